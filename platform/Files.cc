@@ -1,0 +1,151 @@
+#include "platform/Files.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+
+namespace platform {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+constexpr const char* kProtectionAttribute = "user.tallow.protection";
+constexpr mode_t kPrivateMode = 0700;
+
+bool refuseNUL(const std::string& path, TLErrorOut error) {
+  if (path.find('\0') == std::string::npos) return false;
+  setError(error, posixError(EINVAL, "path holds a NUL"));
+  return true;
+}
+
+bool makeDirectory(const std::string& path, TLErrorOut error) {
+  if (mkdir(path.c_str(), kPrivateMode) == 0) return true;
+  const int code = errno;
+  struct stat info;
+  if (code == EEXIST && stat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode)) return true;
+  setError(error, posixError(code, path));
+  return false;
+}
+
+class FileDescriptor {
+ public:
+  explicit FileDescriptor(int fd) : _fd(fd) {}
+  ~FileDescriptor() {
+    if (_fd >= 0) ::close(_fd);
+  }
+  FileDescriptor(const FileDescriptor&) = delete;
+  FileDescriptor& operator=(const FileDescriptor&) = delete;
+  [[nodiscard]] int get() const { return _fd; }
+
+ private:
+  int _fd;
+};
+
+bool writeAll(int fd, const std::string& bytes) {
+  for (size_t done = 0; done < bytes.size();) {
+    const ssize_t n = ::write(fd, bytes.data() + done, bytes.size() - done);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) return false;
+    done += static_cast<size_t>(n);
+  }
+  return fsync(fd) == 0;
+}
+
+}  // namespace
+
+bool fileExists(const std::string& path) {
+  return path.find('\0') == std::string::npos && access(path.c_str(), F_OK) == 0;
+}
+
+bool createDirectories(const std::string& path, TLErrorOut error,
+                       const std::optional<std::string>& protectionClass) {
+  if (refuseNUL(path, error)) return false;
+  for (size_t slash = path.find('/', 1); slash != std::string::npos;
+       slash = path.find('/', slash + 1)) {
+    const std::string parent = path.substr(0, slash);
+    if (!fileExists(parent) && !makeDirectory(parent, error)) return false;
+  }
+  if (!makeDirectory(path, error)) return false;
+  if (protectionClass) {
+    setxattr(path.c_str(), kProtectionAttribute, protectionClass->data(), protectionClass->size(),
+             0);
+  }
+  return true;
+}
+
+std::optional<std::vector<std::string>> listDirectory(const std::string& path, TLErrorOut error) {
+  if (refuseNUL(path, error)) return std::nullopt;
+  std::error_code code;
+  std::vector<std::string> names;
+  fs::directory_iterator it(path, code);
+  for (; !code && it != fs::directory_iterator(); it.increment(code)) {
+    names.push_back(it->path().filename().string());
+  }
+  if (code) {
+    setError(error, posixError(code.value(), path));
+    return std::nullopt;
+  }
+  return names;
+}
+
+bool removeItem(const std::string& path, TLErrorOut error) {
+  if (refuseNUL(path, error)) return false;
+  std::error_code code;
+  fs::remove_all(path, code);
+  if (code) {
+    setError(error, posixError(code.value(), path));
+    return false;
+  }
+  return true;
+}
+
+std::optional<std::string> readFile(const std::string& path, size_t maximum, TLErrorOut error) {
+  if (refuseNUL(path, error)) return std::nullopt;
+  const FileDescriptor file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  if (file.get() < 0) {
+    setError(error, posixError(errno, path));
+    return std::nullopt;
+  }
+  std::string bytes;
+  char buffer[65536];
+  for (;;) {
+    const ssize_t n = ::read(file.get(), buffer, sizeof buffer);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) {
+      setError(error, posixError(errno, path));
+      return std::nullopt;
+    }
+    if (n == 0) return bytes;
+    if (bytes.size() + static_cast<size_t>(n) > maximum) {
+      setError(error, posixError(EFBIG, path));
+      return std::nullopt;
+    }
+    bytes.append(buffer, static_cast<size_t>(n));
+  }
+}
+
+bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error) {
+  if (refuseNUL(path, error)) return false;
+  const std::string temporary = path + ".new";
+  {
+    const FileDescriptor file(
+        open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
+    if (file.get() < 0 || !writeAll(file.get(), bytes)) {
+      setError(error, posixError(errno, temporary));
+      return false;
+    }
+  }
+  if (rename(temporary.c_str(), path.c_str()) != 0) {
+    setError(error, posixError(errno, path));
+    return false;
+  }
+  return true;
+}
+
+}  // namespace platform

@@ -1,0 +1,35 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/TLError.h"
+
+// File access that reports by error object. Paths are bytes; a path that holds a NUL is refused by
+// each operation with EINVAL rather than cut.
+namespace platform {
+
+[[nodiscard]] bool fileExists(const std::string& path);
+
+// Creates `path` and what is missing above it, mode 0700. A directory that exists is no error. With
+// a protection class, the last directory carries it in the extended attribute
+// user.tallow.protection, where the file system has such attributes.
+bool createDirectories(const std::string& path, TLErrorOut error,
+                       const std::optional<std::string>& protectionClass = std::nullopt);
+
+// Names of the entries, without "." and "..", in no order.
+[[nodiscard]] std::optional<std::vector<std::string>> listDirectory(const std::string& path,
+                                                                    TLErrorOut error);
+
+// Removes a file, or a directory with all below it. Symbolic links are removed, not followed.
+bool removeItem(const std::string& path, TLErrorOut error);
+
+// At most `maximum` bytes are read; a larger file is an error (EFBIG).
+[[nodiscard]] std::optional<std::string> readFile(const std::string& path, size_t maximum,
+                                                  TLErrorOut error);
+
+// Written beside the target, synced, then renamed over it.
+bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error);
+
+}  // namespace platform

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <mutex>
+
+// Names of clang's thread-safety analysis; they vanish under other compilers.
+#if defined(__clang__)
+#define TL_THREAD_ANNOTATION(x) __attribute__((x))
+#else
+#define TL_THREAD_ANNOTATION(x)
+#endif
+#define TL_CAPABILITY(x) TL_THREAD_ANNOTATION(capability(x))
+#define TL_SCOPED_CAPABILITY TL_THREAD_ANNOTATION(scoped_lockable)
+#define TL_GUARDED_BY(x) TL_THREAD_ANNOTATION(guarded_by(x))
+#define TL_PT_GUARDED_BY(x) TL_THREAD_ANNOTATION(pt_guarded_by(x))
+#define TL_REQUIRES(...) TL_THREAD_ANNOTATION(requires_capability(__VA_ARGS__))
+#define TL_EXCLUDES(...) TL_THREAD_ANNOTATION(locks_excluded(__VA_ARGS__))
+#define TL_ACQUIRE(...) TL_THREAD_ANNOTATION(acquire_capability(__VA_ARGS__))
+#define TL_RELEASE(...) TL_THREAD_ANNOTATION(release_capability(__VA_ARGS__))
+#define TL_ACQUIRED_BEFORE(...) TL_THREAD_ANNOTATION(acquired_before(__VA_ARGS__))
+#define TL_NO_THREAD_SAFETY_ANALYSIS TL_THREAD_ANNOTATION(no_thread_safety_analysis)
+
+namespace platform {
+
+// std::mutex that the analysis knows. Works with std::condition_variable_any.
+class TL_CAPABILITY("mutex") Mutex {
+ public:
+  void lock() TL_ACQUIRE() { _mutex.lock(); }
+  void unlock() TL_RELEASE() { _mutex.unlock(); }
+
+ private:
+  std::mutex _mutex;
+};
+
+class TL_SCOPED_CAPABILITY MutexLock {
+ public:
+  explicit MutexLock(Mutex& mutex) TL_ACQUIRE(mutex) : _mutex(mutex) { _mutex.lock(); }
+  ~MutexLock() TL_RELEASE() { _mutex.unlock(); }
+  MutexLock(const MutexLock&) = delete;
+  MutexLock& operator=(const MutexLock&) = delete;
+
+ private:
+  Mutex& _mutex;
+};
+
+}  // namespace platform

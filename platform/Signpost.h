@@ -1,0 +1,61 @@
+#pragma once
+
+#include <fmt/format.h>
+
+#include <cstdint>
+#include <functional>
+#include <string_view>
+#include <utility>
+
+namespace platform {
+
+enum class SignpostPhase { begin, end };
+
+struct SignpostEvent {
+  SignpostPhase phase;
+  std::string_view name;
+  uint64_t identifier;
+  std::string_view message;
+};
+
+using SignpostSink = std::function<void(const SignpostEvent&)>;
+
+// Tests see the events through a sink; an empty one removes it. Calls of a sink never overlap.
+void setSignpostSink(SignpostSink sink);
+
+// Handle "com.quill.tallow.signposts", "PointsOfInterest". Events are the static trace points
+// tallow:begin and tallow:end with (name, identifier, message), for perf and bpftrace. While no
+// tracer is attached and no sink set, nothing is formatted and nothing sent. Any thread.
+class Signpost {
+ public:
+  // An identifier derived from the address of an object.
+  [[nodiscard]] static uint64_t identifierForObject(const void* object) {
+    return reinterpret_cast<uintptr_t>(object);
+  }
+
+  template <typename... Args>
+  static void begin(uint64_t identifier, const char* name, fmt::format_string<Args...> format,
+                    Args&&... args) {
+    send(SignpostPhase::begin, identifier, name, format, std::forward<Args>(args)...);
+  }
+  template <typename... Args>
+  static void end(uint64_t identifier, const char* name, fmt::format_string<Args...> format,
+                  Args&&... args) {
+    send(SignpostPhase::end, identifier, name, format, std::forward<Args>(args)...);
+  }
+
+  // True while a tracer or a sink listens.
+  [[nodiscard]] static bool enabled(SignpostPhase phase);
+
+ private:
+  template <typename... Args>
+  static void send(SignpostPhase phase, uint64_t identifier, const char* name,
+                   fmt::format_string<Args...> format, Args&&... args) {
+    if (identifier == 0 || identifier == ~uint64_t{0} || !enabled(phase)) return;
+    emit(phase, identifier, name, fmt::format(format, std::forward<Args>(args)...));
+  }
+  static void emit(SignpostPhase phase, uint64_t identifier, const char* name,
+                   const std::string& message);
+};
+
+}  // namespace platform

@@ -1,0 +1,175 @@
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/xattr.h>
+
+#include <random>
+#include <vector>
+
+#include "platform/Clock.h"
+#include "platform/Concurrent.h"
+#include "platform/Files.h"
+#include "platform/Queue.h"
+#include "platform/Redaction.h"
+#include "platform/Signpost.h"
+#include "platform/StateCapture.h"
+#include "platform/Text.h"
+#include "platform/URL.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using testsupport::LogCapture;
+using testsupport::TemporaryDirectory;
+
+TEST(Text, ConvertsBothWaysAndReplacesWhatIsInvalid) {
+  EXPECT_EQ(platform::toUTF8(u"plain ascii that is longer than a block"),
+            "plain ascii that is longer than a block");
+  EXPECT_EQ(platform::toUTF8(u"gr\u00fc\u00dfe \U0001F600"),
+            "gr\xC3\xBC\xC3\x9F"
+            "e \xF0\x9F\x98\x80");
+  EXPECT_EQ(platform::fromUTF8("abcdefgh\xE6\x97\xA5"), u"abcdefgh\u65e5");
+  EXPECT_EQ(platform::toUTF8(TLString(u"a") + char16_t(0xD800) + u"b"),
+            "a\xEF\xBF\xBD"
+            "b");
+  EXPECT_EQ(platform::fromUTF8("a\xFF"
+                               "b"),
+            u"a\uFFFDb");
+  EXPECT_EQ(platform::toUTF8(TLString(1, u'\0')), std::string(1, '\0'));
+  EXPECT_FALSE(platform::isValidUTF8("ab\xC0\xAF"));
+  EXPECT_TRUE(platform::isValidUTF8("\xF0\x9F\x98\x80"));
+}
+
+TEST(Text, RandomTextSurvivesTheRoundTrip) {
+  std::mt19937 random(7);
+  for (int round = 0; round < 500; ++round) {
+    TLString text;
+    for (size_t i = random() % 40; i > 0; --i) {
+      const uint32_t kind = random() % 3;
+      if (kind == 2) {
+        text += static_cast<char16_t>(0xD800 + random() % 0x400);
+        text += static_cast<char16_t>(0xDC00 + random() % 0x400);
+      } else {
+        text += static_cast<char16_t>(kind == 0 ? random() % 0x80 : 0x80 + random() % 0xD000);
+      }
+    }
+    ASSERT_EQ(platform::fromUTF8(platform::toUTF8(text)), text);
+  }
+}
+
+TEST(Redaction, ShowsTwoUnitsAndTheLength) {
+  EXPECT_EQ(TLPartiallyRedactedStringForString(u"ab"), u"\"ab...\"<2 chars>");
+  EXPECT_EQ(TLPartiallyRedactedStringForString(u"a secret"), u"\"a ...\"<8 chars>");
+  EXPECT_EQ(TLPartiallyRedactedStringForString(u"a"), u"a");
+  EXPECT_EQ(TLPartiallyRedactedStringForString(std::nullopt), std::nullopt);
+  EXPECT_EQ(TLPartiallyRedactedStringForStringAndMaxLength(u"abcdef", 4), u"\"abcd...\"<6 chars>");
+}
+
+TEST(Clock, MillisecondsAreWholeAndADenominatorOfZeroGivesZero) {
+  EXPECT_EQ(platform::millisFromTicks(1999999, {1, 1}), 1u);
+  EXPECT_EQ(platform::millisFromTicks(24000, {125, 3}), 1u);
+  EXPECT_EQ(platform::millisFromTicks(5000000, {1, 0}), 0u);
+}
+
+TEST(Queue, RunsInOrderAndDrainsAtTheEnd) {
+  std::vector<int> order;
+  {
+    platform::SerialQueue queue("com.quill.tallow.test");
+    for (int i = 0; i < 100; ++i) queue.async([&order, i] { order.push_back(i); });
+    queue.sync([&order] { EXPECT_EQ(order.size(), 100u); });
+    queue.async([&order] { order.push_back(100); });
+  }
+  ASSERT_EQ(order.size(), 101u);
+  for (int i = 0; i <= 100; ++i) EXPECT_EQ(order[static_cast<size_t>(i)], i);
+}
+
+TEST(Concurrent, VisitsEveryIndexOnce) {
+  std::vector<int> visits(1000);
+  platform::concurrentApply(visits.size(), [&](size_t i) { ++visits[i]; });
+  EXPECT_EQ(visits, std::vector<int>(1000, 1));
+  platform::concurrentApply(0, [](size_t) { FAIL(); });
+}
+
+TEST(URL, TakesOnlyStrictAbsoluteOnes) {
+  EXPECT_TRUE(TLURL::parse("tlw://mail_bundle_id/file/tmp/a%20b"));
+  EXPECT_TRUE(TLURL::parse("tlw://b/x?offset=10"));
+  for (const char* bad : {"", "no scheme", "tlw://b/a b", "tlw://b/\xC3\xA9", "tlw://b/%zz",
+                          "/only/path", "tlw://b/a\"b", "tlw://b/[x"}) {
+    EXPECT_FALSE(TLURL::parse(bad)) << bad;
+  }
+  EXPECT_FALSE(TLURL::parse(std::string("tlw://b/a\0b", 11)));
+}
+
+TEST(Files, DirectoriesArePrivateAndCarryTheirClass) {
+  TemporaryDirectory temporary;
+  const std::string path = temporary / "a/b/c";
+  ASSERT_TRUE(platform::createDirectories(path, nullptr, "SysFileProtectionComplete"));
+  ASSERT_TRUE(platform::createDirectories(path, nullptr));
+  struct stat info;
+  ASSERT_EQ(stat(path.c_str(), &info), 0);
+  EXPECT_EQ(info.st_mode & 0777, 0700u);
+  char value[64] = {};
+  if (setxattr(temporary.path().c_str(), "user.tallow.probe", "x", 1, 0) == 0) {
+    ASSERT_GT(getxattr(path.c_str(), "user.tallow.protection", value, sizeof value), 0);
+    EXPECT_STREQ(value, "SysFileProtectionComplete");
+  }
+}
+
+TEST(Files, FailuresNameThePath) {
+  TemporaryDirectory temporary;
+  std::optional<TLError> error;
+  EXPECT_FALSE(platform::createDirectories(temporary / std::string("x\0y", 3), &error));
+  EXPECT_EQ(error->code, EINVAL);
+  ASSERT_TRUE(platform::writeFileAtomically(temporary / "file", "0123456789", &error));
+  EXPECT_FALSE(platform::createDirectories(temporary / "file", &error));
+  EXPECT_EQ(error->code, EEXIST);
+  EXPECT_FALSE(platform::createDirectories(temporary / std::string(300, 'n'), &error));
+  EXPECT_EQ(error->code, ENAMETOOLONG);
+  EXPECT_FALSE(platform::readFile(temporary / "file", 9, &error));
+  EXPECT_EQ(error->code, EFBIG);
+  EXPECT_EQ(platform::readFile(temporary / "file", 10, nullptr), "0123456789");
+  EXPECT_FALSE(platform::listDirectory(temporary / "none", &error));
+  EXPECT_EQ(error->code, ENOENT);
+  EXPECT_EQ(error->domain, kPOSIXErrorDomain);
+  EXPECT_NE(error->message.find("none"), std::string::npos);
+  EXPECT_TRUE(platform::removeItem(temporary / "file", nullptr));
+  EXPECT_EQ(platform::listDirectory(temporary.path(), nullptr)->size(), 0u);
+}
+
+TEST(StateCapture, RecordHasTheStatedLayout) {
+  platform::SerialQueue queue("capture");
+  const std::string title(100, 't');
+  auto cancel = TLLogRegisterStateCaptureBlock(queue, title, [] {
+    return nlohmann::json{{"n", 7}};
+  });
+  auto cancelEmpty =
+      TLLogRegisterStateCaptureBlock(queue, "e", [] { return nlohmann::json::object(); });
+  const auto records = platform::captureState();
+  ASSERT_EQ(records.size(), 1u);
+  const std::string& record = records[0];
+  EXPECT_EQ(record.substr(0, 4), std::string("\1\0\0\0", 4));
+  EXPECT_EQ(static_cast<size_t>(record[4]), record.size() - 200);
+  EXPECT_EQ(std::string(record.c_str() + 136), std::string(63, 't'));
+  EXPECT_EQ(nlohmann::json::from_cbor(record.substr(200)), nlohmann::json({{"n", 7}}));
+  LogCapture log;
+  platform::logCapturedState();
+  EXPECT_TRUE(log.contains("{\"n\":7}"));
+  cancel();
+  cancelEmpty();
+  EXPECT_TRUE(platform::captureState().empty());
+}
+
+TEST(Signpost, ReachesASinkAndSkipsTheReservedIdentifiers) {
+  std::vector<std::string> seen;
+  platform::setSignpostSink([&](const platform::SignpostEvent& event) {
+    seen.push_back(fmt::format("{} {} {}",
+                               event.phase == platform::SignpostPhase::begin ? "b" : "e",
+                               event.name, event.message));
+  });
+  const int object = 0;
+  const uint64_t id = platform::Signpost::identifierForObject(&object);
+  platform::Signpost::begin(id, "work", "index {} items", 3);
+  platform::Signpost::begin(0, "work", "never");
+  platform::Signpost::end(~uint64_t{0}, "work", "never");
+  platform::Signpost::end(id, "work", "done");
+  platform::setSignpostSink({});
+  EXPECT_EQ(seen, (std::vector<std::string>{"b work index 3 items", "e work done"}));
+}

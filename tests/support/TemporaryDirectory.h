@@ -1,0 +1,22 @@
+#pragma once
+
+#include <string>
+
+namespace testsupport {
+
+// A fresh directory that is gone, with all in it, at the end of the test.
+class TemporaryDirectory {
+ public:
+  TemporaryDirectory();
+  ~TemporaryDirectory();
+  TemporaryDirectory(const TemporaryDirectory&) = delete;
+  TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
+
+  [[nodiscard]] const std::string& path() const { return _path; }
+  [[nodiscard]] std::string operator/(const std::string& name) const { return _path + '/' + name; }
+
+ private:
+  std::string _path;
+};
+
+}  // namespace testsupport
