@@ -30,7 +30,10 @@ bool parseRecord(const std::string& bytes, Record* record) {
 }  // namespace
 
 index::index(Database opened)
-    : _database(std::move(opened)), db(_database.db.get()), _batch(std::in_place) {
+    : _database(std::move(opened)),
+      _writer(_database.db.get()),
+      db(_database.db.get()),
+      _batch(std::in_place) {
   std::string bytes;
   leveldb::Status status = db->Get(leveldb::ReadOptions(), kMetricsKey, &bytes);
   if (!status.ok() || !parseRecord(bytes, &metrics)) return;
@@ -155,7 +158,7 @@ void index::ResetScanMetrics() {
 bool index::writeMetrics(leveldb::WriteBatch* batch) {
   const MetricsBlock& block = metrics;
   batch->Put(kMetricsKey, {reinterpret_cast<const char*>(&block), sizeof block});
-  const leveldb::Status status = db->Write(leveldb::WriteOptions(), batch);
+  const leveldb::Status status = _writer.write(batch);
   batch->Clear();
   if (!status.ok()) Log.error("Error writing to db: {}", status.ToString());
   return status.ok();
