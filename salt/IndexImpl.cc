@@ -53,25 +53,26 @@ index::index(Database opened)
 }
 
 Index* NewIndex(const Index::Options& options) {
-  Database ldb = openDatabase(options.Path, OpenMode::create);
-  TL_ASSERT(ldb.db);
-  leveldb::Status status = putRecord(ldb.db.get(), kOptionsKey, options);
+  Database database = openDatabase(options.Path, OpenMode::create);
+  leveldb::DB* const ldb = database.db.get();
+  TL_ASSERT(ldb);
+  leveldb::Status status = putRecord(ldb, kOptionsKey, options);
   TL_ASSERT(status.ok());
   Index::Metrics metrics;
   metrics.CodeVersion = CODE_VERSION;
   metrics.CreationTime = std::time(nullptr);
-  status = putRecord(ldb.db.get(), kMetricsKey, metrics);
+  status = putRecord(ldb, kMetricsKey, metrics);
   TL_ASSERT(status.ok());
-  auto idx = std::make_unique<index>(std::move(ldb));
+  auto idx = std::make_unique<index>(std::move(database));
   platform::MutexLock lock(idx->_metricsMutex);
   TL_ASSERT(idx->metrics.CodeVersion == CODE_VERSION);
   return idx.release();
 }
 
 Index* LoadIndex(const std::string& path) {
-  Database ldb = openDatabase(path, OpenMode::existing);
-  if (!ldb.db) return nullptr;
-  auto idx = std::make_unique<index>(std::move(ldb));
+  Database database = openDatabase(path, OpenMode::existing);
+  if (!database.db) return nullptr;
+  auto idx = std::make_unique<index>(std::move(database));
   if (!idx->metricsSound()) return nullptr;
   if (idx->op.ValidateOnLoad && !idx->Validate()) {
     Log.fault("Loading failure: Validation failed.");
