@@ -1,0 +1,488 @@
+#pragma once
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <cmath>
+#include <memory>
+#include <nlohmann/json.hpp>
+#include <optional>
+#include <string>
+#include <tuple>
+#include <type_traits>
+#include <typeinfo>
+#include <utility>
+#include <vector>
+
+#include "platform/Assert.h"
+#include "records/TLAttributeKey.h"
+#include "records/TLCodable.h"
+
+// What the records do field by field, for the source files of the records only. A record's table
+// lists its fields as TLField objects; TLFieldKind says, per C++ type of a field, how a value of
+// that type is read, written, compared, hashed, copied, merged and described. The member functions
+// of TLRecord at the end walk the table; the compiler unrolls them.
+
+struct TLRecordAccess {
+  static uint8_t has(const TLCodable& record) { return record._has; }
+  static void setHas(TLCodable& record, uint8_t bit) { record._has |= bit; }
+};
+
+// One field: its number on the wire, its name in dictionaries, where it lies, and the presence bit
+// of a scalar.
+template <typename Record, typename Value>
+struct TLField {
+  uint32_t number;
+  const char* name;
+  Value Record::*member;
+  uint8_t bit = 0;
+};
+template <typename Record, typename Value>
+TLField(uint32_t, const char*, Value Record::*) -> TLField<Record, Value>;
+template <typename Record, typename Value>
+TLField(uint32_t, const char*, Value Record::*, uint8_t) -> TLField<Record, Value>;
+
+namespace recordfields {
+
+// Bounds the nesting of a walk: one guard per sub-record that the walk is inside of.
+class NestingGuard {
+ public:
+  NestingGuard() {
+    ++_depth;
+    TL_ASSERT(_depth <= kMaximumRecordDepth);
+  }
+  ~NestingGuard() { --_depth; }
+  NestingGuard(const NestingGuard&) = delete;
+  NestingGuard& operator=(const NestingGuard&) = delete;
+
+ private:
+  static constinit inline thread_local int _depth = 0;
+};
+
+inline constexpr uint64_t kHashFactor = 2654435761;
+
+// A number and its negation hash alike. Infinities and NaN contribute nothing.
+inline uint64_t hashOf(double value) {
+  const double magnitude = std::fabs(value);
+  if (!std::isfinite(magnitude)) return 0;
+  const double rounded = std::floor(magnitude + 0.5);
+  const double fraction = std::ldexp(magnitude - rounded, 64);
+  const uint64_t whole = static_cast<uint64_t>(std::fmod(rounded, 0x1p64)) * kHashFactor;
+  const auto part = static_cast<uint64_t>(std::fabs(fraction));
+  return fraction < 0 ? whole - part : whole + part;
+}
+
+// Of a list, so that the order counts.
+inline uint64_t combine(uint64_t seed, uint64_t hash) {
+  return seed * 31 + hash + 0x9E3779B97F4A7C15ULL;
+}
+
+inline std::string nameOf(TLAttributeKey key) {
+  return TLAttributeKeyAsString(key);
+}
+inline std::string nameOf(TLQueryNodeOp op) {
+  return TLQueryNodeOpAsString(op);
+}
+inline std::string nameOf(TLQueryNodeMergeOp mergeOp) {
+  return TLQueryNodeMergeOpAsString(mergeOp);
+}
+
+}  // namespace recordfields
+
+// Scalars: numbers, truth values and enumerations. Present by their bit.
+template <typename Value>
+struct TLFieldKind {
+  static_assert(std::is_arithmetic_v<Value> || std::is_enum_v<Value>);
+  static constexpr bool isScalar = true;
+
+  static Value read(TLReader& reader) {
+    if constexpr (std::is_same_v<Value, float>) {
+      return reader.readFloat();
+    } else if constexpr (std::is_same_v<Value, double>) {
+      return reader.readDouble();
+    } else if constexpr (std::is_same_v<Value, bool>) {
+      return reader.readVarint() != 0;
+    } else if constexpr (std::is_enum_v<Value>) {
+      return static_cast<Value>(static_cast<int32_t>(reader.readVarint()));
+    } else {
+      return static_cast<Value>(reader.readVarint());
+    }
+  }
+  static void write(uint32_t number, Value value, TLWriter& writer) {
+    if constexpr (std::is_same_v<Value, float>) {
+      writer.writeFloatField(number, value);
+    } else if constexpr (std::is_same_v<Value, double>) {
+      writer.writeDoubleField(number, value);
+    } else {
+      // Through int64_t, so that a negative enumerator takes ten bytes.
+      writer.writeVarintField(number, static_cast<uint64_t>(static_cast<int64_t>(value)));
+    }
+  }
+  static bool equal(Value a, Value b) { return a == b; }
+  static uint64_t hash(Value value) {
+    if constexpr (std::is_floating_point_v<Value>) {
+      return recordfields::hashOf(static_cast<double>(value));
+    } else {
+      return static_cast<uint64_t>(static_cast<int64_t>(value)) * recordfields::kHashFactor;
+    }
+  }
+  static nlohmann::json describe(Value value) {
+    if constexpr (std::is_enum_v<Value>) {
+      return recordfields::nameOf(value);
+    } else {
+      return value;
+    }
+  }
+};
+
+// Text.
+template <>
+struct TLFieldKind<std::optional<TLString>> {
+  using Value = std::optional<TLString>;
+  static constexpr bool isScalar = false;
+
+  static bool present(const Value& value) { return value.has_value(); }
+  static bool read(Value& value, TLReader& reader, uint64_t) {
+    value = reader.readString();
+    return true;
+  }
+  static void write(uint32_t number, const Value& value, TLWriter& writer) {
+    writer.writeStringField(number, *value);
+  }
+  static bool equal(const Value& a, const Value& b) { return a == b; }
+  static uint64_t hash(const Value& value) { return std::hash<TLString>()(*value); }
+  static Value deepCopy(const Value& value) { return value; }
+  static void merge(const Value& from, Value& to) { to = from; }
+  static nlohmann::json describe(const Value& value) { return platform::toUTF8(*value); }
+};
+
+// Bytes.
+template <>
+struct TLFieldKind<std::optional<std::string>> {
+  using Value = std::optional<std::string>;
+  static constexpr bool isScalar = false;
+
+  static bool present(const Value& value) { return value.has_value(); }
+  static bool read(Value& value, TLReader& reader, uint64_t) {
+    value = reader.readBytes();
+    return true;
+  }
+  static void write(uint32_t number, const Value& value, TLWriter& writer) {
+    writer.writeBytesField(number, *value);
+  }
+  static bool equal(const Value& a, const Value& b) { return a == b; }
+  static uint64_t hash(const Value& value) { return std::hash<std::string>()(*value); }
+  static Value deepCopy(const Value& value) { return value; }
+  static void merge(const Value& from, Value& to) { to = from; }
+  static nlohmann::json describe(const Value& value) {
+    return nlohmann::json::binary(std::vector<uint8_t>(value->begin(), value->end()));
+  }
+};
+
+// A sub-record. It is in its place before it is read, so a failed read leaves it half read.
+template <typename Record>
+struct TLFieldKind<std::shared_ptr<Record>> {
+  using Value = std::shared_ptr<Record>;
+  static constexpr bool isScalar = false;
+
+  static bool present(const Value& value) { return value != nullptr; }
+  static bool read(Value& value, TLReader& reader, uint64_t) {
+    value = std::make_shared<Record>();
+    return reader.readRecord(*value);
+  }
+  static void write(uint32_t number, const Value& value, TLWriter& writer) {
+    const recordfields::NestingGuard guard;
+    writer.writeRecordField(number, *value);
+  }
+  static bool equal(const Value& a, const Value& b) {
+    const recordfields::NestingGuard guard;
+    return a == b || (a != nullptr && b != nullptr && a->isEqual(*b));
+  }
+  static uint64_t hash(const Value& value) {
+    const recordfields::NestingGuard guard;
+    return value->hash();
+  }
+  static Value deepCopy(const Value& value) {
+    const recordfields::NestingGuard guard;
+    return value->copyWithZone();
+  }
+  static void merge(const Value& from, Value& to) {
+    if (to == nullptr) {
+      to = from;
+    } else if (to != from) {
+      to->mergeFrom(*from);
+    }
+  }
+  static nlohmann::json describe(const Value& value) {
+    const recordfields::NestingGuard guard;
+    return value->dictionaryRepresentation();
+  }
+};
+
+// What the lists have in common. `Elements` says how one element is treated.
+template <typename Element, typename Elements>
+struct TLListKind {
+  using Value = std::vector<Element>;
+  static constexpr bool isScalar = false;
+
+  static bool present(const Value& value) { return !value.empty(); }
+  static bool equal(const Value& a, const Value& b) {
+    return std::equal(a.begin(), a.end(), b.begin(), b.end(), Elements::equalElements);
+  }
+  static uint64_t hash(const Value& value) {
+    uint64_t result = value.size();
+    for (const Element& element : value) {
+      result = recordfields::combine(result, Elements::hashElement(element));
+    }
+    return result;
+  }
+  static Value deepCopy(const Value& value) {
+    Value copy;
+    copy.reserve(value.size());
+    for (const Element& element : value) copy.push_back(Elements::copyElement(element));
+    return copy;
+  }
+  // `from` and `to` may be one list.
+  static void merge(const Value& from, Value& to) {
+    const size_t count = from.size();
+    to.reserve(to.size() + count);
+    for (size_t i = 0; i < count; ++i) to.push_back(from[i]);
+  }
+  static void write(uint32_t number, const Value& value, TLWriter& writer) {
+    for (const Element& element : value) Elements::writeElement(number, element, writer);
+  }
+  static nlohmann::json describe(const Value& value) {
+    nlohmann::json list = nlohmann::json::array();
+    for (const Element& element : value) list.push_back(Elements::describeElement(element));
+    return list;
+  }
+};
+
+// Repeated text, one occurrence an element.
+template <>
+struct TLFieldKind<std::vector<TLString>>
+    : TLListKind<TLString, TLFieldKind<std::vector<TLString>>> {
+  static bool read(Value& value, TLReader& reader, uint64_t) {
+    if (!reader.takeElement()) return false;
+    if (auto text = reader.readString()) value.push_back(std::move(*text));
+    return true;
+  }
+  static void writeElement(uint32_t number, const TLString& element, TLWriter& writer) {
+    writer.writeStringField(number, element);
+  }
+  static bool equalElements(const TLString& a, const TLString& b) { return a == b; }
+  static uint64_t hashElement(const TLString& element) { return std::hash<TLString>()(element); }
+  static TLString copyElement(const TLString& element) { return element; }
+  static nlohmann::json describeElement(const TLString& element) {
+    return platform::toUTF8(element);
+  }
+};
+
+// Numbers of an enumeration, written one occurrence an element and read also when packed.
+template <>
+struct TLFieldKind<std::vector<int32_t>> : TLListKind<int32_t, TLFieldKind<std::vector<int32_t>>> {
+  static bool read(Value& value, TLReader& reader, uint64_t wireType) {
+    const auto readOne = [&] { value.push_back(static_cast<int32_t>(reader.readVarint())); };
+    if (wireType != static_cast<uint64_t>(TLWireType::lengthDelimited)) {
+      readOne();
+      return true;
+    }
+    return reader.withLengthLimit([&] {
+      while (reader.hasMore()) readOne();
+      return !reader.hasError();
+    });
+  }
+  static void writeElement(uint32_t number, int32_t element, TLWriter& writer) {
+    writer.writeVarintField(number, static_cast<uint64_t>(int64_t{element}));
+  }
+  static bool equalElements(int32_t a, int32_t b) { return a == b; }
+  static uint64_t hashElement(int32_t element) { return static_cast<uint64_t>(element); }
+  static int32_t copyElement(int32_t element) { return element; }
+  static nlohmann::json describeElement(int32_t element) {
+    return TLAttributeKeyAsString(static_cast<TLAttributeKey>(element));
+  }
+};
+
+// Repeated sub-records, one occurrence an element.
+template <typename Record>
+struct TLFieldKind<std::vector<std::shared_ptr<Record>>>
+    : TLListKind<std::shared_ptr<Record>, TLFieldKind<std::vector<std::shared_ptr<Record>>>> {
+  using Element = std::shared_ptr<Record>;
+  using One = TLFieldKind<Element>;
+
+  static bool read(std::vector<Element>& value, TLReader& reader, uint64_t wireType) {
+    return One::read(value.emplace_back(), reader, wireType);
+  }
+  static void writeElement(uint32_t number, const Element& element, TLWriter& writer) {
+    One::write(number, element, writer);
+  }
+  static bool equalElements(const Element& a, const Element& b) { return One::equal(a, b); }
+  static uint64_t hashElement(const Element& element) { return One::hash(element); }
+  static Element copyElement(const Element& element) { return One::deepCopy(element); }
+  static nlohmann::json describeElement(const Element& element) { return One::describe(element); }
+};
+
+namespace recordfields {
+
+template <typename Field>
+struct FieldTypes;
+template <typename R, typename V>
+struct FieldTypes<TLField<R, V>> {
+  using Record = R;
+  using Kind = TLFieldKind<V>;
+};
+
+template <typename Field>
+using KindOf = typename FieldTypes<std::remove_cvref_t<Field>>::Kind;
+
+template <typename Record, typename Field>
+bool isPresent(const Record& record, const Field& field) {
+  if constexpr (KindOf<Field>::isScalar) {
+    return (TLRecordAccess::has(record) & field.bit) != 0;
+  } else {
+    return KindOf<Field>::present(record.*field.member);
+  }
+}
+
+// False when the read of the whole record ends here. A scalar is present before its value is read.
+template <typename Record, typename Field>
+bool readField(Record& record, const Field& field, TLReader& reader, uint64_t wireType) {
+  if constexpr (KindOf<Field>::isScalar) {
+    TLRecordAccess::setHas(record, field.bit);
+    record.*field.member = KindOf<Field>::read(reader);
+    return true;
+  } else {
+    return KindOf<Field>::read(record.*field.member, reader, wireType);
+  }
+}
+
+// Calls `body` with every field, in ascending number.
+template <typename Record, typename Body>
+void forEachField(Body&& body) {
+  std::apply([&](const auto&... field) { (body(field), ...); }, TLRecordTable<Record>::fields);
+}
+
+// Sets the target's field to `value`; the presence bit goes with a scalar.
+template <typename Record, typename Field, typename Value>
+void setField(Record& record, const Field& field, Value&& value) {
+  record.*field.member = std::forward<Value>(value);
+  TLRecordAccess::setHas(record, field.bit);
+}
+
+}  // namespace recordfields
+
+template <typename Record>
+bool TLRecord<Record>::readFrom(TLReader& reader) {
+  while (reader.hasMore()) {
+    const uint64_t tag = reader.readVarint();
+    const uint64_t number = tag >> 3;
+    const uint64_t wireType = tag & 7;
+    if (reader.hasError() || wireType == static_cast<uint64_t>(TLWireType::endGroup)) break;
+    bool ok = true;
+    const bool known = std::apply(
+        [&](const auto&... field) {
+          return ((number == field.number &&
+                   (ok = recordfields::readField(self(), field, reader, wireType), true)) ||
+                  ...);
+        },
+        TLRecordTable<Record>::fields);
+    if (!known) ok = reader.skipValue(wireType);
+    if (!ok) return false;
+  }
+  return !reader.hasError();
+}
+
+template <typename Record>
+void TLRecord<Record>::writeTo(TLWriter& writer) const {
+  recordfields::forEachField<Record>([&](const auto& field) {
+    if (recordfields::isPresent(self(), field)) {
+      recordfields::KindOf<decltype(field)>::write(field.number, self().*field.member, writer);
+    }
+  });
+}
+
+template <typename Record>
+bool TLRecord<Record>::isEqual(const TLCodable& other) const {
+  if (typeid(other) != typeid(Record)) return false;
+  const auto& that = static_cast<const Record&>(other);
+  return std::apply(
+      [&](const auto&... field) {
+        const auto equal = [&](const auto& one) {
+          const bool present = recordfields::isPresent(self(), one);
+          if (present != recordfields::isPresent(that, one)) return false;
+          return !present ||
+                 recordfields::KindOf<decltype(one)>::equal(self().*one.member, that.*one.member);
+        };
+        return (equal(field) && ...);
+      },
+      TLRecordTable<Record>::fields);
+}
+
+template <typename Record>
+size_t TLRecord<Record>::hash() const {
+  uint64_t result = 0;
+  recordfields::forEachField<Record>([&](const auto& field) {
+    if (recordfields::isPresent(self(), field)) {
+      result ^= recordfields::KindOf<decltype(field)>::hash(self().*field.member);
+    }
+  });
+  return static_cast<size_t>(result);
+}
+
+template <typename Record>
+nlohmann::json TLRecord<Record>::dictionaryRepresentation() const {
+  nlohmann::json dictionary = nlohmann::json::object();
+  recordfields::forEachField<Record>([&](const auto& field) {
+    if (recordfields::isPresent(self(), field)) {
+      dictionary[field.name] =
+          recordfields::KindOf<decltype(field)>::describe(self().*field.member);
+    }
+  });
+  return dictionary;
+}
+
+template <typename Record>
+std::string TLRecord<Record>::description() const {
+  return fmt::format("<{}: {}> {}", TLRecordTable<Record>::name, fmt::ptr(this),
+                     dictionaryRepresentation().dump());
+}
+
+template <typename Record>
+void TLRecord<Record>::copyTo(Record& other) const {
+  recordfields::forEachField<Record>([&](const auto& field) {
+    if (recordfields::isPresent(self(), field)) {
+      recordfields::setField(other, field, self().*field.member);
+    }
+  });
+}
+
+template <typename Record>
+std::shared_ptr<Record> TLRecord<Record>::copyWithZone() const {
+  auto copy = std::make_shared<Record>();
+  recordfields::forEachField<Record>([&](const auto& field) {
+    using Kind = recordfields::KindOf<decltype(field)>;
+    if constexpr (Kind::isScalar) {
+      if (recordfields::isPresent(self(), field)) {
+        recordfields::setField(*copy, field, self().*field.member);
+      }
+    } else if (recordfields::isPresent(self(), field)) {
+      (*copy).*field.member = Kind::deepCopy(self().*field.member);
+    } else {
+      (*copy).*field.member = {};
+    }
+  });
+  return copy;
+}
+
+template <typename Record>
+void TLRecord<Record>::mergeFrom(const Record& other) {
+  recordfields::forEachField<Record>([&](const auto& field) {
+    using Kind = recordfields::KindOf<decltype(field)>;
+    if (!recordfields::isPresent(other, field)) return;
+    if constexpr (Kind::isScalar) {
+      recordfields::setField(self(), field, other.*field.member);
+    } else {
+      Kind::merge(other.*field.member, self().*field.member);
+    }
+  });
+}

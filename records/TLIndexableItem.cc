@@ -1,0 +1,152 @@
+#include "records/TLIndexableItem.h"
+
+#include "records/RecordFields.h"
+
+template <>
+struct TLRecordTable<TLIndexableItem> {
+  static constexpr const char* name = "TLIndexableItem";
+  static constexpr std::tuple fields{
+      TLField{1, "attributes", &TLIndexableItem::_attributes},
+      TLField{2, "identifier", &TLIndexableItem::_identifier},
+      TLField{3, "domainIdentifier", &TLIndexableItem::_domainIdentifier},
+      TLField{4, "expirationDate", &TLIndexableItem::_expirationDate,
+              TLIndexableItem::kExpirationDateBit},
+      TLField{5, "card", &TLIndexableItem::_card},
+  };
+};
+
+template class TLRecord<TLIndexableItem>;
+
+namespace {
+
+// Appends a new attribute with the key, its value set by `setter`.
+template <typename Setter, typename Value>
+void append(TLIndexableItem& item, TLAttributeKey key, Setter setter, Value&& value) {
+  auto attribute = std::make_shared<TLAttribute>();
+  attribute->setKey(key);
+  ((*attribute).*setter)(std::forward<Value>(value));
+  item.addAttributes(std::move(attribute));
+}
+
+}  // namespace
+
+void TLIndexableItem::addAttributeWithKeyBoolValue(TLAttributeKey key, bool boolValue) {
+  append(*this, key, &TLAttribute::setBoolValue, boolValue);
+}
+
+void TLIndexableItem::addAttributeWithKeyFloatValue(TLAttributeKey key, float floatValue) {
+  append(*this, key, &TLAttribute::setFloatValue, floatValue);
+}
+
+void TLIndexableItem::addAttributeWithKeyDoubleValue(TLAttributeKey key, double doubleValue) {
+  append(*this, key, &TLAttribute::setDoubleValue, doubleValue);
+}
+
+void TLIndexableItem::addAttributeWithKeyIntValue(TLAttributeKey key, int64_t intValue) {
+  append(*this, key, &TLAttribute::setIntValue, intValue);
+}
+
+void TLIndexableItem::addAttributeWithKeyBytesValue(TLAttributeKey key,
+                                                    std::optional<std::string> bytesValue) {
+  if (bytesValue) append(*this, key, &TLAttribute::setBytesValue, std::move(bytesValue));
+}
+
+void TLIndexableItem::addAttributeWithKeyPersonValue(TLAttributeKey key,
+                                                     std::shared_ptr<TLPerson> personValue) {
+  if (personValue) append(*this, key, &TLAttribute::setPersonValue, std::move(personValue));
+}
+
+void TLIndexableItem::addAttributeWithKeyStringValue(TLAttributeKey key,
+                                                     std::optional<TLString> stringValue) {
+  if (stringValue) append(*this, key, &TLAttribute::setStringValue, std::move(stringValue));
+}
+
+void TLIndexableItem::addAttributeWithKeyStringValues(
+    TLAttributeKey key, std::optional<std::vector<TLString>> stringValues) {
+  if (stringValues) append(*this, key, &TLAttribute::setStringValues, std::move(*stringValues));
+}
+
+void TLIndexableItem::addAttributeWithKeyPersonValues(
+    TLAttributeKey key, std::optional<std::vector<std::shared_ptr<TLPerson>>> personValues) {
+  if (personValues) append(*this, key, &TLAttribute::setPersonValues, std::move(*personValues));
+}
+
+void TLIndexableItem::addPersonsWithKey(TLAttributeKey key, const std::vector<TLString>& emails) {
+  std::vector<std::shared_ptr<TLPerson>> persons;
+  persons.reserve(emails.size());
+  for (const TLString& email : emails) {
+    persons.push_back(std::make_shared<TLPerson>());
+    persons.back()->setEmailAddress(email);
+  }
+  addAttributeWithKeyPersonValues(key, std::move(persons));
+}
+
+const std::shared_ptr<TLAttribute>& TLIndexableItem::attributeForKey(TLAttributeKey key) const {
+  static const std::shared_ptr<TLAttribute> none;
+  for (const auto& attribute : _attributes) {
+    if (attribute->key() == key) return attribute;
+  }
+  return none;
+}
+
+std::vector<std::shared_ptr<TLAttribute>> TLIndexableItem::attributesForKey(
+    TLAttributeKey key) const {
+  std::vector<std::shared_ptr<TLAttribute>> result;
+  for (const auto& attribute : _attributes) {
+    if (attribute->key() == key) result.push_back(attribute);
+  }
+  return result;
+}
+
+namespace {
+
+// What a key that the item lacks reads as: an attribute with nothing set.
+const TLAttribute& attributeOrEmpty(const TLIndexableItem& item, TLAttributeKey key) {
+  static const TLAttribute empty;
+  const auto& attribute = item.attributeForKey(key);
+  return attribute ? *attribute : empty;
+}
+
+template <typename Element>
+const std::vector<Element>* nullIfEmpty(const std::vector<Element>& list) {
+  return list.empty() ? nullptr : &list;
+}
+
+}  // namespace
+
+bool TLIndexableItem::boolValueForKey(TLAttributeKey key) const {
+  return attributeOrEmpty(*this, key).boolValue();
+}
+
+float TLIndexableItem::floatValueForKey(TLAttributeKey key) const {
+  return attributeOrEmpty(*this, key).floatValue();
+}
+
+double TLIndexableItem::doubleValueForKey(TLAttributeKey key) const {
+  return attributeOrEmpty(*this, key).doubleValue();
+}
+
+int64_t TLIndexableItem::intValueForKey(TLAttributeKey key) const {
+  return attributeOrEmpty(*this, key).intValue();
+}
+
+const std::optional<std::string>& TLIndexableItem::bytesValueForKey(TLAttributeKey key) const {
+  return attributeOrEmpty(*this, key).bytesValue();
+}
+
+const std::shared_ptr<TLPerson>& TLIndexableItem::personValueForKey(TLAttributeKey key) const {
+  return attributeOrEmpty(*this, key).personValue();
+}
+
+const std::optional<TLString>& TLIndexableItem::stringValueForKey(TLAttributeKey key) const {
+  return attributeOrEmpty(*this, key).stringValue();
+}
+
+const std::vector<std::shared_ptr<TLPerson>>* TLIndexableItem::personValuesForKey(
+    TLAttributeKey key) const {
+  return nullIfEmpty(attributeOrEmpty(*this, key).personValues());
+}
+
+const std::vector<TLString>* TLIndexableItem::stringValuesForKey(TLAttributeKey key) const {
+  return nullIfEmpty(attributeOrEmpty(*this, key).stringValues());
+}

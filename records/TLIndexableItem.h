@@ -1,0 +1,63 @@
+#pragma once
+
+#include "records/RecordAccessors.h"
+#include "records/TLAttribute.h"
+#include "records/TLCard.h"
+#include "records/TLCodable.h"
+
+// What a client hands over for indexing, what the document store keeps and what a search returns.
+class TLIndexableItem final : public TLRecord<TLIndexableItem> {
+ public:
+  // A fresh item has an empty identifier, which is present and is written.
+  TLIndexableItem() { setIdentifier(TLString()); }
+
+  // In insertion order; keys may repeat.
+  TL_RECORD_RECORDS(TLAttribute, attributes, Attributes, attributes, Attributes)
+  TL_RECORD_STRING(identifier, Identifier)
+  TL_RECORD_STRING(domainIdentifier, DomainIdentifier)
+  TL_RECORD_SCALAR(int64_t, expirationDate, ExpirationDate, 1)
+  // Absent until a search scores the item.
+  TL_RECORD_RECORD(TLCard, card, Card)
+
+  // Each appends one new attribute with the key and the value; a null value appends nothing.
+  void addAttributeWithKeyBoolValue(TLAttributeKey key, bool boolValue);
+  void addAttributeWithKeyFloatValue(TLAttributeKey key, float floatValue);
+  void addAttributeWithKeyDoubleValue(TLAttributeKey key, double doubleValue);
+  void addAttributeWithKeyIntValue(TLAttributeKey key, int64_t intValue);
+  void addAttributeWithKeyBytesValue(TLAttributeKey key, std::optional<std::string> bytesValue);
+  void addAttributeWithKeyPersonValue(TLAttributeKey key, std::shared_ptr<TLPerson> personValue);
+  void addAttributeWithKeyStringValue(TLAttributeKey key, std::optional<TLString> stringValue);
+  void addAttributeWithKeyStringValues(TLAttributeKey key,
+                                       std::optional<std::vector<TLString>> stringValues);
+  void addAttributeWithKeyPersonValues(
+      TLAttributeKey key, std::optional<std::vector<std::shared_ptr<TLPerson>>> personValues);
+
+  // One person per address under one attribute, which is appended even without any address.
+  void addPersonsWithKey(TLAttributeKey key, const std::vector<TLString>& emails);
+
+  // The first attribute with the key, by a walk of the list, or null. The reference lives until the
+  // list changes.
+  [[nodiscard]] const std::shared_ptr<TLAttribute>& attributeForKey(TLAttributeKey key) const;
+  [[nodiscard]] std::vector<std::shared_ptr<TLAttribute>> attributesForKey(
+      TLAttributeKey key) const;
+
+  // Fields of the first attribute with the key, whatever its presence bits say; later attributes
+  // with the key never show. Without one: false, 0 or null. References and pointers live until the
+  // item changes.
+  [[nodiscard]] bool boolValueForKey(TLAttributeKey key) const;
+  [[nodiscard]] float floatValueForKey(TLAttributeKey key) const;
+  [[nodiscard]] double doubleValueForKey(TLAttributeKey key) const;
+  [[nodiscard]] int64_t intValueForKey(TLAttributeKey key) const;
+  [[nodiscard]] const std::optional<std::string>& bytesValueForKey(TLAttributeKey key) const;
+  [[nodiscard]] const std::shared_ptr<TLPerson>& personValueForKey(TLAttributeKey key) const;
+  [[nodiscard]] const std::optional<TLString>& stringValueForKey(TLAttributeKey key) const;
+  // Null also for an empty list.
+  [[nodiscard]] const std::vector<std::shared_ptr<TLPerson>>* personValuesForKey(
+      TLAttributeKey key) const;
+  [[nodiscard]] const std::vector<TLString>* stringValuesForKey(TLAttributeKey key) const;
+
+ private:
+  friend struct TLRecordTable<TLIndexableItem>;
+};
+
+extern template class TLRecord<TLIndexableItem>;

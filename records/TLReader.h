@@ -1,0 +1,158 @@
+#pragma once
+
+#include <bit>
+#include <cstdint>
+#include <cstring>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/Text.h"
+
+// How many sub-records may lie inside each other. A record nested deeper makes the read fail, and
+// every walk over a tree of records (write, compare, hash, copy, describe) asserts the same bound,
+// so that no input and no tree built by hand can exhaust the stack.
+inline constexpr int kMaximumRecordDepth = 256;
+
+// How many sub-records and texts of lists one read may make. Two bytes on the wire can ask for a
+// record of some 300 bytes; past this limit, far beyond any real item, the read fails rather than
+// eat the memory of the device.
+inline constexpr uint32_t kMaximumRecordElements = uint32_t{1} << 18;
+
+// Wire types, the low three bits of a tag.
+enum class TLWireType : uint8_t {
+  varint = 0,
+  fixed64 = 1,
+  lengthDelimited = 2,
+  startGroup = 3,
+  endGroup = 4,
+  fixed32 = 5,
+};
+
+// Reads the Protocol Buffers wire format in place from bytes that outlive it. Every failure raises
+// the error flag, which stays; what could not be read reads as 0 or null. One thread.
+class TLReader {
+ public:
+  explicit TLReader(std::string_view bytes)
+      : _position(bytes.data()), _limit(bytes.data() + bytes.size()) {}
+
+  [[nodiscard]] bool hasError() const { return _error; }
+  // True while bytes are left before the limit and nothing has failed.
+  [[nodiscard]] bool hasMore() const { return _position < _limit && !_error; }
+  [[nodiscard]] size_t remaining() const { return static_cast<size_t>(_limit - _position); }
+  void fail() { _error = true; }
+
+  // At most ten bytes, low group first. Ten bytes that all have their top bit set read as 0,
+  // without an error, and the next read starts behind them.
+  uint64_t readVarint() {
+    if (_position < _limit && static_cast<uint8_t>(*_position) < 0x80) {
+      return static_cast<uint8_t>(*_position++);
+    }
+    uint64_t value = 0;
+    for (unsigned shift = 0; shift < 70; shift += 7) {
+      if (_position == _limit) {
+        _error = true;
+        return 0;
+      }
+      const auto byte = static_cast<uint8_t>(*_position++);
+      value |= static_cast<uint64_t>(byte & 0x7F) << shift;
+      if (byte < 0x80) return value;
+    }
+    return 0;
+  }
+
+  float readFloat() { return readFixed<float>(); }
+  double readDouble() { return readFixed<double>(); }
+
+  // A length and as many bytes; the view lives as long as the input. None when they are not there.
+  std::optional<std::string_view> readView() {
+    const uint64_t length = readVarint();
+    if (_error || length > remaining()) {
+      _error = true;
+      return std::nullopt;
+    }
+    const std::string_view view(_position, static_cast<size_t>(length));
+    _position += length;
+    return view;
+  }
+
+  // Invalid UTF-8 reads as U+FFFD.
+  std::optional<TLString> readString() {
+    const auto view = readView();
+    return view ? std::optional(platform::fromUTF8(*view)) : std::nullopt;
+  }
+
+  std::optional<std::string> readBytes() {
+    const auto view = readView();
+    return view ? std::optional(std::string(*view)) : std::nullopt;
+  }
+
+  // Steps over the value behind a tag of this wire type; a group is skipped up to the end tag that
+  // closes it. False for a wire type that does not exist or a value that is cut short.
+  [[nodiscard]] bool skipValue(uint64_t wireType);
+
+  // Reads a length and runs `body` with that length as the limit, then restores the limit, leaving
+  // the position where `body` stopped. False when the length does not fit or `body` says so.
+  template <typename Body>
+  [[nodiscard]] bool withLengthLimit(Body&& body) {
+    const uint64_t length = readVarint();
+    if (_error || length > remaining()) {
+      _error = true;
+      return false;
+    }
+    const char* const outer = _limit;
+    _limit = _position + length;
+    const bool result = body();
+    _limit = outer;
+    return result;
+  }
+
+  // Counts one element against the bound; false, with the error flag, when it is used up.
+  [[nodiscard]] bool takeElement() {
+    if (_elements == kMaximumRecordElements) _error = true;
+    ++_elements;
+    return !_error;
+  }
+
+  // A sub-record in place, within the bounds of nesting and number.
+  template <typename Record>
+  [[nodiscard]] bool readRecord(Record& record) {
+    if (_depth == kMaximumRecordDepth) _error = true;
+    if (!takeElement()) return false;
+    ++_depth;
+    const bool result = withLengthLimit([&] { return record.readFrom(*this); });
+    --_depth;
+    return result;
+  }
+
+ private:
+  static_assert(std::endian::native == std::endian::little, "fixed fields are read in place");
+
+  template <typename T>
+  T readFixed() {
+    T value = 0;
+    if (remaining() < sizeof value) {
+      _error = true;
+      return value;
+    }
+    std::memcpy(&value, _position, sizeof value);
+    _position += sizeof value;
+    return value;
+  }
+
+  bool skipBytes(uint64_t count) {
+    if (_error || count > remaining()) {
+      _error = true;
+      return false;
+    }
+    _position += count;
+    return true;
+  }
+  bool skipGroup();
+
+  const char* _position;
+  const char* _limit;
+  bool _error = false;
+  int _depth = 0;
+  uint32_t _elements = 0;
+};
