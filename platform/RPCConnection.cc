@@ -366,8 +366,8 @@ void RPCServerConnection::checkQueue(size_t bytes) {
   end();
 }
 
-// The bus leaves the loop first: one that is attached when the loop ends blocks until its queue is empty,
-// however long the peer does not read.
+// The bus leaves the loop first: one that is attached when the loop ends blocks until its queue is
+// empty, however long the peer does not read.
 void RPCServerConnection::end() {
   _ending = true;
   sd_bus_detach_event(_bus);
