@@ -36,10 +36,10 @@ std::optional<std::vector<std::span<const Element>>> split(std::span<const Eleme
   for (size_t i = 0; i < elements.size(); ++i) {
     const size_t size = sizeOf(elements[i]);
     if (size > limit) {
-      platform::setError(
-          error, {"com.quill.tallow.client", 1,
-                  fmt::format("{} takes {} bytes, more than the {} that one call can carry",
-                              nameOf(elements[i]).substr(0, kNameLength), size, limit)});
+      platform::setError(error,
+                         {"com.quill.tallow.client", 1,
+                          fmt::format("{} takes {} bytes, more than the {} that one call can carry",
+                                      nameOf(elements[i]).substr(0, kNameLength), size, limit)});
       return std::nullopt;
     }
     if (bytes + size > limit) {

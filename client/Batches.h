@@ -22,9 +22,9 @@ struct EncodedItem {
 
 [[nodiscard]] EncodedItem encode(const TLIndexableItem& item);
 
-// Cuts a list into pieces, in order, whose D-Bus arrays stay within `limit`, as full as that allows.
-// An empty list gives no piece. None, with an error that names it, when one item or text alone does
-// not fit.
+// Cuts a list into pieces, in order, whose D-Bus arrays stay within `limit`, as full as that
+// allows. An empty list gives no piece. None, with an error that names it, when one item or text
+// alone does not fit.
 [[nodiscard]] std::optional<std::vector<std::span<const EncodedItem>>> splitItems(
     std::span<const EncodedItem> items, TLErrorOut error, size_t limit = kMaximumArrayBytes);
 [[nodiscard]] std::optional<std::vector<std::span<const std::string>>> splitTexts(

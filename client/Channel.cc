@@ -63,7 +63,8 @@ TLError errorOf(sd_bus_message* reply) {
     return {domain, code, message};
   }
   const char* text = error->message == nullptr ? "call failed" : error->message;
-  return {kProtocolDomain, sd_bus_error_get_errno(error), fmt::format("{} ({})", text, error->name)};
+  return {kProtocolDomain, sd_bus_error_get_errno(error),
+          fmt::format("{} ({})", text, error->name)};
 }
 
 int onReply(sd_bus_message* reply, void* data, sd_bus_error*) {
@@ -174,7 +175,8 @@ bool Channel::call(const char* member, std::chrono::seconds timeout, const Body&
 
   Message reply;
   result = exchange(_bus, request.get(), timeout, reply);
-  const bool answered = reply != nullptr && sd_bus_message_is_method_error(reply.get(), nullptr) == 0;
+  const bool answered =
+      reply != nullptr && sd_bus_message_is_method_error(reply.get(), nullptr) == 0;
   if (answered) {
     result = read(reply.get());
     if (result >= 0) return true;

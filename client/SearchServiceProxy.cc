@@ -88,8 +88,8 @@ bool SearchServiceProxy::deleteItemsWithIdentifiers(std::span<const std::string>
 bool SearchServiceProxy::deleteItemsWithDomainIdentifiers(
     std::span<const std::string> domainIdentifiers, const std::string& name,
     const std::string& protectionClass, TLErrorOut error) {
-  return callWithTexts("DeleteItemsWithDomainIdentifiers", domainIdentifiers, name,
-                       protectionClass, error);
+  return callWithTexts("DeleteItemsWithDomainIdentifiers", domainIdentifiers, name, protectionClass,
+                       error);
 }
 
 bool SearchServiceProxy::indexItems(std::span<const EncodedItem> items,
@@ -104,8 +104,8 @@ bool SearchServiceProxy::indexItems(std::span<const EncodedItem> items,
   // All deletions but the last piece, then all items but the last piece, go ahead by calls of their
   // own, in the order that one call would keep.
   const bool single = itemPieces->size() <= 1;
-  const size_t separate = single && !textPieces->empty() ? textPieces->size() - 1
-                                                         : textPieces->size();
+  const size_t separate =
+      single && !textPieces->empty() ? textPieces->size() - 1 : textPieces->size();
   for (size_t i = 0; i < separate; ++i) {
     if (!deleteItemsWithIdentifiers((*textPieces)[i], name, protectionClass, error)) return false;
   }
@@ -114,7 +114,8 @@ bool SearchServiceProxy::indexItems(std::span<const EncodedItem> items,
   }
 
   const auto append = [&](sd_bus_message* call) {
-    const auto lastItems = itemPieces->empty() ? std::span<const EncodedItem>() : itemPieces->back();
+    const auto lastItems =
+        itemPieces->empty() ? std::span<const EncodedItem>() : itemPieces->back();
     const auto lastTexts =
         separate < textPieces->size() ? textPieces->back() : std::span<const std::string>();
     int result = appendItems(call, lastItems);
@@ -158,9 +159,9 @@ std::optional<SearchServiceProxy::Items> SearchServiceProxy::searchItems(
   Items items;
   const auto append = [&](sd_bus_message* call) {
     const int result = appendBytes(call, query.data());
-    return result < 0 ? result
-                      : sd_bus_message_append(call, "tsx", options, protectionClass.c_str(),
-                                              maxResults);
+    return result < 0
+               ? result
+               : sd_bus_message_append(call, "tsx", options, protectionClass.c_str(), maxResults);
   };
   const auto read = [&](sd_bus_message* reply) { return readItems(reply, items); };
   if (!_channel.call("SearchItemsForQuery", kShortTimeout, append, read, error)) {

@@ -31,12 +31,11 @@ class SearchServiceProxy {
   bool indexItems(std::span<const EncodedItem> items, const std::string& name,
                   const std::string& protectionClass, TLErrorOut error);
 
-  bool deleteItemsWithIdentifiers(std::span<const std::string> identifiers,
-                                  const std::string& name, const std::string& protectionClass,
-                                  TLErrorOut error);
+  bool deleteItemsWithIdentifiers(std::span<const std::string> identifiers, const std::string& name,
+                                  const std::string& protectionClass, TLErrorOut error);
 
-  // Deletes, then indexes, then stores the state, if given. The state goes with the last call, so it
-  // is stored only after all else has succeeded.
+  // Deletes, then indexes, then stores the state, if given. The state goes with the last call, so
+  // it is stored only after all else has succeeded.
   bool indexItems(std::span<const EncodedItem> items, std::span<const std::string> identifiers,
                   const std::optional<std::string>& clientState, const std::string& name,
                   const std::string& protectionClass, TLErrorOut error);
@@ -47,8 +46,8 @@ class SearchServiceProxy {
                                                                 TLErrorOut error);
 
   bool deleteItemsWithDomainIdentifiers(std::span<const std::string> domainIdentifiers,
-                                        const std::string& name,
-                                        const std::string& protectionClass, TLErrorOut error);
+                                        const std::string& name, const std::string& protectionClass,
+                                        TLErrorOut error);
 
   bool deleteAllItems(const std::string& name, const std::string& protectionClass,
                       TLErrorOut error);
@@ -63,8 +62,7 @@ class SearchServiceProxy {
 
  private:
   bool callWithTexts(const char* member, std::span<const std::string> texts,
-                     const std::string& name, const std::string& protectionClass,
-                     TLErrorOut error);
+                     const std::string& name, const std::string& protectionClass, TLErrorOut error);
 
   Channel _channel;
 };
