@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "indexer/Snippet.h"
-#include "indexer/TALHTMLParsing.h"
 #include "indexer/TALIndexer.h"
 #include "indexer/ZoneFilling.h"
 #include "platform/Clock.h"
@@ -35,7 +34,7 @@ void prepareText(TLIndexableItem& item) {
   std::optional<TLString> body;
   const auto& html = item.attributeForKey(TLAttributeKey::HTML_CONTENT_DATA);
   if (html != nullptr && html->hasBytesValue() && !html->bytesValue()->empty()) {
-    body = TALPlainTextFromHTMLData(*html->bytesValue());
+    body = plainTextOfHTML(*html->bytesValue());
     if (body) html->setStringValue(body);
   }
   auto snippet = snippetOfBody(body ? body : item.stringValueForKey(TLAttributeKey::TEXT_CONTENT));

@@ -48,7 +48,7 @@ void addHTML(zone::Zones& zones, uint32_t zone, const TLAttribute& attribute,
   if (attribute.hasStringValue() && !attribute.stringValue()->empty()) {
     addToZones(zones, zone, *attribute.stringValue(), tokenizer, true);
   } else if (attribute.hasBytesValue()) {
-    const auto text = TALPlainTextFromHTMLData(*attribute.bytesValue());
+    const auto text = plainTextOfHTML(*attribute.bytesValue());
     addToZones(zones, zone, platform::orEmpty(text), tokenizer, true);
   }
 }
@@ -93,4 +93,9 @@ void addToZones(zone::Zones& zones, uint32_t zoneNumber, TLStringView text,
   } else if (tokenizer != nullptr) {
     zone.AddText(text.substr(0, kMaximumTokenizedUnits), *tokenizer);
   }
+}
+
+std::optional<TLString> plainTextOfHTML(std::string_view html) {
+  constexpr uint64_t kNoLimit = 2147483647;
+  return TALPlainTextFromHTMLData(html, kNoLimit, nullptr, platform::kEncodingUTF8);
 }

@@ -18,3 +18,6 @@ void populateZones(zone::Zones& zones, const TLIndexableItem& item, const TALZon
 // Adds one text to a zone: cleaned word by word, or as it is, to be matched from its start only.
 void addToZones(zone::Zones& zones, uint32_t zoneNumber, TLStringView text,
                 const tokenizer::Tokenizer* tokenizer, bool tokenize);
+
+// The plain text of an HTML body as it is indexed: whole, and read as UTF-8.
+[[nodiscard]] std::optional<TLString> plainTextOfHTML(std::string_view html);

@@ -9,6 +9,9 @@ namespace platform {
 
 namespace {
 
+// ICU counts bytes in 32 bits; no encoding takes more than 8 for a unit.
+constexpr size_t kMaximumEncoded = size_t{1} << 27;
+
 struct Encoding {
   uint64_t number;
   uint32_t converter;
@@ -133,7 +136,7 @@ bool Charset::decode(std::string_view bytes, TLString& out) const {
 }
 
 std::optional<std::string> Charset::encode(TLStringView text) const {
-  if (!_converter) return std::nullopt;
+  if (!_converter || text.size() > kMaximumEncoded) return std::nullopt;
   std::string out(static_cast<size_t>(UCNV_GET_MAX_BYTES_FOR_STRING(
                       text.size(), ucnv_getMaxCharSize(_converter.get()))),
                   '\0');

@@ -57,4 +57,7 @@ class RunLoop {
   std::unique_ptr<Body> _body;
 };
 
+// The run loop of the process, run by the main thread; made on first use and never destroyed.
+[[nodiscard]] RunLoop& mainRunLoop();
+
 }  // namespace platform

@@ -44,7 +44,7 @@ TLField(uint32_t, const char*, Value Record::*, uint8_t) -> TLField<Record, Valu
 
 namespace recordfields {
 
-// Bounds the nesting of a walk through records that hold records of their own class.
+// Bounds the nesting of a walk: one guard per sub-record that the walk is inside of.
 class NestingGuard {
  public:
   NestingGuard() {
@@ -191,13 +191,21 @@ struct TLFieldKind<std::shared_ptr<Record>> {
     return reader.readRecord(*value);
   }
   static void write(uint32_t number, const Value& value, TLWriter& writer) {
+    const recordfields::NestingGuard guard;
     writer.writeRecordField(number, *value);
   }
   static bool equal(const Value& a, const Value& b) {
+    const recordfields::NestingGuard guard;
     return a == b || (a != nullptr && b != nullptr && a->isEqual(*b));
   }
-  static uint64_t hash(const Value& value) { return value->hash(); }
-  static Value deepCopy(const Value& value) { return value->copyWithZone(); }
+  static uint64_t hash(const Value& value) {
+    const recordfields::NestingGuard guard;
+    return value->hash();
+  }
+  static Value deepCopy(const Value& value) {
+    const recordfields::NestingGuard guard;
+    return value->copyWithZone();
+  }
   static void merge(const Value& from, Value& to) {
     if (to == nullptr) {
       to = from;
@@ -205,7 +213,10 @@ struct TLFieldKind<std::shared_ptr<Record>> {
       to->mergeFrom(*from);
     }
   }
-  static nlohmann::json describe(const Value& value) { return value->dictionaryRepresentation(); }
+  static nlohmann::json describe(const Value& value) {
+    const recordfields::NestingGuard guard;
+    return value->dictionaryRepresentation();
+  }
 };
 
 // What the lists have in common. `Elements` says how one element is treated.
@@ -252,6 +263,7 @@ template <>
 struct TLFieldKind<std::vector<TLString>>
     : TLListKind<TLString, TLFieldKind<std::vector<TLString>>> {
   static bool read(Value& value, TLReader& reader, uint64_t) {
+    if (!reader.takeElement()) return false;
     if (auto text = reader.readString()) value.push_back(std::move(*text));
     return true;
   }
@@ -291,38 +303,23 @@ struct TLFieldKind<std::vector<int32_t>> : TLListKind<int32_t, TLFieldKind<std::
   }
 };
 
-// Repeated sub-records, one occurrence an element. Only these lists can nest without end, so every
-// step into an element is counted.
+// Repeated sub-records, one occurrence an element.
 template <typename Record>
 struct TLFieldKind<std::vector<std::shared_ptr<Record>>>
     : TLListKind<std::shared_ptr<Record>, TLFieldKind<std::vector<std::shared_ptr<Record>>>> {
   using Element = std::shared_ptr<Record>;
   using One = TLFieldKind<Element>;
 
-  static bool read(std::vector<Element>& value, TLReader& reader, uint64_t) {
-    value.push_back(std::make_shared<Record>());
-    return reader.readRecord(*value.back());
+  static bool read(std::vector<Element>& value, TLReader& reader, uint64_t wireType) {
+    return One::read(value.emplace_back(), reader, wireType);
   }
   static void writeElement(uint32_t number, const Element& element, TLWriter& writer) {
-    const recordfields::NestingGuard guard;
     One::write(number, element, writer);
   }
-  static bool equalElements(const Element& a, const Element& b) {
-    const recordfields::NestingGuard guard;
-    return One::equal(a, b);
-  }
-  static uint64_t hashElement(const Element& element) {
-    const recordfields::NestingGuard guard;
-    return One::hash(element);
-  }
-  static Element copyElement(const Element& element) {
-    const recordfields::NestingGuard guard;
-    return One::deepCopy(element);
-  }
-  static nlohmann::json describeElement(const Element& element) {
-    const recordfields::NestingGuard guard;
-    return One::describe(element);
-  }
+  static bool equalElements(const Element& a, const Element& b) { return One::equal(a, b); }
+  static uint64_t hashElement(const Element& element) { return One::hash(element); }
+  static Element copyElement(const Element& element) { return One::deepCopy(element); }
+  static nlohmann::json describeElement(const Element& element) { return One::describe(element); }
 };
 
 namespace recordfields {

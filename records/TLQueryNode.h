@@ -7,8 +7,9 @@
 // One node of a query's tree of attribute conditions. A leaf has keys, an op and the value that the
 // op compares with; an AND or OR node has only children.
 //
-// A tree is at most kMaximumRecordDepth levels of children deep. A deeper one can be built and
-// destroyed, but to write, compare, hash, copy or describe it is a programming error.
+// A tree is at most kMaximumRecordDepth levels of children deep, one less below a query. A deeper
+// one can be built and destroyed, but to write, compare, hash, copy or describe it is a programming
+// error.
 class TLQueryNode final : public TLRecord<TLQueryNode> {
  public:
   TLQueryNode() = default;

@@ -14,9 +14,10 @@
 // so that no input and no tree built by hand can exhaust the stack.
 inline constexpr int kMaximumRecordDepth = 256;
 
-// How many sub-records one read may make. Two bytes on the wire can ask for a record of some 300
-// bytes; past this limit the read fails rather than eat the memory of the device.
-inline constexpr uint32_t kMaximumRecordCount = uint32_t{1} << 20;
+// How many sub-records and texts of lists one read may make. Two bytes on the wire can ask for a
+// record of some 300 bytes; past this limit, far beyond any real item, the read fails rather than
+// eat the memory of the device.
+inline constexpr uint32_t kMaximumRecordElements = uint32_t{1} << 18;
 
 // Wire types, the low three bits of a tag.
 enum class TLWireType : uint8_t {
@@ -106,15 +107,19 @@ class TLReader {
     return result;
   }
 
+  // Counts one element against the bound; false, with the error flag, when it is used up.
+  [[nodiscard]] bool takeElement() {
+    if (_elements == kMaximumRecordElements) _error = true;
+    ++_elements;
+    return !_error;
+  }
+
   // A sub-record in place, within the bounds of nesting and number.
   template <typename Record>
   [[nodiscard]] bool readRecord(Record& record) {
-    if (_depth == kMaximumRecordDepth || _records == kMaximumRecordCount) {
-      _error = true;
-      return false;
-    }
+    if (_depth == kMaximumRecordDepth) _error = true;
+    if (!takeElement()) return false;
     ++_depth;
-    ++_records;
     const bool result = withLengthLimit([&] { return record.readFrom(*this); });
     --_depth;
     return result;
@@ -149,5 +154,5 @@ class TLReader {
   const char* _limit;
   bool _error = false;
   int _depth = 0;
-  uint32_t _records = 0;
+  uint32_t _elements = 0;
 };

@@ -47,6 +47,16 @@ void LeveldbLogger::Logv(const char* format, va_list arguments) {
   log.debug("{}", static_cast<const char*>(line));
 }
 
+leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
+  platform::MutexLock lock(_mutex);
+  leveldb::Status status;
+  if (_logTorn) status = _db->Write(leveldb::WriteOptions(), nullptr);
+  if (!status.ok()) return status;
+  status = _db->Write(leveldb::WriteOptions(), batch);
+  _logTorn = !status.ok();
+  return status;
+}
+
 Database openDatabase(const std::string& path, OpenMode mode) {
   Database result;
   result.logger = std::make_unique<LeveldbLogger>();

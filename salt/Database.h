@@ -3,12 +3,14 @@
 #include <leveldb/cache.h>
 #include <leveldb/db.h>
 #include <leveldb/env.h>
+#include <leveldb/write_batch.h>
 
 #include <memory>
 #include <string>
 #include <string_view>
 
 #include "platform/Log.h"
+#include "platform/Mutex.h"
 
 namespace salt {
 
@@ -31,6 +33,22 @@ enum class OpenMode { create, existing };
 
 // `create` removes what is at `path` first. A failure is logged.
 [[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode);
+
+// The only way batches are written. A write that fails (a full disk, say) can leave half a record
+// in the log, and recovery does not look behind it: the next write starts a new log first, so that
+// what it acknowledges survives. Any thread.
+class BatchWriter {
+ public:
+  explicit BatchWriter(leveldb::DB* db) : _db(db) {}
+
+  // Not synced to the disk.
+  [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch) TL_EXCLUDES(_mutex);
+
+ private:
+  leveldb::DB* const _db;
+  platform::Mutex _mutex;
+  bool _logTorn TL_GUARDED_BY(_mutex) = false;
+};
 
 inline leveldb::Slice slice(std::string_view bytes) {
   return {bytes.data(), bytes.size()};

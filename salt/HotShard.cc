@@ -16,6 +16,10 @@ double seconds(std::chrono::nanoseconds duration) {
   return static_cast<double>(duration.count()) / 1000000000;
 }
 
+bool holds(const std::vector<uint16_t>& zones, uint16_t zoneID) {
+  return std::find(zones.begin(), zones.end(), zoneID) != zones.end();
+}
+
 bool refuse(const char* reason) {
   Log.error("{}", reason);
   return false;
@@ -58,19 +62,21 @@ std::optional<index::Aftermath> index::storeZone(Clock::time_point start, uint32
   }
   const TextKey key = textKey(docID, zoneID);
   std::string stored;
-  switch (appendToStored(key, text, offsets, merge, &stored)) {
-    case Stored::failed:
-      return std::nullopt;
-    case Stored::duplicate:
-      return Aftermath{};
-    case Stored::appended:
-      text = stored;
-      break;
-    case Stored::none:
-      break;
-  }
-  putZone(key, docID, zoneID, text, offsets);
-  return commitZone(start, locked, docID, offsets.size());
+  const Stored before = mayBeStored(docID, zoneID)
+                            ? appendToStored(key, text, offsets, merge, &stored)
+                            : Stored::none;
+  if (before == Stored::failed) return std::nullopt;
+  if (before == Stored::duplicate) return Aftermath{};
+  putZone(key, docID, zoneID, before == Stored::appended ? stored : text, offsets);
+  return commitZone(start, locked, docID, zoneID, offsets.size());
+}
+
+// False without a read where the answer is known: no document above MaxDocID has text. This spares
+// new documents, nearly all there are, a look-up that misses through every level of the database.
+bool index::mayBeStored(uint32_t docID, uint16_t zoneID) const {
+  if (docID == _newestDoc) return holds(_newestZones, zoneID);
+  platform::MutexLock lock(_metricsMutex);
+  return docID <= metrics.MaxDocID;
 }
 
 // A NUL goes between the older text and the newer, so that no suffix runs from one into the other.
@@ -116,7 +122,8 @@ void index::putZone(const TextKey& key, uint32_t docID, uint16_t zoneID, std::st
 }
 
 std::optional<index::Aftermath> index::commitZone(Clock::time_point start, Clock::time_point locked,
-                                                  uint32_t docID, size_t suffixes) {
+                                                  uint32_t docID, uint16_t zoneID,
+                                                  size_t suffixes) {
   const size_t batchBytes = _batch->ApproximateSize();
   platform::MutexLock lock(_metricsMutex);
   const MetricsBlock undo = metrics;
@@ -132,9 +139,16 @@ std::optional<index::Aftermath> index::commitZone(Clock::time_point start, Clock
   aftermath.vacuumDue = !metrics.VacuumInProgress && metrics.HotSuffixes > op.MaxHotSuffixes;
   const bool written = writeMetrics(&*_batch);
   if (batchBytes > kMaxKeptBatchBytes) _batch.emplace();
-  if (written) return aftermath;
-  static_cast<MetricsBlock&>(metrics) = undo;
-  return std::nullopt;
+  if (!written) {
+    static_cast<MetricsBlock&>(metrics) = undo;
+    return std::nullopt;
+  }
+  if (docID > undo.MaxDocID) {
+    _newestDoc = docID;
+    _newestZones.clear();
+  }
+  if (docID == _newestDoc && !holds(_newestZones, zoneID)) _newestZones.push_back(zoneID);
+  return aftermath;
 }
 
 // No delay below twice MaxHotSuffixes, from there whole multiples of the time the write lock was
@@ -162,7 +176,9 @@ bool index::DeleteDoc(uint32_t docID) {
   };
   _deleted.forEach([&add](const DeletedDoc& doc) { add(doc.docID); });
   add(docID);
-  if (!db->Put(leveldb::WriteOptions(), kDeletedKey, bytes).ok()) return false;
+  leveldb::WriteBatch batch;
+  batch.Put(kDeletedKey, bytes);
+  if (!_writer.write(&batch).ok()) return false;
   _deleted.insert({docID});
   return true;
 }

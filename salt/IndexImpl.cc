@@ -30,7 +30,10 @@ bool parseRecord(const std::string& bytes, Record* record) {
 }  // namespace
 
 index::index(Database opened)
-    : _database(std::move(opened)), db(_database.db.get()), _batch(std::in_place) {
+    : _database(std::move(opened)),
+      _writer(_database.db.get()),
+      db(_database.db.get()),
+      _batch(std::in_place) {
   std::string bytes;
   leveldb::Status status = db->Get(leveldb::ReadOptions(), kMetricsKey, &bytes);
   if (!status.ok() || !parseRecord(bytes, &metrics)) return;
@@ -50,25 +53,26 @@ index::index(Database opened)
 }
 
 Index* NewIndex(const Index::Options& options) {
-  Database ldb = openDatabase(options.Path, OpenMode::create);
-  TL_ASSERT(ldb.db);
-  leveldb::Status status = putRecord(ldb.db.get(), kOptionsKey, options);
+  Database database = openDatabase(options.Path, OpenMode::create);
+  leveldb::DB* const ldb = database.db.get();
+  TL_ASSERT(ldb);
+  leveldb::Status status = putRecord(ldb, kOptionsKey, options);
   TL_ASSERT(status.ok());
   Index::Metrics metrics;
   metrics.CodeVersion = CODE_VERSION;
   metrics.CreationTime = std::time(nullptr);
-  status = putRecord(ldb.db.get(), kMetricsKey, metrics);
+  status = putRecord(ldb, kMetricsKey, metrics);
   TL_ASSERT(status.ok());
-  auto idx = std::make_unique<index>(std::move(ldb));
+  auto idx = std::make_unique<index>(std::move(database));
   platform::MutexLock lock(idx->_metricsMutex);
   TL_ASSERT(idx->metrics.CodeVersion == CODE_VERSION);
   return idx.release();
 }
 
 Index* LoadIndex(const std::string& path) {
-  Database ldb = openDatabase(path, OpenMode::existing);
-  if (!ldb.db) return nullptr;
-  auto idx = std::make_unique<index>(std::move(ldb));
+  Database database = openDatabase(path, OpenMode::existing);
+  if (!database.db) return nullptr;
+  auto idx = std::make_unique<index>(std::move(database));
   if (!idx->metricsSound()) return nullptr;
   if (idx->op.ValidateOnLoad && !idx->Validate()) {
     Log.fault("Loading failure: Validation failed.");
@@ -155,7 +159,7 @@ void index::ResetScanMetrics() {
 bool index::writeMetrics(leveldb::WriteBatch* batch) {
   const MetricsBlock& block = metrics;
   batch->Put(kMetricsKey, {reinterpret_cast<const char*>(&block), sizeof block});
-  const leveldb::Status status = db->Write(leveldb::WriteOptions(), batch);
+  const leveldb::Status status = _writer.write(batch);
   batch->Clear();
   if (!status.ok()) Log.error("Error writing to db: {}", status.ToString());
   return status.ok();

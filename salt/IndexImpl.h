@@ -95,11 +95,14 @@ class index final : public Index {
   [[nodiscard]] Stored appendToStored(const TextKey& key, std::string_view text,
                                       std::vector<uint32_t>& offsets, bool merge,
                                       std::string* stored) TL_REQUIRES(_writeMutex);
+  [[nodiscard]] bool mayBeStored(uint32_t docID, uint16_t zoneID) const TL_REQUIRES(_writeMutex)
+      TL_EXCLUDES(_metricsMutex);
   void putZone(const TextKey& key, uint32_t docID, uint16_t zoneID, std::string_view text,
                const std::vector<uint32_t>& offsets) TL_REQUIRES(_writeMutex);
   [[nodiscard]] std::optional<Aftermath> commitZone(Clock::time_point start,
                                                     Clock::time_point locked, uint32_t docID,
-                                                    size_t suffixes) TL_REQUIRES(_writeMutex);
+                                                    uint16_t zoneID, size_t suffixes)
+      TL_REQUIRES(_writeMutex);
   [[nodiscard]] std::chrono::nanoseconds throttle(Clock::duration held) TL_REQUIRES(_metricsMutex);
 
   // Writes the batch together with the metrics and clears it. A failure is logged.
@@ -120,6 +123,7 @@ class index final : public Index {
   friend Index* LoadIndex(const std::string& path);
 
   Database _database;
+  BatchWriter _writer;
 
  public:
   // Fixed from the construction on.
@@ -134,6 +138,9 @@ class index final : public Index {
   // Kept for their memory.
   std::optional<leveldb::WriteBatch> _batch TL_GUARDED_BY(_writeMutex);
   std::string _key TL_GUARDED_BY(_writeMutex);
+  // The zones of the document that was above all others when it came, 0 for none.
+  uint32_t _newestDoc TL_GUARDED_BY(_writeMutex) = 0;
+  std::vector<uint16_t> _newestZones TL_GUARDED_BY(_writeMutex);
 
   // Written under the write mutex, read without: the callers keep DeleteDoc and readers apart.
   DocTable<DeletedDoc> _deleted;

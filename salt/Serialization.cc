@@ -124,7 +124,7 @@ Index::Metrics::operator std::string() const {
        Shards, LastShardSuffixes, HotSuffixes, Pages);
   if (Pages != 0) {
     line(FMT_STRING("---- Average suffixes/page: {:.2f}\n"),
-         per(static_cast<double>(Suffixes - HotSuffixes), Pages));
+         per(static_cast<double>(Suffixes) - static_cast<double>(HotSuffixes), Pages));
   }
   line(FMT_STRING("--\n-- INDEXING METRICS\n---- Indexing calls: {}\n"), IndexingCalls);
   if (IndexingCalls != 0) {

@@ -9,12 +9,12 @@
 namespace salt {
 
 Suffix::Suffix(const index& owner, const leveldb::ReadOptions& readOptions)
-    : idx(owner), options(readOptions), text(std::make_unique<char[]>(owner.op.MaxMatchLen)) {}
+    : idx(owner), options(readOptions), _text(std::make_unique<char[]>(owner.op.MaxMatchLen)) {}
 
 Suffix& Suffix::operator=(const Suffix& suffix) {
   if (this == &suffix) return *this;
   TL_ASSERT(suffix.size <= idx.op.MaxMatchLen);
-  std::memcpy(text.get(), suffix.text.get(), suffix.size);
+  std::memcpy(_text.get(), suffix._text.get(), suffix.size);
   size = suffix.size;
   full = suffix.full;
   meta = suffix.meta;
@@ -26,7 +26,7 @@ void Suffix::fromKey(std::string_view key) {
   key.remove_prefix(1);
   size = std::min(key.find('\0'), key.size());
   TL_ASSERT(size <= idx.op.MaxMatchLen);
-  std::memcpy(text.get(), key.data(), size);
+  std::memcpy(_text.get(), key.data(), size);
   full = true;
   key.remove_prefix(std::min(size + 1, key.size()));
   meta = {};
@@ -45,8 +45,8 @@ void Suffix::fromNextMeta(const SuffixMeta& next) {
   const bool second = first && meta.extra[1] != 0;
   size = size_t{meta.lcp} + first + second;
   TL_ASSERT(size <= idx.op.MaxMatchLen);
-  if (first) text[meta.lcp] = static_cast<char>(meta.extra[0]);
-  if (second) text[meta.lcp + size_t{1}] = static_cast<char>(meta.extra[1]);
+  if (first) _text[meta.lcp] = static_cast<char>(meta.extra[0]);
+  if (second) _text[meta.lcp + size_t{1}] = static_cast<char>(meta.extra[1]);
   full = !second && size != 0;
 }
 
@@ -54,10 +54,10 @@ void Suffix::fetch() {
   if (full) return;
   TL_ASSERT(meta.DocID > 0);
   ++fetches;
-  const std::string_view whole = idx.fullText(meta, options, &_zoneText);
-  TL_ASSERT(whole.size() >= size);
-  std::memcpy(text.get() + size, whole.data() + size, whole.size() - size);
-  size = whole.size();
+  const std::string_view text = idx.fullText(meta, options, &_zoneText);
+  TL_ASSERT(text.size() >= size);
+  std::memcpy(_text.get() + size, text.data() + size, text.size() - size);
+  size = text.size();
   full = true;
 }
 
@@ -65,7 +65,7 @@ int Suffix::compareWithPrefix(std::string_view prefix) {
   if (prefix.empty()) return 0;
   for (size_t done = 0;;) {
     const size_t known = std::min(size, prefix.size());
-    const int order = std::memcmp(text.get() + done, prefix.data() + done, known - done);
+    const int order = std::memcmp(_text.get() + done, prefix.data() + done, known - done);
     if (order != 0 || known == prefix.size()) return order;
     if (full) return -1;
     done = known;

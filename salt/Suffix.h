@@ -38,18 +38,18 @@ class Suffix {
   [[nodiscard]] int compareWithPrefix(std::string_view prefix);
 
   // What is known of the text. Lives until the next change.
-  [[nodiscard]] std::string_view knownText() const { return {text.get(), size}; }
+  [[nodiscard]] std::string_view knownText() const { return {_text.get(), size}; }
 
   const index& idx;
   const leveldb::ReadOptions options;
-  const std::unique_ptr<char[]> text;  // MaxMatchLen bytes
   size_t size = 0;
   bool full = true;
   uint64_t fetches = 0;  // zone texts read
   SuffixMeta meta;
 
  private:
-  std::string _zoneText;  // of the latest fetch; kept for its memory
+  const std::unique_ptr<char[]> _text;  // MaxMatchLen bytes
+  std::string _zoneText;                // of the latest fetch; kept for its memory
 };
 
 // A walk over the suffixes of one shard at a time, in order. One thread. The view outlives it.

@@ -108,12 +108,13 @@ bool FoldedText::enterNextWord() {
     const int32_t start = _wordEnd;
     const int32_t end = ubrk_next(_workspace.iterator.get());
     if (end == UBRK_DONE) return false;
-    _position = start;
     _wordEnd = end;
     _marks = 0;
     if (isWord(start, end) || (end == start + 1 && isJoiningColon(start))) {
+      _position = start;
       return true;
     }
+    _position = end;
     _skipped = true;
   }
 }

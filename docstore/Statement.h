@@ -1,0 +1,75 @@
+#pragma once
+
+#include <sqlite3.h>
+
+#include <string>
+#include <string_view>
+
+#include "docstore/TALSqliteDocStore.h"
+
+// What the sources of TALSqliteDocStore share on top of sqlite3.h.
+
+namespace docstore {
+
+// How many URLs one execution of the look-up by URL takes.
+inline constexpr int kURLsPerStatement = 64;
+
+}  // namespace docstore
+
+// One use of a prepared statement, from its binds to its reset. Bound text and blobs are not copied
+// and must outlive the steps. A failed bind makes every step fail.
+class TALSqliteDocStore::Use {
+ public:
+  explicit Use(sqlite3_stmt* statement) : _statement(statement) {}
+  explicit Use(const Statement& statement) : _statement(statement.get()) {}
+  ~Use() {
+    sqlite3_reset(_statement);
+    sqlite3_clear_bindings(_statement);
+  }
+  Use(const Use&) = delete;
+  Use& operator=(const Use&) = delete;
+
+  Use& bindText(int index, std::string_view text) {
+    return check(sqlite3_bind_text64(_statement, index, text.data(), text.size(), SQLITE_STATIC,
+                                     SQLITE_UTF8));
+  }
+  Use& bindText(int index, std::string&& text) = delete;
+  Use& bindBlob(int index, std::string_view bytes) {
+    return check(sqlite3_bind_blob64(_statement, index, bytes.data(), bytes.size(), SQLITE_STATIC));
+  }
+  Use& bindInt(int index, int64_t value) {
+    return check(sqlite3_bind_int64(_statement, index, value));
+  }
+
+  // SQLITE_ROW, SQLITE_DONE or an error code.
+  int step() { return _bound == SQLITE_OK ? sqlite3_step(_statement) : _bound; }
+
+  [[nodiscard]] uint32_t columnID(int column) const {
+    return static_cast<uint32_t>(sqlite3_column_int(_statement, column));
+  }
+  [[nodiscard]] int64_t columnInt(int column) const {
+    return sqlite3_column_int64(_statement, column);
+  }
+  // The bytes of a text column, empty for NULL.
+  [[nodiscard]] std::string columnText(int column) const {
+    const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(_statement, column));
+    const int length = sqlite3_column_bytes(_statement, column);
+    return text != nullptr ? std::string(text, static_cast<size_t>(length)) : std::string();
+  }
+  // The bytes of a blob column in place, until the next step; empty for NULL.
+  [[nodiscard]] std::string_view columnBlob(int column) const {
+    const auto* blob = static_cast<const char*>(sqlite3_column_blob(_statement, column));
+    const int length = sqlite3_column_bytes(_statement, column);
+    return blob != nullptr ? std::string_view(blob, static_cast<size_t>(length))
+                           : std::string_view();
+  }
+
+ private:
+  Use& check(int code) {
+    if (code != SQLITE_OK) _bound = code;
+    return *this;
+  }
+
+  sqlite3_stmt* const _statement;
+  int _bound = SQLITE_OK;
+};

@@ -1,0 +1,454 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <functional>
+#include <limits>
+#include <nlohmann/json.hpp>
+#include <stdexcept>
+
+#include "records/TLIndexableItem.h"
+#include "records/TLQuery.h"
+#include "tests/records/Hex.h"
+
+using testsupport::bytes;
+using testsupport::hex;
+
+namespace {
+
+std::shared_ptr<TLPerson> person(std::optional<TLString> name, std::optional<TLString> email) {
+  auto result = std::make_shared<TLPerson>();
+  result->setName(std::move(name));
+  result->setEmailAddress(std::move(email));
+  return result;
+}
+
+// An attribute with every field set.
+std::shared_ptr<TLAttribute> richAttribute() {
+  auto attribute = std::make_shared<TLAttribute>();
+  attribute->setKey(TLAttributeKey::TEXT_CONTENT);
+  attribute->setCustomKey(u"c");
+  attribute->setStringValue(u"gr\u00fc\u00df");
+  attribute->setIntValue(-1);
+  attribute->setFloatValue(1.5F);
+  attribute->setDoubleValue(-2.5);
+  attribute->setBoolValue(true);
+  attribute->setPersonValue(person(u"Ann", std::nullopt));
+  attribute->setBytesValue(std::string("\0\xFF", 2));
+  attribute->setStringValues({u"", u"b"});
+  attribute->addPersonValues(person(std::nullopt, u"x@y"));
+  attribute->addPersonValues(person(std::nullopt, std::nullopt));
+  return attribute;
+}
+
+constexpr const char* kRichAttribute =
+    "08 ab 01 12 01 63 1a 06 67 72 c3 bc c3 9f 20 ff ff ff ff ff ff ff ff ff 01 2d 00 00 c0 3f "
+    "31 00 00 00 00 00 00 04 c0 38 01 42 05 0a 03 41 6e 6e 4a 02 00 ff 52 00 52 01 62 5a 05 12 "
+    "03 78 40 79 5a 00";
+
+std::shared_ptr<TLIndexableItem> richItem() {
+  auto item = std::make_shared<TLIndexableItem>();
+  item->setIdentifier(u"id");
+  item->setDomainIdentifier(u"inbox");
+  item->setExpirationDate(1234567890123);
+  item->addAttributes(richAttribute());
+  item->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, TLString(300, u's'));
+  item->setCard(std::make_shared<TLCard>());
+  item->card()->setTextScore(0.5F);
+  item->card()->setFreshness(3);
+  return item;
+}
+
+// A chain of `levels` nodes, each the only child of the one before.
+std::shared_ptr<TLQueryNode> chain(int levels) {
+  std::shared_ptr<TLQueryNode> top;
+  for (int i = 0; i < levels; ++i) {
+    auto node = std::make_shared<TLQueryNode>();
+    if (top) node->addChild(std::move(top));
+    top = std::move(node);
+  }
+  return top;
+}
+
+// The wire form of a node with `levels` nodes inside each other below it.
+std::string chainBytes(int levels) {
+  std::string reversed;
+  for (int i = 0; i < levels; ++i) {
+    TLWriter length;
+    length.writeVarint(reversed.size());
+    reversed.append(length.bytes().rbegin(), length.bytes().rend());
+    reversed += '\x4a';
+  }
+  return {reversed.rbegin(), reversed.rend()};
+}
+
+}  // namespace
+
+TEST(Records, GoldenBytes) {
+  TLCard card;
+  card.setFreshness(1);
+  card.setMailDateReceived(0);
+  card.setTextScore(-1);
+  TLQueryNode node;
+  node.addKey(TLAttributeKey::SUBJECT);
+  node.addKey(TLAttributeKey::TEXT_CONTENT);
+  TLQueryNode negative;
+  negative.addKey(-1);
+  negative.setOp(TLQueryNodeOp(-2));
+  TLQueryNode leaf;
+  leaf.setMergeOp(TLQueryNodeMergeOp::LEAF);
+  TLQuery query;
+  query.setRoot(std::make_shared<TLQueryNode>());
+  query.setRawQuery(u"a");
+  query.setSearchParams(std::make_shared<TLParameters>());
+  TLAttribute surrogate;
+  surrogate.setStringValue(TLString(1, char16_t(0xD800)));
+  TLIndexableItem persons;
+  persons.addPersonsWithKey(TLAttributeKey::AUTHORS, {});
+
+  const std::vector<std::pair<std::string, std::string>> cases{
+      {hex(TLIndexableItem().data()), "12 00"},
+      {hex(TLAttribute().data()), ""},
+      {hex(TLPerson().data()), ""},
+      {hex(TLCard().data()), ""},
+      {hex(TLQuery().data()), ""},
+      {hex(TLQueryNode().data()), ""},
+      {hex(richAttribute()->data()), kRichAttribute},
+      {hex(card.data()), "0d 00 00 80 bf 79 00 00 00 00 00 00 00 00 81 01 00 00 00 00 00 00 f0 3f"},
+      {hex(node.data()), "08 0d 08 ab 01"},
+      {hex(negative.data()), "08 ff ff ff ff ff ff ff ff ff 01 38 fe ff ff ff ff ff ff ff ff 01"},
+      {hex(leaf.data()), "40 00"},
+      {hex(query.data()), "0a 00 22 01 61 3a 00"},
+      {hex(surrogate.data()), "1a 03 ef bf bd"},
+      {hex(persons.data()), "0a 02 08 6b 12 00"},
+  };
+  for (size_t i = 0; i < cases.size(); ++i) EXPECT_EQ(cases[i].first, cases[i].second) << i;
+}
+
+TEST(Records, SubRecordsOf127And128BytesGetTheRightLengthPrefix) {
+  for (const size_t length : {125, 126, 127, 128, 16383, 16384, 2097152}) {
+    TLIndexableItem item;
+    item.addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, TLString(length, u'x'));
+    TLIndexableItem back;
+    ASSERT_TRUE(back.initWithData(item.data())) << length;
+    EXPECT_TRUE(back.isEqual(item)) << length;
+  }
+}
+
+TEST(Records, PresenceAndDefaults) {
+  TLAttribute attribute;
+  attribute.setIntValue(7);
+  attribute.setHasIntValue(false);
+  EXPECT_EQ(attribute.intValue(), 7);
+  EXPECT_EQ(attribute.data(), "");
+  attribute.setHasIntValue(true);
+  EXPECT_EQ(hex(attribute.data()), "20 07");
+  attribute.setKey(TLAttributeKey::SUBJECT);
+  attribute.setHasKey(false);
+  EXPECT_EQ(attribute.key(), TLAttributeKey::UNKNOWN);
+  EXPECT_FALSE(attribute.hasKey());
+
+  TLQueryNode fresh;
+  EXPECT_EQ(fresh.op(), TLQueryNodeOp::STRING_EQUAL);
+  EXPECT_EQ(fresh.mergeOp(), TLQueryNodeMergeOp::LEAF);
+  fresh.setOp(TLQueryNodeOp::INT_LESS);
+  fresh.setHasOp(false);
+  EXPECT_EQ(fresh.op(), TLQueryNodeOp::STRING_EQUAL);
+  TLQueryNode leaf;
+  leaf.setMergeOp(TLQueryNodeMergeOp::LEAF);
+  EXPECT_FALSE(leaf.isEqual(fresh));
+  EXPECT_FALSE(fresh.isEqual(TLAttribute()));
+}
+
+// Input as it must not come, or as other writers make it: what is read, seen by writing it again.
+template <typename Record>
+void expectRead(const std::string& input, bool result, const std::string& rewritten) {
+  Record record;
+  EXPECT_EQ(record.initWithData(bytes(input)), result) << input;
+  EXPECT_EQ(hex(record.data()), rewritten) << input;
+}
+
+TEST(Records, ReadsWhatOtherWritersMakeOfThem) {
+  expectRead<TLIndexableItem>("", true, "12 00");
+  // Unknown fields of every wire type, field 0, a field number beyond 32 bits.
+  expectRead<TLAttribute>("60 05 08 0d", true, "08 0d");
+  expectRead<TLAttribute>("61 01 02 03 04 05 06 07 08 08 0d", true, "08 0d");
+  expectRead<TLAttribute>("62 02 08 01 65 01 02 03 04 02 00 08 0d", true, "08 0d");
+  expectRead<TLAttribute>("f8 ff ff ff ff ff 01 05 08 0d", true, "08 0d");
+  expectRead<TLCard>("4d 00 00 80 3f 0d 00 00 80 3f", true, "0d 00 00 80 3f");
+  // A group is skipped with what is in it, groups too.
+  expectRead<TLAttribute>("63 08 01 6b 12 01 00 6c 64 08 0d", true, "08 0d");
+  // An end tag ends the record well.
+  expectRead<TLAttribute>("08 0d 0c 20 07", true, "08 0d");
+  // The wire type of a known field is not looked at: field 5 takes four bytes, field 1 a varint.
+  expectRead<TLAttribute>("28 00 00 80 3f 0a 0d", true, "08 0d 2d 00 00 80 3f");
+  // The key keeps the low 32 bits, a truth value is whatever is not 0.
+  expectRead<TLAttribute>("08 8d 80 80 80 80 01 38 80 02", true, "08 0d 38 01");
+  // A later value wins; a later person replaces the earlier one whole.
+  expectRead<TLAttribute>("1a 01 61 1a 00", true, "1a 00");
+  expectRead<TLAttribute>("42 03 0a 01 61 42 03 12 01 62", true, "42 03 12 01 62");
+  // Ten bytes with their top bit set read as 0, and the eleventh byte is the next tag.
+  expectRead<TLAttribute>("20 ff ff ff ff ff ff ff ff ff ff 08 0d", true, "08 0d 20 00");
+  expectRead<TLAttribute>("20 ff ff ff ff ff ff ff ff ff 7f", true,
+                          "20 ff ff ff ff ff ff ff ff ff 01");
+  expectRead<TLAttribute>("20 80 80 80 80 80 80 80 80 80 01", true,
+                          "20 80 80 80 80 80 80 80 80 80 01");
+  // Packed keys, also mixed with single ones.
+  expectRead<TLQueryNode>("0a 03 0d ab 01 08 02 0a 00", true, "08 0d 08 ab 01 08 02");
+  // Invalid UTF-8 reads as U+FFFD.
+  expectRead<TLAttribute>("1a 02 61 ff", true, "1a 04 61 ef bf bd");
+}
+
+TEST(Records, RefusesBadInputAndKeepsWhatWasRead) {
+  expectRead<TLAttribute>("08 0d 20", false, "08 0d 20 00");
+  expectRead<TLAttribute>("08", false, "08 00");
+  expectRead<TLAttribute>("80", false, "");
+  expectRead<TLAttribute>("31 00 00 00 00 00 00 04", false, "31 00 00 00 00 00 00 00 00");
+  expectRead<TLAttribute>("2d 00 00 c0", false, "2d 00 00 00 00");
+  expectRead<TLAttribute>("1a 05 61", false, "");
+  expectRead<TLAttribute>("1a ff ff ff ff ff ff ff ff ff 01 61", false, "");
+  expectRead<TLAttribute>("66 00", false, "");
+  expectRead<TLAttribute>("67 00", false, "");
+  expectRead<TLAttribute>("62 05 00", false, "");
+  expectRead<TLAttribute>("65 00 00", false, "");
+  expectRead<TLAttribute>("63 08 01", false, "");
+  expectRead<TLAttribute>("08 0d 42 09 0a 01", false, "08 0d 42 00");
+  expectRead<TLAttribute>("42 03 0a 05 61 08 0d", false, "42 00");
+  expectRead<TLIndexableItem>("0a 04 08 0d 1a 05", false, "0a 02 08 0d 12 00");
+  expectRead<TLQueryNode>("0a 02 0d ab 01", false, "08 0d 08 00");
+
+  TLAttribute truncated;
+  EXPECT_FALSE(truncated.initWithData(bytes("31 00 00")));
+  EXPECT_TRUE(truncated.hasDoubleValue());
+  EXPECT_EQ(truncated.doubleValue(), 0);
+}
+
+TEST(Records, EveryTruncationFailsOrParses) {
+  const std::string whole = richItem()->data();
+  size_t parsed = 0;
+  for (size_t length = 0; length <= whole.size(); ++length) {
+    TLIndexableItem item;
+    if (!item.initWithData(whole.substr(0, length))) continue;
+    ++parsed;
+    TLIndexableItem again;
+    ASSERT_TRUE(again.initWithData(item.data())) << length;
+    EXPECT_TRUE(again.isEqual(item)) << length;
+  }
+  // Nothing, each of the two attributes, and each of the four fields behind them end a record.
+  EXPECT_EQ(parsed, 7U);
+}
+
+TEST(Records, NestingIsBounded) {
+  TLQueryNode deepest;
+  EXPECT_TRUE(deepest.initWithData(chainBytes(kMaximumRecordDepth)));
+  EXPECT_EQ(deepest.data(), chainBytes(kMaximumRecordDepth));
+  EXPECT_TRUE(deepest.copyWithZone()->isEqual(deepest));
+  EXPECT_EQ(deepest.copyWithZone()->hash(), deepest.hash());
+  EXPECT_FALSE(deepest.dictionaryRepresentation().empty());
+  for (const int levels : {kMaximumRecordDepth + 1, 100000}) {
+    TLQueryNode node;
+    EXPECT_FALSE(node.initWithData(chainBytes(levels))) << levels;
+  }
+  const auto built = chain(100000);
+  EXPECT_DEATH((void)built->data(), "kMaximumRecordDepth");
+  EXPECT_DEATH((void)built->hash(), "kMaximumRecordDepth");
+}
+
+TEST(Records, NumberOfElementsIsBounded) {
+  for (const char* element : {"\x5a\x00", "\x52\x00"}) {
+    std::string input;
+    for (uint32_t i = 0; i < kMaximumRecordElements; ++i) input.append(element, 2);
+    EXPECT_TRUE(TLAttribute().initWithData(input));
+    input.append(element, 2);
+    EXPECT_FALSE(TLAttribute().initWithData(input));
+  }
+}
+
+TEST(Records, EqualityAndHashSeeEveryField) {
+  const std::vector<std::function<void(TLAttribute&)>> changes{
+      [](TLAttribute& a) { a.setKey(TLAttributeKey::SUBJECT); },
+      [](TLAttribute& a) { a.setHasKey(false); },
+      [](TLAttribute& a) { a.setCustomKey(std::nullopt); },
+      [](TLAttribute& a) { a.setStringValue(u""); },
+      [](TLAttribute& a) { a.setIntValue(1); },
+      [](TLAttribute& a) { a.setFloatValue(1); },
+      [](TLAttribute& a) { a.setDoubleValue(1); },
+      [](TLAttribute& a) { a.setBoolValue(false); },
+      [](TLAttribute& a) { a.personValue()->setName(u"Bob"); },
+      [](TLAttribute& a) { a.setPersonValue(nullptr); },
+      [](TLAttribute& a) { a.setBytesValue("\1"); },
+      [](TLAttribute& a) {
+        a.setStringValues({u"b", u""});
+      },
+      [](TLAttribute& a) { a.clearPersonValues(); },
+  };
+  const auto original = richAttribute();
+  EXPECT_TRUE(richAttribute()->isEqual(*original));
+  EXPECT_EQ(richAttribute()->hash(), original->hash());
+  for (size_t i = 0; i < changes.size(); ++i) {
+    const auto changed = richAttribute();
+    changes[i](*changed);
+    EXPECT_FALSE(changed->isEqual(*original)) << i;
+    EXPECT_NE(changed->hash(), original->hash()) << i;
+  }
+}
+
+TEST(Records, HashOfNumbers) {
+  const auto hashOf = [](double value) {
+    TLCard card;
+    card.setFreshness(value);
+    return card.hash();
+  };
+  constexpr uint64_t factor = 2654435761;
+  EXPECT_EQ(hashOf(0), 0U);
+  EXPECT_EQ(hashOf(3), 3 * factor);
+  EXPECT_EQ(hashOf(-3), 3 * factor);
+  EXPECT_EQ(hashOf(2.25), 2 * factor + (uint64_t{1} << 62));
+  EXPECT_EQ(hashOf(2.75), 3 * factor - (uint64_t{1} << 62));
+  EXPECT_EQ(hashOf(0x1p64), 0U);
+  EXPECT_EQ(hashOf(0x1p64 + 0x1p12), 4096 * factor);
+  for (const double odd : {std::numeric_limits<double>::infinity(), std::nan(""), 1e308}) {
+    (void)hashOf(odd);
+  }
+  TLAttribute attribute;
+  attribute.setIntValue(-1);
+  EXPECT_EQ(attribute.hash(), uint64_t{0} - factor);
+}
+
+TEST(Records, CopyingSharesOrCopies) {
+  const auto item = richItem();
+  TLIndexableItem shared;
+  shared.addAttributeWithKeyBoolValue(TLAttributeKey::READ, true);
+  item->copyTo(shared);
+  EXPECT_TRUE(shared.isEqual(*item));
+  EXPECT_EQ(shared.card(), item->card());
+  EXPECT_EQ(shared.attributesAtIndex(0), item->attributesAtIndex(0));
+
+  const auto deep = item->copyWithZone();
+  EXPECT_TRUE(deep->isEqual(*item));
+  EXPECT_NE(deep->card(), item->card());
+  EXPECT_NE(deep->attributesAtIndex(0), item->attributesAtIndex(0));
+  EXPECT_NE(deep->attributesAtIndex(0)->personValue(), item->attributesAtIndex(0)->personValue());
+
+  // What the source lacks stays in the target of copyTo, and is absent from a new copy.
+  TLIndexableItem nothing;
+  nothing.setIdentifier(std::nullopt);
+  nothing.copyTo(shared);
+  EXPECT_TRUE(shared.isEqual(*item));
+  EXPECT_FALSE(nothing.copyWithZone()->hasIdentifier());
+}
+
+TEST(Records, MergingOverwritesAppendsAndMergesSubRecords) {
+  TLAttribute target;
+  target.setIntValue(1);
+  target.setStringValue(u"old");
+  target.setPersonValue(person(u"Ann", std::nullopt));
+  target.setStringValues({u"a"});
+  TLAttribute source;
+  source.setStringValue(u"new");
+  source.setPersonValue(person(std::nullopt, u"ann@b"));
+  source.setStringValues({u"b"});
+  source.addPersonValues(person(u"Bob", std::nullopt));
+  target.mergeFrom(source);
+  EXPECT_EQ(target.intValue(), 1);
+  EXPECT_EQ(target.stringValue(), u"new");
+  EXPECT_TRUE(target.personValue()->isEqual(*person(u"Ann", u"ann@b")));
+  EXPECT_THAT(target.stringValues(), testing::ElementsAre(u"a", u"b"));
+  EXPECT_EQ(target.personValuesAtIndex(0), source.personValuesAtIndex(0));
+
+  TLQuery query;
+  TLQuery other;
+  other.setRoot(chain(2));
+  other.root()->addKey(5);
+  query.mergeFrom(other);
+  EXPECT_EQ(query.root(), other.root());
+  query.setRoot(other.root()->copyWithZone());
+  query.mergeFrom(other);
+  EXPECT_EQ(query.root()->keysCount(), 2U);
+  EXPECT_EQ(query.root()->childsCount(), 2U);
+  EXPECT_EQ(query.root()->childAtIndex(1), other.root()->childAtIndex(0));
+  other.mergeFrom(other);
+  EXPECT_EQ(other.root()->childsCount(), 1U);
+}
+
+TEST(Records, TypedReadersSeeTheFirstAttributeOnly) {
+  TLIndexableItem item;
+  item.addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, u"first");
+  item.addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, u"second");
+  item.addAttributeWithKeyIntValue(TLAttributeKey::PRIORITY, 3);
+  item.addAttributeWithKeyBoolValue(TLAttributeKey::READ, true);
+  item.addAttributeWithKeyFloatValue(TLAttributeKey::KIND, 0.5F);
+  item.addAttributeWithKeyDoubleValue(TLAttributeKey::MAIL_DATE_RECEIVED, 12.5);
+  item.addAttributeWithKeyBytesValue(TLAttributeKey::HTML_CONTENT_DATA, "<p>");
+  item.addAttributeWithKeyPersonValue(TLAttributeKey::AUTHORS, person(u"Ann", std::nullopt));
+  item.addAttributeWithKeyStringValues(TLAttributeKey::MAILBOXES, {{u"in", u"all"}});
+  item.addPersonsWithKey(TLAttributeKey::RECIPIENTS, {u"a@b", u"c@d"});
+  ASSERT_EQ(item.attributesCount(), 10U);
+  item.addAttributeWithKeyStringValue(TLAttributeKey::URL, std::nullopt);
+  item.addAttributeWithKeyBytesValue(TLAttributeKey::URL, std::nullopt);
+  item.addAttributeWithKeyPersonValue(TLAttributeKey::URL, nullptr);
+  item.addAttributeWithKeyStringValues(TLAttributeKey::URL, std::nullopt);
+  item.addAttributeWithKeyPersonValues(TLAttributeKey::URL, std::nullopt);
+  EXPECT_EQ(item.attributesCount(), 10U) << "a null value appends nothing";
+
+  EXPECT_EQ(item.stringValueForKey(TLAttributeKey::SUBJECT), u"first");
+  EXPECT_EQ(item.attributesForKey(TLAttributeKey::SUBJECT).size(), 2U);
+  EXPECT_EQ(item.intValueForKey(TLAttributeKey::PRIORITY), 3);
+  EXPECT_TRUE(item.boolValueForKey(TLAttributeKey::READ));
+  EXPECT_EQ(item.floatValueForKey(TLAttributeKey::KIND), 0.5F);
+  EXPECT_EQ(item.doubleValueForKey(TLAttributeKey::MAIL_DATE_RECEIVED), 12.5);
+  EXPECT_EQ(item.bytesValueForKey(TLAttributeKey::HTML_CONTENT_DATA), "<p>");
+  EXPECT_EQ(item.personValueForKey(TLAttributeKey::AUTHORS)->name(), u"Ann");
+  EXPECT_EQ(item.stringValuesForKey(TLAttributeKey::MAILBOXES)->size(), 2U);
+  EXPECT_EQ(item.personValuesForKey(TLAttributeKey::RECIPIENTS)->at(1)->emailAddress(), u"c@d");
+
+  EXPECT_EQ(item.attributeForKey(TLAttributeKey::URL), nullptr);
+  EXPECT_EQ(item.stringValueForKey(TLAttributeKey::URL), std::nullopt);
+  EXPECT_EQ(item.intValueForKey(TLAttributeKey::URL), 0);
+  EXPECT_FALSE(item.boolValueForKey(TLAttributeKey::URL));
+  EXPECT_EQ(item.personValuesForKey(TLAttributeKey::URL), nullptr);
+  EXPECT_EQ(item.stringValuesForKey(TLAttributeKey::SUBJECT), nullptr);
+  EXPECT_TRUE(item.attributesForKey(TLAttributeKey::URL).empty());
+}
+
+TEST(Records, KeysOfANode) {
+  TLQueryNode node;
+  const int32_t keys[] = {13, 171, 2};
+  node.setKeys(keys, 3);
+  EXPECT_EQ(node.keyAtIndex(2), 2);
+  EXPECT_EQ(std::vector<int32_t>(node.keys(), node.keys() + node.keysCount()),
+            std::vector<int32_t>({13, 171, 2}));
+  try {
+    (void)node.keyAtIndex(3);
+    FAIL();
+  } catch (const std::out_of_range& error) {
+    EXPECT_STREQ(error.what(), "idx (3) is out of range (3)");
+  }
+  EXPECT_THROW((void)node.childAtIndex(0), std::out_of_range);
+  node.setKeys(node.keys() + 1, 1);
+  EXPECT_EQ(node.keysCount(), 1U);
+  EXPECT_EQ(node.keyAtIndex(0), 171);
+  node.clearKeys();
+  EXPECT_EQ(node.data(), "");
+}
+
+TEST(Records, Dictionaries) {
+  EXPECT_EQ(TLIndexableItem().dictionaryRepresentation().dump(), R"({"identifier":""})");
+  const auto rich = richAttribute()->dictionaryRepresentation();
+  EXPECT_EQ(rich["key"], "TEXT_CONTENT");
+  EXPECT_EQ(rich["stringValues"].dump(), R"(["","b"])");
+  EXPECT_EQ(rich["personValues"].dump(), R"([{"emailAddress":"x@y"},{}])");
+  EXPECT_EQ(rich["bytesValue"].get_binary().size(), 2U);
+  EXPECT_EQ(rich["boolValue"], true);
+  EXPECT_EQ(rich.size(), 11U);
+  TLQueryNode node;
+  node.addKey(2);
+  node.setMergeOp(TLQueryNodeMergeOp::AND);
+  node.addChild(std::make_shared<TLQueryNode>());
+  EXPECT_EQ(node.dictionaryRepresentation().dump(),
+            R"json({"child":[{}],"key":["(unknown: 2)"],"mergeOp":"AND"})json");
+  EXPECT_THAT(node.description(), testing::StartsWith("<TLQueryNode: 0x"));
+  EXPECT_THAT(node.description(), testing::HasSubstr(R"json("mergeOp":"AND")json"));
+  EXPECT_EQ(TLIndexableItem::attributesType(), typeid(TLAttribute));
+  EXPECT_EQ(TLQueryNode::childType(), typeid(TLQueryNode));
+}
