@@ -213,9 +213,14 @@ void complain(const std::string& message) {
 }
 
 ExitStatus complain(const std::optional<TLError>& error) {
-  complain(error ? fmt::format("{} ({} {})", error->message, error->domain, error->code)
-                 : std::string("the daemon gave no answer"));
-  return client::isUnreachable(error) ? ExitStatus::unreachable : ExitStatus::failure;
+  if (!error) {
+    complain(std::string("the daemon gave no answer"));
+    return ExitStatus::failure;
+  }
+  const bool unreachable = client::isUnreachable(error);
+  complain(unreachable ? error->message
+                       : fmt::format("{} ({} {})", error->message, error->domain, error->code));
+  return unreachable ? ExitStatus::unreachable : ExitStatus::failure;
 }
 
 ExitStatus runCommand(const Options& options) {
