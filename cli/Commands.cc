@@ -46,7 +46,7 @@ ExitStatus runSearch(const Options& options) {
   query.setRawQuery(platform::fromUTF8(words));
   query.setOriginalQuery(platform::fromUTF8(words));
   std::optional<TLError> error;
-  client::SearchServiceProxy service(options.runtimeDirectory);
+  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
   const int64_t limit = options.limit == 0 ? service.kNoMaximum : options.limit;
   const auto items = service.searchItems(query, 0, options.protectionClass, limit, &error);
   if (!items) return complain(error);
@@ -69,7 +69,7 @@ ExitStatus runSearch(const Options& options) {
 
 // One call an identifier, so that one that fails does not stop the others.
 ExitStatus runDelete(const Options& options) {
-  client::SearchServiceProxy service(options.runtimeDirectory);
+  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
   nlohmann::json list = nlohmann::json::array();
   std::string text;
   ExitStatus status = ExitStatus::done;
@@ -107,7 +107,7 @@ bool confirmed(const Options& options) {
 ExitStatus runReset(const Options& options) {
   if (!confirmed(options)) return ExitStatus::failure;
   std::optional<TLError> error;
-  client::SearchServiceProxy service(options.runtimeDirectory);
+  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
   if (!service.deleteAllItems(options.name, options.protectionClass, &error)) {
     return complain(error);
   }
@@ -117,7 +117,7 @@ ExitStatus runReset(const Options& options) {
 
 ExitStatus runStats(const Options& options) {
   std::optional<TLError> error;
-  client::DebugServiceProxy service(options.runtimeDirectory);
+  client::DebugServiceProxy service(options.runtimeDirectory, options.patience());
   const auto statistics =
       service.fetchStatsForIndexer(options.name, options.protectionClass, &error);
   if (!statistics) return complain(error);
@@ -142,14 +142,14 @@ ExitStatus printText(const Options& options, const char* key,
 
 ExitStatus runMetrics(const Options& options) {
   std::optional<TLError> error;
-  client::DebugServiceProxy service(options.runtimeDirectory);
+  client::DebugServiceProxy service(options.runtimeDirectory, options.patience());
   const auto text = service.fetchStatsForSalt(options.name, options.protectionClass, &error);
   return printText(options, "metrics", text, error);
 }
 
 ExitStatus runPing(const Options& options) {
   std::optional<TLError> error;
-  client::DebugServiceProxy service(options.runtimeDirectory);
+  client::DebugServiceProxy service(options.runtimeDirectory, options.patience());
   const auto text =
       service.ping(options.arguments.empty() ? "tallow" : options.arguments[0], &error);
   return printText(options, "ping", text, error);
@@ -157,7 +157,7 @@ ExitStatus runPing(const Options& options) {
 
 ExitStatus runVacuum(const Options& options) {
   std::optional<TLError> error;
-  client::DebugServiceProxy service(options.runtimeDirectory);
+  client::DebugServiceProxy service(options.runtimeDirectory, options.patience());
   if (!service.forceVacuumAndCompact(options.protectionClass, &error)) return complain(error);
   return print(options.format == OutputFormat::json ? jsonText({{"vacuum", true}})
                                                     : "The index has been compacted.\n");
@@ -165,7 +165,7 @@ ExitStatus runVacuum(const Options& options) {
 
 ExitStatus runState(const Options& options) {
   std::optional<TLError> error;
-  client::SearchServiceProxy service(options.runtimeDirectory);
+  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
   const auto state = service.fetchLastClientState(options.name, options.protectionClass, &error);
   if (error) return complain(error);
   std::string hex;
@@ -190,20 +190,19 @@ ExitStatus runState(const Options& options) {
 struct CommandFunction {
   Command command;
   Run run;
-  const char* service;
 };
 
 constexpr std::array<CommandFunction, 10> kFunctions{{
-    {Command::index, runIndex, client::kSearchServiceName},
-    {Command::search, runSearch, client::kSearchServiceName},
-    {Command::explain, runSearch, client::kSearchServiceName},
-    {Command::remove, runDelete, client::kSearchServiceName},
-    {Command::reset, runReset, client::kSearchServiceName},
-    {Command::stats, runStats, client::kDebugServiceName},
-    {Command::metrics, runMetrics, client::kDebugServiceName},
-    {Command::ping, runPing, client::kDebugServiceName},
-    {Command::vacuum, runVacuum, client::kDebugServiceName},
-    {Command::state, runState, client::kSearchServiceName},
+    {Command::index, runIndex},
+    {Command::search, runSearch},
+    {Command::explain, runSearch},
+    {Command::remove, runDelete},
+    {Command::reset, runReset},
+    {Command::stats, runStats},
+    {Command::metrics, runMetrics},
+    {Command::ping, runPing},
+    {Command::vacuum, runVacuum},
+    {Command::state, runState},
 }};
 
 }  // namespace
@@ -213,21 +212,19 @@ void complain(const std::string& message) {
 }
 
 ExitStatus complain(const std::optional<TLError>& error) {
-  complain(error ? fmt::format("{} ({} {})", error->message, error->domain, error->code)
-                 : std::string("the daemon gave no answer"));
-  return client::isUnreachable(error) ? ExitStatus::unreachable : ExitStatus::failure;
+  if (!error) {
+    complain(std::string("the daemon gave no answer"));
+    return ExitStatus::failure;
+  }
+  const bool unreachable = client::isUnreachable(error);
+  complain(unreachable ? error->message
+                       : fmt::format("{} ({} {})", error->message, error->domain, error->code));
+  return unreachable ? ExitStatus::unreachable : ExitStatus::failure;
 }
 
 ExitStatus runCommand(const Options& options) {
   for (const CommandFunction& function : kFunctions) {
-    if (function.command != options.command) continue;
-    if (options.waitSeconds > 0) {
-      // Where this is in vain, the call says why.
-      const std::chrono::milliseconds limit(static_cast<int64_t>(options.waitSeconds * 1000));
-      [[maybe_unused]] const bool reached =
-          client::waitForService(options.runtimeDirectory, function.service, limit);
-    }
-    return function.run(options);
+    if (function.command == options.command) return function.run(options);
   }
   return ExitStatus::failure;
 }

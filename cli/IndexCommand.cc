@@ -33,7 +33,7 @@ class Indexing {
  public:
   explicit Indexing(const Options& options)
       : _options(options),
-        _service(options.runtimeDirectory),
+        _service(options.runtimeDirectory, options.patience()),
         _progress(ProgressBar::shown() ? totalBytes(options.arguments) : 0) {}
 
   ExitStatus run() {

@@ -7,6 +7,7 @@
 #include <optional>
 #include <vector>
 
+#include "cli/FlowedText.h"
 #include "cli/Identifier.h"
 #include "cli/TextBudget.h"
 
@@ -29,6 +30,10 @@ using CString = std::unique_ptr<char, Free>;
 
 std::string_view orEmpty(const char* text) {
   return text == nullptr ? std::string_view() : text;
+}
+
+bool equalIgnoringCase(std::string_view a, std::string_view b) {
+  return a.size() == b.size() && g_ascii_strncasecmp(a.data(), b.data(), a.size()) == 0;
 }
 
 bool isBlank(TLStringView text) {
@@ -71,12 +76,14 @@ struct Leaves {
   std::vector<GMimeObject*> attachments;
 };
 
+bool isAttached(GMimeObject* object) {
+  return equalIgnoringCase(orEmpty(g_mime_object_get_disposition(object)), "attachment");
+}
+
 void addLeaf(GMimePart* part, Leaves& leaves) {
   GMimeObject* const object = GMIME_OBJECT(part);
   GMimeContentType* const type = g_mime_object_get_content_type(object);
-  const char* const disposition = g_mime_object_get_disposition(object);
-  const bool attached =
-      disposition != nullptr && g_ascii_strcasecmp(disposition, "attachment") == 0;
+  const bool attached = isAttached(object);
   const bool text = type == nullptr || g_mime_content_type_is_type(type, "text", "*");
   if (!attached && text) {
     if (type == nullptr || g_mime_content_type_is_type(type, "text", "plain")) {
@@ -107,8 +114,7 @@ Leaves leavesOf(GMimeMessage* message) {
       }
     } else if (GMIME_IS_MESSAGE_PART(object)) {
       GMimeMessage* const inner = g_mime_message_part_get_message(GMIME_MESSAGE_PART(object));
-      const std::string_view disposition = orEmpty(g_mime_object_get_disposition(object));
-      if (disposition == "attachment") {
+      if (isAttached(object)) {
         leaves.attachments.push_back(object);
       } else if (inner != nullptr) {
         pending.push_back(g_mime_message_get_mime_part(inner));
@@ -128,8 +134,12 @@ TLString textOf(GMimePart* part, TextDecoder& decoder) {
   const GByteArray* bytes = g_mime_stream_mem_get_byte_array(GMIME_STREAM_MEM(stream.get()));
   const std::string_view view(reinterpret_cast<const char*>(bytes->data),
                               std::min<size_t>(bytes->len, kMaximumBodyBytes));
-  const char* charset = g_mime_object_get_content_type_parameter(GMIME_OBJECT(part), "charset");
-  return decoder.decode(view, orEmpty(charset));
+  const auto parameter = [&](const char* name) {
+    return orEmpty(g_mime_object_get_content_type_parameter(GMIME_OBJECT(part), name));
+  };
+  TLString text = decoder.decode(view, parameter("charset"));
+  if (!equalIgnoringCase(parameter("format"), "flowed")) return text;
+  return unflow(text, equalIgnoringCase(parameter("delsp"), "yes"));
 }
 
 // The parts one after the other. Stops once there is more than the index takes.

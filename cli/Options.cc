@@ -2,8 +2,8 @@
 
 #include <CLI/CLI.hpp>
 #include <array>
-#include <cmath>
 #include <iostream>
+#include <limits>
 #include <map>
 
 #include "client/Channel.h"
@@ -56,7 +56,7 @@ void addGlobalOptions(CLI::App& app, Options& options) {
       ->transform(CLI::CheckedTransformer(kFormats).description(""))
       ->type_name("FORMAT");
   app.add_option("--limit", options.limit, "Most results of a search, 0 for all (default: 20)")
-      ->check(CLI::NonNegativeNumber.description(""))
+      ->check(CLI::Range(int64_t{0}, std::numeric_limits<int64_t>::max()).description(""))
       ->type_name("N");
   app.add_option("--color", options.color, "Colours: auto, always or never")
       ->transform(CLI::CheckedTransformer(kColors).description(""))

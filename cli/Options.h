@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -29,10 +30,14 @@ struct Options {
   std::string name = "tallow";
   OutputFormat format = OutputFormat::text;
   ColorMode color = ColorMode::automatic;
-  int64_t limit = 20;  // 0 for all
-  double waitSeconds = 0;
+  int64_t limit = 20;      // 0 for all
+  double waitSeconds = 0;  // for the daemon to come up
   bool yes = false;
   bool verbose = false;
+
+  [[nodiscard]] std::chrono::milliseconds patience() const {
+    return std::chrono::milliseconds(static_cast<int64_t>(waitSeconds * 1000));
+  }
 };
 
 // Reads the command line. When the program has nothing more to do, after --help, --version or wrong

@@ -21,7 +21,7 @@ namespace {
 // The daemon's error object as a D-Bus error.
 constexpr const char* kErrorName = "com.quill.tallow.Error";
 
-// How long a wait for the socket goes without looking again; the directory may not exist yet, and a
+// How long a wait for the daemon goes without looking again; the directory may not exist yet, and a
 // socket can be there before it listens.
 constexpr std::chrono::milliseconds kWaitStep(50);
 
@@ -49,6 +49,25 @@ int connectSocket(const std::string& path) {
   const int result = -errno;
   close(descriptor);
   return result;
+}
+
+// As above; looks again whenever the directory changes, until `patience` has run out.
+int connectWithin(Patience patience, const std::string& directory, const std::string& path) {
+  int descriptor = connectSocket(path);
+  if (descriptor >= 0 || patience.count() == 0) return descriptor;
+  const auto end = std::chrono::steady_clock::now() + patience;
+  const int watch = inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
+  inotify_add_watch(watch, directory.c_str(), IN_CREATE | IN_MOVED_TO);
+  while (descriptor < 0 && std::chrono::steady_clock::now() < end) {
+    pollfd changed{watch, POLLIN, 0};
+    char events[4096];
+    if (poll(&changed, 1, static_cast<int>(kWaitStep.count())) > 0) {
+      [[maybe_unused]] const ssize_t ignored = read(watch, events, sizeof events);
+    }
+    descriptor = connectSocket(path);
+  }
+  close(watch);
+  return descriptor;
 }
 
 // What an error reply says. The daemon's own has message, domain and code in its body; the first of
@@ -102,32 +121,12 @@ std::string defaultRuntimeDirectory() {
   return platform::runtimeDirectory();
 }
 
-bool waitForService(const std::string& runtimeDirectory, const std::string& serviceName,
-                    std::chrono::milliseconds limit) {
-  const std::string path = platform::joinPath(runtimeDirectory, serviceName);
-  const auto end = std::chrono::steady_clock::now() + limit;
-  const int watch = inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
-  inotify_add_watch(watch, runtimeDirectory.c_str(), IN_CREATE | IN_MOVED_TO);
-  bool reached = false;
-  while (!reached) {
-    const int descriptor = connectSocket(path);
-    reached = descriptor >= 0;
-    if (reached) close(descriptor);
-    if (reached || std::chrono::steady_clock::now() >= end) break;
-    pollfd changed{watch, POLLIN, 0};
-    char events[4096];
-    if (poll(&changed, 1, static_cast<int>(kWaitStep.count())) > 0) {
-      [[maybe_unused]] const ssize_t ignored = read(watch, events, sizeof events);
-    }
-  }
-  close(watch);
-  return reached;
-}
-
-Channel::Channel(std::string runtimeDirectory, std::string serviceName)
-    : _socketPath(platform::joinPath(runtimeDirectory, serviceName)),
+Channel::Channel(const std::string& runtimeDirectory, std::string serviceName, Patience patience)
+    : _runtimeDirectory(runtimeDirectory),
+      _socketPath(platform::joinPath(runtimeDirectory, serviceName)),
       _serviceName(std::move(serviceName)),
-      _objectPath(objectPathOf(_serviceName)) {}
+      _objectPath(objectPathOf(_serviceName)),
+      _patience(patience) {}
 
 Channel::~Channel() {
   disconnect();
@@ -140,7 +139,7 @@ TLError Channel::unreachable(int errnoValue) const {
 
 bool Channel::connect(TLErrorOut error) {
   if (_bus != nullptr) return true;
-  const int descriptor = connectSocket(_socketPath);
+  const int descriptor = connectWithin(_patience, _runtimeDirectory, _socketPath);
   int result = descriptor;
   if (result >= 0) {
     result = sd_bus_new(&_bus);

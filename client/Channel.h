@@ -30,21 +30,21 @@ inline constexpr const char* kClientDomain = "com.quill.tallow.client";
 inline constexpr std::chrono::seconds kShortTimeout = std::chrono::minutes(2);
 inline constexpr std::chrono::seconds kLongTimeout = std::chrono::hours(6);
 
+// How long to wait for a daemon that is not there.
+using Patience = std::chrono::milliseconds;
+
 // $RUNTIME_DIRECTORY, else tallow in $XDG_RUNTIME_DIR, else /run/tallow.
 [[nodiscard]] std::string defaultRuntimeDirectory();
 
-// Returns true as soon as the socket of the service takes connections, and false when it does not
-// within `limit`.
-[[nodiscard]] bool waitForService(const std::string& runtimeDirectory,
-                                  const std::string& serviceName, std::chrono::milliseconds limit);
-
 // The connection to one service of the daemon, over the socket of that name in the runtime
-// directory. It is made by the first call, and made anew by the first call after it was lost.
+// directory. It is made by the first call, and made anew by the first call after it was lost; a
+// call waits for the socket to take connections for as long as `patience`, so that a client may
+// start before the daemon.
 //
 // One thread uses a channel at a time; channels are independent of each other.
 class Channel {
  public:
-  Channel(std::string runtimeDirectory, std::string serviceName);
+  Channel(const std::string& runtimeDirectory, std::string serviceName, Patience patience);
   ~Channel();
   Channel(const Channel&) = delete;
   Channel& operator=(const Channel&) = delete;
@@ -62,9 +62,11 @@ class Channel {
   void disconnect();
   [[nodiscard]] TLError unreachable(int errnoValue) const;
 
+  const std::string _runtimeDirectory;
   const std::string _socketPath;
   const std::string _serviceName;
   const std::string _objectPath;
+  const Patience _patience;
   sd_bus* _bus = nullptr;
 };
 

@@ -20,8 +20,8 @@ using Statistics = std::vector<std::pair<std::string, Statistic>>;
 // The diagnostic service of the daemon; threads and errors as in SearchServiceProxy.
 class DebugServiceProxy {
  public:
-  explicit DebugServiceProxy(const std::string& runtimeDirectory)
-      : _channel(runtimeDirectory, kDebugServiceName) {}
+  explicit DebugServiceProxy(const std::string& runtimeDirectory, Patience patience = Patience(0))
+      : _channel(runtimeDirectory, kDebugServiceName, patience) {}
 
   // A text about the daemon that holds `input`.
   [[nodiscard]] std::optional<std::string> ping(const std::string& input, TLErrorOut error);

@@ -24,8 +24,8 @@ inline constexpr const char* kSearchServiceName = "com.quill.tallowsearch.Search
 // it; what earlier calls did stays done.
 class SearchServiceProxy {
  public:
-  explicit SearchServiceProxy(const std::string& runtimeDirectory)
-      : _channel(runtimeDirectory, kSearchServiceName) {}
+  explicit SearchServiceProxy(const std::string& runtimeDirectory, Patience patience = Patience(0))
+      : _channel(runtimeDirectory, kSearchServiceName, patience) {}
 
   // `name` names the client in the daemon's log and its state; `protectionClass` chooses the index.
   bool indexItems(std::span<const EncodedItem> items, const std::string& name,

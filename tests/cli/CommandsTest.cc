@@ -1,0 +1,221 @@
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <nlohmann/json.hpp>
+
+#include "cli/Commands.h"
+#include "platform/Files.h"
+#include "records/TLIndexableItem.h"
+#include "records/TLQuery.h"
+#include "tests/client/FakeDaemon.h"
+
+using cli::ExitStatus;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::internal::CaptureStderr;
+using testing::internal::CaptureStdout;
+using testing::internal::GetCapturedStderr;
+using testing::internal::GetCapturedStdout;
+
+namespace {
+
+class CommandsTest : public testing::Test {
+ protected:
+  // Runs the program with the arguments, and keeps its output.
+  ExitStatus run(std::vector<std::string> arguments) {
+    arguments.insert(arguments.begin(), {"tallow", "--runtime-dir", daemon.runtimeDirectory()});
+    std::vector<const char*> argv;
+    for (const std::string& argument : arguments) argv.push_back(argument.c_str());
+    CaptureStdout();
+    CaptureStderr();
+    ExitStatus status = ExitStatus::failure;
+    const auto options = cli::parseCommandLine(static_cast<int>(argv.size()), argv.data(), status);
+    if (options) status = cli::runCommand(*options);
+    output = GetCapturedStdout();
+    errors = GetCapturedStderr();
+    return status;
+  }
+
+  void answerWith(std::vector<std::shared_ptr<TLIndexableItem>> items) {
+    platform::RPCBytesArray bytes;
+    for (const auto& item : items) bytes.push_back(item->data());
+    daemon.answer("SearchItemsForQuery",
+                  [bytes](platform::RPCReply& reply) { reply.send({bytes}); });
+  }
+
+  static std::shared_ptr<TLIndexableItem> result(const char* identifier) {
+    auto item = std::make_shared<TLIndexableItem>();
+    item->setIdentifier(platform::fromUTF8(identifier));
+    item->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, u"Invoice \x1b[31m\u202E");
+    item->addAttributeWithKeyStringValue(TLAttributeKey::CONTENT_SNIPPET, u"your invoice\u2008due");
+    item->addAttributeWithKeyDoubleValue(TLAttributeKey::MAIL_DATE_RECEIVED, 1704700800);
+    item->addPersonsWithKey(TLAttributeKey::AUTHORS, {u"billing@example.org"});
+    auto card = std::make_shared<TLCard>();
+    card->setTextScore(1.5F);
+    card->setLightScore(0.75F);
+    card->setFreshness(0.5);
+    item->setCard(card);
+    return item;
+  }
+
+  testsupport::FakeDaemon daemon;
+  std::string output;
+  std::string errors;
+};
+
+}  // namespace
+
+TEST_F(CommandsTest, TheQueryIsWhatWasTyped) {
+  setenv("TZ", "UTC", 1);
+  const auto sent = [](TLStringView words) {
+    TLQuery query;
+    query.setRawQuery(TLString(words));
+    query.setOriginalQuery(TLString(words));
+    return query.data();
+  };
+  EXPECT_EQ(run({"search", "invoice", "li"}), ExitStatus::nothingFound);
+  EXPECT_EQ(run({"search", "--limit", "0", "--class=work", "invoice "}), ExitStatus::nothingFound);
+  EXPECT_EQ(run({"search", "--limit=3", "--", "-x", "--limit"}), ExitStatus::nothingFound);
+  EXPECT_THAT(
+      daemon.calls(),
+      ElementsAre("SearchItemsForQuery(<" + sent(u"invoice li") + ">, 0, default, 20)",
+                  "SearchItemsForQuery(<" + sent(u"invoice ") + ">, 0, work, 9223372036854775807)",
+                  "SearchItemsForQuery(<" + sent(u"-x --limit") + ">, 0, default, 3)"));
+}
+
+TEST_F(CommandsTest, ResultsInEveryFormat) {
+  setenv("TZ", "UTC", 1);
+  answerWith({result("mbox/m/in%20box?offset=7"), result("file/m/a.eml"), result("other:1")});
+  EXPECT_EQ(run({"search", "invo"}), ExitStatus::done);
+  EXPECT_THAT(output, testing::StartsWith("  1  2024-01-08 08:00  billing@example.org\n"
+                                          "     Invoice \uFFFD[31m\n"
+                                          "     your invoice due\n"
+                                          "     mbox/m/in%20box?offset=7\n"
+                                          "  2  2024-01-08 08:00"));
+  EXPECT_EQ(run({"--color=always", "search", "invo"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("your \x1b[1;33minvoice\x1b[0m due\n"));
+  EXPECT_EQ(run({"--format=files", "search", "invo"}), ExitStatus::done);
+  EXPECT_EQ(output, "/m/in box:7\n/m/a.eml\nother:1\n");
+  EXPECT_EQ(run({"search", "--format", "json", "invo"}), ExitStatus::done);
+  const auto json = nlohmann::json::parse(output);
+  ASSERT_EQ(json.size(), 3u);
+  EXPECT_EQ(json[1]["rank"], 2);
+  EXPECT_EQ(json[1]["subject"], "Invoice \x1b[31m\u202E");
+  EXPECT_EQ(json[1]["date"], 1704700800.0);
+  EXPECT_EQ(json[1]["from"][0]["emailAddress"], "billing@example.org");
+  EXPECT_EQ(output.find('\x1b'), std::string::npos);
+
+  EXPECT_EQ(run({"explain", "invo"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("\"originalQuery\": \"invo\""));
+  EXPECT_THAT(
+      output,
+      HasSubstr("   2      1.5000      0.7500     0.5000  2024-01-08 08:00  file/m/a.eml\n"));
+  EXPECT_EQ(run({"explain", "--format=json", "invo"}), ExitStatus::done);
+  EXPECT_EQ(nlohmann::json::parse(output)["results"][0]["textScore"], 1.5);
+}
+
+TEST_F(CommandsTest, IndexNamesTheItemsThatTheDaemonRefuses) {
+  const testsupport::TemporaryDirectory mail;
+  for (const char* name : {"a", "b", "poison", "c"}) {
+    platform::writeFileAtomically(mail / (std::string(name) + ".eml"),
+                                  fmt::format("Subject: {}\n\ntext\n", name), nullptr);
+  }
+  daemon.refuseItemsWith("poison", {"TALIndexer", 1, "index failed"});
+  EXPECT_EQ(run({"index", mail.path()}), ExitStatus::failure);
+  EXPECT_EQ(output, "3 messages indexed, 1 refused by the daemon\n");
+  EXPECT_THAT(errors, HasSubstr("poison.eml: index failed"));
+  EXPECT_EQ(daemon.indexedItems().size(), 3u);
+  EXPECT_EQ(daemon.calls().size(), 5u);
+}
+
+TEST_F(CommandsTest, IndexStopsAtAnErrorThatConcernsAll) {
+  const testsupport::TemporaryDirectory mail;
+  platform::writeFileAtomically(mail / "a.eml", "Subject: a\n\n", nullptr);
+  daemon.failOnce("IndexItems", {"com.quill.tallow.TALIndexerManager", -2, "Indexer unavailable."});
+  EXPECT_EQ(run({"index", mail.path()}), ExitStatus::failure);
+  EXPECT_THAT(errors, HasSubstr("Indexer unavailable."));
+  EXPECT_EQ(run({"index", mail.path()}), ExitStatus::done);
+  EXPECT_EQ(run({"index", mail.path(), mail / "none"}), ExitStatus::failure);
+  EXPECT_EQ(output, "1 messages indexed, 1 paths not read\n");
+  const testsupport::TemporaryDirectory empty;
+  EXPECT_EQ(run({"index", "--format=json", empty.path()}), ExitStatus::nothingFound);
+  EXPECT_EQ(nlohmann::json::parse(output)["indexed"], 0);
+}
+
+TEST_F(CommandsTest, DeleteGoesOnBehindAFailure) {
+  daemon.failOnce("DeleteItemsWithIdentifiers", {"DocStore", 5, "unknown"});
+  EXPECT_EQ(run({"delete", "file/a", "file/b"}), ExitStatus::failure);
+  EXPECT_EQ(output, "deleted file/b\n");
+  EXPECT_THAT(errors, HasSubstr("tallow: file/a: unknown"));
+  EXPECT_THAT(daemon.calls(), ElementsAre("DeleteItemsWithIdentifiers([file/a], tallow, default)",
+                                          "DeleteItemsWithIdentifiers([file/b], tallow, default)"));
+}
+
+TEST_F(CommandsTest, ResetWithoutATerminalNeedsYes) {
+  EXPECT_EQ(run({"reset"}), ExitStatus::failure);
+  EXPECT_THAT(errors, HasSubstr("--yes"));
+  EXPECT_TRUE(daemon.calls().empty());
+  EXPECT_EQ(run({"reset", "--yes"}), ExitStatus::done);
+  EXPECT_THAT(daemon.calls(), ElementsAre("DeleteAllItems(tallow, default)"));
+}
+
+TEST_F(CommandsTest, Diagnostics) {
+  daemon.answer("FetchStatsForIndexer", [](platform::RPCReply& reply) {
+    reply.send({platform::RPCDictionary{{"Count", int64_t{3}}, {"Seconds", 0.5}}});
+  });
+  EXPECT_EQ(run({"stats"}), ExitStatus::done);
+  EXPECT_THAT(output, testing::MatchesRegex("Count +3\nSeconds +0.5\n"));
+  EXPECT_EQ(run({"stats", "--format=json"}), ExitStatus::done);
+  EXPECT_EQ(nlohmann::json::parse(output), nlohmann::json::parse(R"({"Count":3,"Seconds":0.5})"));
+  EXPECT_EQ(run({"metrics"}), ExitStatus::done);
+  EXPECT_EQ(output, "metrics\n");
+  EXPECT_EQ(run({"ping", "hello"}), ExitStatus::done);
+  EXPECT_EQ(output, "pong\n");
+  EXPECT_EQ(run({"vacuum", "--class", "c"}), ExitStatus::done);
+  EXPECT_EQ(daemon.calls().back(), "ForceVacuumAndCompact(c)");
+}
+
+TEST_F(CommandsTest, State) {
+  EXPECT_EQ(run({"state", "--name", "phone"}), ExitStatus::nothingFound);
+  EXPECT_EQ(daemon.calls().back(), "FetchLastClientState(phone, default)");
+  std::string bytes = "v1";
+  daemon.answer("FetchLastClientState", [&](platform::RPCReply& reply) {
+    reply.send({true, platform::RPCBytes{bytes}});
+  });
+  EXPECT_EQ(run({"state"}), ExitStatus::done);
+  EXPECT_EQ(output, "7631\nv1\n");
+  bytes = std::string("\0\xFF", 2);
+  EXPECT_EQ(run({"state"}), ExitStatus::done);
+  EXPECT_EQ(output, "00ff\n");
+  EXPECT_EQ(run({"state", "--format=json"}), ExitStatus::done);
+  EXPECT_EQ(nlohmann::json::parse(output)["hex"], "00ff");
+}
+
+TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
+  const std::vector<std::vector<std::string>> kWrong{{},
+                                                     {"search"},
+                                                     {"index"},
+                                                     {"frobnicate"},
+                                                     {"ping", "a", "b"},
+                                                     {"--format=xml", "ping"},
+                                                     {"--format=files", "stats"},
+                                                     {"--limit=-1", "search", "x"},
+                                                     {"--color=blue", "ping"},
+                                                     {"--no-such-option", "ping"}};
+  for (const auto& arguments : kWrong) {
+    EXPECT_EQ(run(arguments), ExitStatus::failure) << testing::PrintToString(arguments);
+    EXPECT_FALSE(errors.empty());
+    EXPECT_TRUE(output.empty());
+  }
+  EXPECT_EQ(run({"--help"}), ExitStatus::done);
+  EXPECT_EQ(run({"--version"}), ExitStatus::done);
+  EXPECT_TRUE(daemon.calls().empty());
+  daemon.stop();
+  for (const char* command : {"ping", "stats", "metrics", "vacuum", "state"}) {
+    EXPECT_EQ(run({command}), ExitStatus::unreachable) << command;
+  }
+  EXPECT_EQ(run({"search", "x"}), ExitStatus::unreachable);
+  EXPECT_EQ(run({"delete", "x"}), ExitStatus::unreachable);
+  EXPECT_EQ(run({"index", TALLOW_SAMPLE_MAIL}), ExitStatus::unreachable);
+}

@@ -1,0 +1,66 @@
+#include <fmt/format.h>
+#include <gtest/gtest.h>
+
+#include "cli/IndexPipeline.h"
+#include "platform/Files.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+std::string mboxOf(size_t messages, size_t bodyBytes) {
+  std::string bytes;
+  for (size_t i = 0; i < messages; ++i) {
+    bytes += fmt::format("From m@example.org Mon Jan  8 08:49:00 2024\nSubject: {}\n\n{}\n\n", i,
+                         std::string(bodyBytes, 'x'));
+  }
+  return bytes;
+}
+
+}  // namespace
+
+TEST(IndexPipeline, BatchesAreBoundedAndKeepTheOrder) {
+  const testsupport::TemporaryDirectory directory;
+  const std::string path = directory / "box";
+  for (const auto& [messages, bodyBytes] :
+       {std::pair<size_t, size_t>{1201, 10}, std::pair<size_t, size_t>{100, 150000}}) {
+    ASSERT_TRUE(platform::writeFileAtomically(path, mboxOf(messages, bodyBytes), nullptr));
+    cli::IndexPipeline pipeline({path});
+    size_t seen = 0;
+    uint64_t inputBytes = 0;
+    while (const auto batch = pipeline.next()) {
+      EXPECT_LE(batch->items.size(), cli::kBatchItems);
+      EXPECT_LE(batch->itemBytes, cli::kBatchBytes);
+      inputBytes += batch->inputBytes;
+      for (const auto& encoded : batch->items) {
+        TLIndexableItem item;
+        ASSERT_TRUE(item.initWithData(encoded.bytes));
+        EXPECT_EQ(platform::toUTF8(*item.stringValueForKey(TLAttributeKey::SUBJECT)),
+                  std::to_string(seen++));
+      }
+    }
+    EXPECT_EQ(seen, messages);
+    EXPECT_EQ(inputBytes, mboxOf(messages, bodyBytes).size());
+  }
+}
+
+TEST(IndexPipeline, TellsMessagesFromPathsThatFail) {
+  const testsupport::TemporaryDirectory directory;
+  ASSERT_TRUE(platform::writeFileAtomically(directory / "bad.eml", "\n\nno header", nullptr));
+  ASSERT_TRUE(platform::writeFileAtomically(directory / "notes", "hello", nullptr));
+  ASSERT_TRUE(platform::writeFileAtomically(directory / "good.eml", "A: a\n\nhello", nullptr));
+  cli::IndexPipeline pipeline({directory.path(), directory / "none", directory / "notes"});
+  const auto batch = pipeline.next();
+  ASSERT_TRUE(batch.has_value());
+  EXPECT_FALSE(pipeline.next().has_value());
+  EXPECT_EQ(batch->items.size(), 1u);
+  EXPECT_EQ(batch->messageFailures.size(), 1u);
+  EXPECT_EQ(batch->pathFailures.size(), 2u);
+  EXPECT_EQ(batch->ignored.size(), 1u);
+}
+
+TEST(IndexPipeline, CanBeLeftInTheMiddle) {
+  const testsupport::TemporaryDirectory directory;
+  ASSERT_TRUE(platform::writeFileAtomically(directory / "box", mboxOf(5000, 10), nullptr));
+  cli::IndexPipeline pipeline({directory / "box"});
+  EXPECT_TRUE(pipeline.next().has_value());
+}

@@ -1,0 +1,280 @@
+#include <fmt/format.h>
+#include <gtest/gtest.h>
+
+#include <nlohmann/json.hpp>
+#include <random>
+
+#include "cli/MessageParser.h"
+#include "cli/TextBudget.h"
+
+using Key = TLAttributeKey;
+
+namespace {
+
+const cli::MessageOrigin kOrigin{"file/m/1.eml", "/m/in box", "in box"};
+
+// The item of a message, or null with the reason in `reason`.
+std::shared_ptr<TLIndexableItem> parse(const std::string& bytes, std::string* reason = nullptr,
+                                       bool* cut = nullptr) {
+  static cli::MessageParser parser;
+  auto result = parser.parse(bytes, kOrigin);
+  if (const auto* bad = std::get_if<cli::UnparsableMessage>(&result)) {
+    if (reason != nullptr) *reason = bad->reason;
+    return nullptr;
+  }
+  const auto& message = std::get<cli::ParsedMessage>(result);
+  if (cut != nullptr) *cut = message.cut;
+  // What goes over the wire is what counts.
+  auto item = std::make_shared<TLIndexableItem>();
+  EXPECT_TRUE(item->initWithData(message.item->data()));
+  return item;
+}
+
+// One attribute in few words.
+std::string show(const TLAttribute& attribute) {
+  std::string out = TLAttributeKeyAsString(attribute.key()) + "=";
+  const auto text = [](const std::optional<TLString>& s) {
+    return platform::toUTF8(platform::orEmpty(s));
+  };
+  if (attribute.hasStringValue()) out += text(attribute.stringValue());
+  if (attribute.hasDoubleValue()) out += fmt::format("{}", attribute.doubleValue());
+  if (attribute.hasBytesValue()) out += "<" + *attribute.bytesValue() + ">";
+  for (const auto& s : attribute.stringValues()) out += "[" + text(s) + "]";
+  for (const auto& p : attribute.personValues()) {
+    out += "{" + text(p->name()) + "|" + text(p->emailAddress()) + "}";
+  }
+  return out;
+}
+
+// All attributes but the three that every item has.
+std::vector<std::string> attributesOf(const std::string& message) {
+  std::vector<std::string> lines;
+  const auto item = parse(message);
+  if (item == nullptr) return {"unparsable"};
+  for (const auto& attribute : item->attributes()) {
+    const Key key = attribute->key();
+    if (key == Key::MAILBOXES || key == Key::MAILBOX_IDENTIFIERS || key == Key::CONTENT_TYPE) {
+      continue;
+    }
+    lines.push_back(show(*attribute));
+  }
+  return lines;
+}
+
+}  // namespace
+
+TEST(MessageParser, EveryFieldHasItsPlace) {
+  const auto item = parse(
+      "Received: by b; Tue, 9 Jan 2024 10:00:00 +0000\n"
+      "Received: by a; Mon, 8 Jan 2024 10:00:00 +0000\n"
+      "From: \"Mara L\" <mara@example.org>, ida@example.org\n"
+      "To: Team: Tom <tom@example.com>, elena@example.com;\n"
+      "Cc: =?utf-8?q?Ren=C3=A9?= <rene@example.com>\nBcc: oleg@example.org\n"
+      "X-From: Priya <priya@example.org>\nSender: owner@example.org\n"
+      "Subject: =?iso-8859-1?q?Caf=E9?=\n =?utf-8?b?IPCfmIA=?=\n"
+      "Date: Mon, 8 Jan 2024 09:00:00 +0100\nMessage-ID: <1@example.org>\n\nHello\n");
+  const nlohmann::json expected = nlohmann::json::parse(R"({
+    "identifier": "file/m/1.eml", "domainIdentifier": "/m/in%20box",
+    "attributes": [
+      {"key": "SUBJECT", "stringValue": "Café 😀"},
+      {"key": "X_FROM", "stringValue": "Priya <priya@example.org>"},
+      {"key": "AUTHORS", "personValues": [{"name": "Mara L", "emailAddress": "mara@example.org"},
+                                          {"emailAddress": "ida@example.org"}]},
+      {"key": "RECIPIENTS", "personValues": [{"name": "Tom", "emailAddress": "tom@example.com"},
+                                             {"emailAddress": "elena@example.com"}]},
+      {"key": "ADDITIONAL_RECIPIENTS",
+       "personValues": [{"name": "René", "emailAddress": "rene@example.com"}]},
+      {"key": "HIDDEN_ADDITIONAL_RECIPIENTS", "personValues": [{"emailAddress": "oleg@example.org"}]},
+      {"key": "MAIL_DATE_RECEIVED", "doubleValue": 1704794400.0},
+      {"key": "CONTENT_CREATION_DATE", "doubleValue": 1704700800.0},
+      {"key": "TEXT_CONTENT", "stringValue": "Hello\n"},
+      {"key": "MAIL_MESSAGE_ID", "stringValue": "1@example.org"},
+      {"key": "MAILBOXES", "stringValues": ["in box"]},
+      {"key": "MAILBOX_IDENTIFIERS", "stringValues": ["/m/in box"]},
+      {"key": "CONTENT_TYPE", "stringValue": "message/rfc822"}]})");
+  ASSERT_NE(item, nullptr);
+  EXPECT_EQ(item->dictionaryRepresentation(), expected)
+      << nlohmann::json::diff(expected, item->dictionaryRepresentation()).dump(1);
+}
+
+TEST(MessageParser, Bodies) {
+  using Lines = std::vector<std::string>;
+  const std::string part = "--b\nContent-Type: ";
+  const std::string alternative = "Content-Type: multipart/alternative; boundary=b\nA: a\n\n";
+  const std::string mixed = "Content-Type: multipart/mixed; boundary=b\nA: a\n\n";
+  const struct {
+    std::string message;
+    Lines attributes;
+  } kCases[] = {
+      {"A: a\n\n", {}},
+      {"A: a\n\nplain caf\xC3\xA9\n", {"TEXT_CONTENT=plain café\n"}},
+      {"A: a\nContent-Type: text/html; charset=iso-8859-1\n\n<p>caf\xE9\n",
+       {"HTML_CONTENT_DATA=<<p>café\n>"}},
+      {"A: a\nContent-Transfer-Encoding: base64\n\nSGkhCg==\n", {"TEXT_CONTENT=Hi!\n"}},
+      {"A: a\nContent-Transfer-Encoding: quoted-printable\nContent-Type: text/plain; "
+       "charset=utf-8\n\nna=C3=AFve so=\nft\n",
+       {"TEXT_CONTENT=naïve soft\n"}},
+      {"A: a\nContent-Type: text/plain; format=flowed\n\none \ntwo\n", {"TEXT_CONTENT=one two\n"}},
+      {alternative + part + "text/plain\n\nplain\n" + part + "text/html\n\n<p>html\n--b--\n",
+       {"TEXT_CONTENT=plain"}},
+      // A text part without text is as good as none.
+      {alternative + part + "text/plain\n\n \n" + part + "text/html\n\n<p>html\n--b--\n",
+       {"HTML_CONTENT_DATA=<<p>html>"}},
+      {mixed + part + "text/plain\n\none\n" + part + "text/plain\n\ntwo\n--b--\n",
+       {"TEXT_CONTENT=one\ntwo"}},
+      {mixed + part + "text/plain\n\none\n" + part +
+           "text/plain; name=a.txt\nContent-Disposition: attachment\n\nno\n--b--\n",
+       {"TEXT_CONTENT=one", "ATTACHMENT_NAMES=[a.txt]", "ATTACHMENT_TYPES=[text/plain]"}},
+      // An inline patch is both text and a named part.
+      {mixed + part + "text/x-diff\nContent-Disposition: inline; filename=x.diff\n\n-a\n" + part +
+           "text/plain\nContent-Disposition: inline; filename*=utf-8''%C3%BC.txt\n\nyes\n--b--\n",
+       {"TEXT_CONTENT=yes", "ATTACHMENT_NAMES=[x.diff][ü.txt]",
+        "ATTACHMENT_TYPES=[text/x-diff][text/plain]"}},
+      {mixed + part + "application/pdf\n\nx\n" + part +
+           "image/png; name=\"=?utf-8?q?=C3=A4?=\"\n\ny\n--b--\n",
+       {"ATTACHMENT_NAMES=[ä]", "ATTACHMENT_TYPES=[application/pdf][image/png]"}},
+      // A message inside the message belongs to it, unless it is attached.
+      {mixed + part + "message/rfc822\n\nSubject: in\n\ninner\n--b--\n", {"TEXT_CONTENT=inner"}},
+      {mixed + part +
+           "message/rfc822\nContent-Disposition: attachment\n\nSubject: in\n\ninner\n--b--\n",
+       {"ATTACHMENT_TYPES=[message/rfc822]"}},
+      // Without the boundary that it names, and without its end.
+      {"A: a\nContent-Type: multipart/mixed; boundary=b\n\nlost\n", {}},
+      {mixed + part + "text/plain\n\nopen end\n", {"TEXT_CONTENT=open end\n"}},
+      {"A: a\nContent-Type: nonsense\n\nx\n", {"ATTACHMENT_TYPES=[application/octet-stream]"}},
+  };
+  for (const auto& c : kCases) EXPECT_EQ(attributesOf(c.message), c.attributes) << c.message;
+}
+
+TEST(MessageParser, Dates) {
+  using Lines = std::vector<std::string>;
+  const std::string good = "Date: Mon, 8 Jan 2024 08:00:00 +0000\n";
+  const struct {
+    std::string headers;
+    Lines attributes;
+  } kCases[] = {
+      {good, {"MAIL_DATE_RECEIVED=1704700800", "CONTENT_CREATION_DATE=1704700800"}},
+      {"Date: yesterday\n", {}},
+      {"Date:\n", {}},
+      {"Received: by a; nonsense\n" + good,
+       {"MAIL_DATE_RECEIVED=1704700800", "CONTENT_CREATION_DATE=1704700800"}},
+      {"Received: by a\n" + good,
+       {"MAIL_DATE_RECEIVED=1704700800", "CONTENT_CREATION_DATE=1704700800"}},
+      {"Received: by a; (x;y) 8 Jan 2024 08:00:01 GMT\nDate: no\n",
+       {"MAIL_DATE_RECEIVED=1704700801"}},
+      {"Date: Thu, 1 Jan 1970 00:00:00 GMT\n", {"MAIL_DATE_RECEIVED=0", "CONTENT_CREATION_DATE=0"}},
+  };
+  for (const auto& c : kCases) EXPECT_EQ(attributesOf(c.headers + "\n"), c.attributes) << c.headers;
+}
+
+TEST(MessageParser, SenderStandsInForXFrom) {
+  EXPECT_EQ(attributesOf("Sender: list@example.org\n\n"),
+            std::vector<std::string>{"X_FROM=list@example.org"});
+}
+
+TEST(MessageParser, WhatIsNoMessageIsNamed) {
+  const struct {
+    std::string bytes;
+    const char* reason;
+  } kCases[] = {
+      {"", "the message is empty"},
+      {" \r\n\n", "the message is empty"},
+      {"\n\nbody only\n", "the message has no header"},
+      {std::string(1000, '\0'), "the message has no header"},
+      {"just a line without a colon", "the message has no header"},
+  };
+  for (const auto& c : kCases) {
+    std::string reason;
+    EXPECT_EQ(parse(c.bytes, &reason), nullptr) << c.bytes;
+    EXPECT_EQ(reason, c.reason) << c.bytes;
+  }
+}
+
+TEST(MessageParser, TooLongTextsAreCut) {
+  bool cut = false;
+  const std::string words = [] {
+    std::string text;
+    while (text.size() < 400000) text += "word ";
+    return text;
+  }();
+  auto item = parse("Subject: " + words + "\n\n" + words, nullptr, &cut);
+  EXPECT_TRUE(cut);
+  EXPECT_EQ(item->stringValueForKey(Key::TEXT_CONTENT)->size(), cli::TextBudget::kZoneBytes - 2);
+  EXPECT_LE(item->stringValueForKey(Key::SUBJECT)->size(), cli::TextBudget::kZoneBytes);
+
+  item = parse("Content-Type: text/html\nA: a\n\n" + words + "<b>" + words, nullptr, &cut);
+  EXPECT_TRUE(cut);
+  std::string to = "To: ";
+  for (int i = 0; i < 40000; ++i) to += fmt::format("Name {} <n{}@example.org>,\n ", i, i);
+  item = parse(to + "last@example.org\n\nshort\n", nullptr, &cut);
+  EXPECT_TRUE(cut);
+  size_t names = 0;
+  size_t addresses = 0;
+  for (const auto& person : *item->personValuesForKey(Key::RECIPIENTS)) {
+    names += platform::orEmpty(person->name()).size() + 2;
+    addresses += platform::orEmpty(person->emailAddress()).size() + 2;
+  }
+  EXPECT_LE(names, cli::TextBudget::kZoneBytes);
+  EXPECT_LE(addresses, cli::TextBudget::kZoneBytes);
+  EXPECT_GT(addresses, cli::TextBudget::kZoneBytes - 100);
+
+  parse("Subject: short\n\nshort\n", nullptr, &cut);
+  EXPECT_FALSE(cut);
+}
+
+// Bounds: none of these may crash, hang or exhaust the stack.
+TEST(MessageParser, MonstersAreSurvived) {
+  std::string nested = "A: a\n";
+  for (int i = 0; i < 100000; ++i) {
+    nested += fmt::format("Content-Type: multipart/mixed; boundary=\"b{}\"\n\n--b{}\n", i, i);
+  }
+  EXPECT_NE(parse(nested + "\nend\n"), nullptr);
+
+  std::string messages = "A: a\n";
+  for (int i = 0; i < 100000; ++i) messages += "Content-Type: message/rfc822\n\nA: a\n";
+  EXPECT_NE(parse(messages + "\nend\n"), nullptr);
+
+  std::string siblings = "A: a\nContent-Type: multipart/mixed; boundary=b\n\n";
+  for (int i = 0; i < 50000; ++i) siblings += "--b\n\nx\n";
+  EXPECT_NE(parse(siblings + "--b--\n"), nullptr);
+
+  EXPECT_NE(parse("Subject: " + std::string(8 << 20, 'x') + "\n\n"), nullptr);
+  EXPECT_NE(parse("To: " + std::string(100000, '(') + "\n\n"), nullptr);
+  EXPECT_NE(parse("To: " + std::string(100000, ':') + "\n\n"), nullptr);
+  EXPECT_NE(parse("Content-Type: text/plain" + std::string(100000, ';') + "\nA: a\n\n"), nullptr);
+  std::string headers;
+  for (int i = 0; i < 100000; ++i) headers += "X-Header: value\n";
+  EXPECT_NE(parse(headers + "\n"), nullptr);
+}
+
+TEST(MessageParser, RandomDamageIsSurvived) {
+  const std::string message =
+      "Received: by a; Mon, 8 Jan 2024 10:00:00 +0000\nFrom: M <m@example.org>\n"
+      "To: a: b@example.org;\nSubject: =?iso-2022-jp?b?GyRCNX5FVBsoQg==?=\n"
+      "Content-Type: multipart/mixed; boundary=\"b\"\n\n--b\n"
+      "Content-Type: text/plain; charset=koi8-r; format=flowed\n"
+      "Content-Transfer-Encoding: quoted-printable\n\n=C1=C2 \n--b\n"
+      "Content-Type: text/html\nContent-Transfer-Encoding: base64\n\nPGI+\n--b\n"
+      "Content-Type: message/rfc822\n\nSubject: x\n\ny\n--b--\n";
+  std::mt19937 random(3);
+  for (int round = 0; round < 5000; ++round) {
+    std::string damaged = message;
+    for (size_t i = 0, n = 1 + random() % 8; i < n; ++i) {
+      const size_t at = random() % damaged.size();
+      switch (random() % 3) {
+        case 0:
+          damaged[at] = static_cast<char>(random());
+          break;
+        case 1:
+          damaged.erase(at, random() % 9);
+          break;
+        default:
+          damaged.insert(at, damaged.substr(random() % damaged.size(), random() % 40));
+      }
+    }
+    std::string reason;
+    if (parse(damaged, &reason) == nullptr) {
+      EXPECT_FALSE(reason.empty());
+    }
+  }
+}

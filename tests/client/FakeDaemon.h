@@ -1,0 +1,66 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/Mutex.h"
+#include "platform/RPC.h"
+#include "platform/RunLoop.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace testsupport {
+
+// Both services of the daemon, in this process, with answers of the test's own. Every call is
+// written down as "Member(argument, ...)": lists as [n bytes, ...] or [text, ...].
+//
+// An answer runs on a thread of the RPC layer; set it before the first call.
+class FakeDaemon {
+ public:
+  using Answer = std::function<void(platform::RPCReply&)>;
+
+  FakeDaemon();
+  ~FakeDaemon();
+  FakeDaemon(const FakeDaemon&) = delete;
+  FakeDaemon& operator=(const FakeDaemon&) = delete;
+
+  // Without one, a member answers with what its signature allows and means nothing.
+  void answer(const std::string& member, Answer answer) { _answers[member] = std::move(answer); }
+  // What the next calls of a member get, one after the other, before `answer` counts.
+  void failOnce(const std::string& member, TLError error);
+  // Answers with an error to every IndexItems that holds an item whose bytes hold `text`.
+  void refuseItemsWith(const std::string& text, TLError error);
+
+  [[nodiscard]] const std::string& runtimeDirectory() const { return _directory.path(); }
+  [[nodiscard]] std::vector<std::string> calls() const;
+  // Items in wire form, of all calls that succeeded.
+  [[nodiscard]] std::vector<std::string> indexedItems() const;
+  void stop();
+
+ private:
+  using Values = platform::RPCValues;
+
+  void addMethod(platform::RPCInterface& interface, const char* member, const char* input,
+                 const char* output, Values values);
+  void serve(const char* member, const std::string& signature, const Values& values,
+             platform::RPCArguments& arguments, platform::RPCReply& reply);
+
+  TemporaryDirectory _directory;
+  platform::RPCInterface _search;
+  platform::RPCInterface _debug;
+  std::map<std::string, Answer> _answers;
+  mutable platform::Mutex _mutex;
+  std::map<std::string, std::vector<TLError>> _failures TL_GUARDED_BY(_mutex);
+  std::vector<std::string> _calls TL_GUARDED_BY(_mutex);
+  std::vector<std::string> _indexed TL_GUARDED_BY(_mutex);
+  std::string _refusedText;
+  TLError _refusal;
+  platform::RunLoop _loop;
+  std::vector<std::unique_ptr<platform::RPCListener>> _listeners;
+  std::thread _thread;
+};
+
+}  // namespace testsupport

@@ -1,0 +1,175 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <limits>
+
+#include "client/DebugServiceProxy.h"
+#include "client/SearchServiceProxy.h"
+#include "tests/client/FakeDaemon.h"
+
+using client::DebugServiceProxy;
+using client::EncodedItem;
+using client::SearchServiceProxy;
+using testing::ElementsAre;
+
+namespace {
+
+class ProxyTest : public testing::Test {
+ protected:
+  testsupport::FakeDaemon daemon;
+  SearchServiceProxy search{daemon.runtimeDirectory()};
+  DebugServiceProxy debug{daemon.runtimeDirectory()};
+  std::optional<TLError> error;
+};
+
+}  // namespace
+
+TEST_F(ProxyTest, CallsCarryTheirArguments) {
+  const std::vector<EncodedItem> items{{"a", "abc"}, {"b", std::string(2000, 'b')}};
+  const std::vector<std::string> texts{"x", "ü"};
+  EXPECT_TRUE(search.indexItems(items, "me", "default", &error));
+  EXPECT_TRUE(search.indexItems({}, "me", "default", &error));  // nothing to send
+  EXPECT_TRUE(search.deleteItemsWithIdentifiers(texts, "me", "", &error));
+  EXPECT_TRUE(search.deleteItemsWithDomainIdentifiers(texts, "", "c", &error));
+  EXPECT_TRUE(search.deleteAllItems("me", "c", &error));
+  EXPECT_TRUE(search.indexItems(items, texts, std::string("s\0t", 3), "me", "c", &error));
+  EXPECT_TRUE(search.indexItems({}, {}, std::nullopt, "me", "c", &error));
+  EXPECT_TRUE(debug.forceVacuumAndCompact("c", &error));
+  EXPECT_THAT(
+      daemon.calls(),
+      ElementsAre("IndexItems([3 bytes, 2000 bytes], me, default)",
+                  "DeleteItemsWithIdentifiers([x, ü], me, )",
+                  "DeleteItemsWithDomainIdentifiers([x, ü], , c)", "DeleteAllItems(me, c)",
+                  "IndexItemsDeleteItemsWithIdentifiers([3 bytes, 2000 bytes], [x, ü], true, <" +
+                      std::string("s\0t", 3) + ">, me, c)",
+                  "IndexItemsDeleteItemsWithIdentifiers([], [], false, <>, me, c)",
+                  "ForceVacuumAndCompact(c)"));
+  EXPECT_FALSE(error.has_value());
+}
+
+TEST_F(ProxyTest, SearchSendsTheQueryAndReadsTheItems) {
+  TLIndexableItem item;
+  item.setIdentifier(u"one");
+  daemon.answer("SearchItemsForQuery", [bytes = item.data()](platform::RPCReply& reply) {
+    reply.send({platform::RPCBytesArray{bytes, ""}});
+  });
+  TLQuery query;
+  query.setOriginalQuery(u"café ");
+  const auto items = search.searchItems(query, 1, "default", search.kNoMaximum, &error);
+  ASSERT_TRUE(items.has_value()) << error->message;
+  ASSERT_EQ(items->size(), 2u);
+  EXPECT_TRUE(items->at(0)->isEqual(item));
+  EXPECT_THAT(daemon.calls(), ElementsAre("SearchItemsForQuery(<" + query.data() +
+                                          ">, 1, default, 9223372036854775807)"));
+}
+
+TEST_F(ProxyTest, StateTellsAbsentFromEmpty) {
+  EXPECT_FALSE(search.fetchLastClientState("me", "c", &error).has_value());
+  EXPECT_FALSE(error.has_value());
+  daemon.answer("FetchLastClientState", [](platform::RPCReply& reply) {
+    reply.send({true, platform::RPCBytes{}});
+  });
+  EXPECT_EQ(search.fetchLastClientState("me", "c", &error), "");
+}
+
+TEST_F(ProxyTest, StatisticsKeepTheirNumbers) {
+  const platform::RPCDictionary sent{{"z", int64_t{-1}},
+                                     {"a", uint64_t{7}},
+                                     {"m", std::numeric_limits<uint64_t>::max()},
+                                     {"d", 0.5}};
+  daemon.answer("FetchStatsForIndexer", [&](platform::RPCReply& reply) { reply.send({sent}); });
+  const auto statistics = debug.fetchStatsForIndexer("me", "c", &error);
+  ASSERT_TRUE(statistics.has_value()) << error->message;
+  const client::Statistics expected{{"z", int64_t{-1}},
+                                    {"a", int64_t{7}},
+                                    {"m", std::numeric_limits<uint64_t>::max()},
+                                    {"d", 0.5}};
+  EXPECT_EQ(*statistics, expected);
+  EXPECT_EQ(debug.ping("hello", &error), "pong");
+  EXPECT_EQ(debug.fetchStatsForSalt("me", "c", &error), "metrics");
+}
+
+TEST_F(ProxyTest, ErrorsOfTheDaemonComeAsTheyAre) {
+  const TLError failure{"TALIndexer", -4, "shutting down"};
+  daemon.failOnce("DeleteAllItems", failure);
+  EXPECT_FALSE(search.deleteAllItems("me", "c", &error));
+  EXPECT_EQ(error, failure);
+  daemon.answer("ForceVacuumAndCompact", [](platform::RPCReply& reply) {
+    reply.sendFailure(platform::kRPCInvalidArgs, "argument 0 is bad");
+  });
+  EXPECT_FALSE(debug.forceVacuumAndCompact("c", &error));
+  EXPECT_EQ(error->domain, client::kProtocolDomain);
+  EXPECT_EQ(error->message, "argument 0 is bad (org.freedesktop.DBus.Error.InvalidArgs)");
+  EXPECT_TRUE(search.deleteAllItems("me", "c", nullptr));  // the connection lives on
+}
+
+TEST_F(ProxyTest, TextThatDBusCannotCarryIsRefusedHere) {
+  const std::vector<std::string> texts{"\xFF"};
+  EXPECT_FALSE(search.deleteItemsWithIdentifiers(texts, "me", "c", &error));
+  EXPECT_EQ(error->domain, client::kClientDomain);
+  EXPECT_TRUE(daemon.calls().empty());
+}
+
+TEST_F(ProxyTest, AListBeyondOneArrayGoesInSeveralCallsAndTheStateWithTheLast) {
+  constexpr size_t kHalf = size_t{33} << 20;
+  std::vector<EncodedItem> items;
+  for (const char* name : {"a", "b"}) items.push_back({name, std::string(kHalf, 'i')});
+  const std::vector<std::string> texts{"old"};
+  EXPECT_TRUE(search.indexItems(items, texts, "state", "me", "c", &error))
+      << platform::printable(error);
+  EXPECT_THAT(
+      daemon.calls(),
+      ElementsAre("DeleteItemsWithIdentifiers([old], me, c)", "IndexItems([34603008 bytes], me, c)",
+                  "IndexItemsDeleteItemsWithIdentifiers([34603008 bytes], [], true, "
+                  "<state>, me, c)"));
+}
+
+TEST_F(ProxyTest, AFailureEndsASplitCall) {
+  constexpr size_t kHalf = size_t{33} << 20;
+  std::vector<EncodedItem> items;
+  for (const char* name : {"a", "b"}) items.push_back({name, std::string(kHalf, 'i')});
+  daemon.failOnce("IndexItems", {"TALIndexer", 1, "index failed"});
+  EXPECT_FALSE(search.indexItems(items, {}, "state", "me", "c", &error));
+  EXPECT_EQ(error->message, "index failed");
+  EXPECT_EQ(daemon.calls().size(), 1u);
+}
+
+TEST_F(ProxyTest, AnAbsentDaemonIsToldApart) {
+  SearchServiceProxy nowhere("/nonexistent");
+  EXPECT_FALSE(nowhere.deleteAllItems("me", "c", &error));
+  EXPECT_TRUE(client::isUnreachable(error));
+  SearchServiceProxy tooLong(std::string(200, 'd'));
+  EXPECT_FALSE(tooLong.deleteAllItems("me", "c", &error));
+  EXPECT_TRUE(client::isUnreachable(error));
+
+  EXPECT_TRUE(search.deleteAllItems("me", "c", nullptr));
+  daemon.stop();
+  EXPECT_FALSE(search.deleteAllItems("me", "c", &error));
+  EXPECT_TRUE(client::isUnreachable(error)) << platform::printable(error);
+}
+
+TEST_F(ProxyTest, ADaemonThatVanishesInMidCallIsUnreachable) {
+  std::thread stopper;
+  daemon.answer("Ping", [&](platform::RPCReply&) {
+    // The reply is dropped; the listener joins this thread, so another one stops it.
+    stopper = std::thread([&] { daemon.stop(); });
+  });
+  EXPECT_FALSE(debug.ping("hello", &error).has_value());
+  stopper.join();
+  EXPECT_TRUE(client::isUnreachable(error)) << platform::printable(error);
+}
+
+TEST_F(ProxyTest, PatienceEndsWithTheSocketOrTheTime) {
+  const testsupport::TemporaryDirectory directory;
+  const std::string runtime = directory / "later";
+  DebugServiceProxy hasty(runtime, std::chrono::milliseconds(1));
+  EXPECT_FALSE(hasty.ping("", &error).has_value());
+  EXPECT_TRUE(client::isUnreachable(error));
+  std::thread starter([&] {
+    // A directory that comes only now is seen as well.
+    EXPECT_EQ(rename(daemon.runtimeDirectory().c_str(), runtime.c_str()), 0);
+  });
+  DebugServiceProxy patient(runtime, std::chrono::minutes(1));
+  EXPECT_EQ(patient.ping("", &error), "pong");
+  starter.join();
+}
