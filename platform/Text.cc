@@ -13,18 +13,6 @@ namespace {
 
 constexpr UChar32 kReplacement = 0xFFFD;
 
-size_t asciiPrefixLength(TLStringView text) {
-  size_t i = 0;
-  const size_t n = text.size();
-  for (; i + 4 <= n; i += 4) {
-    uint64_t block;
-    std::memcpy(&block, text.data() + i, sizeof block);
-    if ((block & 0xFF80FF80FF80FF80ULL) != 0) break;
-  }
-  while (i < n && text[i] < 0x80) ++i;
-  return i;
-}
-
 // ICU takes 32-bit lengths; longer texts are converted in pieces that end on a character.
 constexpr size_t kPiece = size_t{1} << 28;
 
@@ -53,6 +41,18 @@ void appendNonASCII(TLStringView text, std::string& out) {
 }
 
 }  // namespace
+
+size_t asciiPrefixLength(TLStringView text) {
+  size_t i = 0;
+  const size_t n = text.size();
+  for (; i + 4 <= n; i += 4) {
+    uint64_t block;
+    std::memcpy(&block, text.data() + i, sizeof block);
+    if ((block & 0xFF80FF80FF80FF80ULL) != 0) break;
+  }
+  while (i < n && text[i] < 0x80) ++i;
+  return i;
+}
 
 size_t asciiPrefixLength(std::string_view bytes) {
   size_t i = 0;

@@ -19,8 +19,9 @@ namespace platform {
 // As toUTF8, appended to `out`.
 void appendUTF8(TLStringView text, std::string& out);
 
-// Number of leading bytes below 0x80.
+// Number of leading bytes, or units, below 0x80.
 [[nodiscard]] size_t asciiPrefixLength(std::string_view bytes);
+[[nodiscard]] size_t asciiPrefixLength(TLStringView text);
 
 // True when `bytes` is well-formed UTF-8.
 [[nodiscard]] bool isValidUTF8(std::string_view bytes);

@@ -1,0 +1,186 @@
+#include <benchmark/benchmark.h>
+#include <leveldb/db.h>
+#include <leveldb/write_batch.h>
+
+#include <cmath>
+#include <filesystem>
+#include <memory>
+#include <random>
+
+#include "salt/Coding.h"
+#include "salt/Database.h"
+#include "salt/Search.h"
+
+namespace {
+
+constexpr uint32_t kTokensPerZone = 300;
+constexpr uint32_t kVocabulary = 20000;
+constexpr uint16_t kZone = 7;
+
+struct Zone {
+  std::string text;
+  std::vector<uint32_t> offsets;
+};
+
+// Words of a vocabulary by a distribution that falls as 1/rank, as in mail.
+class Texts {
+ public:
+  Texts() {
+    for (uint32_t i = 0; i < kVocabulary; ++i) {
+      std::string word;
+      for (size_t n = 2 + _random() % 9; n > 0; --n) {
+        word += static_cast<char>('a' + _random() % 26);
+      }
+      _words.push_back(word);
+    }
+  }
+
+  [[nodiscard]] const std::string& word(size_t rank) const { return _words[rank]; }
+
+  Zone next() {
+    Zone zone;
+    std::uniform_real_distribution<double> exponent(0, std::log(kVocabulary));
+    for (uint32_t i = 0; i < kTokensPerZone; ++i) {
+      zone.offsets.push_back(static_cast<uint32_t>(zone.text.size()));
+      zone.text += _words[static_cast<size_t>(std::exp(exponent(_random))) % kVocabulary] + ' ';
+    }
+    return zone;
+  }
+
+ private:
+  std::mt19937 _random{11};
+  std::vector<std::string> _words;
+};
+
+class ScratchPath {
+ public:
+  explicit ScratchPath(const std::string& name)
+      : _path(std::filesystem::temp_directory_path() /
+              (name + std::to_string(std::random_device()()))) {}
+  ~ScratchPath() { std::filesystem::remove_all(_path); }
+  [[nodiscard]] std::string string() const { return _path.string(); }
+
+ private:
+  std::filesystem::path _path;
+};
+
+std::unique_ptr<salt::Index> newIndex(const ScratchPath& path) {
+  salt::Index::Options options;
+  options.Path = path.string();
+  return std::unique_ptr<salt::Index>(salt::NewIndex(options));
+}
+
+// Several zones a document, as the indexer adds them: one long text and some short ones.
+void addDocument(salt::Index& index, uint32_t docID, Zone zone) {
+  index.AddZone(docID, kZone, zone.text, zone.offsets, true);
+  for (uint16_t zoneID = 1; zoneID < kZone; ++zoneID) {
+    std::vector<uint32_t> offsets{0};
+    index.AddZone(docID, zoneID, zone.text.substr(0, 30), offsets, true);
+  }
+}
+
+void AddZone(benchmark::State& state) {
+  const ScratchPath path("salt-bench-add");
+  const auto index = newIndex(path);
+  Texts texts;
+  std::vector<Zone> zones(2000);
+  for (Zone& zone : zones) zone = texts.next();
+  uint32_t docID = 0;
+  for (auto _ : state) {
+    ++docID;
+    addDocument(*index, docID, zones[docID % zones.size()]);
+  }
+  state.SetItemsProcessed(state.iterations() * (kTokensPerZone + kZone - 1));
+}
+BENCHMARK(AddZone)->Iterations(10000)->Unit(benchmark::kMicrosecond);
+
+// The bound that AddZone is held against: bare batches of the same keys and texts.
+void RawBatches(benchmark::State& state) {
+  const ScratchPath path("salt-bench-raw");
+  salt::Database database = salt::openDatabase(path.string(), salt::OpenMode::create);
+  const salt::Index::Options op;
+  Texts texts;
+  std::vector<Zone> zones(2000);
+  for (Zone& zone : zones) zone = texts.next();
+  salt::SuffixMeta meta;
+  std::string key;
+  leveldb::WriteBatch batch;
+  const auto add = [&](uint16_t zoneID, std::string_view text, const auto& offsets) {
+    batch.Put(salt::slice(salt::TextKey(255, meta.DocID, zoneID).view()), salt::slice(text));
+    meta.ZoneID = zoneID;
+    for (const uint32_t offset : offsets) {
+      const std::string_view suffix = text.substr(offset);
+      meta.Offset = offset;
+      salt::suffixKey(0, suffix.substr(0, salt::suffixLength(suffix, op)), meta, &key);
+      batch.Put(key, {});
+    }
+    database.db->Write({}, &batch);
+    batch.Clear();
+  };
+  for (auto _ : state) {
+    ++meta.DocID;
+    const Zone& zone = zones[meta.DocID % zones.size()];
+    add(kZone, zone.text, zone.offsets);
+    for (uint16_t zoneID = 1; zoneID < kZone; ++zoneID) {
+      add(zoneID, std::string_view(zone.text).substr(0, 30), std::vector<uint32_t>{0});
+    }
+  }
+  state.SetItemsProcessed(state.iterations() * (kTokensPerZone + kZone - 1));
+}
+BENCHMARK(RawBatches)->Iterations(10000)->Unit(benchmark::kMicrosecond);
+
+struct Filled {
+  ScratchPath path{"salt-bench-read"};
+  Texts texts;
+  std::unique_ptr<salt::Index> index = newIndex(path);
+
+  Filled() {
+    for (uint32_t docID = 1; docID <= 1500; ++docID) addDocument(*index, docID, texts.next());
+    index->Compact();
+  }
+};
+
+Filled& filled() {
+  static Filled all;
+  return all;
+}
+
+// The argument is the rank of the word in the vocabulary.
+void ScanPrefix(benchmark::State& state) {
+  Filled& data = filled();
+  const std::string prefix = data.texts.word(static_cast<size_t>(state.range(0))) + ' ';
+  uint64_t results = 0;
+  for (auto _ : state) {
+    data.index->ScanPrefix(prefix, [&results](const salt::SuffixMeta&) {
+      ++results;
+      return true;
+    });
+  }
+  state.SetItemsProcessed(static_cast<int64_t>(results));
+}
+BENCHMARK(ScanPrefix)->Arg(1)->Arg(30)->Arg(1000)->Unit(benchmark::kMicrosecond);
+
+// Two whole words and the beginning of a third.
+void Search(benchmark::State& state) {
+  Filled& data = filled();
+  const auto term = [](const std::string& token) {
+    saltsearch::Term made;
+    made.tokens = {token};
+    made.tokenScores = {1.0};
+    made.zones = {kZone, 1, 2};
+    made.zoneScores = {0.5, 0.3, 0.2};
+    return made;
+  };
+  const saltsearch::Options options{50, 100000, 0.01};
+  for (auto _ : state) {
+    std::vector<saltsearch::Term> terms{term(data.texts.word(40) + ' '),
+                                        term(data.texts.word(5) + ' '),
+                                        term(data.texts.word(20).substr(0, 2))};
+    benchmark::DoNotOptimize(saltsearch::Search(*data.index, terms, options));
+  }
+}
+BENCHMARK(Search)->Unit(benchmark::kMicrosecond);
+
+}  // namespace
+
+BENCHMARK_MAIN();

@@ -1,0 +1,179 @@
+#include "cli/ByteSource.h"
+
+#include <fcntl.h>
+#include <lzma.h>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <zlib.h>
+
+#include <cerrno>
+#include <string_view>
+#include <vector>
+
+namespace cli {
+
+namespace {
+
+constexpr size_t kBufferBytes = size_t{64} << 10;
+
+// Enough for what xz -9 makes; a file that asks for more is refused.
+constexpr uint64_t kMaximumDecoderBytes = uint64_t{160} << 20;
+
+constexpr const char* kCompressionDomain = "compression";
+constexpr const char* kEndsEarly = "the compressed data ends early";
+constexpr const char* kDamaged = "the compressed data is damaged";
+
+constexpr std::string_view kGzipMagic("\x1F\x8B", 2);
+constexpr std::string_view kXzMagic("\xFD\x37\x7A\x58\x5A\x00", 6);
+
+std::nullopt_t fail(TLErrorOut error, int code, const char* message) {
+  platform::setError(error, {kCompressionDomain, code, message});
+  return std::nullopt;
+}
+
+// The file as it is, through a buffer that the decoders read in place.
+class FileSource final : public ByteSource {
+ public:
+  explicit FileSource(int descriptor) : _descriptor(descriptor), _buffer(kBufferBytes) {}
+  ~FileSource() override { close(_descriptor); }
+
+  // The bytes in the buffer, at least one unless the file has ended.
+  std::optional<std::string_view> peek(TLErrorOut error) {
+    if (_begin == _end) {
+      ssize_t n;
+      do {
+        n = ::read(_descriptor, _buffer.data(), _buffer.size());
+      } while (n < 0 && errno == EINTR);
+      if (n < 0) {
+        platform::setError(error, platform::posixError(errno, "cannot read"));
+        return std::nullopt;
+      }
+      _begin = 0;
+      _end = static_cast<size_t>(n);
+    }
+    return std::string_view(_buffer.data() + _begin, _end - _begin);
+  }
+  void skip(size_t count) {
+    _begin += count;
+    _consumed += count;
+  }
+
+  std::optional<size_t> read(char* buffer, size_t size, TLErrorOut error) override {
+    const auto bytes = peek(error);
+    if (!bytes) return std::nullopt;
+    const size_t count = bytes->copy(buffer, size);
+    skip(count);
+    return count;
+  }
+  uint64_t consumed() const override { return _consumed; }
+
+ private:
+  const int _descriptor;
+  std::vector<char> _buffer;
+  size_t _begin = 0;
+  size_t _end = 0;
+  uint64_t _consumed = 0;
+};
+
+// gzip, also several members in a row. What follows the last one and is no member is ignored, as
+// gzip does.
+class GzipSource final : public ByteSource {
+ public:
+  explicit GzipSource(std::unique_ptr<FileSource> file) : _file(std::move(file)) {
+    _usable = inflateInit2(&_stream, 15 + 16) == Z_OK;
+  }
+  ~GzipSource() override { inflateEnd(&_stream); }
+
+  std::optional<size_t> read(char* buffer, size_t size, TLErrorOut error) override {
+    if (!_usable) return fail(error, ENOMEM, "cannot decompress");
+    _stream.next_out = reinterpret_cast<Bytef*>(buffer);
+    _stream.avail_out = static_cast<uInt>(size);
+    while (!_ended && _stream.avail_out == size) {
+      const auto input = _file->peek(error);
+      if (!input) return std::nullopt;
+      if (_betweenMembers && !input->starts_with(kGzipMagic[0])) {
+        _ended = true;
+        break;
+      }
+      if (input->empty()) return fail(error, Z_BUF_ERROR, kEndsEarly);
+      _betweenMembers = false;
+      _stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(input->data()));
+      _stream.avail_in = static_cast<uInt>(input->size());
+      const int result = inflate(&_stream, Z_NO_FLUSH);
+      _file->skip(input->size() - _stream.avail_in);
+      if (result == Z_STREAM_END) {
+        _betweenMembers = true;
+        inflateReset(&_stream);
+      } else if (result != Z_OK) {
+        return fail(error, result, kDamaged);
+      }
+    }
+    return size - _stream.avail_out;
+  }
+  uint64_t consumed() const override { return _file->consumed(); }
+
+ private:
+  const std::unique_ptr<FileSource> _file;
+  z_stream _stream{};
+  bool _usable = false;
+  bool _betweenMembers = false;
+  bool _ended = false;
+};
+
+class XzSource final : public ByteSource {
+ public:
+  explicit XzSource(std::unique_ptr<FileSource> file) : _file(std::move(file)) {
+    _state = lzma_stream_decoder(&_stream, kMaximumDecoderBytes, LZMA_CONCATENATED);
+  }
+  ~XzSource() override { lzma_end(&_stream); }
+
+  std::optional<size_t> read(char* buffer, size_t size, TLErrorOut error) override {
+    _stream.next_out = reinterpret_cast<uint8_t*>(buffer);
+    _stream.avail_out = size;
+    while (_state == LZMA_OK && _stream.avail_out == size) {
+      const auto input = _file->peek(error);
+      if (!input) return std::nullopt;
+      _stream.next_in = reinterpret_cast<const uint8_t*>(input->data());
+      _stream.avail_in = input->size();
+      _state = lzma_code(&_stream, input->empty() ? LZMA_FINISH : LZMA_RUN);
+      _file->skip(input->size() - _stream.avail_in);
+    }
+    if (_state == LZMA_OK || _stream.avail_out < size) return size - _stream.avail_out;
+    if (_state == LZMA_STREAM_END) return 0;
+    if (_state == LZMA_MEMLIMIT_ERROR) {
+      return fail(error, _state, "decompression takes too much memory");
+    }
+    return fail(error, _state, _state == LZMA_BUF_ERROR ? kEndsEarly : kDamaged);
+  }
+  uint64_t consumed() const override { return _file->consumed(); }
+
+ private:
+  const std::unique_ptr<FileSource> _file;
+  lzma_stream _stream = LZMA_STREAM_INIT;
+  lzma_ret _state;
+};
+
+}  // namespace
+
+std::unique_ptr<ByteSource> openByteSource(const std::string& path, TLErrorOut error) {
+  // O_NONBLOCK, so that a pipe in the place of a file does not hold us up.
+  const int descriptor = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+  struct stat info;
+  if (descriptor < 0 || fstat(descriptor, &info) != 0) {
+    platform::setError(error, platform::posixError(errno, "cannot open"));
+    if (descriptor >= 0) close(descriptor);
+    return nullptr;
+  }
+  auto file = std::make_unique<FileSource>(descriptor);
+  if (!S_ISREG(info.st_mode)) {
+    platform::setError(error, {kPOSIXErrorDomain, EINVAL, "not a regular file"});
+    return nullptr;
+  }
+  const auto head = file->peek(error);
+  if (!head) return nullptr;
+  if (head->starts_with(kGzipMagic)) return std::make_unique<GzipSource>(std::move(file));
+  if (head->starts_with(kXzMagic)) return std::make_unique<XzSource>(std::move(file));
+  return file;
+}
+
+}  // namespace cli

@@ -1,0 +1,235 @@
+#include "cli/Commands.h"
+
+#include <fmt/format.h>
+#include <unistd.h>
+
+#include <array>
+#include <cstdio>
+#include <iostream>
+#include <nlohmann/json.hpp>
+
+#include "cli/Results.h"
+#include "client/DebugServiceProxy.h"
+#include "client/SearchServiceProxy.h"
+
+namespace cli {
+
+namespace {
+
+using Run = ExitStatus (*)(const Options&);
+
+// Writes the result of a command; a full disk or a closed pipe is a failure.
+ExitStatus print(const std::string& text, ExitStatus status = ExitStatus::done) {
+  const bool written =
+      std::fwrite(text.data(), 1, text.size(), stdout) == text.size() && std::fflush(stdout) == 0;
+  return written ? status : ExitStatus::failure;
+}
+
+std::string withLineFeed(std::string text) {
+  if (text.empty() || text.back() != '\n') text.push_back('\n');
+  return text;
+}
+
+// The words as they were typed, joined by single blanks; a blank at the end stays.
+std::string joinedWords(const Options& options) {
+  std::string words;
+  for (const std::string& word : options.arguments) {
+    if (&word != &options.arguments.front()) words.push_back(' ');
+    words += word;
+  }
+  return words;
+}
+
+ExitStatus runSearch(const Options& options) {
+  const std::string words = joinedWords(options);
+  TLQuery query;
+  query.setRawQuery(platform::fromUTF8(words));
+  query.setOriginalQuery(platform::fromUTF8(words));
+  std::optional<TLError> error;
+  client::SearchServiceProxy service(options.runtimeDirectory);
+  const int64_t limit = options.limit == 0 ? service.kNoMaximum : options.limit;
+  const auto items = service.searchItems(query, 0, options.protectionClass, limit, &error);
+  if (!items) return complain(error);
+
+  const Palette palette(colorAllowed(options.color, STDOUT_FILENO));
+  const bool explain = options.command == Command::explain;
+  const auto status = items->empty() ? ExitStatus::nothingFound : ExitStatus::done;
+  switch (options.format) {
+    case OutputFormat::json:
+      return print(explain ? explanationJSON(query, *items) : resultsJSON(*items), status);
+    case OutputFormat::files:
+      return print(resultsFiles(*items), status);
+    case OutputFormat::text:
+      break;
+  }
+  return print(
+      explain ? explanationText(query, *items, palette) : resultsText(*items, words, palette),
+      status);
+}
+
+// One call an identifier, so that one that fails does not stop the others.
+ExitStatus runDelete(const Options& options) {
+  client::SearchServiceProxy service(options.runtimeDirectory);
+  nlohmann::json list = nlohmann::json::array();
+  std::string text;
+  ExitStatus status = ExitStatus::done;
+  for (const std::string& identifier : options.arguments) {
+    std::optional<TLError> error;
+    const bool deleted = service.deleteItemsWithIdentifiers(std::span(&identifier, 1), options.name,
+                                                            options.protectionClass, &error);
+    if (client::isUnreachable(error)) return complain(error);
+    if (deleted) {
+      text += "deleted " + cleanForTerminal(identifier) + '\n';
+    } else {
+      complain(fmt::format("{}: {}", identifier, error->message));
+      status = ExitStatus::failure;
+    }
+    list.push_back({{"identifier", identifier}, {"deleted", deleted}});
+  }
+  return print(options.format == OutputFormat::json ? jsonText(list) : text, status);
+}
+
+bool confirmed(const Options& options) {
+  if (options.yes) return true;
+  if (isatty(STDIN_FILENO) != 1 || isatty(STDERR_FILENO) != 1) {
+    complain("reset without a terminal needs --yes");
+    return false;
+  }
+  fmt::print(stderr, "Delete everything that is indexed for class \"{}\"? [y/N] ",
+             cleanForTerminal(options.protectionClass));
+  std::string answer;
+  std::getline(std::cin, answer);
+  if (answer == "y" || answer == "Y" || answer == "yes") return true;
+  complain("nothing has been deleted");
+  return false;
+}
+
+ExitStatus runReset(const Options& options) {
+  if (!confirmed(options)) return ExitStatus::failure;
+  std::optional<TLError> error;
+  client::SearchServiceProxy service(options.runtimeDirectory);
+  if (!service.deleteAllItems(options.name, options.protectionClass, &error)) {
+    return complain(error);
+  }
+  return print(options.format == OutputFormat::json ? jsonText({{"reset", true}})
+                                                    : "The index is empty.\n");
+}
+
+ExitStatus runStats(const Options& options) {
+  std::optional<TLError> error;
+  client::DebugServiceProxy service(options.runtimeDirectory);
+  const auto statistics =
+      service.fetchStatsForIndexer(options.name, options.protectionClass, &error);
+  if (!statistics) return complain(error);
+  nlohmann::ordered_json json = nlohmann::ordered_json::object();
+  std::string text;
+  for (const auto& [key, value] : *statistics) {
+    const auto number = std::visit([](auto v) { return nlohmann::ordered_json(v); }, value);
+    json[key] = number;
+    text += fmt::format("{:50} {:>14}\n", cleanForTerminal(key), number.dump());
+  }
+  return print(options.format == OutputFormat::json ? escapeJSONForTerminal(json.dump(2)) + '\n'
+                                                    : text);
+}
+
+// A text of the daemon: as it is, or as the value of one key.
+ExitStatus printText(const Options& options, const char* key,
+                     const std::optional<std::string>& text, const std::optional<TLError>& error) {
+  if (!text) return complain(error);
+  return print(options.format == OutputFormat::json ? jsonText({{key, *text}})
+                                                    : withLineFeed(cleanLinesForTerminal(*text)));
+}
+
+ExitStatus runMetrics(const Options& options) {
+  std::optional<TLError> error;
+  client::DebugServiceProxy service(options.runtimeDirectory);
+  const auto text = service.fetchStatsForSalt(options.name, options.protectionClass, &error);
+  return printText(options, "metrics", text, error);
+}
+
+ExitStatus runPing(const Options& options) {
+  std::optional<TLError> error;
+  client::DebugServiceProxy service(options.runtimeDirectory);
+  const auto text =
+      service.ping(options.arguments.empty() ? "tallow" : options.arguments[0], &error);
+  return printText(options, "ping", text, error);
+}
+
+ExitStatus runVacuum(const Options& options) {
+  std::optional<TLError> error;
+  client::DebugServiceProxy service(options.runtimeDirectory);
+  if (!service.forceVacuumAndCompact(options.protectionClass, &error)) return complain(error);
+  return print(options.format == OutputFormat::json ? jsonText({{"vacuum", true}})
+                                                    : "The index has been compacted.\n");
+}
+
+ExitStatus runState(const Options& options) {
+  std::optional<TLError> error;
+  client::SearchServiceProxy service(options.runtimeDirectory);
+  const auto state = service.fetchLastClientState(options.name, options.protectionClass, &error);
+  if (error) return complain(error);
+  std::string hex;
+  for (const char c : state.value_or("")) {
+    hex += fmt::format("{:02x}", static_cast<unsigned char>(c));
+  }
+  const bool printable =
+      state && platform::isValidUTF8(*state) && cleanForTerminal(*state) == *state;
+  if (options.format == OutputFormat::json) {
+    nlohmann::json json{{"name", options.name}, {"present", state.has_value()}};
+    if (state) json["hex"] = hex;
+    if (printable) json["text"] = *state;
+    return print(jsonText(json), state ? ExitStatus::done : ExitStatus::nothingFound);
+  }
+  if (!state) {
+    complain(fmt::format("no state is stored under the name {}", options.name));
+    return ExitStatus::nothingFound;
+  }
+  return print(fmt::format("{}\n{}", hex, printable ? *state + '\n' : std::string()));
+}
+
+struct CommandFunction {
+  Command command;
+  Run run;
+  const char* service;
+};
+
+constexpr std::array<CommandFunction, 10> kFunctions{{
+    {Command::index, runIndex, client::kSearchServiceName},
+    {Command::search, runSearch, client::kSearchServiceName},
+    {Command::explain, runSearch, client::kSearchServiceName},
+    {Command::remove, runDelete, client::kSearchServiceName},
+    {Command::reset, runReset, client::kSearchServiceName},
+    {Command::stats, runStats, client::kDebugServiceName},
+    {Command::metrics, runMetrics, client::kDebugServiceName},
+    {Command::ping, runPing, client::kDebugServiceName},
+    {Command::vacuum, runVacuum, client::kDebugServiceName},
+    {Command::state, runState, client::kSearchServiceName},
+}};
+
+}  // namespace
+
+void complain(const std::string& message) {
+  fmt::print(stderr, "tallow: {}\n", cleanForTerminal(message));
+}
+
+ExitStatus complain(const std::optional<TLError>& error) {
+  complain(error ? fmt::format("{} ({} {})", error->message, error->domain, error->code)
+                 : std::string("the daemon gave no answer"));
+  return client::isUnreachable(error) ? ExitStatus::unreachable : ExitStatus::failure;
+}
+
+ExitStatus runCommand(const Options& options) {
+  for (const CommandFunction& function : kFunctions) {
+    if (function.command != options.command) continue;
+    if (options.waitSeconds > 0) {
+      // Where this is in vain, the call says why.
+      const std::chrono::milliseconds limit(static_cast<int64_t>(options.waitSeconds * 1000));
+      [[maybe_unused]] const bool reached =
+          client::waitForService(options.runtimeDirectory, function.service, limit);
+    }
+    return function.run(options);
+  }
+  return ExitStatus::failure;
+}
+
+}  // namespace cli

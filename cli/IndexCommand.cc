@@ -1,0 +1,149 @@
+#include <fmt/format.h>
+
+#include <nlohmann/json.hpp>
+
+#include "cli/Commands.h"
+#include "cli/IndexPipeline.h"
+#include "cli/MailWalker.h"
+#include "cli/ProgressBar.h"
+#include "cli/Results.h"
+#include "client/SearchServiceProxy.h"
+
+namespace cli {
+
+namespace {
+
+// How the daemon says that one item of a batch stopped it.
+constexpr const char* kIndexerDomain = "TALIndexer";
+constexpr int kItemFailed = 1;
+
+uint64_t totalBytes(const std::vector<std::string>& paths) {
+  uint64_t total = 0;
+  const WalkVisitor visitor{[&](const std::string&, bool, uint64_t size) {
+                              total += size;
+                              return true;
+                            },
+                            [](const std::string&, const std::string&) { return true; }};
+  for (const std::string& path : paths) walkMail(path, visitor);
+  return total;
+}
+
+// One run of `index`: sends the batches and keeps the account.
+class Indexing {
+ public:
+  explicit Indexing(const Options& options)
+      : _options(options),
+        _service(options.runtimeDirectory),
+        _progress(ProgressBar::shown() ? totalBytes(options.arguments) : 0) {}
+
+  ExitStatus run() {
+    IndexPipeline pipeline(_options.arguments);
+    while (auto batch = pipeline.next()) {
+      report(*batch);
+      std::optional<TLError> error;
+      if (!send(batch->items, &error)) {
+        _progress.clear();
+        const ExitStatus status = complain(error);
+        printSummary();
+        return status;
+      }
+      _bytes += batch->inputBytes;
+      _progress.update(_bytes, _indexed);
+    }
+    _progress.clear();
+    const bool written = printSummary();
+    if (!written || _pathFailures > 0 || _refused > 0) return ExitStatus::failure;
+    return _indexed > 0 ? ExitStatus::done : ExitStatus::nothingFound;
+  }
+
+ private:
+  void say(const std::string& message) {
+    _progress.clear();
+    complain(message);
+  }
+
+  void report(const MailBatch& batch) {
+    for (const auto& failure : batch.pathFailures) {
+      say(fmt::format("{}: {}", failure.where, failure.reason));
+    }
+    for (const auto& failure : batch.messageFailures) {
+      say(fmt::format("{}: {}", failure.where, failure.reason));
+    }
+    if (_options.verbose) {
+      for (const auto& path : batch.ignored) say(path + ": no mail");
+      for (const auto& identifier : batch.cut) say(identifier + ": too long, cut");
+    }
+    _pathFailures += batch.pathFailures.size();
+    _messageFailures += batch.messageFailures.size();
+    _ignored += batch.ignored.size();
+    _cut += batch.cut.size();
+  }
+
+  // False only where going on makes no sense.
+  bool send(std::span<const client::EncodedItem> items, TLErrorOut error) {
+    if (items.empty()) return true;
+    std::optional<TLError> failure;
+    if (_service.indexItems(items, _options.name, _options.protectionClass, &failure)) {
+      _indexed += items.size();
+      return true;
+    }
+    if (failure->domain != kIndexerDomain || failure->code != kItemFailed) {
+      platform::setError(error, *failure);
+      return false;
+    }
+    if (items.size() == 1) {
+      say(fmt::format("{}: {}", items[0].identifier, failure->message));
+      ++_refused;
+      return true;
+    }
+    // The batch stopped at one item; which one shows when each goes alone.
+    for (const client::EncodedItem& item : items) {
+      if (!send(std::span(&item, 1), error)) return false;
+    }
+    return true;
+  }
+
+  bool printSummary() const {
+    std::string text;
+    if (_options.format == OutputFormat::json) {
+      text = jsonText({{"indexed", _indexed},
+                       {"unreadableMessages", _messageFailures},
+                       {"unreadablePaths", _pathFailures},
+                       {"refused", _refused},
+                       {"cut", _cut},
+                       {"ignoredFiles", _ignored}});
+    } else {
+      text = fmt::format("{} messages indexed", _indexed);
+      const auto add = [&](uint64_t count, const char* what) {
+        if (count > 0) text += fmt::format(", {} {}", count, what);
+      };
+      add(_messageFailures, "unreadable");
+      add(_pathFailures, "paths not read");
+      add(_refused, "refused by the daemon");
+      add(_cut, "too long and cut");
+      add(_ignored, "other files ignored");
+      text += '\n';
+    }
+    return std::fwrite(text.data(), 1, text.size(), stdout) == text.size() &&
+           std::fflush(stdout) == 0;
+  }
+
+  const Options& _options;
+  client::SearchServiceProxy _service;
+  ProgressBar _progress;
+  uint64_t _bytes = 0;
+  uint64_t _indexed = 0;
+  uint64_t _messageFailures = 0;
+  uint64_t _pathFailures = 0;
+  uint64_t _refused = 0;
+  uint64_t _cut = 0;
+  uint64_t _ignored = 0;
+};
+
+}  // namespace
+
+ExitStatus runIndex(const Options& options) {
+  return Indexing(options).run();
+}
+
+}  // namespace cli

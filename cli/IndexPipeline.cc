@@ -1,0 +1,117 @@
+#include "cli/IndexPipeline.h"
+
+#include "cli/MailWalker.h"
+#include "cli/MessageParser.h"
+#include "platform/Queue.h"
+
+namespace cli {
+
+// The work of the reading thread: gathers a batch and pushes it when it is full.
+class IndexPipeline::Reading {
+ public:
+  explicit Reading(IndexPipeline& pipeline) : _pipeline(pipeline) {}
+
+  bool walk(const std::string& path) {
+    const MailSink sink{
+        [this](std::string_view bytes, const MessageOrigin& origin) { return add(bytes, origin); },
+        [this](const std::string& where, const std::string& reason) {
+          (where == _named ? _batch.pathFailures : _batch.messageFailures)
+              .push_back({where, reason});
+          return flushIfFull();
+        },
+        [this](const std::string& ignored) { _batch.ignored.push_back(ignored); },
+        [this](uint64_t bytes) { _batch.inputBytes += bytes; }};
+    return walkMail(path, {[&](const std::string& file, bool named, uint64_t) {
+                             _named = named ? file : std::string();
+                             return readMailFile(file, named, sink);
+                           },
+                           [&](const std::string& where, const std::string& reason) {
+                             _batch.pathFailures.push_back({where, reason});
+                             return flushIfFull();
+                           }});
+  }
+
+  bool flush() { return _pipeline.push(std::exchange(_batch, MailBatch())); }
+
+ private:
+  bool add(std::string_view bytes, const MessageOrigin& origin) {
+    auto result = _parser.parse(bytes, origin);
+    if (const auto* bad = std::get_if<UnparsableMessage>(&result)) {
+      _batch.messageFailures.push_back({origin.identifier, bad->reason});
+      return flushIfFull();
+    }
+    const auto& message = std::get<ParsedMessage>(result);
+    if (message.cut) _batch.cut.push_back(origin.identifier);
+    client::EncodedItem item = client::encode(*message.item);
+    if (!_batch.items.empty() && _batch.itemBytes + item.bytes.size() > kBatchBytes && !flush()) {
+      return false;
+    }
+    _batch.itemBytes += item.bytes.size();
+    _batch.items.push_back(std::move(item));
+    return flushIfFull();
+  }
+
+  bool flushIfFull() {
+    const size_t reports = _batch.messageFailures.size() + _batch.pathFailures.size() +
+                           _batch.ignored.size() + _batch.cut.size();
+    const bool full = _batch.items.size() >= kBatchItems || _batch.itemBytes >= kBatchBytes ||
+                      reports >= kBatchReports;
+    return !full || flush();
+  }
+
+  IndexPipeline& _pipeline;
+  MessageParser _parser;
+  MailBatch _batch;
+  std::string _named;
+};
+
+IndexPipeline::IndexPipeline(std::vector<std::string> paths)
+    : _paths(std::move(paths)), _thread([this] { run(); }) {}
+
+IndexPipeline::~IndexPipeline() {
+  {
+    const platform::MutexLock lock(_mutex);
+    _cancelled = true;
+  }
+  _changed.notify_all();
+  _thread.join();
+}
+
+void IndexPipeline::run() {
+  platform::setThreadName("tallow.reader");
+  Reading reading(*this);
+  bool goOn = true;
+  for (const std::string& path : _paths) goOn = goOn && reading.walk(path);
+  if (goOn) reading.flush();
+  {
+    const platform::MutexLock lock(_mutex);
+    _ended = true;
+  }
+  _changed.notify_all();
+}
+
+bool IndexPipeline::push(MailBatch batch) {
+  {
+    const platform::MutexLock lock(_mutex);
+    while (_batches.size() >= kQueuedBatches && !_cancelled) _changed.wait(_mutex);
+    if (_cancelled) return false;
+    _batches.push_back(std::move(batch));
+  }
+  _changed.notify_all();
+  return true;
+}
+
+std::optional<MailBatch> IndexPipeline::next() {
+  std::optional<MailBatch> batch;
+  {
+    const platform::MutexLock lock(_mutex);
+    while (_batches.empty() && !_ended) _changed.wait(_mutex);
+    if (_batches.empty()) return std::nullopt;
+    batch = std::move(_batches.front());
+    _batches.pop_front();
+  }
+  _changed.notify_all();
+  return batch;
+}
+
+}  // namespace cli

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <string>
+#include <string_view>
+
+#include "platform/TLError.h"
+
+namespace cli {
+
+// The longest message that is read; a longer one is reported and passed over.
+inline constexpr size_t kMaximumMessageBytes = size_t{64} << 20;
+
+// Where a message comes from.
+struct MessageOrigin {
+  std::string identifier;
+  std::string folderPath;  // the Maildir folder, the directory of a single file, or the mbox file
+  std::string folderName;
+};
+
+// What a reader of mail files reports to. Results are false to stop reading.
+struct MailSink {
+  // The bytes live for the call.
+  std::function<bool(std::string_view bytes, const MessageOrigin& origin)> message;
+  // A message, or the rest of a file, that cannot be read; `where` is a path, or path:offset.
+  std::function<bool(const std::string& where, const std::string& reason)> failure;
+  // A file of a directory that is no mail.
+  std::function<void(const std::string& path)> ignored;
+  // Bytes of the file itself read since the last call.
+  std::function<void(uint64_t bytes)> progress;
+};
+
+// Reads the messages of one file: an mbox file or a single message, which may be compressed. `path`
+// is absolute. With `named`, the user has named the file, so that one without mail is a failure; in
+// a directory it is ignored. False once the sink has said stop.
+//
+// In an mbox file a message begins at a line "From " with a time and a year, at the start or behind
+// an empty line. Behind ">From " lines (with any number of ">") one ">" is taken off.
+bool readMailFile(const std::string& path, bool named, const MailSink& sink);
+
+// True for a line that begins a message in an mbox file.
+[[nodiscard]] bool isFromLine(std::string_view line);
+
+}  // namespace cli

@@ -1,0 +1,303 @@
+#include "cli/MessageParser.h"
+
+#include <gmime/gmime.h>
+
+#include <algorithm>
+#include <mutex>
+#include <optional>
+#include <vector>
+
+#include "cli/Identifier.h"
+#include "cli/TextBudget.h"
+
+namespace cli {
+
+namespace {
+
+using Key = TLAttributeKey;
+
+struct Unref {
+  void operator()(gpointer object) const { g_object_unref(object); }
+};
+template <typename T>
+using Object = std::unique_ptr<T, Unref>;
+
+struct Free {
+  void operator()(gpointer memory) const { g_free(memory); }
+};
+using CString = std::unique_ptr<char, Free>;
+
+std::string_view orEmpty(const char* text) {
+  return text == nullptr ? std::string_view() : text;
+}
+
+bool isBlank(TLStringView text) {
+  return text.find_first_not_of(u" \t\r\n\u00A0") == TLStringView::npos;
+}
+
+Object<GMimeMessage> parseMIME(std::string_view bytes) {
+  const Object<GMimeStream> stream(g_mime_stream_mem_new_with_buffer(bytes.data(), bytes.size()));
+  const Object<GMimeParser> parser(g_mime_parser_new_with_stream(stream.get()));
+  g_mime_parser_set_format(parser.get(), GMIME_FORMAT_MESSAGE);
+  // Parts are kept as places in the stream, not copied.
+  g_mime_parser_set_persist_stream(parser.get(), TRUE);
+  return Object<GMimeMessage>(g_mime_parser_construct_message(parser.get(), nullptr));
+}
+
+std::optional<double> secondsOf(GDateTime* date) {
+  if (date == nullptr) return std::nullopt;
+  return static_cast<double>(g_date_time_to_unix(date));
+}
+
+std::string_view headerOf(GMimeMessage* message, const char* name) {
+  return orEmpty(g_mime_object_get_header(GMIME_OBJECT(message), name));
+}
+
+std::optional<double> receivedDate(GMimeMessage* message) {
+  const std::string_view received = headerOf(message, "Received");
+  const size_t semicolon = received.rfind(';');
+  if (semicolon == std::string_view::npos) return std::nullopt;
+  GDateTime* date =
+      g_mime_utils_header_decode_date(std::string(received.substr(semicolon + 1)).c_str());
+  const auto seconds = secondsOf(date);
+  if (date != nullptr) g_date_time_unref(date);
+  return seconds;
+}
+
+// The leaves of a message that matter.
+struct Leaves {
+  std::vector<GMimePart*> plain;
+  std::vector<GMimePart*> html;
+  std::vector<GMimeObject*> attachments;
+};
+
+void addLeaf(GMimePart* part, Leaves& leaves) {
+  GMimeObject* const object = GMIME_OBJECT(part);
+  GMimeContentType* const type = g_mime_object_get_content_type(object);
+  const char* const disposition = g_mime_object_get_disposition(object);
+  const bool attached =
+      disposition != nullptr && g_ascii_strcasecmp(disposition, "attachment") == 0;
+  const bool text = type == nullptr || g_mime_content_type_is_type(type, "text", "*");
+  if (!attached && text) {
+    if (type == nullptr || g_mime_content_type_is_type(type, "text", "plain")) {
+      leaves.plain.push_back(part);
+    } else if (g_mime_content_type_is_type(type, "text", "html")) {
+      leaves.html.push_back(part);
+    }
+  }
+  if (attached || !text || g_mime_part_get_filename(part) != nullptr) {
+    leaves.attachments.push_back(object);
+  }
+}
+
+// In the order of the message. Messages inside the message belong to it unless they are attached.
+Leaves leavesOf(GMimeMessage* message) {
+  Leaves leaves;
+  std::vector<GMimeObject*> pending{g_mime_message_get_mime_part(message)};
+  for (size_t count = 0; !pending.empty() && count < kMaximumParts; ++count) {
+    GMimeObject* const object = pending.back();
+    pending.pop_back();
+    if (object == nullptr) continue;
+    if (GMIME_IS_MULTIPART(object)) {
+      GMimeMultipart* const multipart = GMIME_MULTIPART(object);
+      const int children =
+          std::min(g_mime_multipart_get_count(multipart), static_cast<int>(kMaximumParts));
+      for (int i = children; i > 0; --i) {
+        pending.push_back(g_mime_multipart_get_part(multipart, i - 1));
+      }
+    } else if (GMIME_IS_MESSAGE_PART(object)) {
+      GMimeMessage* const inner = g_mime_message_part_get_message(GMIME_MESSAGE_PART(object));
+      const std::string_view disposition = orEmpty(g_mime_object_get_disposition(object));
+      if (disposition == "attachment") {
+        leaves.attachments.push_back(object);
+      } else if (inner != nullptr) {
+        pending.push_back(g_mime_message_get_mime_part(inner));
+      }
+    } else if (GMIME_IS_PART(object)) {
+      addLeaf(GMIME_PART(object), leaves);
+    }
+  }
+  return leaves;
+}
+
+TLString textOf(GMimePart* part, TextDecoder& decoder) {
+  GMimeDataWrapper* const content = g_mime_part_get_content(part);
+  if (content == nullptr) return {};
+  const Object<GMimeStream> stream(g_mime_stream_mem_new());
+  g_mime_data_wrapper_write_to_stream(content, stream.get());
+  const GByteArray* bytes = g_mime_stream_mem_get_byte_array(GMIME_STREAM_MEM(stream.get()));
+  const std::string_view view(reinterpret_cast<const char*>(bytes->data),
+                              std::min<size_t>(bytes->len, kMaximumBodyBytes));
+  const char* charset = g_mime_object_get_content_type_parameter(GMIME_OBJECT(part), "charset");
+  return decoder.decode(view, orEmpty(charset));
+}
+
+// The parts one after the other. Stops once there is more than the index takes.
+TLString joinedText(const std::vector<GMimePart*>& parts, TextDecoder& decoder) {
+  TLString joined;
+  for (GMimePart* part : parts) {
+    if (joined.size() > kMaximumBodyBytes) break;
+    if (!joined.empty() && joined.back() != u'\n') joined.push_back(u'\n');
+    joined += textOf(part, decoder);
+  }
+  return joined;
+}
+
+// Fills one item from one message.
+class ItemBuilder {
+ public:
+  ItemBuilder(GMimeMessage* message, const MessageOrigin& origin, TextDecoder& decoder)
+      : _message(message), _origin(origin), _decoder(decoder) {}
+
+  ParsedMessage build() {
+    _item->setIdentifier(platform::fromUTF8(_origin.identifier));
+    _item->setDomainIdentifier(platform::fromUTF8(percentEncodePath(_origin.folderPath)));
+    addText(Key::SUBJECT, orEmpty(g_mime_message_get_subject(_message)));
+    const std::string_view sender = headerOf(_message, "X-From");
+    addText(Key::X_FROM, sender.empty() ? headerOf(_message, "Sender") : sender);
+    addPersons(Key::AUTHORS, GMIME_ADDRESS_TYPE_FROM);
+    addPersons(Key::RECIPIENTS, GMIME_ADDRESS_TYPE_TO);
+    addPersons(Key::ADDITIONAL_RECIPIENTS, GMIME_ADDRESS_TYPE_CC);
+    addPersons(Key::HIDDEN_ADDITIONAL_RECIPIENTS, GMIME_ADDRESS_TYPE_BCC);
+    addDates();
+    const Leaves leaves = leavesOf(_message);
+    addBody(leaves);
+    addAttachments(leaves.attachments);
+    addText(Key::MAIL_MESSAGE_ID, orEmpty(g_mime_message_get_message_id(_message)));
+    addTexts(Key::MAILBOXES, {platform::fromUTF8(_origin.folderName)});
+    addTexts(Key::MAILBOX_IDENTIFIERS, {platform::fromUTF8(_origin.folderPath)});
+    addText(Key::CONTENT_TYPE, "message/rfc822");
+    return {_item, _cut};
+  }
+
+ private:
+  void addText(Key key, std::string_view text) {
+    if (text.empty()) return;
+    addTexts(key, {platform::fromUTF8(text)}, true);
+  }
+
+  // As one text or as a list, within the budget of one zone.
+  void addTexts(Key key, const std::vector<TLString>& texts, bool single = false) {
+    TextBudget budget;
+    std::vector<TLString> kept;
+    for (const TLString& text : texts) {
+      const TLStringView taken = budget.take(text);
+      if (!taken.empty()) kept.emplace_back(taken);
+      if (budget.exhausted()) break;
+    }
+    _cut = _cut || budget.exhausted();
+    if (kept.empty()) return;
+    if (single) {
+      _item->addAttributeWithKeyStringValue(key, std::move(kept.front()));
+    } else {
+      _item->addAttributeWithKeyStringValues(key, std::move(kept));
+    }
+  }
+
+  void addPersons(Key key, GMimeAddressType type) {
+    TextBudget names;
+    TextBudget addresses;
+    std::vector<std::shared_ptr<TLPerson>> persons;
+    std::vector<InternetAddressList*> pending{g_mime_message_get_addresses(_message, type)};
+    while (!pending.empty()) {
+      InternetAddressList* const list = pending.back();
+      pending.pop_back();
+      const int count = list == nullptr ? 0 : internet_address_list_length(list);
+      for (int i = 0; i < count; ++i) {
+        InternetAddress* const address = internet_address_list_get_address(list, i);
+        if (INTERNET_ADDRESS_IS_GROUP(address)) {
+          pending.push_back(internet_address_group_get_members(INTERNET_ADDRESS_GROUP(address)));
+        } else if (INTERNET_ADDRESS_IS_MAILBOX(address)) {
+          auto person = personOf(address, names, addresses);
+          if (person != nullptr) persons.push_back(std::move(person));
+        }
+        if (names.exhausted() || addresses.exhausted()) break;
+      }
+    }
+    _cut = _cut || names.exhausted() || addresses.exhausted();
+    if (!persons.empty()) _item->addAttributeWithKeyPersonValues(key, std::move(persons));
+  }
+
+  static std::shared_ptr<TLPerson> personOf(InternetAddress* address, TextBudget& names,
+                                            TextBudget& addresses) {
+    const TLString name = platform::fromUTF8(orEmpty(internet_address_get_name(address)));
+    const TLString mail = platform::fromUTF8(
+        orEmpty(internet_address_mailbox_get_addr(INTERNET_ADDRESS_MAILBOX(address))));
+    const TLStringView takenName = names.take(name);
+    const TLStringView takenMail = addresses.take(mail);
+    if (takenName.empty() && takenMail.empty()) return nullptr;
+    auto person = std::make_shared<TLPerson>();
+    if (!takenName.empty()) person->setName(TLString(takenName));
+    if (!takenMail.empty()) person->setEmailAddress(TLString(takenMail));
+    return person;
+  }
+
+  void addDates() {
+    const auto sent = secondsOf(g_mime_message_get_date(_message));
+    auto received = receivedDate(_message);
+    if (!received) received = sent;
+    if (received) _item->addAttributeWithKeyDoubleValue(Key::MAIL_DATE_RECEIVED, *received);
+    if (sent) _item->addAttributeWithKeyDoubleValue(Key::CONTENT_CREATION_DATE, *sent);
+  }
+
+  void addBody(const Leaves& leaves) {
+    TextBudget budget;
+    const TLString text = joinedText(leaves.plain, _decoder);
+    if (leaves.html.empty() || !isBlank(text)) {
+      const TLStringView taken = budget.take(text);
+      if (!taken.empty()) _item->addAttributeWithKeyStringValue(Key::TEXT_CONTENT, TLString(taken));
+    } else {
+      const TLString html = joinedText(leaves.html, _decoder);
+      const TLStringView taken = budget.takeMarkup(html);
+      if (!taken.empty()) {
+        _item->addAttributeWithKeyBytesValue(Key::HTML_CONTENT_DATA, platform::toUTF8(taken));
+      }
+    }
+    _cut = _cut || budget.exhausted();
+  }
+
+  void addAttachments(const std::vector<GMimeObject*>& attachments) {
+    std::vector<TLString> names;
+    std::vector<TLString> types;
+    for (GMimeObject* attachment : attachments) {
+      const char* name =
+          GMIME_IS_PART(attachment) ? g_mime_part_get_filename(GMIME_PART(attachment)) : nullptr;
+      if (name != nullptr) names.push_back(platform::fromUTF8(name));
+      GMimeContentType* const type = g_mime_object_get_content_type(attachment);
+      if (type == nullptr) continue;
+      const CString text(g_mime_content_type_get_mime_type(type));
+      types.push_back(platform::fromUTF8(orEmpty(text.get())));
+    }
+    addTexts(Key::ATTACHMENT_NAMES, names);
+    addTexts(Key::ATTACHMENT_TYPES, types);
+  }
+
+  GMimeMessage* const _message;
+  const MessageOrigin& _origin;
+  TextDecoder& _decoder;
+  const std::shared_ptr<TLIndexableItem> _item = std::make_shared<TLIndexableItem>();
+  bool _cut = false;
+};
+
+}  // namespace
+
+MessageParser::MessageParser() {
+  static std::once_flag once;
+  std::call_once(once, g_mime_init);
+}
+
+std::variant<ParsedMessage, UnparsableMessage> MessageParser::parse(std::string_view bytes,
+                                                                    const MessageOrigin& origin) {
+  if (bytes.find_first_not_of(" \t\r\n") == std::string_view::npos) {
+    return UnparsableMessage{"the message is empty"};
+  }
+  const Object<GMimeMessage> message = parseMIME(bytes);
+  if (message == nullptr) return UnparsableMessage{"not a mail message"};
+  GMimeHeaderList* const headers = g_mime_object_get_header_list(GMIME_OBJECT(message.get()));
+  if (g_mime_header_list_get_count(headers) == 0) {
+    return UnparsableMessage{"the message has no header"};
+  }
+  return ItemBuilder(message.get(), origin, _decoder).build();
+}
+
+}  // namespace cli

@@ -1,0 +1,54 @@
+#pragma once
+
+#include <memory>
+#include <string>
+#include <string_view>
+#include <variant>
+
+#include "cli/MailFile.h"
+#include "cli/TextDecoder.h"
+#include "records/TLIndexableItem.h"
+
+namespace cli {
+
+// How many MIME parts of a message are looked at.
+inline constexpr size_t kMaximumParts = 10000;
+
+// How much of a body is decoded. More never fits into the index.
+inline constexpr size_t kMaximumBodyBytes = size_t{1} << 20;
+
+struct ParsedMessage {
+  std::shared_ptr<TLIndexableItem> item;
+  bool cut = false;  // some text was too long for the index
+};
+
+// Why a message cannot be made an item.
+struct UnparsableMessage {
+  std::string reason;
+};
+
+// Turns mail into items of the index. The parser bounds the nesting of MIME parts (1024), and all
+// walks over them are loops. One thread.
+class MessageParser {
+ public:
+  MessageParser();
+
+  // The item has
+  //   identifier, domainIdentifier          from the origin
+  //   SUBJECT, X_FROM                       Subject; X-From, else Sender
+  //   AUTHORS, RECIPIENTS, ADDITIONAL_..., HIDDEN_ADDITIONAL_...   From, To, Cc, Bcc
+  //   MAIL_DATE_RECEIVED                    the topmost Received, else Date
+  //   CONTENT_CREATION_DATE                 Date
+  //   TEXT_CONTENT                          all inline text/plain parts, or where they hold no text
+  //   HTML_CONTENT_DATA                     the text/html parts as UTF-8
+  //   ATTACHMENT_NAMES, ATTACHMENT_TYPES, MAIL_MESSAGE_ID, MAILBOXES, MAILBOX_IDENTIFIERS,
+  //   CONTENT_TYPE
+  // and lacks what the message lacks. Dates are seconds since 1970.
+  [[nodiscard]] std::variant<ParsedMessage, UnparsableMessage> parse(std::string_view bytes,
+                                                                     const MessageOrigin& origin);
+
+ private:
+  TextDecoder _decoder;
+};
+
+}  // namespace cli

@@ -1,0 +1,108 @@
+#include "cli/Options.h"
+
+#include <CLI/CLI.hpp>
+#include <array>
+#include <cmath>
+#include <iostream>
+#include <map>
+
+#include "client/Channel.h"
+
+namespace cli {
+
+namespace {
+
+constexpr const char* kVersion = "tallow 0.1.0";
+
+// One command. `operands` is how its arguments are called in the help, null for none.
+struct CommandRow {
+  Command command;
+  const char* name;
+  const char* help;
+  const char* operands;
+  bool operandsRequired;
+};
+
+constexpr std::array<CommandRow, 10> kCommands{{
+    {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
+     "PATH", true},
+    {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
+     "WORDS", true},
+    {Command::explain, "explain", "Search, and show the query record and the scores", "WORDS",
+     true},
+    {Command::remove, "delete", "Delete messages by identifier", "ID", true},
+    {Command::reset, "reset", "Delete everything that is indexed", nullptr, false},
+    {Command::stats, "stats", "Show the statistics of store and index", nullptr, false},
+    {Command::metrics, "metrics", "Show the metrics of the text index", nullptr, false},
+    {Command::ping, "ping", "Ask the daemon whether it is there", "TEXT", false},
+    {Command::vacuum, "vacuum", "Drop what is deleted and compact the index", nullptr, false},
+    {Command::state, "state", "Show the state that a client has stored", nullptr, false},
+}};
+
+const std::map<std::string, OutputFormat> kFormats{
+    {"text", OutputFormat::text}, {"json", OutputFormat::json}, {"files", OutputFormat::files}};
+const std::map<std::string, ColorMode> kColors{
+    {"auto", ColorMode::automatic}, {"always", ColorMode::always}, {"never", ColorMode::never}};
+
+void addGlobalOptions(CLI::App& app, Options& options) {
+  app.set_version_flag("--version", kVersion);
+  app.add_option("--runtime-dir", options.runtimeDirectory, "Directory of the daemon's sockets")
+      ->type_name("DIR");
+  app.add_option("--class", options.protectionClass, "Protection class (default: default)")
+      ->type_name("CLASS");
+  app.add_option("--name", options.name, "Name of this client (default: tallow)")
+      ->type_name("NAME");
+  app.add_option("--format", options.format, "Output: text, json, or for search also files")
+      ->transform(CLI::CheckedTransformer(kFormats).description(""))
+      ->type_name("FORMAT");
+  app.add_option("--limit", options.limit, "Most results of a search, 0 for all (default: 20)")
+      ->check(CLI::NonNegativeNumber.description(""))
+      ->type_name("N");
+  app.add_option("--color", options.color, "Colours: auto, always or never")
+      ->transform(CLI::CheckedTransformer(kColors).description(""))
+      ->type_name("WHEN");
+  app.add_option("--wait", options.waitSeconds, "Wait so long for the daemon to come up")
+      ->check(CLI::Range(0.0, 3600.0).description(""))
+      ->type_name("SECONDS");
+  app.add_flag("-y,--yes", options.yes, "Do not ask before a reset");
+  app.add_flag("-v,--verbose", options.verbose, "Name what was cut or ignored");
+}
+
+void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
+  CLI::App* const sub = app.add_subcommand(row.name, row.help);
+  sub->fallthrough();
+  if (row.operands != nullptr) {
+    CLI::Option* const operands = sub->add_option(row.operands, options.arguments);
+    operands->required(row.operandsRequired)->type_name(" ");
+    if (row.command == Command::ping) operands->expected(0, 1);
+  }
+  sub->callback([&options, command = row.command] { options.command = command; });
+}
+
+}  // namespace
+
+std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitStatus& status) {
+  Options options;
+  CLI::App app("Full-text search of personal mail; a client of tallowsearchd.", "tallow");
+  app.require_subcommand(1);
+  app.failure_message(CLI::FailureMessage::simple);
+  addGlobalOptions(app, options);
+  for (const CommandRow& row : kCommands) addCommand(app, row, options);
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::ParseError& error) {
+    status = app.exit(error) == 0 ? ExitStatus::done : ExitStatus::failure;
+    return std::nullopt;
+  }
+  if (options.format == OutputFormat::files && options.command != Command::search) {
+    std::cerr << "tallow: --format=files is for search only\n";
+    status = ExitStatus::failure;
+    return std::nullopt;
+  }
+  if (options.runtimeDirectory.empty()) {
+    options.runtimeDirectory = client::defaultRuntimeDirectory();
+  }
+  return options;
+}
+
+}  // namespace cli

@@ -1,0 +1,43 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "cli/Terminal.h"
+
+namespace cli {
+
+// What a program ends with.
+enum class ExitStatus : int {
+  done = 0,
+  nothingFound = 1,
+  failure = 2,       // also wrong use
+  unreachable = 75,  // of the daemon
+};
+
+enum class Command { index, search, explain, remove, reset, stats, metrics, ping, vacuum, state };
+enum class OutputFormat { text, json, files };
+
+struct Options {
+  Command command = Command::ping;
+  std::vector<std::string> arguments;  // of the command: paths, words, identifiers or a text
+
+  std::string runtimeDirectory;
+  std::string protectionClass = "default";
+  std::string name = "tallow";
+  OutputFormat format = OutputFormat::text;
+  ColorMode color = ColorMode::automatic;
+  int64_t limit = 20;  // 0 for all
+  double waitSeconds = 0;
+  bool yes = false;
+  bool verbose = false;
+};
+
+// Reads the command line. When the program has nothing more to do, after --help, --version or wrong
+// use, it has been told on the standard output or error, and `status` is what to end with.
+[[nodiscard]] std::optional<Options> parseCommandLine(int argc, const char* const* argv,
+                                                      ExitStatus& status);
+
+}  // namespace cli

@@ -1,0 +1,72 @@
+#include "client/Batches.h"
+
+namespace client {
+
+namespace {
+
+// The length in front of each element, and the padding up to the next.
+constexpr size_t kElementOverhead = 4;
+constexpr size_t kAlignment = 4;
+
+size_t padded(size_t size) {
+  return (size + kAlignment - 1) / kAlignment * kAlignment;
+}
+
+size_t sizeOf(const EncodedItem& item) {
+  return padded(kElementOverhead + item.bytes.size());
+}
+size_t sizeOf(const std::string& text) {
+  return padded(kElementOverhead + text.size() + 1);
+}
+const std::string& nameOf(const EncodedItem& item) {
+  return item.identifier;
+}
+const std::string& nameOf(const std::string& text) {
+  return text;
+}
+
+constexpr size_t kNameLength = 200;
+
+template <typename Element>
+std::optional<std::vector<std::span<const Element>>> split(std::span<const Element> elements,
+                                                           TLErrorOut error, size_t limit) {
+  std::vector<std::span<const Element>> pieces;
+  size_t begin = 0;
+  size_t bytes = 0;
+  for (size_t i = 0; i < elements.size(); ++i) {
+    const size_t size = sizeOf(elements[i]);
+    if (size > limit) {
+      platform::setError(error,
+                         {"com.quill.tallow.client", 1,
+                          fmt::format("{} takes {} bytes, more than the {} that one call can carry",
+                                      nameOf(elements[i]).substr(0, kNameLength), size, limit)});
+      return std::nullopt;
+    }
+    if (bytes + size > limit) {
+      pieces.push_back(elements.subspan(begin, i - begin));
+      begin = i;
+      bytes = 0;
+    }
+    bytes += size;
+  }
+  if (begin < elements.size()) pieces.push_back(elements.subspan(begin));
+  return pieces;
+}
+
+}  // namespace
+
+EncodedItem encode(const TLIndexableItem& item) {
+  return {platform::toUTF8(platform::orEmpty(item.identifier())), item.data()};
+}
+
+std::optional<std::vector<std::span<const EncodedItem>>> splitItems(
+    std::span<const EncodedItem> items, TLErrorOut error, size_t limit) {
+  return split(items, error, limit);
+}
+
+std::optional<std::vector<std::span<const std::string>>> splitTexts(
+    std::span<const std::string> texts, TLErrorOut error, size_t limit) {
+  return split(texts, error, limit);
+}
+
+}  // namespace client

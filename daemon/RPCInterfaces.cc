@@ -1,0 +1,213 @@
+#include "daemon/RPCInterfaces.h"
+
+#include <utility>
+
+using platform::RPCArguments;
+using platform::RPCInterface;
+using platform::RPCValues;
+using Reply = std::shared_ptr<platform::RPCReply>;
+
+namespace {
+
+// Decodes the items of a call; refuses the call and gives none when one does not parse.
+std::optional<TALSearchService::Items> readItems(RPCArguments& arguments, const Reply& reply) {
+  const auto encoded = arguments.readBytesArray();
+  TALSearchService::Items items;
+  items.reserve(encoded.size());
+  for (size_t i = 0; i < encoded.size(); ++i) {
+    auto item = std::make_shared<TLIndexableItem>();
+    if (!item->initWithData(encoded[i])) {
+      reply->sendFailure(
+          platform::kRPCInvalidArgs,
+          fmt::format("argument 0 (items), index {}: the bytes are no TLIndexableItem", i));
+      return std::nullopt;
+    }
+    items.push_back(std::move(item));
+  }
+  return items;
+}
+
+TALSearchService::Strings readStrings(RPCArguments& arguments) {
+  TALSearchService::Strings strings;
+  for (const std::string_view text : arguments.readStringArray()) {
+    strings.push_back(platform::fromUTF8(text));
+  }
+  return strings;
+}
+
+TLErrorReply replyWithError(const Reply& reply) {
+  return [reply](const std::optional<TLError>& error) {
+    if (error) {
+      reply->sendError(*error);
+    } else {
+      reply->send({});
+    }
+  };
+}
+
+void indexItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  auto items = readItems(arguments, reply);
+  if (!items) return;
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.indexItems(std::move(*items), name, protectionClass, replyWithError(reply));
+}
+
+void deleteItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  auto identifiers = readStrings(arguments);
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.deleteItemsWithIdentifiers(std::move(identifiers), name, protectionClass,
+                                     replyWithError(reply));
+}
+
+void indexAndDeleteItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  auto items = readItems(arguments, reply);
+  if (!items) return;
+  auto identifiers = readStrings(arguments);
+  const bool stateGiven = arguments.readBoolean();
+  const std::string_view bytes = arguments.readBytes();
+  std::optional<std::string> state;
+  if (stateGiven) state = std::string(bytes);
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.indexItems(std::move(*items), std::move(identifiers), std::move(state), name,
+                     protectionClass, replyWithError(reply));
+}
+
+void fetchState(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.fetchLastClientStateFromIndexerNamed(
+      name, protectionClass,
+      [reply](const std::optional<std::string>& state, const std::optional<TLError>& error) {
+        if (error) return reply->sendError(*error);
+        reply->send({state.has_value(), platform::RPCBytes{state.value_or("")}});
+      });
+}
+
+void deleteDomains(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  auto domains = readStrings(arguments);
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.deleteItemsWithDomainIdentifiers(std::move(domains), name, protectionClass,
+                                           replyWithError(reply));
+}
+
+void deleteAll(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.deleteAllItemsFromIndexerNamed(name, protectionClass, replyWithError(reply));
+}
+
+void searchItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  TLQuery query;
+  if (!query.initWithData(arguments.readBytes())) {
+    reply->sendFailure(platform::kRPCInvalidArgs, "argument 0 (query): the bytes are no TLQuery");
+    return;
+  }
+  const uint64_t options = arguments.readUInt64();
+  const std::string protectionClass(arguments.readString());
+  const int64_t maxResults = arguments.readInt64();
+  service.searchItemsForQuery(query, options, protectionClass, maxResults,
+                              [&reply](const std::optional<TALSearchService::Items>& items,
+                                       const std::optional<TLError>& error) {
+                                if (error) return reply->sendError(*error);
+                                platform::RPCBytesArray encoded;
+                                encoded.reserve(items->size());
+                                for (const auto& item : *items) encoded.push_back(item->data());
+                                reply->send({std::move(encoded)});
+                              });
+}
+
+void ping(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  service.ping(std::string(arguments.readString()),
+               [&reply](const std::string& text) { reply->send({text}); });
+}
+
+platform::RPCDictionary toDictionary(const nlohmann::json& stats) {
+  platform::RPCDictionary dictionary;
+  if (!stats.is_object()) return dictionary;
+  for (const auto& [key, value] : stats.items()) {
+    if (value.is_number_float()) {
+      dictionary.emplace_back(key, value.get<double>());
+    } else if (value.is_number_unsigned()) {
+      dictionary.emplace_back(key, value.get<uint64_t>());
+    } else {
+      dictionary.emplace_back(key, value.get<int64_t>());
+    }
+  }
+  return dictionary;
+}
+
+void fetchIndexerStats(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.fetchStatsForIndexerNamed(
+      name, protectionClass,
+      [&reply](const nlohmann::json& stats, const std::optional<TLError>& error) {
+        if (error) return reply->sendError(*error);
+        reply->send({toDictionary(stats)});
+      });
+}
+
+void fetchSaltStats(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  const std::string name(arguments.readString());
+  const std::string protectionClass(arguments.readString());
+  service.fetchStatsForSaltNamed(
+      name, protectionClass,
+      [&reply](const std::optional<std::string>& text, const std::optional<TLError>& error) {
+        if (error) return reply->sendError(*error);
+        reply->send({text.value_or("")});
+      });
+}
+
+void forceVacuum(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+  service.forceVacuumAndCompactForProtectionClass(std::string(arguments.readString()),
+                                                  replyWithError(reply));
+}
+
+using Operation = void (*)(TALSearchService&, RPCArguments&, const Reply&);
+
+platform::RPCMethod method(TALSearchService& service, const char* member, const char* input,
+                           const char* output, std::vector<const char*> names,
+                           Operation operation) {
+  return {member, input, output, std::move(names),
+          [&service, operation](RPCArguments& arguments, Reply reply) {
+            operation(service, arguments, reply);
+          }};
+}
+
+}  // namespace
+
+RPCInterface makeSearchServiceProtocol(TALSearchService& service) {
+  return {{
+      method(service, "IndexItems", "aayss", "", {"items", "toIndexerNamed", "protectionClass"},
+             indexItems),
+      method(service, "DeleteItemsWithIdentifiers", "asss", "",
+             {"identifiers", "fromIndexerNamed", "protectionClass"}, deleteItems),
+      method(service, "IndexItemsDeleteItemsWithIdentifiers", "aayasbayss", "",
+             {"items", "deleteItemsWithIdentifiers", "clientStateGiven", "clientState",
+              "toIndexerNamed", "protectionClass"},
+             indexAndDeleteItems),
+      method(service, "FetchLastClientState", "ss", "bay",
+             {"fromIndexerNamed", "protectionClass", "present", "clientState"}, fetchState),
+      method(service, "DeleteItemsWithDomainIdentifiers", "asss", "",
+             {"domainIdentifiers", "fromIndexerNamed", "protectionClass"}, deleteDomains),
+      method(service, "DeleteAllItems", "ss", "", {"fromIndexerNamed", "protectionClass"},
+             deleteAll),
+      method(service, "SearchItemsForQuery", "aytsx", "aay",
+             {"query", "options", "protectionClass", "maxResults", "items"}, searchItems),
+  }};
+}
+
+RPCInterface makeDebugServiceProtocol(TALSearchService& service) {
+  return {{
+      method(service, "Ping", "s", "s", {"input", "reply"}, ping),
+      method(service, "FetchStatsForIndexer", "ss", "a{sv}",
+             {"indexerNamed", "protectionClass", "statistics"}, fetchIndexerStats),
+      method(service, "FetchStatsForSalt", "ss", "s", {"saltNamed", "protectionClass", "metrics"},
+             fetchSaltStats),
+      method(service, "ForceVacuumAndCompact", "s", "", {"protectionClass"}, forceVacuum),
+  }};
+}

@@ -1,0 +1,79 @@
+#include "daemon/TALDaemon.h"
+
+#include "platform/Files.h"
+#include "platform/Paths.h"
+
+namespace {
+
+constexpr uint64_t kFarewellMilliseconds = 2000;
+
+}  // namespace
+
+const platform::Log& TALDaemon::log() {
+  static const platform::Log handle(platform::kSubsystem, "TALDaemon");
+  return handle;
+}
+
+TALDaemon* TALDaemon::sharedInstance() {
+  static const std::unique_ptr<TALDaemon> instance =
+      init(platform::mainRunLoop(), platform::dataRoot(), platform::runtimeDirectory());
+  return instance.get();
+}
+
+std::unique_ptr<TALDaemon> TALDaemon::init(platform::RunLoop& loop, const std::string& path,
+                                           const std::string& runtimeDirectory) {
+  log().standard("Initializing daemon");
+  std::optional<TLError> error;
+  if (!platform::createDirectories(path, &error)) {
+    log().fault("Could not create tallow directory: {}", platform::printable(error));
+    return nullptr;
+  }
+  return std::unique_ptr<TALDaemon>(new TALDaemon(loop, path, runtimeDirectory));
+}
+
+TALDaemon::TALDaemon(platform::RunLoop& loop, const std::string& path,
+                     const std::string& runtimeDirectory)
+    : _searchService(std::make_unique<TALSearchService>(std::make_shared<TALIndexerManager>(path))),
+      _searchServiceProtocol(makeSearchServiceProtocol(*_searchService)),
+      _debugServiceProtocol(makeDebugServiceProtocol(*_searchService)),
+      _searchServiceListener(platform::makeRPCListener(loop, runtimeDirectory, kSearchServiceName)),
+      _debugServiceListener(platform::makeRPCListener(loop, runtimeDirectory, kDebugServiceName)) {
+  const auto delegate = [this](platform::RPCListener& from, platform::RPCConnection& connection) {
+    return listener(from, connection);
+  };
+  _searchServiceListener->setDelegate(delegate);
+  _debugServiceListener->setDelegate(delegate);
+}
+
+TALDaemon::~TALDaemon() = default;
+
+bool TALDaemon::listener(platform::RPCListener&, platform::RPCConnection& connection) {
+  log().standard("accept new connection: {}", connection.description());
+  if (connection.serviceName() == kSearchServiceName) {
+    connection.setExportedInterface(&_searchServiceProtocol);
+    return true;
+  }
+  if (connection.serviceName() == kDebugServiceName) {
+    connection.setExportedInterface(&_debugServiceProtocol);
+    return true;
+  }
+  return false;
+}
+
+bool TALDaemon::run(TLErrorOut error) {
+  if (_running) return true;
+  _running = true;
+  log().standard("Resuming listeners");
+  return _searchServiceListener->resume(error) && _debugServiceListener->resume(error);
+}
+
+void TALDaemon::shutdown() {
+  log().standard("Starting shutdown...");
+  _searchService->shutdown();
+  log().standard("Shutting down.");
+}
+
+void TALDaemon::invalidate() {
+  _searchServiceListener->invalidate(kFarewellMilliseconds);
+  _debugServiceListener->invalidate(kFarewellMilliseconds);
+}

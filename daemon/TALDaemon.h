@@ -1,0 +1,54 @@
+#pragma once
+
+#include <memory>
+
+#include "daemon/RPCInterfaces.h"
+#include "daemon/TALSearchService.h"
+#include "platform/Log.h"
+#include "platform/RPC.h"
+#include "platform/RunLoop.h"
+
+// The one service object of the process and the two listeners that export it.
+//
+// Threads: all operations belong to the main thread; requests arrive on the threads of the
+// connections.
+class TALDaemon {
+ public:
+  // Makes the daemon once. Null, with a fault in the log, when the data root cannot be created.
+  static TALDaemon* sharedInstance();
+
+  // Null when the data root `path` cannot be created. Sockets lie in `runtimeDirectory`.
+  [[nodiscard]] static std::unique_ptr<TALDaemon> init(platform::RunLoop& loop,
+                                                       const std::string& path,
+                                                       const std::string& runtimeDirectory);
+  ~TALDaemon();
+
+  [[nodiscard]] TALSearchService& searchService() { return *_searchService; }
+  [[nodiscard]] platform::RPCListener& searchServiceListener() { return *_searchServiceListener; }
+  [[nodiscard]] platform::RPCListener& debugServiceListener() { return *_debugServiceListener; }
+
+  // Which interface a connection gets is decided by the service name alone.
+  [[nodiscard]] bool listener(platform::RPCListener& listener,
+                              platform::RPCConnection& shouldAcceptNewConnection);
+
+  // Resumes the listeners; once, later calls do nothing. False when a socket cannot be had.
+  bool run(TLErrorOut error);
+
+  // Shuts every indexer down. Blocks until their queues have drained.
+  void shutdown();
+
+  // Lets what is ready go out to the clients, for a bounded time, and ends the connections.
+  void invalidate();
+
+  static const platform::Log& log();
+
+ private:
+  TALDaemon(platform::RunLoop& loop, const std::string& path, const std::string& runtimeDirectory);
+
+  std::unique_ptr<TALSearchService> _searchService;
+  platform::RPCInterface _searchServiceProtocol;
+  platform::RPCInterface _debugServiceProtocol;
+  std::unique_ptr<platform::RPCListener> _searchServiceListener;
+  std::unique_ptr<platform::RPCListener> _debugServiceListener;
+  bool _running = false;
+};

@@ -1,0 +1,115 @@
+#include "daemon/TALIndexerManager.h"
+
+#include <cerrno>
+#include <utility>
+
+#include "daemon/TLDeviceLockMonitor.h"
+#include "docstore/TALSqliteDocStore.h"
+#include "platform/Files.h"
+#include "platform/Paths.h"
+
+namespace {
+
+constexpr int kIndexerUnavailable = -2;
+constexpr size_t kLongestName = 255;  // bytes, of the file system
+
+bool namesOneDirectory(const std::string& name) {
+  return !name.empty() && name != "." && name != ".." && name.size() <= kLongestName &&
+         name.find('/') == std::string::npos && name.find('\0') == std::string::npos;
+}
+
+bool createClassDirectory(const std::string& root, const std::string& protectionClass,
+                          TLErrorOut error) {
+  if (!namesOneDirectory(protectionClass)) {
+    platform::setError(
+        error, platform::posixError(protectionClass.size() > kLongestName ? ENAMETOOLONG : EINVAL,
+                                    "a protection class must name one directory"));
+    return false;
+  }
+  return platform::createDirectories(platform::joinPath(root, protectionClass), error,
+                                     protectionClass);
+}
+
+}  // namespace
+
+const platform::Log& TALIndexerManager::log() {
+  static const platform::Log handle(platform::kSubsystem, "TALIndexerManager");
+  return handle;
+}
+
+TLError TALIndexerManager::indexerUnavailableError() {
+  return {"com.quill.tallow.TALIndexerManager", kIndexerUnavailable, "Indexer unavailable."};
+}
+
+TALIndexerManager::TALIndexerManager(std::string path)
+    : TALIndexerManager(std::move(path), [] {
+        return LockState{TLDeviceUnlockedSinceBoot(), TLProtectedDataAvailable()};
+      }) {}
+
+TALIndexerManager::TALIndexerManager(std::string path, LockStateSource lockState)
+    : _path(std::move(path)),
+      _lockState(std::move(lockState)),
+      _indexersQueue("com.quill.tallow.IndexerManager", platform::QueuePriority::background) {}
+
+std::vector<std::shared_ptr<TALIndexer>> TALIndexerManager::allIndexers() {
+  std::vector<std::shared_ptr<TALIndexer>> all;
+  _indexersQueue.sync([&] {
+    for (const auto& [protectionClass, indexer] : _indexers) all.push_back(indexer);
+  });
+  return all;
+}
+
+std::shared_ptr<TALIndexer> TALIndexerManager::indexerWithProtectionClass(
+    const std::string& protectionClass, TLErrorOut error) {
+  const LockState lock = _lockState();
+  if (!lock.unlockedSinceBoot) {
+    log().error("Not providing a requested {} indexer prior to first unlock.", protectionClass);
+    platform::setError(error, indexerUnavailableError());
+    return nullptr;
+  }
+  if (protectionClass == SysFileProtectionComplete && !lock.protectedDataAvailable) {
+    log().error(
+        "Not providing an SysFileProtectionComplete indexer without protected data available.");
+    platform::setError(error, indexerUnavailableError());
+    return nullptr;
+  }
+  std::shared_ptr<TALIndexer> indexer;
+  _indexersQueue.sync([&] {
+    const auto entry = _indexers.find(protectionClass);
+    if (entry != _indexers.end()) {
+      indexer = entry->second;
+      return;
+    }
+    log().standard(
+        "No existing indexer with type {}. Attempting to create a new one with "
+        "DeviceUnlockedSinceBoot={}, ProtectedDataAvailable={}.",
+        protectionClass, platform::yesNo(lock.unlockedSinceBoot),
+        platform::yesNo(lock.protectedDataAvailable));
+    indexer = _createIndexerWithProtectionType(protectionClass, error);
+    if (indexer != nullptr) _indexers.emplace(protectionClass, indexer);
+  });
+  return indexer;
+}
+
+std::shared_ptr<TALIndexer> TALIndexerManager::_createIndexerWithProtectionType(
+    const std::string& protectionClass, TLErrorOut error) {
+  std::optional<TLError> failure;
+  if (!createClassDirectory(_path, protectionClass, &failure)) {
+    log().fault("Could not create {} protected directory: {}", protectionClass,
+                platform::printable(failure));
+    platform::setError(error, *failure);
+    return nullptr;
+  }
+  const std::string directory = platform::joinPath(_path, protectionClass);
+  const std::string docStorePath = platform::joinPath(directory, "docstore/docstore.db");
+  auto docStore = std::make_shared<TALSqliteDocStore>(docStorePath);
+  if (!docStore->openWithError(&failure)) {
+    log().error("Could not create doc store in {}: {}", docStorePath, platform::printable(failure));
+    platform::setError(error, failure.value_or(indexerUnavailableError()));
+    return nullptr;
+  }
+  const std::string saltPath = platform::joinPath(directory, "salt");
+  log().standard("Creating indexer saltPath={} docStorePath: {} synonymPath: {}", saltPath,
+                 docStorePath, platform::synonymFilePath());
+  return std::make_shared<TALIndexer>(saltPath, protectionClass, std::move(docStore));
+}

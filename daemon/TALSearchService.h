@@ -1,0 +1,99 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <nlohmann/json.hpp>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "daemon/TALIndexerManager.h"
+#include "platform/Log.h"
+#include "platform/Mutex.h"
+#include "records/TLQuery.h"
+
+using TLErrorReply = std::function<void(const std::optional<TLError>&)>;
+
+// The object behind both RPC services. For each request it turns the protection class into an
+// indexer, calls that, and delivers the outcome through the reply. It makes no errors of its own.
+//
+// The name that clients give selects no indexer: it stands in the log, and is the client state's
+// name. A query that only asks whether messages with given subjects are there (an OR of at least
+// five equal comparisons of the subject) is answered by exact comparison.
+//
+// Threads: every operation runs on the caller's thread, and several may run at once. Item
+// operations return at once and reply from the indexer's queue; searches and statistics reply
+// before they return. After `shutdown` a request gets no indexer, and its reply is not called.
+class TALSearchService {
+ public:
+  using Items = TALIndexer::Items;
+  using Strings = TALIndexer::Strings;
+
+  explicit TALSearchService(std::shared_ptr<TALIndexerManager> indexerManager);
+
+  // The search service.
+  void indexItems(Items items, const std::string& toIndexerNamed,
+                  const std::string& protectionClass, TLErrorReply reply);
+  void deleteItemsWithIdentifiers(Strings identifiers, const std::string& fromIndexerNamed,
+                                  const std::string& protectionClass, TLErrorReply reply);
+  void indexItems(Items items, Strings deleteItemsWithIdentifiers,
+                  std::optional<std::string> clientState, const std::string& toIndexerNamed,
+                  const std::string& protectionClass, TLErrorReply reply);
+  void fetchLastClientStateFromIndexerNamed(
+      const std::string& name, const std::string& protectionClass,
+      const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>&
+          reply);
+  void deleteItemsWithDomainIdentifiers(Strings domainIdentifiers,
+                                        const std::string& fromIndexerNamed,
+                                        const std::string& protectionClass, TLErrorReply reply);
+  void deleteAllItemsFromIndexerNamed(const std::string& name, const std::string& protectionClass,
+                                      TLErrorReply reply);
+  // The items are null only beside an error. The query is changed: it gets its resolved parameters.
+  // `maxResults` is compared as unsigned, so that a negative one truncates nothing.
+  void searchItemsForQuery(
+      TLQuery& query, uint64_t withOption, const std::string& forProtectionClass,
+      int64_t maxResults,
+      const std::function<void(const std::optional<Items>&, const std::optional<TLError>&)>& reply);
+
+  // The debug service.
+  void ping(const std::string& input, const std::function<void(const std::string&)>& reply);
+  void fetchStatsForIndexerNamed(
+      const std::string& name, const std::string& protectionClass,
+      const std::function<void(const nlohmann::json&, const std::optional<TLError>&)>& reply);
+  void fetchStatsForSaltNamed(const std::string& name, const std::string& protectionClass,
+                              const std::function<void(const std::optional<std::string>&,
+                                                       const std::optional<TLError>&)>& reply);
+  void forceVacuumAndCompactForProtectionClass(const std::string& protectionClass,
+                                               TLErrorReply reply);
+
+  // Shuts every indexer down in turn, and waits for each.
+  void shutdown();
+
+  // "<empty>" for an empty text, so that no log line shows an empty field.
+  [[nodiscard]] static std::string cleanName(const std::string& name);
+  [[nodiscard]] static std::string cleanProtectionClass(const std::string& protectionClass);
+  [[nodiscard]] static std::string _searchDescriptionWithOptions(uint64_t options,
+                                                                 int64_t maxResults);
+
+  [[nodiscard]] static bool isMailVerificationQuery(const TLQuery* query);
+  // The subjects of a verification query's text, in order.
+  [[nodiscard]] static Strings subjectsFromRawQuery(TLStringView rawQuery);
+  // Undoes the escapes one kind after the other, each over the result of the one before.
+  [[nodiscard]] static TLString _stringFromEscapedString(TLString text);
+
+  static const platform::Log& log();
+
+ private:
+  // Null without an error after `shutdown`.
+  std::shared_ptr<TALIndexer> indexerFor(const std::string& protectionClass, TLErrorOut error);
+  // The shape that the four item operations share.
+  void runItemOperation(const std::string& description, const std::string& protectionClass,
+                        TLErrorReply reply,
+                        const std::function<void(TALIndexer&, TALIndexer::Completion)>& operation);
+  std::optional<Items> handleVerificationQueryWithIndexer(TALIndexer& indexer, TLQuery& query,
+                                                          const Strings& subjects,
+                                                          TLErrorOut error);
+
+  mutable platform::Mutex _mutex;
+  std::shared_ptr<TALIndexerManager> _indexerManager TL_GUARDED_BY(_mutex);
+};

@@ -1,0 +1,65 @@
+#pragma once
+
+#include <atomic>
+#include <memory>
+
+#include "platform/DeviceVault.h"
+#include "platform/Log.h"
+#include "platform/Mutex.h"
+#include "platform/Queue.h"
+
+// Called when the state of the device changes.
+class TLDeviceLockObserver {
+ public:
+  virtual ~TLDeviceLockObserver() = default;
+  virtual void protectedDataDidBecomeAvailable() = 0;
+  virtual void protectedDataWillBecomeUnavailable() = 0;
+  virtual void protectedDataDidBecomeUnavailable() = 0;
+};
+
+// Knows whether the device has been unlocked at least once since boot, and whether protected data
+// can be read now.
+//
+// Threads: the two facts are read from any thread, without a lock, and may lag by one notification.
+// They are written on the monitor's own queue. The observer is called there, or on the queue given
+// with it.
+class TLDeviceLockMonitor {
+ public:
+  static TLDeviceLockMonitor& sharedInstance();
+
+  // The vault must outlive the monitor.
+  explicit TLDeviceLockMonitor(DeviceVault& vault);
+  ~TLDeviceLockMonitor();
+  TLDeviceLockMonitor(const TLDeviceLockMonitor&) = delete;
+  TLDeviceLockMonitor& operator=(const TLDeviceLockMonitor&) = delete;
+
+  // Turns true once and stays.
+  [[nodiscard]] bool deviceUnlockedSinceBoot() const { return _deviceUnlockedSinceBoot; }
+  [[nodiscard]] bool protectedDataAvailable() const { return _protectedDataAvailable; }
+
+  // Both are held weakly. Not from the monitor's queue.
+  void setDelegate(const std::shared_ptr<TLDeviceLockObserver>& delegate,
+                   const std::shared_ptr<platform::SerialQueue>& delegateQueue);
+
+  static const platform::Log& log();
+
+ private:
+  using Call = void (TLDeviceLockObserver::*)();
+
+  void _deviceLockSetupNotification();
+  void lockStateChanged();
+  void notifyDelegate(Call call, bool readDelegateAgain);
+
+  DeviceVault& _vault;
+  int32_t _lockStateNotifyToken = -1;
+  std::atomic<bool> _deviceUnlockedSinceBoot;
+  std::atomic<bool> _protectedDataAvailable{false};
+  // Of the queue's thread.
+  std::weak_ptr<TLDeviceLockObserver> _delegate;
+  std::weak_ptr<platform::SerialQueue> _delegateQueue;
+  platform::SerialQueue _dispatchQueue;  // last, so that it ends before what its items use
+};
+
+// The facts of the shared monitor; the first call makes it.
+[[nodiscard]] bool TLDeviceUnlockedSinceBoot();
+[[nodiscard]] bool TLProtectedDataAvailable();

@@ -1,0 +1,88 @@
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <systemd/sd-daemon.h>
+
+#include <array>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+
+#include "daemon/TALDaemon.h"
+#include "daemon/TLDeviceLockMonitor.h"
+#include "platform/Files.h"
+#include "platform/Paths.h"
+#include "platform/ProcessLock.h"
+#include "platform/Queue.h"
+#include "platform/StateCapture.h"
+
+namespace {
+
+constexpr std::array<int, 3> kEndingSignals{SIGHUP, SIGPIPE, SIGTERM};
+constexpr int kCaptureSignal = SIGUSR1;
+constexpr mode_t kPrivateUmask = 0077;
+
+const platform::Log& log() {
+  static const platform::Log handle(platform::kSubsystem, "main");
+  return handle;
+}
+
+// Each protection class may hold a thousand table files open.
+void raiseDescriptorLimit() {
+  rlimit limit;
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+void handleEndingSignal(int signal) {
+  log().standard("Received signal {}.", strsignal(signal));
+  sd_notify(0, "STOPPING=1");
+  if (TALDaemon* daemon = TALDaemon::sharedInstance()) daemon->shutdown();
+  log().standard("Stopping main run loop.");
+  platform::mainRunLoop().stop();
+}
+
+int fail(const std::optional<TLError>& error) {
+  std::fprintf(stderr, "tallowsearchd: %s\n", error ? error->message.c_str() : "could not start");
+  return 1;
+}
+
+}  // namespace
+
+int main() {
+  umask(kPrivateUmask);
+  raiseDescriptorLimit();
+  // Before any thread starts, so that all threads inherit it.
+  for (const int signal : kEndingSignals) platform::takeSignalFromProcess(signal);
+  platform::takeSignalFromProcess(kCaptureSignal);
+
+  std::optional<TLError> error;
+  if (!platform::createDirectories(platform::runtimeDirectory(), &error)) return fail(error);
+  log().standard("Starting main with UnlockedSinceBoot:{}, ProtectedDataAvailable:{}",
+                 platform::yesNo(TLDeviceUnlockedSinceBoot()),
+                 platform::yesNo(TLProtectedDataAvailable()));
+
+  platform::RunLoop& loop = platform::mainRunLoop();
+  std::array<std::unique_ptr<platform::RunLoop::Source>, kEndingSignals.size()> sources;
+  for (size_t i = 0; i < kEndingSignals.size(); ++i) {
+    sources[i] = loop.addSignal(kEndingSignals[i], handleEndingSignal);
+  }
+  platform::SerialQueue captureQueue("com.quill.tallow.capture");
+  auto captureSource = loop.addSignal(
+      kCaptureSignal, [&captureQueue](int) { captureQueue.async(platform::logCapturedState); });
+
+  const auto lock = platform::ProcessLock::acquire(
+      platform::joinPath(platform::stateDirectory(), "tallowsearchd.lock"), &error);
+  TALDaemon* daemon = TALDaemon::sharedInstance();
+  if (daemon != nullptr) {
+    if (lock == nullptr || !daemon->run(&error)) return fail(error);
+    sd_notify(0, "READY=1");
+  }
+  log().standard("Starting run loop");
+  loop.run();
+
+  for (auto& source : sources) source.reset();
+  captureSource.reset();
+  if (daemon != nullptr) daemon->invalidate();
+  return 0;
+}

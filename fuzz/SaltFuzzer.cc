@@ -1,0 +1,124 @@
+#include <algorithm>
+#include <filesystem>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Assert.h"
+#include "salt/Coding.h"
+#include "salt/IndexImpl.h"
+#include "salt/Suffix.h"
+
+// Any text and any numbers: the cut of suffixes against a loop that follows the rule byte by byte,
+// keys and pages there and back, and the walk of a page against the texts it was made from.
+namespace {
+
+std::string slowCut(std::string_view text, const salt::Index::OptionsBlock& op) {
+  std::string cut;
+  for (size_t i = 0; i < text.size() && i < op.MaxMatchLen && text[i] != '\0'; ++i) {
+    cut += text[i];
+    if (text[i] == ' ' && i >= op.MinMatchLen) break;
+  }
+  return cut;
+}
+
+struct Entry {
+  std::string text;
+  salt::SuffixMeta meta;
+};
+
+// Sorted suffixes of the text, numbers taken from its bytes.
+std::vector<Entry> entriesOf(std::string_view text, const salt::Index::OptionsBlock& op) {
+  std::vector<Entry> entries;
+  for (size_t i = 0; i < text.size() && entries.size() < op.MaxPageSuffixes; ++i) {
+    const std::string cut = slowCut(text.substr(i), op);
+    TL_ASSERT(cut == text.substr(i, salt::suffixLength(text.substr(i), op)));
+    const auto byte = static_cast<uint8_t>(text[i]);
+    entries.push_back({cut,
+                       {1 + (uint32_t{byte} << byte % 24),
+                        static_cast<uint32_t>(i << byte % 20),
+                        static_cast<uint16_t>(byte << byte % 9),
+                        0,
+                        {0, 0}}});
+  }
+  std::sort(entries.begin(), entries.end(), [](const Entry& a, const Entry& b) {
+    return a.text < b.text || (a.text == b.text && a.meta < b.meta);
+  });
+  for (size_t n = 1; n < entries.size(); ++n) {
+    const std::string& before = entries[n - 1].text;
+    Entry& entry = entries[n];
+    size_t lcp = 0;
+    while (lcp < before.size() && lcp < entry.text.size() && before[lcp] == entry.text[lcp]) ++lcp;
+    entry.meta.lcp = static_cast<uint8_t>(lcp);
+    for (size_t i = 0; i < 2 && lcp + i < entry.text.size(); ++i) {
+      entry.meta.extra[i] = static_cast<uint8_t>(entry.text[lcp + i]);
+    }
+  }
+  return entries;
+}
+
+bool samePlace(const salt::SuffixMeta& a, const salt::SuffixMeta& b) {
+  return a.DocID == b.DocID && a.ZoneID == b.ZoneID && a.Offset == b.Offset;
+}
+
+std::vector<salt::SuffixMeta> throughPage(const std::vector<Entry>& entries,
+                                          const salt::Index::OptionsBlock& op) {
+  std::vector<salt::SuffixMeta> metas;
+  for (const Entry& entry : entries) metas.push_back(entry.meta);
+  std::string value;
+  salt::pageToValue(metas.data(), metas.size(), &value);
+  std::vector<salt::SuffixMeta> decoded;
+  salt::valueToPage(value, op, &decoded);
+  TL_ASSERT(decoded.size() == metas.size());
+  for (size_t i = 0; i < metas.size(); ++i) {
+    TL_ASSERT(samePlace(decoded[i], metas[i]));
+    TL_ASSERT(std::string(decoded[i]) == std::string(metas[i]));
+  }
+  return decoded;
+}
+
+void walkPage(const salt::index& idx, const std::vector<Entry>& entries) {
+  if (entries.empty()) return;
+  const auto metas = throughPage(entries, idx.op);
+  salt::Suffix suffix(idx, {});
+  std::string key;
+  for (const Entry& entry : entries) {
+    salt::suffixKey(1, entry.text, entry.meta, &key);
+    suffix.fromKey(key);
+    TL_ASSERT(suffix.knownText() == entry.text && samePlace(suffix.meta, entry.meta));
+  }
+  salt::suffixKey(1, entries.front().text, entries.front().meta, &key);
+  suffix.fromKey(key);
+  for (size_t i = 1; i < entries.size(); ++i) {
+    suffix.fromNextMeta(metas[i]);
+    const std::string& text = entries[i].text;
+    TL_ASSERT(text.compare(0, suffix.size, suffix.knownText()) == 0);
+    TL_ASSERT(!suffix.full || suffix.size == text.size());
+  }
+}
+
+// An empty index that lends its options; its directory stands for the run.
+const salt::index& sharedIndex() {
+  static const std::unique_ptr<salt::Index> shared = [] {
+    std::string path = std::filesystem::temp_directory_path() / "salt-fuzz-XXXXXX";
+    TL_ASSERT(mkdtemp(path.data()) != nullptr);
+    salt::Index::Options options;
+    options.Path = path;
+    return std::unique_ptr<salt::Index>(salt::NewIndex(options));
+  }();
+  return static_cast<const salt::index&>(*shared);
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  const std::string_view text(reinterpret_cast<const char*>(data), size);
+  walkPage(sharedIndex(), entriesOf(text, sharedIndex().op));
+  if (size < 2) return 0;
+  salt::Index::OptionsBlock op;
+  op.MaxMatchLen = data[0];
+  op.MinMatchLen = static_cast<uint8_t>(data[1] % (op.MaxMatchLen + 1));
+  throughPage(entriesOf(text, op), op);
+  return 0;
+}

@@ -1,0 +1,357 @@
+#include "indexer/TALIndexer.h"
+
+#include <utility>
+
+#include "platform/Clock.h"
+#include "platform/Files.h"
+#include "platform/Paths.h"
+#include "platform/Signpost.h"
+#include "platform/StateCapture.h"
+#include "tokenizer/TLLexemonAssetManager.h"
+
+using platform::MutexLock;
+using platform::Signpost;
+
+namespace {
+
+constexpr const char* kQueueName = "com.quill.tallow.indexer.queue";
+constexpr const char* kClientStateKey = "clientstate";
+
+salt::Index::Options newIndexOptions(const std::string& path) {
+  salt::Index::Options options;
+  options.ValidateOnLoad = false;
+  options.MinMatchLen = 32;
+  options.MaxMatchLen = 100;
+  options.MaxZoneSize = 200000;
+  options.MaxPageSuffixes = 50;
+  options.MaxShardSuffixes = 1000000;
+  options.MaxShards = 16;
+  options.MaxHotSuffixes = 500000;
+  options.CompactAfterVacuum = false;
+  options.ThrottleFactor = 0;
+  options.MaxBatchBytes = 1000000;
+  options.Path = path;
+  return options;
+}
+
+uint64_t zoneCount(const salt::Index::Metrics& metrics, TLAttributeKey key) {
+  const auto entry = metrics.ZoneCounts.find(static_cast<uint16_t>(key));
+  return entry == metrics.ZoneCounts.end() ? 0 : entry->second;
+}
+
+}  // namespace
+
+const platform::Log& TALIndexer::log() {
+  static const platform::Log handle(platform::kSubsystem, "TALIndexer");
+  return handle;
+}
+
+TALIndexer::TALIndexer(std::string path, const std::string& protectionClass,
+                       std::shared_ptr<TALDocStore> docStore)
+    : _path(std::move(path)), _docStore(std::move(docStore)), _queue(kQueueName) {
+  {
+    MutexLock lock(_indexMutex);
+    _init();
+  }
+  _logStateCaptureCancellationBlock =
+      TLLogRegisterStateCaptureBlock(_queue, protectionClass + " index stats", [this] {
+        const nlohmann::json stats = docStats();
+        const auto value = [&stats](const char* key) {
+          return stats.is_null() ? nlohmann::json(0) : stats.at(key);
+        };
+        return nlohmann::json{{"DocStoreNumItems", value("TLDebugServiceDocStoreNumOfItems")},
+                              {"SaltNumItems", value("TLDebugServiceTextStoreNumOfItems")}};
+      });
+}
+
+TALIndexer::~TALIndexer() {
+  _logStateCaptureCancellationBlock();
+}
+
+std::shared_ptr<TALDocStore> TALIndexer::docStore() const {
+  MutexLock lock(_docStoreMutex);
+  return _docStore;
+}
+
+void TALIndexer::setTextStore(std::unique_ptr<salt::Index> index) {
+  MutexLock lock(_textStoreMutex);
+  _textStore = std::move(index);
+}
+
+// Each step makes only what is missing, so that after a reset the zone manager, tokenizer and query
+// processor stay.
+void TALIndexer::_init() {
+  const uint64_t start = platform::monotonicTicks();
+  makeQueryObjects();
+  log().standard("Initializing text store from path: {} ...", _path);
+  if (_path.empty()) {
+    log().fault("No path specified for index.");
+  } else {
+    std::optional<TLError> error;
+    const int64_t stored = docStore() == nullptr ? 0 : docStore()->count(&error);
+    if (error) log().error("Could not get docstore count: {}", platform::printable(error));
+    if (stored == 0 && !error) {
+      log().standard("Docstore is empty, resetting SALT...");
+      if (_resetSALT(&error)) {
+        log().standard("SALT was reset");
+      } else {
+        log().error("Could not reset SALT: {}", platform::printable(error));
+      }
+    }
+    if (!platform::createDirectories(_path, &error)) {
+      log().error("Could not create intermediate directory {}: {}", _path,
+                  platform::printable(error));
+      return;
+    }
+    loadTextStore();
+    if (_textStore == nullptr) createTextStore(stored);
+  }
+  log().standard("Finished initing indexer in time: {} ms", elapsedMillisSinceMonotonicTime(start));
+}
+
+void TALIndexer::makeQueryObjects() {
+  if (tk == nullptr) {
+    const std::string locale = bestLexemonLocale();
+    log().info("Creating Lexemon tokenizer for locale: {}", locale);
+    tk = tokenizer::NewFastLexemonTokenizer(locale);
+    if (tk == nullptr) log().error("Failed to create lexemon tokenizer for locale: {}", locale);
+  }
+  if (_queryProcessor == nullptr)
+    _queryProcessor = TALQueryProcessor::initWithZoneManager(_zoneManager);
+}
+
+void TALIndexer::loadTextStore() {
+  log().standard("Loading textstore...");
+  const uint64_t start = platform::monotonicTicks();
+  setTextStore(nullptr);
+  setTextStore(std::unique_ptr<salt::Index>(salt::LoadIndex(_path)));
+  if (_textStore == nullptr) return;
+  log().standard("Loaded textstore from path: {} in time: {} ms", _path,
+                 elapsedMillisSinceMonotonicTime(start));
+  if (!_shouldRunValidation) {
+    log().standard("Validation disabled, skipping...");
+    return;
+  }
+  log().standard("Running validation...");
+  _scheduleWork(
+      "validateOnLoad",
+      [this]() -> std::optional<TLError> {
+        _validated = _textStore->Validate();
+        if (_validated) {
+          log().standard("Index passed validation");
+        } else {
+          log().fault("Index failed validation");
+        }
+        return std::nullopt;
+      },
+      nullptr);
+}
+
+// A text index made from nothing empties the document store, so that the two never differ in what
+// they know of.
+void TALIndexer::createTextStore(int64_t storedDocuments) {
+  log().standard("Could not find path, creating new textstore at path {}", _path);
+  uint64_t start = platform::monotonicTicks();
+  setTextStore(std::unique_ptr<salt::Index>(salt::NewIndex(newIndexOptions(_path))));
+  log().standard("Created new textstore at path: {} in time: {} ms", _path,
+                 elapsedMillisSinceMonotonicTime(start));
+  if (_textStore == nullptr || docStore() == nullptr) return;
+  log().standard("Resetting docstore after creating a new textstore...");
+  start = platform::monotonicTicks();
+  std::optional<TLError> error;
+  if (docStore()->resetWithError(&error)) {
+    log().standard("Reset docstore with {} items in time: {} ms", storedDocuments,
+                   elapsedMillisSinceMonotonicTime(start));
+  } else {
+    log().error("Error resetting docstore: {}", platform::printable(error));
+  }
+}
+
+std::string TALIndexer::clientStateKey(const TLString& name) {
+  return std::string(kClientStateKey) + "_" + platform::toUTF8(name);
+}
+
+TLError TALIndexer::_errorWithCode(TALIndexerError code, const char* message, TLErrorOut error) {
+  TLError made{kTALIndexerErrorDomain, static_cast<int>(code), message};
+  platform::setError(error, made);
+  return made;
+}
+
+void TALIndexer::_scheduleWork(std::string name, Task task, Completion completionHandler) {
+  log().debug("{} requested", name);
+  _queue.async([this, name = std::move(name), task = std::move(task),
+                completion = std::move(completionHandler)] {
+    const uint64_t start = platform::monotonicTicks();
+    log().debug("{} started", name);
+    const std::optional<TLError> outcome = runWork(task);
+    if (completion) completion(outcome);
+    if (outcome) {
+      log().error("{} completed with error: {}", name, platform::printable(outcome));
+    } else {
+      log().debug("{} completed successfully", name);
+    }
+    log().debug("{} ended, time taken: {} ms", name, elapsedMillisSinceMonotonicTime(start));
+  });
+}
+
+std::optional<TLError> TALIndexer::runWork(const Task& task) {
+  if (!_validated) {
+    return _errorWithCode(TALIndexerError::validationFailed, "index validation failed", nullptr);
+  }
+  {
+    MutexLock lock(_indexMutex);
+    if (_shutdown) return _errorWithCode(TALIndexerError::shuttingDown, "shutting down", nullptr);
+  }
+  return task();
+}
+
+void TALIndexer::resetWithCompletionHandler(Completion completionHandler) {
+  _scheduleWork(
+      "resetWithCompletionHandler",
+      [this] {
+        MutexLock lock(_indexMutex);
+        const uint64_t signpost = Signpost::identifierForObject(this);
+        Signpost::begin(signpost, "resetWithCompletionHandler", "");
+        std::optional<TLError> error;
+        _resetWithError(&error);
+        log().standard("Reinitializing TALIndexer");
+        _init();
+        Signpost::end(signpost, "resetWithCompletionHandler", "");
+        return error;
+      },
+      std::move(completionHandler));
+}
+
+bool TALIndexer::_resetWithError(TLErrorOut error) {
+  const auto store = docStore();
+  if (!_resetSALT(error)) return false;
+  if (store == nullptr) return true;
+  log().standard("Resetting docstore...");
+  std::optional<TLError> failure;
+  if (!store->resetWithError(&failure)) {
+    log().error("Error resetting docstore: {}", platform::printable(failure));
+    if (error != nullptr) *error = std::move(failure);
+    return false;
+  }
+  log().standard("Docstore was reset");
+  return true;
+}
+
+bool TALIndexer::_resetSALT(TLErrorOut error) {
+  std::optional<TLError> failure;
+  const auto names = platform::listDirectory(_path, &failure);
+  if (!names) {
+    log().error("Failed to list files in directory {}: {}", _path, platform::printable(failure));
+    platform::setError(error, *failure);
+    return false;
+  }
+  setTextStore(nullptr);
+  for (const std::string& name : *names) {
+    const std::string file = platform::joinPath(_path, name);
+    log().standard("Removing file {}", file);
+    if (!platform::removeItem(file, &failure)) {
+      log().error("Failed to remove file {}: {}", name, platform::printable(failure));
+      platform::setError(error, *failure);
+      return false;
+    }
+  }
+  return true;
+}
+
+void TALIndexer::saltVacuumAndCompactWithCompletionHandler(Completion completionHandler) {
+  _scheduleWork(
+      "saltVacuum",
+      [this]() -> std::optional<TLError> {
+        // On the queue the index cannot be replaced, so neither mutex is needed.
+        if (_textStore != nullptr) {
+          _textStore->Vacuum();
+          _textStore->Compact();
+        }
+        return std::nullopt;
+      },
+      std::move(completionHandler));
+}
+
+void TALIndexer::fetchLastClientStateforName(
+    const TLString& name,
+    const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>&
+        completionHandler) {
+  log().debug("fetchLastClientStateWithCompletionHandler requested");
+  if (!completionHandler) return;
+  log().debug("fetchLastClientStateWithCompletionHandler started");
+  std::optional<TLError> error;
+  std::optional<std::string> value;
+  if (const auto store = docStore())
+    value = store->metadataValueForKey(clientStateKey(name), &error);
+  if (error) {
+    log().error("fetchLastClientStateWithCompletionHandler name: {} error: {}",
+                platform::toUTF8(name), platform::printable(error));
+  } else {
+    log().standard(
+        "fetchLastClientStateWithCompletionHandler successfully fetched client state name: {} "
+        "(length "
+        "{})",
+        platform::toUTF8(name), value ? value->size() : 0);
+  }
+  completionHandler(value, error);
+}
+
+nlohmann::json TALIndexer::docStats() {
+  const auto store = docStore();
+  if (store == nullptr) return nullptr;
+  const int64_t documents = store->count(nullptr);
+  salt::Index::Metrics m;
+  {
+    MutexLock lock(_indexMutex);
+    if (_textStore == nullptr) return nullptr;
+    m = _textStore->GetMetrics();
+  }
+  return {
+      {"TLDebugServiceDocStoreNumOfItems", documents},
+      {"TLDebugServiceTextStoreNumOfItems", m.Docs},
+      {"TLDebugServiceTextStoreNumOfItemsWithHtmlBody",
+       zoneCount(m, TLAttributeKey::HTML_CONTENT_DATA)},
+      {"TLDebugServiceTextStoreNumOfItemsWithTextBody", zoneCount(m, TLAttributeKey::TEXT_CONTENT)},
+      {"TLDebugServiceTextStoreSize", m.TextBytes},
+      {"TLDebugServiceSaltMaxDocID", m.MaxDocID},
+      {"TLDebugServiceSaltLastDocID", m.LastDocID},
+      {"TLDebugServiceSaltTotalSuffixes", m.Suffixes},
+      {"TLDebugServiceSaltNumOfPages", m.Pages},
+      {"TLDebugServiceSaltHotSuffixes", m.HotSuffixes},
+      {"TLDebugServiceSaltScanPrefixSearched", m.Scans},
+      {"TLDebugServiceSaltScanTimeSecs", m.ScanSeconds},
+      {"TLDebugServiceSaltScanResults", m.ScanResults},
+      {"TLDebugServiceSaltScanPageLoads", m.ScanPageReads},
+      {"TLDebugServiceSaltScanDocTextFetches", m.ScanTextFetches},
+      {"TLDebugServiceSaltIndexTimeSecs", m.IndexingSeconds},
+      {"TLDebugServiceSaltVacuumNumOfPhases", m.Vacuums},
+      {"TLDebugServiceSaltVacuumTimeSecs", m.VacuumSeconds},
+  };
+}
+
+std::string TALIndexer::saltMetrics() {
+  MutexLock lock(_textStoreMutex);
+  return _textStore == nullptr ? std::string() : std::string(_textStore->GetMetrics());
+}
+
+void TALIndexer::close() {
+  setTextStore(nullptr);
+}
+
+void TALIndexer::shutdown() {
+  log().standard("Shutting down indexer...");
+  {
+    MutexLock lock(_indexMutex);
+    _shutdown = true;
+  }
+  _queue.drain();
+  std::shared_ptr<TALDocStore> store;
+  {
+    MutexLock lock(_indexMutex);
+    close();
+    MutexLock storeLock(_docStoreMutex);
+    store = std::exchange(_docStore, nullptr);
+  }
+  if (store != nullptr) store->close();
+  log().standard("Indexer has shut down");
+}

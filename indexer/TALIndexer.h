@@ -1,0 +1,190 @@
+#pragma once
+
+#include <atomic>
+#include <functional>
+#include <memory>
+#include <nlohmann/json.hpp>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "docstore/TALDocStore.h"
+#include "indexer/TALZoneManager.h"
+#include "platform/Log.h"
+#include "platform/Mutex.h"
+#include "platform/Queue.h"
+#include "platform/TLError.h"
+#include "query/TALQueryProcessor.h"
+#include "records/TLIndexableItem.h"
+#include "records/TLQuery.h"
+#include "salt/Index.h"
+#include "salt/Search.h"
+#include "tokenizer/Tokenizer.h"
+
+inline constexpr const char* kTALIndexerErrorDomain = "TALIndexer";
+
+// Codes of the errors of the class.
+enum class TALIndexerError {
+  document = 1,          // "document has no identifier", "index failed"
+  query = 3,             // the query gave no terms
+  shuttingDown = 4,      // "shutting down"
+  validationFailed = 5,  // "index validation failed"
+};
+
+// The heart of one protection class: one text index, one document store, and all work that changes
+// them.
+//
+// Threads. The destructor waits for what is queued, so it must not run on the queue. Adds, deletes,
+// reset and vacuum run one after the other on the indexer's own queue; the operations that start
+// them return at once, from any thread, and completions run on the queue. Searches, statistics and
+// the client state run on the caller's thread.
+//
+// Invariants.
+// 1. `_textStore` is replaced or deleted only by who holds both `_indexMutex` and
+// `_textStoreMutex`, so
+//    holding either keeps it. `_queue` work that changes it takes both.
+// 2. A search holds `_indexMutex` for one pass, a batch for all its documents: they never overlap.
+// 3. The document store is written before the text index. What a search finds in the index and not
+// in the
+//    store is left out.
+// 4. After `shutdown` no work runs: what is queued, or comes later, completes with "shutting down".
+class TALIndexer {
+ public:
+  using Items = std::vector<std::shared_ptr<TLIndexableItem>>;
+  using Strings = std::vector<TLString>;
+  using Completion = std::function<void(const std::optional<TLError>&)>;
+
+  // Opens, or makes, the text index in the directory `path`. The store is open. Never fails:
+  // problems are logged, and an indexer without index or tokenizer reports them with each call.
+  TALIndexer(std::string path, const std::string& protectionClass,
+             std::shared_ptr<TALDocStore> docStore);
+  ~TALIndexer();
+  TALIndexer(const TALIndexer&) = delete;
+  TALIndexer& operator=(const TALIndexer&) = delete;
+
+  // Ingest. A document can be found once the completion has been called without error. A batch that
+  // fails in the text index stays stored; its rest is found once it is sent again.
+  void addDocs(Items docs, std::string bundleID, Completion completionHandler);
+  // Deletes first, then adds, then stores the state; each only when all before it has succeeded.
+  void addDocs(Items docs, Strings deleteItemsByIdentifiers, std::optional<std::string> clientState,
+               TLString clientStateName, std::string bundleID, Completion completionHandler);
+  // An identifier that is not known ends the list with an error; earlier deletions stand.
+  void deleteItemsByIdentifiers(Strings identifiers, std::string bundleID,
+                                Completion completionHandler);
+  void deleteItemsByDomainIdentifiers(Strings domainIdentifiers, Completion completionHandler);
+
+  // Forgets all documents and all client states.
+  void resetWithCompletionHandler(Completion completionHandler);
+  void saltVacuumAndCompactWithCompletionHandler(Completion completionHandler);
+
+  // The bytes stored under a client's name, none when there are none. Synchronous.
+  void fetchLastClientStateforName(
+      const TLString& name,
+      const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>&
+          completionHandler);
+
+  // 18 figures by their statistics keys; null without index or store. Reads all stored text.
+  [[nodiscard]] nlohmann::json docStats();
+  // The metrics of the text index for people; empty without index. Reads all stored text.
+  [[nodiscard]] std::string saltMetrics();
+
+  // Ranked items, at most "salt.maxTopK", each with its card. Writes the resolved parameters into
+  // the query. With a failure the result is empty and the error set.
+  [[nodiscard]] Items search(TLQuery& query, TLErrorOut error);
+
+  // Every stored document whose subject is one of `subjects`, in the store's order, without scores;
+  // none with an error set when the store fails. Reads every document.
+  [[nodiscard]] std::optional<Items> iterateAllDocsToFindMatchingSubjects(const Strings& subjects,
+                                                                          TLErrorOut error);
+
+  // Refuses further work, waits for what runs, closes index and store. Not from the indexer's
+  // queue.
+  void shutdown();
+
+  [[nodiscard]] const std::string& path() const { return _path; }
+  [[nodiscard]] std::shared_ptr<TALDocStore> docStore() const;
+
+  // The key of a document in the store; none for an empty identifier or one that makes no valid
+  // URL.
+  [[nodiscard]] static std::optional<TLURL> documentURLForIdentifier(
+      const std::optional<TLString>& identifier, const std::string& bundleID);
+
+  // -1, 0 or 1; 1 also when either is not a number.
+  [[nodiscard]] static int _floatCompare(float a, float b);
+  // 0 for a document up to a day old, falling to -1 at about 366 days. Seconds since 1970.
+  [[nodiscard]] static double _computeFreshnessPenalty(double documentTime, double queryTime);
+
+  static const platform::Log& log();
+
+ private:
+  using Task = std::function<std::optional<TLError>()>;
+
+  // The maps of one batch.
+  struct Batch;
+
+  void _init();
+  void loadTextStore() TL_REQUIRES(_indexMutex);
+  void createTextStore(int64_t storedDocuments) TL_REQUIRES(_indexMutex);
+  void makeQueryObjects();
+  void setTextStore(std::unique_ptr<salt::Index> index) TL_REQUIRES(_indexMutex);
+  void close() TL_REQUIRES(_indexMutex);
+
+  void _scheduleWork(std::string name, Task task, Completion completionHandler);
+  std::optional<TLError> runWork(const Task& task);
+  bool _resetWithError(TLErrorOut error) TL_REQUIRES(_indexMutex);
+  bool _resetSALT(TLErrorOut error) TL_REQUIRES(_indexMutex);
+  // The key of a client's state in the store's metadata.
+  static std::string clientStateKey(const TLString& name);
+  static TLError _errorWithCode(TALIndexerError code, const char* message, TLErrorOut error);
+
+  bool _addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
+  bool makeDocURLs(const Items& docs, const std::string& bundleID, Batch& batch, TLErrorOut error);
+  bool fetchOldDocs(Batch& batch, TLErrorOut error);
+  void mergeDocs(const Items& docs, Batch& batch);
+  bool storeDocs(Batch& batch, TLErrorOut error);
+  bool indexDocs(const std::string& bundleID, Batch& batch, uint64_t batchStart, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
+  bool _indexDoc(const TLIndexableItem& doc, uint32_t docID, uint64_t* docParsingTime)
+      TL_REQUIRES(_indexMutex);
+  std::optional<TLError> addAndStoreState(const Items& docs,
+                                          const std::optional<std::string>& clientState,
+                                          const TLString& clientStateName,
+                                          const std::string& bundleID);
+  bool _deleteItemsByIdentifiers(const Strings& identifiers, const std::string& bundleID,
+                                 TLErrorOut error);
+  bool _deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
+
+  Items searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms,
+                   TLErrorOut error) TL_REQUIRES(_indexMutex);
+  Items retrieveItems(const std::vector<saltsearch::DocResult>& results, const TLQuery& query,
+                      double queryTime, TLErrorOut error);
+  static std::vector<saltsearch::Term> _populateQueryTerms(const std::vector<TALTerm>& terms);
+  static void _fillScores(TLIndexableItem& item, const saltsearch::DocResult& indexerResult,
+                          double queryTime, float textScoreWeight, float freshnessWeight);
+  static float _lightWeightScoring(const TLIndexableItem& item, double queryTime,
+                                   float textScoreWeight, float freshnessWeight);
+  static void rankItems(Items& items);
+  static void logRanking(const TLQuery& query, const Items& items);
+
+  const std::string _path;
+  TALZoneManager _zoneManager;                         // self-synchronised
+  std::unique_ptr<tokenizer::Tokenizer> tk;            // fixed after construction
+  std::unique_ptr<TALQueryProcessor> _queryProcessor;  // fixed after construction
+
+  platform::Mutex _indexMutex;
+  // Held for as long as one reads `_textStore` without `_indexMutex`; taken after it.
+  platform::Mutex _textStoreMutex;
+  std::unique_ptr<salt::Index> _textStore;  // see invariant 1
+  bool _shutdown TL_GUARDED_BY(_indexMutex) = false;
+  mutable platform::Mutex _docStoreMutex;
+  std::shared_ptr<TALDocStore> _docStore TL_GUARDED_BY(_docStoreMutex);
+
+  // Validation at load is switched off; `_validated` falls to false only through one.
+  const bool _shouldRunValidation = false;
+  std::atomic<bool> _validated{true};
+
+  std::function<void()> _logStateCaptureCancellationBlock;
+  platform::SerialQueue _queue;  // last, so that it ends before what its work uses
+};

@@ -1,0 +1,372 @@
+#include <unordered_map>
+#include <unordered_set>
+#include <utility>
+
+#include "indexer/Snippet.h"
+#include "indexer/TALIndexer.h"
+#include "indexer/ZoneFilling.h"
+#include "platform/Clock.h"
+#include "platform/Concurrent.h"
+#include "platform/Redaction.h"
+#include "platform/Signpost.h"
+
+using platform::MutexLock;
+using platform::Signpost;
+
+struct TALIndexer::Batch {
+  std::vector<TLURL> docURLs;  // one per input item, same order
+  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>>
+      oldDocs;  // what the store knows already
+  std::unordered_map<TLURL, uint32_t> oldDocIDs;
+  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>> mergedDocs;  // the final form
+  std::unordered_set<TLURL> urlsToIndex;  // whose text must go into the text index
+  std::unordered_map<TLURL, uint32_t> newDocIDs;
+};
+
+namespace {
+
+// The store gives 0 for an unknown document and calls that no error; to delete one is one, under
+// the store's domain and the number that its engine has for "not found".
+constexpr int kDocumentNotFound = 12;
+constexpr const char* kDocStoreErrorDomain = "DocStore";
+
+// Gives one item its plain text and its snippet. Touches nothing else.
+void prepareText(TLIndexableItem& item) {
+  std::optional<TLString> body;
+  const auto& html = item.attributeForKey(TLAttributeKey::HTML_CONTENT_DATA);
+  if (html != nullptr && html->hasBytesValue() && !html->bytesValue()->empty()) {
+    body = plainTextOfHTML(*html->bytesValue());
+    if (body) html->setStringValue(body);
+  }
+  auto snippet = snippetOfBody(body ? body : item.stringValueForKey(TLAttributeKey::TEXT_CONTENT));
+  if (snippet && !snippet->empty()) {
+    item.addAttributeWithKeyStringValue(TLAttributeKey::CONTENT_SNIPPET, std::move(snippet));
+  }
+}
+
+// What the log says of a document: identifier, bundle, redacted subject, URL.
+std::string describe(const TLIndexableItem& doc, const std::string& bundleID,
+                     const std::optional<TLURL>& url) {
+  return fmt::format("(identifier: {}, bundleID: {}, subject: {}, docURL: {})",
+                     platform::printable(doc.identifier()), bundleID,
+                     platform::redacted(doc.stringValueForKey(TLAttributeKey::SUBJECT)),
+                     url ? url->absoluteString() : "(null)");
+}
+
+}  // namespace
+
+std::optional<TLURL> TALIndexer::documentURLForIdentifier(const std::optional<TLString>& identifier,
+                                                          const std::string& bundleID) {
+  if (!identifier || identifier->empty()) return std::nullopt;
+  return TLURL::parse("tlw://" + bundleID + "/" + platform::toUTF8(*identifier));
+}
+
+void TALIndexer::addDocs(Items docs, std::string bundleID, Completion completionHandler) {
+  _scheduleWork(
+      "addDocs",
+      [this, docs = std::move(docs), bundleID = std::move(bundleID)] {
+        std::optional<TLError> error;
+        MutexLock lock(_indexMutex);
+        const uint64_t signpost = Signpost::identifierForObject(&docs);
+        Signpost::begin(signpost, "addDocs", "index {} items", docs.size());
+        _addDocs(docs, bundleID, &error);
+        Signpost::end(signpost, "addDocs", "");
+        return error;
+      },
+      std::move(completionHandler));
+}
+
+void TALIndexer::addDocs(Items docs, Strings deleteItemsByIdentifiers,
+                         std::optional<std::string> clientState, TLString clientStateName,
+                         std::string bundleID, Completion completionHandler) {
+  _scheduleWork(
+      "addDocs:deleteDoscsByIdentifiers:clientStates:",
+      [this, docs = std::move(docs), identifiers = std::move(deleteItemsByIdentifiers),
+       state = std::move(clientState), name = std::move(clientStateName),
+       bundleID = std::move(bundleID)]() -> std::optional<TLError> {
+        if (!identifiers.empty()) {
+          std::optional<TLError> error;
+          const uint64_t signpost = Signpost::identifierForObject(&identifiers);
+          Signpost::begin(signpost, "deleteItemsByIdentifiers", "delete {} items",
+                          identifiers.size());
+          _deleteItemsByIdentifiers(identifiers, bundleID, &error);
+          Signpost::end(signpost, "deleteItemsByIdentifiers", "");
+          if (error) return error;
+        }
+        return addAndStoreState(docs, state, name, bundleID);
+      },
+      std::move(completionHandler));
+}
+
+std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
+                                                    const std::optional<std::string>& clientState,
+                                                    const TLString& clientStateName,
+                                                    const std::string& bundleID) {
+  std::optional<TLError> error;
+  MutexLock lock(_indexMutex);
+  if (!docs.empty()) {
+    const uint64_t signpost = Signpost::identifierForObject(&docs);
+    Signpost::begin(signpost, "addDocs", "index {} items", docs.size());
+    _addDocs(docs, bundleID, &error);
+    Signpost::end(signpost, "addDocs", "");
+    if (error) return error;
+  }
+  if (clientState) {
+    log().standard("storing client state name: {} (length {})", platform::toUTF8(clientStateName),
+                   clientState->size());
+    docStore()->setMetadataValue(*clientState, clientStateKey(clientStateName), &error);
+  }
+  return error;
+}
+
+bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error) {
+  const uint64_t start = platform::monotonicTicks();
+  log().debug("Starting to index {} docs with bundleID: {}", docs.size(), bundleID);
+  if (bundleID.empty()) {
+    log().error("bundleID not set");
+    return true;
+  }
+  platform::concurrentApply(docs.size(), [&docs](size_t i) { prepareText(*docs[i]); });
+
+  Batch batch;
+  if (!makeDocURLs(docs, bundleID, batch, error)) return false;
+  if (!fetchOldDocs(batch, error)) return false;
+  mergeDocs(docs, batch);
+  if (!storeDocs(batch, error)) return false;
+  return indexDocs(bundleID, batch, start, error);
+}
+
+bool TALIndexer::makeDocURLs(const Items& docs, const std::string& bundleID, Batch& batch,
+                             TLErrorOut error) {
+  batch.docURLs.reserve(docs.size());
+  for (const auto& doc : docs) {
+    auto url = documentURLForIdentifier(doc->identifier(), bundleID);
+    if (!url) {
+      log().error("Aborting indexing of {} docs as invalid docURL generated for doc {}",
+                  docs.size(), describe(*doc, bundleID, url));
+      _errorWithCode(TALIndexerError::document, "document has no identifier", error);
+      return false;
+    }
+    batch.docURLs.push_back(std::move(*url));
+  }
+  return true;
+}
+
+bool TALIndexer::fetchOldDocs(Batch& batch, TLErrorOut error) {
+  const uint64_t start = platform::monotonicTicks();
+  std::optional<TLError> failure;
+  batch.oldDocs = docStore()->documentsWithURLs(batch.docURLs, &failure, &batch.oldDocIDs);
+  if (failure) {
+    log().error(
+        "Aborting indexing of {} docs as failed to fetch old documents from docstore with error: "
+        "{}",
+        batch.docURLs.size(), platform::printable(failure));
+    platform::setError(error, *failure);
+    return false;
+  }
+  log().debug("Fetched {} old docs, queried {} docURLs in docstore in time: {} ms",
+              batch.oldDocs.size(), batch.docURLs.size(), elapsedMillisSinceMonotonicTime(start));
+  return true;
+}
+
+void TALIndexer::mergeDocs(const Items& docs, Batch& batch) {
+  const uint64_t start = platform::monotonicTicks();
+  int merges = 0;
+  for (size_t i = 0; i < docs.size(); ++i) {
+    const TLURL& url = batch.docURLs[i];
+    const auto prior = batch.mergedDocs.find(url);
+    const auto stored = batch.oldDocs.find(url);
+    if (prior == batch.mergedDocs.end() && stored == batch.oldDocs.end()) {
+      batch.mergedDocs.emplace(url, docs[i]);
+      batch.urlsToIndex.insert(url);
+      continue;
+    }
+    const auto old = prior != batch.mergedDocs.end() ? prior->second : stored->second;
+    bool shouldIndexNewDoc = false;
+    batch.mergedDocs[url] = _zoneManager.mergeNewDoc(*docs[i], old.get(), &shouldIndexNewDoc);
+    if (shouldIndexNewDoc) batch.urlsToIndex.insert(url);
+    ++merges;
+  }
+  log().debug("Checked merging for {} docs and merged {} docs in time: {} ms", docs.size(), merges,
+              elapsedMillisSinceMonotonicTime(start));
+}
+
+bool TALIndexer::storeDocs(Batch& batch, TLErrorOut error) {
+  const uint64_t start = platform::monotonicTicks();
+  TLDocumentBatch docsToUpdate;
+  TLDocumentBatch docsToInsert;
+  std::unordered_set<TLURL> seen;
+  for (const TLURL& url : batch.docURLs) {
+    if (!seen.insert(url).second) continue;
+    auto& docs = batch.oldDocs.contains(url) ? docsToUpdate : docsToInsert;
+    docs.emplace_back(url, batch.mergedDocs[url]);
+  }
+  // A failed commit is reported by the error alone.
+  std::optional<TLError> failure;
+  const bool updated =
+      docsToUpdate.empty() ||
+      docStore()->storeOrUpdateDocuments(docsToUpdate, batch.oldDocIDs, &batch.newDocIDs, &failure);
+  if (!updated || failure) {
+    log().error(
+        "Aborting indexing of {} docs as failed to update {} docs in docstore with error: {}",
+        batch.docURLs.size(), docsToUpdate.size(), platform::printable(failure));
+    platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
+    return false;
+  }
+  const bool inserted = docsToInsert.empty() || docStore()->storeOrUpdateDocuments(
+                                                    docsToInsert, &batch.newDocIDs, &failure);
+  if (!inserted || failure) {
+    log().error(
+        "Aborting indexing of {} docs as failed to store {} new docs in docstore with error: {}",
+        batch.docURLs.size(), docsToInsert.size(), platform::printable(failure));
+    platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
+    return false;
+  }
+  log().debug("Inserted {} new docs and updated {} old docs in docstore in time: {} ms",
+              docsToInsert.size(), docsToUpdate.size(), elapsedMillisSinceMonotonicTime(start));
+  return true;
+}
+
+bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t batchStart,
+                           TLErrorOut error) {
+  const uint64_t start = platform::monotonicTicks();
+  uint64_t textStoreMillis = 0;
+  int indexed = 0;
+  for (const TLURL& url : batch.docURLs) {
+    if (batch.urlsToIndex.erase(url) == 0) continue;
+    const auto docID = batch.newDocIDs.find(url);
+    if (docID == batch.newDocIDs.end() || docID->second == 0) {
+      log().fault(
+          "Skipping indexing of doc with docURL: {} as failed to retrieve its internal docID",
+          url.absoluteString());
+      continue;
+    }
+    const auto merged = batch.mergedDocs.find(url);
+    if (merged == batch.mergedDocs.end() || merged->second == nullptr) {
+      log().fault("Skipping indexing of doc with docURL: {} as failed to retrieve merged doc",
+                  url.absoluteString());
+      continue;
+    }
+    uint64_t docParsingTime = 0;
+    if (!_indexDoc(*merged->second, docID->second, &docParsingTime)) {
+      log().error("Failed to index document in salt {}", describe(*merged->second, bundleID, url));
+      const TLError failure = _errorWithCode(TALIndexerError::document, "index failed", error);
+      log().error(
+          "Indexed {} docs in SALT, aborting indexing of remaining {} docs due to error: {}",
+          indexed, static_cast<int64_t>(batch.urlsToIndex.size()) - indexed,
+          platform::printable(failure));
+      return false;
+    }
+    batch.mergedDocs.erase(merged);
+    textStoreMillis += docParsingTime;
+    ++indexed;
+  }
+  log().standard("Indexed {} docs in time: {} ms (indexing time: {} ms, textstore time: {} ms)",
+                 indexed, elapsedMillisSinceMonotonicTime(batchStart),
+                 elapsedMillisSinceMonotonicTime(start), textStoreMillis);
+  return true;
+}
+
+bool TALIndexer::_indexDoc(const TLIndexableItem& doc, uint32_t docID, uint64_t* docParsingTime) {
+  zone::Zones zones;
+  populateZones(zones, doc, _zoneManager, tk.get());
+  const uint64_t start = platform::monotonicTicks();
+  if (_textStore == nullptr) return false;
+  for (auto& [zoneID, zone] : zones) {
+    if (zone.text.empty() || zone.offsets.empty()) continue;
+    // The offsets may be changed by the call; this is their last use.
+    if (!_textStore->AddZone(docID, zoneID, zone.text, zone.offsets, true)) return false;
+  }
+  *docParsingTime = elapsedMillisSinceMonotonicTime(start);
+  return true;
+}
+
+void TALIndexer::deleteItemsByIdentifiers(Strings identifiers, std::string bundleID,
+                                          Completion completionHandler) {
+  _scheduleWork(
+      "deleteItemsByIdentifiers",
+      [this, identifiers = std::move(identifiers), bundleID = std::move(bundleID)] {
+        std::optional<TLError> error;
+        const uint64_t signpost = Signpost::identifierForObject(this);
+        Signpost::begin(signpost, "deleteItemsByIdentifiers", "delete {} items",
+                        identifiers.size());
+        _deleteItemsByIdentifiers(identifiers, bundleID, &error);
+        Signpost::end(signpost, "deleteItemsByIdentifiers", "");
+        return error;
+      },
+      std::move(completionHandler));
+}
+
+bool TALIndexer::_deleteItemsByIdentifiers(const Strings& identifiers, const std::string& bundleID,
+                                           TLErrorOut error) {
+  if (bundleID.empty()) {
+    log().error("bundleID not set");
+    return true;
+  }
+  for (const TLString& identifier : identifiers) {
+    const auto url = documentURLForIdentifier(identifier, bundleID);
+    const std::string shown = url ? url->absoluteString() : "(null)";
+    std::optional<TLError> failure;
+    const uint32_t docID = url ? docStore()->documentIDWithURL(*url, &failure) : 0;
+    if (docID == 0 && !failure) {
+      failure = TLError{kDocStoreErrorDomain, kDocumentNotFound, "no document with URL " + shown};
+    }
+    if (failure) {
+      log().error("Failed to fetch document ID in docstore for URL {}: {}", shown,
+                  platform::printable(failure));
+    } else {
+      MutexLock lock(_indexMutex);
+      if (docStore()->deleteDocument(docID, &failure) && _textStore != nullptr) {
+        _textStore->DeleteDoc(docID);
+      }
+      if (failure) {
+        log().error("Failed to delete document with ID {} in docstore: {}", docID,
+                    platform::printable(failure));
+      }
+    }
+    if (failure) {
+      platform::setError(error, *failure);
+      return false;
+    }
+  }
+  return true;
+}
+
+void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
+                                                Completion completionHandler) {
+  _scheduleWork(
+      "deleteItemsByDomainIdentifiers",
+      [this, domains = std::move(domainIdentifiers)] {
+        std::optional<TLError> error;
+        MutexLock lock(_indexMutex);
+        const uint64_t signpost = Signpost::identifierForObject(this);
+        Signpost::begin(signpost, "deleteItemsByDomainIdentifiers", "delete {} domains",
+                        domains.size());
+        for (const TLString& domain : domains) {
+          _deleteItemsByDomainIdentifier(domain, &error);
+          if (error) break;
+        }
+        Signpost::end(signpost, "deleteItemsByDomainIdentifiers", "");
+        return error;
+      },
+      std::move(completionHandler));
+}
+
+bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error) {
+  salt::Index* index = _textStore.get();
+  const auto store = docStore();
+  return store->enumerateDocIDs(
+      error, [&](int64_t, uint32_t docID, const TLURL&, bool* stop, TLErrorOut handlerError) {
+        const auto doc = store->documentWithID(docID, nullptr);
+        if (doc == nullptr || doc->domainIdentifier() != domain) return;
+        std::optional<TLError> failure;
+        if (store->deleteDocument(docID, &failure)) {
+          if (index != nullptr) index->DeleteDoc(docID);
+          return;
+        }
+        log().error("Failed to delete document with doc ID {} in docstore: {}", docID,
+                    platform::printable(failure));
+        if (failure) platform::setError(handlerError, *failure);
+        *stop = true;
+      });
+}

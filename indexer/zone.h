@@ -1,0 +1,53 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+#include <vector>
+
+#include "platform/Text.h"
+#include "tokenizer/Tokenizer.h"
+
+// The texts of one document on their way into the text index. One thread.
+namespace zone {
+
+// The text of one zone: UTF-8, values separated by one NUL.
+class Zone {
+ public:
+  // The cleaned words of the text.
+  void AddText(TLStringView value, const tokenizer::Tokenizer& tokenizer);
+
+  // Text that is cleaned already: a match may start at the beginning and behind each blank.
+  void AddTokenizedText(std::string_view value);
+
+  // A value to be matched whole, or by its beginning.
+  void AddTextAsIs(std::string_view value);
+
+  std::string text;
+  // Byte positions in `text` at which a match may start, ascending.
+  std::vector<uint32_t> offsets;
+
+ private:
+  // Separates the next value, and gives its position.
+  size_t beginValue();
+};
+
+// The zones of one document by zone ID, in no order.
+class Zones {
+ public:
+  // Made empty when it is not there. References stay good while others are added.
+  [[nodiscard]] Zone& GetZone(uint16_t zoneID) { return _zones[zoneID]; }
+
+  [[nodiscard]] size_t size() const { return _zones.size(); }
+  [[nodiscard]] auto begin() const { return _zones.begin(); }
+  [[nodiscard]] auto end() const { return _zones.end(); }
+  [[nodiscard]] auto begin() { return _zones.begin(); }
+  [[nodiscard]] auto end() { return _zones.end(); }
+
+ private:
+  std::unordered_map<uint16_t, Zone> _zones;
+};
+
+}  // namespace zone

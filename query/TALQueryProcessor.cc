@@ -1,0 +1,223 @@
+#include "query/TALQueryProcessor.h"
+
+#include <algorithm>
+#include <unordered_set>
+#include <utility>
+
+#include "tokenizer/TLLexemonAssetManager.h"
+
+namespace {
+
+constexpr double kDefaultZoneScore = 0.0;  // of a zone that has no score
+
+// Score of a hit, and of a document without one, by kind of term.
+struct TermWorth {
+  double score;
+  double noMatch;
+};
+constexpr TermWorth kPhrase{5.0, 1.0};    // a pure bonus
+constexpr TermWorth kWordPair{2.0, 0.8};  // missing it is a small penalty
+constexpr TermWorth kWord{1.0, 0.0};      // required
+constexpr TermWorth kEqual{1.0, 0.0};     // required
+constexpr TermWorth kNotEqual{0.0, 1.0};  // forbidden
+constexpr size_t kWordsOfAPhrase = 3;
+
+TLString joinWords(const std::vector<TLString>& words) {
+  TLString text;
+  for (const TLString& word : words) {
+    if (!text.empty()) text += u' ';
+    text += word;
+  }
+  return text;
+}
+
+TLAttributeKey keyAt(const TLQueryNode& node, size_t index) {
+  return static_cast<TLAttributeKey>(node.keys()[index]);
+}
+
+}  // namespace
+
+const platform::Log& TALQueryProcessor::log() {
+  static const platform::Log handle(platform::kSubsystem, "TALQueryProcessor");
+  return handle;
+}
+
+const std::array<TLAttributeKey, 14>& TALQueryProcessor::queryTermEnumKeyAttribs() {
+  using enum TLAttributeKey;
+  static constexpr std::array<TLAttributeKey, 14> keys{SUBJECT,
+                                                       TEXT_CONTENT,
+                                                       HTML_CONTENT_DATA,
+                                                       AUTHORS,
+                                                       RECIPIENTS,
+                                                       ADDITIONAL_RECIPIENTS,
+                                                       HIDDEN_ADDITIONAL_RECIPIENTS,
+                                                       AUTHOR_EMAIL_ADDRESSES,
+                                                       RECIPIENT_EMAIL_ADDRESSES,
+                                                       ADDITIONAL_RECIPIENT_EMAIL_ADDRESSES,
+                                                       HIDDEN_RECIPIENT_EMAIL_ADDRESSES,
+                                                       X_FROM,
+                                                       ATTACHMENT_NAMES,
+                                                       ATTACHMENT_TYPES};
+  return keys;
+}
+
+std::unique_ptr<TALQueryProcessor> TALQueryProcessor::initWithZoneManager(
+    const TALZoneManager& zoneManager) {
+  const std::string locale = bestLexemonLocale();
+  log().info("Creating Lexemon tokenizer for locale: {}", locale);
+  auto tokenizer = tokenizer::NewFastLexemonTokenizer(locale);
+  if (tokenizer == nullptr) {
+    log().error("Failed to create lexemon tokenizer for locale: {}", locale);
+    return nullptr;
+  }
+  return std::unique_ptr<TALQueryProcessor>(
+      new TALQueryProcessor(std::move(tokenizer), zoneManager));
+}
+
+std::vector<TALTerm> TALQueryProcessor::termsFromQuery(const TLQuery& query) const {
+  std::vector<TALTerm> terms = _processQueryString(platform::orEmpty(query.originalQuery()));
+  _processQueryNode(query.root().get(), terms);
+  return terms;
+}
+
+std::vector<TALTerm> TALQueryProcessor::_processQueryString(TLStringView queryString) const {
+  std::vector<TALTerm> terms;
+  if (queryString.empty()) return terms;
+  Zones zones;
+  for (const TLAttributeKey key : queryTermEnumKeyAttribs()) _zoneWeightsWithKey(key, zones);
+  std::vector<TLString> words;
+  _tokenizer->TokenizeToList(queryString, words);
+  if (words.empty()) return terms;
+
+  const bool trailing = hasTrailingSpecialChar(queryString);
+  const size_t last = words.size() - 1;
+  const auto append = [&](TLString token, TermWorth worth, bool wholeWord, bool isUnigram) {
+    if (wholeWord) token += u' ';
+    terms.emplace_back(std::vector<TLString>{std::move(token)}, std::vector<double>{worth.score},
+                       worth.noMatch, zones.ids, zones.scores, isUnigram);
+  };
+  terms.reserve(2 * words.size());
+  if (words.size() >= kWordsOfAPhrase) append(joinWords(words), kPhrase, trailing, false);
+  for (size_t i = 1; i <= last; ++i) {
+    append(words[i - 1] + u' ' + words[i], kWordPair, i != last || trailing, false);
+  }
+  for (size_t i = 0; i <= last; ++i) append(words[i], kWord, i != last || trailing, true);
+  return terms;
+}
+
+// The tree is walked with a stack of its own, in the order of the leaves: AND nodes unfold in
+// place.
+void TALQueryProcessor::_processQueryNode(const TLQueryNode* root,
+                                          std::vector<TALTerm>& terms) const {
+  if (root == nullptr) {
+    log().standard("Query tree node is empty.");
+    return;
+  }
+  std::vector<const TLQueryNode*> pending{root};
+  while (!pending.empty()) {
+    const TLQueryNode& node = *pending.back();
+    pending.pop_back();
+    switch (node.mergeOp()) {
+      case TLQueryNodeMergeOp::LEAF:
+        if (node.op() == TLQueryNodeOp::STRING_EQUAL ||
+            node.op() == TLQueryNodeOp::STRING_NOT_EQUAL) {
+          _stringRestrictTermsFromLeafNode(node, node.op(), terms);
+        }
+        break;
+      case TLQueryNodeMergeOp::AND:
+        for (auto child = node.childs().rbegin(); child != node.childs().rend(); ++child) {
+          pending.push_back(child->get());
+        }
+        break;
+      case TLQueryNodeMergeOp::OR:
+        _restrictTermFromOrNode(node, terms);
+        break;
+      default:
+        log().error("Unknown query tree node mergeOp: {}.", static_cast<int32_t>(node.mergeOp()));
+    }
+  }
+}
+
+void TALQueryProcessor::_stringRestrictTermsFromLeafNode(const TLQueryNode& node, TLQueryNodeOp op,
+                                                         std::vector<TALTerm>& terms) const {
+  const bool equal = op == TLQueryNodeOp::STRING_EQUAL;
+  if (!equal && op != TLQueryNodeOp::STRING_NOT_EQUAL) {
+    log().info("Cannot handle leaf node op: {}.", static_cast<int32_t>(op));
+    return;
+  }
+  const TLString token = _extractStringFrom(node);
+  if (token.empty()) return;
+  for (size_t i = 0; i < node.keysCount(); ++i) {
+    const TLAttributeKey key = keyAt(node, i);
+    Zones zones;
+    if (equal) {
+      // All searchable zones are named, so that a match elsewhere counts as one, at no weight.
+      for (const TLAttributeKey entry : _zoneManager.indexableEnumKeyAttribs()) {
+        _assignWeightsWithKey(entry, entry == key ? 1.0 : 0.0, zones);
+      }
+    } else {
+      _assignWeightsWithKey(key, 1.0, zones);
+    }
+    const TermWorth worth = equal ? kEqual : kNotEqual;
+    terms.emplace_back(std::vector<TLString>{token}, std::vector<double>{worth.score},
+                       worth.noMatch, std::move(zones.ids), std::move(zones.scores), false);
+  }
+}
+
+void TALQueryProcessor::_restrictTermFromOrNode(const TLQueryNode& node,
+                                                std::vector<TALTerm>& terms) const {
+  std::vector<TLString> tokens;
+  std::unordered_set<TLString> known;  // a verification query has thousands of tokens
+  Zones zones;
+  for (const auto& child : node.childs()) {
+    if (child->mergeOp() != TLQueryNodeMergeOp::LEAF) {
+      log().info("Cannot handle a non-leaf node under an OR node.");
+      continue;
+    }
+    if (child->op() != TLQueryNodeOp::STRING_EQUAL) {
+      log().info("Cannot handle op {} under an OR node.", static_cast<int32_t>(child->op()));
+      continue;
+    }
+    TLString token = _extractStringFrom(*child);
+    if (token.empty()) continue;
+    if (known.insert(token).second) tokens.push_back(std::move(token));
+    for (size_t i = 0; i < child->keysCount(); ++i)
+      _assignWeightsWithKey(keyAt(*child, i), 1.0, zones);
+  }
+  if (tokens.empty()) return;
+  std::vector<double> scores(tokens.size(), kEqual.score);
+  terms.emplace_back(std::move(tokens), std::move(scores), kEqual.noMatch, std::move(zones.ids),
+                     std::move(zones.scores), false);
+}
+
+TLString TALQueryProcessor::_extractStringFrom(const TLQueryNode& node) const {
+  if (!node.hasStringValue()) return {};
+  if (!_needsTokenization(node)) return *node.stringValue();
+  std::vector<TLString> words;
+  _tokenizer->TokenizeToList(*node.stringValue(), words);
+  return joinWords(words);
+}
+
+bool TALQueryProcessor::_needsTokenization(const TLQueryNode& node) {
+  const auto& free = queryTermEnumKeyAttribs();
+  for (size_t i = 0; i < node.keysCount(); ++i) {
+    if (std::find(free.begin(), free.end(), keyAt(node, i)) != free.end()) return true;
+  }
+  return false;
+}
+
+void TALQueryProcessor::_zoneWeightsWithKey(TLAttributeKey key, Zones& zones) const {
+  const auto zone = _zoneManager.zoneIDForAttributeKey(static_cast<int32_t>(key), std::nullopt);
+  if (!zone) return;
+  const auto score = _zoneManager.scoreForZoneID(zone);
+  zones.ids.push_back(*zone);
+  zones.scores.push_back(score ? static_cast<double>(*score) : kDefaultZoneScore);
+}
+
+void TALQueryProcessor::_assignWeightsWithKey(TLAttributeKey key, double weight,
+                                              Zones& zones) const {
+  const auto zone = _zoneManager.zoneIDForAttributeKey(static_cast<int32_t>(key), std::nullopt);
+  if (!zone || std::find(zones.ids.begin(), zones.ids.end(), *zone) != zones.ids.end()) return;
+  zones.ids.push_back(*zone);
+  zones.scores.push_back(weight);
+}

@@ -1,0 +1,84 @@
+#include "salt/Database.h"
+
+#include <cstdarg>
+#include <cstdio>
+
+#include "platform/Files.h"
+
+namespace salt {
+
+namespace {
+
+constexpr size_t kWriteBufferBytes =
+    6 * 1024 * 1024;  // memtable and log size at which it is sorted
+constexpr size_t kBlockCacheBytes = 1024 * 1024;
+constexpr size_t kBlockBytes = 32 * 1024;
+constexpr size_t kFileBytes = 4 * 1024 * 1024;
+constexpr size_t kLogLineBytes = 100;
+
+leveldb::Status open(const leveldb::Options& options, const std::string& path,
+                     std::unique_ptr<leveldb::DB>* db) {
+  leveldb::DB* opened = nullptr;
+  const leveldb::Status status = leveldb::DB::Open(options, path, &opened);
+  db->reset(opened);
+  return status;
+}
+
+// A database whose last process died can have a log that ends within a record. Reusing such a log
+// appends behind the torn record, where the next recovery does not look: batches acknowledged
+// after the reopening would be gone. So a first open recovers into a table and a fresh log, and
+// only then are logs reused.
+leveldb::Status openExisting(leveldb::Options options, const std::string& path,
+                             std::unique_ptr<leveldb::DB>* db) {
+  options.reuse_logs = false;
+  if (const leveldb::Status status = open(options, path, db); !status.ok()) return status;
+  db->reset();
+  options.reuse_logs = true;
+  return open(options, path, db);
+}
+
+}  // namespace
+
+void LeveldbLogger::Logv(const char* format, va_list arguments) {
+  static constexpr platform::Log log{platform::kSubsystem, "LevelDB"};
+  if (!log.enabled(platform::LogLevel::debug)) return;
+  char line[kLogLineBytes];
+  std::vsnprintf(line, sizeof line, format, arguments);
+  log.debug("{}", static_cast<const char*>(line));
+}
+
+leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
+  platform::MutexLock lock(_mutex);
+  leveldb::Status status;
+  if (_logTorn) status = _db->Write(leveldb::WriteOptions(), nullptr);
+  if (!status.ok()) return status;
+  status = _db->Write(leveldb::WriteOptions(), batch);
+  _logTorn = !status.ok();
+  return status;
+}
+
+Database openDatabase(const std::string& path, OpenMode mode) {
+  Database result;
+  result.logger = std::make_unique<LeveldbLogger>();
+  result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
+  leveldb::Options options;
+  options.write_buffer_size = kWriteBufferBytes;
+  options.block_cache = result.cache.get();
+  options.block_size = kBlockBytes;
+  options.max_file_size = kFileBytes;
+  options.reuse_logs = true;
+  options.info_log = result.logger.get();
+  leveldb::Status status;
+  if (mode == OpenMode::create) {
+    platform::removeItem(path, nullptr);
+    options.create_if_missing = true;
+    options.error_if_exists = true;
+    status = open(options, path, &result.db);
+  } else {
+    status = openExisting(options, path, &result.db);
+  }
+  if (!status.ok()) Log.error("Error opening db: {}", status.ToString());
+  return result;
+}
+
+}  // namespace salt

@@ -1,0 +1,60 @@
+#pragma once
+
+#include <leveldb/cache.h>
+#include <leveldb/db.h>
+#include <leveldb/env.h>
+#include <leveldb/write_batch.h>
+
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "platform/Log.h"
+#include "platform/Mutex.h"
+
+namespace salt {
+
+inline constexpr platform::Log Log{platform::kSubsystem, "SALT"};
+
+// Passes what leveldb says of itself to the log, at debug level, cut to 99 bytes a line.
+class LeveldbLogger final : public leveldb::Logger {
+ public:
+  void Logv(const char* format, va_list arguments) override;
+};
+
+// An open database with what it needs to live; goes down in the order database, cache, logger.
+struct Database {
+  std::unique_ptr<leveldb::Logger> logger;
+  std::unique_ptr<leveldb::Cache> cache;
+  std::unique_ptr<leveldb::DB> db;  // null when opening failed
+};
+
+enum class OpenMode { create, existing };
+
+// `create` removes what is at `path` first. A failure is logged.
+[[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode);
+
+// The only way batches are written. A write that fails (a full disk, say) can leave half a record
+// in the log, and recovery does not look behind it: the next write starts a new log first, so that
+// what it acknowledges survives. Any thread.
+class BatchWriter {
+ public:
+  explicit BatchWriter(leveldb::DB* db) : _db(db) {}
+
+  // Not synced to the disk.
+  [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch) TL_EXCLUDES(_mutex);
+
+ private:
+  leveldb::DB* const _db;
+  platform::Mutex _mutex;
+  bool _logTorn TL_GUARDED_BY(_mutex) = false;
+};
+
+inline leveldb::Slice slice(std::string_view bytes) {
+  return {bytes.data(), bytes.size()};
+}
+inline std::string_view view(const leveldb::Slice& bytes) {
+  return {bytes.data(), bytes.size()};
+}
+
+}  // namespace salt

@@ -1,0 +1,190 @@
+#include <algorithm>
+#include <cstring>
+#include <thread>
+
+#include "salt/IndexImpl.h"
+
+// The writing half of the index: zones into the hot part, and the set of deleted documents.
+namespace salt {
+
+namespace {
+
+// A batch that has grown past this gives its memory back.
+constexpr size_t kMaxKeptBatchBytes = 4 * 1024 * 1024;
+
+double seconds(std::chrono::nanoseconds duration) {
+  return static_cast<double>(duration.count()) / 1000000000;
+}
+
+bool holds(const std::vector<uint16_t>& zones, uint16_t zoneID) {
+  return std::find(zones.begin(), zones.end(), zoneID) != zones.end();
+}
+
+bool refuse(const char* reason) {
+  Log.error("{}", reason);
+  return false;
+}
+
+}  // namespace
+
+bool index::AddZone(uint32_t docID, uint16_t zoneID, std::string_view text,
+                    std::vector<uint32_t>& offsets, bool merge) {
+  const auto start = Clock::now();
+  if (!zoneFits(docID, zoneID, text, offsets)) return false;
+  const std::optional<Aftermath> aftermath = storeZone(start, docID, zoneID, text, offsets, merge);
+  if (!aftermath) return false;
+  if (aftermath->vacuumDue) Vacuum();
+  if (aftermath->delay.count() != 0) std::this_thread::sleep_for(aftermath->delay);
+  return true;
+}
+
+bool index::zoneFits(uint32_t docID, uint16_t zoneID, std::string_view text,
+                     const std::vector<uint32_t>& offsets) const {
+  if (docID == 0) return refuse("Invalid DocID.");
+  if (zoneID == 0) return refuse("Invalid ZoneID.");
+  if (text.size() > op.MaxZoneSize) return refuse("Zone text too large.");
+  for (size_t i = 0; i < offsets.size(); ++i) {
+    if (i > 0 && offsets[i] <= offsets[i - 1]) return refuse("Offsets out of order.");
+    if (offsets[i] >= text.size()) return refuse("Token offset out of bounds.");
+    if (text[offsets[i]] == '\0') return refuse("Empty token.");
+  }
+  return true;
+}
+
+std::optional<index::Aftermath> index::storeZone(Clock::time_point start, uint32_t docID,
+                                                 uint16_t zoneID, std::string_view text,
+                                                 std::vector<uint32_t>& offsets, bool merge) {
+  platform::MutexLock lock(_writeMutex);
+  const auto locked = Clock::now();
+  if (deletedDocs()->contains(docID)) {
+    refuse("Doc is deleted.");
+    return std::nullopt;
+  }
+  const TextKey key = textKey(docID, zoneID);
+  std::string stored;
+  const Stored before = mayBeStored(docID, zoneID)
+                            ? appendToStored(key, text, offsets, merge, &stored)
+                            : Stored::none;
+  if (before == Stored::failed) return std::nullopt;
+  if (before == Stored::duplicate) return Aftermath{};
+  putZone(key, docID, zoneID, before == Stored::appended ? stored : text, offsets);
+  return commitZone(start, locked, docID, zoneID, offsets.size());
+}
+
+// False without a read where the answer is known: no document above MaxDocID has text. This spares
+// new documents, nearly all there are, a look-up that misses through every level of the database.
+bool index::mayBeStored(uint32_t docID, uint16_t zoneID) const {
+  if (docID == _newestDoc) return holds(_newestZones, zoneID);
+  platform::MutexLock lock(_metricsMutex);
+  return docID <= metrics.MaxDocID;
+}
+
+// A NUL goes between the older text and the newer, so that no suffix runs from one into the other.
+index::Stored index::appendToStored(const TextKey& key, std::string_view text,
+                                    std::vector<uint32_t>& offsets, bool merge,
+                                    std::string* stored) {
+  const leveldb::Status status = db->Get(leveldb::ReadOptions(), slice(key.view()), stored);
+  if (status.IsNotFound()) return Stored::none;
+  if (!status.ok()) {
+    Log.error("Error reading from db: {}", status.ToString());
+    return Stored::failed;
+  }
+  if (!merge) {
+    refuse("Zone already exists.");
+    return Stored::failed;
+  }
+  if (*stored == text) {
+    Log.debug("Ignoring duplicate text.");
+    return Stored::duplicate;
+  }
+  stored->push_back('\0');
+  for (uint32_t& offset : offsets) offset += static_cast<uint32_t>(stored->size());
+  stored->append(text);
+  if (stored->size() > op.MaxZoneSize) {
+    refuse("Zone text too large.");
+    return Stored::failed;
+  }
+  return Stored::appended;
+}
+
+void index::putZone(const TextKey& key, uint32_t docID, uint16_t zoneID, std::string_view text,
+                    const std::vector<uint32_t>& offsets) {
+  _batch->Put(slice(key.view()), slice(text));
+  SuffixMeta meta;
+  meta.DocID = docID;
+  meta.ZoneID = zoneID;
+  for (const uint32_t offset : offsets) {
+    const std::string_view suffix = text.substr(offset);
+    meta.Offset = offset;
+    suffixKey(0, suffix.substr(0, suffixLength(suffix, op)), meta, &_key);
+    _batch->Put(_key, {});
+  }
+}
+
+std::optional<index::Aftermath> index::commitZone(Clock::time_point start, Clock::time_point locked,
+                                                  uint32_t docID, uint16_t zoneID,
+                                                  size_t suffixes) {
+  const size_t batchBytes = _batch->ApproximateSize();
+  platform::MutexLock lock(_metricsMutex);
+  const MetricsBlock undo = metrics;
+  const auto now = Clock::now();
+  metrics.MaxDocID = std::max(metrics.MaxDocID, docID);
+  metrics.LastDocID = docID;
+  metrics.Suffixes += suffixes;
+  metrics.HotSuffixes += suffixes;
+  metrics.IndexingCalls += 1;
+  metrics.IndexingSeconds += seconds(now - start);
+  Aftermath aftermath;
+  aftermath.delay = throttle(now - locked);
+  aftermath.vacuumDue = !metrics.VacuumInProgress && metrics.HotSuffixes > op.MaxHotSuffixes;
+  const bool written = writeMetrics(&*_batch);
+  if (batchBytes > kMaxKeptBatchBytes) _batch.emplace();
+  if (!written) {
+    static_cast<MetricsBlock&>(metrics) = undo;
+    return std::nullopt;
+  }
+  if (docID > undo.MaxDocID) {
+    _newestDoc = docID;
+    _newestZones.clear();
+  }
+  if (docID == _newestDoc && !holds(_newestZones, zoneID)) _newestZones.push_back(zoneID);
+  return aftermath;
+}
+
+// No delay below twice MaxHotSuffixes, from there whole multiples of the time the write lock was
+// held.
+std::chrono::nanoseconds index::throttle(Clock::duration held) {
+  const auto hot = static_cast<double>(metrics.HotSuffixes);
+  const double most = op.MaxHotSuffixes;
+  if (!(hot > most * 1.1)) return std::chrono::nanoseconds(0);
+  // Without a limit every suffix counts as one time over.
+  const auto times = static_cast<uint64_t>(hot / std::max(most, 1.0) - 1.0);
+  const std::chrono::nanoseconds delay(static_cast<uint64_t>(held.count()) * times *
+                                       op.ThrottleFactor);
+  metrics.ThrottlingSeconds += seconds(delay);
+  return delay;
+}
+
+bool index::DeleteDoc(uint32_t docID) {
+  if (docID == 0) return refuse("Invalid DocID.");
+  platform::MutexLock lock(_writeMutex);
+  const auto before = deletedDocs();
+  if (before->contains(docID)) return true;
+  std::string bytes;
+  bytes.reserve((before->size() + 1) * sizeof docID);
+  const auto add = [&bytes](uint32_t id) {
+    bytes.append(reinterpret_cast<const char*>(&id), sizeof id);
+  };
+  before->forEach([&add](const DeletedDoc& doc) { add(doc.docID); });
+  add(docID);
+  leveldb::WriteBatch batch;
+  batch.Put(kDeletedKey, bytes);
+  if (!_writer.write(&batch).ok()) return false;
+  DeletedDocs after = *before;
+  after.insert({docID});
+  platform::MutexLock metricsLock(_metricsMutex);
+  _deleted = std::make_shared<const DeletedDocs>(std::move(after));
+  return true;
+}
+
+}  // namespace salt

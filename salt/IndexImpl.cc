@@ -1,0 +1,193 @@
+#include "salt/IndexImpl.h"
+
+#include <algorithm>
+#include <cstring>
+#include <ctime>
+#include <sstream>
+
+#include "platform/Assert.h"
+
+namespace salt {
+
+namespace {
+
+constexpr char kOptionsKey[] = "\xFFOPTIONS";
+constexpr char kMetricsKey[] = "\xFFMETRICS";
+
+template <typename Record>
+leveldb::Status putRecord(leveldb::DB* db, const char* key, const Record& record) {
+  std::ostringstream bytes;
+  TL_ASSERT(record.SerializeToOstream(bytes));
+  return db->Put(leveldb::WriteOptions(), key, bytes.str());
+}
+
+template <typename Record>
+bool parseRecord(const std::string& bytes, Record* record) {
+  std::istringstream stream(bytes);
+  return record->ParseFromIstream(stream);
+}
+
+}  // namespace
+
+index::index(Database opened)
+    : _database(std::move(opened)),
+      _writer(_database.db.get()),
+      db(_database.db.get()),
+      _batch(std::in_place),
+      _deleted(std::make_shared<const DeletedDocs>()) {
+  std::string bytes;
+  leveldb::Status status = db->Get(leveldb::ReadOptions(), kMetricsKey, &bytes);
+  if (!status.ok() || !parseRecord(bytes, &metrics)) return;
+  if (metrics.CodeVersion != CODE_VERSION) return;
+  status = db->Get(leveldb::ReadOptions(), kOptionsKey, &bytes);
+  TL_ASSERT(status.ok());
+  TL_ASSERT(parseRecord(bytes, &op));
+  TL_ASSERT(op.Valid());
+  status = db->Get(leveldb::ReadOptions(), kDeletedKey, &bytes);
+  if (status.IsNotFound()) return;
+  TL_ASSERT(status.ok());
+  DeletedDocs deleted;
+  for (size_t at = 0; at + sizeof(uint32_t) <= bytes.size(); at += sizeof(uint32_t)) {
+    DeletedDoc doc;
+    std::memcpy(&doc.docID, bytes.data() + at, sizeof doc.docID);
+    if (doc.docID != 0 && !deleted.contains(doc.docID)) deleted.insert(doc);
+  }
+  _deleted = std::make_shared<const DeletedDocs>(std::move(deleted));
+}
+
+Index* NewIndex(const Index::Options& options) {
+  Database database = openDatabase(options.Path, OpenMode::create);
+  leveldb::DB* const ldb = database.db.get();
+  TL_ASSERT(ldb);
+  leveldb::Status status = putRecord(ldb, kOptionsKey, options);
+  TL_ASSERT(status.ok());
+  Index::Metrics metrics;
+  metrics.CodeVersion = CODE_VERSION;
+  metrics.CreationTime = std::time(nullptr);
+  status = putRecord(ldb, kMetricsKey, metrics);
+  TL_ASSERT(status.ok());
+  auto idx = std::make_unique<index>(std::move(database));
+  platform::MutexLock lock(idx->_metricsMutex);
+  TL_ASSERT(idx->metrics.CodeVersion == CODE_VERSION);
+  return idx.release();
+}
+
+Index* LoadIndex(const std::string& path) {
+  Database database = openDatabase(path, OpenMode::existing);
+  if (!database.db) return nullptr;
+  auto idx = std::make_unique<index>(std::move(database));
+  if (!idx->metricsSound()) return nullptr;
+  if (idx->op.ValidateOnLoad && !idx->Validate()) {
+    Log.fault("Loading failure: Validation failed.");
+    return nullptr;
+  }
+  platform::MutexLock lock(idx->_metricsMutex);
+  idx->metrics.VacuumInProgress = false;
+  return idx.release();
+}
+
+bool index::metricsSound() const {
+  platform::MutexLock lock(_metricsMutex);
+  if (metrics.CodeVersion != CODE_VERSION) {
+    Log.error("Loading failure: Mismatched code version.");
+    return false;
+  }
+  const auto product = [](uint64_t count, uint32_t each) {
+    return static_cast<double>(count) * static_cast<double>(each);
+  };
+  if (metrics.Shards > op.MaxShards ||
+      product(metrics.Zones, op.MaxZoneSize) < static_cast<double>(metrics.TextBytes) ||
+      metrics.Suffixes < metrics.HotSuffixes ||
+      product(metrics.Pages, op.MaxPageSuffixes) <
+          static_cast<double>(metrics.Suffixes - metrics.HotSuffixes)) {
+    Log.fault("Loading failure: Metrics corrupted.");
+    return false;
+  }
+  return true;
+}
+
+std::string_view index::fullText(const SuffixMeta& meta, const leveldb::ReadOptions& options,
+                                 std::string* zoneText) const {
+  const leveldb::Status status =
+      db->Get(options, slice(textKey(meta.DocID, meta.ZoneID).view()), zoneText);
+  if (!status.ok() || zoneText->size() < meta.Offset) return "";
+  const std::string_view text = std::string_view(*zoneText).substr(meta.Offset);
+  return text.substr(0, suffixLength(text, op));
+}
+
+std::string index::GetSuffixText(const SuffixMeta& meta) const {
+  std::string zoneText;
+  return std::string(fullText(meta, leveldb::ReadOptions(), &zoneText));
+}
+
+std::shared_ptr<const DeletedDocs> index::deletedDocs() const {
+  platform::MutexLock lock(_metricsMutex);
+  return _deleted;
+}
+
+void index::Vacuum() {}
+
+bool index::Sync() {
+  leveldb::WriteOptions options;
+  options.sync = true;
+  return db->Write(options, nullptr).ok();
+}
+
+void index::Compact() {
+  db->CompactRange(nullptr, nullptr);
+}
+
+Index::Metrics index::GetMetrics() const {
+  const IndexView view(*this, false);
+  Metrics result = view.metrics;
+  result.Docs = result.Zones = result.TextBytes = 0;
+  result.DeletedDocs = view.deleted->size();
+  uint32_t previous = 0;
+  forEachZone(view, [&](uint32_t docID, uint16_t zoneID, std::string_view text) {
+    if (docID != previous) ++result.Docs;
+    previous = docID;
+    ++result.ZoneCounts[zoneID];
+    ++result.Zones;
+    result.TextBytes += text.size();
+    return true;
+  });
+  return result;
+}
+
+void index::ResetScanMetrics() {
+  platform::MutexLock lock(_metricsMutex);
+  metrics.Scans = 0;
+  metrics.ScanSeconds = 0;
+  metrics.ScanResults = 0;
+  metrics.ScanTextFetches = 0;
+  metrics.ScanHotReads = 0;
+  metrics.ScanPageReads = 0;
+}
+
+bool index::writeMetrics(leveldb::WriteBatch* batch) {
+  const MetricsBlock& block = metrics;
+  batch->Put(kMetricsKey, {reinterpret_cast<const char*>(&block), sizeof block});
+  const leveldb::Status status = _writer.write(batch);
+  batch->Clear();
+  if (!status.ok()) Log.error("Error writing to db: {}", status.ToString());
+  return status.ok();
+}
+
+IndexView::IndexView(const index& owner, bool fillCache) : idx(owner) {
+  options.verify_checksums = false;
+  options.fill_cache = fillCache;
+  platform::MutexLock lock(owner._metricsMutex);
+  options.snapshot = owner.db->GetSnapshot();
+  metrics = owner.metrics;
+  deleted = owner._deleted;
+}
+
+IndexView::~IndexView() {
+  idx.db->ReleaseSnapshot(options.snapshot);
+}
+
+uint8_t IndexView::lastShard() const {
+  return static_cast<uint8_t>(std::min<uint64_t>(metrics.Shards, kMaxShardNumber));
+}
+
+}  // namespace salt

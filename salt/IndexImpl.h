@@ -1,0 +1,175 @@
+#pragma once
+
+#include <leveldb/db.h>
+#include <leveldb/write_batch.h>
+
+#include <chrono>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Mutex.h"
+#include "salt/Coding.h"
+#include "salt/Database.h"
+#include "salt/DocTable.h"
+#include "salt/Index.h"
+
+namespace salt {
+
+class IndexView;
+class ShardCursor;
+
+struct DeletedDoc {
+  uint32_t docID = 0;
+};
+using DeletedDocs = DocTable<DeletedDoc>;
+
+inline constexpr char kDeletedKey[] =
+    "\xFF"
+    "DELETED";
+
+// 0xFF is the first byte of texts and named keys.
+inline constexpr uint8_t kMaxShardNumber = 0xFE;
+
+// The index over a leveldb database. Two locks, the write mutex always before the metrics mutex:
+// the first makes whole calls of AddZone and DeleteDoc follow one another, the second guards the
+// metrics and the taking of a view.
+//
+// What holds at all times: the metrics in the database are those of the same batch as the keys that
+// they count; a reader's snapshot and its copy of the metrics are of the same moment, and what is
+// deleted later stays visible to it.
+class index final : public Index {
+ public:
+  explicit index(Database opened);
+  ~index() override = default;
+
+  [[nodiscard]] const Options& GetOptions() const override { return op; }
+  [[nodiscard]] std::string GetSuffixText(const SuffixMeta& meta) const override;
+  bool AddZone(uint32_t docID, uint16_t zoneID, std::string_view text,
+               std::vector<uint32_t>& offsets, bool merge) override;
+  bool DeleteDoc(uint32_t docID) override;
+  bool ScanPrefix(std::string_view prefix,
+                  std::function<bool(const SuffixMeta&)> callback) const override;
+  void ForEachZone(std::function<bool(uint32_t docID, uint16_t zoneID, std::string_view text)>
+                       callback) const override;
+  void Vacuum() override;
+  bool Sync() override;
+  void Compact() override;
+  [[nodiscard]] Metrics GetMetrics() const override;
+  void ResetScanMetrics() override;
+  [[nodiscard]] bool Validate() const override;
+  [[nodiscard]] std::string Dump() const override;
+
+  static TextKey textKey(uint32_t docID, uint16_t zoneID) {
+    constexpr uint8_t shard = 255;
+    return {shard, docID, zoneID};
+  }
+
+  // The cut text of a suffix, empty when its zone cannot be read or is too short. It points into
+  // `zoneText`, which takes the text of the whole zone.
+  [[nodiscard]] std::string_view fullText(const SuffixMeta& meta,
+                                          const leveldb::ReadOptions& options,
+                                          std::string* zoneText) const;
+
+ private:
+  using Clock = std::chrono::steady_clock;
+
+  // What AddZone has left to do once the locks are released.
+  struct Aftermath {
+    bool vacuumDue = false;
+    std::chrono::nanoseconds delay{0};
+  };
+
+  // What a shard's walk adds to the metrics.
+  struct ScanCounts {
+    uint64_t results = 0;
+    uint64_t fetches = 0;
+    uint64_t hotReads = 0;
+    uint64_t pageReads = 0;
+  };
+
+  [[nodiscard]] bool zoneFits(uint32_t docID, uint16_t zoneID, std::string_view text,
+                              const std::vector<uint32_t>& offsets) const;
+  [[nodiscard]] std::optional<Aftermath> storeZone(Clock::time_point start, uint32_t docID,
+                                                   uint16_t zoneID, std::string_view text,
+                                                   std::vector<uint32_t>& offsets, bool merge);
+  enum class Stored { none, duplicate, appended, failed };
+  [[nodiscard]] Stored appendToStored(const TextKey& key, std::string_view text,
+                                      std::vector<uint32_t>& offsets, bool merge,
+                                      std::string* stored) TL_REQUIRES(_writeMutex);
+  [[nodiscard]] bool mayBeStored(uint32_t docID, uint16_t zoneID) const TL_REQUIRES(_writeMutex)
+      TL_EXCLUDES(_metricsMutex);
+  void putZone(const TextKey& key, uint32_t docID, uint16_t zoneID, std::string_view text,
+               const std::vector<uint32_t>& offsets) TL_REQUIRES(_writeMutex);
+  [[nodiscard]] std::optional<Aftermath> commitZone(Clock::time_point start,
+                                                    Clock::time_point locked, uint32_t docID,
+                                                    uint16_t zoneID, size_t suffixes)
+      TL_REQUIRES(_writeMutex);
+  [[nodiscard]] std::chrono::nanoseconds throttle(Clock::duration held) TL_REQUIRES(_metricsMutex);
+
+  [[nodiscard]] std::shared_ptr<const DeletedDocs> deletedDocs() const TL_EXCLUDES(_metricsMutex);
+
+  // Writes the batch together with the metrics and clears it. A failure is logged.
+  [[nodiscard]] bool writeMetrics(leveldb::WriteBatch* batch) TL_REQUIRES(_metricsMutex);
+
+  // False, with a log line, when the loaded counters cannot be those of a sound index.
+  [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
+
+  // Counts what it does; false when the whole scan is over.
+  [[nodiscard]] bool scanShard(ShardCursor* cursor, const DeletedDocs& deleted,
+                               std::string_view prefix,
+                               const std::function<bool(const SuffixMeta&)>& callback,
+                               ScanCounts* counts) const;
+  void forEachZone(const IndexView& view,
+                   const std::function<bool(uint32_t, uint16_t, std::string_view)>& callback) const;
+
+  friend class IndexView;
+  friend Index* NewIndex(const Options& options);
+  friend Index* LoadIndex(const std::string& path);
+
+  Database _database;
+  BatchWriter _writer;
+
+ public:
+  // Fixed from the construction on.
+  leveldb::DB* const db;
+  Options op;
+
+ private:
+  mutable platform::Mutex _metricsMutex;
+  mutable Metrics metrics TL_GUARDED_BY(_metricsMutex);
+
+  platform::Mutex _writeMutex TL_ACQUIRED_BEFORE(_metricsMutex);
+  // Kept for their memory.
+  std::optional<leveldb::WriteBatch> _batch TL_GUARDED_BY(_writeMutex);
+  std::string _key TL_GUARDED_BY(_writeMutex);
+  // The zones of the document that was above all others when it came, 0 for none.
+  uint32_t _newestDoc TL_GUARDED_BY(_writeMutex) = 0;
+  std::vector<uint16_t> _newestZones TL_GUARDED_BY(_writeMutex);
+
+  // Replaced as a whole by each deletion, under both mutexes, so that a view keeps the set of its
+  // moment. A deletion writes the whole set anyway.
+  std::shared_ptr<const DeletedDocs> _deleted TL_GUARDED_BY(_metricsMutex);
+};
+
+// What every reader works from: a snapshot, the metrics and the set of deleted documents. One
+// thread; the index outlives it.
+class IndexView {
+ public:
+  // With `fillCache` false the reads do not displace the block cache.
+  IndexView(const index& owner, bool fillCache);
+  ~IndexView();
+  IndexView(const IndexView&) = delete;
+  IndexView& operator=(const IndexView&) = delete;
+
+  // The last shard number to visit; the hot part is 0.
+  [[nodiscard]] uint8_t lastShard() const;
+
+  const index& idx;
+  leveldb::ReadOptions options;
+  Index::Metrics metrics;
+  std::shared_ptr<const DeletedDocs> deleted;
+};
+
+}  // namespace salt

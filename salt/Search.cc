@@ -1,0 +1,237 @@
+#include "salt/Search.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+
+#include "salt/Database.h"
+#include "salt/DocTable.h"
+
+namespace saltsearch {
+
+namespace {
+
+// What the terms from one on can still multiply a document's score by, computed from the last term
+// back. It is what lets a search drop documents early.
+struct Bounds {
+  std::vector<double> zone;     // of one term: sum of its zone weights, at most 1
+  std::vector<double> matched;  // highest product if at least one of the terms really matches
+  std::vector<double> any;      // highest product
+};
+
+double cappedSum(const std::vector<double>& weights) {
+  double sum = 0;
+  for (const double weight : weights) sum += weight;
+  return std::min(sum, 1.0);
+}
+
+Bounds boundsOf(const std::vector<Term>& terms) {
+  const size_t n = terms.size();
+  Bounds bounds{std::vector<double>(n), std::vector<double>(n + 1), std::vector<double>(n + 1)};
+  bounds.matched[n] = 0;
+  bounds.any[n] = 1;
+  for (size_t i = n; i-- > 0;) {
+    const Term& term = terms[i];
+    bounds.zone[i] = term.zones.empty() ? 1.0 : cappedSum(term.zoneScores);
+    double best = 0;
+    for (const double score : term.tokenScores) best = std::max(best, score);
+    best *= bounds.zone[i];
+    bounds.any[i] = std::max(term.defaultScore, best) * bounds.any[i + 1];
+    bounds.matched[i] =
+        std::max(term.defaultScore * bounds.matched[i + 1], best * bounds.any[i + 1]);
+  }
+  return bounds;
+}
+
+bool wellFormed(const Term& term) {
+  if (term.tokens.size() != term.tokenScores.size()) {
+    salt::Log.error("Mismatched tokens in query.");
+    return false;
+  }
+  if (term.zones.size() != term.zoneScores.size()) {
+    salt::Log.error("Mismatched zones in query.");
+    return false;
+  }
+  if (term.zones.size() > kMaxTermZones) {
+    salt::Log.error("Too many zones in query: {}.", term.zones.size());
+    return false;
+  }
+  return true;
+}
+
+// The documents found so far and the score of all others.
+struct Candidates {
+  salt::DocTable<DocResult> results;
+  double unmatched = 1.0;  // product of the default scores of the terms done
+};
+
+// The evaluation of one term: collects its matches, then multiplies them into the scores.
+class TermRun {
+ public:
+  // `matched` and `any` are the bounds of the terms after this one, `zone` that of this one.
+  TermRun(Term& term, const Options& options, Candidates* candidates, double zone, double matched,
+          double any)
+      : _term(term),
+        _options(options),
+        _candidates(*candidates),
+        _zoneBound(zone),
+        _reach(candidates->unmatched * term.defaultScore * matched),
+        _need(options.threshold / any),
+        _wild(wildZone(term.zones)) {}
+
+  void collect(const salt::Index& index) {
+    for (size_t t = 0; t < _term.tokens.size(); ++t) {
+      _tokenScore = _term.tokenScores[t];
+      _noNewDocs = refusesNewDocs(t);
+      index.ScanPrefix(_term.tokens[t],
+                       [this](const salt::SuffixMeta& meta) { return take(meta); });
+    }
+  }
+
+  void score() {
+    _candidates.results.retain([this](DocResult& doc) {
+      doc.score *= factor(doc);
+      if (_reach < _options.threshold && doc.score < _need) return false;
+      doc.tokenScore = -1.0;
+      doc.zoneMask = 0;
+      return true;
+    });
+    _candidates.unmatched *= _term.defaultScore;
+  }
+
+ private:
+  // The last entry that stands for all zones not listed, or the size.
+  static size_t wildZone(const std::vector<uint16_t>& zones) {
+    const auto last = std::find(zones.rbegin(), zones.rend(), 0);
+    return last == zones.rend() ? zones.size() : static_cast<size_t>(zones.rend() - last) - 1;
+  }
+
+  // Whether a document that only this token, or where a later one can raise it those too, finds now
+  // stays below the threshold.
+  [[nodiscard]] bool refusesNewDocs(size_t token) const {
+    if (_options.threshold <= _reach) return false;
+    double best = _term.tokenScores[token];
+    if (_term.isMin || _term.zones.size() > 1) {
+      const auto from = _term.tokenScores.begin() + static_cast<ptrdiff_t>(token);
+      best = *std::max_element(from, _term.tokenScores.end());
+    }
+    return _candidates.unmatched * best * _zoneBound < _need;
+  }
+
+  bool take(const salt::SuffixMeta& meta) {
+    ++_suffixes;
+    _term.found = true;
+    if (_suffixes > _options.maxSuffixes) return false;
+    DocResult* const known = _candidates.results.find(meta.DocID);
+    if (known == nullptr && _noNewDocs) return true;
+    const size_t zone = zoneIndex(meta.ZoneID);
+    if (zone == _term.zones.size() && !_term.zones.empty()) return true;
+    const uint32_t bit = uint32_t{1} << zone;
+    if (known == nullptr) {
+      _candidates.results.insert({meta.DocID, bit, _candidates.unmatched, _tokenScore});
+      return true;
+    }
+    if (known->tokenScore == -1.0) {
+      known->tokenScore = _tokenScore;
+    } else {
+      known->tokenScore = _term.isMin ? std::min(known->tokenScore, _tokenScore)
+                                      : std::max(known->tokenScore, _tokenScore);
+    }
+    known->zoneMask |= bit;
+    return true;
+  }
+
+  [[nodiscard]] size_t zoneIndex(uint16_t zoneID) const {
+    const auto& zones = _term.zones;
+    const auto found = std::find(zones.begin(), zones.end(), zoneID);
+    return found == zones.end() ? _wild : static_cast<size_t>(found - zones.begin());
+  }
+
+  // What this term multiplies the document's score by.
+  [[nodiscard]] double factor(const DocResult& doc) const {
+    if (doc.tokenScore == -1.0) return _term.defaultScore;
+    if (_term.zones.empty()) return doc.tokenScore;
+    double sum = 0;
+    for (size_t i = 0; i < _term.zones.size(); ++i) {
+      if ((doc.zoneMask >> i & 1) != 0) sum += _term.zoneScores[i];
+    }
+    return doc.tokenScore * std::min(sum, 1.0);
+  }
+
+  Term& _term;
+  const Options& _options;
+  Candidates& _candidates;
+  const double _zoneBound;
+  const double _reach;  // best score of a document that neither this term nor one before matched
+  const double _need;   // running score below which no later term brings a document up
+  const size_t _wild;
+  double _tokenScore = 0;
+  bool _noNewDocs = false;
+  size_t _suffixes = 0;
+};
+
+bool ranksAbove(const DocResult& left, const DocResult& right) {
+  return left.score > right.score || (left.score == right.score && left.docID > right.docID);
+}
+
+std::vector<DocResult> topDocs(const salt::DocTable<DocResult>& results, const Options& options) {
+  std::vector<DocResult> heap;
+  if (options.maxResults == 0) return heap;
+  results.forEach([&](const DocResult& doc) {
+    if (doc.score < options.threshold) return;
+    if (heap.size() == options.maxResults) {
+      if (!ranksAbove(doc, heap.front())) return;
+      std::pop_heap(heap.begin(), heap.end(), ranksAbove);
+      heap.back() = doc;
+    } else {
+      heap.push_back(doc);
+    }
+    std::push_heap(heap.begin(), heap.end(), ranksAbove);
+  });
+  std::sort_heap(heap.begin(), heap.end(), ranksAbove);
+  return heap;
+}
+
+}  // namespace
+
+std::vector<DocResult> Search(const salt::Index& index, std::vector<Term>& terms,
+                              const Options& options) {
+  const Bounds bounds = boundsOf(terms);
+  Candidates candidates;
+  for (size_t u = 0; u < terms.size(); ++u) {
+    if (!wellFormed(terms[u])) continue;
+    TermRun run(terms[u], options, &candidates, bounds.zone[u], bounds.matched[u + 1],
+                bounds.any[u + 1]);
+    run.collect(index);
+    run.score();
+  }
+  return topDocs(candidates.results, options);
+}
+
+double ZoneScoreDefault(uint32_t, uint16_t) {
+  return 1.0;
+}
+
+Term::operator std::string() const {
+  std::string text = isMin ? "{MIN " : "{";
+  for (size_t i = 0; i < tokens.size(); ++i) {
+    if (i > 0) text += " | ";
+    text += fmt::format("\"{}\":", tokens[i]);
+    if (i < tokenScores.size()) text += fmt::format("{:g}", tokenScores[i]);
+  }
+  if (!zones.empty()) text += " zones:{";
+  for (size_t i = 0; i < zones.size(); ++i) {
+    if (i > 0) text += ',';
+    text += fmt::format("{}:", zones[i]);
+    if (i < zoneScores.size()) text += fmt::format("{:g}", zoneScores[i]);
+  }
+  if (!zones.empty()) text += '}';
+  if (defaultScore > 0) text += fmt::format(" default:{:g}", defaultScore);
+  return text + '}';
+}
+
+DocResult::operator std::string() const {
+  return fmt::format("{}:{:g}", docID, score);
+}
+
+}  // namespace saltsearch

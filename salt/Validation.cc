@@ -1,0 +1,97 @@
+#include <fmt/format.h>
+
+#include <algorithm>
+
+#include "salt/IndexImpl.h"
+#include "salt/Suffix.h"
+
+// Walks of the whole index: one that checks what a merge promises, one that prints.
+namespace salt {
+
+namespace {
+
+constexpr size_t kDumpedTextBytes = 16;
+
+uint8_t byteAt(std::string_view text, size_t at) {
+  return at < text.size() ? static_cast<uint8_t>(text[at]) : 0;
+}
+
+// What is wrong with `text` and its place after `previous`, or null. A suffix that its page derives
+// from the one before must also have the right common prefix and extra bytes.
+const char* fault(std::string_view previous, const SuffixMeta& previousMeta, std::string_view text,
+                  const SuffixMeta& meta, bool derived) {
+  const int order = text.compare(previous);
+  if (order < 0 || (order == 0 && meta < previousMeta)) return "Validation failed: Out of order.";
+  if (!derived) return nullptr;
+  const size_t lcp = meta.lcp;
+  if (lcp > previous.size() || lcp > text.size() ||
+      previous.substr(0, lcp) != text.substr(0, lcp)) {
+    return "Validation failed: LCP too large.";
+  }
+  if ((lcp < previous.size() || lcp < text.size()) &&
+      previous.substr(0, lcp + 1) == text.substr(0, lcp + 1)) {
+    return "Validation failed: LCP too small.";
+  }
+  if (byteAt(text, lcp) != meta.extra[0] || byteAt(text, lcp + 1) != meta.extra[1]) {
+    return "Validation failed: Incorrect extra.";
+  }
+  return nullptr;
+}
+
+// Counts the suffixes of the cursor's shard into `total`; false, with a log line, at a fault.
+bool shardSound(ShardCursor* cursor, uint64_t* total) {
+  std::string previous;
+  SuffixMeta previousMeta;
+  for (cursor->seekToFirst(); cursor->valid; cursor->next()) {
+    Suffix& suffix = cursor->suffix;
+    suffix.fetch();
+    const bool derived = cursor->shard != 0 && cursor->pos != 0;
+    if (const char* const found =
+            fault(previous, previousMeta, suffix.knownText(), suffix.meta, derived)) {
+      Log.error("{}", found);
+      return false;
+    }
+    previous = suffix.knownText();
+    previousMeta = suffix.meta;
+    ++*total;
+  }
+  if (const leveldb::Status status = cursor->iterator->status(); !status.ok()) {
+    Log.error("Error scanning index: {}", status.ToString());
+    return false;
+  }
+  return true;
+}
+
+}  // namespace
+
+bool index::Validate() const {
+  const IndexView view(*this, false);
+  ShardCursor cursor(view, 0);
+  uint64_t total = 0;
+  for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {
+    cursor.moveTo(static_cast<uint8_t>(shard));
+    if (!shardSound(&cursor, &total)) return false;
+  }
+  if (total != view.metrics.Suffixes) {
+    Log.error("Validation failed: # of suffixes: {} != {}.", total, view.metrics.Suffixes);
+  }
+  return true;
+}
+
+std::string index::Dump() const {
+  const IndexView view(*this, false);
+  ShardCursor cursor(view, 0);
+  std::string text = std::string(view.metrics) + '\n';
+  for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {
+    text += shard == 0 ? "-- SALT INDEX (HOT)\n" : fmt::format("-- SALT INDEX (SHARD {})\n", shard);
+    cursor.moveTo(static_cast<uint8_t>(shard));
+    for (cursor.seekToFirst(); cursor.valid; cursor.next()) {
+      cursor.suffix.fetch();
+      text += fmt::format("---- {}: \"{}\"\n", std::string(cursor.suffix.meta),
+                          cursor.suffix.knownText().substr(0, kDumpedTextBytes));
+    }
+  }
+  return text;
+}
+
+}  // namespace salt

@@ -1,0 +1,145 @@
+#include <gtest/gtest.h>
+
+#include <future>
+
+#include "daemon/TLDeviceLockMonitor.h"
+#include "platform/Files.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+class FakeVault : public DeviceVault {
+ public:
+  uint32_t DVLGetDeviceLockState(int) override { return state; }
+  int DVLDeviceUnlockedSinceBoot() override { return unlocked; }
+  uint32_t registerNotification(const std::string& name, platform::SerialQueue& queue,
+                                std::function<void()> handler, int32_t* token) override {
+    EXPECT_EQ(name, "com.quill.mobile.lockstated.lock_status");
+    if (status == 0) *token = 7;
+    onQueue = &queue;
+    notify = std::move(handler);
+    return status;
+  }
+  void cancel(int32_t token) override { cancelled = token; }
+
+  // The state changes, and its handler has run when this returns.
+  void change(uint32_t newState) {
+    state = newState;
+    onQueue->sync(notify);
+  }
+
+  std::atomic<uint32_t> state{0};
+  int unlocked = 1;
+  uint32_t status = 0;
+  int32_t cancelled = 0;
+  platform::SerialQueue* onQueue = nullptr;
+  std::function<void()> notify;
+};
+
+struct Observer : TLDeviceLockObserver {
+  std::vector<std::string> calls;
+  void protectedDataDidBecomeAvailable() override { calls.push_back("available"); }
+  void protectedDataWillBecomeUnavailable() override { calls.push_back("will be unavailable"); }
+  void protectedDataDidBecomeUnavailable() override { calls.push_back("unavailable"); }
+};
+
+}  // namespace
+
+TEST(LockMonitor, FollowsTheStates) {
+  struct Row {
+    uint32_t state;
+    bool available;
+    bool unlocked;
+    const char* line;
+  };
+  const std::vector<Row> rows{
+      {1, false, false,
+       "default TLDeviceLockMonitor: Device locked with state: 1, unlockedSinceBoot: 0, "
+       "protectedDataAvailable 0"},
+      {3, true, true,
+       "default TLDeviceLockMonitor: Device unlocked with state: 3, unlockedSinceBoot: 1, "
+       "protectedDataAvailable 1"},
+      {2, false, true,
+       "default TLDeviceLockMonitor: Device locking with state: 2, unlockedSinceBoot: 1, "
+       "protectedDataAvailable 0"},
+      {0, true, true,
+       "default TLDeviceLockMonitor: Device unlocked with state: 0, unlockedSinceBoot: 1, "
+       "protectedDataAvailable 1"},
+      {4, false, true,
+       "fault TLDeviceLockMonitor: Device lock state changed to unexpected state: 4, "
+       "unlockedSinceBoot: 1, protectedDataAvailable 0"}};
+  FakeVault vault;
+  vault.unlocked = 0;
+  vault.state = 9;
+  testsupport::LogCapture log;
+  {
+    TLDeviceLockMonitor monitor(vault);
+    EXPECT_TRUE(log.has("fault TLDeviceLockMonitor: Unexpected device lock state: 9"));
+    EXPECT_TRUE(
+        log.has("default TLDeviceLockMonitor: lockState: 9, unlockedSinceBoot: 0, "
+                "protectedDataAvailable: 0"));
+    for (const Row& row : rows) {
+      vault.change(row.state);
+      EXPECT_EQ(monitor.protectedDataAvailable(), row.available) << row.state;
+      EXPECT_EQ(monitor.deviceUnlockedSinceBoot(), row.unlocked) << row.state;
+      EXPECT_TRUE(log.has(row.line)) << row.line;
+    }
+  }
+  EXPECT_EQ(vault.cancelled, 7);
+}
+
+TEST(LockMonitor, CallsTheDelegateDirectlyOrOnItsQueue) {
+  FakeVault vault;
+  TLDeviceLockMonitor monitor(vault);
+  const auto observer = std::make_shared<Observer>();
+  monitor.setDelegate(observer, nullptr);
+  for (const uint32_t state : {1u, 2u, 9u, 3u}) vault.change(state);
+  EXPECT_EQ(observer->calls,
+            (std::vector<std::string>{"unavailable", "will be unavailable", "available"}));
+  observer->calls.clear();
+  const auto queue = std::make_shared<platform::SerialQueue>("observer");
+  monitor.setDelegate(observer, queue);
+  for (const uint32_t state : {2u, 1u, 0u}) vault.change(state);
+  queue->drain();
+  EXPECT_EQ(observer->calls,
+            (std::vector<std::string>{"will be unavailable", "unavailable", "available"}));
+}
+
+TEST(LockMonitor, GoesOnWithoutNotifications) {
+  FakeVault vault;
+  vault.status = 5;
+  testsupport::LogCapture log;
+  {
+    const TLDeviceLockMonitor monitor(vault);
+    EXPECT_TRUE(monitor.protectedDataAvailable());
+  }
+  EXPECT_TRUE(
+      log.has("fault TLDeviceLockMonitor: Failed to setup notification handler for "
+              "com.quill.mobile.lockstated.lock_status, error status: 5"));
+  EXPECT_EQ(vault.cancelled, 0);
+}
+
+TEST(FileDeviceVault, ReadsItsFileAndSeesChanges) {
+  const testsupport::TemporaryDirectory directory;
+  const std::string path = directory / "lock_status";
+  const auto vault = platform::makeFileDeviceVault(path);
+  EXPECT_EQ(vault->DVLGetDeviceLockState(0), 0u);
+  EXPECT_EQ(vault->DVLDeviceUnlockedSinceBoot(), 1);
+  platform::SerialQueue queue("vault");
+  std::promise<void> changed;
+  int32_t token = -1;
+  ASSERT_EQ(vault->registerNotification(
+                "n", queue, [&] { changed.set_value(); }, &token),
+            0u);
+  EXPECT_NE(token, -1);
+  ASSERT_TRUE(platform::writeFileAtomically(path, "2 1\n", nullptr));
+  changed.get_future().wait();
+  EXPECT_EQ(vault->DVLGetDeviceLockState(0), 2u);
+  vault->cancel(token);
+  for (const char* garbled : {"", "x", "1", "1 2", "-1 1", "0 1 1", "99999999999 1"}) {
+    ASSERT_TRUE(platform::writeFileAtomically(path, garbled, nullptr));
+    EXPECT_EQ(vault->DVLGetDeviceLockState(0), 1u) << garbled;
+    EXPECT_EQ(vault->DVLDeviceUnlockedSinceBoot(), 0) << garbled;
+  }
+}

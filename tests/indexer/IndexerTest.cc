@@ -1,0 +1,417 @@
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <future>
+#include <thread>
+
+#include "docstore/TALSqliteDocStore.h"
+#include "indexer/Snippet.h"
+#include "indexer/TALIndexer.h"
+#include "platform/Files.h"
+#include "platform/StateCapture.h"
+#include "records/TLParamsManager.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using enum TLAttributeKey;
+using Outcome = std::optional<TLError>;
+
+std::shared_ptr<TLIndexableItem> mail(const std::string& identifier, const std::string& subject,
+                                      const std::string& body = "", double date = 0) {
+  auto item = std::make_shared<TLIndexableItem>();
+  item->setIdentifier(platform::fromUTF8(identifier));
+  item->addAttributeWithKeyStringValue(SUBJECT, platform::fromUTF8(subject));
+  if (!body.empty()) item->addAttributeWithKeyStringValue(TEXT_CONTENT, platform::fromUTF8(body));
+  if (date != 0) item->addAttributeWithKeyDoubleValue(MAIL_DATE_RECEIVED, date);
+  return item;
+}
+
+class IndexerTest : public testing::Test {
+ protected:
+  IndexerTest() { open(); }
+  ~IndexerTest() override {
+    if (indexer != nullptr) indexer->shutdown();
+  }
+
+  void open() {
+    store = std::make_shared<TALSqliteDocStore>(directory / "docstore/docstore.db");
+    ASSERT_TRUE(store->openWithError(nullptr));
+    indexer = std::make_unique<TALIndexer>(directory / "salt", "testing", store);
+  }
+  void reopen() {
+    indexer->shutdown();
+    indexer.reset();
+    open();
+  }
+
+  // Calls an operation with a completion and waits for its outcome.
+  template <typename Start>
+  static Outcome wait(const Start& start) {
+    std::promise<Outcome> promise;
+    start([&promise](const Outcome& outcome) { promise.set_value(outcome); });
+    return promise.get_future().get();
+  }
+  Outcome add(TALIndexer::Items items) {
+    return wait([&](auto done) { indexer->addDocs(std::move(items), "mail_bundle_id", done); });
+  }
+  Outcome remove(TALIndexer::Strings identifiers) {
+    return wait([&](auto done) {
+      indexer->deleteItemsByIdentifiers(std::move(identifiers), "mail_bundle_id", done);
+    });
+  }
+
+  // Identifiers of the results, in order, separated by blanks; the error's message after a failure.
+  std::string search(const std::string& text, std::shared_ptr<TLParameters> overrides = nullptr) {
+    TLQuery query;
+    query.setOriginalQuery(platform::fromUTF8(text));
+    query.setSearchParams(std::move(overrides));
+    Outcome error;
+    const auto items = indexer->search(query, &error);
+    if (error) return error->message;
+    std::string out;
+    for (const auto& item : items) {
+      if (!out.empty()) out += ' ';
+      out += platform::printable(item->identifier());
+    }
+    return out;
+  }
+
+  testsupport::LogCapture log;
+  testsupport::TemporaryDirectory directory;
+  std::shared_ptr<TALSqliteDocStore> store;
+  std::unique_ptr<TALIndexer> indexer;
+};
+
+std::shared_ptr<TLParameters> parameters(TLStringView text) {
+  return TLParamsManager::paramsFromString(text);
+}
+
+}  // namespace
+
+TEST_F(IndexerTest, FindsByWordPhraseAndPrefixAndRanksByZone) {
+  ASSERT_EQ(add({mail("body", "Monday", "the invoice for lunch"),
+                 mail("subject", "Invoice for lunch"), mail("other", "Dinner", "an invitation")}),
+            std::nullopt);
+  EXPECT_EQ(search("invoice"), "subject body");
+  EXPECT_EQ(search("inv"), "subject other body");
+  EXPECT_EQ(search("inv "), "");
+  EXPECT_EQ(search("invoice for lunch"), "subject body");
+  EXPECT_EQ(search("lunch invoice"), "subject body");
+  EXPECT_EQ(search("INVOICE, dinner"), "");
+  EXPECT_EQ(search("?!"), "Query processor failed to generate query terms");
+  EXPECT_TRUE(log.has("error TALIndexer: Query processor failed to generate query terms"));
+}
+
+TEST_F(IndexerTest, EqualScoresGoByDateThenIdentifier) {
+  ASSERT_EQ(
+      add({mail("a", "x", "", 1000000), mail("b", "x", "", 3000000), mail("c", "x", "", 1000000)}),
+      std::nullopt);
+  EXPECT_EQ(search("x"), "b c a");
+  const double recent = 1.7e9;  // where a float is 128 seconds wide
+  ASSERT_EQ(add({mail("m", "near", "", recent + 64), mail("n", "near", "", recent)}), std::nullopt);
+  EXPECT_EQ(search("near"), "n m");
+}
+
+TEST_F(IndexerTest, FreshnessCountsOnlyWithAWeight) {
+  const double now = static_cast<double>(std::time(nullptr));
+  ASSERT_EQ(add({mail("old", "word", "", now - 86400 * 400.0), mail("new", "word word", "", now)}),
+            std::nullopt);
+  TLQuery query;
+  query.setOriginalQuery(u"word");
+  query.setSearchParams(parameters(u"ranking.freshnessWeight=0.5"));
+  const auto items = indexer->search(query, nullptr);
+  ASSERT_EQ(items.size(), 2u);
+  EXPECT_EQ(items[1]->card()->freshness(), -1.0);
+  EXPECT_EQ(items[0]->card()->freshness(), 0.0);
+  EXPECT_FLOAT_EQ(items[1]->card()->lightScore(), 0.9F - 0.5F);
+  EXPECT_EQ(query.searchParams()->keyvaluesCount(), 30u);
+}
+
+TEST(Ranking, FreshnessPenaltyAndComparison) {
+  const double day = 86400;
+  const std::vector<std::pair<double, double>> ages{
+      {-5, 0}, {0, 0}, {day, 0}, {3 * day, -1 / 7.52}, {366.2 * day, -1}, {1e9, -1}};
+  for (const auto& [age, penalty] : ages) {
+    EXPECT_NEAR(TALIndexer::_computeFreshnessPenalty(1e9, 1e9 + age), penalty, 1e-3) << age;
+  }
+  EXPECT_GT(TALIndexer::_computeFreshnessPenalty(0, 360 * day), -1.0);
+  EXPECT_EQ(TALIndexer::_floatCompare(1, 1), 0);
+  EXPECT_EQ(TALIndexer::_floatCompare(1, 2), -1);
+  EXPECT_EQ(TALIndexer::_floatCompare(2, 1), 1);
+  EXPECT_EQ(TALIndexer::_floatCompare(NAN, 1), 1);
+  EXPECT_EQ(TALIndexer::_floatCompare(1, NAN), 1);
+}
+
+TEST_F(IndexerTest, SendingAgainAddsNothingAndAChangeIsFoundByItsNewWords) {
+  ASSERT_EQ(add({mail("a", "first words", "some body")}), std::nullopt);
+  const auto before = indexer->docStats();
+  ASSERT_EQ(add({mail("a", "first words", "some body")}), std::nullopt);
+  const auto after = indexer->docStats();
+  EXPECT_EQ(before.at("TLDebugServiceSaltTotalSuffixes"),
+            after.at("TLDebugServiceSaltTotalSuffixes"));
+  EXPECT_EQ(after.at("TLDebugServiceDocStoreNumOfItems"), 1);
+  ASSERT_EQ(add({mail("a", "changed words")}), std::nullopt);
+  EXPECT_EQ(search("changed"), "a");
+  EXPECT_EQ(indexer->docStats().at("TLDebugServiceTextStoreNumOfItems"), 1);
+  EXPECT_EQ(indexer->docStats().size(), 18u);
+}
+
+TEST_F(IndexerTest, ARepeatedIdentifierInABatchIsOneDocumentMergedFromBoth) {
+  auto second = std::make_shared<TLIndexableItem>();
+  second->setIdentifier(u"a");
+  second->addAttributeWithKeyStringValue(TEXT_CONTENT, u"later body");
+  ASSERT_EQ(add({mail("a", "early subject", "replaced text"), second}), std::nullopt);
+  EXPECT_EQ(search("early"), "a");
+  EXPECT_EQ(search("later"), "a");
+  EXPECT_EQ(search("replaced"), "");
+  EXPECT_EQ(store->count(nullptr), 1);
+  EXPECT_TRUE(log.contains("default TALIndexer: Indexed 1 docs in time:"));
+}
+
+TEST_F(IndexerTest, AnUpdateWithoutTextLeavesTheIndexUntouched) {
+  ASSERT_EQ(add({mail("a", "subject")}), std::nullopt);
+  const auto before = indexer->docStats();
+  auto update = std::make_shared<TLIndexableItem>();
+  update->setIdentifier(u"a");
+  update->addAttributeWithKeyDoubleValue(MAIL_DATE_RECEIVED, 77);
+  ASSERT_EQ(add({update}), std::nullopt);
+  EXPECT_EQ(indexer->docStats().at("TLDebugServiceSaltIndexTimeSecs"),
+            before.at("TLDebugServiceSaltIndexTimeSecs"));
+  EXPECT_EQ(store->documentWithID(1, nullptr)->doubleValueForKey(MAIL_DATE_RECEIVED), 77);
+  EXPECT_EQ(*store->documentWithID(1, nullptr)->stringValueForKey(SUBJECT), u"subject");
+}
+
+TEST_F(IndexerTest, HTMLPersonsAndListsGoToTheirZones) {
+  auto item = std::make_shared<TLIndexableItem>();
+  item->setIdentifier(u"a");
+  item->addAttributeWithKeyBytesValue(HTML_CONTENT_DATA,
+                                      "<p>Gr\xC3\xBC\xC3\x9F"
+                                      "e <b>aus</b> Bern</p>");
+  auto person = std::make_shared<TLPerson>();
+  person->setName(u"Ada Lovelace");
+  person->setEmailAddress(u"ada@example.org");
+  item->addAttributeWithKeyPersonValues(AUTHORS, {{person}});
+  item->addAttributeWithKeyStringValues(ATTACHMENT_NAMES, {{u"report_2024.pdf"}});
+  item->addAttributeWithKeyStringValues(MAILBOXES, {{u"Inbox"}});
+  item->addAttributeWithKeyStringValue(CONTENT_DESCRIPTION, u"unsearchable");
+  ASSERT_EQ(add({item}), std::nullopt);
+  for (const char* text :
+       {"grusse aus bern", "lovelace", "ada example", "report", "2024"}) {
+    EXPECT_EQ(search(text), "a") << text;
+  }
+  EXPECT_EQ(search("unsearchable"), "");
+  EXPECT_EQ(search("inbox"), "");  // no zone of free text
+  EXPECT_EQ(*store->documentWithID(1, nullptr)->stringValueForKey(CONTENT_SNIPPET),
+            u"Gr\u00fc\u00dfe aus Bern");
+}
+
+TEST_F(IndexerTest, DeletedDocumentsStayGoneAcrossARestart) {
+  ASSERT_EQ(add({mail("a", "word"), mail("b", "word"), mail("c", "word")}), std::nullopt);
+  EXPECT_EQ(remove({u"b"}), std::nullopt);
+  EXPECT_EQ(search("word"), "c a");
+  reopen();
+  EXPECT_EQ(search("word"), "c a");
+  ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
+  EXPECT_EQ(search("word"), "c b a");
+}
+
+TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
+  ASSERT_EQ(add({mail("a", "word"), mail("b", "word")}), std::nullopt);
+  const Outcome error = remove({u"a", u"nobody", u"b"});
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->domain, "DocStore");
+  EXPECT_TRUE(
+      log.contains("Failed to fetch document ID in docstore for URL tlw://mail_bundle_id/nobody"));
+  EXPECT_EQ(search("word"), "b");
+  EXPECT_TRUE(remove({u""}));
+}
+
+TEST_F(IndexerTest, DeletesByDomain) {
+  TALIndexer::Items items;
+  for (int i = 0; i < 6; ++i) {
+    items.push_back(mail(std::to_string(i), "word"));
+    items.back()->setDomainIdentifier(i % 2 == 0 ? u"even" : u"odd");
+  }
+  ASSERT_EQ(add(items), std::nullopt);
+  EXPECT_EQ(wait([&](auto done) {
+              indexer->deleteItemsByDomainIdentifiers({u"even", u"none"}, done);
+            }),
+            std::nullopt);
+  EXPECT_EQ(search("word"), "5 3 1");
+  EXPECT_EQ(store->count(nullptr), 3);
+}
+
+TEST_F(IndexerTest, AnItemWithoutIdentifierStoresNothingOfTheBatch) {
+  for (const char* bad : {"", "two words", "\xC3\xA9", "[x"}) {
+    const Outcome error = add({mail("a", "word"), mail(bad, "My secret plan")});
+    ASSERT_TRUE(error) << bad;
+    EXPECT_EQ(*error, (TLError{"TALIndexer", 1, "document has no identifier"}));
+  }
+  EXPECT_EQ(store->count(nullptr), 0);
+  EXPECT_TRUE(log.contains("subject: \"My...\"<14 chars>, docURL: (null)"));
+  EXPECT_FALSE(log.contains("secret"));
+}
+
+TEST_F(IndexerTest, AZoneTooLargeFailsTheRestOfTheBatchAndASecondTryHeals) {
+  const std::string tooLarge(200001, 'x');
+  const Outcome error = add({mail("a", "word"), mail("b", "", tooLarge), mail("c", "word")});
+  ASSERT_TRUE(error);
+  EXPECT_EQ(*error, (TLError{"TALIndexer", 1, "index failed"}));
+  EXPECT_TRUE(log.has("error SALT: Zone text too large."));
+  EXPECT_TRUE(
+      log.contains("Indexed 1 docs in SALT, aborting indexing of remaining 0 docs due to error"));
+  EXPECT_EQ(search("word"), "a");
+  EXPECT_EQ(add({mail("c", "word")}), std::nullopt);
+  EXPECT_EQ(search("word"), "c a");
+}
+
+TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccess) {
+  const auto combined = [&](TALIndexer::Items items, TALIndexer::Strings gone,
+                            std::optional<std::string> state) {
+    return wait([&](auto done) {
+      indexer->addDocs(std::move(items), std::move(gone), std::move(state), u"client",
+                       "mail_bundle_id", done);
+    });
+  };
+  const auto fetch = [&](const TLString& name) {
+    std::optional<std::string> state;
+    indexer->fetchLastClientStateforName(name,
+                                         [&](const auto& value, const auto&) { state = value; });
+    return state;
+  };
+  EXPECT_EQ(fetch(u"client"), std::nullopt);
+  EXPECT_EQ(combined({mail("a", "word")}, {}, std::string("one\0two", 7)), std::nullopt);
+  EXPECT_EQ(fetch(u"client"), std::string("one\0two", 7));
+  EXPECT_TRUE(combined({mail("", "word")}, {}, "bad"));
+  EXPECT_TRUE(combined({mail("b", "word")}, {u"nobody"}, "bad"));
+  EXPECT_EQ(fetch(u"client"), std::string("one\0two", 7));
+  EXPECT_EQ(search("word"), "a");
+  EXPECT_EQ(combined({mail("b", "word")}, {u"a"}, std::nullopt), std::nullopt);
+  EXPECT_EQ(search("word"), "b");
+  EXPECT_EQ(fetch(u"client"), std::string("one\0two", 7));
+  EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+  EXPECT_EQ(fetch(u"client"), std::nullopt);
+}
+
+TEST_F(IndexerTest, AResetForgetsAllAndGoesOn) {
+  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+  EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+  EXPECT_EQ(search("word"), "");
+  ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
+  EXPECT_EQ(search("word"), "b");
+  EXPECT_EQ(store->documentIDWithURL(*TLURL::parse("tlw://mail_bundle_id/b"), nullptr), 1u);
+}
+
+TEST_F(IndexerTest, IndexAndStoreNeverDifferInWhatTheyKnowOf) {
+  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+  indexer->shutdown();
+  ASSERT_TRUE(platform::removeItem(directory / "salt", nullptr));
+  open();
+  EXPECT_EQ(store->count(nullptr), 0);
+  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+  indexer->shutdown();
+  ASSERT_TRUE(platform::removeItem(directory / "docstore", nullptr));
+  open();
+  EXPECT_EQ(search("word"), "");
+  EXPECT_EQ(indexer->docStats().at("TLDebugServiceTextStoreNumOfItems"), 0);
+  EXPECT_TRUE(log.has("default TALIndexer: SALT was reset"));
+}
+
+TEST_F(IndexerTest, ADocumentThatTheStoreLostIsLeftOut) {
+  ASSERT_EQ(add({mail("a", "word"), mail("b", "word")}), std::nullopt);
+  ASSERT_TRUE(store->deleteDocument(1, nullptr));
+  EXPECT_EQ(search("word"), "b");
+  EXPECT_TRUE(
+      log.contains("error TALIndexer: Internal docid 1 not found in docstore. Text score: 0.9"));
+}
+
+TEST_F(IndexerTest, AfterShutdownEverythingSaysSo) {
+  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+  indexer->shutdown();
+  const TLError shuttingDown{"TALIndexer", 4, "shutting down"};
+  EXPECT_EQ(add({mail("b", "word")}), shuttingDown);
+  EXPECT_EQ(search("word"), "shutting down");
+  EXPECT_TRUE(indexer->docStats().is_null());
+  EXPECT_EQ(indexer->saltMetrics(), "");
+  EXPECT_FALSE(indexer->iterateAllDocsToFindMatchingSubjects({u"word"}, nullptr));
+}
+
+TEST_F(IndexerTest, AnEmptyPathGivesAnIndexerWithoutIndex) {
+  TALIndexer empty("", "class", store);
+  EXPECT_TRUE(log.has("fault TALIndexer: No path specified for index."));
+  EXPECT_TRUE(empty.docStats().is_null());
+}
+
+TEST_F(IndexerTest, StateIsCapturedFromTheQueue) {
+  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+  const auto records = platform::captureState();
+  ASSERT_EQ(records.size(), 1u);
+  EXPECT_STREQ(records[0].c_str() + 136, "testing index stats");
+  EXPECT_EQ(nlohmann::json::from_cbor(records[0].substr(200)),
+            (nlohmann::json{{"DocStoreNumItems", 1}, {"SaltNumItems", 1}}));
+}
+
+TEST_F(IndexerTest, SubjectsAreFoundByAWalkOverTheStore) {
+  ASSERT_EQ(add({mail("a", "One"), mail("b", "Two"), mail("c", "One")}), std::nullopt);
+  auto items = indexer->iterateAllDocsToFindMatchingSubjects({u"One"}, nullptr);
+  ASSERT_TRUE(items);
+  EXPECT_EQ(items->size(), 2u);
+  EXPECT_TRUE(log.has("default TALIndexer: Verification Query Successful"));
+  items = indexer->iterateAllDocsToFindMatchingSubjects({u"one", u"Two"}, nullptr);
+  EXPECT_EQ(items->size(), 1u);
+  EXPECT_TRUE(log.has(
+      "default TALIndexer: [Linear Search] Subject with No Doc Match: <\"on...\"<3 chars>>"));
+  EXPECT_TRUE(log.has("fault TALIndexer: Verification Query Failed"));
+}
+
+TEST_F(IndexerTest, SearchesAndStatisticsRunBesideIngest) {
+  std::atomic<bool> done{false};
+  std::thread reader([&] {
+    while (!done) {
+      search("word");
+      static_cast<void>(indexer->docStats());
+      static_cast<void>(indexer->saltMetrics());
+    }
+  });
+  for (int round = 0; round < 20; ++round) {
+    TALIndexer::Items items;
+    for (int i = 0; i < 10; ++i)
+      items.push_back(mail(std::to_string(i), "word " + std::to_string(round)));
+    ASSERT_EQ(add(items), std::nullopt);
+    ASSERT_EQ(remove({u"0", u"5"}), std::nullopt);
+    if (round == 10) {
+      ASSERT_EQ(wait([&](auto completion) { indexer->resetWithCompletionHandler(completion); }),
+                std::nullopt);
+    }
+  }
+  done = true;
+  reader.join();
+  EXPECT_EQ(search("word 19"), "9 8 7 6 4 3 2 1");
+}
+
+TEST(Snippet, CleansWhiteSpace) {
+  const TLString two(2, u'\u2008');
+  const std::vector<std::pair<TLString, std::optional<TLString>>> cases{
+      {u"", std::nullopt},
+      {u" \n\t\u00a0\ufffc", u" \n\t\u00a0\ufffc"},
+      {u"a\n\nb", u"a" + two + u"b"},
+      {u"a\nb", u"a\u2008b"},
+      {u"a \n b", u"a  \u2008b"},
+      {u"\ufffc \r\nhello\r\n\r\n", u"hello"},
+      {u"a\t \u00a0b", u"a b"},
+      {u"a\u0001\ufffcb", u"a\u0001\ufffcb"},
+  };
+  for (const auto& [body, snippet] : cases) EXPECT_EQ(snippetOfBody(body), snippet);
+  EXPECT_EQ(snippetOfBody(std::nullopt), std::nullopt);
+}
+
+TEST(Snippet, EndsAfterAbout300UnitsAndNeverInsideACharacter) {
+  EXPECT_EQ(snippetOfBody(TLString(1000, u'x'))->size(), 300u);
+  EXPECT_EQ(snippetOfBody(TLString(300, u'x'))->size(), 300u);
+  EXPECT_EQ(snippetOfBody(TLString(299, u'x') + u"\n\nyz")->size(), 302u);
+  EXPECT_EQ(snippetOfBody(TLString(299, u'x') + u"\U0001F600 more")->size(), 299u);
+  EXPECT_EQ(snippetOfBody(TLString(299, u'x') + u"e\u0301 more")->size(), 299u);
+  EXPECT_EQ(snippetOfBody(TLString(298, u'x') + u"e\u0301\u0302 more")->size(), 298u);
+}
