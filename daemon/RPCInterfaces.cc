@@ -17,8 +17,9 @@ std::optional<TALSearchService::Items> readItems(RPCArguments& arguments, const 
   for (size_t i = 0; i < encoded.size(); ++i) {
     auto item = std::make_shared<TLIndexableItem>();
     if (!item->initWithData(encoded[i])) {
-      reply->sendFailure(platform::kRPCInvalidArgs,
-                         fmt::format("argument 0 (items), index {}: the bytes are no TLIndexableItem", i));
+      reply->sendFailure(
+          platform::kRPCInvalidArgs,
+          fmt::format("argument 0 (items), index {}: the bytes are no TLIndexableItem", i));
       return std::nullopt;
     }
     items.push_back(std::move(item));
@@ -56,7 +57,8 @@ void deleteItems(TALSearchService& service, RPCArguments& arguments, const Reply
   auto identifiers = readStrings(arguments);
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
-  service.deleteItemsWithIdentifiers(std::move(identifiers), name, protectionClass, replyWithError(reply));
+  service.deleteItemsWithIdentifiers(std::move(identifiers), name, protectionClass,
+                                     replyWithError(reply));
 }
 
 void indexAndDeleteItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
@@ -69,8 +71,8 @@ void indexAndDeleteItems(TALSearchService& service, RPCArguments& arguments, con
   if (stateGiven) state = std::string(bytes);
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
-  service.indexItems(std::move(*items), std::move(identifiers), std::move(state), name, protectionClass,
-                     replyWithError(reply));
+  service.indexItems(std::move(*items), std::move(identifiers), std::move(state), name,
+                     protectionClass, replyWithError(reply));
 }
 
 void fetchState(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
@@ -107,15 +109,15 @@ void searchItems(TALSearchService& service, RPCArguments& arguments, const Reply
   const uint64_t options = arguments.readUInt64();
   const std::string protectionClass(arguments.readString());
   const int64_t maxResults = arguments.readInt64();
-  service.searchItemsForQuery(
-      query, options, protectionClass, maxResults,
-      [&reply](const std::optional<TALSearchService::Items>& items, const std::optional<TLError>& error) {
-        if (error) return reply->sendError(*error);
-        platform::RPCBytesArray encoded;
-        encoded.reserve(items->size());
-        for (const auto& item : *items) encoded.push_back(item->data());
-        reply->send({std::move(encoded)});
-      });
+  service.searchItemsForQuery(query, options, protectionClass, maxResults,
+                              [&reply](const std::optional<TALSearchService::Items>& items,
+                                       const std::optional<TLError>& error) {
+                                if (error) return reply->sendError(*error);
+                                platform::RPCBytesArray encoded;
+                                encoded.reserve(items->size());
+                                for (const auto& item : *items) encoded.push_back(item->data());
+                                reply->send({std::move(encoded)});
+                              });
 }
 
 void ping(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
@@ -142,7 +144,8 @@ void fetchIndexerStats(TALSearchService& service, RPCArguments& arguments, const
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
   service.fetchStatsForIndexerNamed(
-      name, protectionClass, [&reply](const nlohmann::json& stats, const std::optional<TLError>& error) {
+      name, protectionClass,
+      [&reply](const nlohmann::json& stats, const std::optional<TLError>& error) {
         if (error) return reply->sendError(*error);
         reply->send({toDictionary(stats)});
       });
@@ -167,7 +170,8 @@ void forceVacuum(TALSearchService& service, RPCArguments& arguments, const Reply
 using Operation = void (*)(TALSearchService&, RPCArguments&, const Reply&);
 
 platform::RPCMethod method(TALSearchService& service, const char* member, const char* input,
-                           const char* output, std::vector<const char*> names, Operation operation) {
+                           const char* output, std::vector<const char*> names,
+                           Operation operation) {
   return {member, input, output, std::move(names),
           [&service, operation](RPCArguments& arguments, Reply reply) {
             operation(service, arguments, reply);
@@ -178,18 +182,20 @@ platform::RPCMethod method(TALSearchService& service, const char* member, const 
 
 RPCInterface makeSearchServiceProtocol(TALSearchService& service) {
   return {{
-      method(service, "IndexItems", "aayss", "", {"items", "toIndexerNamed", "protectionClass"}, indexItems),
+      method(service, "IndexItems", "aayss", "", {"items", "toIndexerNamed", "protectionClass"},
+             indexItems),
       method(service, "DeleteItemsWithIdentifiers", "asss", "",
              {"identifiers", "fromIndexerNamed", "protectionClass"}, deleteItems),
       method(service, "IndexItemsDeleteItemsWithIdentifiers", "aayasbayss", "",
-             {"items", "deleteItemsWithIdentifiers", "clientStateGiven", "clientState", "toIndexerNamed",
-              "protectionClass"},
+             {"items", "deleteItemsWithIdentifiers", "clientStateGiven", "clientState",
+              "toIndexerNamed", "protectionClass"},
              indexAndDeleteItems),
       method(service, "FetchLastClientState", "ss", "bay",
              {"fromIndexerNamed", "protectionClass", "present", "clientState"}, fetchState),
       method(service, "DeleteItemsWithDomainIdentifiers", "asss", "",
              {"domainIdentifiers", "fromIndexerNamed", "protectionClass"}, deleteDomains),
-      method(service, "DeleteAllItems", "ss", "", {"fromIndexerNamed", "protectionClass"}, deleteAll),
+      method(service, "DeleteAllItems", "ss", "", {"fromIndexerNamed", "protectionClass"},
+             deleteAll),
       method(service, "SearchItemsForQuery", "aytsx", "aay",
              {"query", "options", "protectionClass", "maxResults", "items"}, searchItems),
   }};

@@ -6,8 +6,8 @@
 inline constexpr const char* kSearchServiceName = "com.quill.tallowsearch.SearchService";
 inline constexpr const char* kDebugServiceName = "com.quill.tallow.DebugService";
 
-// The operations of the two services as members of their RPC interfaces. Records are decoded here: bytes
-// that do not parse are refused, with the argument and the index named, and nothing of the call is done.
-// The service must outlive the interfaces.
+// The operations of the two services as members of their RPC interfaces. Records are decoded here:
+// bytes that do not parse are refused, with the argument and the index named, and nothing of the
+// call is done. The service must outlive the interfaces.
 [[nodiscard]] platform::RPCInterface makeSearchServiceProtocol(TALSearchService& service);
 [[nodiscard]] platform::RPCInterface makeDebugServiceProtocol(TALSearchService& service);

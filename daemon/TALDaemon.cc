@@ -33,8 +33,7 @@ std::unique_ptr<TALDaemon> TALDaemon::init(platform::RunLoop& loop, const std::s
 
 TALDaemon::TALDaemon(platform::RunLoop& loop, const std::string& path,
                      const std::string& runtimeDirectory)
-    : _searchService(
-          std::make_unique<TALSearchService>(std::make_shared<TALIndexerManager>(path))),
+    : _searchService(std::make_unique<TALSearchService>(std::make_shared<TALIndexerManager>(path))),
       _searchServiceProtocol(makeSearchServiceProtocol(*_searchService)),
       _debugServiceProtocol(makeDebugServiceProtocol(*_searchService)),
       _searchServiceListener(platform::makeRPCListener(loop, runtimeDirectory, kSearchServiceName)),

@@ -10,14 +10,16 @@
 
 // The one service object of the process and the two listeners that export it.
 //
-// Threads: all operations belong to the main thread; requests arrive on the threads of the connections.
+// Threads: all operations belong to the main thread; requests arrive on the threads of the
+// connections.
 class TALDaemon {
  public:
   // Makes the daemon once. Null, with a fault in the log, when the data root cannot be created.
   static TALDaemon* sharedInstance();
 
   // Null when the data root `path` cannot be created. Sockets lie in `runtimeDirectory`.
-  [[nodiscard]] static std::unique_ptr<TALDaemon> init(platform::RunLoop& loop, const std::string& path,
+  [[nodiscard]] static std::unique_ptr<TALDaemon> init(platform::RunLoop& loop,
+                                                       const std::string& path,
                                                        const std::string& runtimeDirectory);
   ~TALDaemon();
 

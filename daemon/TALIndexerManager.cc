@@ -21,12 +21,13 @@ bool namesOneDirectory(const std::string& name) {
 bool createClassDirectory(const std::string& root, const std::string& protectionClass,
                           TLErrorOut error) {
   if (!namesOneDirectory(protectionClass)) {
-    platform::setError(error, platform::posixError(protectionClass.size() > kLongestName ? ENAMETOOLONG
-                                                                                         : EINVAL,
-                                                   "a protection class must name one directory"));
+    platform::setError(
+        error, platform::posixError(protectionClass.size() > kLongestName ? ENAMETOOLONG : EINVAL,
+                                    "a protection class must name one directory"));
     return false;
   }
-  return platform::createDirectories(platform::joinPath(root, protectionClass), error, protectionClass);
+  return platform::createDirectories(platform::joinPath(root, protectionClass), error,
+                                     protectionClass);
 }
 
 }  // namespace
@@ -67,7 +68,8 @@ std::shared_ptr<TALIndexer> TALIndexerManager::indexerWithProtectionClass(
     return nullptr;
   }
   if (protectionClass == SysFileProtectionComplete && !lock.protectedDataAvailable) {
-    log().error("Not providing an SysFileProtectionComplete indexer without protected data available.");
+    log().error(
+        "Not providing an SysFileProtectionComplete indexer without protected data available.");
     platform::setError(error, indexerUnavailableError());
     return nullptr;
   }
@@ -107,7 +109,7 @@ std::shared_ptr<TALIndexer> TALIndexerManager::_createIndexerWithProtectionType(
     return nullptr;
   }
   const std::string saltPath = platform::joinPath(directory, "salt");
-  log().standard("Creating indexer saltPath={} docStorePath: {} synonymPath: {}", saltPath, docStorePath,
-                 platform::synonymFilePath());
+  log().standard("Creating indexer saltPath={} docStorePath: {} synonymPath: {}", saltPath,
+                 docStorePath, platform::synonymFilePath());
   return std::make_shared<TALIndexer>(saltPath, protectionClass, std::move(docStore));
 }

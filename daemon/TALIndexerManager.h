@@ -13,13 +13,14 @@
 // The strictest protection class: its data cannot be read while the device is locked.
 inline constexpr const char* SysFileProtectionComplete = "SysFileProtectionComplete";
 
-// Owns the indexers, one for each data-protection class, made on first use and kept; and refuses one while
-// the device's state does not allow access to the class.
+// Owns the indexers, one for each data-protection class, made on first use and kept; and refuses
+// one while the device's state does not allow access to the class.
 //
-// A class is any string that can name one directory: its data lies below the data root under that name.
+// A class is any string that can name one directory: its data lies below the data root under that
+// name.
 //
-// Threads: any. Lookups and creations run one at a time on the manager's queue; a creation opens the class's
-// databases there, and requests for other classes wait behind it.
+// Threads: any. Lookups and creations run one at a time on the manager's queue; a creation opens
+// the class's databases there, and requests for other classes wait behind it.
 class TALIndexerManager {
  public:
   // What the manager asks the device.
@@ -34,10 +35,10 @@ class TALIndexerManager {
 
   [[nodiscard]] std::vector<std::shared_ptr<TALIndexer>> allIndexers();
 
-  // The indexer of the class, or null with an error: indexerUnavailableError, or that of the file system
-  // or of the store, and then nothing is kept and the next request tries again.
-  [[nodiscard]] std::shared_ptr<TALIndexer> indexerWithProtectionClass(const std::string& protectionClass,
-                                                                       TLErrorOut error);
+  // The indexer of the class, or null with an error: indexerUnavailableError, or that of the file
+  // system or of the store, and then nothing is kept and the next request tries again.
+  [[nodiscard]] std::shared_ptr<TALIndexer> indexerWithProtectionClass(
+      const std::string& protectionClass, TLErrorOut error);
 
   // The data root.
   [[nodiscard]] const std::string& path() const { return _path; }

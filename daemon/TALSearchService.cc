@@ -43,7 +43,9 @@ const platform::Log& TALSearchService::log() {
 TALSearchService::TALSearchService(std::shared_ptr<TALIndexerManager> indexerManager)
     : _indexerManager(std::move(indexerManager)) {}
 
-std::string TALSearchService::cleanName(const std::string& name) { return name.empty() ? kEmpty : name; }
+std::string TALSearchService::cleanName(const std::string& name) {
+  return name.empty() ? kEmpty : name;
+}
 
 std::string TALSearchService::cleanProtectionClass(const std::string& protectionClass) {
   return protectionClass.empty() ? kEmpty : protectionClass;
@@ -81,21 +83,23 @@ void TALSearchService::runItemOperation(
     return;
   }
   if (indexer == nullptr) return;
-  operation(*indexer, [description, start, reply = std::move(reply)](const std::optional<TLError>& outcome) {
-    reply(outcome);
-    log().standard("Finished {}, timeTaken={} ms", description, elapsedMillisSinceMonotonicTime(start));
-  });
+  operation(*indexer,
+            [description, start, reply = std::move(reply)](const std::optional<TLError>& outcome) {
+              reply(outcome);
+              log().standard("Finished {}, timeTaken={} ms", description,
+                             elapsedMillisSinceMonotonicTime(start));
+            });
 }
 
 void TALSearchService::indexItems(Items items, const std::string& toIndexerNamed,
                                   const std::string& protectionClass, TLErrorReply reply) {
-  runItemOperation(fmt::format("indexItems numDocuments={}, callerName={}, protectionClass={}",
-                               items.size(), cleanName(toIndexerNamed),
-                               cleanProtectionClass(protectionClass)),
-                   protectionClass, std::move(reply),
-                   [&](TALIndexer& indexer, TALIndexer::Completion completion) {
-                     indexer.addDocs(std::move(items), kBundleID, std::move(completion));
-                   });
+  runItemOperation(
+      fmt::format("indexItems numDocuments={}, callerName={}, protectionClass={}", items.size(),
+                  cleanName(toIndexerNamed), cleanProtectionClass(protectionClass)),
+      protectionClass, std::move(reply),
+      [&](TALIndexer& indexer, TALIndexer::Completion completion) {
+        indexer.addDocs(std::move(items), kBundleID, std::move(completion));
+      });
 }
 
 void TALSearchService::deleteItemsWithIdentifiers(Strings identifiers,
@@ -104,8 +108,10 @@ void TALSearchService::deleteItemsWithIdentifiers(Strings identifiers,
                                                   TLErrorReply reply) {
   runItemOperation(
       fmt::format("deleteItemsWithIdentifiers numDocuments={}, callerName={}, protectionClass={}",
-                  identifiers.size(), cleanName(fromIndexerNamed), cleanProtectionClass(protectionClass)),
-      protectionClass, std::move(reply), [&](TALIndexer& indexer, TALIndexer::Completion completion) {
+                  identifiers.size(), cleanName(fromIndexerNamed),
+                  cleanProtectionClass(protectionClass)),
+      protectionClass, std::move(reply),
+      [&](TALIndexer& indexer, TALIndexer::Completion completion) {
         indexer.deleteItemsByIdentifiers(std::move(identifiers), kBundleID, std::move(completion));
       });
 }
@@ -115,10 +121,12 @@ void TALSearchService::deleteItemsWithDomainIdentifiers(Strings domainIdentifier
                                                         const std::string& protectionClass,
                                                         TLErrorReply reply) {
   runItemOperation(
-      fmt::format("deleteItemsWithDomainIdentifiers numDocuments={}, callerName={}, protectionClass={}",
-                  domainIdentifiers.size(), cleanName(fromIndexerNamed),
-                  cleanProtectionClass(protectionClass)),
-      protectionClass, std::move(reply), [&](TALIndexer& indexer, TALIndexer::Completion completion) {
+      fmt::format(
+          "deleteItemsWithDomainIdentifiers numDocuments={}, callerName={}, protectionClass={}",
+          domainIdentifiers.size(), cleanName(fromIndexerNamed),
+          cleanProtectionClass(protectionClass)),
+      protectionClass, std::move(reply),
+      [&](TALIndexer& indexer, TALIndexer::Completion completion) {
         indexer.deleteItemsByDomainIdentifiers(std::move(domainIdentifiers), std::move(completion));
       });
 }
@@ -136,8 +144,8 @@ void TALSearchService::deleteAllItemsFromIndexerNamed(const std::string& name,
 
 void TALSearchService::indexItems(Items items, Strings deleteItemsWithIdentifiers,
                                   std::optional<std::string> clientState,
-                                  const std::string& toIndexerNamed, const std::string& protectionClass,
-                                  TLErrorReply reply) {
+                                  const std::string& toIndexerNamed,
+                                  const std::string& protectionClass, TLErrorReply reply) {
   const std::string name = cleanName(toIndexerNamed);
   const std::string shownClass = cleanProtectionClass(protectionClass);
   const size_t count = items.size();
@@ -147,18 +155,20 @@ void TALSearchService::indexItems(Items items, Strings deleteItemsWithIdentifier
   const auto indexer = indexerFor(protectionClass, &error);
   if (error) return reply(error);
   if (indexer == nullptr) return;
-  indexer->addDocs(std::move(items), std::move(deleteItemsWithIdentifiers), std::move(clientState),
-                   platform::fromUTF8(toIndexerNamed), kBundleID,
-                   [count, name, shownClass, reply = std::move(reply)](const std::optional<TLError>& outcome) {
-                     reply(outcome);
-                     log().standard("indexItems done for {} documents for name={}, protectionClass={}",
-                                    count, name, shownClass);
-                   });
+  indexer->addDocs(
+      std::move(items), std::move(deleteItemsWithIdentifiers), std::move(clientState),
+      platform::fromUTF8(toIndexerNamed), kBundleID,
+      [count, name, shownClass, reply = std::move(reply)](const std::optional<TLError>& outcome) {
+        reply(outcome);
+        log().standard("indexItems done for {} documents for name={}, protectionClass={}", count,
+                       name, shownClass);
+      });
 }
 
 void TALSearchService::fetchLastClientStateFromIndexerNamed(
     const std::string& name, const std::string& protectionClass,
-    const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>& reply) {
+    const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>&
+        reply) {
   const std::string shownClass = cleanProtectionClass(protectionClass);
   log().standard("fetchLastClientStateWithCompletionHandler requested for protectionClass={}",
                  shownClass);
@@ -170,7 +180,8 @@ void TALSearchService::fetchLastClientStateFromIndexerNamed(
       platform::fromUTF8(name),
       [&](const std::optional<std::string>& state, const std::optional<TLError>& outcome) {
         reply(state, outcome);
-        log().standard("fetchLastClientStateWithCompletionHandler done for protectionClass={}", shownClass);
+        log().standard("fetchLastClientStateWithCompletionHandler done for protectionClass={}",
+                       shownClass);
       });
 }
 
@@ -195,7 +206,8 @@ void TALSearchService::searchItemsForQuery(
   if (indexer == nullptr) return;
 
   if (isMailVerificationQuery(&query)) {
-    log().standard("Query: [{}] detected to be a Verification Query", platform::redacted(query.rawQuery()));
+    log().standard("Query: [{}] detected to be a Verification Query",
+                   platform::redacted(query.rawQuery()));
     const Strings subjects = subjectsFromRawQuery(platform::orEmpty(query.rawQuery()));
     const auto found = handleVerificationQueryWithIndexer(*indexer, query, subjects, &error);
     if (error) {
@@ -210,8 +222,8 @@ void TALSearchService::searchItemsForQuery(
   }
 
   Items items = indexer->search(query, &error);
-  Signpost::end(signpost, "SearchQuery", "query {} found {} items", platform::redacted(query.rawQuery()),
-                items.size());
+  Signpost::end(signpost, "SearchQuery", "query {} found {} items",
+                platform::redacted(query.rawQuery()), items.size());
   const auto maximum = static_cast<uint64_t>(maxResults);
   if (items.size() > maximum) items.resize(maximum);
   log().standard("Finished {}, results={}, timeTaken={} ms", description, items.size(),
@@ -235,8 +247,8 @@ void TALSearchService::ping(const std::string& input,
 void TALSearchService::fetchStatsForIndexerNamed(
     const std::string& name, const std::string& protectionClass,
     const std::function<void(const nlohmann::json&, const std::optional<TLError>&)>& reply) {
-  log().standard("fetchStatsForIndexerNamed requested for name={}, protectionClass={}", cleanName(name),
-                 cleanProtectionClass(protectionClass));
+  log().standard("fetchStatsForIndexerNamed requested for name={}, protectionClass={}",
+                 cleanName(name), cleanProtectionClass(protectionClass));
   std::optional<TLError> error;
   const auto indexer = indexerFor(protectionClass, &error);
   if (error) return reply(nullptr, error);
@@ -245,9 +257,10 @@ void TALSearchService::fetchStatsForIndexerNamed(
 
 void TALSearchService::fetchStatsForSaltNamed(
     const std::string& name, const std::string& protectionClass,
-    const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>& reply) {
-  log().standard("fetchStatsForSaltNamed requested for name={}, protectionClass={}", cleanName(name),
-                 cleanProtectionClass(protectionClass));
+    const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>&
+        reply) {
+  log().standard("fetchStatsForSaltNamed requested for name={}, protectionClass={}",
+                 cleanName(name), cleanProtectionClass(protectionClass));
   std::optional<TLError> error;
   const auto indexer = indexerFor(protectionClass, &error);
   if (error) return reply(std::nullopt, error);

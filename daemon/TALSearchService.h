@@ -14,16 +14,16 @@
 
 using TLErrorReply = std::function<void(const std::optional<TLError>&)>;
 
-// The object behind both RPC services. For each request it turns the protection class into an indexer,
-// calls that, and delivers the outcome through the reply. It makes no errors of its own.
+// The object behind both RPC services. For each request it turns the protection class into an
+// indexer, calls that, and delivers the outcome through the reply. It makes no errors of its own.
 //
-// The name that clients give selects no indexer: it stands in the log, and is the client state's name.
-// A query that only asks whether messages with given subjects are there (an OR of at least five equal
-// comparisons of the subject) is answered by exact comparison.
+// The name that clients give selects no indexer: it stands in the log, and is the client state's
+// name. A query that only asks whether messages with given subjects are there (an OR of at least
+// five equal comparisons of the subject) is answered by exact comparison.
 //
-// Threads: every operation runs on the caller's thread, and several may run at once. Item operations return
-// at once and reply from the indexer's queue; searches and statistics reply before they return. After
-// `shutdown` a request gets no indexer, and its reply is not called.
+// Threads: every operation runs on the caller's thread, and several may run at once. Item
+// operations return at once and reply from the indexer's queue; searches and statistics reply
+// before they return. After `shutdown` a request gets no indexer, and its reply is not called.
 class TALSearchService {
  public:
   using Items = TALIndexer::Items;
@@ -32,24 +32,27 @@ class TALSearchService {
   explicit TALSearchService(std::shared_ptr<TALIndexerManager> indexerManager);
 
   // The search service.
-  void indexItems(Items items, const std::string& toIndexerNamed, const std::string& protectionClass,
-                  TLErrorReply reply);
+  void indexItems(Items items, const std::string& toIndexerNamed,
+                  const std::string& protectionClass, TLErrorReply reply);
   void deleteItemsWithIdentifiers(Strings identifiers, const std::string& fromIndexerNamed,
                                   const std::string& protectionClass, TLErrorReply reply);
-  void indexItems(Items items, Strings deleteItemsWithIdentifiers, std::optional<std::string> clientState,
-                  const std::string& toIndexerNamed, const std::string& protectionClass,
-                  TLErrorReply reply);
+  void indexItems(Items items, Strings deleteItemsWithIdentifiers,
+                  std::optional<std::string> clientState, const std::string& toIndexerNamed,
+                  const std::string& protectionClass, TLErrorReply reply);
   void fetchLastClientStateFromIndexerNamed(
       const std::string& name, const std::string& protectionClass,
-      const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>& reply);
-  void deleteItemsWithDomainIdentifiers(Strings domainIdentifiers, const std::string& fromIndexerNamed,
+      const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>&
+          reply);
+  void deleteItemsWithDomainIdentifiers(Strings domainIdentifiers,
+                                        const std::string& fromIndexerNamed,
                                         const std::string& protectionClass, TLErrorReply reply);
   void deleteAllItemsFromIndexerNamed(const std::string& name, const std::string& protectionClass,
                                       TLErrorReply reply);
   // The items are null only beside an error. The query is changed: it gets its resolved parameters.
   // `maxResults` is compared as unsigned, so that a negative one truncates nothing.
   void searchItemsForQuery(
-      TLQuery& query, uint64_t withOption, const std::string& forProtectionClass, int64_t maxResults,
+      TLQuery& query, uint64_t withOption, const std::string& forProtectionClass,
+      int64_t maxResults,
       const std::function<void(const std::optional<Items>&, const std::optional<TLError>&)>& reply);
 
   // The debug service.
@@ -57,10 +60,11 @@ class TALSearchService {
   void fetchStatsForIndexerNamed(
       const std::string& name, const std::string& protectionClass,
       const std::function<void(const nlohmann::json&, const std::optional<TLError>&)>& reply);
-  void fetchStatsForSaltNamed(
-      const std::string& name, const std::string& protectionClass,
-      const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>& reply);
-  void forceVacuumAndCompactForProtectionClass(const std::string& protectionClass, TLErrorReply reply);
+  void fetchStatsForSaltNamed(const std::string& name, const std::string& protectionClass,
+                              const std::function<void(const std::optional<std::string>&,
+                                                       const std::optional<TLError>&)>& reply);
+  void forceVacuumAndCompactForProtectionClass(const std::string& protectionClass,
+                                               TLErrorReply reply);
 
   // Shuts every indexer down in turn, and waits for each.
   void shutdown();
@@ -68,7 +72,8 @@ class TALSearchService {
   // "<empty>" for an empty text, so that no log line shows an empty field.
   [[nodiscard]] static std::string cleanName(const std::string& name);
   [[nodiscard]] static std::string cleanProtectionClass(const std::string& protectionClass);
-  [[nodiscard]] static std::string _searchDescriptionWithOptions(uint64_t options, int64_t maxResults);
+  [[nodiscard]] static std::string _searchDescriptionWithOptions(uint64_t options,
+                                                                 int64_t maxResults);
 
   [[nodiscard]] static bool isMailVerificationQuery(const TLQuery* query);
   // The subjects of a verification query's text, in order.
@@ -86,7 +91,8 @@ class TALSearchService {
                         TLErrorReply reply,
                         const std::function<void(TALIndexer&, TALIndexer::Completion)>& operation);
   std::optional<Items> handleVerificationQueryWithIndexer(TALIndexer& indexer, TLQuery& query,
-                                                          const Strings& subjects, TLErrorOut error);
+                                                          const Strings& subjects,
+                                                          TLErrorOut error);
 
   mutable platform::Mutex _mutex;
   std::shared_ptr<TALIndexerManager> _indexerManager TL_GUARDED_BY(_mutex);

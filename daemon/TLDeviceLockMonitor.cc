@@ -56,7 +56,8 @@ void TLDeviceLockMonitor::_deviceLockSetupNotification() {
   const uint32_t status = _vault.registerNotification(
       kNotification, _dispatchQueue, [this] { lockStateChanged(); }, &_lockStateNotifyToken);
   if (status != 0) {
-    log().fault("Failed to setup notification handler for {}, error status: {}", kNotification, status);
+    log().fault("Failed to setup notification handler for {}, error status: {}", kNotification,
+                status);
   }
 }
 
@@ -73,8 +74,8 @@ void TLDeviceLockMonitor::lockStateChanged() {
   const StateRow& row = kStates[state];
   _protectedDataAvailable = row.available;
   if (row.available) _deviceUnlockedSinceBoot = true;
-  log().standard("{} with state: {}, unlockedSinceBoot: {:d}, protectedDataAvailable {:d}", row.word, state,
-                 deviceUnlockedSinceBoot(), protectedDataAvailable());
+  log().standard("{} with state: {}, unlockedSinceBoot: {:d}, protectedDataAvailable {:d}",
+                 row.word, state, deviceUnlockedSinceBoot(), protectedDataAvailable());
   notifyDelegate(row.call, row.available);
 }
 

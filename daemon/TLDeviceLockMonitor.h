@@ -17,11 +17,12 @@ class TLDeviceLockObserver {
   virtual void protectedDataDidBecomeUnavailable() = 0;
 };
 
-// Knows whether the device has been unlocked at least once since boot, and whether protected data can be
-// read now.
+// Knows whether the device has been unlocked at least once since boot, and whether protected data
+// can be read now.
 //
-// Threads: the two facts are read from any thread, without a lock, and may lag by one notification. They
-// are written on the monitor's own queue. The observer is called there, or on the queue given with it.
+// Threads: the two facts are read from any thread, without a lock, and may lag by one notification.
+// They are written on the monitor's own queue. The observer is called there, or on the queue given
+// with it.
 class TLDeviceLockMonitor {
  public:
   static TLDeviceLockMonitor& sharedInstance();

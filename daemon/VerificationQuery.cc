@@ -14,7 +14,8 @@ constexpr TLStringView kSeparator = u"' || ";
 
 bool isSubjectClause(const TLQueryNode& node) {
   return node.mergeOp() == TLQueryNodeMergeOp::LEAF && node.op() == TLQueryNodeOp::STRING_EQUAL &&
-         node.keysCount() == 1 && node.keyAtIndex(0) == static_cast<int32_t>(TLAttributeKey::SUBJECT);
+         node.keysCount() == 1 &&
+         node.keyAtIndex(0) == static_cast<int32_t>(TLAttributeKey::SUBJECT);
 }
 
 TLString replaceAll(TLStringView text, TLStringView from, TLStringView to) {
@@ -93,7 +94,8 @@ std::optional<TALSearchService::Items> TALSearchService::handleVerificationQuery
   const auto maxTopK = static_cast<uint64_t>(query.searchParams()->intValueForKey("salt.maxTopK"));
   if (results.size() >= maxTopK || results.size() < subjects.size()) {
     log().standard(
-        "[Verification Query] Query contains {} subjects but search retrieved {} docs (max_limit = {}), "
+        "[Verification Query] Query contains {} subjects but search retrieved {} docs (max_limit = "
+        "{}), "
         "will use a slow linear search for finding the subjects",
         subjects.size(), results.size(), maxTopK);
     return indexer.iterateAllDocsToFindMatchingSubjects(subjects, error);
@@ -106,7 +108,8 @@ std::optional<TALSearchService::Items> TALSearchService::handleVerificationQuery
       found.insert(*subject);
       matched.push_back(item);
     } else {
-      log().standard("[Verification Query] Doc with No Subject Match: <{}>", platform::redacted(subject));
+      log().standard("[Verification Query] Doc with No Subject Match: <{}>",
+                     platform::redacted(subject));
     }
   }
   for (const TLString& subject : found) remaining.erase(subject);
@@ -119,7 +122,8 @@ std::optional<TALSearchService::Items> TALSearchService::handleVerificationQuery
     return matched;
   }
   log().standard(
-      "[Verification Query] Couldn't find results for {} subjects, will use a slow linear search for "
+      "[Verification Query] Couldn't find results for {} subjects, will use a slow linear search "
+      "for "
       "finding the subjects",
       remaining.size());
   return indexer.iterateAllDocsToFindMatchingSubjects(subjects, error);

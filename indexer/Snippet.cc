@@ -14,8 +14,12 @@ constexpr char16_t kLineBreakSign = u'\u2008';
 // How far around the cut a character of many units is looked for.
 constexpr size_t kLongestCharacter = 64;
 
-bool isLineBreak(char16_t unit) { return unit == u'\n' || unit == u'\r'; }
-bool isBlank(char16_t unit) { return unit == u'\t' || unit == u' ' || unit == u'\u00A0'; }
+bool isLineBreak(char16_t unit) {
+  return unit == u'\n' || unit == u'\r';
+}
+bool isBlank(char16_t unit) {
+  return unit == u'\t' || unit == u' ' || unit == u'\u00A0';
+}
 bool isSkippedAtStart(char16_t unit) {
   return isLineBreak(unit) || isBlank(unit) || unit == u'\uFFFC';
 }

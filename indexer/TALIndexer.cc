@@ -64,7 +64,9 @@ TALIndexer::TALIndexer(std::string path, const std::string& protectionClass,
       });
 }
 
-TALIndexer::~TALIndexer() { _logStateCaptureCancellationBlock(); }
+TALIndexer::~TALIndexer() {
+  _logStateCaptureCancellationBlock();
+}
 
 std::shared_ptr<TALDocStore> TALIndexer::docStore() const {
   MutexLock lock(_docStoreMutex);
@@ -97,7 +99,8 @@ void TALIndexer::_init() {
       }
     }
     if (!platform::createDirectories(_path, &error)) {
-      log().error("Could not create intermediate directory {}: {}", _path, platform::printable(error));
+      log().error("Could not create intermediate directory {}: {}", _path,
+                  platform::printable(error));
       return;
     }
     loadTextStore();
@@ -113,7 +116,8 @@ void TALIndexer::makeQueryObjects() {
     tk = tokenizer::NewFastLexemonTokenizer(locale);
     if (tk == nullptr) log().error("Failed to create lexemon tokenizer for locale: {}", locale);
   }
-  if (_queryProcessor == nullptr) _queryProcessor = TALQueryProcessor::initWithZoneManager(_zoneManager);
+  if (_queryProcessor == nullptr)
+    _queryProcessor = TALQueryProcessor::initWithZoneManager(_zoneManager);
 }
 
 void TALIndexer::loadTextStore() {
@@ -143,8 +147,8 @@ void TALIndexer::loadTextStore() {
       nullptr);
 }
 
-// A text index made from nothing empties the document store, so that the two never differ in what they
-// know of.
+// A text index made from nothing empties the document store, so that the two never differ in what
+// they know of.
 void TALIndexer::createTextStore(int64_t storedDocuments) {
   log().standard("Could not find path, creating new textstore at path {}", _path);
   uint64_t start = platform::monotonicTicks();
@@ -277,13 +281,15 @@ void TALIndexer::fetchLastClientStateforName(
   log().debug("fetchLastClientStateWithCompletionHandler started");
   std::optional<TLError> error;
   std::optional<std::string> value;
-  if (const auto store = docStore()) value = store->metadataValueForKey(clientStateKey(name), &error);
+  if (const auto store = docStore())
+    value = store->metadataValueForKey(clientStateKey(name), &error);
   if (error) {
-    log().error("fetchLastClientStateWithCompletionHandler name: {} error: {}", platform::toUTF8(name),
-                platform::printable(error));
+    log().error("fetchLastClientStateWithCompletionHandler name: {} error: {}",
+                platform::toUTF8(name), platform::printable(error));
   } else {
     log().standard(
-        "fetchLastClientStateWithCompletionHandler successfully fetched client state name: {} (length "
+        "fetchLastClientStateWithCompletionHandler successfully fetched client state name: {} "
+        "(length "
         "{})",
         platform::toUTF8(name), value ? value->size() : 0);
   }
@@ -303,7 +309,8 @@ nlohmann::json TALIndexer::docStats() {
   return {
       {"TLDebugServiceDocStoreNumOfItems", documents},
       {"TLDebugServiceTextStoreNumOfItems", m.Docs},
-      {"TLDebugServiceTextStoreNumOfItemsWithHtmlBody", zoneCount(m, TLAttributeKey::HTML_CONTENT_DATA)},
+      {"TLDebugServiceTextStoreNumOfItemsWithHtmlBody",
+       zoneCount(m, TLAttributeKey::HTML_CONTENT_DATA)},
       {"TLDebugServiceTextStoreNumOfItemsWithTextBody", zoneCount(m, TLAttributeKey::TEXT_CONTENT)},
       {"TLDebugServiceTextStoreSize", m.TextBytes},
       {"TLDebugServiceSaltMaxDocID", m.MaxDocID},
@@ -327,7 +334,9 @@ std::string TALIndexer::saltMetrics() {
   return _textStore == nullptr ? std::string() : std::string(_textStore->GetMetrics());
 }
 
-void TALIndexer::close() { setTextStore(nullptr); }
+void TALIndexer::close() {
+  setTextStore(nullptr);
+}
 
 void TALIndexer::shutdown() {
   log().standard("Shutting down indexer...");

@@ -31,17 +31,21 @@ enum class TALIndexerError {
   validationFailed = 5,  // "index validation failed"
 };
 
-// The heart of one protection class: one text index, one document store, and all work that changes them.
+// The heart of one protection class: one text index, one document store, and all work that changes
+// them.
 //
-// Threads. The destructor waits for what is queued, so it must not run on the queue. Adds, deletes, reset and vacuum run one after the other on the indexer's own queue; the
-// operations that start them return at once, from any thread, and completions run on the queue. Searches,
-// statistics and the client state run on the caller's thread.
+// Threads. The destructor waits for what is queued, so it must not run on the queue. Adds, deletes,
+// reset and vacuum run one after the other on the indexer's own queue; the operations that start
+// them return at once, from any thread, and completions run on the queue. Searches, statistics and
+// the client state run on the caller's thread.
 //
 // Invariants.
-// 1. `_textStore` is replaced or deleted only by who holds both `_indexMutex` and `_textStoreMutex`, so
+// 1. `_textStore` is replaced or deleted only by who holds both `_indexMutex` and
+// `_textStoreMutex`, so
 //    holding either keeps it. `_queue` work that changes it takes both.
 // 2. A search holds `_indexMutex` for one pass, a batch for all its documents: they never overlap.
-// 3. The document store is written before the text index. What a search finds in the index and not in the
+// 3. The document store is written before the text index. What a search finds in the index and not
+// in the
 //    store is left out.
 // 4. After `shutdown` no work runs: what is queued, or comes later, completes with "shutting down".
 class TALIndexer {
@@ -50,22 +54,23 @@ class TALIndexer {
   using Strings = std::vector<TLString>;
   using Completion = std::function<void(const std::optional<TLError>&)>;
 
-  // Opens, or makes, the text index in the directory `path`. The store is open. Never fails: problems are
-  // logged, and an indexer without index or tokenizer reports them with each call.
+  // Opens, or makes, the text index in the directory `path`. The store is open. Never fails:
+  // problems are logged, and an indexer without index or tokenizer reports them with each call.
   TALIndexer(std::string path, const std::string& protectionClass,
              std::shared_ptr<TALDocStore> docStore);
   ~TALIndexer();
   TALIndexer(const TALIndexer&) = delete;
   TALIndexer& operator=(const TALIndexer&) = delete;
 
-  // Ingest. A document can be found once the completion has been called without error. A batch that fails
-  // in the text index stays stored; its rest is found once it is sent again.
+  // Ingest. A document can be found once the completion has been called without error. A batch that
+  // fails in the text index stays stored; its rest is found once it is sent again.
   void addDocs(Items docs, std::string bundleID, Completion completionHandler);
   // Deletes first, then adds, then stores the state; each only when all before it has succeeded.
   void addDocs(Items docs, Strings deleteItemsByIdentifiers, std::optional<std::string> clientState,
                TLString clientStateName, std::string bundleID, Completion completionHandler);
   // An identifier that is not known ends the list with an error; earlier deletions stand.
-  void deleteItemsByIdentifiers(Strings identifiers, std::string bundleID, Completion completionHandler);
+  void deleteItemsByIdentifiers(Strings identifiers, std::string bundleID,
+                                Completion completionHandler);
   void deleteItemsByDomainIdentifiers(Strings domainIdentifiers, Completion completionHandler);
 
   // Forgets all documents and all client states.
@@ -83,22 +88,24 @@ class TALIndexer {
   // The metrics of the text index for people; empty without index. Reads all stored text.
   [[nodiscard]] std::string saltMetrics();
 
-  // Ranked items, at most "salt.maxTopK", each with its card. Writes the resolved parameters into the
-  // query. With a failure the result is empty and the error set.
+  // Ranked items, at most "salt.maxTopK", each with its card. Writes the resolved parameters into
+  // the query. With a failure the result is empty and the error set.
   [[nodiscard]] Items search(TLQuery& query, TLErrorOut error);
 
-  // Every stored document whose subject is one of `subjects`, in the store's order, without scores; none
-  // with an error set when the store fails. Reads every document.
+  // Every stored document whose subject is one of `subjects`, in the store's order, without scores;
+  // none with an error set when the store fails. Reads every document.
   [[nodiscard]] std::optional<Items> iterateAllDocsToFindMatchingSubjects(const Strings& subjects,
                                                                           TLErrorOut error);
 
-  // Refuses further work, waits for what runs, closes index and store. Not from the indexer's queue.
+  // Refuses further work, waits for what runs, closes index and store. Not from the indexer's
+  // queue.
   void shutdown();
 
   [[nodiscard]] const std::string& path() const { return _path; }
   [[nodiscard]] std::shared_ptr<TALDocStore> docStore() const;
 
-  // The key of a document in the store; none for an empty identifier or one that makes no valid URL.
+  // The key of a document in the store; none for an empty identifier or one that makes no valid
+  // URL.
   [[nodiscard]] static std::optional<TLURL> documentURLForIdentifier(
       const std::optional<TLString>& identifier, const std::string& bundleID);
 
@@ -140,28 +147,31 @@ class TALIndexer {
       TL_REQUIRES(_indexMutex);
   bool _indexDoc(const TLIndexableItem& doc, uint32_t docID, uint64_t* docParsingTime)
       TL_REQUIRES(_indexMutex);
-  std::optional<TLError> addAndStoreState(const Items& docs, const std::optional<std::string>& clientState,
-                                          const TLString& clientStateName, const std::string& bundleID);
+  std::optional<TLError> addAndStoreState(const Items& docs,
+                                          const std::optional<std::string>& clientState,
+                                          const TLString& clientStateName,
+                                          const std::string& bundleID);
   bool _deleteItemsByIdentifiers(const Strings& identifiers, const std::string& bundleID,
                                  TLErrorOut error);
-  bool _deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error) TL_REQUIRES(_indexMutex);
-
-  Items searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms, TLErrorOut error)
+  bool _deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
+
+  Items searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms,
+                   TLErrorOut error) TL_REQUIRES(_indexMutex);
   Items retrieveItems(const std::vector<saltsearch::DocResult>& results, const TLQuery& query,
                       double queryTime, TLErrorOut error);
   static std::vector<saltsearch::Term> _populateQueryTerms(const std::vector<TALTerm>& terms);
   static void _fillScores(TLIndexableItem& item, const saltsearch::DocResult& indexerResult,
                           double queryTime, float textScoreWeight, float freshnessWeight);
-  static float _lightWeightScoring(const TLIndexableItem& item, double queryTime, float textScoreWeight,
-                                   float freshnessWeight);
+  static float _lightWeightScoring(const TLIndexableItem& item, double queryTime,
+                                   float textScoreWeight, float freshnessWeight);
   static void rankItems(Items& items);
   static void logRanking(const TLQuery& query, const Items& items);
 
   const std::string _path;
-  TALZoneManager _zoneManager;                          // self-synchronised
-  std::unique_ptr<tokenizer::Tokenizer> tk;             // fixed after construction
-  std::unique_ptr<TALQueryProcessor> _queryProcessor;   // fixed after construction
+  TALZoneManager _zoneManager;                         // self-synchronised
+  std::unique_ptr<tokenizer::Tokenizer> tk;            // fixed after construction
+  std::unique_ptr<TALQueryProcessor> _queryProcessor;  // fixed after construction
 
   platform::Mutex _indexMutex;
   // Held for as long as one reads `_textStore` without `_indexMutex`; taken after it.

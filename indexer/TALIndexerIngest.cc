@@ -15,7 +15,8 @@ using platform::Signpost;
 
 struct TALIndexer::Batch {
   std::vector<TLURL> docURLs;  // one per input item, same order
-  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>> oldDocs;  // what the store knows already
+  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>>
+      oldDocs;  // what the store knows already
   std::unordered_map<TLURL, uint32_t> oldDocIDs;
   std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>> mergedDocs;  // the final form
   std::unordered_set<TLURL> urlsToIndex;  // whose text must go into the text index
@@ -24,8 +25,8 @@ struct TALIndexer::Batch {
 
 namespace {
 
-// The store gives 0 for an unknown document and calls that no error; to delete one is one, under the
-// store's domain and the number that its engine has for "not found".
+// The store gives 0 for an unknown document and calls that no error; to delete one is one, under
+// the store's domain and the number that its engine has for "not found".
 constexpr int kDocumentNotFound = 12;
 constexpr const char* kDocStoreErrorDomain = "DocStore";
 
@@ -86,7 +87,8 @@ void TALIndexer::addDocs(Items docs, Strings deleteItemsByIdentifiers,
         if (!identifiers.empty()) {
           std::optional<TLError> error;
           const uint64_t signpost = Signpost::identifierForObject(&identifiers);
-          Signpost::begin(signpost, "deleteItemsByIdentifiers", "delete {} items", identifiers.size());
+          Signpost::begin(signpost, "deleteItemsByIdentifiers", "delete {} items",
+                          identifiers.size());
           _deleteItemsByIdentifiers(identifiers, bundleID, &error);
           Signpost::end(signpost, "deleteItemsByIdentifiers", "");
           if (error) return error;
@@ -140,8 +142,8 @@ bool TALIndexer::makeDocURLs(const Items& docs, const std::string& bundleID, Bat
   for (const auto& doc : docs) {
     auto url = documentURLForIdentifier(doc->identifier(), bundleID);
     if (!url) {
-      log().error("Aborting indexing of {} docs as invalid docURL generated for doc {}", docs.size(),
-                  describe(*doc, bundleID, url));
+      log().error("Aborting indexing of {} docs as invalid docURL generated for doc {}",
+                  docs.size(), describe(*doc, bundleID, url));
       _errorWithCode(TALIndexerError::document, "document has no identifier", error);
       return false;
     }
@@ -155,13 +157,15 @@ bool TALIndexer::fetchOldDocs(Batch& batch, TLErrorOut error) {
   std::optional<TLError> failure;
   batch.oldDocs = docStore()->documentsWithURLs(batch.docURLs, &failure, &batch.oldDocIDs);
   if (failure) {
-    log().error("Aborting indexing of {} docs as failed to fetch old documents from docstore with error: {}",
-                batch.docURLs.size(), platform::printable(failure));
+    log().error(
+        "Aborting indexing of {} docs as failed to fetch old documents from docstore with error: "
+        "{}",
+        batch.docURLs.size(), platform::printable(failure));
     platform::setError(error, *failure);
     return false;
   }
-  log().debug("Fetched {} old docs, queried {} docURLs in docstore in time: {} ms", batch.oldDocs.size(),
-              batch.docURLs.size(), elapsedMillisSinceMonotonicTime(start));
+  log().debug("Fetched {} old docs, queried {} docURLs in docstore in time: {} ms",
+              batch.oldDocs.size(), batch.docURLs.size(), elapsedMillisSinceMonotonicTime(start));
   return true;
 }
 
@@ -179,7 +183,7 @@ void TALIndexer::mergeDocs(const Items& docs, Batch& batch) {
     }
     const auto old = prior != batch.mergedDocs.end() ? prior->second : stored->second;
     bool shouldIndexNewDoc = false;
-    batch.mergedDocs[url] = _zoneManager.mergeNewDoc(*docs[i], *old, &shouldIndexNewDoc);
+    batch.mergedDocs[url] = _zoneManager.mergeNewDoc(*docs[i], old.get(), &shouldIndexNewDoc);
     if (shouldIndexNewDoc) batch.urlsToIndex.insert(url);
     ++merges;
   }
@@ -199,21 +203,22 @@ bool TALIndexer::storeDocs(Batch& batch, TLErrorOut error) {
   }
   // A failed commit is reported by the error alone.
   std::optional<TLError> failure;
-  const bool updated = docsToUpdate.empty() ||
-                       docStore()->storeOrUpdateDocuments(docsToUpdate, batch.oldDocIDs,
-                                                          &batch.newDocIDs, &failure);
+  const bool updated =
+      docsToUpdate.empty() ||
+      docStore()->storeOrUpdateDocuments(docsToUpdate, batch.oldDocIDs, &batch.newDocIDs, &failure);
   if (!updated || failure) {
-    log().error("Aborting indexing of {} docs as failed to update {} docs in docstore with error: {}",
-                batch.docURLs.size(), docsToUpdate.size(), platform::printable(failure));
+    log().error(
+        "Aborting indexing of {} docs as failed to update {} docs in docstore with error: {}",
+        batch.docURLs.size(), docsToUpdate.size(), platform::printable(failure));
     platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
     return false;
   }
-  const bool inserted =
-      docsToInsert.empty() ||
-      docStore()->storeOrUpdateDocuments(docsToInsert, &batch.newDocIDs, &failure);
+  const bool inserted = docsToInsert.empty() || docStore()->storeOrUpdateDocuments(
+                                                    docsToInsert, &batch.newDocIDs, &failure);
   if (!inserted || failure) {
-    log().error("Aborting indexing of {} docs as failed to store {} new docs in docstore with error: {}",
-                batch.docURLs.size(), docsToInsert.size(), platform::printable(failure));
+    log().error(
+        "Aborting indexing of {} docs as failed to store {} new docs in docstore with error: {}",
+        batch.docURLs.size(), docsToInsert.size(), platform::printable(failure));
     platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
     return false;
   }
@@ -231,8 +236,9 @@ bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t b
     if (batch.urlsToIndex.erase(url) == 0) continue;
     const auto docID = batch.newDocIDs.find(url);
     if (docID == batch.newDocIDs.end() || docID->second == 0) {
-      log().fault("Skipping indexing of doc with docURL: {} as failed to retrieve its internal docID",
-                  url.absoluteString());
+      log().fault(
+          "Skipping indexing of doc with docURL: {} as failed to retrieve its internal docID",
+          url.absoluteString());
       continue;
     }
     const auto merged = batch.mergedDocs.find(url);
@@ -245,18 +251,19 @@ bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t b
     if (!_indexDoc(*merged->second, docID->second, &docParsingTime)) {
       log().error("Failed to index document in salt {}", describe(*merged->second, bundleID, url));
       const TLError failure = _errorWithCode(TALIndexerError::document, "index failed", error);
-      log().error("Indexed {} docs in SALT, aborting indexing of remaining {} docs due to error: {}",
-                  indexed, static_cast<int64_t>(batch.urlsToIndex.size()) - indexed,
-                  platform::printable(failure));
+      log().error(
+          "Indexed {} docs in SALT, aborting indexing of remaining {} docs due to error: {}",
+          indexed, static_cast<int64_t>(batch.urlsToIndex.size()) - indexed,
+          platform::printable(failure));
       return false;
     }
     batch.mergedDocs.erase(merged);
     textStoreMillis += docParsingTime;
     ++indexed;
   }
-  log().standard("Indexed {} docs in time: {} ms (indexing time: {} ms, textstore time: {} ms)", indexed,
-                 elapsedMillisSinceMonotonicTime(batchStart), elapsedMillisSinceMonotonicTime(start),
-                 textStoreMillis);
+  log().standard("Indexed {} docs in time: {} ms (indexing time: {} ms, textstore time: {} ms)",
+                 indexed, elapsedMillisSinceMonotonicTime(batchStart),
+                 elapsedMillisSinceMonotonicTime(start), textStoreMillis);
   return true;
 }
 
@@ -281,7 +288,8 @@ void TALIndexer::deleteItemsByIdentifiers(Strings identifiers, std::string bundl
       [this, identifiers = std::move(identifiers), bundleID = std::move(bundleID)] {
         std::optional<TLError> error;
         const uint64_t signpost = Signpost::identifierForObject(this);
-        Signpost::begin(signpost, "deleteItemsByIdentifiers", "delete {} items", identifiers.size());
+        Signpost::begin(signpost, "deleteItemsByIdentifiers", "delete {} items",
+                        identifiers.size());
         _deleteItemsByIdentifiers(identifiers, bundleID, &error);
         Signpost::end(signpost, "deleteItemsByIdentifiers", "");
         return error;
@@ -324,14 +332,16 @@ bool TALIndexer::_deleteItemsByIdentifiers(const Strings& identifiers, const std
   return true;
 }
 
-void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers, Completion completionHandler) {
+void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
+                                                Completion completionHandler) {
   _scheduleWork(
       "deleteItemsByDomainIdentifiers",
       [this, domains = std::move(domainIdentifiers)] {
         std::optional<TLError> error;
         MutexLock lock(_indexMutex);
         const uint64_t signpost = Signpost::identifierForObject(this);
-        Signpost::begin(signpost, "deleteItemsByDomainIdentifiers", "delete {} domains", domains.size());
+        Signpost::begin(signpost, "deleteItemsByDomainIdentifiers", "delete {} domains",
+                        domains.size());
         for (const TLString& domain : domains) {
           _deleteItemsByDomainIdentifier(domain, &error);
           if (error) break;

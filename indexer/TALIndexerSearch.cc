@@ -64,7 +64,8 @@ std::string rankingEntry(const TLIndexableItem& item) {
   using enum TLAttributeKey;
   const TLCard& card = *item.card();
   return fmt::format(
-      "Mailid: {}\tScores: {{ Text: {:f}.\tFreshness : {:f}.\tLight : {:f}.\tFull : {:f}. }}\nSubject: "
+      "Mailid: {}\tScores: {{ Text: {:f}.\tFreshness : {:f}.\tLight : {:f}.\tFull : {:f}. "
+      "}}\nSubject: "
       "{}.\nBody: {}.\ndateReceived: {}. \nAuthor(s): {}.\nX-From: {}.",
       platform::printable(item.identifier()), card.textScore(), card.freshness(), card.lightScore(),
       card.fullScore(), platform::redacted(item.stringValueForKey(SUBJECT)),
@@ -115,7 +116,7 @@ std::vector<saltsearch::Term> TALIndexer::_populateQueryTerms(const std::vector<
     for (const TLString& token : from.tokens()) to.tokens.push_back(platform::toUTF8(token));
     to.tokenScores = from.tokenScores();
     to.zones.reserve(from.zoneIDs().size());
-    for (const uint32_t zone : from.zoneIDs()) to.zones.push_back(static_cast<uint16_t>(zone));
+    for (const int32_t zone : from.zoneIDs()) to.zones.push_back(static_cast<uint16_t>(zone));
     to.zoneScores = from.zoneScores();
     to.defaultScore = from.scoreNoMatch();
     to.isUnigram = from.isUnigram();
@@ -152,7 +153,8 @@ TALIndexer::Items TALIndexer::searchOnce(const TLQuery& query,
 }
 
 TALIndexer::Items TALIndexer::retrieveItems(const std::vector<saltsearch::DocResult>& results,
-                                            const TLQuery& query, double queryTime, TLErrorOut error) {
+                                            const TLQuery& query, double queryTime,
+                                            TLErrorOut error) {
   const uint64_t signpost = Signpost::identifierForObject(&query);
   Signpost::begin(signpost, "retrieve items", "retrieving {} items", results.size());
   std::vector<uint32_t> ids;
@@ -196,11 +198,12 @@ void TALIndexer::_fillScores(TLIndexableItem& item, const saltsearch::DocResult&
                              double queryTime, float textScoreWeight, float freshnessWeight) {
   item.setCard(std::make_shared<TLCard>());
   item.card()->setTextScore(static_cast<float>(indexerResult.score));
-  item.card()->setLightScore(_lightWeightScoring(item, queryTime, textScoreWeight, freshnessWeight));
+  item.card()->setLightScore(
+      _lightWeightScoring(item, queryTime, textScoreWeight, freshnessWeight));
 }
 
-// The text product is rounded to float, the sum made in double, and rounded to float again: the order is
-// part of the result.
+// The text product is rounded to float, the sum made in double, and rounded to float again: the
+// order is part of the result.
 float TALIndexer::_lightWeightScoring(const TLIndexableItem& item, double queryTime,
                                       float textScoreWeight, float freshnessWeight) {
   TLCard& card = *item.card();
@@ -254,19 +257,20 @@ std::optional<TALIndexer::Items> TALIndexer::iterateAllDocsToFindMatchingSubject
   const auto store = docStore();
   const bool walked =
       store != nullptr &&
-      store->enumerateDocIDs(&failure, [&](int64_t, uint32_t docID, const TLURL& url, bool*, TLErrorOut) {
-        std::optional<TLError> fetchError;
-        const auto doc = store->documentWithID(docID, &fetchError);
-        if (doc == nullptr || fetchError) {
-          log().error("Error in retrieving document with docURL: {} from docstore: {}",
-                      url.absoluteString(), platform::printable(fetchError));
-          return;
-        }
-        const auto& subject = doc->stringValueForKey(TLAttributeKey::SUBJECT);
-        if (!subject || !wanted.contains(*subject)) return;
-        results.push_back(doc);
-        unmatched.erase(*subject);
-      });
+      store->enumerateDocIDs(
+          &failure, [&](int64_t, uint32_t docID, const TLURL& url, bool*, TLErrorOut) {
+            std::optional<TLError> fetchError;
+            const auto doc = store->documentWithID(docID, &fetchError);
+            if (doc == nullptr || fetchError) {
+              log().error("Error in retrieving document with docURL: {} from docstore: {}",
+                          url.absoluteString(), platform::printable(fetchError));
+              return;
+            }
+            const auto& subject = doc->stringValueForKey(TLAttributeKey::SUBJECT);
+            if (!subject || !wanted.contains(*subject)) return;
+            results.push_back(doc);
+            unmatched.erase(*subject);
+          });
   if (!walked) {
     log().error("Error in retriving via DocStore: {}", platform::printable(failure));
     if (!failure) _errorWithCode(TALIndexerError::shuttingDown, "shutting down", &failure);
@@ -276,8 +280,8 @@ std::optional<TALIndexer::Items> TALIndexer::iterateAllDocsToFindMatchingSubject
   for (const TLString& subject : unmatched) {
     log().standard("[Linear Search] Subject with No Doc Match: <{}>", platform::redacted(subject));
   }
-  log().standard("[Linear Search] Total {} subjects received and {} found no match", subjects.size(),
-                 unmatched.size());
+  log().standard("[Linear Search] Total {} subjects received and {} found no match",
+                 subjects.size(), unmatched.size());
   if (unmatched.empty()) {
     log().standard("Verification Query Successful");
   } else {

@@ -43,7 +43,7 @@ const Row* rowForKey(TLAttributeKey key) {
   return nullptr;
 }
 
-void addHTML(zone::Zones& zones, uint32_t zone, const TLAttribute& attribute,
+void addHTML(zone::Zones& zones, int32_t zone, const TLAttribute& attribute,
              const tokenizer::Tokenizer* tokenizer) {
   if (attribute.hasStringValue() && !attribute.stringValue()->empty()) {
     addToZones(zones, zone, *attribute.stringValue(), tokenizer, true);
@@ -55,15 +55,17 @@ void addHTML(zone::Zones& zones, uint32_t zone, const TLAttribute& attribute,
 
 }  // namespace
 
-void populateZones(zone::Zones& zones, const TLIndexableItem& item, const TALZoneManager& zoneManager,
-                   const tokenizer::Tokenizer* tokenizer) {
+void populateZones(zone::Zones& zones, const TLIndexableItem& item,
+                   const TALZoneManager& zoneManager, const tokenizer::Tokenizer* tokenizer) {
   for (const auto& attribute : item.attributes()) {
-    const auto zone = zoneManager.zoneIDForAttributeKey(attribute->key(), attribute->customKey());
+    const auto zone = zoneManager.zoneIDForAttributeKey(static_cast<int32_t>(attribute->key()),
+                                                        attribute->customKey());
     const Row* row = rowForKey(attribute->key());
     if (!zone || row == nullptr) continue;
     switch (row->source) {
       case Source::string:
-        addToZones(zones, *zone, platform::orEmpty(attribute->stringValue()), tokenizer, row->tokenize);
+        addToZones(zones, *zone, platform::orEmpty(attribute->stringValue()), tokenizer,
+                   row->tokenize);
         break;
       case Source::strings:
         for (const TLString& text : attribute->stringValues()) {
@@ -76,7 +78,7 @@ void populateZones(zone::Zones& zones, const TLIndexableItem& item, const TALZon
       case Source::persons:
         for (const auto& person : attribute->personValues()) {
           addToZones(zones, *zone, platform::orEmpty(person->name()), tokenizer, true);
-          addToZones(zones, static_cast<uint32_t>(row->emailZone),
+          addToZones(zones, static_cast<int32_t>(row->emailZone),
                      platform::orEmpty(person->emailAddress()), tokenizer, true);
         }
         break;
@@ -84,7 +86,7 @@ void populateZones(zone::Zones& zones, const TLIndexableItem& item, const TALZon
   }
 }
 
-void addToZones(zone::Zones& zones, uint32_t zoneNumber, TLStringView text,
+void addToZones(zone::Zones& zones, int32_t zoneNumber, TLStringView text,
                 const tokenizer::Tokenizer* tokenizer, bool tokenize) {
   if (text.empty()) return;
   zone::Zone& zone = zones.GetZone(static_cast<uint16_t>(zoneNumber));

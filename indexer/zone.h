@@ -43,6 +43,8 @@ class Zones {
   [[nodiscard]] size_t size() const { return _zones.size(); }
   [[nodiscard]] auto begin() const { return _zones.begin(); }
   [[nodiscard]] auto end() const { return _zones.end(); }
+  [[nodiscard]] auto begin() { return _zones.begin(); }
+  [[nodiscard]] auto end() { return _zones.end(); }
 
  private:
   std::unordered_map<uint16_t, Zone> _zones;

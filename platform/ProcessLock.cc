@@ -18,15 +18,17 @@ std::unique_ptr<ProcessLock> ProcessLock::acquire(const std::string& path, TLErr
     return nullptr;
   }
   if (flock(descriptor, LOCK_EX | LOCK_NB) != 0) {
-    setError(error, errno == EWOULDBLOCK
-                        ? TLError{kPOSIXErrorDomain, EWOULDBLOCK, path + " is held by a running daemon"}
-                        : posixError(errno, path));
+    setError(error, errno == EWOULDBLOCK ? TLError{kPOSIXErrorDomain, EWOULDBLOCK,
+                                                   path + " is held by a running daemon"}
+                                         : posixError(errno, path));
     close(descriptor);
     return nullptr;
   }
   return std::unique_ptr<ProcessLock>(new ProcessLock(descriptor));
 }
 
-ProcessLock::~ProcessLock() { close(_descriptor); }
+ProcessLock::~ProcessLock() {
+  close(_descriptor);
+}
 
 }  // namespace platform

@@ -261,14 +261,18 @@ bool RPCServerConnection::openBus() {
   sd_id128_t id;
   if (sd_bus_new(&_bus) < 0) return false;
   const int descriptor = std::exchange(_descriptor, -1);
+  const auto matchLocalSignal = [this](const char* member, sd_bus_message_handler_t handler) {
+    constexpr const char* kLocal = "org.freedesktop.DBus.Local";
+    return sd_bus_match_signal_async(_bus, nullptr, kLocal, nullptr, kLocal, member, handler,
+                                     nullptr, this) >= 0;
+  };
   const bool ready = sd_bus_set_fd(_bus, descriptor, descriptor) >= 0 &&
                      sd_id128_randomize(&id) >= 0 && sd_bus_set_server(_bus, 1, id) >= 0 &&
                      sd_bus_negotiate_fds(_bus, 0) >= 0 && sd_bus_set_trusted(_bus, 1) >= 0 &&
-                     sd_bus_start(_bus) >= 0 &&
-                     sd_bus_attach_event(_bus, _loop->event(), SD_EVENT_PRIORITY_NORMAL) >= 0 &&
-                     sd_bus_match_signal_async(_bus, nullptr, "org.freedesktop.DBus.Local", nullptr,
-                                               "org.freedesktop.DBus.Local", "Disconnected",
-                                               onDisconnected, nullptr, this) >= 0;
+                     sd_bus_set_connected_signal(_bus, 1) >= 0 && sd_bus_start(_bus) >= 0 &&
+                     matchLocalSignal("Connected", onConnected) &&
+                     matchLocalSignal("Disconnected", onDisconnected) &&
+                     sd_bus_attach_event(_bus, _loop->event(), SD_EVENT_PRIORITY_NORMAL) >= 0;
   if (!ready) log().error("Could not serve connection {}", description());
   return ready;
 }
@@ -302,6 +306,19 @@ bool RPCServerConnection::exportInterface() {
                                               _serviceName.c_str(), _vtable.data(), this);
   if (result < 0) log().error("Could not export {}: {}", _serviceName, std::strerror(-result));
   return result >= 0;
+}
+
+// A call that came in one piece with the end of the authentication is in the bus's buffer now, and
+// the loop would not look at it before more bytes arrive.
+int RPCServerConnection::onConnected(sd_bus_message*, void* data, sd_bus_error*) {
+  auto* connection = static_cast<RPCServerConnection*>(data);
+  connection->_loop->post([connection] { connection->processWaiting(); });
+  return 1;
+}
+
+void RPCServerConnection::processWaiting() {
+  while (!_ending && !_paused && sd_bus_process(_bus, nullptr) > 0) {
+  }
 }
 
 int RPCServerConnection::onDisconnected(sd_bus_message*, void* data, sd_bus_error*) {
@@ -366,8 +383,8 @@ void RPCServerConnection::checkQueue(size_t bytes) {
   end();
 }
 
-// The bus leaves the loop first: one that is attached when the loop ends blocks until its queue is empty,
-// however long the peer does not read.
+// The bus leaves the loop first: one that is attached when the loop ends blocks until its queue is
+// empty, however long the peer does not read.
 void RPCServerConnection::end() {
   _ending = true;
   sd_bus_detach_event(_bus);

@@ -56,6 +56,7 @@ class RPCServerConnection : public RPCConnection {
   void serve();
   bool openBus();
   bool exportInterface();
+  void processWaiting();
   void dispatch(sd_bus_message* message);
   void endCall(uint64_t number, const BuildReply& build, size_t bytes);
   void sendReply(sd_bus_message* call, const BuildReply& build);
@@ -64,6 +65,7 @@ class RPCServerConnection : public RPCConnection {
   void endIfIdle();
   void end();
   static int onMessage(sd_bus_message* message, void* data, sd_bus_error* error);
+  static int onConnected(sd_bus_message* message, void* data, sd_bus_error* error);
   static int onDisconnected(sd_bus_message* message, void* data, sd_bus_error* error);
 
   const std::string _serviceName;

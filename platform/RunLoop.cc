@@ -140,4 +140,9 @@ sd_event* RunLoop::event() const {
   return _body->event;
 }
 
+RunLoop& mainRunLoop() {
+  static auto* loop = new RunLoop;
+  return *loop;
+}
+
 }  // namespace platform

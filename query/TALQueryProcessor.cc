@@ -15,11 +15,11 @@ struct TermWorth {
   double score;
   double noMatch;
 };
-constexpr TermWorth kPhrase{5.0, 1.0};       // a pure bonus
-constexpr TermWorth kWordPair{2.0, 0.8};     // missing it is a small penalty
-constexpr TermWorth kWord{1.0, 0.0};         // required
-constexpr TermWorth kEqual{1.0, 0.0};        // required
-constexpr TermWorth kNotEqual{0.0, 1.0};     // forbidden
+constexpr TermWorth kPhrase{5.0, 1.0};    // a pure bonus
+constexpr TermWorth kWordPair{2.0, 0.8};  // missing it is a small penalty
+constexpr TermWorth kWord{1.0, 0.0};      // required
+constexpr TermWorth kEqual{1.0, 0.0};     // required
+constexpr TermWorth kNotEqual{0.0, 1.0};  // forbidden
 constexpr size_t kWordsOfAPhrase = 3;
 
 TLString joinWords(const std::vector<TLString>& words) {
@@ -70,7 +70,8 @@ std::unique_ptr<TALQueryProcessor> TALQueryProcessor::initWithZoneManager(
     log().error("Failed to create lexemon tokenizer for locale: {}", locale);
     return nullptr;
   }
-  return std::unique_ptr<TALQueryProcessor>(new TALQueryProcessor(std::move(tokenizer), zoneManager));
+  return std::unique_ptr<TALQueryProcessor>(
+      new TALQueryProcessor(std::move(tokenizer), zoneManager));
 }
 
 std::vector<TALTerm> TALQueryProcessor::termsFromQuery(const TLQuery& query) const {
@@ -104,8 +105,10 @@ std::vector<TALTerm> TALQueryProcessor::_processQueryString(TLStringView querySt
   return terms;
 }
 
-// The tree is walked with a stack of its own, in the order of the leaves: AND nodes unfold in place.
-void TALQueryProcessor::_processQueryNode(const TLQueryNode* root, std::vector<TALTerm>& terms) const {
+// The tree is walked with a stack of its own, in the order of the leaves: AND nodes unfold in
+// place.
+void TALQueryProcessor::_processQueryNode(const TLQueryNode* root,
+                                          std::vector<TALTerm>& terms) const {
   if (root == nullptr) {
     log().standard("Query tree node is empty.");
     return;
@@ -116,7 +119,8 @@ void TALQueryProcessor::_processQueryNode(const TLQueryNode* root, std::vector<T
     pending.pop_back();
     switch (node.mergeOp()) {
       case TLQueryNodeMergeOp::LEAF:
-        if (node.op() == TLQueryNodeOp::STRING_EQUAL || node.op() == TLQueryNodeOp::STRING_NOT_EQUAL) {
+        if (node.op() == TLQueryNodeOp::STRING_EQUAL ||
+            node.op() == TLQueryNodeOp::STRING_NOT_EQUAL) {
           _stringRestrictTermsFromLeafNode(node, node.op(), terms);
         }
         break;
@@ -155,8 +159,8 @@ void TALQueryProcessor::_stringRestrictTermsFromLeafNode(const TLQueryNode& node
       _assignWeightsWithKey(key, 1.0, zones);
     }
     const TermWorth worth = equal ? kEqual : kNotEqual;
-    terms.emplace_back(std::vector<TLString>{token}, std::vector<double>{worth.score}, worth.noMatch,
-                       std::move(zones.ids), std::move(zones.scores), false);
+    terms.emplace_back(std::vector<TLString>{token}, std::vector<double>{worth.score},
+                       worth.noMatch, std::move(zones.ids), std::move(zones.scores), false);
   }
 }
 
@@ -177,7 +181,8 @@ void TALQueryProcessor::_restrictTermFromOrNode(const TLQueryNode& node,
     TLString token = _extractStringFrom(*child);
     if (token.empty()) continue;
     if (known.insert(token).second) tokens.push_back(std::move(token));
-    for (size_t i = 0; i < child->keysCount(); ++i) _assignWeightsWithKey(keyAt(*child, i), 1.0, zones);
+    for (size_t i = 0; i < child->keysCount(); ++i)
+      _assignWeightsWithKey(keyAt(*child, i), 1.0, zones);
   }
   if (tokens.empty()) return;
   std::vector<double> scores(tokens.size(), kEqual.score);
@@ -202,15 +207,16 @@ bool TALQueryProcessor::_needsTokenization(const TLQueryNode& node) {
 }
 
 void TALQueryProcessor::_zoneWeightsWithKey(TLAttributeKey key, Zones& zones) const {
-  const auto zone = _zoneManager.zoneIDForAttributeKey(key, std::nullopt);
+  const auto zone = _zoneManager.zoneIDForAttributeKey(static_cast<int32_t>(key), std::nullopt);
   if (!zone) return;
   const auto score = _zoneManager.scoreForZoneID(zone);
   zones.ids.push_back(*zone);
   zones.scores.push_back(score ? static_cast<double>(*score) : kDefaultZoneScore);
 }
 
-void TALQueryProcessor::_assignWeightsWithKey(TLAttributeKey key, double weight, Zones& zones) const {
-  const auto zone = _zoneManager.zoneIDForAttributeKey(key, std::nullopt);
+void TALQueryProcessor::_assignWeightsWithKey(TLAttributeKey key, double weight,
+                                              Zones& zones) const {
+  const auto zone = _zoneManager.zoneIDForAttributeKey(static_cast<int32_t>(key), std::nullopt);
   if (!zone || std::find(zones.ids.begin(), zones.ids.end(), *zone) != zones.ids.end()) return;
   zones.ids.push_back(*zone);
   zones.scores.push_back(weight);

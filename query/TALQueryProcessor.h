@@ -11,25 +11,25 @@
 #include "records/TLQuery.h"
 #include "tokenizer/Tokenizer.h"
 
-// Turns a query into the flat list of scored terms that the text index evaluates; the shape of ranking is
-// decided here.
+// Turns a query into the flat list of scored terms that the text index evaluates; the shape of
+// ranking is decided here.
 //
-// A document's text score is the product over all terms: a matched document gets the token score times the
-// weights of the zones, any other `scoreNoMatch`. A whole phrase is worth more than a pair of neighbouring
-// words, a pair more than words far apart; every word is required, and conditions on attributes are hard
-// restrictions.
+// A document's text score is the product over all terms: a matched document gets the token score
+// times the weights of the zones, any other `scoreNoMatch`. A whole phrase is worth more than a
+// pair of neighbouring words, a pair more than words far apart; every word is required, and
+// conditions on attributes are hard restrictions.
 //
-// Threads: holds no state of a query and may be called from any thread, at once. Zone weights are those
-// that the zone manager has at the time.
+// Threads: holds no state of a query and may be called from any thread, at once. Zone weights are
+// those that the zone manager has at the time.
 class TALQueryProcessor {
  public:
-  // Null, with a line in the log, when there is no tokenizer for the best locale. The zone manager must
-  // outlive the processor.
+  // Null, with a line in the log, when there is no tokenizer for the best locale. The zone manager
+  // must outlive the processor.
   [[nodiscard]] static std::unique_ptr<TALQueryProcessor> initWithZoneManager(
       const TALZoneManager& zoneManager);
 
-  // The terms of the free text (`originalQuery`), then those of the condition tree (`root`). Empty for a
-  // query that asks for nothing.
+  // The terms of the free text (`originalQuery`), then those of the condition tree (`root`). Empty
+  // for a query that asks for nothing.
   [[nodiscard]] std::vector<TALTerm> termsFromQuery(const TLQuery& query) const;
 
   // The attribute keys that free text is searched in, in order.
@@ -38,11 +38,12 @@ class TALQueryProcessor {
   static const platform::Log& log();
 
  private:
-  TALQueryProcessor(std::unique_ptr<tokenizer::Tokenizer> tokenizer, const TALZoneManager& zoneManager)
+  TALQueryProcessor(std::unique_ptr<tokenizer::Tokenizer> tokenizer,
+                    const TALZoneManager& zoneManager)
       : _tokenizer(std::move(tokenizer)), _zoneManager(zoneManager) {}
 
   struct Zones {
-    std::vector<uint32_t> ids;
+    std::vector<int32_t> ids;
     std::vector<double> scores;
   };
 

@@ -7,13 +7,14 @@
 
 #include "platform/Text.h"
 
-// A group of alternative tokens with scores: what a query processor makes and the text index evaluates.
-// A token with a blank at the end stands for a whole word, one without for a prefix. Immutable.
+// A group of alternative tokens with scores: what a query processor makes and the text index
+// evaluates. A token with a blank at the end stands for a whole word, one without for a prefix.
+// Immutable.
 class TALTerm {
  public:
   // As many token scores as tokens, as many zone scores as zone IDs.
   TALTerm(std::vector<TLString> tokens, std::vector<double> tokenScores, double scoreNoMatch,
-          std::vector<uint32_t> zoneIDs, std::vector<double> zoneScores, bool isUnigram)
+          std::vector<int32_t> zoneIDs, std::vector<double> zoneScores, bool isUnigram)
       : _tokens(std::move(tokens)),
         _tokenScores(std::move(tokenScores)),
         _scoreNoMatch(scoreNoMatch),
@@ -27,7 +28,7 @@ class TALTerm {
   // The score of a document that no token matches: 0 makes the term required, 1 a pure bonus.
   [[nodiscard]] double scoreNoMatch() const { return _scoreNoMatch; }
   // Zones to look in.
-  [[nodiscard]] const std::vector<uint32_t>& zoneIDs() const { return _zoneIDs; }
+  [[nodiscard]] const std::vector<int32_t>& zoneIDs() const { return _zoneIDs; }
   [[nodiscard]] const std::vector<double>& zoneScores() const { return _zoneScores; }
   // True for a single query word: only such terms are rewritten when a search finds too little.
   [[nodiscard]] bool isUnigram() const { return _isUnigram; }
@@ -39,7 +40,7 @@ class TALTerm {
   std::vector<TLString> _tokens;
   std::vector<double> _tokenScores;
   double _scoreNoMatch;
-  std::vector<uint32_t> _zoneIDs;
+  std::vector<int32_t> _zoneIDs;
   std::vector<double> _zoneScores;
   bool _isUnigram;
 };

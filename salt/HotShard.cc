@@ -56,7 +56,7 @@ std::optional<index::Aftermath> index::storeZone(Clock::time_point start, uint32
                                                  std::vector<uint32_t>& offsets, bool merge) {
   platform::MutexLock lock(_writeMutex);
   const auto locked = Clock::now();
-  if (_deleted.contains(docID)) {
+  if (deletedDocs()->contains(docID)) {
     refuse("Doc is deleted.");
     return std::nullopt;
   }
@@ -168,18 +168,22 @@ std::chrono::nanoseconds index::throttle(Clock::duration held) {
 bool index::DeleteDoc(uint32_t docID) {
   if (docID == 0) return refuse("Invalid DocID.");
   platform::MutexLock lock(_writeMutex);
-  if (_deleted.contains(docID)) return true;
+  const auto before = deletedDocs();
+  if (before->contains(docID)) return true;
   std::string bytes;
-  bytes.reserve((_deleted.size() + 1) * sizeof docID);
+  bytes.reserve((before->size() + 1) * sizeof docID);
   const auto add = [&bytes](uint32_t id) {
     bytes.append(reinterpret_cast<const char*>(&id), sizeof id);
   };
-  _deleted.forEach([&add](const DeletedDoc& doc) { add(doc.docID); });
+  before->forEach([&add](const DeletedDoc& doc) { add(doc.docID); });
   add(docID);
   leveldb::WriteBatch batch;
   batch.Put(kDeletedKey, bytes);
   if (!_writer.write(&batch).ok()) return false;
-  _deleted.insert({docID});
+  DeletedDocs after = *before;
+  after.insert({docID});
+  platform::MutexLock metricsLock(_metricsMutex);
+  _deleted = std::make_shared<const DeletedDocs>(std::move(after));
   return true;
 }
 

@@ -31,10 +31,8 @@ struct SuffixMeta {
   explicit operator std::string() const;
 };
 
-// Threads: AddZone, ScanPrefix, ForEachZone, Vacuum, Sync, Compact, GetMetrics, Validate and Dump
-// may run on any threads at once. Readers work from a snapshot and block nobody. DeleteDoc must
-// not overlap with ScanPrefix, ForEachZone or GetMetrics: they read the set of deleted documents
-// without a lock.
+// Threads: all operations may run on any threads at once. Readers work from a snapshot and block
+// nobody; what is added or deleted while one runs does not change what it sees.
 class Index {
  public:
   // The members of the stream, in its layout: 40 bytes, little-endian.

@@ -33,7 +33,8 @@ index::index(Database opened)
     : _database(std::move(opened)),
       _writer(_database.db.get()),
       db(_database.db.get()),
-      _batch(std::in_place) {
+      _batch(std::in_place),
+      _deleted(std::make_shared<const DeletedDocs>()) {
   std::string bytes;
   leveldb::Status status = db->Get(leveldb::ReadOptions(), kMetricsKey, &bytes);
   if (!status.ok() || !parseRecord(bytes, &metrics)) return;
@@ -45,11 +46,13 @@ index::index(Database opened)
   status = db->Get(leveldb::ReadOptions(), kDeletedKey, &bytes);
   if (status.IsNotFound()) return;
   TL_ASSERT(status.ok());
+  DeletedDocs deleted;
   for (size_t at = 0; at + sizeof(uint32_t) <= bytes.size(); at += sizeof(uint32_t)) {
     DeletedDoc doc;
     std::memcpy(&doc.docID, bytes.data() + at, sizeof doc.docID);
-    if (doc.docID != 0 && !_deleted.contains(doc.docID)) _deleted.insert(doc);
+    if (doc.docID != 0 && !deleted.contains(doc.docID)) deleted.insert(doc);
   }
+  _deleted = std::make_shared<const DeletedDocs>(std::move(deleted));
 }
 
 Index* NewIndex(const Index::Options& options) {
@@ -117,6 +120,11 @@ std::string index::GetSuffixText(const SuffixMeta& meta) const {
   return std::string(fullText(meta, leveldb::ReadOptions(), &zoneText));
 }
 
+std::shared_ptr<const DeletedDocs> index::deletedDocs() const {
+  platform::MutexLock lock(_metricsMutex);
+  return _deleted;
+}
+
 void index::Vacuum() {}
 
 bool index::Sync() {
@@ -133,7 +141,7 @@ Index::Metrics index::GetMetrics() const {
   const IndexView view(*this, false);
   Metrics result = view.metrics;
   result.Docs = result.Zones = result.TextBytes = 0;
-  result.DeletedDocs = _deleted.size();
+  result.DeletedDocs = view.deleted->size();
   uint32_t previous = 0;
   forEachZone(view, [&](uint32_t docID, uint16_t zoneID, std::string_view text) {
     if (docID != previous) ++result.Docs;
@@ -171,6 +179,7 @@ IndexView::IndexView(const index& owner, bool fillCache) : idx(owner) {
   platform::MutexLock lock(owner._metricsMutex);
   options.snapshot = owner.db->GetSnapshot();
   metrics = owner.metrics;
+  deleted = owner._deleted;
 }
 
 IndexView::~IndexView() {

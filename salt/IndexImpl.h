@@ -20,6 +20,11 @@ namespace salt {
 class IndexView;
 class ShardCursor;
 
+struct DeletedDoc {
+  uint32_t docID = 0;
+};
+using DeletedDocs = DocTable<DeletedDoc>;
+
 inline constexpr char kDeletedKey[] =
     "\xFF"
     "DELETED";
@@ -32,7 +37,8 @@ inline constexpr uint8_t kMaxShardNumber = 0xFE;
 // metrics and the taking of a view.
 //
 // What holds at all times: the metrics in the database are those of the same batch as the keys that
-// they count; a reader's snapshot and its copy of the metrics are of the same moment.
+// they count; a reader's snapshot and its copy of the metrics are of the same moment, and what is
+// deleted later stays visible to it.
 class index final : public Index {
  public:
   explicit index(Database opened);
@@ -67,9 +73,6 @@ class index final : public Index {
                                           std::string* zoneText) const;
 
  private:
-  struct DeletedDoc {
-    uint32_t docID = 0;
-  };
   using Clock = std::chrono::steady_clock;
 
   // What AddZone has left to do once the locks are released.
@@ -105,6 +108,8 @@ class index final : public Index {
       TL_REQUIRES(_writeMutex);
   [[nodiscard]] std::chrono::nanoseconds throttle(Clock::duration held) TL_REQUIRES(_metricsMutex);
 
+  [[nodiscard]] std::shared_ptr<const DeletedDocs> deletedDocs() const TL_EXCLUDES(_metricsMutex);
+
   // Writes the batch together with the metrics and clears it. A failure is logged.
   [[nodiscard]] bool writeMetrics(leveldb::WriteBatch* batch) TL_REQUIRES(_metricsMutex);
 
@@ -112,7 +117,8 @@ class index final : public Index {
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
 
   // Counts what it does; false when the whole scan is over.
-  [[nodiscard]] bool scanShard(ShardCursor* cursor, std::string_view prefix,
+  [[nodiscard]] bool scanShard(ShardCursor* cursor, const DeletedDocs& deleted,
+                               std::string_view prefix,
                                const std::function<bool(const SuffixMeta&)>& callback,
                                ScanCounts* counts) const;
   void forEachZone(const IndexView& view,
@@ -142,12 +148,13 @@ class index final : public Index {
   uint32_t _newestDoc TL_GUARDED_BY(_writeMutex) = 0;
   std::vector<uint16_t> _newestZones TL_GUARDED_BY(_writeMutex);
 
-  // Written under the write mutex, read without: the callers keep DeleteDoc and readers apart.
-  DocTable<DeletedDoc> _deleted;
+  // Replaced as a whole by each deletion, under both mutexes, so that a view keeps the set of its
+  // moment. A deletion writes the whole set anyway.
+  std::shared_ptr<const DeletedDocs> _deleted TL_GUARDED_BY(_metricsMutex);
 };
 
-// What every reader works from: a snapshot and the metrics of the same moment. One thread; the
-// index outlives it.
+// What every reader works from: a snapshot, the metrics and the set of deleted documents. One
+// thread; the index outlives it.
 class IndexView {
  public:
   // With `fillCache` false the reads do not displace the block cache.
@@ -162,6 +169,7 @@ class IndexView {
   const index& idx;
   leveldb::ReadOptions options;
   Index::Metrics metrics;
+  std::shared_ptr<const DeletedDocs> deleted;
 };
 
 }  // namespace salt

@@ -14,7 +14,7 @@ bool index::ScanPrefix(std::string_view prefix,
   bool goOn = true;
   for (unsigned shard = 0; goOn && shard <= view.lastShard(); ++shard) {
     cursor.moveTo(static_cast<uint8_t>(shard));
-    goOn = scanShard(&cursor, prefix, callback, &counts);
+    goOn = scanShard(&cursor, *view.deleted, prefix, callback, &counts);
   }
   const std::chrono::nanoseconds elapsed = Clock::now() - start;
   platform::MutexLock lock(_metricsMutex);
@@ -27,13 +27,13 @@ bool index::ScanPrefix(std::string_view prefix,
   return true;
 }
 
-bool index::scanShard(ShardCursor* cursor, std::string_view prefix,
+bool index::scanShard(ShardCursor* cursor, const DeletedDocs& deleted, std::string_view prefix,
                       const std::function<bool(const SuffixMeta&)>& callback,
                       ScanCounts* counts) const {
   bool goOn = true;
   for (cursor->seek(prefix); cursor->valid; cursor->next()) {
     if (cursor->suffix.compareWithPrefix(prefix) != 0) break;
-    if (_deleted.contains(cursor->suffix.meta.DocID)) continue;
+    if (deleted.contains(cursor->suffix.meta.DocID)) continue;
     ++counts->results;
     goOn = callback(cursor->suffix.meta);
     if (!goOn) break;
@@ -60,7 +60,7 @@ void index::forEachZone(
     uint32_t docID = 0;
     uint16_t zoneID = 0;
     if (!parseTextKey(salt::view(iterator->key()), &docID, &zoneID)) continue;
-    if (_deleted.contains(docID)) continue;
+    if (view.deleted->contains(docID)) continue;
     if (!callback(docID, zoneID, salt::view(iterator->value()))) return;
   }
 }

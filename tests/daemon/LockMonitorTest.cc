@@ -54,16 +54,21 @@ TEST(LockMonitor, FollowsTheStates) {
     const char* line;
   };
   const std::vector<Row> rows{
-      {1, false, false, "default TLDeviceLockMonitor: Device locked with state: 1, unlockedSinceBoot: 0, "
-                        "protectedDataAvailable 0"},
-      {3, true, true, "default TLDeviceLockMonitor: Device unlocked with state: 3, unlockedSinceBoot: 1, "
-                      "protectedDataAvailable 1"},
-      {2, false, true, "default TLDeviceLockMonitor: Device locking with state: 2, unlockedSinceBoot: 1, "
-                       "protectedDataAvailable 0"},
-      {0, true, true, "default TLDeviceLockMonitor: Device unlocked with state: 0, unlockedSinceBoot: 1, "
-                      "protectedDataAvailable 1"},
-      {4, false, true, "fault TLDeviceLockMonitor: Device lock state changed to unexpected state: 4, "
-                       "unlockedSinceBoot: 1, protectedDataAvailable 0"}};
+      {1, false, false,
+       "default TLDeviceLockMonitor: Device locked with state: 1, unlockedSinceBoot: 0, "
+       "protectedDataAvailable 0"},
+      {3, true, true,
+       "default TLDeviceLockMonitor: Device unlocked with state: 3, unlockedSinceBoot: 1, "
+       "protectedDataAvailable 1"},
+      {2, false, true,
+       "default TLDeviceLockMonitor: Device locking with state: 2, unlockedSinceBoot: 1, "
+       "protectedDataAvailable 0"},
+      {0, true, true,
+       "default TLDeviceLockMonitor: Device unlocked with state: 0, unlockedSinceBoot: 1, "
+       "protectedDataAvailable 1"},
+      {4, false, true,
+       "fault TLDeviceLockMonitor: Device lock state changed to unexpected state: 4, "
+       "unlockedSinceBoot: 1, protectedDataAvailable 0"}};
   FakeVault vault;
   vault.unlocked = 0;
   vault.state = 9;
@@ -71,8 +76,9 @@ TEST(LockMonitor, FollowsTheStates) {
   {
     TLDeviceLockMonitor monitor(vault);
     EXPECT_TRUE(log.has("fault TLDeviceLockMonitor: Unexpected device lock state: 9"));
-    EXPECT_TRUE(log.has("default TLDeviceLockMonitor: lockState: 9, unlockedSinceBoot: 0, "
-                        "protectedDataAvailable: 0"));
+    EXPECT_TRUE(
+        log.has("default TLDeviceLockMonitor: lockState: 9, unlockedSinceBoot: 0, "
+                "protectedDataAvailable: 0"));
     for (const Row& row : rows) {
       vault.change(row.state);
       EXPECT_EQ(monitor.protectedDataAvailable(), row.available) << row.state;
@@ -89,13 +95,15 @@ TEST(LockMonitor, CallsTheDelegateDirectlyOrOnItsQueue) {
   const auto observer = std::make_shared<Observer>();
   monitor.setDelegate(observer, nullptr);
   for (const uint32_t state : {1u, 2u, 9u, 3u}) vault.change(state);
-  EXPECT_EQ(observer->calls, (std::vector<std::string>{"unavailable", "will be unavailable", "available"}));
+  EXPECT_EQ(observer->calls,
+            (std::vector<std::string>{"unavailable", "will be unavailable", "available"}));
   observer->calls.clear();
   const auto queue = std::make_shared<platform::SerialQueue>("observer");
   monitor.setDelegate(observer, queue);
   for (const uint32_t state : {2u, 1u, 0u}) vault.change(state);
   queue->drain();
-  EXPECT_EQ(observer->calls, (std::vector<std::string>{"will be unavailable", "unavailable", "available"}));
+  EXPECT_EQ(observer->calls,
+            (std::vector<std::string>{"will be unavailable", "unavailable", "available"}));
 }
 
 TEST(LockMonitor, GoesOnWithoutNotifications) {
@@ -106,8 +114,9 @@ TEST(LockMonitor, GoesOnWithoutNotifications) {
     const TLDeviceLockMonitor monitor(vault);
     EXPECT_TRUE(monitor.protectedDataAvailable());
   }
-  EXPECT_TRUE(log.has("fault TLDeviceLockMonitor: Failed to setup notification handler for "
-                      "com.quill.mobile.lockstated.lock_status, error status: 5"));
+  EXPECT_TRUE(
+      log.has("fault TLDeviceLockMonitor: Failed to setup notification handler for "
+              "com.quill.mobile.lockstated.lock_status, error status: 5"));
   EXPECT_EQ(vault.cancelled, 0);
 }
 
@@ -120,7 +129,9 @@ TEST(FileDeviceVault, ReadsItsFileAndSeesChanges) {
   platform::SerialQueue queue("vault");
   std::promise<void> changed;
   int32_t token = -1;
-  ASSERT_EQ(vault->registerNotification("n", queue, [&] { changed.set_value(); }, &token), 0u);
+  ASSERT_EQ(vault->registerNotification(
+                "n", queue, [&] { changed.set_value(); }, &token),
+            0u);
   EXPECT_NE(token, -1);
   ASSERT_TRUE(platform::writeFileAtomically(path, "2 1\n", nullptr));
   changed.get_future().wait();

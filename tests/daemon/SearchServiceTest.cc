@@ -21,16 +21,16 @@ std::shared_ptr<TLIndexableItem> mail(const TLString& identifier, const TLString
   return item;
 }
 
-TLQuery textQuery(const TLString& text) {
-  TLQuery query;
-  query.setRawQuery(text);
-  query.setOriginalQuery(text);
+std::shared_ptr<TLQuery> textQuery(const TLString& text) {
+  auto query = std::make_shared<TLQuery>();
+  query->setRawQuery(text);
+  query->setOriginalQuery(text);
   return query;
 }
 
 // A query as a mail client asks whether it has messages with these subjects.
-TLQuery verificationQuery(const std::vector<TLString>& subjects) {
-  TLQuery query;
+std::shared_ptr<TLQuery> verificationQuery(const std::vector<TLString>& subjects) {
+  auto query = std::make_shared<TLQuery>();
   auto root = std::make_shared<TLQueryNode>();
   root->setMergeOp(TLQueryNodeMergeOp::OR);
   TLString raw = u"(";
@@ -42,8 +42,8 @@ TLQuery verificationQuery(const std::vector<TLString>& subjects) {
     if (raw.size() > 1) raw += u" || ";
     raw += u"kTLItemSubject = '" + subject + u"'";
   }
-  query.setRoot(root);
-  query.setRawQuery(raw + u")");
+  query->setRoot(root);
+  query->setRawQuery(raw + u")");
   return query;
 }
 
@@ -60,12 +60,13 @@ class SearchServiceTest : public testing::Test {
     return promise.get_future().get();
   }
   Outcome index(Items items, const std::string& protectionClass = "default") {
-    return wait([&](auto reply) { service.indexItems(std::move(items), "test", protectionClass, reply); });
+    return wait(
+        [&](auto reply) { service.indexItems(std::move(items), "test", protectionClass, reply); });
   }
   // Number of results, -1 after an error, which goes to `lastError`.
-  int search(TLQuery query, int64_t maximum = 100, const std::string& protectionClass = "default") {
+  int search(const std::shared_ptr<TLQuery>& query, int64_t maximum = 100, const std::string& protectionClass = "default") {
     int count = -2;
-    service.searchItemsForQuery(query, 1, protectionClass, maximum,
+    service.searchItemsForQuery(*query, 1, protectionClass, maximum,
                                 [&](const std::optional<Items>& items, const Outcome& error) {
                                   lastError = error;
                                   count = error ? -1 : static_cast<int>(items->size());
@@ -84,17 +85,20 @@ class SearchServiceTest : public testing::Test {
 
 TEST_F(SearchServiceTest, LogsItsRequestsAndNeverPersonalText) {
   ASSERT_EQ(index({mail(u"a", u"private words")}), std::nullopt);
-  EXPECT_TRUE(log.has("default TALSearchService: Requested indexItems numDocuments=1, callerName=test, "
-                      "protectionClass=default"));
+  EXPECT_TRUE(
+      log.has("default TALSearchService: Requested indexItems numDocuments=1, callerName=test, "
+              "protectionClass=default"));
   EXPECT_EQ(search(textQuery(u"private words")), 1);
-  EXPECT_TRUE(log.has("default TALSearchService: Requested searchItemsForQuery query=\"pr...\"<13 chars>, "
-                      "context=<maxResults=100, options=TLSearchOptionTopHit>, protectionClass=default"));
+  EXPECT_TRUE(
+      log.has("default TALSearchService: Requested searchItemsForQuery query=\"pr...\"<13 chars>, "
+              "context=<maxResults=100, options=TLSearchOptionTopHit>, protectionClass=default"));
   EXPECT_TRUE(log.contains("results=1, timeTaken="));
   EXPECT_FALSE(log.contains("private"));
   // The word of a completion comes after its reply; the queue's drain at shutdown waits for it.
   service.shutdown();
-  EXPECT_TRUE(log.contains("default TALSearchService: Finished indexItems numDocuments=1, callerName=test, "
-                           "protectionClass=default, timeTaken="));
+  EXPECT_TRUE(
+      log.contains("default TALSearchService: Finished indexItems numDocuments=1, callerName=test, "
+                   "protectionClass=default, timeTaken="));
   EXPECT_TRUE(log.has("default TALSearchService: SearchService has shut down"));
 }
 
@@ -109,7 +113,8 @@ TEST_F(SearchServiceTest, EmptyFieldsShowAsEmptyAndMaximaRead) {
 
 TEST_F(SearchServiceTest, TheMaximumCutsAndANegativeOneDoesNot) {
   ASSERT_EQ(index({mail(u"a", u"x"), mail(u"b", u"x"), mail(u"c", u"x")}), std::nullopt);
-  for (const auto& [maximum, count] : std::vector<std::pair<int64_t, int>>{{2, 2}, {0, 0}, {-1, 3}}) {
+  for (const auto& [maximum, count] :
+       std::vector<std::pair<int64_t, int>>{{2, 2}, {0, 0}, {-1, 3}}) {
     EXPECT_EQ(search(textQuery(u"x"), maximum), count) << maximum;
   }
 }
@@ -118,16 +123,19 @@ TEST_F(SearchServiceTest, TheLockStateGatesTheClasses) {
   ASSERT_EQ(index({mail(u"a", u"x")}, "SysFileProtectionComplete"), std::nullopt);
   lock.protectedDataAvailable = false;
   const TLError unavailable = TALIndexerManager::indexerUnavailableError();
-  EXPECT_EQ(unavailable, (TLError{"com.quill.tallow.TALIndexerManager", -2, "Indexer unavailable."}));
+  EXPECT_EQ(unavailable,
+            (TLError{"com.quill.tallow.TALIndexerManager", -2, "Indexer unavailable."}));
   EXPECT_EQ(index({mail(u"b", u"x")}, "SysFileProtectionComplete"), unavailable);
-  EXPECT_TRUE(log.has("error TALIndexerManager: Not providing an SysFileProtectionComplete indexer without "
-                      "protected data available."));
+  EXPECT_TRUE(
+      log.has("error TALIndexerManager: Not providing an SysFileProtectionComplete indexer without "
+              "protected data available."));
   EXPECT_EQ(index({mail(u"b", u"x")}, "other"), std::nullopt);
   lock.unlockedSinceBoot = false;
   EXPECT_EQ(search(textQuery(u"x"), 10, "other"), -1);
   EXPECT_EQ(lastError, unavailable);
-  EXPECT_TRUE(log.has("error TALIndexerManager: Not providing a requested other indexer prior to first "
-                      "unlock."));
+  EXPECT_TRUE(
+      log.has("error TALIndexerManager: Not providing a requested other indexer prior to first "
+              "unlock."));
   lock = {true, true};
   EXPECT_EQ(search(textQuery(u"x"), 10, "other"), 1);
   EXPECT_EQ(search(textQuery(u"x"), 10, "SysFileProtectionComplete"), 1);
@@ -136,8 +144,8 @@ TEST_F(SearchServiceTest, TheLockStateGatesTheClasses) {
 }
 
 TEST_F(SearchServiceTest, AClassMustNameOneDirectory) {
-  const std::vector<std::string> bad{"",    ".", "..", "../x", "a/b", "/etc", std::string("a\0b", 3),
-                                     std::string(256, 'c')};
+  const std::vector<std::string> bad{
+      "", ".", "..", "../x", "a/b", "/etc", std::string("a\0b", 3), std::string(256, 'c')};
   for (const std::string& name : bad) {
     EXPECT_TRUE(index({mail(u"a", u"x")}, name)) << name;
     EXPECT_EQ(search(textQuery(u"x"), 1, name), -1);
@@ -163,23 +171,30 @@ TEST_F(SearchServiceTest, StatisticsStateVacuumAndReset) {
             }),
             std::nullopt);
   std::optional<std::string> state;
-  service.fetchLastClientStateFromIndexerNamed("client", "default",
-                                               [&](const auto& value, const auto&) { state = value; });
+  service.fetchLastClientStateFromIndexerNamed(
+      "client", "default", [&](const auto& value, const auto&) { state = value; });
   EXPECT_EQ(state, "state");
   nlohmann::json stats;
-  service.fetchStatsForIndexerNamed("n", "default", [&](const auto& value, const auto&) { stats = value; });
+  service.fetchStatsForIndexerNamed("n", "default",
+                                    [&](const auto& value, const auto&) { stats = value; });
   EXPECT_EQ(stats.at("TLDebugServiceDocStoreNumOfItems"), 1);
   std::string metrics;
-  service.fetchStatsForSaltNamed("n", "default", [&](const auto& value, const auto&) { metrics = *value; });
+  service.fetchStatsForSaltNamed("n", "default",
+                                 [&](const auto& value, const auto&) { metrics = *value; });
   EXPECT_NE(metrics.find("SALT INDEX METRICS\n"), std::string::npos);
-  EXPECT_EQ(wait([&](auto reply) { service.forceVacuumAndCompactForProtectionClass("default", reply); }),
+  EXPECT_EQ(
+      wait([&](auto reply) { service.forceVacuumAndCompactForProtectionClass("default", reply); }),
+      std::nullopt);
+  EXPECT_EQ(
+      wait([&](auto reply) { service.deleteItemsWithIdentifiers({u"a"}, "n", "default", reply); }),
+      std::nullopt);
+  EXPECT_EQ(wait([&](auto reply) {
+              service.deleteItemsWithDomainIdentifiers({u"d"}, "n", "default", reply);
+            }),
             std::nullopt);
-  EXPECT_EQ(wait([&](auto reply) { service.deleteItemsWithIdentifiers({u"a"}, "n", "default", reply); }),
-            std::nullopt);
-  EXPECT_EQ(wait([&](auto reply) { service.deleteItemsWithDomainIdentifiers({u"d"}, "n", "default", reply); }),
-            std::nullopt);
-  EXPECT_EQ(wait([&](auto reply) { service.deleteAllItemsFromIndexerNamed("n", "default", reply); }),
-            std::nullopt);
+  EXPECT_EQ(
+      wait([&](auto reply) { service.deleteAllItemsFromIndexerNamed("n", "default", reply); }),
+      std::nullopt);
   std::string answer;
   service.ping("hello", [&](const std::string& text) { answer = text; });
   EXPECT_EQ(answer.substr(0, 20), "Received hello\nCmd: ");
@@ -208,12 +223,12 @@ TEST_F(SearchServiceTest, AnEndSignpostBearsTheCount) {
 TEST(VerificationQuery, IsRecognisedByItsShape) {
   EXPECT_FALSE(TALSearchService::isMailVerificationQuery(nullptr));
   const std::vector<TLString> five{u"a", u"b", u"c", u"d", u"e"};
-  TLQuery query = TLQuery();
+  const TLQuery query;
   EXPECT_FALSE(TALSearchService::isMailVerificationQuery(&query));
-  const TLQuery good = verificationQuery(five);
-  EXPECT_TRUE(TALSearchService::isMailVerificationQuery(&good));
-  const TLQuery four = verificationQuery({u"a", u"b", u"c", u"d"});
-  EXPECT_FALSE(TALSearchService::isMailVerificationQuery(&four));
+  const auto good = verificationQuery(five);
+  EXPECT_TRUE(TALSearchService::isMailVerificationQuery(good.get()));
+  const auto four = verificationQuery({u"a", u"b", u"c", u"d"});
+  EXPECT_FALSE(TALSearchService::isMailVerificationQuery(four.get()));
   using Change = std::function<void(TLQueryNode&)>;
   const std::vector<Change> changes{
       [](TLQueryNode& root) { root.setMergeOp(TLQueryNodeMergeOp::AND); },
@@ -222,9 +237,9 @@ TEST(VerificationQuery, IsRecognisedByItsShape) {
       [](TLQueryNode& root) { root.childAtIndex(2)->setOp(TLQueryNodeOp::STRING_NOT_EQUAL); },
       [](TLQueryNode& root) { root.childAtIndex(0)->setMergeOp(TLQueryNodeMergeOp::OR); }};
   for (const Change& change : changes) {
-    const TLQuery changed = verificationQuery(five);
-    change(*changed.root());
-    EXPECT_FALSE(TALSearchService::isMailVerificationQuery(&changed));
+    const auto changed = verificationQuery(five);
+    change(*changed->root());
+    EXPECT_FALSE(TALSearchService::isMailVerificationQuery(changed.get()));
   }
 }
 
@@ -248,7 +263,8 @@ TEST(VerificationQuery, SubjectsComeFromTheText) {
 TEST_F(SearchServiceTest, VerificationFindsExactSubjectsByBothPaths) {
   std::vector<TLString> subjects;
   Items items;
-  for (const char16_t* subject : {u"Lunch", u"Lunch today", u"Re: Lunch", u"Invoice 7", u"Party", u"lunch"}) {
+  for (const char16_t* subject :
+       {u"Lunch", u"Lunch today", u"Re: Lunch", u"Invoice 7", u"Party", u"lunch"}) {
     items.push_back(mail(u"id" + platform::fromUTF8(std::to_string(items.size())), subject));
     if (items.size() < 6) subjects.push_back(subject);
   }
@@ -261,9 +277,9 @@ TEST_F(SearchServiceTest, VerificationFindsExactSubjectsByBothPaths) {
   EXPECT_TRUE(log.has("fault TALIndexer: Verification Query Failed"));
   // As many results as the limit cannot be trusted.
   subjects[4] = u"Party";
-  TLQuery limited = verificationQuery(subjects);
-  limited.setSearchParams(TLParamsManager::paramsFromString(u"salt.maxTopK=6"));
+  const auto limited = verificationQuery(subjects);
+  limited->setSearchParams(TLParamsManager::paramsFromString(u"salt.maxTopK=6"));
   log.clear();
-  EXPECT_EQ(search(std::move(limited)), 5);
+  EXPECT_EQ(search(limited), 5);
   EXPECT_TRUE(log.contains("(max_limit = 6), will use a slow linear search"));
 }

@@ -355,7 +355,7 @@ TEST(HTML, RepetitionsOfAnyKindTakeOnePass) {
                            "\n"}) {
     for (const std::string& start : {std::string(), std::string("<head><title>x")}) {
       std::string html = start;
-      while (html.size() < 10000000) html += unit;
+      while (html.size() < 5000000) html += unit;
       std::optional<json> attributes;
       const auto text = TALPlainTextFromHTMLData(html, kNoLimit, &attributes, 4);
       EXPECT_LE(platform::orEmpty(text).size(), html.size()) << unit;

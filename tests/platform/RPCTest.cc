@@ -182,6 +182,41 @@ TEST(RPCListener, AStaleSocketIsReplaced) {
                    ->resume(nullptr));
 }
 
+// The call comes in one piece with the end of the authentication, as some libraries send it.
+TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
+  const int descriptor = connectTo(path());
+  const std::string begin = "BEGIN\r\n";
+  std::string authentication = std::string(1, '\0') + "AUTH EXTERNAL ";
+  for (const char digit : std::to_string(getuid())) authentication += fmt::format("{:02x}", digit);
+  authentication += "\r\n";
+  ASSERT_GT(send(descriptor, authentication.data(), authentication.size(), 0), 0);
+  char buffer[256];
+  ASSERT_GT(recv(descriptor, buffer, sizeof buffer, 0), 0);
+  // Little-endian method call, serial 1, object path, interface, member, signature "s", body "hi".
+  std::string message("l\1\0\1\7\0\0\0\1\0\0\0", 12);
+  std::string fields;
+  const auto field = [&fields](char code, const char* type, const std::string& value) {
+    while (fields.size() % 8 != 0) fields += '\0';
+    fields += std::string({code, 1}) + type + '\0';
+    if (*type != 'g') fields += std::string({static_cast<char>(value.size()), 0, 0, 0});
+    if (*type == 'g') fields += static_cast<char>(value.size());
+    fields += value + '\0';
+  };
+  field(1, "o", kPath);
+  field(2, "s", kService);
+  field(3, "s", "Echo");
+  field(8, "g", "s");
+  message += std::string({static_cast<char>(fields.size()), 0, 0, 0}) + fields;
+  while (message.size() % 8 != 0) message += '\0';
+  message += std::string("\2\0\0\0hi\0", 7);
+  const std::string eager = begin + message;
+  ASSERT_EQ(send(descriptor, eager.data(), eager.size(), 0), static_cast<ssize_t>(eager.size()));
+  const ssize_t size = recv(descriptor, buffer, sizeof buffer, 0);
+  EXPECT_NE(std::string(buffer, static_cast<size_t>(std::max<ssize_t>(size, 0))).find("hi"),
+            std::string::npos);
+  close(descriptor);
+}
+
 TEST_F(RPCTest, AClientThatVanishesInMidCallHarmsNobody) {
   {
     const Client client(path());

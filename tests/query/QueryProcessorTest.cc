@@ -18,7 +18,8 @@ std::shared_ptr<TLQueryNode> leaf(TLAttributeKey key, TLString value, Op op = Op
   return node;
 }
 
-std::shared_ptr<TLQueryNode> inner(Merge mergeOp, std::vector<std::shared_ptr<TLQueryNode>> childs) {
+std::shared_ptr<TLQueryNode> inner(Merge mergeOp,
+                                   std::vector<std::shared_ptr<TLQueryNode>> childs) {
   auto node = std::make_shared<TLQueryNode>();
   node->setMergeOp(mergeOp);
   node->setChilds(std::move(childs));
@@ -87,16 +88,18 @@ TEST_F(QueryProcessorTest, FreeTextBecomesPhrasePairsAndWords) {
 
 TEST_F(QueryProcessorTest, FreeTextLooksInFourteenZonesWithTheirScores) {
   const auto terms = termsOfText(u"x");
-  EXPECT_EQ(zonesOf(terms.at(0)),
-            "zones:{13:0.9,171:0.5,104:0.5,107:1,111:0.1,115:0.1,119:0,108:0.8,112:0.1,116:0.1,120:0,147:"
-            "0.2,132:0.2,131:0.2}");
+  EXPECT_EQ(
+      zonesOf(terms.at(0)),
+      "zones:{13:0.9,171:0.5,104:0.5,107:1,111:0.1,115:0.1,119:0,108:0.8,112:0.1,116:0.1,120:0,147:"
+      "0.2,132:0.2,131:0.2}");
 }
 
 TEST_F(QueryProcessorTest, ALeafRestrictsToItsZone) {
   auto terms = termsOfTree(leaf(SUBJECT, u"Hello, World"));
   EXPECT_EQ(print(terms), "[\"hello world\" 1] nomatch:0\n");
   EXPECT_EQ(zonesOf(terms[0]),
-            "zones:{13:1,171:0,104:0,107:0,111:0,115:0,119:0,108:0,112:0,116:0,120:0,22:0,138:0,165:0,106:"
+            "zones:{13:1,171:0,104:0,107:0,111:0,115:0,119:0,108:0,112:0,116:0,120:0,22:0,138:0,"
+            "165:0,106:"
             "0,180:0,147:0,132:0,131:0}");
   terms = termsOfTree(leaf(SUBJECT, u"spam", Op::STRING_NOT_EQUAL));
   EXPECT_EQ(print(terms), "[\"spam\" 0] nomatch:1\n");
@@ -121,17 +124,19 @@ TEST_F(QueryProcessorTest, WhatMakesNoTerm) {
                                             inner(Merge::AND, {leaf(SUBJECT, u"x")}),
                                             leaf(SUBJECT, u"x", Op::STRING_NOT_EQUAL)}))
                   .empty());
-  EXPECT_EQ(log.lines(), (std::vector<std::string>{
-                             "info TALQueryProcessor: Cannot handle op 16 under an OR node.",
-                             "info TALQueryProcessor: Cannot handle a non-leaf node under an OR node.",
-                             "info TALQueryProcessor: Cannot handle op 5 under an OR node."}));
+  EXPECT_EQ(log.lines(),
+            (std::vector<std::string>{
+                "info TALQueryProcessor: Cannot handle op 16 under an OR node.",
+                "info TALQueryProcessor: Cannot handle a non-leaf node under an OR node.",
+                "info TALQueryProcessor: Cannot handle op 5 under an OR node."}));
 }
 
 TEST_F(QueryProcessorTest, AnOrNodeIsOneTermAndAnAndNodeUnfoldsInOrder) {
-  const auto either = inner(Merge::OR, {leaf(SUBJECT, u"one"), leaf(AUTHORS, u"two"), leaf(SUBJECT, u"one")});
-  const auto terms = termsOfTree(
-      inner(Merge::AND, {leaf(AUTHORS, u"first"), inner(Merge::AND, {either, leaf(X_FROM, u"third")}),
-                         leaf(SUBJECT, u"last", Op::STRING_NOT_EQUAL)}));
+  const auto either =
+      inner(Merge::OR, {leaf(SUBJECT, u"one"), leaf(AUTHORS, u"two"), leaf(SUBJECT, u"one")});
+  const auto terms = termsOfTree(inner(
+      Merge::AND, {leaf(AUTHORS, u"first"), inner(Merge::AND, {either, leaf(X_FROM, u"third")}),
+                   leaf(SUBJECT, u"last", Op::STRING_NOT_EQUAL)}));
   EXPECT_EQ(print(terms),
             "[\"first\" 1] nomatch:0\n[\"one\" 1 | \"two\" 1] nomatch:0\n[\"third\" 1] nomatch:0\n"
             "[\"last\" 0] nomatch:1\n");
@@ -150,6 +155,7 @@ TEST_F(QueryProcessorTest, ZoneScoresFollowTheParametersOfTheSearch) {
   score->setFloatValue(0.25F);
   TLParameters overrides;
   overrides.addKeyvalue(score);
-  zoneManager.setupAttributeScoresWithSearchParams(*TLParamsManager::resolveOverrides(overrides, true));
+  zoneManager.setupAttributeScoresWithSearchParams(
+      *TLParamsManager::resolveOverrides(overrides, true));
   EXPECT_EQ(zonesOf(termsOfText(u"x").at(0)).substr(0, 16), "zones:{13:0.25,1");
 }
