@@ -122,7 +122,7 @@ class TALIndexer {
   // The maps of one batch.
   struct Batch;
 
-  void _init();
+  void _init() TL_REQUIRES(_indexMutex);
   void loadTextStore() TL_REQUIRES(_indexMutex);
   void createTextStore(int64_t storedDocuments) TL_REQUIRES(_indexMutex);
   void makeQueryObjects();

@@ -235,7 +235,7 @@ TEST_F(DaemonProcessTest, WhatDoesNotParseIsRefusedByArgumentAndIndex) {
   tree[0] = '\x0A';
   sd_bus_message_append_array(call, 'y', tree.data(), tree.size());
   sd_bus_message_append(call, "tsx", uint64_t{0}, "default", int64_t{1});
-  sd_bus_error refused = SD_BUS_ERROR_NULL;
+  sd_bus_error refused{};
   EXPECT_LT(sd_bus_call(bus, call, 0, &refused, nullptr), 0);
   EXPECT_STREQ(refused.message, "argument 0 (query): the bytes are no TLQuery");
   sd_bus_error_free(&refused);

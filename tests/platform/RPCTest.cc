@@ -60,7 +60,7 @@ class Client {
 
   // The text of the reply, or the name of the error.
   std::string echo(const std::string& text) const {
-    sd_bus_error error = SD_BUS_ERROR_NULL;
+    sd_bus_error error{};
     sd_bus_message* reply = nullptr;
     sd_bus_call_method(bus, nullptr, kPath, kService, "Echo", &error, &reply, "s", text.c_str());
     const char* result = error.name;
@@ -142,7 +142,7 @@ TEST_F(RPCTest, AnswersAndReportsErrorsByName) {
   const Client client(path());
   EXPECT_EQ(client.echo("hello"), "hello");
   EXPECT_EQ(client.echo("fail"), "com.quill.tallow.Error");
-  sd_bus_error error = SD_BUS_ERROR_NULL;
+  sd_bus_error error{};
   EXPECT_LT(
       sd_bus_call_method(client.bus, nullptr, kPath, kService, "Nothing", &error, nullptr, ""), 0);
   EXPECT_STREQ(error.name, "org.freedesktop.DBus.Error.UnknownMethod");
@@ -251,7 +251,7 @@ TEST_F(RPCTest, AClientThatNeverReadsIsClosed) {
 
 TEST_F(RPCTest, AReplyBeyondTheProtocolIsAnError) {
   const Client client(path());
-  sd_bus_error error = SD_BUS_ERROR_NULL;
+  sd_bus_error error{};
   EXPECT_LT(sd_bus_call_method(client.bus, nullptr, kPath, kService, "Make", &error, nullptr, "x",
                                int64_t{200} << 20),
             0);
