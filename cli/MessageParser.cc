@@ -165,10 +165,10 @@ class ItemBuilder {
     addText(Key::SUBJECT, orEmpty(g_mime_message_get_subject(_message)));
     const std::string_view sender = headerOf(_message, "X-From");
     addText(Key::X_FROM, sender.empty() ? headerOf(_message, "Sender") : sender);
-    addPersons(Key::AUTHORS, GMIME_ADDRESS_TYPE_FROM);
-    addPersons(Key::RECIPIENTS, GMIME_ADDRESS_TYPE_TO);
-    addPersons(Key::ADDITIONAL_RECIPIENTS, GMIME_ADDRESS_TYPE_CC);
-    addPersons(Key::HIDDEN_ADDITIONAL_RECIPIENTS, GMIME_ADDRESS_TYPE_BCC);
+    addPersons(Key::AUTHORS, GMIME_ADDRESS_TYPE_FROM, "From");
+    addPersons(Key::RECIPIENTS, GMIME_ADDRESS_TYPE_TO, "To");
+    addPersons(Key::ADDITIONAL_RECIPIENTS, GMIME_ADDRESS_TYPE_CC, "Cc");
+    addPersons(Key::HIDDEN_ADDITIONAL_RECIPIENTS, GMIME_ADDRESS_TYPE_BCC, "Bcc");
     addDates();
     const Leaves leaves = leavesOf(_message);
     addBody(leaves);
@@ -204,11 +204,13 @@ class ItemBuilder {
     }
   }
 
-  void addPersons(Key key, GMimeAddressType type) {
+  // A header that holds text but no address that can be read gives one person of that name.
+  void addPersons(Key key, GMimeAddressType type, const char* header) {
     TextBudget names;
     TextBudget addresses;
     std::vector<std::shared_ptr<TLPerson>> persons;
-    std::vector<InternetAddressList*> pending{g_mime_message_get_addresses(_message, type)};
+    InternetAddressList* const all = g_mime_message_get_addresses(_message, type);
+    std::vector<InternetAddressList*> pending{all};
     while (!pending.empty()) {
       InternetAddressList* const list = pending.back();
       pending.pop_back();
@@ -223,6 +225,11 @@ class ItemBuilder {
         }
         if (names.exhausted() || addresses.exhausted()) break;
       }
+    }
+    const TLString text = platform::fromUTF8(headerOf(_message, header));
+    if ((all == nullptr || internet_address_list_length(all) == 0) && !isBlank(text)) {
+      persons.push_back(std::make_shared<TLPerson>());
+      persons.back()->setName(TLString(names.take(text)));
     }
     _cut = _cut || names.exhausted() || addresses.exhausted();
     if (!persons.empty()) _item->addAttributeWithKeyPersonValues(key, std::move(persons));

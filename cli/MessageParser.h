@@ -36,7 +36,8 @@ class MessageParser {
   // The item has
   //   identifier, domainIdentifier          from the origin
   //   SUBJECT, X_FROM                       Subject; X-From, else Sender
-  //   AUTHORS, RECIPIENTS, ADDITIONAL_..., HIDDEN_ADDITIONAL_...   From, To, Cc, Bcc
+  //   AUTHORS, RECIPIENTS, ADDITIONAL_..., HIDDEN_ADDITIONAL_...   From, To, Cc, Bcc; where no
+  //                                         address can be read, the header's text as a name
   //   MAIL_DATE_RECEIVED                    the topmost Received, else Date
   //   CONTENT_CREATION_DATE                 Date
   //   TEXT_CONTENT                          all inline text/plain parts, or where they hold no text
