@@ -197,8 +197,7 @@ TEST_F(IndexerTest, HTMLPersonsAndListsGoToTheirZones) {
   item->addAttributeWithKeyStringValues(MAILBOXES, {{u"Inbox"}});
   item->addAttributeWithKeyStringValue(CONTENT_DESCRIPTION, u"unsearchable");
   ASSERT_EQ(add({item}), std::nullopt);
-  for (const char* text :
-       {"grusse aus bern", "lovelace", "ada example", "report", "2024"}) {
+  for (const char* text : {"grusse aus bern", "lovelace", "ada example", "report", "2024"}) {
     EXPECT_EQ(search(text), "a") << text;
   }
   EXPECT_EQ(search("unsearchable"), "");
