@@ -262,7 +262,7 @@ TEST_F(RPCTest, AReplyBeyondTheProtocolIsAnError) {
 TEST_F(RPCTest, RubbishEndsOnlyItsOwnConnection) {
   for (const std::string& bytes :
        {std::string("GET / HTTP/1.0\r\n\r\n"), std::string(100000, '\xFF'),
-        std::string("\0AUTH EXTERNAL 39393939\r\nBEGIN\r\nl\1", 36)}) {
+        std::string("\0AUTH EXTERNAL 39393939\r\nBEGIN\r\nl\1", 34)}) {
     const int descriptor = connectTo(path());
     [[maybe_unused]] const ssize_t n = send(descriptor, bytes.data(), bytes.size(), MSG_NOSIGNAL);
     shutdown(descriptor, SHUT_WR);
