@@ -31,7 +31,7 @@ namespace bench {
 
 namespace {
 
-constexpr std::chrono::milliseconds kSampleInterval(5);
+constexpr std::chrono::milliseconds kSampleInterval(20);
 constexpr int kReadyMilliseconds = 30000;
 
 [[noreturn]] void fail(const std::string& what) {

@@ -30,7 +30,7 @@ class ScratchDirectory {
 // figure may be off by some hundred kilobytes.
 struct Memory {
   uint64_t anonymous = 0;      // RssAnon
-  uint64_t anonymousPeak = 0;  // highest RssAnon seen, looked at every 5 ms
+  uint64_t anonymousPeak = 0;  // highest RssAnon seen, looked at every 20 ms
   uint64_t residentPeak = 0;   // VmHWM: mapped files count too
 };
 
