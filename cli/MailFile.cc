@@ -102,11 +102,13 @@ class Reader {
   bool run() {
     const std::string_view head = _lines.peek();
     if (head.starts_with(kFrom)) return readMbox();
-    if (_lines.error() && head.empty()) return _sink.failure(_path, _lines.error()->message);
-    if (isMaildirFile(_path) || _path.ends_with(".eml") || looksLikeMessage(head)) {
+    const bool failedAtOnce = _lines.error() && head.empty();
+    if (!failedAtOnce &&
+        (isMaildirFile(_path) || _path.ends_with(".eml") || looksLikeMessage(head))) {
       return readSingle();
     }
-    if (head.empty()) return true;  // an empty mbox file
+    if (head.empty() && !_lines.error()) return true;  // an empty mbox file
+    if (_lines.error()) return _sink.failure(_path, _lines.error()->message);
     if (_named) return _sink.failure(_path, "neither an mbox file nor a message");
     _sink.ignored(_path);
     return true;
@@ -115,14 +117,14 @@ class Reader {
  private:
   bool readSingle() {
     while (const auto piece = next()) append(piece->bytes);
-    return finish(originOfFile(_path), _path);
+    return finish(originOfFile(_path), _path, true);
   }
 
   bool readMbox() {
     MessageOrigin origin = originOfMbox(_path);
     uint64_t start = 0;
     bool afterBlank = true;
-    const auto deliver = [&] {
+    const auto deliver = [&](bool last) {
       origin.identifier = mboxIdentifier(_path, start);
       // The empty line in front of the next message is no part of this one.
       if (_message.ends_with("\n\r\n")) {
@@ -130,20 +132,20 @@ class Reader {
       } else if (_message.ends_with("\n\n")) {
         _message.pop_back();
       }
-      return finish(origin, fmt::format("{}:{}", _path, start));
+      return finish(origin, fmt::format("{}:{}", _path, start), last);
     };
     while (const auto piece = next()) {
       const bool first = piece->offset == 0;
       const bool separator = piece->startsLine && afterBlank && (first || isFromLine(piece->bytes));
       afterBlank = piece->startsLine && isBlankLine(piece->bytes);
       if (separator) {
-        if (!first && !deliver()) return false;
+        if (!first && !deliver(false)) return false;
         start = piece->offset;
         continue;
       }
       append(piece->bytes.substr(piece->startsLine && isQuotedFromLine(piece->bytes) ? 1 : 0));
     }
-    return deliver();
+    return deliver(true);
   }
 
   std::optional<LineReader::Piece> next() {
@@ -159,13 +161,13 @@ class Reader {
     if (!_tooLong) _message.append(bytes);
   }
 
-  // Hands out the message and makes room for the next. One at the end of a file that could not be
+  // Hands out the message and makes room for the next. The last one of a file that could not be
   // read to its end is not complete.
-  bool finish(const MessageOrigin& origin, const std::string& where) {
+  bool finish(const MessageOrigin& origin, const std::string& where, bool last) {
     bool goOn;
     if (_tooLong) {
       goOn = _sink.failure(where, fmt::format("longer than {} MiB", kMaximumMessageBytes >> 20));
-    } else if (_lines.error()) {
+    } else if (last && _lines.error()) {
       goOn = _sink.failure(where, _lines.error()->message);
     } else {
       goOn = _sink.message(_message, origin);

@@ -61,14 +61,19 @@ class NestingGuard {
 
 inline constexpr uint64_t kHashFactor = 2654435761;
 
+// A whole number modulo 2 to the 64th.
+inline uint64_t wrap(double value) {
+  return static_cast<uint64_t>(std::fmod(value, 0x1p64));
+}
+
 // A number and its negation hash alike. Infinities and NaN contribute nothing.
 inline uint64_t hashOf(double value) {
   const double magnitude = std::fabs(value);
   if (!std::isfinite(magnitude)) return 0;
   const double rounded = std::floor(magnitude + 0.5);
   const double fraction = std::ldexp(magnitude - rounded, 64);
-  const uint64_t whole = static_cast<uint64_t>(std::fmod(rounded, 0x1p64)) * kHashFactor;
-  const auto part = static_cast<uint64_t>(std::fabs(fraction));
+  const uint64_t whole = wrap(rounded) * kHashFactor;
+  const uint64_t part = wrap(std::fabs(fraction));
   return fraction < 0 ? whole - part : whole + part;
 }
 
@@ -311,6 +316,8 @@ struct TLFieldKind<std::vector<std::shared_ptr<Record>>>
   using One = TLFieldKind<Element>;
 
   static bool read(std::vector<Element>& value, TLReader& reader, uint64_t wireType) {
+    // Items have a handful of attributes: skip the first steps of growth.
+    if (value.capacity() == 0) value.reserve(4);
     return One::read(value.emplace_back(), reader, wireType);
   }
   static void writeElement(uint32_t number, const Element& element, TLWriter& writer) {

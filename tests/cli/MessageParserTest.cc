@@ -180,8 +180,8 @@ TEST(MessageParser, WhatIsNoMessageIsNamed) {
       {"", "the message is empty"},
       {" \r\n\n", "the message is empty"},
       {"\n\nbody only\n", "the message has no header"},
-      {std::string(1000, '\0'), "the message has no header"},
-      {"just a line without a colon", "the message has no header"},
+      {std::string(1000, '\0'), "not a mail message"},
+      {"just a line without a colon", "not a mail message"},
   };
   for (const auto& c : kCases) {
     std::string reason;

@@ -35,8 +35,8 @@ TEST(TextBudget, TakesWholeCharactersWhileThereIsRoom) {
   } kCases[] = {{u"", 0, 0, false},          {u"abc", 5, 3, false},
                 {u"abc", 4, 2, true},        {u"abc", 1, 0, true},
                 {u"яя", 8, 2, false},        {u"яя", 7, 1, true},
-                {u"京都", 10, 2, false},     {u"a京", 7, 2, false},
-                {u"a京", 6, 1, true},  // a blank between
+                {u"京都", 10, 2, false},     {u"a京", 8, 2, false},
+                {u"a京", 7, 1, true},  // a blank between
                 {u"\U0001F600", 6, 0, true}, {u"\U0001F600", 7, 2, false}};
   for (const auto& c : kCases) {
     TextBudget budget(c.budget);

@@ -64,7 +64,8 @@ class SearchServiceTest : public testing::Test {
         [&](auto reply) { service.indexItems(std::move(items), "test", protectionClass, reply); });
   }
   // Number of results, -1 after an error, which goes to `lastError`.
-  int search(const std::shared_ptr<TLQuery>& query, int64_t maximum = 100, const std::string& protectionClass = "default") {
+  int search(const std::shared_ptr<TLQuery>& query, int64_t maximum = 100,
+             const std::string& protectionClass = "default") {
     int count = -2;
     service.searchItemsForQuery(*query, 1, protectionClass, maximum,
                                 [&](const std::optional<Items>& items, const Outcome& error) {

@@ -307,8 +307,9 @@ TEST(Records, HashOfNumbers) {
   EXPECT_EQ(hashOf(2.75), 3 * factor - (uint64_t{1} << 62));
   EXPECT_EQ(hashOf(0x1p64), 0U);
   EXPECT_EQ(hashOf(0x1p64 + 0x1p12), 4096 * factor);
-  for (const double odd : {std::numeric_limits<double>::infinity(), std::nan(""), 1e308}) {
-    (void)hashOf(odd);
+  for (const double odd :
+       {std::numeric_limits<double>::infinity(), std::nan(""), 1e308, 0x1p52 + 1}) {
+    EXPECT_EQ(hashOf(odd), hashOf(-odd));
   }
   TLAttribute attribute;
   attribute.setIntValue(-1);

@@ -1,0 +1,35 @@
+# Bash completion of tallow(1).
+
+_tallow() {
+  local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
+  local commands='index search explain delete reset stats metrics ping vacuum state'
+  local options='--runtime-dir --class --name --format --limit --color --wait --yes --verbose --help
+    --version'
+  # Bash takes --option=value apart.
+  if [[ $prev == = ]]; then
+    prev=${COMP_WORDS[COMP_CWORD - 2]}
+  elif [[ $cur == = ]]; then
+    prev=${COMP_WORDS[COMP_CWORD - 1]} cur=
+  fi
+  COMPREPLY=()
+  case $prev in
+    --format) mapfile -t COMPREPLY < <(compgen -W 'text json files' -- "$cur"); return ;;
+    --color) mapfile -t COMPREPLY < <(compgen -W 'auto always never' -- "$cur"); return ;;
+    --runtime-dir) compopt -o dirnames; return ;;
+    --class | --name | --limit | --wait) return ;;
+  esac
+  if [[ $cur == -* ]]; then
+    mapfile -t COMPREPLY < <(compgen -W "$options" -- "$cur")
+    return
+  fi
+  local word
+  for word in "${COMP_WORDS[@]:1:COMP_CWORD-1}"; do
+    if [[ " $commands " == *" $word "* ]]; then
+      [[ $word == index ]] && compopt -o default
+      return
+    fi
+  done
+  mapfile -t COMPREPLY < <(compgen -W "$commands" -- "$cur")
+}
+
+complete -F _tallow tallow

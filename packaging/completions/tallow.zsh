@@ -1,0 +1,30 @@
+#compdef tallow
+# Zsh completion of tallow(1).
+
+local -a commands options
+commands=(
+  'index:index mail'
+  'search:search for messages'
+  'explain:search and show the scores'
+  'delete:delete messages by identifier'
+  'reset:delete everything that is indexed'
+  'stats:show the statistics of store and index'
+  'metrics:show the metrics of the text index'
+  'ping:ask the daemon whether it is there'
+  'vacuum:drop what is deleted and compact'
+  'state:show the state of a client'
+)
+options=(
+  '--runtime-dir=[directory of the sockets]:directory:_files -/'
+  '--class=[protection class]:class:'
+  '--name=[name of this client]:name:'
+  '--format=[output]:format:(text json files)'
+  '--limit=[most results]:number:'
+  '--color=[colours]:when:(auto always never)'
+  '--wait=[seconds to wait for the daemon]:seconds:'
+  '(-y --yes)'{-y,--yes}'[do not ask]'
+  '(-v --verbose)'{-v,--verbose}'[name what was cut or ignored]'
+  '(-h --help)'{-h,--help}'[show help]'
+  '--version[show the version]'
+)
+_arguments -S $options '1:command:{_describe command commands}' '*:argument:{ [[ $words[(I)index] -gt 0 ]] && _files }'

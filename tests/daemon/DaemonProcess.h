@@ -1,0 +1,46 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <string>
+#include <vector>
+
+namespace testsupport {
+
+// The daemon as a process of its own, with its state and sockets below a directory of the test.
+class DaemonProcess {
+ public:
+  // Starts it and waits until it says that it is ready, or has ended.
+  explicit DaemonProcess(const std::string& directory, const std::vector<int>& passedSockets = {},
+                         const std::string& socketNames = "");
+  // Kills it where it still runs.
+  ~DaemonProcess();
+  DaemonProcess(const DaemonProcess&) = delete;
+  DaemonProcess& operator=(const DaemonProcess&) = delete;
+
+  [[nodiscard]] bool ready() const { return _ready; }
+  [[nodiscard]] pid_t pid() const { return _pid; }
+  [[nodiscard]] const std::string& runtimeDirectory() const { return _runtimeDirectory; }
+  [[nodiscard]] std::string socketOf(const std::string& service) const {
+    return _runtimeDirectory + "/" + service;
+  }
+
+  void signal(int number) const;
+  // Waits for the end; the exit status, or 128 and the number of the signal that ended it.
+  int wait();
+  // What it has written to its standard error so far.
+  [[nodiscard]] std::string log() const;
+  // Waits until the log holds `text`; false when the daemon ended without.
+  bool waitForLog(const std::string& text) const;
+
+ private:
+  bool waitUntilReady(int notifySocket);
+
+  const std::string _directory;
+  const std::string _runtimeDirectory;
+  pid_t _pid = -1;
+  bool _ready = false;
+  int _ended = -1;  // a descriptor of the process that can be polled for its end
+};
+
+}  // namespace testsupport

@@ -1,0 +1,316 @@
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <systemd/sd-bus.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <fstream>
+#include <regex>
+#include <set>
+#include <thread>
+
+#include "client/DebugServiceProxy.h"
+#include "client/SearchServiceProxy.h"
+#include "daemon/TALIndexerManager.h"
+#include "platform/Files.h"
+#include "records/TLParamsManager.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using client::EncodedItem;
+using testsupport::DaemonProcess;
+using Outcome = std::optional<TLError>;
+
+EncodedItem mail(const std::string& identifier, const std::string& subject,
+                 const std::string& body = "") {
+  TLIndexableItem item;
+  item.setIdentifier(platform::fromUTF8(identifier));
+  item.addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, platform::fromUTF8(subject));
+  item.addAttributeWithKeyStringValue(TLAttributeKey::TEXT_CONTENT, platform::fromUTF8(body));
+  return client::encode(item);
+}
+
+std::vector<EncodedItem> mails(const std::string& prefix, int count) {
+  std::vector<EncodedItem> items;
+  for (int i = 0; i < count; ++i) {
+    std::string body;
+    for (int word = 0; word < 300; ++word) body += fmt::format("w{} ", i * 7 + word);
+    items.push_back(mail(fmt::format("{}{}", prefix, i), "word " + prefix, body));
+  }
+  return items;
+}
+
+// Number of results, or the code of the error.
+int64_t search(client::SearchServiceProxy& service, const std::string& text,
+               const std::string& protectionClass = "default") {
+  TLQuery query;
+  query.setRawQuery(platform::fromUTF8(text));
+  query.setOriginalQuery(platform::fromUTF8(text));
+  Outcome error;
+  const auto items = service.searchItems(query, 0, protectionClass,
+                                         client::SearchServiceProxy::kNoMaximum, &error);
+  return items ? static_cast<int64_t>(items->size()) : error->code;
+}
+
+class DaemonProcessTest : public testing::Test {
+ protected:
+  testsupport::TemporaryDirectory directory;
+};
+
+class EndingSignal : public DaemonProcessTest, public testing::WithParamInterface<int> {};
+
+int listenAt(const std::string& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  path.copy(address.sun_path, sizeof address.sun_path - 1);
+  const int descriptor = socket(AF_UNIX, SOCK_STREAM, 0);
+  EXPECT_EQ(bind(descriptor, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  EXPECT_EQ(listen(descriptor, 8), 0);
+  return descriptor;
+}
+
+// The members of an introspection text with their arguments: "Member(sas)->b", names left out.
+std::set<std::string> members(const std::string& xml, const std::string& interface) {
+  std::set<std::string> out;
+  const size_t from = xml.find("<interface name=\"" + interface + "\"");
+  const std::string body = xml.substr(from, xml.find("</interface>", from) - from);
+  const std::regex method("<method name=\"(\\w+)\">([\\s\\S]*?)</method>");
+  const std::regex argument("<arg ([^>]*)>");
+  for (std::sregex_iterator m(body.begin(), body.end(), method), end; m != end; ++m) {
+    std::string text = (*m)[1].str() + "(";
+    const std::string arguments = (*m)[2].str();
+    for (std::sregex_iterator a(arguments.begin(), arguments.end(), argument); a != end; ++a) {
+      std::smatch type, name;
+      const std::string attributes = (*a)[1].str();
+      std::regex_search(attributes, type, std::regex("type=\"([^\"]*)\""));
+      std::regex_search(attributes, name, std::regex("name=\"([^\"]*)\""));
+      const bool output = attributes.find("direction=\"out\"") != std::string::npos;
+      text += fmt::format("{}{} {},", output ? ">" : "", type[1].str(), name[1].str());
+    }
+    out.insert(text + ")");
+  }
+  return out;
+}
+
+std::string introspect(const std::string& socketPath, const std::string& objectPath) {
+  sd_bus* bus = nullptr;
+  sd_bus_new(&bus);
+  sd_bus_set_address(bus, ("unix:path=" + socketPath).c_str());
+  EXPECT_GE(sd_bus_start(bus), 0);
+  sd_bus_message* reply = nullptr;
+  sd_bus_call_method(bus, nullptr, objectPath.c_str(), "org.freedesktop.DBus.Introspectable",
+                     "Introspect", nullptr, &reply, "");
+  const char* xml = "";
+  if (reply != nullptr) sd_bus_message_read(reply, "s", &xml);
+  std::string out = xml;
+  sd_bus_message_unref(reply);
+  sd_bus_close_unref(bus);
+  return out;
+}
+
+}  // namespace
+
+TEST_P(EndingSignal, EndsInOrderBesideABatchAndASearchAndLosesNothingAcknowledged) {
+  int acknowledged = 0;
+  {
+    DaemonProcess daemon(directory.path());
+    ASSERT_TRUE(daemon.ready());
+    client::SearchServiceProxy first(daemon.runtimeDirectory());
+    ASSERT_TRUE(first.indexItems(mails("first", 50), "test", "default", nullptr));
+    std::thread indexing([&] {
+      client::SearchServiceProxy service(daemon.runtimeDirectory());
+      for (int batch = 0;
+           service.indexItems(mails(fmt::format("b{}x", batch), 20), "test", "default", nullptr);
+           ++batch) {
+        acknowledged += 20;
+      }
+    });
+    std::thread searching([&] {
+      client::SearchServiceProxy service(daemon.runtimeDirectory());
+      Outcome error;
+      TLQuery query;
+      query.setOriginalQuery(u"wo");
+      while (!error) static_cast<void>(service.searchItems(query, 0, "default", 50, &error));
+    });
+    EXPECT_TRUE(daemon.waitForLog("Finished indexItems numDocuments=20"));
+    EXPECT_TRUE(daemon.waitForLog("Finished searchItemsForQuery"));
+    daemon.signal(GetParam());
+    EXPECT_EQ(daemon.wait(), 0);
+    indexing.join();
+    searching.join();
+    const std::string log = daemon.log();
+    for (const char* line : {"Received signal", "Starting shutdown...", "Indexer has shut down",
+                             "SearchService has shut down", "Stopping main run loop."}) {
+      EXPECT_NE(log.find(line), std::string::npos) << line;
+    }
+  }
+  EXPECT_GT(acknowledged, 0);
+  const DaemonProcess again(directory.path());
+  client::SearchServiceProxy service(again.runtimeDirectory());
+  TLQuery query;
+  query.setOriginalQuery(u"word");
+  query.setSearchParams(TLParamsManager::paramsFromString(u"salt.maxTopK=1000000"));
+  const auto items =
+      service.searchItems(query, 0, "default", client::SearchServiceProxy::kNoMaximum, nullptr);
+  ASSERT_TRUE(items);
+  EXPECT_GE(static_cast<int>(items->size()), 50 + acknowledged);
+}
+
+INSTANTIATE_TEST_SUITE_P(Signals, EndingSignal, testing::Values(SIGHUP, SIGPIPE, SIGTERM));
+
+TEST_F(DaemonProcessTest, WhatWasAcknowledgedSurvivesAKill) {
+  {
+    DaemonProcess daemon(directory.path());
+    client::SearchServiceProxy service(daemon.runtimeDirectory());
+    ASSERT_TRUE(service.indexItems(mails("a", 100), "test", "default", nullptr));
+    const std::vector<std::string> gone{"a5", "a6"};
+    ASSERT_TRUE(service.deleteItemsWithIdentifiers(gone, "test", "default", nullptr));
+    daemon.signal(SIGKILL);
+    EXPECT_EQ(daemon.wait(), 128 + SIGKILL);
+  }
+  const DaemonProcess again(directory.path());
+  ASSERT_TRUE(again.ready());
+  client::SearchServiceProxy service(again.runtimeDirectory());
+  EXPECT_EQ(search(service, "word"), 98);
+}
+
+TEST_F(DaemonProcessTest, AllOperationsWorkOverTheSockets) {
+  DaemonProcess daemon(directory.path());
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  client::DebugServiceProxy debug(daemon.runtimeDirectory());
+  const std::vector<EncodedItem> items{mail("a", "Lunch"), mail("b", "Lunch")};
+  ASSERT_TRUE(service.indexItems(items, {}, "state", "client", "default", nullptr));
+  EXPECT_EQ(service.fetchLastClientState("client", "default", nullptr), "state");
+  EXPECT_EQ(service.fetchLastClientState("other", "default", nullptr), std::nullopt);
+  EXPECT_EQ(search(service, "lun"), 2);
+  const std::vector<std::string> gone{"a"};
+  EXPECT_TRUE(service.deleteItemsWithIdentifiers(gone, "client", "default", nullptr));
+  EXPECT_EQ(search(service, "lun"), 1);
+  EXPECT_TRUE(service.deleteItemsWithDomainIdentifiers(gone, "client", "default", nullptr));
+  EXPECT_EQ(debug.fetchStatsForIndexer("n", "default", nullptr)->size(), 18u);
+  EXPECT_NE(debug.fetchStatsForSalt("n", "default", nullptr)->find("---- Docs: 1\n"),
+            std::string::npos);
+  EXPECT_TRUE(debug.forceVacuumAndCompact("default", nullptr));
+  EXPECT_TRUE(service.deleteAllItems("client", "default", nullptr));
+  EXPECT_EQ(search(service, "lun"), 0);
+  EXPECT_NE(debug.ping("hello", nullptr)->find("Received hello\n"), std::string::npos);
+  daemon.signal(SIGUSR1);
+  EXPECT_TRUE(
+      daemon.waitForLog("default index stats: {\"DocStoreNumItems\":0,\"SaltNumItems\":0}"));
+}
+
+TEST_F(DaemonProcessTest, WhatDoesNotParseIsRefusedByArgumentAndIndex) {
+  const DaemonProcess daemon(directory.path());
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  Outcome error;
+  const std::vector<EncodedItem> items{mail("a", "fine"), {"bad", std::string("\x0A\x7F", 2)}};
+  EXPECT_FALSE(service.indexItems(items, "test", "default", &error));
+  EXPECT_NE(error->message.find("argument 0 (items), index 1"), std::string::npos)
+      << error->message;
+  EXPECT_EQ(search(service, "fine"), 0);
+  const std::vector<EncodedItem> nameless{mail("b", "fine"), mail("", "fine")};
+  EXPECT_FALSE(service.indexItems(nameless, "test", "default", &error));
+  EXPECT_EQ(*error, (TLError{"TALIndexer", 1, "document has no identifier"}));
+  EXPECT_EQ(search(service, "fine"), 0);
+  // Wrapped by hand, as the library itself would refuse to write so deep a tree.
+  std::string tree;
+  for (int depth = 0; depth < 100000; ++depth) {
+    std::string length;
+    for (size_t n = tree.size(); length.empty() || n != 0; n >>= 7) {
+      length += static_cast<char>((n & 0x7F) | (n >> 7 != 0 ? 0x80 : 0));
+    }
+    if (tree.size() > 300000) break;
+    tree.insert(0, (depth == 0 ? "\x0A" : "\x4A") + length);
+  }
+  sd_bus* bus = nullptr;
+  sd_bus_new(&bus);
+  sd_bus_set_address(bus, ("unix:path=" + daemon.socketOf(client::kSearchServiceName)).c_str());
+  ASSERT_GE(sd_bus_start(bus), 0);
+  sd_bus_message* call = nullptr;
+  sd_bus_message_new_method_call(bus, &call, nullptr, "/com/quill/tallowsearch/SearchService",
+                                 client::kSearchServiceName, "SearchItemsForQuery");
+  tree[0] = '\x0A';
+  sd_bus_message_append_array(call, 'y', tree.data(), tree.size());
+  sd_bus_message_append(call, "tsx", uint64_t{0}, "default", int64_t{1});
+  sd_bus_error refused = SD_BUS_ERROR_NULL;
+  EXPECT_LT(sd_bus_call(bus, call, 0, &refused, nullptr), 0);
+  EXPECT_STREQ(refused.message, "argument 0 (query): the bytes are no TLQuery");
+  sd_bus_error_free(&refused);
+  sd_bus_message_unref(call);
+  sd_bus_close_unref(bus);
+  EXPECT_EQ(search(service, "fine"), 0);
+}
+
+TEST_F(DaemonProcessTest, ClassesAreSeparateAndFollowTheLock) {
+  DaemonProcess daemon(directory.path());
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  const std::vector<EncodedItem> items{mail("a", "word")};
+  ASSERT_TRUE(service.indexItems(items, "test", SysFileProtectionComplete, nullptr));
+  EXPECT_EQ(search(service, "word", "other"), 0);
+  ASSERT_TRUE(platform::writeFileAtomically(daemon.socketOf("lock_status"), "1 1", nullptr));
+  ASSERT_TRUE(daemon.waitForLog("Device locked with state: 1"));
+  EXPECT_EQ(search(service, "word", SysFileProtectionComplete), -2);
+  EXPECT_EQ(search(service, "word", "other"), 0);
+  ASSERT_TRUE(platform::writeFileAtomically(daemon.socketOf("lock_status"), "0 1", nullptr));
+  ASSERT_TRUE(daemon.waitForLog("Device unlocked with state: 0"));
+  EXPECT_EQ(search(service, "word", SysFileProtectionComplete), 1);
+  for (const std::string& bad : {std::string("../x"), std::string("a/b"), std::string("."),
+                                 std::string(300, 'c'), std::string()}) {
+    EXPECT_NE(search(service, "word", bad), 0) << bad;
+  }
+  EXPECT_EQ(platform::listDirectory(directory / "state/TallowSearch", nullptr)->size(), 2u);
+}
+
+TEST_F(DaemonProcessTest, BeforeTheFirstUnlockAllClassesAreRefused) {
+  ASSERT_TRUE(platform::createDirectories(directory / "run", nullptr));
+  ASSERT_TRUE(platform::writeFileAtomically(directory / "run/lock_status", "1 0", nullptr));
+  const DaemonProcess daemon(directory.path());
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  EXPECT_EQ(search(service, "word", "any"), -2);
+  EXPECT_TRUE(platform::listDirectory(directory / "state/TallowSearch", nullptr)->empty());
+}
+
+TEST_F(DaemonProcessTest, ASecondDaemonEndsWithAMessage) {
+  const DaemonProcess first(directory.path());
+  ASSERT_TRUE(first.ready());
+  DaemonProcess second(directory.path());
+  EXPECT_FALSE(second.ready());
+  EXPECT_EQ(second.wait(), 1);
+  EXPECT_NE(second.log().find("tallowsearchd.lock is held by a running daemon"), std::string::npos);
+  client::DebugServiceProxy debug(first.runtimeDirectory());
+  EXPECT_TRUE(debug.ping("x", nullptr));
+}
+
+TEST_F(DaemonProcessTest, TakesSocketsByActivation) {
+  const int search = listenAt(directory / "search");
+  const int debug = listenAt(directory / "debug");
+  DaemonProcess daemon(directory.path(), {search, debug},
+                       std::string(client::kSearchServiceName) + ":" + client::kDebugServiceName);
+  ASSERT_TRUE(daemon.ready());
+  EXPECT_NE(introspect(directory / "debug", "/com/quill/tallow/DebugService").find("Ping"),
+            std::string::npos);
+  EXPECT_FALSE(platform::fileExists(daemon.socketOf(client::kDebugServiceName)));
+  daemon.signal(SIGTERM);
+  EXPECT_EQ(daemon.wait(), 0);
+  EXPECT_TRUE(platform::fileExists(directory / "debug"));
+  close(search);
+  close(debug);
+}
+
+TEST_F(DaemonProcessTest, TheInterfacesAreThoseOfTheirFiles) {
+  const DaemonProcess daemon(directory.path());
+  const std::vector<std::pair<std::string, std::string>> services{
+      {client::kSearchServiceName, "/com/quill/tallowsearch/SearchService"},
+      {client::kDebugServiceName, "/com/quill/tallow/DebugService"}};
+  for (const auto& [name, path] : services) {
+    const auto file =
+        platform::readFile(std::string(TALLOW_INTERFACES) + "/" + name + ".xml", 1 << 20, nullptr);
+    ASSERT_TRUE(file) << name;
+    const auto expected = members(*file, name);
+    EXPECT_GE(expected.size(), 4u);
+    EXPECT_EQ(members(introspect(daemon.socketOf(name), path), name), expected);
+  }
+}
