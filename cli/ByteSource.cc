@@ -7,8 +7,8 @@
 #include <zlib.h>
 
 #include <cerrno>
+#include <memory>
 #include <string_view>
-#include <vector>
 
 namespace cli {
 
@@ -34,7 +34,8 @@ std::nullopt_t fail(TLErrorOut error, int code, const char* message) {
 // The file as it is, through a buffer that the decoders read in place.
 class FileSource final : public ByteSource {
  public:
-  explicit FileSource(int descriptor) : _descriptor(descriptor), _buffer(kBufferBytes) {}
+  explicit FileSource(int descriptor)
+      : _descriptor(descriptor), _buffer(std::make_unique_for_overwrite<char[]>(kBufferBytes)) {}
   ~FileSource() override { close(_descriptor); }
 
   // The bytes in the buffer, at least one unless the file has ended.
@@ -42,7 +43,7 @@ class FileSource final : public ByteSource {
     if (_begin == _end) {
       ssize_t n;
       do {
-        n = ::read(_descriptor, _buffer.data(), _buffer.size());
+        n = ::read(_descriptor, _buffer.get(), kBufferBytes);
       } while (n < 0 && errno == EINTR);
       if (n < 0) {
         platform::setError(error, platform::posixError(errno, "cannot read"));
@@ -51,7 +52,7 @@ class FileSource final : public ByteSource {
       _begin = 0;
       _end = static_cast<size_t>(n);
     }
-    return std::string_view(_buffer.data() + _begin, _end - _begin);
+    return std::string_view(_buffer.get() + _begin, _end - _begin);
   }
   void skip(size_t count) {
     _begin += count;
@@ -69,7 +70,7 @@ class FileSource final : public ByteSource {
 
  private:
   const int _descriptor;
-  std::vector<char> _buffer;
+  const std::unique_ptr<char[]> _buffer;
   size_t _begin = 0;
   size_t _end = 0;
   uint64_t _consumed = 0;

@@ -5,6 +5,7 @@
 #include <unicode/utf16.h>
 #include <unicode/utf8.h>
 
+#include <algorithm>
 #include <array>
 #include <cstdint>
 #include <memory>
@@ -55,6 +56,12 @@ TLStringView TextBudget::take(TLStringView text) {
   bool afterASCII = false;
   size_t i = 0;
   while (i < text.size()) {
+    if (const size_t run = std::min(platform::asciiPrefixLength(text.substr(i)), left); run > 0) {
+      left -= run;  // each costs 1
+      i += run;
+      afterASCII = true;
+      continue;
+    }
     size_t next = i;
     char32_t c;
     U16_NEXT(text.data(), next, text.size(), c);
