@@ -72,6 +72,27 @@ int listenAt(const std::string& path) {
   return descriptor;
 }
 
+std::string varint(size_t value) {
+  std::string bytes;
+  for (; value >= 0x80; value >>= 7) bytes += static_cast<char>(value | 0x80);
+  return bytes + static_cast<char>(value);
+}
+
+// A query whose root has a child that has a child and so on, written by hand, as the records refuse
+// to write so deep a tree.
+std::string queryOfDepth(size_t depth) {
+  std::vector<std::string> lengths;  // innermost first
+  for (size_t size = 0; lengths.size() < depth;) {
+    lengths.push_back(varint(size));
+    size += 1 + lengths.back().size();
+  }
+  std::string bytes;
+  for (auto length = lengths.rbegin(); length != lengths.rend(); ++length) {
+    bytes += (bytes.empty() ? '\x0A' : '\x4A') + *length;
+  }
+  return bytes;
+}
+
 // The members of an introspection text with their arguments: "Member(sas)->b", names left out.
 std::set<std::string> members(const std::string& xml, const std::string& interface) {
   std::set<std::string> out;
@@ -215,16 +236,7 @@ TEST_F(DaemonProcessTest, WhatDoesNotParseIsRefusedByArgumentAndIndex) {
   EXPECT_FALSE(service.indexItems(nameless, "test", "default", &error));
   EXPECT_EQ(*error, (TLError{"TALIndexer", 1, "document has no identifier"}));
   EXPECT_EQ(search(service, "fine"), 0);
-  // Wrapped by hand, as the library itself would refuse to write so deep a tree.
-  std::string tree;
-  for (int depth = 0; depth < 100000; ++depth) {
-    std::string length;
-    for (size_t n = tree.size(); length.empty() || n != 0; n >>= 7) {
-      length += static_cast<char>((n & 0x7F) | (n >> 7 != 0 ? 0x80 : 0));
-    }
-    if (tree.size() > 300000) break;
-    tree.insert(0, (depth == 0 ? "\x0A" : "\x4A") + length);
-  }
+  const std::string tree = queryOfDepth(100000);
   sd_bus* bus = nullptr;
   sd_bus_new(&bus);
   sd_bus_set_address(bus, ("unix:path=" + daemon.socketOf(client::kSearchServiceName)).c_str());
@@ -232,7 +244,6 @@ TEST_F(DaemonProcessTest, WhatDoesNotParseIsRefusedByArgumentAndIndex) {
   sd_bus_message* call = nullptr;
   sd_bus_message_new_method_call(bus, &call, nullptr, "/com/quill/tallowsearch/SearchService",
                                  client::kSearchServiceName, "SearchItemsForQuery");
-  tree[0] = '\x0A';
   sd_bus_message_append_array(call, 'y', tree.data(), tree.size());
   sd_bus_message_append(call, "tsx", uint64_t{0}, "default", int64_t{1});
   sd_bus_error refused{};
