@@ -40,6 +40,13 @@ std::string joinedWords(const Options& options) {
   return words;
 }
 
+// The daemon's answer to a text that holds no word, such as the first quote mark of a phrase that
+// is being typed: it finds nothing.
+bool asksForNothing(const std::optional<TLError>& error) {
+  constexpr int kNoTerms = 3;
+  return error && error->domain == "TALIndexer" && error->code == kNoTerms;
+}
+
 ExitStatus runSearch(const Options& options) {
   const std::string words = joinedWords(options);
   TLQuery query;
@@ -48,7 +55,8 @@ ExitStatus runSearch(const Options& options) {
   std::optional<TLError> error;
   client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
   const int64_t limit = options.limit == 0 ? service.kNoMaximum : options.limit;
-  const auto items = service.searchItems(query, 0, options.protectionClass, limit, &error);
+  auto items = service.searchItems(query, 0, options.protectionClass, limit, &error);
+  if (!items && asksForNothing(error)) items.emplace();
   if (!items) return complain(error);
 
   const Palette palette(colorAllowed(options.color, STDOUT_FILENO));

@@ -255,6 +255,54 @@ TEST_F(DaemonProcessTest, WhatDoesNotParseIsRefusedByArgumentAndIndex) {
   EXPECT_EQ(search(service, "fine"), 0);
 }
 
+TEST_F(DaemonProcessTest, OddItemsAndQueriesHaveTheirResult) {
+  const DaemonProcess daemon(directory.path());
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  const auto odd = [](const std::string& identifier, const std::string& marker) {
+    auto item = std::make_unique<TLIndexableItem>();
+    item->setIdentifier(platform::fromUTF8(identifier));
+    item->addAttributeWithKeyStringValue(TLAttributeKey::X_FROM, platform::fromUTF8(marker));
+    return item;
+  };
+  const auto html = odd("html", "odd");
+  html->addAttributeWithKeyBytesValue(TLAttributeKey::HTML_CONTENT_DATA,
+                                      std::string(10 << 20, '<'));
+  const auto separators = odd("separators", "odd");
+  separators->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, TLString(1000, u'-'));
+  const auto unknown = odd("unknown", "odd");
+  unknown->addAttributeWithKeyStringValue(static_cast<TLAttributeKey>(9999), u"nowhere");
+  unknown->addAttributeWithKeyStringValue(static_cast<TLAttributeKey>(-5), u"nowhere");
+  const auto surrogates = odd("surrogates", "odd");
+  surrogates->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT,
+                                             TLString(3, char16_t(0xD800)));
+  EncodedItem invalid = client::encode(*odd("invalid", "odd"));
+  invalid.bytes +=
+      std::string("\x0A\x06\x08\x0D\x1A\x02\xFF\xC0", 8);  // a subject of no valid UTF-8
+  const std::vector<EncodedItem> items{client::encode(*html), client::encode(*separators),
+                                       client::encode(*unknown), client::encode(*surrogates),
+                                       invalid};
+  Outcome error;
+  EXPECT_TRUE(service.indexItems(items, "test", "default", &error)) << platform::printable(error);
+  EXPECT_EQ(search(service, "odd"), 5);
+  EXPECT_EQ(search(service, "nowhere"), 0);
+  EXPECT_EQ(search(service, "?!"), 3);
+  const std::vector<EncodedItem> large{mail("large", "odd", std::string(300000, 'x'))};
+  EXPECT_FALSE(service.indexItems(large, "test", "default", &error));
+  EXPECT_EQ(*error, (TLError{"TALIndexer", 1, "index failed"}));
+
+  TLQuery query;
+  query.setOriginalQuery(u"odd");
+  query.setSearchParams(std::make_shared<TLParameters>());
+  for (const char16_t* key : {u"salt.maxTopK", u"zoneScore.Subject", u"nosuch", u""}) {
+    auto wrong = std::make_shared<TLParamKeyValue>();
+    wrong->setKey(key);
+    wrong->setBoolValue(true);
+    query.searchParams()->addKeyvalue(wrong);
+  }
+  EXPECT_TRUE(service.searchItems(query, ~uint64_t{0}, "default", -1, &error));
+  EXPECT_EQ(search(service, "odd"), 5);
+}
+
 TEST_F(DaemonProcessTest, ClassesAreSeparateAndFollowTheLock) {
   DaemonProcess daemon(directory.path());
   client::SearchServiceProxy service(daemon.runtimeDirectory());
