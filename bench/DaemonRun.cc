@@ -10,6 +10,7 @@
 #include <sys/syscall.h>
 #include <sys/un.h>
 #include <sys/wait.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -87,6 +88,12 @@ uint64_t statusBytes(const std::string& status, std::string_view field) {
   const size_t at = status.find(field);
   if (at == std::string::npos) return 0;
   return strtoull(status.c_str() + at + field.size(), nullptr, 10) * 1024;
+}
+
+double secondsOf(clockid_t clock) {
+  timespec time{};
+  if (clock_gettime(clock, &time) != 0) failWithErrno("clock_gettime");
+  return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) / 1e9;
 }
 
 }  // namespace
@@ -202,6 +209,14 @@ Memory DaemonRun::memory() {
   return _memory;
 }
 
+double DaemonRun::cpuSeconds() const {
+  clockid_t clock;
+  if (const int code = clock_getcpuclockid(_pid, &clock); code != 0) {
+    throw std::system_error(code, std::generic_category(), "clock_getcpuclockid");
+  }
+  return secondsOf(clock);
+}
+
 int DaemonRun::end(int signal) {
   const pid_t pid = std::exchange(_pid, -1);
   int status = 0;
@@ -228,8 +243,11 @@ uint64_t bytesOnDisk(const std::string& path) {
 }
 
 double secondsNow() {
-  using Seconds = std::chrono::duration<double>;
-  return Seconds(std::chrono::steady_clock::now().time_since_epoch()).count();
+  return secondsOf(CLOCK_MONOTONIC);
+}
+
+double cpuSecondsNow() {
+  return secondsOf(CLOCK_PROCESS_CPUTIME_ID);
 }
 
 int guarded(const char* program, int (*run)(int, char**), int argc, char** argv) {

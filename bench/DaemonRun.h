@@ -51,6 +51,9 @@ class DaemonRun {
 
   [[nodiscard]] Memory memory() TL_EXCLUDES(_mutex);
 
+  // Processor time of all its threads so far. Steadier than the clock on a machine with other work.
+  [[nodiscard]] double cpuSeconds() const;
+
   // Asks the daemon to end and waits until it has; throws unless it ended well.
   void stop();
 
@@ -79,6 +82,9 @@ class DaemonRun {
 
 // Seconds since some moment of the past.
 [[nodiscard]] double secondsNow();
+
+// Processor time of all threads of this process.
+[[nodiscard]] double cpuSecondsNow();
 
 // Calls `run`; an exception becomes a message and the exit status 1.
 [[nodiscard]] int guarded(const char* program, int (*run)(int, char**), int argc, char** argv);
