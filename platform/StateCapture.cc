@@ -3,6 +3,7 @@
 #include <cstring>
 #include <map>
 #include <memory>
+#include <new>
 
 #include "platform/Log.h"
 #include "platform/Mutex.h"
@@ -43,6 +44,15 @@ void putLittleEndian(std::string& record, size_t offset, uint32_t value) {
   for (size_t i = 0; i < 4; ++i) record[offset + i] = static_cast<char>(value >> (8 * i));
 }
 
+std::string makeRecord(const std::string& title, const std::vector<uint8_t>& data) {
+  std::string record(kHeaderSize, '\0');
+  putLittleEndian(record, 0, kSerialisedDictionary);
+  putLittleEndian(record, 4, static_cast<uint32_t>(data.size()));
+  std::memcpy(record.data() + kTitleOffset, title.data(), std::min(title.size(), kTitleSize - 1));
+  record.append(data.begin(), data.end());
+  return record;
+}
+
 }  // namespace
 
 std::optional<std::string> stateCaptureRecord(const std::string& title,
@@ -54,17 +64,16 @@ std::optional<std::string> stateCaptureRecord(const std::string& title,
   } catch (const std::exception& failure) {
     log().error(
         "Looks like this failed to transform state dictionary {} into a property list, please "
-        "check "
-        "previous logging: {}",
+        "check previous logging: {}",
         title, failure.what());
     return std::nullopt;
   }
-  std::string record(kHeaderSize, '\0');
-  putLittleEndian(record, 0, kSerialisedDictionary);
-  putLittleEndian(record, 4, static_cast<uint32_t>(data.size()));
-  std::memcpy(record.data() + kTitleOffset, title.data(), std::min(title.size(), kTitleSize - 1));
-  record.append(data.begin(), data.end());
-  return record;
+  try {
+    return makeRecord(title, data);
+  } catch (const std::bad_alloc&) {
+    log().error("no state data could be collected, see previous logging");
+    return std::nullopt;
+  }
 }
 
 std::vector<std::string> captureState() {
