@@ -164,8 +164,20 @@ void RPCOutbox::open(RunLoop* loop) {
   _loop = loop;
 }
 
+bool RPCOutbox::isCurrent() {
+  MutexLock lock(_mutex);
+  return _thread == std::this_thread::get_id();
+}
+
+void RPCOutbox::begin() {
+  MutexLock lock(_mutex);
+  _thread = std::this_thread::get_id();
+}
+
 void RPCOutbox::close() {
-  open(nullptr);
+  MutexLock lock(_mutex);
+  _loop = nullptr;
+  _thread = {};
 }
 
 // Knows its call by number only: the messages of the bus library are not for several threads, so
@@ -204,12 +216,14 @@ class RPCServerReply : public RPCReply {
  private:
   void finish(RPCServerConnection::BuildReply build, size_t bytes) {
     if (_finished.exchange(true)) return;
+    // A handler that answers before it returns need not wake the loop that it runs on.
+    if (_outbox->isCurrent()) return _connection.endCall(_call, build, bytes);
     _outbox->post([&connection = _connection, call = _call, build = std::move(build), bytes] {
       connection.endCall(call, build, bytes);
     });
   }
 
-  RPCServerConnection& _connection;  // touched only by items that the outbox accepts
+  RPCServerConnection& _connection;  // touched only where the outbox says that it lives
   const std::shared_ptr<RPCOutbox> _outbox;
   const uint64_t _call;
   std::atomic<bool> _finished{false};
@@ -236,6 +250,7 @@ void RPCServerConnection::finish(uint64_t milliseconds) {
 
 void RPCServerConnection::serve() {
   setThreadName("tallow.rpc");
+  _outbox->begin();
   if (openBus() && exportInterface()) {
     _authenticationTimer = _loop->addTimer(kAuthenticationMilliseconds, [this] {
       if (sd_bus_is_ready(_bus) > 0) return;

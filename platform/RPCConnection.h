@@ -19,12 +19,17 @@ class RPCOutbox {
  public:
   // Runs `item` on the connection's thread; false once the connection has ended.
   bool post(std::function<void()> item);
+  // True on the connection's thread, while the connection serves.
+  bool isCurrent();
   void open(RunLoop* loop);
+  // Called on the connection's thread, first and last.
+  void begin();
   void close();
 
  private:
   Mutex _mutex;
   RunLoop* _loop TL_GUARDED_BY(_mutex) = nullptr;
+  std::thread::id _thread TL_GUARDED_BY(_mutex);
 };
 
 // One accepted connection: the bus object and the thread that serves it. Made and destroyed on the
