@@ -7,6 +7,7 @@
 #include "platform/Paths.h"
 #include "platform/Signpost.h"
 #include "platform/StateCapture.h"
+#include "records/TLDebugServiceKeys.h"
 #include "tokenizer/TLLexemonAssetManager.h"
 
 using platform::MutexLock;
@@ -59,8 +60,8 @@ TALIndexer::TALIndexer(std::string path, const std::string& protectionClass,
         const auto value = [&stats](const char* key) {
           return stats.is_null() ? nlohmann::json(0) : stats.at(key);
         };
-        return nlohmann::json{{"DocStoreNumItems", value("TLDebugServiceDocStoreNumOfItems")},
-                              {"SaltNumItems", value("TLDebugServiceTextStoreNumOfItems")}};
+        return nlohmann::json{{"DocStoreNumItems", value(TLDebugServiceDocStoreNumOfItems)},
+                              {"SaltNumItems", value(TLDebugServiceTextStoreNumOfItems)}};
       });
 }
 
@@ -307,25 +308,25 @@ nlohmann::json TALIndexer::docStats() {
     m = _textStore->GetMetrics();
   }
   return {
-      {"TLDebugServiceDocStoreNumOfItems", documents},
-      {"TLDebugServiceTextStoreNumOfItems", m.Docs},
-      {"TLDebugServiceTextStoreNumOfItemsWithHtmlBody",
+      {TLDebugServiceDocStoreNumOfItems, documents},
+      {TLDebugServiceTextStoreNumOfItems, m.Docs},
+      {TLDebugServiceTextStoreNumOfItemsWithHtmlBody,
        zoneCount(m, TLAttributeKey::HTML_CONTENT_DATA)},
-      {"TLDebugServiceTextStoreNumOfItemsWithTextBody", zoneCount(m, TLAttributeKey::TEXT_CONTENT)},
-      {"TLDebugServiceTextStoreSize", m.TextBytes},
-      {"TLDebugServiceSaltMaxDocID", m.MaxDocID},
-      {"TLDebugServiceSaltLastDocID", m.LastDocID},
-      {"TLDebugServiceSaltTotalSuffixes", m.Suffixes},
-      {"TLDebugServiceSaltNumOfPages", m.Pages},
-      {"TLDebugServiceSaltHotSuffixes", m.HotSuffixes},
-      {"TLDebugServiceSaltScanPrefixSearched", m.Scans},
-      {"TLDebugServiceSaltScanTimeSecs", m.ScanSeconds},
-      {"TLDebugServiceSaltScanResults", m.ScanResults},
-      {"TLDebugServiceSaltScanPageLoads", m.ScanPageReads},
-      {"TLDebugServiceSaltScanDocTextFetches", m.ScanTextFetches},
-      {"TLDebugServiceSaltIndexTimeSecs", m.IndexingSeconds},
-      {"TLDebugServiceSaltVacuumNumOfPhases", m.Vacuums},
-      {"TLDebugServiceSaltVacuumTimeSecs", m.VacuumSeconds},
+      {TLDebugServiceTextStoreNumOfItemsWithTextBody, zoneCount(m, TLAttributeKey::TEXT_CONTENT)},
+      {TLDebugServiceTextStoreSize, m.TextBytes},
+      {TLDebugServiceSaltMaxDocID, m.MaxDocID},
+      {TLDebugServiceSaltLastDocID, m.LastDocID},
+      {TLDebugServiceSaltTotalSuffixes, m.Suffixes},
+      {TLDebugServiceSaltNumOfPages, m.Pages},
+      {TLDebugServiceSaltHotSuffixes, m.HotSuffixes},
+      {TLDebugServiceSaltScanPrefixSearched, m.Scans},
+      {TLDebugServiceSaltScanTimeSecs, m.ScanSeconds},
+      {TLDebugServiceSaltScanResults, m.ScanResults},
+      {TLDebugServiceSaltScanPageLoads, m.ScanPageReads},
+      {TLDebugServiceSaltScanDocTextFetches, m.ScanTextFetches},
+      {TLDebugServiceSaltIndexTimeSecs, m.IndexingSeconds},
+      {TLDebugServiceSaltVacuumNumOfPhases, m.Vacuums},
+      {TLDebugServiceSaltVacuumTimeSecs, m.VacuumSeconds},
   };
 }
 

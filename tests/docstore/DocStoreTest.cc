@@ -4,39 +4,23 @@
 #include <sys/resource.h>
 #include <sys/stat.h>
 
-#include <atomic>
 #include <csignal>
 #include <filesystem>
 #include <fstream>
-#include <thread>
 
 #include "docstore/TALSqliteDocStore.h"
+#include "tests/docstore/DocStoreSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using testing::ElementsAre;
+using testsupport::item;
 using testsupport::LogCapture;
+using testsupport::subjectOf;
 using testsupport::TemporaryDirectory;
+using testsupport::url;
 
 namespace {
-
-TLURL url(const std::string& name) {
-  return *TLURL::parse("tlw://b/" + name);
-}
-TLURL url(size_t number) {
-  return url(std::to_string(number));
-}
-
-std::shared_ptr<TLIndexableItem> item(const TLString& subject) {
-  auto result = std::make_shared<TLIndexableItem>();
-  result->setIdentifier(u"id " + subject);
-  result->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, subject);
-  return result;
-}
-
-const std::optional<TLString>& subjectOf(const std::shared_ptr<TLIndexableItem>& document) {
-  return document->stringValueForKey(TLAttributeKey::SUBJECT);
-}
 
 // Another connection to the file of the store.
 class Connection {
@@ -458,56 +442,4 @@ TEST_F(DocStore, AClosedStoreAnswersWithoutHarm) {
       nullptr, [](int64_t, uint32_t, const TLURL&, bool*, TLErrorOut) { FAIL(); }));
   _store.storeTopKVocab("v", nullptr);
   EXPECT_EQ(_store.loadTopKVocab(nullptr), std::nullopt);
-}
-
-TEST(DocStoreThreads, ReadersRunBesideAWriter) {
-  TALSqliteDocStore store(":memory:");
-  ASSERT_TRUE(store.openWithError(nullptr));
-  constexpr size_t kDocuments = 300;
-  std::atomic<bool> done = false;
-  const auto read = [&] {
-    do {
-      const uint32_t docID = store.documentIDWithURL(url(1), nullptr);
-      if (docID != 0) {
-        EXPECT_EQ(subjectOf(store.documentWithID(docID, nullptr)), u"s");
-        EXPECT_EQ(store.documentsWithURLs({url(1)}, nullptr, nullptr).size(), 1U);
-      }
-      EXPECT_EQ(store.metadataValueForKey("version", nullptr), "v0.4");
-      int64_t walked = 0;
-      store.enumerateDocIDs(nullptr,
-                            [&](int64_t, uint32_t, const TLURL&, bool*, TLErrorOut) { ++walked; });
-      EXPECT_LE(walked, store.count(nullptr));
-      store.storeTopKVocab("vocab", nullptr);
-      EXPECT_EQ(store.loadTopKVocab(nullptr), "vocab");
-    } while (!done);
-  };
-  std::thread first(read);
-  std::thread second(read);
-  for (size_t i = 1; i <= kDocuments; ++i) {
-    EXPECT_TRUE(store.storeOrUpdateDocuments({{url(i), item(u"s")}}, nullptr, nullptr));
-    EXPECT_TRUE(store.storeOrUpdateDocuments(
-        {{url(i), item(u"s")}}, {{url(i), static_cast<uint32_t>(i)}}, nullptr, nullptr));
-    if (i % 100 == 0) {
-      EXPECT_TRUE(store.vacuumWithError(nullptr));
-    }
-  }
-  done = true;
-  first.join();
-  second.join();
-  EXPECT_EQ(store.count(nullptr), static_cast<int64_t>(kDocuments));
-}
-
-TEST_F(DocStore, AnyOperationMayMeetTheClose) {
-  fill(1);
-  std::atomic<bool> started = false;
-  std::thread other([&] {
-    do {
-      _store.storeTopKVocab("vocab", nullptr);
-      started = true;
-      started.notify_all();
-    } while (_store.documentIDWithURL(url(1), nullptr) == 1);
-  });
-  started.wait(false);
-  _store.close();
-  other.join();
 }
