@@ -30,16 +30,6 @@ TLString replaceAll(TLStringView text, TLStringView from, TLStringView to) {
   }
 }
 
-std::vector<TLStringView> split(TLStringView text, TLStringView separator) {
-  std::vector<TLStringView> pieces;
-  for (;;) {
-    const size_t at = text.find(separator);
-    pieces.push_back(text.substr(0, at));
-    if (at == TLStringView::npos) return pieces;
-    text.remove_prefix(at + separator.size());
-  }
-}
-
 TLStringView trim(TLStringView text, TLStringView characters) {
   const size_t first = text.find_first_not_of(characters);
   if (first == TLStringView::npos) return {};
@@ -65,7 +55,7 @@ TLString TALSearchService::_stringFromEscapedString(TLString text) {
 
 TALSearchService::Strings TALSearchService::subjectsFromRawQuery(TLStringView rawQuery) {
   Strings subjects;
-  const auto pieces = split(trim(rawQuery, u" ()"), kSeparator);
+  const auto pieces = platform::split(trim(rawQuery, u" ()"), kSeparator);
   for (size_t i = 0; i < pieces.size(); ++i) {
     if (pieces[i].find(kClause) == TLStringView::npos) continue;
     TLString subject = replaceAll(pieces[i], kClauseStart, u"");

@@ -115,6 +115,16 @@ bool isValidUTF8(std::string_view bytes) {
   return true;
 }
 
+std::vector<TLStringView> split(TLStringView text, TLStringView separator) {
+  std::vector<TLStringView> pieces;
+  for (;;) {
+    const size_t at = text.find(separator);
+    pieces.push_back(text.substr(0, at));
+    if (at == TLStringView::npos) return pieces;
+    text.remove_prefix(at + separator.size());
+  }
+}
+
 std::string printable(const std::optional<TLString>& text) {
   return text ? toUTF8(*text) : std::string("(null)");
 }

@@ -3,6 +3,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 // Text of the interface, the records and the tokenizers: UTF-16 code units, not checked for lone
 // surrogates. A nullable text is a std::optional of it.
@@ -25,6 +26,9 @@ void appendUTF8(TLStringView text, std::string& out);
 
 // True when `bytes` is well-formed UTF-8.
 [[nodiscard]] bool isValidUTF8(std::string_view bytes);
+
+// The pieces of `text` between the separators, one more than there are of them. Views into `text`.
+[[nodiscard]] std::vector<TLStringView> split(TLStringView text, TLStringView separator);
 
 // For log lines: the text in UTF-8, "(null)" for a missing one.
 [[nodiscard]] std::string printable(const std::optional<TLString>& text);

@@ -109,16 +109,6 @@ std::shared_ptr<TLParamKeyValue> make(std::optional<TLString> key, Setter setter
   return result;
 }
 
-std::vector<TLStringView> split(TLStringView text, char16_t separator) {
-  std::vector<TLStringView> parts;
-  for (;;) {
-    const size_t end = text.find(separator);
-    parts.push_back(text.substr(0, end));
-    if (end == TLStringView::npos) return parts;
-    text.remove_prefix(end + 1);
-  }
-}
-
 // The longest leading decimal number, clamped to the range of an int32_t.
 std::optional<int32_t> leadingInteger(std::string_view text) {
   if (text.starts_with('+') && !text.starts_with("+-")) text.remove_prefix(1);
@@ -265,8 +255,8 @@ void TLParamsManager::saveSearchParamsToUserDefaults(platform::DefaultsStore& st
 
 std::shared_ptr<TLParameters> TLParamsManager::paramsFromString(TLStringView text) {
   auto params = std::make_shared<TLParameters>();
-  for (const TLStringView pair : split(text, u',')) {
-    const auto pieces = split(pair, u'=');
+  for (const TLStringView pair : platform::split(text, u",")) {
+    const auto pieces = platform::split(pair, u"=");
     if (pieces.size() != 2) {
       log().error("Key Value format for override param {} cannot be parsed",
                   platform::toUTF8(pair));
