@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <cstring>
+#include <system_error>
 #include <thread>
 
 #include "salt/IndexImpl.h"
@@ -33,9 +34,18 @@ bool index::AddZone(uint32_t docID, uint16_t zoneID, std::string_view text,
   if (!zoneFits(docID, zoneID, text, offsets)) return false;
   const std::optional<Aftermath> aftermath = storeZone(start, docID, zoneID, text, offsets, merge);
   if (!aftermath) return false;
-  if (aftermath->vacuumDue) Vacuum();
+  if (aftermath->vacuumDue) vacuumAfterAdding();
   if (aftermath->delay.count() != 0) std::this_thread::sleep_for(aftermath->delay);
   return true;
+}
+
+// The zone is stored by now, whatever becomes of the merge; the next zone asks for one again.
+void index::vacuumAfterAdding() {
+  try {
+    Vacuum();
+  } catch (const std::system_error& error) {
+    Log.error("Error starting vacuum: {}", error.what());
+  }
 }
 
 bool index::zoneFits(uint32_t docID, uint16_t zoneID, std::string_view text,

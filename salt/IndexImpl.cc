@@ -110,8 +110,12 @@ std::string_view index::fullText(const SuffixMeta& meta, const leveldb::ReadOpti
                                  std::string* zoneText) const {
   const leveldb::Status status =
       db->Get(options, slice(textKey(meta.DocID, meta.ZoneID).view()), zoneText);
-  if (!status.ok() || zoneText->size() < meta.Offset) return "";
-  const std::string_view text = std::string_view(*zoneText).substr(meta.Offset);
+  return status.ok() ? suffixText(meta, *zoneText) : "";
+}
+
+std::string_view index::suffixText(const SuffixMeta& meta, std::string_view zoneText) const {
+  if (zoneText.size() < meta.Offset) return "";
+  const std::string_view text = zoneText.substr(meta.Offset);
   return text.substr(0, suffixLength(text, op));
 }
 
@@ -124,8 +128,6 @@ std::shared_ptr<const DeletedDocs> index::deletedDocs() const {
   platform::MutexLock lock(_metricsMutex);
   return _deleted;
 }
-
-void index::Vacuum() {}
 
 bool index::Sync() {
   leveldb::WriteOptions options;

@@ -7,6 +7,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "platform/Mutex.h"
@@ -42,7 +43,8 @@ inline constexpr uint8_t kMaxShardNumber = 0xFE;
 class index final : public Index {
  public:
   explicit index(Database opened);
-  ~index() override = default;
+  // Waits for a merge that runs.
+  ~index() override;
 
   [[nodiscard]] const Options& GetOptions() const override { return op; }
   [[nodiscard]] std::string GetSuffixText(const SuffixMeta& meta) const override;
@@ -71,6 +73,15 @@ class index final : public Index {
   [[nodiscard]] std::string_view fullText(const SuffixMeta& meta,
                                           const leveldb::ReadOptions& options,
                                           std::string* zoneText) const;
+  // The same, of a zone's text at hand.
+  [[nodiscard]] std::string_view suffixText(const SuffixMeta& meta,
+                                            std::string_view zoneText) const;
+
+  // One commit of a merge, whole or not at all: writes the batch, with the metrics that it leads
+  // to, and clears it. `pageDelta` is pages written less pages removed. False when it failed, which
+  // is logged.
+  [[nodiscard]] bool commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta)
+      TL_EXCLUDES(_metricsMutex);
 
  private:
   using Clock = std::chrono::steady_clock;
@@ -113,6 +124,16 @@ class index final : public Index {
   // Writes the batch together with the metrics and clears it. A failure is logged.
   [[nodiscard]] bool writeMetrics(leveldb::WriteBatch* batch) TL_REQUIRES(_metricsMutex);
 
+  void vacuumAfterAdding();
+  // The shard that the next merge goes into; a new one is counted.
+  [[nodiscard]] uint8_t chooseShard() TL_REQUIRES(_metricsMutex);
+  // Marks a merge as running and chooses its shard; none when it is not worthwhile, one runs
+  // already, or the mark cannot be written.
+  [[nodiscard]] std::optional<uint8_t> beginVacuum() TL_EXCLUDES(_metricsMutex);
+  void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex);
+  // The body of the merge thread.
+  void runMerge(uint8_t shard) TL_EXCLUDES(_metricsMutex);
+
   // False, with a log line, when the loaded counters cannot be those of a sound index.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
 
@@ -151,6 +172,11 @@ class index final : public Index {
   // Replaced as a whole by each deletion, under both mutexes, so that a view keeps the set of its
   // moment. A deletion writes the whole set anyway.
   std::shared_ptr<const DeletedDocs> _deleted TL_GUARDED_BY(_metricsMutex);
+
+  // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is
+  // taken with no other held.
+  platform::Mutex _mergeThreadMutex;
+  std::thread _mergeThread TL_GUARDED_BY(_mergeThreadMutex);
 };
 
 // What every reader works from: a snapshot, the metrics and the set of deleted documents. One

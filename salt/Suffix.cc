@@ -5,11 +5,15 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
+#include "salt/ZoneTexts.h"
 
 namespace salt {
 
-Suffix::Suffix(const index& owner, const leveldb::ReadOptions& readOptions)
-    : idx(owner), options(readOptions), _text(std::make_unique<char[]>(owner.op.MaxMatchLen)) {}
+Suffix::Suffix(const index& owner, const leveldb::ReadOptions& readOptions, ZoneTexts* zoneTexts)
+    : idx(owner),
+      options(readOptions),
+      _zoneTexts(zoneTexts),
+      _text(std::make_unique<char[]>(owner.op.MaxMatchLen)) {}
 
 Suffix& Suffix::operator=(const Suffix& suffix) {
   if (this == &suffix) return *this;
@@ -54,7 +58,9 @@ void Suffix::fetch() {
   if (full) return;
   TL_ASSERT(meta.DocID > 0);
   ++fetches;
-  const std::string_view text = idx.fullText(meta, options, &_zoneText);
+  const std::string_view text =
+      _zoneTexts != nullptr ? idx.suffixText(meta, _zoneTexts->find(meta.DocID, meta.ZoneID))
+                            : idx.fullText(meta, options, &_zoneText);
   TL_ASSERT(text.size() >= size);
   std::memcpy(_text.get() + size, text.data() + size, text.size() - size);
   size = text.size();
@@ -73,11 +79,11 @@ int Suffix::compareWithPrefix(std::string_view prefix) {
   }
 }
 
-ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber)
+ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts)
     : idx(view.idx),
       shard(shardNumber),
       iterator(idx.db->NewIterator(view.options)),
-      suffix(idx, view.options) {}
+      suffix(idx, view.options, zoneTexts) {}
 
 void ShardCursor::moveTo(uint8_t shardNumber) {
   shard = shardNumber;

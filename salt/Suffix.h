@@ -14,12 +14,15 @@ namespace salt {
 
 class index;
 class IndexView;
+class ZoneTexts;
 
 // The running state of one decoded suffix. Its text is known up to `size`; beyond that it is read
 // from the stored zone when a comparison needs it. One thread. The index outlives it.
 class Suffix {
  public:
-  Suffix(const index& owner, const leveldb::ReadOptions& readOptions);
+  // Reads zone texts from `zoneTexts`, or from the database when that is null.
+  Suffix(const index& owner, const leveldb::ReadOptions& readOptions,
+         ZoneTexts* zoneTexts = nullptr);
   Suffix(const Suffix&) = delete;
   // Copies the suffix, not where it is read from nor the count of fetches.
   Suffix& operator=(const Suffix& suffix);
@@ -48,14 +51,16 @@ class Suffix {
   SuffixMeta meta;
 
  private:
+  ZoneTexts* const _zoneTexts;
   const std::unique_ptr<char[]> _text;  // MaxMatchLen bytes
   std::string _zoneText;                // of the latest fetch; kept for its memory
 };
 
-// A walk over the suffixes of one shard at a time, in order. One thread. The view outlives it.
+// A walk over the suffixes of one shard at a time, in order. One thread. The view outlives it, and
+// so do `zoneTexts`, which walks that complete many suffixes give.
 class ShardCursor {
  public:
-  ShardCursor(const IndexView& view, uint8_t shardNumber);
+  ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts = nullptr);
 
   // Goes on with another shard: the cursor stands nowhere and its counts are 0.
   void moveTo(uint8_t shardNumber);

@@ -4,6 +4,7 @@
 
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
+#include "salt/ZoneTexts.h"
 
 // Walks of the whole index: one that checks what a merge promises, one that prints.
 namespace salt {
@@ -66,7 +67,8 @@ bool shardSound(ShardCursor* cursor, uint64_t* total) {
 
 bool index::Validate() const {
   const IndexView view(*this, false);
-  ShardCursor cursor(view, 0);
+  ZoneTexts zoneTexts(view);
+  ShardCursor cursor(view, 0, &zoneTexts);
   uint64_t total = 0;
   for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {
     cursor.moveTo(static_cast<uint8_t>(shard));
@@ -80,7 +82,8 @@ bool index::Validate() const {
 
 std::string index::Dump() const {
   const IndexView view(*this, false);
-  ShardCursor cursor(view, 0);
+  ZoneTexts zoneTexts(view);
+  ShardCursor cursor(view, 0, &zoneTexts);
   std::string text = std::string(view.metrics) + '\n';
   for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {
     text += shard == 0 ? "-- SALT INDEX (HOT)\n" : fmt::format("-- SALT INDEX (SHARD {})\n", shard);

@@ -1,0 +1,138 @@
+#include "salt/Merge.h"
+
+#include <algorithm>
+#include <cstring>
+
+namespace salt {
+
+namespace {
+
+uint8_t byteAt(std::string_view text, size_t at) {
+  return at < text.size() ? static_cast<uint8_t>(text[at]) : 0;
+}
+
+// The length of the common prefix of what is known of both, of which `from` bytes are equal.
+size_t commonPrefix(std::string_view left, std::string_view right, size_t from) {
+  const size_t limit = std::min(left.size(), right.size());
+  while (from < limit && left[from] == right[from]) ++from;
+  return from;
+}
+
+}  // namespace
+
+Merge::Merge(index& owner, uint8_t shard)
+    : _idx(owner),
+      _shard(shard),
+      _view(owner, false),
+      _zoneTexts(_view),
+      _old(_view, shard, &_zoneTexts),
+      _hot(_view, 0),
+      _previous(owner, _view.options, &_zoneTexts),
+      _first(owner, _view.options, &_zoneTexts) {}
+
+void Merge::run() {
+  const size_t pageSuffixes = _idx.op.MaxPageSuffixes;
+  _old.seekToFirst();
+  _hot.seekToFirst();
+  while (!_failed && (_old.valid || _hot.valid)) {
+    if (_pending.size() >= 2 * pageSuffixes) {
+      flushPage(pageSuffixes);
+      if (!_tookOld) commit(false);
+    }
+    if (oldIsNext()) {
+      takeOld();
+    } else {
+      takeHot();
+    }
+  }
+  commit(true);
+}
+
+bool Merge::oldIsNext() {
+  if (!_old.valid || !_hot.valid) return _old.valid;
+  Suffix& old = _old.suffix;
+  const std::string_view hot = _hot.suffix.knownText();  // all of it
+  for (size_t equal = 0;;) {
+    const std::string_view known = old.knownText();
+    const size_t shorter = std::min(known.size(), hot.size());
+    const int order = std::memcmp(known.data() + equal, hot.data() + equal, shorter - equal);
+    if (order != 0) return order < 0;
+    if (known.size() > hot.size()) return false;
+    if (old.full) return known.size() < hot.size() || old.meta < _hot.suffix.meta;
+    equal = shorter;
+    old.fetch();
+  }
+}
+
+void Merge::takeOld() {
+  const bool pageBegins = _old.pos == 0;
+  if (pageBegins) {
+    if (_tookOld) commit(false);
+    _batch.Delete(_old.iterator->key());
+    --_pageDelta;
+  }
+  // Behind its old neighbour a suffix relates as before.
+  take(&_old, _lastFromHot || pageBegins);
+  _lastFromHot = false;
+  _tookOld = true;
+}
+
+void Merge::takeHot() {
+  _batch.Delete(_hot.iterator->key());
+  ++_hotMerged;
+  take(&_hot, true);
+  _lastFromHot = true;
+}
+
+void Merge::take(ShardCursor* cursor, bool relateToPrevious) {
+  _pending.push_back(cursor->suffix.meta);
+  if (relateToPrevious && _pending.size() > 1) relate(&cursor->suffix);
+  _previous = cursor->suffix;
+  cursor->next();
+}
+
+void Merge::relate(Suffix* suffix) {
+  size_t lcp = 0;
+  for (;;) {
+    lcp = commonPrefix(suffix->knownText(), _previous.knownText(), lcp);
+    if (lcp == suffix->size && !suffix->full) {
+      suffix->fetch();
+    } else if (lcp == _previous.size && !_previous.full) {
+      _previous.fetch();
+    } else {
+      break;
+    }
+  }
+  if (suffix->size < lcp + 2) suffix->fetch();
+  SuffixMeta& meta = _pending.back();
+  meta.lcp = static_cast<uint8_t>(lcp);
+  meta.extra[0] = byteAt(suffix->knownText(), lcp);
+  meta.extra[1] = byteAt(suffix->knownText(), lcp + 1);
+}
+
+void Merge::flushPage(size_t count) {
+  TL_ASSERT(_pending.size() >= count);
+  _first.meta = _pending.front();
+  _first.size = 0;
+  _first.full = false;
+  _first.fetch();
+  suffixKey(_shard, _first.knownText(), _first.meta, &_key);
+  pageToValue(_pending.data(), count, &_value);
+  _batch.Put(_key, _value);
+  ++_pageDelta;
+  _pending.erase(_pending.begin(), _pending.begin() + static_cast<ptrdiff_t>(count));
+}
+
+// A rest too long for one page becomes two of about the same size.
+void Merge::commit(bool final) {
+  if (!_old.iterator->status().ok() || !_hot.iterator->status().ok()) _failed = true;
+  if (_failed) return;
+  if (_pending.size() > _idx.op.MaxPageSuffixes) flushPage(_pending.size() / 2);
+  if (!_pending.empty()) flushPage(_pending.size());
+  if (!final && _batch.ApproximateSize() < _idx.op.MaxBatchBytes) return;
+  if (!_idx.commitMerge(&_batch, _hotMerged, _pageDelta)) _failed = true;
+  _hotMerged = 0;
+  _pageDelta = 0;
+}
+
+}  // namespace salt

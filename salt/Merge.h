@@ -1,0 +1,65 @@
+#pragma once
+
+#include <leveldb/write_batch.h>
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "salt/IndexImpl.h"
+#include "salt/Suffix.h"
+#include "salt/ZoneTexts.h"
+
+namespace salt {
+
+// Merges the hot part, as it is when the merge is made, into one shard: two sorted walks become one
+// run of new pages. One thread; the index outlives it.
+//
+// What holds over a crash: a batch is written only when every suffix taken so far is in a page of
+// it or of one before, and every old page that it removes has been taken in full. So each suffix is
+// at any moment either hot or in one page, and the metrics of the same batch say so. Within a batch
+// an old page is removed before a new one is put that may have its key.
+class Merge {
+ public:
+  Merge(index& owner, uint8_t shard);
+
+  // To the end, or to the first read or write that fails; what was committed until then stays.
+  void run();
+
+ private:
+  [[nodiscard]] bool oldIsNext();
+  void takeOld();
+  void takeHot();
+
+  // Appends the cursor's suffix to the pending ones.
+  void take(ShardCursor* cursor, bool relateToPrevious);
+
+  // Sets common prefix and extra bytes of the latest pending entry, which is `suffix`.
+  void relate(Suffix* suffix);
+
+  // Puts the first `count` pending suffixes into a page.
+  void flushPage(size_t count);
+
+  // Puts all that is pending into pages, and writes the batch if it is large enough or the last.
+  void commit(bool final);
+
+  index& _idx;
+  const uint8_t _shard;
+  const IndexView _view;
+  ZoneTexts _zoneTexts;
+  leveldb::WriteBatch _batch;
+  ShardCursor _old;
+  ShardCursor _hot;
+  Suffix _previous;  // the latest one taken
+  Suffix _first;     // of a page
+  std::vector<SuffixMeta> _pending;
+  uint64_t _hotMerged = 0;  // since the latest commit, like _pageDelta
+  int64_t _pageDelta = 0;
+  bool _failed = false;
+  bool _tookOld = false;
+  bool _lastFromHot = false;
+  std::string _key;
+  std::string _value;
+};
+
+}  // namespace salt

@@ -1,0 +1,54 @@
+#include "salt/ZoneTexts.h"
+
+#include "salt/Coding.h"
+#include "salt/IndexImpl.h"
+
+namespace salt {
+
+namespace {
+
+uint64_t idOf(uint32_t docID, uint16_t zoneID) {
+  return uint64_t{docID} << 16 | zoneID;
+}
+
+}  // namespace
+
+ZoneTexts::ZoneTexts(const IndexView& view) : _iterator(view.idx.db->NewIterator(view.options)) {}
+
+std::string_view ZoneTexts::find(uint32_t docID, uint16_t zoneID) {
+  const uint64_t id = idOf(docID, zoneID);
+  if (const auto found = _younger.find(id); found != _younger.end()) return found->second;
+  if (const auto found = _older.find(id); found != _older.end()) {
+    return keep(id, std::move(found->second));
+  }
+  return read(docID, zoneID);
+}
+
+std::string_view ZoneTexts::keep(uint64_t id, std::string text) {
+  if (_youngerBytes + text.size() > kKeptBytes / 2) {
+    _older = std::move(_younger);
+    _younger.clear();
+    _youngerBytes = 0;
+  }
+  _youngerBytes += text.size();
+  return _younger.insert_or_assign(id, std::move(text)).first->second;
+}
+
+std::string_view ZoneTexts::read(uint32_t docID, uint16_t zoneID) {
+  const TextKey key = index::textKey(docID, zoneID);
+  _iterator->Seek(slice(key.view()));
+  if (!_iterator->Valid() || view(_iterator->key()) != key.view()) return "";
+  const std::string wanted = _iterator->value().ToString();
+  size_t ahead = wanted.size();
+  for (_iterator->Next(); _iterator->Valid() && ahead < kReadAheadBytes; _iterator->Next()) {
+    uint32_t nextDoc = 0;
+    uint16_t nextZone = 0;
+    if (!parseTextKey(view(_iterator->key()), &nextDoc, &nextZone)) break;
+    const uint64_t id = idOf(nextDoc, nextZone);
+    ahead += _iterator->value().size();
+    if (!_younger.contains(id)) keep(id, _iterator->value().ToString());
+  }
+  return keep(idOf(docID, zoneID), wanted);
+}
+
+}  // namespace salt
