@@ -179,13 +179,9 @@ IndexView::IndexView(const index& owner, bool fillCache) : idx(owner) {
   options.verify_checksums = false;
   options.fill_cache = fillCache;
   platform::MutexLock lock(owner._metricsMutex);
-  options.snapshot = owner.db->GetSnapshot();
+  iterator.reset(owner.db->NewIterator(options));
   metrics = owner.metrics;
   deleted = owner._deleted;
-}
-
-IndexView::~IndexView() {
-  idx.db->ReleaseSnapshot(options.snapshot);
 }
 
 uint8_t IndexView::lastShard() const {

@@ -38,7 +38,7 @@ inline constexpr uint8_t kMaxShardNumber = 0xFE;
 // metrics and the taking of a view.
 //
 // What holds at all times: the metrics in the database are those of the same batch as the keys that
-// they count; a reader's snapshot and its copy of the metrics are of the same moment, and what is
+// they count; a reader's walk and its copy of the metrics are of the same moment, and what is
 // deleted later stays visible to it.
 class index final : public Index {
  public:
@@ -179,13 +179,19 @@ class index final : public Index {
   std::thread _mergeThread TL_GUARDED_BY(_mergeThreadMutex);
 };
 
-// What every reader works from: a snapshot, the metrics and the set of deleted documents. One
-// thread; the index outlives it.
+// What every reader works from: one walk over the database, the metrics and the set of deleted
+// documents, all of the same moment. One thread; the index outlives it.
+//
+// The iterator holds the keys of its moment by itself. A leveldb snapshot would, too, but while one
+// lives, a compaction keeps a removed key together with the mark that removes it, and may put the
+// two into neighbouring files of a level; a later compaction of the first file alone then drops the
+// mark (leveldb 1.23 looks for such neighbours in the upper level only), and the removed key is
+// back. Single reads go to the newest state: a stored text only ever grows behind a NUL, so that a
+// suffix reads the same.
 class IndexView {
  public:
   // With `fillCache` false the reads do not displace the block cache.
   IndexView(const index& owner, bool fillCache);
-  ~IndexView();
   IndexView(const IndexView&) = delete;
   IndexView& operator=(const IndexView&) = delete;
 
@@ -194,6 +200,7 @@ class IndexView {
 
   const index& idx;
   leveldb::ReadOptions options;
+  std::unique_ptr<leveldb::Iterator> iterator;  // never null
   Index::Metrics metrics;
   std::shared_ptr<const DeletedDocs> deleted;
 };

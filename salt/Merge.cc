@@ -23,12 +23,13 @@ size_t commonPrefix(std::string_view left, std::string_view right, size_t from) 
 Merge::Merge(index& owner, uint8_t shard)
     : _idx(owner),
       _shard(shard),
-      _view(owner, false),
-      _zoneTexts(_view),
-      _old(_view, shard, &_zoneTexts),
-      _hot(_view, 0),
-      _previous(owner, _view.options, &_zoneTexts),
-      _first(owner, _view.options, &_zoneTexts) {}
+      _oldView(owner, false),
+      _hotView(owner, false),
+      _zoneTexts(owner),
+      _old(_oldView, shard, &_zoneTexts),
+      _hot(_hotView, 0),
+      _previous(owner, _oldView.options, &_zoneTexts),
+      _first(owner, _oldView.options, &_zoneTexts) {}
 
 void Merge::run() {
   const size_t pageSuffixes = _idx.op.MaxPageSuffixes;

@@ -45,7 +45,8 @@ class Merge {
 
   index& _idx;
   const uint8_t _shard;
-  const IndexView _view;
+  const IndexView _oldView;
+  const IndexView _hotView;
   ZoneTexts _zoneTexts;
   leveldb::WriteBatch _batch;
   ShardCursor _old;

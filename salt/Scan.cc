@@ -55,7 +55,7 @@ void index::ForEachZone(
 void index::forEachZone(
     const IndexView& view,
     const std::function<bool(uint32_t, uint16_t, std::string_view)>& callback) const {
-  const std::unique_ptr<leveldb::Iterator> iterator(db->NewIterator(view.options));
+  leveldb::Iterator* const iterator = view.iterator.get();
   for (iterator->Seek(slice(textKey(0, 0).view())); iterator->Valid(); iterator->Next()) {
     uint32_t docID = 0;
     uint16_t zoneID = 0;

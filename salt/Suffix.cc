@@ -82,7 +82,7 @@ int Suffix::compareWithPrefix(std::string_view prefix) {
 ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts)
     : idx(view.idx),
       shard(shardNumber),
-      iterator(idx.db->NewIterator(view.options)),
+      iterator(view.iterator.get()),
       suffix(idx, view.options, zoneTexts) {}
 
 void ShardCursor::moveTo(uint8_t shardNumber) {

@@ -56,8 +56,9 @@ class Suffix {
   std::string _zoneText;                // of the latest fetch; kept for its memory
 };
 
-// A walk over the suffixes of one shard at a time, in order. One thread. The view outlives it, and
-// so do `zoneTexts`, which walks that complete many suffixes give.
+// A walk over the suffixes of one shard at a time, in order, with the iterator of a view. One
+// thread. The view outlives it, and so do `zoneTexts`, which walks that complete many suffixes
+// give.
 class ShardCursor {
  public:
   ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts = nullptr);
@@ -78,10 +79,10 @@ class ShardCursor {
 
   const index& idx;
   uint8_t shard;
-  const std::unique_ptr<leveldb::Iterator> iterator;
-  std::vector<SuffixMeta> metas;  // of the current page; empty in the hot part
-  size_t pos = 0;                 // of the current suffix in metas
-  bool valid = false;             // the cursor stands on a suffix
+  leveldb::Iterator* const iterator;  // the view's
+  std::vector<SuffixMeta> metas;      // of the current page; empty in the hot part
+  size_t pos = 0;                     // of the current suffix in metas
+  bool valid = false;                 // the cursor stands on a suffix
   Suffix suffix;
   uint64_t loads = 0;  // keys (hot part) or pages loaded
 

@@ -67,7 +67,7 @@ bool shardSound(ShardCursor* cursor, uint64_t* total) {
 
 bool index::Validate() const {
   const IndexView view(*this, false);
-  ZoneTexts zoneTexts(view);
+  ZoneTexts zoneTexts(*this);
   ShardCursor cursor(view, 0, &zoneTexts);
   uint64_t total = 0;
   for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {
@@ -82,7 +82,7 @@ bool index::Validate() const {
 
 std::string index::Dump() const {
   const IndexView view(*this, false);
-  ZoneTexts zoneTexts(view);
+  ZoneTexts zoneTexts(*this);
   ShardCursor cursor(view, 0, &zoneTexts);
   std::string text = std::string(view.metrics) + '\n';
   for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {

@@ -11,9 +11,15 @@ uint64_t idOf(uint32_t docID, uint16_t zoneID) {
   return uint64_t{docID} << 16 | zoneID;
 }
 
+leveldb::ReadOptions sparingTheCache() {
+  leveldb::ReadOptions options;
+  options.fill_cache = false;
+  return options;
+}
+
 }  // namespace
 
-ZoneTexts::ZoneTexts(const IndexView& view) : _iterator(view.idx.db->NewIterator(view.options)) {}
+ZoneTexts::ZoneTexts(const index& owner) : _iterator(owner.db->NewIterator(sparingTheCache())) {}
 
 std::string_view ZoneTexts::find(uint32_t docID, uint16_t zoneID) {
   const uint64_t id = idOf(docID, zoneID);

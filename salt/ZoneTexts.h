@@ -12,7 +12,7 @@
 
 namespace salt {
 
-class IndexView;
+class index;
 
 // The stored texts of zones, for walks that complete very many suffixes. The suffixes of a shard
 // come from few documents, again and again, so that texts are kept in memory; documents of
@@ -20,10 +20,10 @@ class IndexView;
 //
 // Memory: kKeptBytes of text at most, and one zone. The texts are in two generations: when the
 // younger has its half of the bytes it becomes the older, and what was not used since is dropped.
-// One thread. The view outlives it.
+// One thread. The index outlives it.
 class ZoneTexts {
  public:
-  explicit ZoneTexts(const IndexView& view);
+  explicit ZoneTexts(const index& owner);
 
   // The whole text of a zone, empty when there is none. Lives until the next call.
   [[nodiscard]] std::string_view find(uint32_t docID, uint16_t zoneID);
