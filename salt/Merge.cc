@@ -86,9 +86,12 @@ void Merge::takeHot() {
 }
 
 void Merge::take(ShardCursor* cursor, bool relateToPrevious) {
-  _pending.push_back(cursor->suffix.meta);
-  if (relateToPrevious && _pending.size() > 1) relate(&cursor->suffix);
-  _previous = cursor->suffix;
+  Suffix& suffix = cursor->suffix;
+  _pending.push_back(suffix.meta);
+  if (relateToPrevious && _pending.size() > 1) relate(&suffix);
+  if (_pendingTexts.size() < _pending.size()) _pendingTexts.emplace_back();
+  _pendingTexts[_pending.size() - 1] = suffix.full ? suffix.knownText() : "";
+  _previous = suffix;
   cursor->next();
 }
 
@@ -111,17 +114,24 @@ void Merge::relate(Suffix* suffix) {
   meta.extra[1] = byteAt(suffix->knownText(), lcp + 1);
 }
 
-void Merge::flushPage(size_t count) {
-  TL_ASSERT(_pending.size() >= count);
+std::string_view Merge::firstText() {
+  if (!_pendingTexts.front().empty()) return _pendingTexts.front();
   _first.meta = _pending.front();
   _first.size = 0;
   _first.full = false;
   _first.fetch();
-  suffixKey(_shard, _first.knownText(), _first.meta, &_key);
+  return _first.knownText();
+}
+
+void Merge::flushPage(size_t count) {
+  TL_ASSERT(_pending.size() >= count);
+  suffixKey(_shard, firstText(), _pending.front(), &_key);
   pageToValue(_pending.data(), count, &_value);
   _batch.Put(_key, _value);
   ++_pageDelta;
-  _pending.erase(_pending.begin(), _pending.begin() + static_cast<ptrdiff_t>(count));
+  const auto taken = static_cast<ptrdiff_t>(count);
+  _pending.erase(_pending.begin(), _pending.begin() + taken);
+  std::rotate(_pendingTexts.begin(), _pendingTexts.begin() + taken, _pendingTexts.end());
 }
 
 // A rest too long for one page becomes two of about the same size.

@@ -37,6 +37,8 @@ class Merge {
   // Sets common prefix and extra bytes of the latest pending entry, which is `suffix`.
   void relate(Suffix* suffix);
 
+  [[nodiscard]] std::string_view firstText();
+
   // Puts the first `count` pending suffixes into a page.
   void flushPage(size_t count);
 
@@ -54,7 +56,8 @@ class Merge {
   Suffix _previous;  // the latest one taken
   Suffix _first;     // of a page
   std::vector<SuffixMeta> _pending;
-  uint64_t _hotMerged = 0;  // since the latest commit, like _pageDelta
+  std::vector<std::string> _pendingTexts;  // of each, in full, or empty where it would be a read
+  uint64_t _hotMerged = 0;                 // since the latest commit, like _pageDelta
   int64_t _pageDelta = 0;
   bool _failed = false;
   bool _tookOld = false;

@@ -32,6 +32,7 @@ std::string_view ZoneTexts::find(uint32_t docID, uint16_t zoneID) {
 
 std::string_view ZoneTexts::keep(uint64_t id, std::string text) {
   if (_youngerBytes + text.size() > kKeptBytes / 2) {
+    _full = !_older.empty();
     _older = std::move(_younger);
     _younger.clear();
     _youngerBytes = 0;
@@ -44,17 +45,21 @@ std::string_view ZoneTexts::read(uint32_t docID, uint16_t zoneID) {
   const TextKey key = index::textKey(docID, zoneID);
   _iterator->Seek(slice(key.view()));
   if (!_iterator->Valid() || view(_iterator->key()) != key.view()) return "";
-  const std::string wanted = _iterator->value().ToString();
-  size_t ahead = wanted.size();
-  for (_iterator->Next(); _iterator->Valid() && ahead < kReadAheadBytes; _iterator->Next()) {
-    uint32_t nextDoc = 0;
-    uint16_t nextZone = 0;
-    if (!parseTextKey(view(_iterator->key()), &nextDoc, &nextZone)) break;
-    const uint64_t id = idOf(nextDoc, nextZone);
-    ahead += _iterator->value().size();
-    if (!_younger.contains(id)) keep(id, _iterator->value().ToString());
+  std::string wanted = _iterator->value().ToString();
+  if (!_full) readOn();
+  return keep(idOf(docID, zoneID), std::move(wanted));
+}
+
+void ZoneTexts::readOn() {
+  size_t bytes = 0;
+  for (_iterator->Next(); _iterator->Valid() && bytes < kReadAheadBytes; _iterator->Next()) {
+    uint32_t docID = 0;
+    uint16_t zoneID = 0;
+    if (!parseTextKey(view(_iterator->key()), &docID, &zoneID)) return;
+    const uint64_t id = idOf(docID, zoneID);
+    bytes += _iterator->value().size();
+    if (!_younger.contains(id) && !_older.contains(id)) keep(id, _iterator->value().ToString());
   }
-  return keep(idOf(docID, zoneID), wanted);
 }
 
 }  // namespace salt

@@ -15,8 +15,9 @@ namespace salt {
 class index;
 
 // The stored texts of zones, for walks that complete very many suffixes. The suffixes of a shard
-// come from few documents, again and again, so that texts are kept in memory; documents of
-// neighbouring numbers mostly share a shard, so that a read that misses goes on for a stretch.
+// come from few documents, again and again, so that texts are kept in memory. Documents of
+// neighbouring numbers mostly share a shard, so that a read that misses goes on for a stretch until
+// the memory is full for the first time; a shard with more text than that reads one by one.
 //
 // Memory: kKeptBytes of text at most, and one zone. The texts are in two generations: when the
 // younger has its half of the bytes it becomes the older, and what was not used since is dropped.
@@ -36,11 +37,13 @@ class ZoneTexts {
 
   std::string_view keep(uint64_t id, std::string text);
   std::string_view read(uint32_t docID, uint16_t zoneID);
+  void readOn();
 
   const std::unique_ptr<leveldb::Iterator> _iterator;
   Texts _younger;
   Texts _older;
   size_t _youngerBytes = 0;
+  bool _full = false;  // texts have been dropped
 };
 
 }  // namespace salt
