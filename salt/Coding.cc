@@ -17,6 +17,41 @@ char* putTail(char* out, const SuffixMeta& meta) {
   return putVarint(putVarint(putVarint(out, meta.ZoneID), meta.Offset), meta.DocID);
 }
 
+size_t readPageSize(std::string_view& s, const Index::OptionsBlock& op) {
+  const size_t size = readVarint(s);
+  TL_ASSERT(size <= op.MaxPageSuffixes);
+  return size;
+}
+
+// The same as readVarint where the longest varint is known to fit.
+const char* getVarint(const char* in, uint32_t* value) {
+  uint32_t byte = static_cast<uint8_t>(*in++);
+  *value = byte & 0x7F;
+  for (int shift = 7; byte >= 0x80; shift += 7) {
+    TL_ASSERT(shift < 32);
+    byte = static_cast<uint8_t>(*in++);
+    *value |= (byte & 0x7F) << shift;
+  }
+  return in;
+}
+
+// Reads `count` varints from the front and hands each to store(index, value). The bounds are
+// checked once for all where that is enough.
+template <typename Store>
+void readColumn(std::string_view& s, size_t count, const Store& store) {
+  if (s.size() < count * kMaxVarint32) {
+    for (size_t i = 0; i < count; ++i) store(i, readVarint(s));
+    return;
+  }
+  const char* in = s.data();
+  for (size_t i = 0; i < count; ++i) {
+    uint32_t value = 0;
+    in = getVarint(in, &value);
+    store(i, value);
+  }
+  s.remove_prefix(static_cast<size_t>(in - s.data()));
+}
+
 // Position of `byte` in [from, limit) of `text`, or `limit`.
 size_t findByte(std::string_view text, char byte, size_t from, size_t limit) {
   const void* found = std::memchr(text.data() + from, byte, limit - from);
@@ -69,19 +104,27 @@ void pageToValue(const SuffixMeta* metas, size_t count, std::string* value) {
 
 void valueToPage(std::string_view s, const Index::OptionsBlock& op,
                  std::vector<SuffixMeta>* metas) {
-  const uint32_t size = readVarint(s);
-  TL_ASSERT(size <= op.MaxPageSuffixes);
+  const size_t size = readPageSize(s, op);
   metas->resize(size);
-  for (SuffixMeta& m : *metas) m.DocID = readVarint(s);
-  for (SuffixMeta& m : *metas) m.ZoneID = static_cast<uint16_t>(readVarint(s));
-  for (SuffixMeta& m : *metas) m.Offset = readVarint(s);
-  for (SuffixMeta& m : *metas) m.lcp = static_cast<uint8_t>(readVarint(s));
-  TL_ASSERT(s.size() >= 2 * metas->size());
-  for (SuffixMeta& m : *metas) {
-    m.extra[0] = static_cast<uint8_t>(s[0]);
-    m.extra[1] = static_cast<uint8_t>(s[1]);
-    s.remove_prefix(2);
+  SuffixMeta* const m = metas->data();
+  readColumn(s, size, [m](size_t i, uint32_t value) { m[i].DocID = value; });
+  readColumn(s, size, [m](size_t i, uint32_t value) { m[i].ZoneID = uint16_t(value); });
+  readColumn(s, size, [m](size_t i, uint32_t value) { m[i].Offset = value; });
+  readColumn(s, size, [m](size_t i, uint32_t value) { m[i].lcp = uint8_t(value); });
+  TL_ASSERT(s.size() >= 2 * size);
+  for (size_t i = 0; i < size; ++i) {
+    m[i].extra[0] = static_cast<uint8_t>(s[2 * i]);
+    m[i].extra[1] = static_cast<uint8_t>(s[2 * i + 1]);
   }
+}
+
+void appendPlaces(std::string_view s, const Index::OptionsBlock& op, std::vector<Place>* places) {
+  const size_t size = readPageSize(s, op);
+  const size_t before = places->size();
+  places->resize(before + size);
+  Place* const p = places->data() + before;
+  readColumn(s, size, [p](size_t i, uint32_t value) { p[i].DocID = value; });
+  readColumn(s, size, [p](size_t i, uint32_t value) { p[i].ZoneID = uint16_t(value); });
 }
 
 TextKey::TextKey(uint8_t shard, uint32_t docID, uint16_t zoneID) {

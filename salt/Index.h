@@ -33,6 +33,12 @@ struct SuffixMeta {
 
 // Threads: all operations may run on any threads at once. Readers work from a snapshot and block
 // nobody; what is added or deleted while one runs does not change what it sees.
+// Where a suffix stands, but for its offset.
+struct Place {
+  uint32_t DocID = 0;
+  uint16_t ZoneID = 0;
+};
+
 class Index {
  public:
   // The members of the stream, in its layout: 40 bytes, little-endian.
@@ -158,6 +164,13 @@ class Index {
 
   // The stored metrics and one line per suffix, deleted ones included.
   [[nodiscard]] virtual std::string Dump() const = 0;
+
+  // ScanPrefix for those who look at documents and zones alone: calls `callback` with runs of
+  // matching suffixes, `count` of them, above 0, and `limit` in all at most. The places live for
+  // the call. Of a scan that the callback stops, the metrics count whole runs.
+  virtual bool ScanPlaces(
+      std::string_view prefix, size_t limit,
+      const std::function<bool(const Place* places, size_t count)>& callback) const = 0;
 };
 
 // Makes a new index in the directory `options.Path`; what was there is removed. Never null: a

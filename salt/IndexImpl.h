@@ -19,7 +19,7 @@
 namespace salt {
 
 class IndexView;
-class ShardCursor;
+struct ScanCounts;
 
 struct DeletedDoc {
   uint32_t docID = 0;
@@ -62,6 +62,9 @@ class index final : public Index {
   void ResetScanMetrics() override;
   [[nodiscard]] bool Validate() const override;
   [[nodiscard]] std::string Dump() const override;
+  bool ScanPlaces(
+      std::string_view prefix, size_t limit,
+      const std::function<bool(const Place* places, size_t count)>& callback) const override;
 
   static TextKey textKey(uint32_t docID, uint16_t zoneID) {
     constexpr uint8_t shard = 255;
@@ -90,14 +93,6 @@ class index final : public Index {
   struct Aftermath {
     bool vacuumDue = false;
     std::chrono::nanoseconds delay{0};
-  };
-
-  // What a shard's walk adds to the metrics.
-  struct ScanCounts {
-    uint64_t results = 0;
-    uint64_t fetches = 0;
-    uint64_t hotReads = 0;
-    uint64_t pageReads = 0;
   };
 
   [[nodiscard]] bool zoneFits(uint32_t docID, uint16_t zoneID, std::string_view text,
@@ -133,15 +128,13 @@ class index final : public Index {
   void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex);
   // The body of the merge thread.
   void runMerge(uint8_t shard) TL_EXCLUDES(_metricsMutex);
+  void compactHotPart();
 
   // False, with a log line, when the loaded counters cannot be those of a sound index.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
 
-  // Counts what it does; false when the whole scan is over.
-  [[nodiscard]] bool scanShard(ShardCursor* cursor, const DeletedDocs& deleted,
-                               std::string_view prefix,
-                               const std::function<bool(const SuffixMeta&)>& callback,
-                               ScanCounts* counts) const;
+  void countScan(Clock::time_point start, const ScanCounts& counts) const
+      TL_EXCLUDES(_metricsMutex);
   void forEachZone(const IndexView& view,
                    const std::function<bool(uint32_t, uint16_t, std::string_view)>& callback) const;
 

@@ -3,8 +3,10 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <cstdint>
 
 #include "salt/Database.h"
+#include "salt/DocMasks.h"
 #include "salt/DocTable.h"
 
 namespace saltsearch {
@@ -63,6 +65,32 @@ bool wellFormed(const Term& term) {
 struct Candidates {
   salt::DocTable<DocResult> results;
   double unmatched = 1.0;  // product of the default scores of the terms done
+  // Zones in which the token at hand has been seen, by document. Most suffixes of a short token
+  // repeat what is known, and go no further than here.
+  salt::DocMasks seen;
+};
+
+// The bit in a zone mask that a match in a zone sets, 0 when it does not count.
+class ZoneBits {
+ public:
+  explicit ZoneBits(const std::vector<uint16_t>& zones) {
+    if (zones.empty()) _others = 1;
+    for (size_t i = 0; i < zones.size(); ++i) {
+      const uint32_t bit = uint32_t{1} << i;
+      if (zones[i] == 0) _others = bit;  // the last entry of this kind stands for all not listed
+      if (zones[i] >= _bits.size()) _bits.resize(zones[i] + size_t{1});
+      if (_bits[zones[i]] == 0) _bits[zones[i]] = bit;
+    }
+  }
+
+  [[nodiscard]] uint32_t of(uint16_t zoneID) const {
+    const uint32_t bit = zoneID < _bits.size() ? _bits[zoneID] : 0;
+    return bit != 0 ? bit : _others;
+  }
+
+ private:
+  std::vector<uint32_t> _bits;  // by zone
+  uint32_t _others = 0;
 };
 
 // The evaluation of one term: collects its matches, then multiplies them into the scores.
@@ -77,14 +105,20 @@ class TermRun {
         _zoneBound(zone),
         _reach(candidates->unmatched * term.defaultScore * matched),
         _need(options.threshold / any),
-        _wild(wildZone(term.zones)) {}
+        _zoneBits(term.zones) {}
 
   void collect(const salt::Index& index) {
     for (size_t t = 0; t < _term.tokens.size(); ++t) {
       _tokenScore = _term.tokenScores[t];
       _noNewDocs = refusesNewDocs(t);
-      index.ScanPrefix(_term.tokens[t],
-                       [this](const salt::SuffixMeta& meta) { return take(meta); });
+      _candidates.seen.clear();
+      const size_t limit = left() + (left() < SIZE_MAX);  // the one too many ends the scan
+      index.ScanPlaces(_term.tokens[t], limit, [&](const salt::Place* places, size_t count) {
+        _term.found = true;
+        if (!nothingCanChange(t)) take(places, std::min(count, left()));
+        _suffixes += count;
+        return _suffixes <= _options.maxSuffixes && !nothingCanChange(t);
+      });
     }
   }
 
@@ -100,10 +134,9 @@ class TermRun {
   }
 
  private:
-  // The last entry that stands for all zones not listed, or the size.
-  static size_t wildZone(const std::vector<uint16_t>& zones) {
-    const auto last = std::find(zones.rbegin(), zones.rend(), 0);
-    return last == zones.rend() ? zones.size() : static_cast<size_t>(zones.rend() - last) - 1;
+  // Whether no document is left, and this token, the last one, adds none.
+  [[nodiscard]] bool nothingCanChange(size_t token) const {
+    return _noNewDocs && _candidates.results.size() == 0 && token + 1 == _term.tokens.size();
   }
 
   // Whether a document that only this token, or where a later one can raise it those too, finds now
@@ -118,18 +151,28 @@ class TermRun {
     return _candidates.unmatched * best * _zoneBound < _need;
   }
 
-  bool take(const salt::SuffixMeta& meta) {
-    ++_suffixes;
-    _term.found = true;
-    if (_suffixes > _options.maxSuffixes) return false;
-    DocResult* const known = _candidates.results.find(meta.DocID);
-    if (known == nullptr && _noNewDocs) return true;
-    const size_t zone = zoneIndex(meta.ZoneID);
-    if (zone == _term.zones.size() && !_term.zones.empty()) return true;
-    const uint32_t bit = uint32_t{1} << zone;
+  // Suffixes that the term may still take.
+  [[nodiscard]] size_t left() const {
+    return _options.maxSuffixes - std::min(_options.maxSuffixes, _suffixes);
+  }
+
+  void take(const salt::Place* places, size_t count) {
+    for (const salt::Place* place = places; place != places + count; ++place) {
+      const uint32_t bit = _zoneBits.of(place->ZoneID);
+      uint32_t& seen = _candidates.seen[place->DocID];
+      if ((bit & ~seen) == 0) continue;
+      seen |= bit;
+      match(place->DocID, bit);
+    }
+  }
+
+  void match(uint32_t docID, uint32_t bit) {
+    DocResult* const known = _candidates.results.find(docID);
     if (known == nullptr) {
-      _candidates.results.insert({meta.DocID, bit, _candidates.unmatched, _tokenScore});
-      return true;
+      if (!_noNewDocs) {
+        _candidates.results.insert({docID, bit, _candidates.unmatched, _tokenScore});
+      }
+      return;
     }
     if (known->tokenScore == -1.0) {
       known->tokenScore = _tokenScore;
@@ -138,13 +181,6 @@ class TermRun {
                                       : std::max(known->tokenScore, _tokenScore);
     }
     known->zoneMask |= bit;
-    return true;
-  }
-
-  [[nodiscard]] size_t zoneIndex(uint16_t zoneID) const {
-    const auto& zones = _term.zones;
-    const auto found = std::find(zones.begin(), zones.end(), zoneID);
-    return found == zones.end() ? _wild : static_cast<size_t>(found - zones.begin());
   }
 
   // What this term multiplies the document's score by.
@@ -164,7 +200,7 @@ class TermRun {
   const double _zoneBound;
   const double _reach;  // best score of a document that neither this term nor one before matched
   const double _need;   // running score below which no later term brings a document up
-  const size_t _wild;
+  const ZoneBits _zoneBits;
   double _tokenScore = 0;
   bool _noNewDocs = false;
   size_t _suffixes = 0;

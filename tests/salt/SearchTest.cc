@@ -244,6 +244,22 @@ TEST_F(SearchSmall, SuffixesAreLimitedPerTermAndFoundIsSet) {
   EXPECT_EQ(results[0].zoneMask, 0u);
 }
 
+// Places come in runs; the limit holds within one and over several.
+TEST(SearchLimit, HoldsWithinAndOverRuns) {
+  const TemporaryDirectory directory;
+  const auto index = salttest::newIndex(directory / "index");
+  for (uint32_t docID = 1; docID <= 700; ++docID) {
+    ASSERT_TRUE(salttest::addZone(*index, docID, 1, "apple"));
+  }
+  for (const size_t limit : {1, 255, 256, 257, 300, 600, 699, 700, 701}) {
+    index->ResetScanMetrics();
+    std::vector<Term> terms{term({"apple"}, {1})};
+    EXPECT_EQ(saltsearch::Search(*index, terms, {1000, limit, 0}).size(),
+              std::min<size_t>(limit, 700));
+    EXPECT_EQ(index->GetMetrics().ScanResults, std::min<size_t>(limit + 1, 700));
+  }
+}
+
 TEST(SearchText, TermsAndResultsPrint) {
   Term t = term({"a b", "c"}, {0.5, 1}, 0.25);
   EXPECT_EQ(std::string(t), "{\"a b\":0.5 | \"c\":1 default:0.25}");
