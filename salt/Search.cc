@@ -5,9 +5,8 @@
 #include <algorithm>
 #include <cstdint>
 
+#include "salt/Candidates.h"
 #include "salt/Database.h"
-#include "salt/DocMasks.h"
-#include "salt/DocTable.h"
 
 namespace saltsearch {
 
@@ -61,15 +60,6 @@ bool wellFormed(const Term& term) {
   return true;
 }
 
-// The documents found so far and the score of all others.
-struct Candidates {
-  salt::DocTable<DocResult> results;
-  double unmatched = 1.0;  // product of the default scores of the terms done
-  // Zones in which the token at hand has been seen, by document. Most suffixes of a short token
-  // repeat what is known, and go no further than here.
-  salt::DocMasks seen;
-};
-
 // The bit in a zone mask that a match in a zone sets, 0 when it does not count.
 class ZoneBits {
  public:
@@ -96,14 +86,16 @@ class ZoneBits {
 // The evaluation of one term: collects its matches, then multiplies them into the scores.
 class TermRun {
  public:
-  // `matched` and `any` are the bounds of the terms after this one, `zone` that of this one.
-  TermRun(Term& term, const Options& options, Candidates* candidates, double zone, double matched,
-          double any)
+  // `unmatched` is the score, so far, of documents that no term has matched; `matched` and `any`
+  // are the bounds of the terms after this one, `zone` that of this one.
+  TermRun(Term& term, const Options& options, Candidates* candidates, double unmatched, double zone,
+          double matched, double any)
       : _term(term),
         _options(options),
         _candidates(*candidates),
+        _unmatched(unmatched),
         _zoneBound(zone),
-        _reach(candidates->unmatched * term.defaultScore * matched),
+        _reach(unmatched * term.defaultScore * matched),
         _need(options.threshold / any),
         _zoneBits(term.zones) {}
 
@@ -111,7 +103,7 @@ class TermRun {
     for (size_t t = 0; t < _term.tokens.size(); ++t) {
       _tokenScore = _term.tokenScores[t];
       _noNewDocs = refusesNewDocs(t);
-      _candidates.seen.clear();
+      _candidates.forgetSeen();
       const size_t limit = left() + (left() < SIZE_MAX);  // the one too many ends the scan
       index.ScanPlaces(_term.tokens[t], limit, [&](const salt::Place* places, size_t count) {
         _term.found = true;
@@ -123,20 +115,19 @@ class TermRun {
   }
 
   void score() {
-    _candidates.results.retain([this](DocResult& doc) {
+    _candidates.retain([this](DocResult& doc) {
       doc.score *= factor(doc);
       if (_reach < _options.threshold && doc.score < _need) return false;
       doc.tokenScore = -1.0;
       doc.zoneMask = 0;
       return true;
     });
-    _candidates.unmatched *= _term.defaultScore;
   }
 
  private:
   // Whether no document is left, and this token, the last one, adds none.
   [[nodiscard]] bool nothingCanChange(size_t token) const {
-    return _noNewDocs && _candidates.results.size() == 0 && token + 1 == _term.tokens.size();
+    return _noNewDocs && _candidates.all().empty() && token + 1 == _term.tokens.size();
   }
 
   // Whether a document that only this token, or where a later one can raise it those too, finds now
@@ -148,7 +139,7 @@ class TermRun {
       const auto from = _term.tokenScores.begin() + static_cast<ptrdiff_t>(token);
       best = *std::max_element(from, _term.tokenScores.end());
     }
-    return _candidates.unmatched * best * _zoneBound < _need;
+    return _unmatched * best * _zoneBound < _need;
   }
 
   // Suffixes that the term may still take.
@@ -159,28 +150,25 @@ class TermRun {
   void take(const salt::Place* places, size_t count) {
     for (const salt::Place* place = places; place != places + count; ++place) {
       const uint32_t bit = _zoneBits.of(place->ZoneID);
-      uint32_t& seen = _candidates.seen[place->DocID];
-      if ((bit & ~seen) == 0) continue;
-      seen |= bit;
-      match(place->DocID, bit);
+      Candidates::Slot& slot = _candidates[place->DocID];
+      if ((bit & ~slot.seen) == 0) continue;
+      slot.seen |= bit;
+      if (slot.place != 0) {
+        match(&_candidates.candidate(slot), bit);
+      } else if (!_noNewDocs) {
+        _candidates.add(&slot, {place->DocID, bit, _unmatched, _tokenScore});
+      }
     }
   }
 
-  void match(uint32_t docID, uint32_t bit) {
-    DocResult* const known = _candidates.results.find(docID);
-    if (known == nullptr) {
-      if (!_noNewDocs) {
-        _candidates.results.insert({docID, bit, _candidates.unmatched, _tokenScore});
-      }
-      return;
-    }
-    if (known->tokenScore == -1.0) {
-      known->tokenScore = _tokenScore;
+  void match(DocResult* doc, uint32_t bit) const {
+    if (doc->tokenScore == -1.0) {
+      doc->tokenScore = _tokenScore;
     } else {
-      known->tokenScore = _term.isMin ? std::min(known->tokenScore, _tokenScore)
-                                      : std::max(known->tokenScore, _tokenScore);
+      doc->tokenScore = _term.isMin ? std::min(doc->tokenScore, _tokenScore)
+                                    : std::max(doc->tokenScore, _tokenScore);
     }
-    known->zoneMask |= bit;
+    doc->zoneMask |= bit;
   }
 
   // What this term multiplies the document's score by.
@@ -197,6 +185,7 @@ class TermRun {
   Term& _term;
   const Options& _options;
   Candidates& _candidates;
+  const double _unmatched;
   const double _zoneBound;
   const double _reach;  // best score of a document that neither this term nor one before matched
   const double _need;   // running score below which no later term brings a document up
@@ -210,20 +199,20 @@ bool ranksAbove(const DocResult& left, const DocResult& right) {
   return left.score > right.score || (left.score == right.score && left.docID > right.docID);
 }
 
-std::vector<DocResult> topDocs(const salt::DocTable<DocResult>& results, const Options& options) {
+std::vector<DocResult> topDocs(const std::vector<DocResult>& results, const Options& options) {
   std::vector<DocResult> heap;
   if (options.maxResults == 0) return heap;
-  results.forEach([&](const DocResult& doc) {
-    if (doc.score < options.threshold) return;
+  for (const DocResult& doc : results) {
+    if (doc.score < options.threshold) continue;
     if (heap.size() == options.maxResults) {
-      if (!ranksAbove(doc, heap.front())) return;
+      if (!ranksAbove(doc, heap.front())) continue;
       std::pop_heap(heap.begin(), heap.end(), ranksAbove);
       heap.back() = doc;
     } else {
       heap.push_back(doc);
     }
     std::push_heap(heap.begin(), heap.end(), ranksAbove);
-  });
+  }
   std::sort_heap(heap.begin(), heap.end(), ranksAbove);
   return heap;
 }
@@ -234,14 +223,16 @@ std::vector<DocResult> Search(const salt::Index& index, std::vector<Term>& terms
                               const Options& options) {
   const Bounds bounds = boundsOf(terms);
   Candidates candidates;
+  double unmatched = 1.0;
   for (size_t u = 0; u < terms.size(); ++u) {
     if (!wellFormed(terms[u])) continue;
-    TermRun run(terms[u], options, &candidates, bounds.zone[u], bounds.matched[u + 1],
+    TermRun run(terms[u], options, &candidates, unmatched, bounds.zone[u], bounds.matched[u + 1],
                 bounds.any[u + 1]);
     run.collect(index);
     run.score();
+    unmatched *= terms[u].defaultScore;
   }
-  return topDocs(candidates.results, options);
+  return topDocs(candidates.all(), options);
 }
 
 double ZoneScoreDefault(uint32_t, uint16_t) {
