@@ -19,10 +19,14 @@ std::string indexPath(const std::string& stateDirectory) {
   return stateDirectory + "/TallowSearch/" + kProtectionClass + "/salt";
 }
 
-ItemSpool::ItemSpool(const ScratchDirectory& scratch)
-    : _file(std::fopen((scratch / "items").c_str(), "w+b")) {
+ItemSpool::ItemSpool(std::string path, const char* mode)
+    : _path(std::move(path)), _file(std::fopen(_path.c_str(), mode)) {
   if (_file == nullptr) failWithErrno();
 }
+
+ItemSpool::ItemSpool(const ScratchDirectory& scratch) : ItemSpool(scratch / "items", "w+b") {}
+
+ItemSpool::ItemSpool(const std::string& path) : ItemSpool(path, "rb") {}
 
 void ItemSpool::fill(const std::vector<std::string>& paths,
                      const std::function<void(const client::EncodedItem&)>& visit) {
@@ -42,25 +46,27 @@ void ItemSpool::fill(const std::vector<std::string>& paths,
       if (visit) visit(item);
     }
     _items += batch->items.size();
-    ++_batches;
   }
   if (std::fflush(_file.get()) != 0) failWithErrno();
+  rewind();
+}
+
+bool ItemSpool::next(std::vector<client::EncodedItem>& batch) {
+  batch.resize(readCount().value_or(0));
+  for (client::EncodedItem& item : batch) {
+    item.identifier = read();
+    item.bytes = read();
+  }
+  return !batch.empty();
+}
+
+void ItemSpool::rewind() {
+  std::rewind(_file.get());
 }
 
 void ItemSpool::send(client::SearchServiceProxy& service) {
-  std::rewind(_file.get());
-  std::vector<client::EncodedItem> batch;
-  for (uint64_t i = 0; i < _batches; ++i) {
-    batch.resize(readCount());
-    for (client::EncodedItem& item : batch) {
-      item.identifier = read();
-      item.bytes = read();
-    }
-    std::optional<TLError> error;
-    if (!service.indexItems(batch, kClientName, kProtectionClass, &error)) {
-      throw std::runtime_error("indexing: " + platform::printable(error));
-    }
-  }
+  rewind();
+  for (std::vector<client::EncodedItem> batch; next(batch);) indexBatch(service, batch);
 }
 
 void ItemSpool::write(const std::string& bytes) {
@@ -73,15 +79,23 @@ void ItemSpool::writeCount(uint64_t count) {
 }
 
 std::string ItemSpool::read() {
-  std::string bytes(readCount(), '\0');
+  std::string bytes(readCount().value_or(0), '\0');
   if (std::fread(bytes.data(), 1, bytes.size(), _file.get()) != bytes.size()) failWithErrno();
   return bytes;
 }
 
-uint64_t ItemSpool::readCount() {
+std::optional<uint64_t> ItemSpool::readCount() {
   uint64_t count = 0;
-  if (std::fread(&count, sizeof count, 1, _file.get()) != 1) failWithErrno();
-  return count;
+  if (std::fread(&count, sizeof count, 1, _file.get()) == 1) return count;
+  if (std::ferror(_file.get()) != 0) failWithErrno();
+  return std::nullopt;
+}
+
+void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch) {
+  std::optional<TLError> error;
+  if (!service.indexItems(batch, kClientName, kProtectionClass, &error)) {
+    throw std::runtime_error("indexing: " + platform::printable(error));
+  }
 }
 
 }  // namespace bench

@@ -26,13 +26,12 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Queue.h"
+#include "bench/ChildProcess.h"
 
 namespace bench {
 
 namespace {
 
-constexpr std::chrono::milliseconds kSampleInterval(20);
 constexpr int kReadyMilliseconds = 30000;
 
 [[noreturn]] void fail(const std::string& what) {
@@ -68,28 +67,6 @@ void bindTo(const Descriptor& socket, const std::string& path) {
   }
 }
 
-// This environment with some variables set anew.
-std::vector<std::string> environmentWith(
-    const std::vector<std::pair<std::string, std::string>>& values) {
-  std::vector<std::string> all;
-  for (char** entry = environ; *entry != nullptr; ++entry) {
-    const std::string_view text(*entry);
-    const bool replaced = std::any_of(values.begin(), values.end(), [&](const auto& value) {
-      return text.starts_with(value.first + '=');
-    });
-    if (!replaced) all.emplace_back(text);
-  }
-  for (const auto& [name, value] : values) all.push_back(name + '=' + value);
-  return all;
-}
-
-// Kilobytes of one line of /proc/PID/status, in bytes.
-uint64_t statusBytes(const std::string& status, std::string_view field) {
-  const size_t at = status.find(field);
-  if (at == std::string::npos) return 0;
-  return strtoull(status.c_str() + at + field.size(), nullptr, 10) * 1024;
-}
-
 double secondsOf(clockid_t clock) {
   timespec time{};
   if (clock_gettime(clock, &time) != 0) failWithErrno("clock_gettime");
@@ -123,18 +100,17 @@ DaemonRun::DaemonRun(const ScratchDirectory& scratch, const std::string& stateDi
     end(SIGKILL);
     throw;
   }
-  _sampler = std::thread([this] { sampleMemory(); });
+  _watch.emplace(_pid);
 }
 
 DaemonRun::~DaemonRun() {
-  endSampling();
+  if (_watch) _watch->stop();
   if (_pid >= 0) end(SIGKILL);
 }
 
 void DaemonRun::spawn(const std::string& stateDirectory, const std::string& notifyPath,
                       const std::string& logPath) {
-  const std::string program =
-      std::filesystem::read_symlink("/proc/self/exe").replace_filename("tallowsearchd");
+  const std::string program = programBeside("tallowsearchd");
   std::vector<std::string> variables = environmentWith({{"STATE_DIRECTORY", stateDirectory},
                                                         {"RUNTIME_DIRECTORY", _runtimeDirectory},
                                                         {"NOTIFY_SOCKET", notifyPath}});
@@ -174,41 +150,6 @@ void DaemonRun::awaitReady(int notifySocket) const {
   }
 }
 
-void DaemonRun::lookAtMemory() {
-  std::ifstream file("/proc/" + std::to_string(_pid) + "/status");
-  const std::string status{std::istreambuf_iterator<char>(file), {}};
-  const uint64_t anonymous = statusBytes(status, "RssAnon:");
-  if (anonymous == 0) return;  // the process has ended
-  _memory.anonymous = anonymous;
-  _memory.anonymousPeak = std::max(_memory.anonymousPeak, anonymous);
-  _memory.residentPeak = std::max(_memory.residentPeak, statusBytes(status, "VmHWM:"));
-}
-
-void DaemonRun::sampleMemory() {
-  platform::setThreadName("bench.memory");
-  platform::MutexLock lock(_mutex);
-  while (!_ending) {
-    lookAtMemory();
-    _changed.wait_for(_mutex, kSampleInterval);
-  }
-}
-
-void DaemonRun::endSampling() {
-  if (!_sampler.joinable()) return;
-  {
-    platform::MutexLock lock(_mutex);
-    _ending = true;
-  }
-  _changed.notify_all();
-  _sampler.join();
-}
-
-Memory DaemonRun::memory() {
-  platform::MutexLock lock(_mutex);
-  lookAtMemory();
-  return _memory;
-}
-
 double DaemonRun::cpuSeconds() const {
   clockid_t clock;
   if (const int code = clock_getcpuclockid(_pid, &clock); code != 0) {
@@ -227,7 +168,7 @@ int DaemonRun::end(int signal) {
 }
 
 void DaemonRun::stop() {
-  endSampling();
+  _watch->stop();
   const int status = end(SIGTERM);
   if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) fail("tallowsearchd did not end well");
 }

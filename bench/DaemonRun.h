@@ -2,12 +2,11 @@
 
 #include <sys/types.h>
 
-#include <condition_variable>
 #include <cstdint>
+#include <optional>
 #include <string>
-#include <thread>
 
-#include "platform/Mutex.h"
+#include "bench/MemoryWatch.h"
 
 // What the end-to-end benchmarks share: a daemon of their own, and figures.
 namespace bench {
@@ -26,19 +25,10 @@ class ScratchDirectory {
   std::string _path;
 };
 
-// Resident memory of the daemon, in bytes. The kernel counts a thread's pages in bulk, so that each
-// figure may be off by some hundred kilobytes.
-struct Memory {
-  uint64_t anonymous = 0;      // RssAnon
-  uint64_t anonymousPeak = 0;  // highest RssAnon seen, looked at every 20 ms
-  uint64_t residentPeak = 0;   // VmHWM: mapped files count too
-};
-
 // One tallowsearchd, taken from the directory of this program, on directories of its own. Its log
 // goes to the file "daemon.log" in the scratch directory.
 //
-// Threads: one, the maker's. A sampling thread, joined by `stop`, shares `_memory` only. The daemon
-// is killed when the program ends without `stop`.
+// Threads: one, the maker's. The daemon is killed when the program ends without `stop`.
 class DaemonRun {
  public:
   // Returns once the daemon has said that it is ready; throws std::runtime_error when it does not.
@@ -49,7 +39,7 @@ class DaemonRun {
 
   [[nodiscard]] const std::string& runtimeDirectory() const { return _runtimeDirectory; }
 
-  [[nodiscard]] Memory memory() TL_EXCLUDES(_mutex);
+  [[nodiscard]] Memory memory() { return _watch->memory(); }
 
   // Processor time of all its threads so far. Steadier than the clock on a machine with other work.
   [[nodiscard]] double cpuSeconds() const;
@@ -61,20 +51,12 @@ class DaemonRun {
   void spawn(const std::string& stateDirectory, const std::string& notifyPath,
              const std::string& logPath);
   void awaitReady(int notifySocket) const;
-  void lookAtMemory() TL_REQUIRES(_mutex);
-  void sampleMemory() TL_EXCLUDES(_mutex);
-  void endSampling();
   // The exit status, as waitpid gives it.
   int end(int signal);
 
   const std::string _runtimeDirectory;
-  pid_t _pid = -1;  // fixed while the sampling thread runs
-
-  platform::Mutex _mutex;
-  std::condition_variable_any _changed;
-  Memory _memory TL_GUARDED_BY(_mutex);
-  bool _ending TL_GUARDED_BY(_mutex) = false;
-  std::thread _sampler;
+  pid_t _pid = -1;
+  std::optional<MemoryWatch> _watch;
 };
 
 // Sum of what the files at and below `path` take on the disk, in bytes.

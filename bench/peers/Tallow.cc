@@ -1,0 +1,217 @@
+#include <unistd.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <exception>
+#include <stdexcept>
+#include <string_view>
+#include <thread>
+
+#include "bench/ChildProcess.h"
+#include "bench/Corpus.h"
+#include "bench/RawBatches.h"
+#include "bench/peers/Peers.h"
+#include "client/DebugServiceProxy.h"
+#include "platform/Queue.h"
+
+namespace peers {
+
+namespace {
+
+struct Merges {
+  uint64_t ended;
+  bool running;
+};
+
+Merges mergesOf(client::DebugServiceProxy& service) {
+  std::optional<TLError> error;
+  const auto text = service.fetchStatsForSalt(bench::kClientName, bench::kProtectionClass, &error);
+  if (!text) throw std::runtime_error("statistics: " + platform::printable(error));
+  constexpr std::string_view kCount = "---- Vacuums: ";
+  const size_t at = text->find(kCount);
+  if (at == std::string::npos) throw std::runtime_error("the metrics tell no vacuums");
+  return {std::stoull(text->substr(at + kCount.size())),
+          text->find("(IN PROGRESS)", at) != std::string::npos};
+}
+
+// Merges and compacts the index until there is nothing more to merge.
+void settle(client::DebugServiceProxy& service) {
+  constexpr std::chrono::milliseconds kPoll(100);
+  constexpr int kMostRounds = 100;  // each moves at least a quarter of a million suffixes
+  for (int round = 0; round < kMostRounds; ++round) {
+    const uint64_t before = mergesOf(service).ended;
+    std::optional<TLError> error;
+    if (!service.forceVacuumAndCompact(bench::kProtectionClass, &error)) {
+      throw std::runtime_error("vacuum: " + platform::printable(error));
+    }
+    Merges merges = mergesOf(service);
+    for (; merges.running; merges = mergesOf(service)) std::this_thread::sleep_for(kPoll);
+    if (merges.ended == before) return;
+  }
+  throw std::runtime_error("the merges do not come to an end");
+}
+
+// Indexes the mail of the spool under new identifiers, again and again, to make the daemon merge.
+//
+// Threads: one, the maker's. The feeding thread, joined by `stop`, has all but `_stopping` for
+// itself while it runs.
+class Feeder {
+ public:
+  Feeder(const std::string& runtimeDirectory, const std::string& spoolPath)
+      : _service(runtimeDirectory), _spool(spoolPath) {}
+  ~Feeder() { end(); }
+  Feeder(const Feeder&) = delete;
+  Feeder& operator=(const Feeder&) = delete;
+
+  // Returns once a merge runs, or all mail was sent without.
+  void startMerge(client::DebugServiceProxy& service) {
+    const size_t round = _round;
+    while (_round == round && !mergesOf(service).running) sendBatch(SIZE_MAX);
+  }
+
+  // Goes on in a thread, in small calls, as mail comes in.
+  void start() {
+    _mails = 0;
+    _thread = std::thread([this] { feed(); });
+  }
+
+  // Returns how many mails the thread has sent; throws what it has met.
+  uint64_t stop() {
+    end();
+    if (_failure) std::rethrow_exception(_failure);
+    return _mails;
+  }
+
+ private:
+  void sendBatch(size_t itemsACall) {
+    if (!_spool.next(_batch)) {
+      ++_round;
+      _spool.rewind();
+      return;
+    }
+    for (client::EncodedItem& item : _batch) item = renamed(item);
+    for (size_t at = 0; at < _batch.size() && !_stopping;) {
+      const size_t count = std::min(itemsACall, _batch.size() - at);
+      bench::indexBatch(_service, std::span(_batch).subspan(at, count));
+      _mails += count;
+      at += count;
+    }
+  }
+
+  [[nodiscard]] client::EncodedItem renamed(const client::EncodedItem& encoded) const {
+    TLIndexableItem item;
+    if (!item.initWithData(encoded.bytes)) throw std::runtime_error("an item does not parse");
+    item.setIdentifier(platform::fromUTF8(encoded.identifier + "-again" + std::to_string(_round)));
+    return client::encode(item);
+  }
+
+  void feed() noexcept {
+    platform::setThreadName("bench.feeder");
+    constexpr size_t kItemsACall = 10;
+    try {
+      while (!_stopping) sendBatch(kItemsACall);
+    } catch (...) {
+      _failure = std::current_exception();
+    }
+  }
+
+  void end() {
+    _stopping = true;
+    if (_thread.joinable()) _thread.join();
+  }
+
+  client::SearchServiceProxy _service;
+  bench::ItemSpool _spool;
+  std::vector<client::EncodedItem> _batch;
+  size_t _round = 0;
+  uint64_t _mails = 0;
+  std::exception_ptr _failure;
+  std::atomic<bool> _stopping{false};
+  std::thread _thread;
+};
+
+// Makes the index, which is no part of indexing.
+void openIndex(client::SearchServiceProxy& service) {
+  std::optional<TLError> error;
+  const auto none =
+      service.fetchLastClientState(bench::kClientName, bench::kProtectionClass, &error);
+  if (error) throw std::runtime_error("opening: " + platform::printable(error));
+}
+
+void indexByClient(const Workload& work, bench::DaemonRun& daemon, const std::string& output,
+                   TallowFigures& figures) {
+  sync();
+  const double cpuStart = daemon.cpuSeconds();
+  const bench::Run run = bench::runProgram({{bench::programBeside("tallow"), "--runtime-dir",
+                                             daemon.runtimeDirectory(), "index", work.maildir},
+                                            {},
+                                            output},
+                                           false);
+  figures.mailsPerSecond = static_cast<double>(work.mails) / run.seconds;
+  figures.cpuSeconds = run.cpuSeconds + daemon.cpuSeconds() - cpuStart;
+  figures.residentPeak = static_cast<double>(daemon.memory().residentPeak);
+}
+
+}  // namespace
+
+TallowFigures measureTallow(const Workload& work) {
+  const bench::ScratchDirectory scratch;
+  const std::string state = scratch / "state";
+  bench::DaemonRun daemon(scratch, state);
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  client::DebugServiceProxy debugService(daemon.runtimeDirectory());
+  openIndex(service);
+  TallowFigures figures;
+  indexByClient(work, daemon, scratch / "output", figures);
+
+  const double start = bench::secondsNow();
+  settle(debugService);
+  figures.settleSeconds = bench::secondsNow() - start;
+  figures.settleMerges = mergesOf(debugService).ended;
+  figures.diskBytes = static_cast<double>(bench::bytesOnDisk(state));
+
+  const Search search = [&](const std::string& query) {
+    return bench::timedSearch(service, query);
+  };
+  timeQueries(work, search, false, figures);
+  Feeder feeder(daemon.runtimeDirectory(), work.spoolPath);
+  feeder.startMerge(debugService);
+  const Merges before = mergesOf(debugService);
+  feeder.start();
+  timeQueries(work, search, true, figures.duringMerge);
+  figures.mailsFed = feeder.stop();
+  const Merges after = mergesOf(debugService);
+  figures.merges = after.ended - before.ended + (after.running ? 1 : 0);
+
+  figures.anonymousPeak = static_cast<double>(daemon.memory().anonymousPeak);
+  daemon.stop();
+  return figures;
+}
+
+EncodedFigures measureEncoded(const Workload& work) {
+  const bench::ScratchDirectory scratch;
+  const std::string state = scratch / "state";
+  const std::string rawPath = scratch / "raw";
+  bench::ItemSpool spool(work.spoolPath);
+  bench::DaemonRun daemon(scratch, state);
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  openIndex(service);
+  EncodedFigures figures;
+  sync();
+  const double start = bench::secondsNow();
+  const double cpuStart = daemon.cpuSeconds();
+  spool.send(service);
+  figures.seconds = bench::secondsNow() - start;
+  figures.cpuSeconds = daemon.cpuSeconds() - cpuStart;
+  figures.anonymousPeak = static_cast<double>(daemon.memory().anonymousPeak);
+  daemon.stop();
+  sync();
+  const bench::RawRun raw = bench::writeRawBatches(bench::indexPath(state), rawPath);
+  figures.suffixes = raw.suffixes;
+  figures.rawSeconds = raw.seconds;
+  figures.rawDiskBytes = static_cast<double>(bench::bytesOnDisk(rawPath));
+  return figures;
+}
+
+}  // namespace peers
