@@ -56,6 +56,7 @@ int run(int argc, char** argv) {
   bench::Percentiles all;
   std::array<bench::Percentiles, bench::kMaximumWords> byWords;
   uint64_t results = 0;
+  const double cpuBefore = daemon.cpuSeconds();
   for (size_t i = 0; i < queries.size(); ++i) {
     const bench::TimedSearch timed = bench::timedSearch(service, queries[i]);
     all.add(timed.seconds);
@@ -63,6 +64,7 @@ int run(int argc, char** argv) {
     results += timed.results;
     if (verbose) fmt::print("{:8.2f} {:3} {}\n", timed.seconds * 1e3, timed.results, queries[i]);
   }
+  const double cpu = (daemon.cpuSeconds() - cpuBefore) / static_cast<double>(queries.size());
   const bench::Memory memory = daemon.memory();
   daemon.stop();
 
@@ -71,7 +73,8 @@ int run(int argc, char** argv) {
   for (size_t i = 0; i < bench::kMaximumWords; ++i) {
     line += figures(fmt::format("words{}", i + 1), byWords[i]);
   }
-  fmt::print("{} rss_anon_peak_mb={:.1f}\n", line, static_cast<double>(memory.anonymousPeak) / 1e6);
+  fmt::print("{} daemon_cpu_ms_per_query={:.2f} rss_anon_peak_mb={:.1f}\n", line, cpu * 1e3,
+             static_cast<double>(memory.anonymousPeak) / 1e6);
   return 0;
 }
 

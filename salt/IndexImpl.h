@@ -128,6 +128,7 @@ class index final : public Index {
   void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex);
   // The body of the merge thread.
   void runMerge(uint8_t shard) TL_EXCLUDES(_metricsMutex);
+  [[nodiscard]] bool hotPartIsSparse() const TL_EXCLUDES(_metricsMutex);
   void compactHotPart();
 
   // False, with a log line, when the loaded counters cannot be those of a sound index.

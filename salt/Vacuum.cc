@@ -8,6 +8,13 @@
 // Moving the hot part into shards: when, where to, and on which thread.
 namespace salt {
 
+namespace {
+
+// A hot part below this part of the most it may hold is sparse.
+constexpr uint32_t kSparseHotPart = 16;
+
+}  // namespace
+
 index::~index() {
   platform::MutexLock lock(_mergeThreadMutex);
   if (_mergeThread.joinable()) _mergeThread.join();
@@ -62,8 +69,8 @@ void index::runMerge(uint8_t shard) {
   Merge(*this, shard).run();
   if (op.CompactAfterVacuum) {
     Compact();
-  } else {
-    if (getenv("HOTC")) compactHotPart();
+  } else if (hotPartIsSparse()) {
+    compactHotPart();
   }
   const std::chrono::duration<double> elapsed = Clock::now() - start;
   platform::MutexLock lock(_metricsMutex);
@@ -74,8 +81,14 @@ void index::runMerge(uint8_t shard) {
   (void)writeMetrics(&batch);
 }
 
-// A merge leaves a removed key for each suffix that was hot, and a seek walks over all of them up
-// to the next one that lives.
+// A merge leaves a removed key for each suffix that was hot, and a seek walks over them up to the
+// next one that lives. While mail comes in fast there is always one near, and leveldb, busy then,
+// soon drops the removed keys by itself.
+bool index::hotPartIsSparse() const {
+  platform::MutexLock lock(_metricsMutex);
+  return metrics.HotSuffixes < op.MaxHotSuffixes / kSparseHotPart;
+}
+
 void index::compactHotPart() {
   const leveldb::Slice begin("\x00", 1);
   const leveldb::Slice end("\x01", 1);
