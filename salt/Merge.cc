@@ -69,7 +69,8 @@ void Merge::takeOld() {
   const bool pageBegins = _old.pos == 0;
   if (pageBegins) {
     if (_tookOld) commit(false);
-    _batch.Delete(_old.iterator->key());
+    _oldKey = view(_old.iterator->key());
+    _oldValue = view(_old.iterator->value());
     --_pageDelta;
   }
   // Behind its old neighbour a suffix relates as before.
@@ -127,11 +128,20 @@ void Merge::flushPage(size_t count) {
   TL_ASSERT(_pending.size() >= count);
   suffixKey(_shard, firstText(), _pending.front(), &_key);
   pageToValue(_pending.data(), count, &_value);
-  _batch.Put(_key, _value);
+  putPage();
   ++_pageDelta;
   const auto taken = static_cast<ptrdiff_t>(count);
   _pending.erase(_pending.begin(), _pending.begin() + taken);
   std::rotate(_pendingTexts.begin(), _pendingTexts.begin() + taken, _pendingTexts.end());
+}
+
+// The first page since an old one began is to take its place, and mostly has its key; if its value,
+// too, then there is nothing to write.
+void Merge::putPage() {
+  const bool replaces = !_oldKey.empty();
+  if (replaces && _oldKey != _key) _batch.Delete(_oldKey);
+  if (!replaces || _oldKey != _key || _oldValue != _value) _batch.Put(_key, _value);
+  _oldKey.clear();
 }
 
 // A rest too long for one page becomes two of about the same size.

@@ -42,6 +42,9 @@ class Merge {
   // Puts the first `count` pending suffixes into a page.
   void flushPage(size_t count);
 
+  // Writes the page of _key and _value, and removes the old page that it replaces.
+  void putPage();
+
   // Puts all that is pending into pages, and writes the batch if it is large enough or the last.
   void commit(bool final);
 
@@ -64,6 +67,8 @@ class Merge {
   bool _lastFromHot = false;
   std::string _key;
   std::string _value;
+  std::string _oldKey;  // of the old page begun since the latest flush, or empty
+  std::string _oldValue;
 };
 
 }  // namespace salt

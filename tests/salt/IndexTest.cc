@@ -140,6 +140,7 @@ TEST(AddZone, DelaysOnlyFromTwiceTheHotLimit) {
   const TemporaryDirectory directory;
   Index::Options options;
   options.MaxHotSuffixes = 10;
+  options.MaxPageSuffixes = 0;  // no merge takes from the hot part
   options.ThrottleFactor = 1;
   const auto index = newIndex(directory / "i", options);
   const std::string text(19, 'a');
