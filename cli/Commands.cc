@@ -18,13 +18,6 @@ namespace {
 
 using Run = ExitStatus (*)(const Options&);
 
-// Writes the result of a command; a full disk or a closed pipe is a failure.
-ExitStatus print(const std::string& text, ExitStatus status = ExitStatus::done) {
-  const bool written =
-      std::fwrite(text.data(), 1, text.size(), stdout) == text.size() && std::fflush(stdout) == 0;
-  return written ? status : ExitStatus::failure;
-}
-
 std::string withLineFeed(std::string text) {
   if (text.empty() || text.back() != '\n') text.push_back('\n');
   return text;
@@ -200,7 +193,7 @@ struct CommandFunction {
   Run run;
 };
 
-constexpr std::array<CommandFunction, 10> kFunctions{{
+constexpr std::array<CommandFunction, 12> kFunctions{{
     {Command::index, runIndex},
     {Command::search, runSearch},
     {Command::explain, runSearch},
@@ -211,9 +204,17 @@ constexpr std::array<CommandFunction, 10> kFunctions{{
     {Command::ping, runPing},
     {Command::vacuum, runVacuum},
     {Command::state, runState},
+    {Command::dump, runDump},
+    {Command::validate, runValidate},
 }};
 
 }  // namespace
+
+ExitStatus print(std::string_view text, ExitStatus status) {
+  const bool written =
+      std::fwrite(text.data(), 1, text.size(), stdout) == text.size() && std::fflush(stdout) == 0;
+  return written ? status : ExitStatus::failure;
+}
 
 void complain(const std::string& message) {
   fmt::print(stderr, "tallow: {}\n", cleanForTerminal(message));

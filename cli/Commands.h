@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 #include "cli/Options.h"
 #include "platform/TLError.h"
@@ -12,6 +13,13 @@ namespace cli {
 
 // Of runCommand, the one that reads mail.
 [[nodiscard]] ExitStatus runIndex(const Options& options);
+
+// Of runCommand, those that look at an index without the daemon.
+[[nodiscard]] ExitStatus runDump(const Options& options);
+[[nodiscard]] ExitStatus runValidate(const Options& options);
+
+// Writes the result of a command, or a piece of it; a full disk or a closed pipe is a failure.
+[[nodiscard]] ExitStatus print(std::string_view text, ExitStatus status = ExitStatus::done);
 
 // Says "tallow: MESSAGE" on the standard error.
 void complain(const std::string& message);

@@ -23,7 +23,7 @@ struct CommandRow {
   bool operandsRequired;
 };
 
-constexpr std::array<CommandRow, 10> kCommands{{
+constexpr std::array<CommandRow, 12> kCommands{{
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
     {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
@@ -35,8 +35,10 @@ constexpr std::array<CommandRow, 10> kCommands{{
     {Command::stats, "stats", "Show the statistics of store and index", nullptr, false},
     {Command::metrics, "metrics", "Show the metrics of the text index", nullptr, false},
     {Command::ping, "ping", "Ask the daemon whether it is there", "TEXT", false},
-    {Command::vacuum, "vacuum", "Drop what is deleted and compact the index", nullptr, false},
+    {Command::vacuum, "vacuum", "Sort what is new into the index and compact it", nullptr, false},
     {Command::state, "state", "Show the state that a client has stored", nullptr, false},
+    {Command::dump, "dump", "Print the text index, while no daemon runs", nullptr, false},
+    {Command::validate, "validate", "Check the text index, while no daemon runs", nullptr, false},
 }};
 
 const std::map<std::string, OutputFormat> kFormats{
@@ -47,6 +49,9 @@ const std::map<std::string, ColorMode> kColors{
 void addGlobalOptions(CLI::App& app, Options& options) {
   app.set_version_flag("--version", kVersion);
   app.add_option("--runtime-dir", options.runtimeDirectory, "Directory of the daemon's sockets")
+      ->type_name("DIR");
+  app.add_option("--state-dir", options.stateDirectory,
+                 "Directory of the daemon's data, for dump and validate")
       ->type_name("DIR");
   app.add_option("--class", options.protectionClass, "Protection class (default: default)")
       ->type_name("CLASS");
@@ -79,6 +84,17 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 
+// What is wrong with the format that was asked for, or null.
+const char* misusedFormat(const Options& options) {
+  if (options.format == OutputFormat::files && options.command != Command::search) {
+    return "--format=files is for search only";
+  }
+  if (options.format == OutputFormat::json && options.command == Command::dump) {
+    return "a dump is text only";
+  }
+  return nullptr;
+}
+
 }  // namespace
 
 std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitStatus& status) {
@@ -94,8 +110,8 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
     status = app.exit(error) == 0 ? ExitStatus::done : ExitStatus::failure;
     return std::nullopt;
   }
-  if (options.format == OutputFormat::files && options.command != Command::search) {
-    std::cerr << "tallow: --format=files is for search only\n";
+  if (const char* const misused = misusedFormat(options)) {
+    std::cerr << "tallow: " << misused << '\n';
     status = ExitStatus::failure;
     return std::nullopt;
   }

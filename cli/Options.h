@@ -15,10 +15,24 @@ enum class ExitStatus : int {
   done = 0,
   nothingFound = 1,
   failure = 2,       // also wrong use
+  inUse = 3,         // an index that can be looked at only while no daemon runs
   unreachable = 75,  // of the daemon
 };
 
-enum class Command { index, search, explain, remove, reset, stats, metrics, ping, vacuum, state };
+enum class Command {
+  index,
+  search,
+  explain,
+  remove,
+  reset,
+  stats,
+  metrics,
+  ping,
+  vacuum,
+  state,
+  dump,
+  validate
+};
 enum class OutputFormat { text, json, files };
 
 struct Options {
@@ -26,6 +40,7 @@ struct Options {
   std::vector<std::string> arguments;  // of the command: paths, words, identifiers or a text
 
   std::string runtimeDirectory;
+  std::string stateDirectory;  // empty: where the daemon has it by itself
   std::string protectionClass = "default";
   std::string name = "tallow";
   OutputFormat format = OutputFormat::text;

@@ -11,19 +11,13 @@
 namespace {
 
 constexpr int kIndexerUnavailable = -2;
-constexpr size_t kLongestName = 255;  // bytes, of the file system
-
-bool namesOneDirectory(const std::string& name) {
-  return !name.empty() && name != "." && name != ".." && name.size() <= kLongestName &&
-         name.find('/') == std::string::npos && name.find('\0') == std::string::npos;
-}
 
 bool createClassDirectory(const std::string& root, const std::string& protectionClass,
                           TLErrorOut error) {
-  if (!namesOneDirectory(protectionClass)) {
-    platform::setError(
-        error, platform::posixError(protectionClass.size() > kLongestName ? ENAMETOOLONG : EINVAL,
-                                    "a protection class must name one directory"));
+  if (!platform::namesOneDirectory(protectionClass)) {
+    const bool tooLong = protectionClass.size() > platform::kLongestName;
+    platform::setError(error, platform::posixError(tooLong ? ENAMETOOLONG : EINVAL,
+                                                   "a protection class must name one directory"));
     return false;
   }
   return platform::createDirectories(platform::joinPath(root, protectionClass), error,
@@ -108,7 +102,7 @@ std::shared_ptr<TALIndexer> TALIndexerManager::_createIndexerWithProtectionType(
     platform::setError(error, failure.value_or(indexerUnavailableError()));
     return nullptr;
   }
-  const std::string saltPath = platform::joinPath(directory, "salt");
+  const std::string saltPath = platform::textIndexPath(_path, protectionClass);
   log().standard("Creating indexer saltPath={} docStorePath: {} synonymPath: {}", saltPath,
                  docStorePath, platform::synonymFilePath());
   return std::make_shared<TALIndexer>(saltPath, protectionClass, std::move(docStore));

@@ -1,4 +1,3 @@
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <systemd/sd-daemon.h>
 
@@ -26,14 +25,6 @@ const platform::Log& log() {
   return handle;
 }
 
-// Each protection class may hold a thousand table files open.
-void raiseDescriptorLimit() {
-  rlimit limit;
-  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
-  limit.rlim_cur = limit.rlim_max;
-  setrlimit(RLIMIT_NOFILE, &limit);
-}
-
 void handleEndingSignal(int signal) {
   log().standard("Received signal {}.", strsignal(signal));
   sd_notify(0, "STOPPING=1");
@@ -51,7 +42,7 @@ int fail(const std::optional<TLError>& error) {
 
 int main() {
   umask(kPrivateUmask);
-  raiseDescriptorLimit();
+  platform::raiseDescriptorLimit();  // each class may hold a thousand table files open
   // Before any thread starts, so that all threads inherit it.
   for (const int signal : kEndingSignals) platform::takeSignalFromProcess(signal);
   platform::takeSignalFromProcess(kCaptureSignal);
@@ -71,8 +62,7 @@ int main() {
   auto captureSource = loop.addSignal(
       kCaptureSignal, [&captureQueue](int) { captureQueue.async(platform::logCapturedState); });
 
-  const auto lock = platform::ProcessLock::acquire(
-      platform::joinPath(platform::stateDirectory(), "tallowsearchd.lock"), &error);
+  const auto lock = platform::ProcessLock::acquire(platform::processLockPath(), &error);
   TALDaemon* daemon = TALDaemon::sharedInstance();
   if (daemon != nullptr) {
     if (lock == nullptr || !daemon->run(&error)) return fail(error);

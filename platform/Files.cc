@@ -1,6 +1,7 @@
 #include "platform/Files.h"
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/xattr.h>
 #include <unistd.h>
@@ -8,6 +9,8 @@
 #include <cerrno>
 #include <filesystem>
 #include <fstream>
+
+#include "platform/FileDescriptor.h"
 
 namespace platform {
 
@@ -32,20 +35,6 @@ bool makeDirectory(const std::string& path, TLErrorOut error) {
   setError(error, posixError(code, path));
   return false;
 }
-
-class FileDescriptor {
- public:
-  explicit FileDescriptor(int fd) : _fd(fd) {}
-  ~FileDescriptor() {
-    if (_fd >= 0) ::close(_fd);
-  }
-  FileDescriptor(const FileDescriptor&) = delete;
-  FileDescriptor& operator=(const FileDescriptor&) = delete;
-  [[nodiscard]] int get() const { return _fd; }
-
- private:
-  int _fd;
-};
 
 bool writeAll(int fd, const std::string& bytes) {
   for (size_t done = 0; done < bytes.size();) {
@@ -146,6 +135,13 @@ bool writeFileAtomically(const std::string& path, const std::string& bytes, TLEr
     return false;
   }
   return true;
+}
+
+void raiseDescriptorLimit() {
+  rlimit limit;
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
 }
 
 }  // namespace platform

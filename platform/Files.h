@@ -32,4 +32,7 @@ bool removeItem(const std::string& path, TLErrorOut error);
 // Written beside the target, synced, then renamed over it.
 bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error);
 
+// As many open files as the system lets this process have.
+void raiseDescriptorLimit();
+
 }  // namespace platform

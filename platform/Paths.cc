@@ -1,7 +1,6 @@
 #include "platform/Paths.h"
 
 #include <cstdlib>
-#include <string_view>
 
 namespace platform {
 
@@ -24,8 +23,12 @@ std::string runtimeDirectory() {
   return directoryFromEnvironment("RUNTIME_DIRECTORY", "/run/tallow");
 }
 
-std::string dataRoot() {
-  return joinPath(stateDirectory(), "TallowSearch");
+std::string processLockPath(const std::string& state) {
+  return joinPath(state, "tallowsearchd.lock");
+}
+
+std::string dataRoot(const std::string& state) {
+  return joinPath(state, "TallowSearch");
 }
 
 std::string synonymFilePath() {
@@ -38,6 +41,16 @@ std::string defaultsFilePath() {
 
 std::string lockStatusPath() {
   return joinPath(runtimeDirectory(), "lock_status");
+}
+
+bool namesOneDirectory(std::string_view protectionClass) {
+  return !protectionClass.empty() && protectionClass != "." && protectionClass != ".." &&
+         protectionClass.size() <= kLongestName &&
+         protectionClass.find_first_of(std::string_view("/\0", 2)) == std::string_view::npos;
+}
+
+std::string textIndexPath(const std::string& root, const std::string& protectionClass) {
+  return joinPath(joinPath(root, protectionClass), "salt");
 }
 
 std::string joinPath(const std::string& base, const std::string& component) {

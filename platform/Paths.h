@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 namespace platform {
 
@@ -11,10 +12,22 @@ namespace platform {
 // $RUNTIME_DIRECTORY or /run/tallow: sockets and the lock status lie below it.
 [[nodiscard]] std::string runtimeDirectory();
 
-[[nodiscard]] std::string dataRoot();         // TallowSearch
+// What a running daemon holds as long as it may touch anything below its state directory.
+[[nodiscard]] std::string processLockPath(const std::string& state = stateDirectory());
+
+[[nodiscard]] std::string dataRoot(const std::string& state = stateDirectory());  // TallowSearch
 [[nodiscard]] std::string synonymFilePath();  // TALLOW/en_synonyms.txt
 [[nodiscard]] std::string defaultsFilePath();
 [[nodiscard]] std::string lockStatusPath();
+
+// A protection class is one directory below the data root, whose name clients choose: neither
+// empty, nor a way to elsewhere, nor longer than a file system takes.
+[[nodiscard]] bool namesOneDirectory(std::string_view protectionClass);
+inline constexpr size_t kLongestName = 255;  // bytes
+
+// Directory of the text index of a class.
+[[nodiscard]] std::string textIndexPath(const std::string& root,
+                                        const std::string& protectionClass);
 
 // `base` and `component` with exactly one slash between.
 [[nodiscard]] std::string joinPath(const std::string& base, const std::string& component);

@@ -3,6 +3,7 @@
 #include <memory>
 #include <string>
 
+#include "platform/FileDescriptor.h"
 #include "platform/TLError.h"
 
 namespace platform {
@@ -14,14 +15,19 @@ class ProcessLock {
   // Null with an error when another process holds the lock, or the file cannot be made.
   [[nodiscard]] static std::unique_ptr<ProcessLock> acquire(const std::string& path,
                                                             TLErrorOut error);
-  ~ProcessLock();
-  ProcessLock(const ProcessLock&) = delete;
-  ProcessLock& operator=(const ProcessLock&) = delete;
+
+  // Keeps the holder of an exclusive lock out, but not others like itself, and never makes or
+  // changes the file. Null with an error when the lock is held exclusively (EWOULDBLOCK) or the
+  // file cannot be read.
+  [[nodiscard]] static std::unique_ptr<ProcessLock> acquireShared(const std::string& path,
+                                                                  TLErrorOut error);
 
  private:
-  explicit ProcessLock(int descriptor) : _descriptor(descriptor) {}
+  explicit ProcessLock(FileDescriptor file) : _file(std::move(file)) {}
+  static std::unique_ptr<ProcessLock> lock(FileDescriptor file, int operation,
+                                           const std::string& path, TLErrorOut error);
 
-  const int _descriptor;
+  const FileDescriptor _file;
 };
 
 }  // namespace platform

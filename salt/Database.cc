@@ -57,11 +57,12 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
   return status;
 }
 
-Database openDatabase(const std::string& path, OpenMode mode) {
+Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* files) {
   Database result;
   result.logger = std::make_unique<LeveldbLogger>();
   result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
   leveldb::Options options;
+  options.env = files;
   options.write_buffer_size = kWriteBufferBytes;
   options.block_cache = result.cache.get();
   options.block_size = kBlockBytes;

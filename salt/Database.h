@@ -31,8 +31,9 @@ struct Database {
 
 enum class OpenMode { create, existing };
 
-// `create` removes what is at `path` first. A failure is logged.
-[[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode);
+// `create` removes what is at `path` first. A failure is logged. `files` outlives the database.
+[[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode,
+                                    leveldb::Env* files = leveldb::Env::Default());
 
 // The only way batches are written. A write that fails (a full disk, say) can leave half a record
 // in the log, and recovery does not look behind it: the next write starts a new log first, so that

@@ -73,9 +73,12 @@ Index* NewIndex(const Index::Options& options) {
 }
 
 Index* LoadIndex(const std::string& path) {
-  Database database = openDatabase(path, OpenMode::existing);
-  if (!database.db) return nullptr;
-  auto idx = std::make_unique<index>(std::move(database));
+  return index::load(openDatabase(path, OpenMode::existing)).release();
+}
+
+std::unique_ptr<index> index::load(Database opened) {
+  if (!opened.db) return nullptr;
+  auto idx = std::make_unique<index>(std::move(opened));
   if (!idx->metricsSound()) return nullptr;
   if (idx->op.ValidateOnLoad && !idx->Validate()) {
     Log.fault("Loading failure: Validation failed.");
@@ -83,7 +86,7 @@ Index* LoadIndex(const std::string& path) {
   }
   platform::MutexLock lock(idx->_metricsMutex);
   idx->metrics.VacuumInProgress = false;
-  return idx.release();
+  return idx;
 }
 
 bool index::metricsSound() const {

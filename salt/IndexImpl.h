@@ -43,6 +43,9 @@ inline constexpr uint8_t kMaxShardNumber = 0xFE;
 class index final : public Index {
  public:
   explicit index(Database opened);
+  // An index over a database that exists; null, with a log line, when there is none or it is not
+  // sound.
+  [[nodiscard]] static std::unique_ptr<index> load(Database opened);
   // Waits for a merge that runs.
   ~index() override;
 
@@ -65,6 +68,10 @@ class index final : public Index {
   bool ScanPlaces(
       std::string_view prefix, size_t limit,
       const std::function<bool(const Place* places, size_t count)>& callback) const override;
+
+  // The text of Dump, in pieces of some 64 KiB. `sink` returns false to stop. False when it did,
+  // or, with a log line, when reading failed.
+  [[nodiscard]] bool dumpTo(const std::function<bool(std::string_view)>& sink) const;
 
   static TextKey textKey(uint32_t docID, uint16_t zoneID) {
     constexpr uint8_t shard = 255;
@@ -141,7 +148,6 @@ class index final : public Index {
 
   friend class IndexView;
   friend Index* NewIndex(const Options& options);
-  friend Index* LoadIndex(const std::string& path);
 
   Database _database;
   BatchWriter _writer;

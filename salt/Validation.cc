@@ -1,6 +1,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <iterator>
 
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
@@ -12,6 +13,7 @@ namespace salt {
 namespace {
 
 constexpr size_t kDumpedTextBytes = 16;
+constexpr size_t kDumpPieceBytes = 64 * 1024;
 
 uint8_t byteAt(std::string_view text, size_t at) {
   return at < text.size() ? static_cast<uint8_t>(text[at]) : 0;
@@ -39,6 +41,13 @@ const char* fault(std::string_view previous, const SuffixMeta& previousMeta, std
   return nullptr;
 }
 
+// False, with a log line, when a walk ended for an error.
+bool readInFull(const ShardCursor& cursor) {
+  const leveldb::Status status = cursor.iterator->status();
+  if (!status.ok()) Log.error("Error scanning index: {}", status.ToString());
+  return status.ok();
+}
+
 // Counts the suffixes of the cursor's shard into `total`; false, with a log line, at a fault.
 bool shardSound(ShardCursor* cursor, uint64_t* total) {
   std::string previous;
@@ -56,11 +65,7 @@ bool shardSound(ShardCursor* cursor, uint64_t* total) {
     previousMeta = suffix.meta;
     ++*total;
   }
-  if (const leveldb::Status status = cursor->iterator->status(); !status.ok()) {
-    Log.error("Error scanning index: {}", status.ToString());
-    return false;
-  }
-  return true;
+  return readInFull(*cursor);
 }
 
 }  // namespace
@@ -81,20 +86,38 @@ bool index::Validate() const {
 }
 
 std::string index::Dump() const {
+  std::string text;
+  static_cast<void>(dumpTo([&text](std::string_view piece) {
+    text += piece;
+    return true;
+  }));
+  return text;
+}
+
+bool index::dumpTo(const std::function<bool(std::string_view)>& sink) const {
   const IndexView view(*this, false);
   ZoneTexts zoneTexts(*this);
   ShardCursor cursor(view, 0, &zoneTexts);
-  std::string text = std::string(view.metrics) + '\n';
+  std::string piece = std::string(view.metrics) + '\n';
   for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {
-    text += shard == 0 ? "-- SALT INDEX (HOT)\n" : fmt::format("-- SALT INDEX (SHARD {})\n", shard);
+    piece +=
+        shard == 0 ? "-- SALT INDEX (HOT)\n" : fmt::format("-- SALT INDEX (SHARD {})\n", shard);
     cursor.moveTo(static_cast<uint8_t>(shard));
     for (cursor.seekToFirst(); cursor.valid; cursor.next()) {
       cursor.suffix.fetch();
-      text += fmt::format("---- {}: \"{}\"\n", std::string(cursor.suffix.meta),
-                          cursor.suffix.knownText().substr(0, kDumpedTextBytes));
+      fmt::format_to(std::back_inserter(piece), "---- {}: \"{}\"\n",
+                     std::string(cursor.suffix.meta),
+                     cursor.suffix.knownText().substr(0, kDumpedTextBytes));
+      if (piece.size() < kDumpPieceBytes) continue;
+      if (!sink(piece)) return false;
+      piece.clear();
+    }
+    if (!readInFull(cursor)) {
+      sink(piece);
+      return false;
     }
   }
-  return text;
+  return sink(piece);
 }
 
 }  // namespace salt

@@ -2,9 +2,10 @@
 
 _tallow() {
   local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='index search explain delete reset stats metrics ping vacuum state'
-  local options='--runtime-dir --class --name --format --limit --color --wait --yes --verbose --help
-    --version'
+  local commands='index search explain delete reset stats metrics ping vacuum state dump
+    validate'
+  local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
+    --verbose --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
     prev=${COMP_WORDS[COMP_CWORD - 2]}
@@ -15,7 +16,7 @@ _tallow() {
   case $prev in
     --format) mapfile -t COMPREPLY < <(compgen -W 'text json files' -- "$cur"); return ;;
     --color) mapfile -t COMPREPLY < <(compgen -W 'auto always never' -- "$cur"); return ;;
-    --runtime-dir) compopt -o dirnames; return ;;
+    --runtime-dir | --state-dir) compopt -o dirnames; return ;;
     --class | --name | --limit | --wait) return ;;
   esac
   if [[ $cur == -* ]]; then

@@ -11,11 +11,14 @@ commands=(
   'stats:show the statistics of store and index'
   'metrics:show the metrics of the text index'
   'ping:ask the daemon whether it is there'
-  'vacuum:drop what is deleted and compact'
+  'vacuum:sort what is new into the index and compact it'
   'state:show the state of a client'
+  'dump:print the text index, while no daemon runs'
+  'validate:check the text index, while no daemon runs'
 )
 options=(
   '--runtime-dir=[directory of the sockets]:directory:_files -/'
+  '--state-dir=[directory of the data]:directory:_files -/'
   '--class=[protection class]:class:'
   '--name=[name of this client]:name:'
   '--format=[output]:format:(text json files)'

@@ -174,6 +174,12 @@ TEST_F(CommandsTest, Diagnostics) {
   EXPECT_EQ(output, "pong\n");
   EXPECT_EQ(run({"vacuum", "--class", "c"}), ExitStatus::done);
   EXPECT_EQ(daemon.calls().back(), "ForceVacuumAndCompact(c)");
+  EXPECT_EQ(output, "The index has been compacted.\n");
+  EXPECT_EQ(run({"vacuum", "--format=json"}), ExitStatus::done);
+  EXPECT_EQ(nlohmann::json::parse(output), nlohmann::json({{"vacuum", true}}));
+  daemon.failOnce("ForceVacuumAndCompact", {"TALIndexer", 4, "shutting down"});
+  EXPECT_EQ(run({"vacuum"}), ExitStatus::failure);
+  EXPECT_EQ(errors, "tallow: shutting down (TALIndexer 4)\n");
 }
 
 TEST_F(CommandsTest, State) {

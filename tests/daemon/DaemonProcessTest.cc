@@ -16,44 +16,17 @@
 #include "platform/Files.h"
 #include "records/TLParamsManager.h"
 #include "tests/daemon/DaemonProcess.h"
+#include "tests/daemon/DaemonSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
 
 using client::EncodedItem;
 using testsupport::DaemonProcess;
+using testsupport::mail;
+using testsupport::mails;
+using testsupport::search;
 using Outcome = std::optional<TLError>;
-
-EncodedItem mail(const std::string& identifier, const std::string& subject,
-                 const std::string& body = "") {
-  TLIndexableItem item;
-  item.setIdentifier(platform::fromUTF8(identifier));
-  item.addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, platform::fromUTF8(subject));
-  item.addAttributeWithKeyStringValue(TLAttributeKey::TEXT_CONTENT, platform::fromUTF8(body));
-  return client::encode(item);
-}
-
-std::vector<EncodedItem> mails(const std::string& prefix, int count) {
-  std::vector<EncodedItem> items;
-  for (int i = 0; i < count; ++i) {
-    std::string body;
-    for (int word = 0; word < 300; ++word) body += fmt::format("w{} ", i * 7 + word);
-    items.push_back(mail(fmt::format("{}{}", prefix, i), "word " + prefix, body));
-  }
-  return items;
-}
-
-// Number of results, or the code of the error.
-int64_t search(client::SearchServiceProxy& service, const std::string& text,
-               const std::string& protectionClass = "default") {
-  TLQuery query;
-  query.setRawQuery(platform::fromUTF8(text));
-  query.setOriginalQuery(platform::fromUTF8(text));
-  Outcome error;
-  const auto items = service.searchItems(query, 0, protectionClass,
-                                         client::SearchServiceProxy::kNoMaximum, &error);
-  return items ? static_cast<int64_t>(items->size()) : error->code;
-}
 
 class DaemonProcessTest : public testing::Test {
  protected:

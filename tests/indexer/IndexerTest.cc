@@ -10,6 +10,7 @@
 #include "platform/Files.h"
 #include "platform/StateCapture.h"
 #include "records/TLParamsManager.h"
+#include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -316,6 +317,54 @@ TEST_F(IndexerTest, IndexAndStoreNeverDifferInWhatTheyKnowOf) {
   EXPECT_EQ(search("word"), "");
   EXPECT_EQ(indexer->docStats().at("TLDebugServiceTextStoreNumOfItems"), 0);
   EXPECT_TRUE(log.has("default TALIndexer: SALT was reset"));
+}
+
+TEST_F(IndexerTest, AnIndexThatDoesNotOpenIsMadeAnewAndEmptiesTheStore) {
+  const std::string salt = directory / "salt";
+  const struct {
+    std::function<void()> damage;
+    std::string line;
+  } cases[] = {
+      {[&] { salttest::editMetrics(salt, [](auto& m) { m.CodeVersion = 303; }); },
+       "error SALT: Loading failure: Mismatched code version."},
+      {[&] { salttest::editMetrics(salt, [](auto& m) { m.Shards = 17; }); },
+       "fault SALT: Loading failure: Metrics corrupted."},
+      {[&] { platform::writeFileAtomically(salt + "/CURRENT", "garbage", nullptr); },
+       "error SALT: Error opening db: Corruption: CURRENT file does not end with newline"},
+  };
+  for (const auto& c : cases) {
+    ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+    indexer->shutdown();
+    c.damage();
+    log.clear();
+    open();
+    EXPECT_TRUE(log.has(c.line)) << c.line;
+    EXPECT_TRUE(
+        log.has("default TALIndexer: Could not find path, creating new textstore at path " + salt));
+    EXPECT_TRUE(log.contains("default TALIndexer: Reset docstore with "));
+    EXPECT_EQ(store->count(nullptr), 0);
+    EXPECT_EQ(search("word"), "");
+    ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
+    EXPECT_EQ(search("word"), "b");
+  }
+}
+
+TEST_F(IndexerTest, AFileInPlaceOfTheIndexIsLeftAloneAndFailsWhatNeedsTheIndex) {
+  const std::string salt = directory / "salt";
+  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+  indexer->shutdown();
+  ASSERT_TRUE(platform::removeItem(salt, nullptr));
+  ASSERT_TRUE(platform::writeFileAtomically(salt, "mine", nullptr));
+  open();
+  EXPECT_TRUE(log.contains("error TALIndexer: Could not create intermediate directory " + salt));
+  EXPECT_EQ(search("word"), "shutting down");
+  EXPECT_EQ(add({mail("b", "word")}), (TLError{"TALIndexer", 1, "index failed"}));
+  EXPECT_EQ(wait([&](auto done) { indexer->saltVacuumAndCompactWithCompletionHandler(done); }),
+            std::nullopt);
+  EXPECT_TRUE(indexer->docStats().is_null());
+  EXPECT_EQ(indexer->saltMetrics(), "");
+  EXPECT_EQ(platform::readFile(salt, 100, nullptr), "mine");
+  EXPECT_EQ(store->count(nullptr), 2);
 }
 
 TEST_F(IndexerTest, ADocumentThatTheStoreLostIsLeftOut) {

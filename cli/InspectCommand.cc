@@ -1,0 +1,189 @@
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <functional>
+#include <nlohmann/json.hpp>
+
+#include "cli/Commands.h"
+#include "cli/Results.h"
+#include "platform/FileDescriptor.h"
+#include "platform/Files.h"
+#include "platform/Paths.h"
+
+// Dump and validate. The text index is the daemon's, so a program of its own reads it,
+// tallow-inspect; here it is run, and what it writes is made fit to be shown.
+namespace cli {
+
+namespace {
+
+constexpr const char* kProgram = "tallow-inspect";
+constexpr size_t kPieceBytes = 64 * 1024;
+
+std::string variable(const char* name) {
+  const char* const value = std::getenv(name);
+  return value == nullptr ? "" : value;
+}
+
+// Where the daemon has its data: as it is told; else, when it is the user's own service, where
+// systemd puts its state, of new and of old; else as the system's service.
+std::string defaultStateDirectory() {
+  if (!variable("STATE_DIRECTORY").empty()) return platform::stateDirectory();
+  const auto homes = {std::pair("XDG_STATE_HOME", ".local/state"),
+                      std::pair("XDG_CONFIG_HOME", ".config")};
+  for (const auto& [name, below] : homes) {
+    std::string base = variable(name);
+    if (base.empty()) base = platform::joinPath(variable("HOME"), below);
+    const std::string own = platform::joinPath(base, "tallow");
+    if (platform::fileExists(platform::processLockPath(own))) return own;
+  }
+  return platform::stateDirectory();
+}
+
+// Beside this program, as it is built, or where it is installed.
+std::string programPath() {
+  std::error_code ignored;
+  const auto bin = std::filesystem::read_symlink("/proc/self/exe", ignored).parent_path();
+  const auto beside = bin / kProgram;
+  return std::filesystem::exists(beside, ignored) ? beside
+                                                  : bin.parent_path() / "libexec/tallow" / kProgram;
+}
+
+// The program at work; ends before this object does.
+class Inspector {
+ public:
+  Inspector() = default;
+  ~Inspector() { end(); }
+  Inspector(const Inspector&) = delete;
+  Inspector& operator=(const Inspector&) = delete;
+
+  // False, with a word, when it cannot be run.
+  [[nodiscard]] bool start(const char* command, const Options& options);
+
+  // Hands out what it writes, in pieces, until its end or until `take` returns false.
+  void read(const std::function<bool(std::string_view)>& take);
+
+  // How it ended, as of waitpid. If it still writes, it ends by SIGPIPE.
+  int end();
+
+ private:
+  pid_t _pid = -1;
+  platform::FileDescriptor _output;
+};
+
+bool Inspector::start(const char* command, const Options& options) {
+  const std::string program = programPath();
+  const std::string state =
+      options.stateDirectory.empty() ? defaultStateDirectory() : options.stateDirectory;
+  const std::array<const char*, 5> arguments{program.c_str(), command, state.c_str(),
+                                             options.protectionClass.c_str(), nullptr};
+  std::array<int, 2> pipe{-1, -1};
+  int result = pipe2(pipe.data(), O_CLOEXEC) == 0 ? 0 : errno;
+  _output = platform::FileDescriptor(pipe[0]);
+  const platform::FileDescriptor input(pipe[1]);
+  if (result == 0) {
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_adddup2(&actions, input.get(), STDOUT_FILENO);
+    posix_spawnattr_t attributes;
+    posix_spawnattr_init(&attributes);
+    sigset_t ending;
+    sigemptyset(&ending);
+    sigaddset(&ending, SIGPIPE);
+    posix_spawnattr_setsigdefault(&attributes, &ending);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
+    result = posix_spawn(&_pid, program.c_str(), &actions, &attributes,
+                         const_cast<char* const*>(arguments.data()), environ);
+    posix_spawnattr_destroy(&attributes);
+    posix_spawn_file_actions_destroy(&actions);
+  }
+  if (result == 0) return true;
+  _pid = -1;
+  complain(platform::posixError(result, program).message);
+  return false;
+}
+
+void Inspector::read(const std::function<bool(std::string_view)>& take) {
+  std::array<char, kPieceBytes> piece;
+  for (;;) {
+    const ssize_t size = ::read(_output.get(), piece.data(), piece.size());
+    if (size < 0 && errno == EINTR) continue;
+    if (size <= 0 || !take({piece.data(), static_cast<size_t>(size)})) return;
+  }
+}
+
+int Inspector::end() {
+  _output.reset();
+  int status = 0;
+  while (_pid > 0 && waitpid(_pid, &status, 0) < 0 && errno == EINTR) {
+  }
+  _pid = -1;
+  return status;
+}
+
+// A corrupt index can end the program by an assertion, which has been told.
+bool metAssertion(int status) {
+  return WIFSIGNALED(status) && WTERMSIG(status) == SIGABRT;
+}
+
+ExitStatus statusOf(int status) {
+  if (WIFEXITED(status)) return static_cast<ExitStatus>(WEXITSTATUS(status));
+  complain(metAssertion(status) ? "the index is corrupt"
+                                : fmt::format("{} ended by signal {}", kProgram, WTERMSIG(status)));
+  return ExitStatus::failure;
+}
+
+std::string outcomeText(const nlohmann::ordered_json& outcome) {
+  std::string text = outcome.value("valid", false) ? "valid\n" : "not valid\n";
+  for (const auto& [key, value] : outcome.items()) {
+    if (key != "valid") text += fmt::format("{:20} {:>14}\n", key, value.dump());
+  }
+  return text;
+}
+
+}  // namespace
+
+ExitStatus runDump(const Options& options) {
+  Inspector inspector;
+  if (!inspector.start("dump", options)) return ExitStatus::failure;
+  std::string lines;
+  bool written = true;
+  inspector.read([&](std::string_view piece) {
+    lines += piece;
+    const size_t whole = lines.rfind('\n') + 1;
+    written =
+        print(cleanLinesForTerminal(std::string_view(lines).substr(0, whole))) == ExitStatus::done;
+    lines.erase(0, whole);
+    return written;
+  });
+  const int status = inspector.end();
+  if (!written) return ExitStatus::failure;
+  return print(cleanLinesForTerminal(lines), statusOf(status));
+}
+
+ExitStatus runValidate(const Options& options) {
+  Inspector inspector;
+  if (!inspector.start("validate", options)) return ExitStatus::failure;
+  std::string text;
+  inspector.read([&text](std::string_view piece) {
+    text += piece;
+    return true;
+  });
+  const int ended = inspector.end();
+  if (metAssertion(ended)) text = R"({"valid": false})";
+  const auto outcome = nlohmann::ordered_json::parse(text, nullptr, false);
+  if (!outcome.is_object()) return statusOf(ended);
+  const bool valid = outcome.value("valid", false);
+  return print(options.format == OutputFormat::json ? outcome.dump(2) + '\n' : outcomeText(outcome),
+               valid ? ExitStatus::done : ExitStatus::nothingFound);
+}
+
+}  // namespace cli

@@ -1,0 +1,95 @@
+#include <fmt/format.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <memory>
+#include <nlohmann/json.hpp>
+#include <string>
+#include <string_view>
+
+#include "platform/Files.h"
+#include "platform/Paths.h"
+#include "platform/ProcessLock.h"
+#include "salt/Inspection.h"
+
+// Looks at the text index of one protection class while no daemon runs on it:
+//
+//   tallow-inspect dump|validate STATE_DIRECTORY CLASS
+//
+// Changes nothing. The result goes to the standard output: the dump as it is, control characters of
+// mail included, and the outcome of the validation as JSON; tallow(1), which runs this program,
+// makes both fit for people. What validation finds is logged to the standard error.
+namespace {
+
+enum ExitStatus : int { kDone = 0, kNotValid = 1, kFailure = 2, kInUse = 3 };
+
+int complain(const std::string& message, ExitStatus status = kFailure) {
+  fmt::print(stderr, "tallow-inspect: {}\n", message);
+  return status;
+}
+
+bool write(std::string_view text) {
+  return std::fwrite(text.data(), 1, text.size(), stdout) == text.size();
+}
+
+int dump(salt::Inspection& inspection) {
+  if (inspection.load() == nullptr) return complain("the index cannot be opened");
+  const bool whole = inspection.dump(write);
+  return std::fflush(stdout) == 0 && whole ? kDone : kFailure;
+}
+
+// A corrupt page ends the process by an assertion.
+int validate(salt::Inspection& inspection) {
+  const salt::Index* const index = inspection.load();
+  const bool valid = index != nullptr && index->Validate();
+  nlohmann::ordered_json outcome{{"valid", valid}};
+  if (index != nullptr) {
+    const salt::Index::Metrics m = index->GetMetrics();
+    outcome.update({{"documents", m.Docs},
+                    {"deletedDocuments", m.DeletedDocs},
+                    {"zones", m.Zones},
+                    {"textBytes", m.TextBytes},
+                    {"suffixes", m.Suffixes},
+                    {"hotSuffixes", m.HotSuffixes},
+                    {"pages", m.Pages},
+                    {"shards", m.Shards}});
+  }
+  if (!write(outcome.dump() + '\n') || std::fflush(stdout) != 0) return kFailure;
+  return valid ? kDone : kNotValid;
+}
+
+// The files as they are while no daemon can start. It may as soon as they are taken hold of: to
+// hold the lock for the whole look would keep the service down.
+std::unique_ptr<salt::Inspection> capture(const std::string& state,
+                                          const std::string& protectionClass, TLErrorOut error) {
+  const auto lock = platform::ProcessLock::acquireShared(platform::processLockPath(state), error);
+  if (lock == nullptr) return nullptr;
+  return salt::Inspection::capture(
+      platform::textIndexPath(platform::dataRoot(state), protectionClass), error);
+}
+
+bool isInUse(const TLError& error) {
+  return error.domain == kPOSIXErrorDomain && error.code == EWOULDBLOCK;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  const std::string_view command = argc == 4 ? argv[1] : "";
+  if (command != "dump" && command != "validate") {
+    return complain("usage: tallow-inspect dump|validate STATE_DIRECTORY CLASS");
+  }
+  const std::string state = argv[2];
+  const std::string protectionClass = argv[3];
+  if (!platform::namesOneDirectory(protectionClass)) {
+    return complain("a protection class must name one directory");
+  }
+  platform::raiseDescriptorLimit();
+  std::optional<TLError> error;
+  const auto inspection = capture(state, protectionClass, &error);
+  if (inspection == nullptr) {
+    if (!isInUse(*error)) return complain(error->message);
+    return complain(error->message + "; stop it first", kInUse);
+  }
+  return command == "dump" ? dump(*inspection) : validate(*inspection);
+}

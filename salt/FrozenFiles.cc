@@ -1,0 +1,154 @@
+#include "salt/FrozenFiles.h"
+
+#include <fcntl.h>
+#include <leveldb/helpers/memenv.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <string_view>
+
+#include "platform/Files.h"
+#include "platform/Paths.h"
+
+namespace salt {
+
+namespace {
+
+// Of a log or a manifest. leveldb begins a new log at some 6 MiB; a larger one is no log of ours.
+constexpr size_t kMaxCopiedBytes = 256 * 1024 * 1024;
+
+bool isNumber(std::string_view text) {
+  return !text.empty() && text.find_first_not_of("0123456789") == std::string_view::npos;
+}
+
+// leveldb's names; files of others are not looked at.
+bool isTable(std::string_view name) {
+  return (name.ends_with(".ldb") || name.ends_with(".sst")) &&
+         isNumber(name.substr(0, name.size() - 4));
+}
+
+bool isCopied(std::string_view name) {
+  constexpr std::string_view kManifest = "MANIFEST-";
+  return name == "CURRENT" ||
+         (name.starts_with(kManifest) && isNumber(name.substr(kManifest.size()))) ||
+         (name.ends_with(".log") && isNumber(name.substr(0, name.size() - 4)));
+}
+
+leveldb::Status refused(const std::string& path) {
+  return leveldb::Status::IOError(path, "frozen");
+}
+
+// Part of a table; the descriptor is another's.
+class TableReader final : public leveldb::RandomAccessFile {
+ public:
+  TableReader(std::string path, int descriptor) : _path(std::move(path)), _descriptor(descriptor) {}
+
+  leveldb::Status Read(uint64_t offset, size_t n, leveldb::Slice* result,
+                       char* scratch) const override {
+    size_t done = 0;
+    while (done < n) {
+      const ssize_t got =
+          pread(_descriptor, scratch + done, n - done, static_cast<off_t>(offset + done));
+      if (got < 0 && errno == EINTR) continue;
+      if (got < 0) {
+        return leveldb::Status::IOError(platform::posixError(errno, _path).message);
+      }
+      if (got == 0) break;
+      done += static_cast<size_t>(got);
+    }
+    *result = leveldb::Slice(scratch, done);
+    return leveldb::Status::OK();
+  }
+
+ private:
+  const std::string _path;
+  const int _descriptor;
+};
+
+}  // namespace
+
+FrozenFiles::FrozenFiles(std::unique_ptr<leveldb::Env> memory)
+    : leveldb::EnvWrapper(memory.get()), _memory(std::move(memory)) {}
+
+std::unique_ptr<FrozenFiles> FrozenFiles::capture(const std::string& directory, TLErrorOut error) {
+  const auto names = platform::listDirectory(directory, error);
+  if (!names) return nullptr;
+  std::unique_ptr<leveldb::Env> memory(leveldb::NewMemEnv(leveldb::Env::Default()));
+  std::unique_ptr<FrozenFiles> files(new FrozenFiles(std::move(memory)));
+  for (const std::string& name : *names) {
+    const std::string path = platform::joinPath(directory, name);
+    if (isTable(name) && !files->addTable(path, error)) return nullptr;
+    if (isCopied(name) && !files->addCopy(path, error)) return nullptr;
+  }
+  return files;
+}
+
+bool FrozenFiles::addTable(const std::string& path, TLErrorOut error) {
+  Table table{platform::FileDescriptor(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK)), 0};
+  struct stat info;
+  if (table.file.get() < 0 || fstat(table.file.get(), &info) != 0) {
+    platform::setError(error, platform::posixError(errno, path));
+    return false;
+  }
+  if (!S_ISREG(info.st_mode)) return true;  // and so none of leveldb's
+  table.size = static_cast<uint64_t>(info.st_size);
+  _tables.emplace(path, std::move(table));
+  return true;
+}
+
+bool FrozenFiles::addCopy(const std::string& path, TLErrorOut error) {
+  const auto bytes = platform::readFile(path, kMaxCopiedBytes, error);
+  return bytes && leveldb::WriteStringToFile(_memory.get(), *bytes, path).ok();
+}
+
+const FrozenFiles::Table* FrozenFiles::table(const std::string& path) {
+  const auto entry = _tables.find(path);
+  return entry == _tables.end() || target()->FileExists(path) ? nullptr : &entry->second;
+}
+
+leveldb::Status FrozenFiles::NewRandomAccessFile(const std::string& path,
+                                                 leveldb::RandomAccessFile** file) {
+  const Table* const frozen = table(path);
+  if (frozen == nullptr) return target()->NewRandomAccessFile(path, file);
+  *file = new TableReader(path, frozen->file.get());
+  return leveldb::Status::OK();
+}
+
+leveldb::Status FrozenFiles::NewWritableFile(const std::string& path,
+                                             leveldb::WritableFile** file) {
+  return mayWrite() ? target()->NewWritableFile(path, file) : refused(path);
+}
+
+leveldb::Status FrozenFiles::NewAppendableFile(const std::string& path,
+                                               leveldb::WritableFile** file) {
+  return mayWrite() ? target()->NewAppendableFile(path, file) : refused(path);
+}
+
+bool FrozenFiles::FileExists(const std::string& path) {
+  return table(path) != nullptr || target()->FileExists(path);
+}
+
+leveldb::Status FrozenFiles::GetChildren(const std::string& directory,
+                                         std::vector<std::string>* names) {
+  const leveldb::Status status = target()->GetChildren(directory, names);
+  for (const auto& [path, frozen] : _tables) {
+    if (table(path) != nullptr) names->push_back(path.substr(path.rfind('/') + 1));
+  }
+  return status;
+}
+
+// A table that is removed is only one that is not used any more; it stays.
+leveldb::Status FrozenFiles::RemoveFile(const std::string& path) {
+  return table(path) != nullptr ? leveldb::Status::OK() : target()->RemoveFile(path);
+}
+
+leveldb::Status FrozenFiles::GetFileSize(const std::string& path, uint64_t* size) {
+  const Table* const frozen = table(path);
+  if (frozen == nullptr) return target()->GetFileSize(path, size);
+  *size = frozen->size;
+  return leveldb::Status::OK();
+}
+
+}  // namespace salt

@@ -1,0 +1,255 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <nlohmann/json.hpp>
+
+#include "cli/Terminal.h"
+#include "client/SearchServiceProxy.h"
+#include "platform/Files.h"
+#include "platform/Paths.h"
+#include "platform/ProcessLock.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/TemporaryDirectory.h"
+
+// The client and the program that it runs, on an index that the test has made.
+namespace {
+
+namespace fs = std::filesystem;
+using testing::HasSubstr;
+using testing::StartsWith;
+
+class InspectTest : public testing::Test {
+ protected:
+  InspectTest() {
+    // What a daemon that ran here has left.
+    static_cast<void>(platform::ProcessLock::acquire(platform::processLockPath(state), nullptr));
+    platform::createDirectories(platform::joinPath(platform::dataRoot(state), "default"), nullptr);
+  }
+
+  // Runs `command` on the state with the client before it; keeps the output.
+  int run(const std::string& command) { return shell(client + command); }
+  int shell(const std::string& command) {
+    const std::string redirected =
+        "( " + command + " ) >" + directory / "out" + " 2>" + directory / "err";
+    const int status = std::system(redirected.c_str());
+    output = readAll(directory / "out");
+    errors = readAll(directory / "err");
+    return WEXITSTATUS(status);
+  }
+
+  static std::string readAll(const std::string& path) {
+    return platform::readFile(path, size_t{1} << 30, nullptr).value_or("(no file)");
+  }
+
+  // All files of the state, with their contents.
+  [[nodiscard]] std::map<std::string, std::string> files() const {
+    std::map<std::string, std::string> all;
+    for (const auto& entry : fs::recursive_directory_iterator(state)) {
+      all[entry.path()] = entry.is_regular_file() ? readAll(entry.path()) : "";
+    }
+    return all;
+  }
+
+  // One zone of 8 words and one page, of the given suffixes of it.
+  void makeIndex(const std::vector<salt::SuffixMeta>& page) const {
+    auto made = salttest::newIndex(index);
+    ASSERT_TRUE(salttest::addZone(*made, 1, 1, "aa ab ba abcd", {}));
+    const std::string first = made->GetSuffixText(page.front());
+    made.reset();
+    salttest::writePage(index, 1, first, page);
+  }
+  void makeLargeIndex() const {
+    const auto made = salttest::newIndex(index);
+    std::string text;
+    while (text.size() < 20000) text += "word ";
+    for (uint32_t docID = 1; docID <= 5; ++docID) {
+      ASSERT_TRUE(salttest::addZone(*made, docID, 1, text, salttest::wordOffsets(text)));
+    }
+  }
+
+  testsupport::TemporaryDirectory directory;
+  const std::string state = directory / "state";
+  const std::string index = platform::textIndexPath(platform::dataRoot(state), "default");
+  const std::string client = TALLOW_PROGRAM " --state-dir " + state + " ";
+  std::string output;
+  std::string errors;
+};
+
+const salt::SuffixMeta kFirst{1, 0, 1, 0, {}};
+const salt::SuffixMeta kSecond{1, 3, 1, 1, {'b', ' '}};
+
+}  // namespace
+
+TEST_F(InspectTest, DumpsWhatTheIndexDumpsAndChangesNothing) {
+  makeIndex({kFirst, kSecond});
+  std::string dump;
+  {
+    const auto made = salttest::loadIndex(index);
+    ASSERT_TRUE(salttest::addZone(*made, 2, 4, "\x1b[31m red \xe4\xba\xac\xe9\x83\xbd", {0, 6}));
+    ASSERT_TRUE(salttest::addZone(*made, 3, 4, "fifteen bytes..\xe4\xba\xac", {0}));
+    ASSERT_TRUE(made->DeleteDoc(2));
+    dump = made->Dump();
+  }
+  platform::writeFileAtomically(index + "/notes.log", "a log of another kind", nullptr);
+  platform::createDirectories(index + "/999999.ldb/000001.log", nullptr);
+  const auto before = files();
+  EXPECT_EQ(run("dump"), 0) << errors;
+  EXPECT_EQ(output, cli::cleanLinesForTerminal(dump));
+  EXPECT_THAT(output, HasSubstr("---- [2,4:0]: \"\uFFFD[31m red \u4eac\u90fd\"\n"));
+  EXPECT_EQ(run("validate"), 0) << errors;
+  EXPECT_EQ(errors, "");
+  EXPECT_EQ(files(), before);
+}
+
+TEST_F(InspectTest, AReaderThatGoesAwayEndsTheDump) {
+  makeLargeIndex();
+  EXPECT_EQ(shell("{ " + client + "dump; echo $? >&2; } | head -n 1"), 0);
+  EXPECT_EQ(output, "SALT INDEX METRICS\n");
+  EXPECT_EQ(errors, "2\n");
+}
+
+TEST_F(InspectTest, ValidateTellsEachFault) {
+  const auto page = [this] { makeIndex({kFirst, kSecond}); };
+  const std::string pageKey(
+      "\x01"
+      "aa ab ba abcd\0\x01\0\x01",
+      18);
+  const std::string shortPage("\x02", 1);
+  const std::string otherOptions(48, '\0');
+  const struct {
+    std::function<void()> make;
+    int status;
+    std::string line;
+    int dumpStatus;
+  } cases[] = {
+      {page, 0, "", 0},
+      {[&] {
+         makeIndex({kSecond, kFirst});
+       },
+       1, "SALT Validation failed: Out of order.", 0},
+      {[&] {
+         page();
+         salttest::editMetrics(index, [](auto& m) { m.Pages = m.Suffixes = 9; });
+       },
+       0, "SALT Validation failed: # of suffixes: 2 != 9.", 0},
+      {[&] {
+         page();
+         salttest::editMetrics(index, [](auto& m) { m.CodeVersion = 305; });
+       },
+       1, "SALT Loading failure: Mismatched code version.", 2},
+      {[&] {
+         page();
+         salttest::editKey(index, pageKey, &shortPage);
+       },
+       1, "Assertion failed: s.size()", 2},
+      {[&] {
+         page();
+         salttest::editKey(index, "\xFFOPTIONS", &otherOptions);
+       },
+       1, "Assertion failed: op.Valid()", 2},
+  };
+  for (const auto& c : cases) {
+    c.make();
+    const auto before = files();
+    EXPECT_EQ(run("validate"), c.status) << c.line;
+    EXPECT_THAT(output, StartsWith(c.status == 0 ? "valid\n" : "not valid\n"));
+    EXPECT_THAT(errors, HasSubstr(c.line));
+    EXPECT_EQ(run("validate --format=json"), c.status) << c.line;
+    EXPECT_EQ(nlohmann::json::parse(output).at("valid"), c.status == 0);
+    EXPECT_EQ(run("dump"), c.dumpStatus) << c.line;
+    EXPECT_EQ(files(), before) << c.line;
+  }
+}
+
+TEST_F(InspectTest, CountsWhatItFinds) {
+  makeIndex({kFirst, kSecond});
+  {
+    const auto made = salttest::loadIndex(index);
+    ASSERT_TRUE(salttest::addZone(*made, 2, 4, "gone"));
+    ASSERT_TRUE(made->DeleteDoc(2));
+  }
+  EXPECT_EQ(run("validate --format=json"), 0);
+  EXPECT_EQ(nlohmann::json::parse(output),
+            nlohmann::json::parse(R"({"valid": true, "documents": 1, "deletedDocuments": 1,
+                "zones": 1, "textBytes": 13, "suffixes": 3, "hotSuffixes": 1, "pages": 1,
+                "shards": 1})"));
+}
+
+TEST_F(InspectTest, ALiveIndexIsRefused) {
+  makeIndex({kFirst});
+  {
+    testsupport::DaemonProcess daemon(directory.path());
+    ASSERT_TRUE(daemon.ready());
+    const auto before = files();
+    for (const char* command : {"dump", "validate", "validate --class other"}) {
+      EXPECT_EQ(run(command), 3) << command;
+      EXPECT_EQ(output, "");
+      EXPECT_THAT(errors, HasSubstr("tallowsearchd.lock is held by a running daemon"));
+    }
+    EXPECT_EQ(files(), before);
+    daemon.signal(SIGKILL);
+    daemon.wait();
+  }
+  EXPECT_EQ(run("validate"), 0);
+}
+
+// A look in progress holds nothing up: a daemon may start, and what it does to the index is not
+// seen.
+TEST_F(InspectTest, ADaemonThatStartsMeanwhileIsNotHeldUpNorSeen) {
+  makeLargeIndex();
+  const std::string dump = salttest::loadIndex(index)->Dump();
+  FILE* const pipe = popen((TALLOW_INSPECT_PROGRAM " dump " + state + " default").c_str(), "r");
+  std::string text(1, static_cast<char>(fgetc(pipe)));
+  {
+    const testsupport::DaemonProcess daemon(directory.path());
+    ASSERT_TRUE(daemon.ready());
+    client::SearchServiceProxy service(daemon.runtimeDirectory());
+    ASSERT_TRUE(service.deleteAllItems("test", "default", nullptr));
+  }
+  EXPECT_NE(salttest::loadIndex(index)->Dump(), dump);
+  char piece[4096];
+  while (const size_t size = fread(piece, 1, sizeof piece, pipe)) text.append(piece, size);
+  EXPECT_EQ(pclose(pipe), 0);
+  EXPECT_EQ(text, dump);
+}
+
+TEST_F(InspectTest, FindsTheStateOfTheDaemonByItself) {
+  makeIndex({kFirst});
+  for (const char* base : {"state-home", "config-home", "home/.local/state", "home/.config"}) {
+    platform::createDirectories(directory / base, nullptr);
+    fs::create_directory_symlink(state, directory / base + "/tallow");
+  }
+  const std::string elsewhere = "HOME=" + directory / "no" + " XDG_STATE_HOME= XDG_CONFIG_HOME= ";
+  const std::string places[] = {
+      elsewhere + "STATE_DIRECTORY=" + state,
+      elsewhere + "XDG_STATE_HOME=" + directory / "state-home",
+      elsewhere + "XDG_CONFIG_HOME=" + directory / "config-home",
+      elsewhere + "HOME=" + directory / "home",
+  };
+  for (const std::string& place : places) {
+    EXPECT_EQ(shell("env -u STATE_DIRECTORY " + place + " " TALLOW_PROGRAM " validate"), 0)
+        << place << errors;
+  }
+}
+
+TEST_F(InspectTest, NothingIsMadeWhereNothingIs) {
+  makeIndex({kFirst});
+  const auto before = files();
+  for (const char* command : {"validate", "dump"}) {
+    EXPECT_EQ(run(command + std::string(" --class none")), 2);
+    EXPECT_THAT(errors, HasSubstr("none/salt: No such file or directory"));
+    EXPECT_EQ(run(command + std::string(" --class ../TallowSearch/default")), 2);
+    EXPECT_THAT(errors, HasSubstr("must name one directory"));
+    EXPECT_EQ(shell(TALLOW_PROGRAM " --state-dir " + (directory / "none ") + command), 2);
+    EXPECT_THAT(errors, HasSubstr("tallowsearchd.lock: No such file or directory"));
+  }
+  EXPECT_EQ(run("dump --format=json"), 2);
+  EXPECT_EQ(files(), before);
+  EXPECT_FALSE(platform::fileExists(directory / "none"));
+}

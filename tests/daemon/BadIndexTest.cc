@@ -1,0 +1,169 @@
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <sstream>
+
+#include "client/DebugServiceProxy.h"
+#include "platform/Files.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/daemon/DaemonSupport.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/TemporaryDirectory.h"
+
+// A class whose index is damaged or whose disk is full, and one beside it.
+namespace {
+
+namespace fs = std::filesystem;
+using testsupport::DaemonProcess;
+using testsupport::mails;
+using testsupport::search;
+
+class BadIndexTest : public testing::Test {
+ protected:
+  BadIndexTest() {
+    DaemonProcess daemon(directory.path());
+    client::SearchServiceProxy service(daemon.runtimeDirectory());
+    for (const char* protectionClass : {"bad", "good"}) {
+      EXPECT_TRUE(service.indexItems(mails("a", 10), "test", protectionClass, nullptr));
+    }
+    end(daemon);
+    fs::copy(root, kept, fs::copy_options::recursive);
+  }
+
+  static void end(DaemonProcess& daemon) {
+    daemon.signal(SIGTERM);
+    EXPECT_EQ(daemon.wait(), 0);
+  }
+  // Puts the data back as it was before all damage.
+  void restore() const {
+    fs::remove_all(root);
+    fs::copy(kept, root, fs::copy_options::recursive);
+  }
+  void makeFile(const std::string& path) const {
+    fs::remove_all(path);
+    ASSERT_TRUE(platform::writeFileAtomically(path, "a file", nullptr));
+  }
+  void editOptions(const std::function<void(salt::Index::Options&)>& edit) const {
+    salt::Index::Options options;
+    edit(options);
+    std::ostringstream bytes;
+    ASSERT_TRUE(options.SerializeToOstream(bytes));
+    const std::string value = bytes.str();
+    salttest::editKey(index, "\xFFOPTIONS", &value);
+  }
+  // Turns the first byte of each table round.
+  void damageTables() const {
+    salttest::loadIndex(index).reset();  // from the log into a table
+    for (const auto& entry : fs::directory_iterator(index)) {
+      if (entry.path().extension() != ".ldb") continue;
+      std::fstream file(entry.path(), std::ios::in | std::ios::out | std::ios::binary);
+      const int byte = file.get();
+      file.seekp(0);
+      file.put(static_cast<char>(~byte));
+    }
+  }
+
+  testsupport::TemporaryDirectory directory;
+  const std::string root = directory / "state/TallowSearch";
+  const std::string kept = directory / "kept";
+  const std::string index = root + "/bad/salt";
+};
+
+}  // namespace
+
+TEST_F(BadIndexTest, DamageOfOneClassLeavesTheOtherAlone) {
+  const struct {
+    std::function<void()> damage;
+    int64_t results;  // or the code of the error
+    std::string line;
+  } cases[] = {
+      {[&] { salttest::editMetrics(index, [](auto& m) { m.CodeVersion = 303; }); }, 0,
+       "SALT Loading failure: Mismatched code version."},
+      {[&] { damageTables(); }, 0, "SALT Error scanning index: Corruption: corrupted"},
+      {[&] { makeFile(index); }, 4, "TALIndexer Could not create intermediate directory"},
+      {[&] { makeFile(root + "/bad"); }, 17, "Could not create bad protected directory"},
+  };
+  for (const auto& c : cases) {
+    restore();
+    c.damage();
+    DaemonProcess daemon(directory.path());
+    client::SearchServiceProxy service(daemon.runtimeDirectory());
+    EXPECT_EQ(search(service, "a", "bad"), c.results) << c.line;
+    EXPECT_EQ(search(service, "a", "good"), 10) << c.line;
+    EXPECT_TRUE(daemon.waitForLog(c.line));
+    EXPECT_TRUE(service.indexItems(mails("b", 1), "test", "good", nullptr));
+    EXPECT_EQ(search(service, "word", "good"), 11) << c.line;
+    end(daemon);
+  }
+}
+
+TEST_F(BadIndexTest, WhatEndsTheProcessLeavesTheOtherClassSoundForTheNext) {
+  const std::string page("\x02", 1);
+  const struct {
+    std::function<void()> damage;
+    std::string line;
+  } cases[] = {
+      {[&] { editOptions([](auto& op) { op.MaxShards = 0; }); }, "Assertion failed: op.Valid()"},
+      {[&] {
+         salttest::writePage(index, 1, "a", {{1, 0, 1, 0, {}}});
+         salttest::editKey(index,
+                           std::string("\x01"
+                                       "a\0\x01\0\x01",
+                                       6),
+                           &page);
+       },
+       "Assertion failed: s.size()"},
+  };
+  for (const auto& c : cases) {
+    restore();
+    c.damage();
+    {
+      DaemonProcess daemon(directory.path());
+      client::SearchServiceProxy service(daemon.runtimeDirectory());
+      EXPECT_EQ(search(service, "a", "good"), 10);
+      EXPECT_TRUE(service.indexItems(mails("b", 1), "test", "good", nullptr));
+      EXPECT_NE(search(service, "a", "bad"), 0);
+      EXPECT_EQ(daemon.wait(), 128 + SIGABRT);
+      EXPECT_NE(daemon.log().find(c.line), std::string::npos) << c.line;
+    }
+    DaemonProcess daemon(directory.path());
+    client::SearchServiceProxy service(daemon.runtimeDirectory());
+    EXPECT_EQ(search(service, "word", "good"), 11) << c.line;
+    end(daemon);
+  }
+}
+
+// The disk is full for files above a limit that the merge passes and nothing else does.
+TEST_F(BadIndexTest, AFullDiskInAMergeLosesNothing) {
+  constexpr rlim_t kMostBytes = 64 * 1024;
+  signal(SIGXFSZ, SIG_IGN);  // which the daemon inherits
+  editOptions([](auto& op) { op.MaxHotSuffixes = 4000; });
+  {
+    DaemonProcess daemon(directory.path());
+    client::SearchServiceProxy service(daemon.runtimeDirectory());
+    client::DebugServiceProxy debug(daemon.runtimeDirectory());
+    EXPECT_EQ(search(service, "a", "bad"), 10);
+    rlimit limit{kMostBytes, RLIM_INFINITY};
+    ASSERT_EQ(prlimit(daemon.pid(), RLIMIT_FSIZE, &limit, nullptr), 0);
+    EXPECT_TRUE(debug.forceVacuumAndCompact("bad", nullptr));
+    EXPECT_TRUE(daemon.waitForLog("SALT Error writing to db: IO error"));
+    EXPECT_EQ(search(service, "a", "bad"), 10);
+    EXPECT_EQ(search(service, "a", "good"), 10);
+    end(daemon);
+  }
+  DaemonProcess daemon(directory.path());
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  client::DebugServiceProxy debug(daemon.runtimeDirectory());
+  EXPECT_EQ(search(service, "a", "bad"), 10);
+  EXPECT_TRUE(debug.forceVacuumAndCompact("bad", nullptr));
+  EXPECT_TRUE(service.indexItems(mails("b", 1), "test", "bad", nullptr));
+  EXPECT_EQ(search(service, "word", "bad"), 11);
+  end(daemon);
+  const auto merged = salttest::loadIndex(index);
+  EXPECT_TRUE(merged->Validate());
+  EXPECT_GT(merged->GetMetrics().Pages, 0u);
+}
