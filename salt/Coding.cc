@@ -118,11 +118,10 @@ void valueToPage(std::string_view s, const Index::OptionsBlock& op,
   }
 }
 
-void appendPlaces(std::string_view s, const Index::OptionsBlock& op, std::vector<Place>* places) {
+void readPlaces(std::string_view s, const Index::OptionsBlock& op, std::vector<Place>* places) {
   const size_t size = readPageSize(s, op);
-  const size_t before = places->size();
-  places->resize(before + size);
-  Place* const p = places->data() + before;
+  places->resize(size);
+  Place* const p = places->data();
   readColumn(s, size, [p](size_t i, uint32_t value) { p[i].DocID = value; });
   readColumn(s, size, [p](size_t i, uint32_t value) { p[i].ZoneID = uint16_t(value); });
 }

@@ -48,9 +48,8 @@ void pageToValue(const SuffixMeta* metas, size_t count, std::string* value);
 void valueToPage(std::string_view value, const Index::OptionsBlock& op,
                  std::vector<SuffixMeta>* metas);
 
-// Appends what the page's suffixes are of; the columns behind are not read.
-void appendPlaces(std::string_view value, const Index::OptionsBlock& op,
-                  std::vector<Place>* places);
+// Where the page's suffixes stand; the columns behind are not read.
+void readPlaces(std::string_view value, const Index::OptionsBlock& op, std::vector<Place>* places);
 
 // Key of a zone's text: 0xFF, decimal DocID, ",", decimal ZoneID.
 class TextKey {

@@ -194,6 +194,7 @@ bool index::DeleteDoc(uint32_t docID) {
   after.insert({docID});
   platform::MutexLock metricsLock(_metricsMutex);
   _deleted = std::make_shared<const DeletedDocs>(std::move(after));
+  ++_pageGeneration;
   return true;
 }
 

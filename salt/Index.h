@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <functional>
 #include <iosfwd>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -165,12 +166,13 @@ class Index {
   // The stored metrics and one line per suffix, deleted ones included.
   [[nodiscard]] virtual std::string Dump() const = 0;
 
-  // ScanPrefix for those who look at documents and zones alone: calls `callback` with runs of
-  // matching suffixes, `count` of them, above 0, and `limit` in all at most. The places live for
-  // the call. Of a scan that the callback stops, the metrics count whole runs.
-  virtual bool ScanPlaces(
-      std::string_view prefix, size_t limit,
-      const std::function<bool(const Place* places, size_t count)>& callback) const = 0;
+  // ScanPrefix for those who ask in which zones of which documents there is a match: calls
+  // `callback` with runs of places, in any order, each place once or more; they live for the call.
+  // The result is the number of matching suffixes. Null, and no call, when there might be more than
+  // `limit`: then only ScanPrefix can tell which come first.
+  virtual std::optional<uint64_t> ScanPlaces(
+      std::string_view prefix, uint64_t limit,
+      const std::function<void(const Place* places, size_t count)>& callback) const = 0;
 };
 
 // Makes a new index in the directory `options.Path`; what was there is removed. Never null: a

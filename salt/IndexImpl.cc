@@ -185,6 +185,7 @@ IndexView::IndexView(const index& owner, bool fillCache) : idx(owner) {
   iterator.reset(owner.db->NewIterator(options));
   metrics = owner.metrics;
   deleted = owner._deleted;
+  pageGeneration = owner._pageGeneration;
 }
 
 uint8_t IndexView::lastShard() const {

@@ -15,10 +15,12 @@
 #include "salt/Database.h"
 #include "salt/DocTable.h"
 #include "salt/Index.h"
+#include "salt/ScanMemory.h"
 
 namespace salt {
 
 class IndexView;
+class PlaceSet;
 struct ScanCounts;
 
 struct DeletedDoc {
@@ -65,9 +67,9 @@ class index final : public Index {
   void ResetScanMetrics() override;
   [[nodiscard]] bool Validate() const override;
   [[nodiscard]] std::string Dump() const override;
-  bool ScanPlaces(
-      std::string_view prefix, size_t limit,
-      const std::function<bool(const Place* places, size_t count)>& callback) const override;
+  std::optional<uint64_t> ScanPlaces(
+      std::string_view prefix, uint64_t limit,
+      const std::function<void(const Place* places, size_t count)>& callback) const override;
 
   // The text of Dump, in pieces of some 64 KiB. `sink` returns false to stop. False when it did,
   // or, with a log line, when reading failed.
@@ -141,6 +143,7 @@ class index final : public Index {
   // False, with a log line, when the loaded counters cannot be those of a sound index.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
 
+  void remember(std::string_view prefix, const IndexView& view, const PlaceSet& pages) const;
   void countScan(Clock::time_point start, const ScanCounts& counts) const
       TL_EXCLUDES(_metricsMutex);
   void forEachZone(const IndexView& view,
@@ -173,6 +176,10 @@ class index final : public Index {
   // moment. A deletion writes the whole set anyway.
   std::shared_ptr<const DeletedDocs> _deleted TL_GUARDED_BY(_metricsMutex);
 
+  // Counts what changes the pages or hides documents in them: commits of merges and deletions.
+  uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
+  mutable ScanMemory _scanMemory;  // synchronised by itself
+
   // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is
   // taken with no other held.
   platform::Mutex _mergeThreadMutex;
@@ -203,6 +210,7 @@ class IndexView {
   std::unique_ptr<leveldb::Iterator> iterator;  // never null
   Index::Metrics metrics;
   std::shared_ptr<const DeletedDocs> deleted;
+  uint64_t pageGeneration = 0;
 };
 
 }  // namespace salt

@@ -2,6 +2,7 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
+#include "salt/PlaceSet.h"
 #include "salt/Suffix.h"
 
 // The reading half of the index.
@@ -17,33 +18,49 @@ struct ScanCounts {
 
 namespace {
 
-// Hot suffixes that go to the callback together.
-constexpr size_t kHotRun = 256;
-
-using PlaceCallback = std::function<bool(const Place* places, size_t count)>;
-
 // A scan of all shards for one prefix, cut already.
 class PrefixScan {
  public:
   PrefixScan(const IndexView& view, std::string_view prefix)
       : _view(view), _prefix(prefix), _cursor(view, 0) {}
 
-  // Calls visit() with the cursor on each shard's first suffix from the prefix on, until it returns
+  // Calls `callback` for each suffix, until it returns false or a read fails.
+  void suffixes(const std::function<bool(const SuffixMeta&)>& callback) {
+    for (unsigned shard = 0; shard <= _view.lastShard(); ++shard) {
+      if (!visitShard(shard, [&] { return visitSuffixes(callback); })) return;
+    }
+  }
+
+  void hotPlaces(PlaceSet* places) {
+    visitShard(0, [&] { return visitHotPlaces(places); });
+  }
+
+  // False when a read has failed.
+  bool pagePlaces(PlaceSet* places) {
+    bool good = true;
+    for (unsigned shard = 1; good && shard <= _view.lastShard(); ++shard) {
+      good = visitShard(shard, [&] { return visitPagePlaces(places); });
+    }
+    return good;
+  }
+
+  ScanCounts counts;
+
+ private:
+  // Calls visit() with the cursor on the first suffix from the prefix on. False when that returns
   // false or a read fails.
   template <typename Visit>
-  void overShards(const Visit& visit) {
-    bool goOn = true;
-    for (unsigned shard = 0; goOn && shard <= _view.lastShard(); ++shard) {
-      _cursor.moveTo(static_cast<uint8_t>(shard));
-      _cursor.seek(_prefix);
-      goOn = visit();
-      if (const leveldb::Status status = _cursor.iterator->status(); !status.ok()) {
-        Log.error("Error scanning index: {}", status.ToString());
-        return;
-      }
-      (shard == 0 ? counts.hotReads : counts.pageReads) += _cursor.loads;
-      counts.fetches += _cursor.suffix.fetches;
+  bool visitShard(unsigned shard, const Visit& visit) {
+    _cursor.moveTo(static_cast<uint8_t>(shard));
+    _cursor.seek(_prefix);
+    const bool goOn = visit();
+    if (const leveldb::Status status = _cursor.iterator->status(); !status.ok()) {
+      Log.error("Error scanning index: {}", status.ToString());
+      return false;
     }
+    (shard == 0 ? counts.hotReads : counts.pageReads) += _cursor.loads;
+    counts.fetches += _cursor.suffix.fetches;
+    return goOn;
   }
 
   bool visitSuffixes(const std::function<bool(const SuffixMeta&)>& callback) {
@@ -55,57 +72,50 @@ class PrefixScan {
     return true;
   }
 
-  bool visitPlaces(size_t limit, const PlaceCallback& callback) {
-    _limit = limit;
-    return _cursor.shard == 0 ? visitHotPlaces(callback) : visitPagePlaces(callback);
-  }
-
-  ScanCounts counts;
-
- private:
-  bool matches() { return _cursor.valid && _cursor.suffix.compareWithPrefix(_prefix) == 0; }
-
-  bool visitHotPlaces(const PlaceCallback& callback) {
-    for (; matches(); _cursor.next()) {
-      const SuffixMeta& meta = _cursor.suffix.meta;
-      _places.push_back({meta.DocID, meta.ZoneID});
-      if (_places.size() == kHotRun && !deliver(callback)) return false;
-    }
-    return deliver(callback);
+  bool visitHotPlaces(PlaceSet* places) {
+    for (; matches(); _cursor.next()) add(_cursor.suffix.meta, places);
+    return true;
   }
 
   // Within a page a suffix matches as long as it shares the whole prefix with the one before. When
   // the next page begins with a match, all of this one are matches, and most of its columns need no
   // look.
-  bool visitPagePlaces(const PlaceCallback& callback) {
+  bool visitPagePlaces(PlaceSet* places) {
     if (!matches()) return true;
-    if (!addMatches(_cursor.pos)) return deliver(callback);
-    bool more = nextPageMatches();
-    while (deliver(callback)) {
-      if (!more) return true;
+    bool more = addMatches(_cursor.pos, places) && nextPageMatches();
+    while (more) {
       ++_cursor.loads;
       _page = view(_cursor.iterator->value());
       more = nextPageMatches();
       if (more) {
-        appendPlaces(_page, _view.idx.op, &_places);
+        readPlaces(_page, _view.idx.op, &_places);
+        for (const Place& place : _places) add(place, places);
       } else {
         valueToPage(_page, _view.idx.op, &_cursor.metas);
-        addMatches(0);
+        addMatches(0, places);
       }
     }
-    return false;
+    return true;
   }
 
   // Adds the cursor's suffixes from `first`, which matches, to the last that does. True when that
   // is the last of the page.
-  bool addMatches(size_t first) {
+  bool addMatches(size_t first, PlaceSet* places) {
     const std::vector<SuffixMeta>& metas = _cursor.metas;
     size_t at = first;
     for (; at < metas.size() && (at == first || metas[at].lcp >= _prefix.size()); ++at) {
-      _places.push_back({metas[at].DocID, metas[at].ZoneID});
+      add(metas[at], places);
     }
     return at == metas.size();
   }
+
+  template <typename Standing>
+  void add(const Standing& at, PlaceSet* places) const {
+    if (_view.deleted->contains(at.DocID)) return;
+    places->add({at.DocID, at.ZoneID});
+  }
+
+  bool matches() { return _cursor.valid && _cursor.suffix.compareWithPrefix(_prefix) == 0; }
 
   // Steps the iterator, and the iterator alone.
   bool nextPageMatches() {
@@ -117,23 +127,9 @@ class PrefixScan {
            key.substr(1, _prefix.size()) == _prefix;
   }
 
-  // Hands the places of live documents over.
-  bool deliver(const PlaceCallback& callback) {
-    if (_view.deleted->size() != 0) {
-      std::erase_if(_places, [&](const Place& p) { return _view.deleted->contains(p.DocID); });
-    }
-    if (_places.empty()) return true;
-    const size_t count = std::min<size_t>(_places.size(), _limit - counts.results);
-    counts.results += count;
-    const bool goOn = callback(_places.data(), count) && counts.results < _limit;
-    _places.clear();
-    return goOn;
-  }
-
   const IndexView& _view;
   const std::string_view _prefix;
   ShardCursor _cursor;
-  size_t _limit = 0;
   std::vector<Place> _places;
   std::string _page;
 };
@@ -145,20 +141,42 @@ bool index::ScanPrefix(std::string_view prefix,
   const auto start = Clock::now();
   const IndexView view(*this, true);
   PrefixScan scan(view, prefix.substr(0, suffixLength(prefix, op)));
-  scan.overShards([&] { return scan.visitSuffixes(callback); });
+  scan.suffixes(callback);
   countScan(start, scan.counts);
   return true;
 }
 
-bool index::ScanPlaces(
-    std::string_view prefix, size_t limit,
-    const std::function<bool(const Place* places, size_t count)>& callback) const {
+std::optional<uint64_t> index::ScanPlaces(
+    std::string_view prefix, uint64_t limit,
+    const std::function<void(const Place* places, size_t count)>& callback) const {
   const auto start = Clock::now();
   const IndexView view(*this, true);
-  PrefixScan scan(view, prefix.substr(0, suffixLength(prefix, op)));
-  scan.overShards([&] { return scan.visitPlaces(limit, callback); });
+  if (view.metrics.Suffixes > limit) return std::nullopt;
+  prefix = prefix.substr(0, suffixLength(prefix, op));
+  PrefixScan scan(view, prefix);
+  PlaceSet hot;
+  scan.hotPlaces(&hot);
+  hot.deliver(callback);
+  scan.counts.results = hot.suffixes();
+  if (const auto known = _scanMemory.find(prefix, view.pageGeneration)) {
+    PlaceSet::deliver(known->places, callback);
+    scan.counts.results += known->suffixes;
+  } else {
+    PlaceSet pages;
+    const bool complete = scan.pagePlaces(&pages);
+    pages.deliver(callback);
+    scan.counts.results += pages.suffixes();
+    if (complete && !view.metrics.VacuumInProgress) remember(prefix, view, pages);
+  }
   countScan(start, scan.counts);
-  return true;
+  return scan.counts.results;
+}
+
+void index::remember(std::string_view prefix, const IndexView& view, const PlaceSet& pages) const {
+  ScanMemory::Found found{pages.suffixes(), pages.encode()};
+  if (found.places.empty()) return;
+  _scanMemory.keep(prefix, view.pageGeneration,
+                   std::make_shared<const ScanMemory::Found>(std::move(found)));
 }
 
 void index::countScan(Clock::time_point start, const ScanCounts& counts) const {

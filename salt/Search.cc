@@ -103,14 +103,14 @@ class TermRun {
     for (size_t t = 0; t < _term.tokens.size(); ++t) {
       _tokenScore = _term.tokenScores[t];
       _noNewDocs = refusesNewDocs(t);
-      _candidates.forgetSeen();
-      const size_t limit = left() + (left() < SIZE_MAX);  // the one too many ends the scan
-      index.ScanPlaces(_term.tokens[t], limit, [&](const salt::Place* places, size_t count) {
-        _term.found = true;
-        if (!nothingCanChange(t)) take(places, std::min(count, left()));
-        _suffixes += count;
-        return _suffixes <= _options.maxSuffixes && !nothingCanChange(t);
-      });
+      if (nothingCanChange(t)) {
+        index.ScanPrefix(_term.tokens[t], [this](const salt::SuffixMeta&) {
+          _term.found = true;
+          return false;
+        });
+        return;
+      }
+      scan(index, _term.tokens[t]);
     }
   }
 
@@ -142,22 +142,40 @@ class TermRun {
     return _unmatched * best * _zoneBound < _need;
   }
 
+  void scan(const salt::Index& index, const std::string& token) {
+    const auto suffixes =
+        index.ScanPlaces(token, left(), [this](const salt::Place* places, size_t count) {
+          for (const salt::Place* place = places; place != places + count; ++place) {
+            take(place->DocID, place->ZoneID);
+          }
+        });
+    if (suffixes) {
+      _term.found = _term.found || *suffixes != 0;
+      _suffixes += *suffixes;
+      return;
+    }
+    index.ScanPrefix(token, [this](const salt::SuffixMeta& meta) {
+      ++_suffixes;
+      _term.found = true;
+      if (_suffixes > _options.maxSuffixes) return false;
+      take(meta.DocID, meta.ZoneID);
+      return true;
+    });
+  }
+
   // Suffixes that the term may still take.
   [[nodiscard]] size_t left() const {
     return _options.maxSuffixes - std::min(_options.maxSuffixes, _suffixes);
   }
 
-  void take(const salt::Place* places, size_t count) {
-    for (const salt::Place* place = places; place != places + count; ++place) {
-      const uint32_t bit = _zoneBits.of(place->ZoneID);
-      Candidates::Slot& slot = _candidates[place->DocID];
-      if ((bit & ~slot.seen) == 0) continue;
-      slot.seen |= bit;
-      if (slot.place != 0) {
-        match(&_candidates.candidate(slot), bit);
-      } else if (!_noNewDocs) {
-        _candidates.add(&slot, {place->DocID, bit, _unmatched, _tokenScore});
-      }
+  // Once for a place, or again: the second time changes nothing.
+  void take(uint32_t docID, uint16_t zoneID) {
+    const uint32_t bit = _zoneBits.of(zoneID);
+    if (bit == 0) return;
+    if (DocResult* const known = _candidates.find(docID)) {
+      match(known, bit);
+    } else if (!_noNewDocs) {
+      _candidates.add({docID, bit, _unmatched, _tokenScore});
     }
   }
 

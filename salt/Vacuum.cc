@@ -101,6 +101,7 @@ bool index::commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t 
   if (metrics.LastShardVacuumed == metrics.Shards) metrics.LastShardSuffixes += hotMerged;
   metrics.HotSuffixes -= std::min(hotMerged, metrics.HotSuffixes);
   metrics.Pages += static_cast<uint64_t>(pageDelta);
+  ++_pageGeneration;
   const bool written = writeMetrics(batch);
   if (!written) static_cast<MetricsBlock&>(metrics) = undo;
   return written;

@@ -1,0 +1,39 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <vector>
+
+namespace salt {
+
+// A value for each document number, T() at first. Made for very many look-ups in no order: the
+// memory is taken by the page, for documents that are asked for and their neighbours. One thread.
+template <typename T>
+class DocPages {
+ public:
+  [[nodiscard]] T& operator[](uint32_t docID) {
+    const size_t page = docID / kPageDocs;
+    if (page >= _pages.size()) _pages.resize(page + 1);
+    if (_pages[page] == nullptr) _pages[page] = std::make_unique<T[]>(kPageDocs);
+    return _pages[page][docID % kPageDocs];
+  }
+
+  // Calls visit(docID, value), in order of docID, for each document on a page that has memory.
+  template <typename Visit>
+  void forEach(const Visit& visit) const {
+    for (size_t page = 0; page < _pages.size(); ++page) {
+      if (_pages[page] == nullptr) continue;
+      for (uint32_t i = 0; i < kPageDocs; ++i) {
+        visit(static_cast<uint32_t>(page * kPageDocs + i), _pages[page][i]);
+      }
+    }
+  }
+
+ private:
+  static constexpr uint32_t kPageDocs = 512;
+
+  std::vector<std::unique_ptr<T[]>> _pages;
+};
+
+}  // namespace salt
