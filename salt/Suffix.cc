@@ -9,9 +9,20 @@
 
 namespace salt {
 
+namespace {
+
+// The few texts that a walk completes are scattered: their blocks would displace those of the walk,
+// which the next token, often a longer or shorter form of this one, goes through again.
+leveldb::ReadOptions sparingTheCache(leveldb::ReadOptions options) {
+  options.fill_cache = false;
+  return options;
+}
+
+}  // namespace
+
 Suffix::Suffix(const index& owner, const leveldb::ReadOptions& readOptions, ZoneTexts* zoneTexts)
     : idx(owner),
-      options(readOptions),
+      options(sparingTheCache(readOptions)),
       _zoneTexts(zoneTexts),
       _text(std::make_unique<char[]>(owner.op.MaxMatchLen)) {}
 
