@@ -129,26 +129,37 @@ void RawBatches(benchmark::State& state) {
 }
 BENCHMARK(RawBatches)->Iterations(10000)->Unit(benchmark::kMicrosecond);
 
+// An index of 1,500 documents, all hot or all in pages, with the whole database sorted.
 struct Filled {
   ScratchPath path{"salt-bench-read"};
   Texts texts;
   std::unique_ptr<salt::Index> index = newIndex(path);
 
-  Filled() {
-    for (uint32_t docID = 1; docID <= 1500; ++docID) addDocument(*index, docID, texts.next());
+  explicit Filled(bool merged) {
+    for (uint32_t docID = 1; docID <= kDocuments; ++docID) {
+      addDocument(*index, docID, texts.next());
+    }
+    if (merged) {
+      index->Vacuum();
+      index.reset();  // waits for the merge
+      index.reset(salt::LoadIndex(path.string()));
+    }
     index->Compact();
   }
+
+  static constexpr uint32_t kDocuments = 1500;
 };
 
-Filled& filled() {
-  static Filled all;
-  return all;
+Filled& filled(bool merged) {
+  static Filled hot(false);
+  static Filled pages(true);
+  return merged ? pages : hot;
 }
 
-// The argument is the rank of the word in the vocabulary.
+// The arguments: whether the suffixes are in pages, and the rank of the word in the vocabulary.
 void ScanPrefix(benchmark::State& state) {
-  Filled& data = filled();
-  const std::string prefix = data.texts.word(static_cast<size_t>(state.range(0))) + ' ';
+  Filled& data = filled(state.range(0) != 0);
+  const std::string prefix = data.texts.word(static_cast<size_t>(state.range(1))) + ' ';
   uint64_t results = 0;
   for (auto _ : state) {
     data.index->ScanPrefix(prefix, [&results](const salt::SuffixMeta&) {
@@ -158,11 +169,72 @@ void ScanPrefix(benchmark::State& state) {
   }
   state.SetItemsProcessed(static_cast<int64_t>(results));
 }
-BENCHMARK(ScanPrefix)->Arg(1)->Arg(30)->Arg(1000)->Unit(benchmark::kMicrosecond);
+BENCHMARK(ScanPrefix)
+    ->ArgsProduct({{0, 1}, {1, 30, 1000}})
+    ->ArgNames({"pages", "rank"})
+    ->Unit(benchmark::kMicrosecond);
+
+// What a search asks. The last argument: whether the answer is remembered from the time before.
+void ScanPlaces(benchmark::State& state) {
+  Filled& data = filled(state.range(0) != 0);
+  const std::string prefix = data.texts.word(static_cast<size_t>(state.range(1))) + ' ';
+  uint64_t results = 0;
+  uint64_t places = 0;
+  static uint32_t unused = Filled::kDocuments;
+  for (auto _ : state) {
+    if (state.range(2) == 0) {
+      state.PauseTiming();
+      data.index->DeleteDoc(++unused);  // ends what is remembered
+      state.ResumeTiming();
+    }
+    results += *data.index->ScanPlaces(
+        prefix, SIZE_MAX, [&places](const salt::Place*, size_t count) { places += count; });
+  }
+  benchmark::DoNotOptimize(places);
+  state.SetItemsProcessed(static_cast<int64_t>(results));
+}
+BENCHMARK(ScanPlaces)
+    ->ArgsProduct({{0, 1}, {1, 30}, {0}})
+    ->ArgNames({"pages", "rank", "remembered"})
+    ->Iterations(200)
+    ->Unit(benchmark::kMicrosecond);
+BENCHMARK(ScanPlaces)
+    ->ArgsProduct({{1}, {1, 30}, {1}})
+    ->ArgNames({"pages", "rank", "remembered"})
+    ->Unit(benchmark::kMicrosecond);
+
+// Moves 460,000 hot suffixes into pages; the argument is how many documents' are there before.
+void Merge(benchmark::State& state) {
+  uint64_t suffixes = 0;
+  for (auto _ : state) {
+    state.PauseTiming();
+    const ScratchPath path("salt-bench-merge");
+    auto index = newIndex(path);
+    Texts texts;
+    uint32_t docID = 0;
+    const auto add = [&](int64_t documents) {
+      for (; documents > 0; --documents) addDocument(*index, ++docID, texts.next());
+    };
+    const auto reopen = [&] {
+      index.reset();
+      index.reset(salt::LoadIndex(path.string()));
+    };
+    add(state.range(0));
+    index->Vacuum();
+    reopen();
+    add(Filled::kDocuments);
+    suffixes += index->GetMetrics().Suffixes;
+    state.ResumeTiming();
+    index->Vacuum();
+    index.reset();
+  }
+  state.SetItemsProcessed(static_cast<int64_t>(suffixes));
+}
+BENCHMARK(Merge)->Arg(0)->Arg(1500)->Iterations(1)->Unit(benchmark::kMillisecond)->UseRealTime();
 
 // Two whole words and the beginning of a third.
 void Search(benchmark::State& state) {
-  Filled& data = filled();
+  Filled& data = filled(state.range(0) != 0);
   const auto term = [](const std::string& token) {
     saltsearch::Term made;
     made.tokens = {token};
@@ -179,7 +251,7 @@ void Search(benchmark::State& state) {
     benchmark::DoNotOptimize(saltsearch::Search(*data.index, terms, options));
   }
 }
-BENCHMARK(Search)->Unit(benchmark::kMicrosecond);
+BENCHMARK(Search)->Arg(0)->Arg(1)->ArgName("pages")->Unit(benchmark::kMicrosecond);
 
 }  // namespace
 
