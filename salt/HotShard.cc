@@ -189,7 +189,10 @@ bool index::DeleteDoc(uint32_t docID) {
   add(docID);
   leveldb::WriteBatch batch;
   batch.Put(kDeletedKey, bytes);
-  if (!_writer.write(&batch).ok()) return false;
+  if (const leveldb::Status status = _writer.write(&batch); !status.ok()) {
+    Log.error("Error writing to db: {}", status.ToString());
+    return false;
+  }
   DeletedDocs after = *before;
   after.insert({docID});
   platform::MutexLock metricsLock(_metricsMutex);

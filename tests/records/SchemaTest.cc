@@ -3,7 +3,6 @@
 #include <google/protobuf/util/message_differencer.h>
 #include <gtest/gtest.h>
 
-#include <cstdlib>
 #include <nlohmann/json.hpp>
 #include <random>
 #include <vector>
@@ -13,6 +12,7 @@
 #include "records/TLQuery.h"
 #include "tallow.pb.h"
 #include "tests/records/Hex.h"
+#include "tests/support/Seed.h"
 
 // The published schema against the records: what protoc's code writes, the records read, and the
 // other way round. Its random messages are also the random input of the records' own operations.
@@ -104,15 +104,9 @@ class RandomMessages {
   std::mt19937 _random;
 };
 
-// TALLOW_TEST_SEED moves the start of the random messages.
-uint32_t firstSeed() {
-  const char* text = std::getenv("TALLOW_TEST_SEED");
-  return text != nullptr ? static_cast<uint32_t>(std::strtoul(text, nullptr, 10)) : 1;
-}
-
 template <typename Record, typename Schema>
 void expectAgreement(int depth) {
-  for (uint32_t seed = firstSeed(), end = seed + 400; seed != end; ++seed) {
+  for (uint32_t seed = testsupport::firstSeed(), end = seed + 400; seed != end; ++seed) {
     Schema message;
     RandomMessages(seed).fill(message, depth);
     const std::string wire = message.SerializeAsString();

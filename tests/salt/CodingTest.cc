@@ -8,7 +8,7 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
-#include "tests/salt/SaltSupport.h"
+#include "tests/salt/Model.h"
 
 using salt::Index;
 using salt::SuffixMeta;

@@ -10,6 +10,7 @@
 
 #include "platform/Files.h"
 #include "salt/Index.h"
+#include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"

@@ -8,6 +8,7 @@
 #include <set>
 
 #include "salt/IndexImpl.h"
+#include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"

@@ -1,7 +1,5 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <signal.h>
-#include <sys/resource.h>
 
 #include <filesystem>
 
@@ -13,7 +11,9 @@
 using salt::Index;
 using salt::SuffixMeta;
 using salttest::addZone;
+using salttest::FileSizeLimit;
 using salttest::loadIndex;
+using salttest::newestLog;
 using salttest::newIndex;
 using salttest::scan;
 using testing::ElementsAre;
@@ -27,14 +27,6 @@ namespace {
 std::string padded(std::string text, size_t size) {
   text.resize(size, 'x');
   return text;
-}
-
-// The path of the one write-ahead log in the directory.
-std::filesystem::path logFile(const std::string& path) {
-  for (const auto& entry : std::filesystem::directory_iterator(path)) {
-    if (entry.path().extension() == ".log") return entry.path();
-  }
-  return {};
 }
 
 }  // namespace
@@ -161,19 +153,16 @@ TEST(Writes, LoseNothingAroundAFailedOne) {
       [](Index& index) { return addZone(index, 2, 1, std::string(5000, 'z')); },
       [](Index& index) { return index.DeleteDoc(1); },
   };
-  signal(SIGXFSZ, SIG_IGN);
-  rlimit limit{};
-  getrlimit(RLIMIT_FSIZE, &limit);
   for (const auto& write : writes) {
     const TemporaryDirectory directory;
     auto index = newIndex(directory / "i");
     ASSERT_TRUE(addZone(*index, 1, 1, "first"));
-    rlimit low = limit;
-    low.rlim_cur = std::filesystem::file_size(logFile(directory / "i")) + 10;
-    setrlimit(RLIMIT_FSIZE, &low);
-    const bool written = write(*index);
-    setrlimit(RLIMIT_FSIZE, &limit);
-    EXPECT_FALSE(written);
+    {
+      const FileSizeLimit limit(std::filesystem::file_size(newestLog(directory / "i")) + 10);
+      const LogCapture log;
+      EXPECT_FALSE(write(*index));
+      EXPECT_EQ(log.count("error SALT: Error writing to db: "), 1u);
+    }
     EXPECT_EQ(index->GetMetrics().Suffixes, 1u);
     EXPECT_EQ(index->GetMetrics().MaxDocID, 1u);
     EXPECT_EQ(index->GetMetrics().DeletedDocs, 0u);
@@ -316,7 +305,7 @@ TEST(Open, ATornLogHidesNothingThatComesLater) {
     ASSERT_TRUE(addZone(*index, 1, 1, "early"));
     ASSERT_TRUE(addZone(*index, 2, 1, "torn"));
     index.reset();
-    const auto log = logFile(directory / "i");
+    const auto log = newestLog(directory / "i");
     std::filesystem::resize_file(log, std::filesystem::file_size(log) - cut);
     index = loadIndex(directory / "i");
     ASSERT_TRUE(index);

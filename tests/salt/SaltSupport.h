@@ -1,39 +1,17 @@
 #pragma once
 
+#include <sys/resource.h>
+
+#include <filesystem>
 #include <functional>
 #include <memory>
-#include <random>
 #include <string>
 #include <vector>
 
 #include "salt/Index.h"
 
-// A slow and obviously right model of the index, and the means to write shards by hand.
+// Short forms of what tests do with an index, and the means to change a database by hand.
 namespace salttest {
-
-// One suffix as the model knows it.
-struct Place {
-  uint8_t shard = 0;
-  uint32_t docID = 0;
-  uint16_t zoneID = 0;
-  uint32_t offset = 0;
-  std::string text;  // cut
-
-  // Order within an index: shard, then text, then the bytes of the tail.
-  bool operator<(const Place& other) const;
-};
-
-[[nodiscard]] std::string naiveVarint(uint32_t value);
-[[nodiscard]] std::string naiveCut(std::string_view text, const salt::Index::Options& op);
-
-// A text of a small alphabet, so that suffixes share long prefixes, with blanks, some NULs and some
-// bytes above 0x7F.
-[[nodiscard]] std::string randomText(std::mt19937& random, size_t size);
-[[nodiscard]] std::vector<uint32_t> randomOffsets(std::mt19937& random, std::string_view text);
-
-// Adds pages of the places, which are of one shard, to the database at `path` and counts them into
-// its metrics. No index may be open there. Page sizes are random, at most MaxPageSuffixes.
-void writeShard(const std::string& path, std::vector<Place> places, std::mt19937& random);
 
 // Writes one page as given.
 void writePage(const std::string& path, uint8_t shard, const std::string& firstText,
@@ -44,6 +22,21 @@ void editMetrics(const std::string& path, const std::function<void(salt::Index::
 
 // Writes, or with no value removes, a key.
 void editKey(const std::string& path, const std::string& key, const std::string* value);
+
+// The newest write-ahead log of the database at `path`.
+[[nodiscard]] std::filesystem::path newestLog(const std::string& path);
+
+// While it lives, writes past this size of a file fail half done, as on a full disk.
+class FileSizeLimit {
+ public:
+  explicit FileSizeLimit(uint64_t bytes);
+  ~FileSizeLimit();
+  FileSizeLimit(const FileSizeLimit&) = delete;
+  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
+
+ private:
+  rlimit _before{};
+};
 
 [[nodiscard]] std::unique_ptr<salt::Index> newIndex(const std::string& path,
                                                     salt::Index::Options options = {});

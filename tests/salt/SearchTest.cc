@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <map>
+#include <random>
 
 #include "salt/Search.h"
 #include "tests/salt/SaltSupport.h"

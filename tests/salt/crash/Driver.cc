@@ -1,0 +1,350 @@
+// Kills a process with signal 9 while it adds, deletes and merges, again and again on the same
+// database, and checks after each kill, by the keys, that every acknowledged operation is there
+// exactly once. Ends with 1 at the first fault and leaves the database where it is.
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <poll.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <optional>
+#include <random>
+
+#include "platform/Assert.h"
+#include "tests/salt/Model.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/salt/crash/Workload.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using namespace salttest;
+using Clock = std::chrono::steady_clock;
+using std::chrono::microseconds;
+
+namespace {
+
+constexpr uint32_t kGenerations = 12;  // kills of one database
+constexpr size_t kMaxPlaces = 20000;   // in one database; more only makes the check slow
+constexpr microseconds kForever = std::chrono::hours(24);
+constexpr uint64_t kLogBlock = 32768;
+
+constexpr uint64_t kMaxDiskBytes = 256 * 1024 * 1024;  // of a file system to be filled
+
+constexpr const char* kUsage =
+    "Usage: salt_crash_driver [--mode kill|truncate|enospc] [--kills N] [--seed N]\n"
+    "                         [--seconds MOST] [--disk DIR]\n"
+    "truncate: also cuts the newest log at a random place.\n"
+    "enospc: writes fail at times, by a limit on the size of files or, with DIR on a file system\n"
+    "of some megabytes, by filling it.\n";
+
+enum class Mode { kill, truncate, enospc };
+
+struct Options {
+  uint64_t kills = 200;
+  uint32_t seed = 1;
+  Mode mode = Mode::kill;
+  std::string disk;  // a directory on a small file system of its own, which workers fill
+  std::chrono::seconds most{86400};
+};
+
+struct Tally {
+  uint64_t kills = 0;
+  uint64_t whileOpening = 0;
+  uint64_t whileMerging = 0;
+  uint64_t databases = 0;
+  uint64_t operations = 0;
+  uint64_t failedForSpace = 0;
+  uint64_t lostTails = 0;  // databases that a cut log took something from
+};
+
+// A worker and the pipe that it reports through.
+class WorkerProcess {
+ public:
+  explicit WorkerProcess(const WorkerTask& task) {
+    int ends[2];
+    TL_ASSERT(pipe2(ends, O_CLOEXEC) == 0);
+    _reports = ends[0];
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_adddup2(&actions, ends[1], STDOUT_FILENO);
+    std::string words[] = {"salt_crash_driver",
+                           "--worker",
+                           task.path,
+                           std::to_string(task.seed),
+                           std::to_string(task.first),
+                           std::to_string(task.generation),
+                           std::to_string(task.create),
+                           std::to_string(static_cast<int>(task.shortage))};
+    std::vector<char*> arguments;
+    for (std::string& word : words) arguments.push_back(word.data());
+    arguments.push_back(nullptr);
+    TL_ASSERT(posix_spawn(&_pid, "/proc/self/exe", &actions, nullptr, arguments.data(), environ) ==
+              0);
+    posix_spawn_file_actions_destroy(&actions);
+    close(ends[1]);
+  }
+
+  ~WorkerProcess() { close(_reports); }
+  WorkerProcess(const WorkerProcess&) = delete;
+  WorkerProcess& operator=(const WorkerProcess&) = delete;
+
+  // Waits for reports until `end` and appends them. False when the worker has ended.
+  bool read(Clock::time_point end, std::string* reports) const {
+    const auto left = std::chrono::ceil<microseconds>(end - Clock::now());
+    const timespec time{left.count() / 1'000'000, left.count() % 1'000'000 * 1000};
+    pollfd waiting{_reports, POLLIN, 0};
+    if (left.count() <= 0 || ppoll(&waiting, 1, &time, nullptr) <= 0) return true;
+    char bytes[4096];
+    const ssize_t size = ::read(_reports, bytes, sizeof bytes);
+    if (size > 0) reports->append(bytes, static_cast<size_t>(size));
+    return size > 0;
+  }
+
+  // The status that it ended with; what it reported before is appended.
+  int end(std::string* reports) const {
+    kill(_pid, SIGKILL);
+    while (read(Clock::now() + kForever, reports)) {
+    }
+    int status = 0;
+    TL_ASSERT(waitpid(_pid, &status, 0) == _pid);
+    return status;
+  }
+
+ private:
+  pid_t _pid = -1;
+  int _reports = -1;
+};
+
+// One database through its kills.
+class Trial {
+ public:
+  Trial(const Options& options, uint32_t seed, Tally* tally)
+      : _mode(options.mode),
+        _onSmallDisk(!options.disk.empty()),
+        _path(_onSmallDisk ? options.disk + "/index" : _directory / "index"),
+        _seed(seed),
+        _tally(*tally),
+        _random(seed),
+        _model(workloadOptions(seed)) {}
+
+  [[nodiscard]] bool over() const {
+    return _generation >= kGenerations || _model.places.size() > kMaxPlaces;
+  }
+  [[nodiscard]] const std::string& path() const { return _path; }
+
+  // Lets a worker go on where the last one was killed. The result is the first fault, or empty.
+  std::string nextGeneration() {
+    WorkerTask task;
+    task.path = _path;
+    task.seed = _seed;
+    task.first = _next;
+    task.generation = ++_generation;
+    task.create = !_created;
+    if (_mode == Mode::enospc) {
+      task.shortage = _onSmallDisk ? Shortage::fullDisk : Shortage::fileSize;
+    }
+    std::string reports;
+    const int status = killed(WorkerProcess(task), &reports);
+    ++_tally.kills;
+    std::filesystem::remove(ballastOf(_path));
+    if (!WIFSIGNALED(status) || WTERMSIG(status) != SIGKILL) {
+      return fmt::format("the worker ended with status {:#x}", status);
+    }
+    std::string fault = believe(reports);
+    if (fault.empty() && _mode == Mode::truncate && _created) cutNewestLog();
+    if (fault.empty() && _created) fault = check(reports.size() > 1);
+    return fault;
+  }
+
+ private:
+  // Kills while the index is opened, or some time after a number of reports, or right after a write
+  // that failed.
+  int killed(const WorkerProcess& worker, std::string* reports) {
+    const microseconds pause(_random() % 3000);
+    const size_t quota = 1 + _random() % 80;
+    const bool atFailure = _random() % 4 == 0;
+    const auto part = static_cast<int>(_random() % 100);
+    const auto start = Clock::now();
+    auto end = start + (_random() % 5 == 0 ? _opening * part / 100 : kForever);
+    for (bool chosen = false; Clock::now() < end && worker.read(end, reports);) {
+      if (reports->size() == 1) _opening = std::chrono::ceil<microseconds>(Clock::now() - start);
+      if (chosen) continue;
+      const bool failed = reports->find(static_cast<char>(Report::failed)) != std::string::npos;
+      chosen = (atFailure && failed) || reports->size() >= quota;
+      if (chosen) end = atFailure ? start : std::min(end, Clock::now() + pause);
+    }
+    return worker.end(reports);
+  }
+
+  // Takes over what the worker says of itself.
+  std::string believe(const std::string& reports) {
+    if (reports.empty()) ++_tally.whileOpening;
+    for (const char byte : reports) {
+      const auto report = static_cast<Report>(byte);
+      _created = true;
+      if (report == Report::failed) ++_tally.failedForSpace;
+      if (report != Report::done && report != Report::refused) continue;
+      ++_tally.operations;
+      if (carryOut(_model, workloadOperation(_seed, _next)) != (report == Report::done)) {
+        return fmt::format("operation {} was answered {}", _next, byte);
+      }
+      ++_next;
+    }
+    return "";
+  }
+
+  void cutNewestLog() {
+    const std::filesystem::path log = newestLog(_path);
+    const uint64_t size = std::filesystem::file_size(log);
+    const uint64_t block = _random() % (size / kLogBlock + 1) * kLogBlock;
+    const uint64_t places[] = {
+        _random() % (size + 1), size - std::min<uint64_t>(size, _random() % 300),
+        block + _random() % 8, block - std::min<uint64_t>(block, _random() % 8)};
+    std::filesystem::resize_file(log, std::min(size, places[_random() % std::size(places)]));
+  }
+
+  // Works on copies, so that the next worker is the first to open what this one left.
+  std::string check(bool worked) {
+    const Keys keys = readKeys(freshCopy());
+    if (keys.size() < 2 && _mode == Mode::truncate) {  // without its metrics there is no index
+      startAnew();
+      return "";
+    }
+    if (worked && storedMetrics(keys).VacuumInProgress) ++_tally.whileMerging;
+    if (!catchUpWith(keys)) return fmt::format("operations before {} are missing", _next);
+    if (std::string fault = difference(keys, &_model); !fault.empty()) return fault;
+
+    const testsupport::LogCapture log;
+    const auto index = loadIndex(freshCopy());
+    if (!index) return "LoadIndex";
+    if (!index->Validate() || log.count("Validation failed") != 0) return "Validate";
+    if (scan(*index, "") != _model.scan("")) return "scan";
+    return _model.difference(index->GetMetrics());
+  }
+
+  std::string freshCopy() {
+    std::string copy = _directory / "copy";
+    std::filesystem::remove_all(copy);
+    std::filesystem::copy(_path, copy);
+    return copy;
+  }
+
+  // Brings the model to what the keys hold: the operation after the last acknowledged may be there;
+  // after a cut, any number of the last ones may be missing. False when they hold anything else.
+  bool catchUpWith(const Keys& keys) {
+    const auto agree = [&] {
+      return _model.indexingCalls == storedMetrics(keys).IndexingCalls &&
+             _model.deleted == storedDeletions(keys);
+    };
+    const auto take = [this] { carryOut(_model, workloadOperation(_seed, _next++)); };
+    if (agree()) return true;
+    const uint32_t acknowledged = _next;
+    if (_mode == Mode::truncate) {
+      take();
+      if (agree()) return true;
+      ++_tally.lostTails;
+      startAnew();
+      _created = true;
+      while (!agree() && _next < acknowledged) take();
+    } else {
+      take();
+    }
+    return agree();
+  }
+
+  void startAnew() {
+    _model = Model(_model.op);
+    _next = 0;
+    _created = false;
+  }
+
+  const testsupport::TemporaryDirectory _directory;
+  const Mode _mode;
+  const bool _onSmallDisk;
+  const std::string _path;
+  const uint32_t _seed;
+  Tally& _tally;
+  std::mt19937 _random;
+  Model _model;
+  microseconds _opening{10000};  // how long it took the last time
+  uint32_t _generation = 0;
+  uint32_t _next = 0;  // number of the first operation that the model has not seen
+  bool _created = false;
+};
+
+int drive(const Options& options) {
+  Tally tally;
+  const auto start = Clock::now();
+  std::mt19937 seeds(options.seed);
+  std::optional<Trial> trial;
+  while (tally.kills < options.kills && Clock::now() - start < options.most) {
+    if (!trial || trial->over()) {
+      trial.emplace(options, seeds(), &tally);
+      ++tally.databases;
+    }
+    if (const std::string fault = trial->nextGeneration(); !fault.empty()) {
+      fmt::print(stderr, "FAULT at kill {} of seed {}: {}\n{} is left\n", tally.kills, options.seed,
+                 fault, trial->path());
+      _exit(1);
+    }
+  }
+  const std::chrono::duration<double> seconds = Clock::now() - start;
+  fmt::print(
+      "kills={} while_merging={} while_opening={} databases={} operations={} lost_tails={} "
+      "failed_for_space={} seconds={:.1f}\n",
+      tally.kills, tally.whileMerging, tally.whileOpening, tally.databases, tally.operations,
+      tally.lostTails, tally.failedForSpace, seconds.count());
+  return 0;
+}
+
+uint32_t number(const char* text) {
+  return static_cast<uint32_t>(std::strtoul(text, nullptr, 10));
+}
+
+int worker(char** words) {
+  return runWorker({words[0], number(words[1]), number(words[2]), number(words[3]),
+                    number(words[4]) != 0, static_cast<Shortage>(number(words[5]))});
+}
+
+// False when the words make no sense.
+bool parse(int count, char** words, Options* options) {
+  for (int i = 0; i + 1 < count; i += 2) {
+    const std::string_view name = words[i];
+    const std::string_view value = words[i + 1];
+    if (name == "--kills") {
+      options->kills = number(words[i + 1]);
+    } else if (name == "--seed") {
+      options->seed = number(words[i + 1]);
+    } else if (name == "--disk" && std::filesystem::space(value).capacity <= kMaxDiskBytes) {
+      options->disk = value;
+    } else if (name == "--seconds") {
+      options->most = std::chrono::seconds(number(words[i + 1]));
+    } else if (name == "--mode" && (value == "kill" || value == "truncate" || value == "enospc")) {
+      options->mode = value == "kill"       ? Mode::kill
+                      : value == "truncate" ? Mode::truncate
+                                            : Mode::enospc;
+    } else {
+      return false;
+    }
+  }
+  return count % 2 == 0;
+}
+
+}  // namespace
+
+int main(int count, char** words) {
+  if (count == 8 && std::strcmp(words[1], "--worker") == 0) return worker(words + 2);
+  Options options;
+  if (!parse(count - 1, words + 1, &options)) {
+    fmt::print(stderr, "{}", kUsage);
+    return 2;
+  }
+  setenv("TALLOW_LOG", "fault", 0);  // refused and failed operations are what a worker expects
+  return drive(options);
+}

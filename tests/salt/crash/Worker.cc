@@ -1,0 +1,111 @@
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <memory>
+#include <random>
+#include <variant>
+
+#include "platform/Assert.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/salt/crash/Workload.h"
+
+namespace salttest {
+
+namespace {
+
+constexpr uint32_t kReopenings = 200;  // one in so many operations closes and opens the index first
+constexpr uint32_t kShortages = 25;    // the same for a shortage of space
+
+// While it lives, the file system of `path` has only so many bytes left.
+class FullDisk {
+ public:
+  FullDisk(const std::string& path, uint64_t room) : _ballast(ballastOf(path)) {
+    const uint64_t free = std::filesystem::space(_ballast.parent_path()).available;
+    const int file = open(_ballast.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600);
+    TL_ASSERT(file >= 0);
+    static_cast<void>(
+        posix_fallocate(file, 0, static_cast<off_t>(free - std::min(free, room)) + 1));
+    close(file);
+  }
+  ~FullDisk() { std::filesystem::remove(_ballast); }
+  FullDisk(const FullDisk&) = delete;
+  FullDisk& operator=(const FullDisk&) = delete;
+
+ private:
+  const std::filesystem::path _ballast;
+};
+
+class Worker {
+ public:
+  explicit Worker(const WorkerTask& task) : _task(task), _random(task.seed + task.generation) {}
+
+  int run() {
+    if (_task.create) _index = newIndex(_task.path, workloadOptions(_task.seed));
+    if (!_index) reopen();
+    say(Report::opened);
+    for (uint32_t number = _task.first;; ++number) {
+      if (_random() % kReopenings == 0) reopen();
+      if (_random() % kShortages == 0) changeSpace();
+      say(answer(workloadOperation(_task.seed, number)) ? Report::done : Report::refused);
+    }
+  }
+
+ private:
+  static void say(Report report) {
+    if (write(STDOUT_FILENO, &report, 1) != 1) _exit(2);
+  }
+
+  [[nodiscard]] bool isShort() const { return _shortage.index() != 0; }
+  void endShortage() { _shortage.emplace<std::monostate>(); }
+
+  // Without space it may fail, with space never.
+  void reopen() {
+    _index.reset();
+    _index = loadIndex(_task.path);
+    if (_index) return;
+    if (!isShort()) _exit(3);
+    endShortage();
+    reopen();
+  }
+
+  // A file may grow a little more than the log has, enough for some operations or some batches of a
+  // merge; or less, and tables come to their limit, too.
+  void changeSpace() {
+    if (isShort()) return endShortage();
+    if (_task.shortage == Shortage::fullDisk) {
+      _shortage.emplace<FullDisk>(_task.path, _random() % 100000);
+    } else if (_task.shortage == Shortage::fileSize) {
+      const uint64_t log = std::filesystem::file_size(newestLog(_task.path));
+      const uint64_t sizes[] = {log + _random() % 300, log + _random() % 20000, _random() % 20000};
+      _shortage.emplace<FileSizeLimit>(sizes[_random() % std::size(sizes)]);
+    }
+  }
+
+  // Tries until it is clear that the answer has nothing to do with space. What leveldb keeps in
+  // mind of a failure is forgotten when the index is opened again.
+  bool answer(const Operation& operation) {
+    while (isShort()) {
+      if (carryOut(*_index, operation)) return true;
+      say(Report::failed);
+      if (_random() % 2 == 0) endShortage();
+    }
+    if (carryOut(*_index, operation)) return true;
+    if (_task.shortage == Shortage::none) return false;
+    reopen();
+    return carryOut(*_index, operation);
+  }
+
+  const WorkerTask& _task;
+  std::mt19937 _random;
+  std::unique_ptr<salt::Index> _index;
+  std::variant<std::monostate, FileSizeLimit, FullDisk> _shortage;
+};
+
+}  // namespace
+
+int runWorker(const WorkerTask& task) {
+  return Worker(task).run();
+}
+
+}  // namespace salttest
