@@ -158,6 +158,16 @@ double DaemonRun::cpuSeconds() const {
   return secondsOf(clock);
 }
 
+std::optional<pid_t> DaemonRun::threadNamed(const std::string& name) const {
+  const std::string tasks = "/proc/" + std::to_string(_pid) + "/task";
+  for (const auto& task : std::filesystem::directory_iterator(tasks)) {
+    std::ifstream file(task.path() / "comm");  // the thread may be gone by now
+    std::string found;
+    if (std::getline(file, found) && found == name) return std::stoi(task.path().filename());
+  }
+  return std::nullopt;
+}
+
 int DaemonRun::end(int signal) {
   const pid_t pid = std::exchange(_pid, -1);
   int status = 0;

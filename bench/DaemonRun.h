@@ -44,6 +44,9 @@ class DaemonRun {
   // Processor time of all its threads so far. Steadier than the clock on a machine with other work.
   [[nodiscard]] double cpuSeconds() const;
 
+  // The kernel's number of its thread of this name; none when there is no such thread now.
+  [[nodiscard]] std::optional<pid_t> threadNamed(const std::string& name) const;
+
   // Asks the daemon to end and waits until it has; throws unless it ended well.
   void stop();
 

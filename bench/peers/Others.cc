@@ -65,7 +65,7 @@ class ToolRun {
       if (_queries++ % kQueriesAStart == 0) _starts.add(search("zqxjvwzqxjvw").seconds);
       return search(query);
     };
-    timeQueries(_work, searchAndStart, false, figures);
+    timeQueries(_work, searchAndStart, figures);
     takeStartOff(figures);
     return figures;
   }
@@ -87,9 +87,8 @@ class ToolRun {
   // its index.
   void takeStartOff(Figures& figures) const {
     figures.startSeconds = _starts.at(0.5);
-    for (double* seconds : {&figures.median, &figures.percentile95, &figures.maximum}) {
-      *seconds = std::max(*seconds - figures.startSeconds, 0.0);
-    }
+    figures.first.takeOff(figures.startSeconds);
+    figures.again.takeOff(figures.startSeconds);
   }
 
   const Tool _tool;
@@ -163,7 +162,7 @@ Figures measureFts5(const Workload& work, bool optimize) {
     const size_t results = database.search(query);
     return bench::TimedSearch{bench::secondsNow() - start, results};
   };
-  timeQueries(work, search, false, figures);
+  timeQueries(work, search, figures);
   return figures;
 }
 

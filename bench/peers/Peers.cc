@@ -1,20 +1,24 @@
 #include "bench/peers/Peers.h"
 
+#include <algorithm>
+
 namespace peers {
 
-void timeQueries(const Workload& work, const Search& search, bool warm, Figures& figures) {
-  bench::Percentiles seconds;
-  for (size_t pass = warm ? 1 : 0; pass <= work.passes; ++pass) {
-    for (const std::string& query : work.queries) {
-      const bench::TimedSearch timed = search(query);
-      if (pass == 0) continue;
-      seconds.add(timed.seconds);
-      figures.results += timed.results;
-    }
+void SearchTimes::add(const bench::TimedSearch& timed) {
+  _seconds.add(timed.seconds);
+  ++_queries;
+  _results += timed.results;
+}
+
+double SearchTimes::at(double part) const {
+  return _queries == 0 ? kUnknown : std::max(_seconds.at(part) - _takenOff, 0.0);
+}
+
+void timeQueries(const Workload& work, const Search& search, Figures& figures) {
+  for (const std::string& query : work.warmUp) static_cast<void>(search(query));
+  for (SearchTimes* pass : {&figures.first, &figures.again}) {
+    for (const std::string& query : work.queries) pass->add(search(query));
   }
-  figures.median = seconds.at(0.5);
-  figures.percentile95 = seconds.at(0.95);
-  figures.maximum = seconds.at(1);
 }
 
 }  // namespace peers

@@ -18,11 +18,34 @@ struct Workload {
   std::string maildir;    // an absolute path
   std::string spoolPath;  // its mails as encoded items
   uint64_t mails;
-  std::vector<std::string> queries;
-  size_t passes;  // over the queries, after one that is not timed
+  // No query stands twice in these, so that each is new to whoever is asked it first.
+  std::vector<std::string> warmUp;       // not timed
+  std::vector<std::string> queries;      // timed twice
+  std::vector<std::string> duringMerge;  // timed once, of this daemon
 };
 
 inline constexpr double kUnknown = std::numeric_limits<double>::quiet_NaN();
+
+// What some searches took.
+class SearchTimes {
+ public:
+  void add(const bench::TimedSearch& timed);
+
+  // From now on each search took so much less.
+  void takeOff(double seconds) { _takenOff = seconds; }
+
+  // In seconds; NaN without any search.
+  [[nodiscard]] double at(double part) const;
+
+  [[nodiscard]] uint64_t queries() const { return _queries; }
+  [[nodiscard]] uint64_t results() const { return _results; }  // of all together
+
+ private:
+  bench::Percentiles _seconds;
+  uint64_t _queries = 0;
+  uint64_t _results = 0;
+  double _takenOff = 0;
+};
 
 // What is measured of each. Whatever is not known, or depends on that, is NaN.
 struct Figures {
@@ -31,39 +54,37 @@ struct Figures {
   double diskBytes = kUnknown;
   double residentPeak = kUnknown;  // of the indexing process, in bytes
   double startSeconds = 0;         // taken off each query
-  double median = kUnknown;        // of the queries, in seconds
-  double percentile95 = kUnknown;
-  double maximum = kUnknown;
-  uint64_t results = 0;  // of all timed queries together
+  SearchTimes first;               // each query when it is asked for the first time
+  SearchTimes again;               // and for the second
 };
 
 using Search = std::function<bench::TimedSearch(const std::string& query)>;
 
-// Runs the queries once unless they are warm, then `passes` times, and enters what that took into
-// the figures.
-void timeQueries(const Workload& work, const Search& search, bool warm, Figures& figures);
+// Warms up, then runs the queries twice and enters what that took into the figures.
+void timeQueries(const Workload& work, const Search& search, Figures& figures);
 
 // This daemon.
 struct TallowFigures : Figures {
   double settleSeconds = 0;  // from the last mail until all merges have ended
   uint64_t settleMerges = 0;
-  double anonymousPeak = 0;  // RssAnon, in bytes, of the daemon at any time
-  Figures duringMerge;
-  uint64_t merges = 0;    // that ran during those queries
-  uint64_t mailsFed = 0;  // indexed meanwhile
+  double anonymousPeak = kUnknown;  // RssAnon, in bytes, of the daemon at any time
+  SearchTimes duringMerge;          // of queries that began and ended while one and the same ran
+  uint64_t merges = 0;              // that ran during those queries
+  uint64_t mailsFed = 0;            // indexed meanwhile
 };
 [[nodiscard]] TallowFigures measureTallow(const Workload& work);
 
-// This daemon without the parsing of mail, and the same keys as raw batches.
+// This daemon without the parsing of mail, and the same keys as raw batches. What is not known is
+// NaN.
 struct EncodedFigures {
-  uint64_t suffixes = 0;
-  double seconds = 0;
-  double cpuSeconds = 0;
-  double rawSeconds = 0;
-  double rawDiskBytes = 0;
-  double anonymousPeak = 0;
+  double seconds = kUnknown;
+  double cpuSeconds = kUnknown;
+  double anonymousPeak = kUnknown;
+  double suffixes = kUnknown;  // this and the following only `withRaw`
+  double rawSeconds = kUnknown;
+  double rawDiskBytes = kUnknown;
 };
-[[nodiscard]] EncodedFigures measureEncoded(const Workload& work);
+[[nodiscard]] EncodedFigures measureEncoded(const Workload& work, bool withRaw);
 
 [[nodiscard]] Figures measureMu(const Workload& work);
 [[nodiscard]] Figures measureNotmuch(const Workload& work);

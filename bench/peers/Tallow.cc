@@ -7,6 +7,7 @@
 #include <stdexcept>
 #include <string_view>
 #include <thread>
+#include <utility>
 
 #include "bench/ChildProcess.h"
 #include "bench/Corpus.h"
@@ -24,6 +25,8 @@ struct Merges {
   bool running;
 };
 
+// Reads all texts of the index.
+
 Merges mergesOf(client::DebugServiceProxy& service) {
   std::optional<TLError> error;
   const auto text = service.fetchStatsForSalt(bench::kClientName, bench::kProtectionClass, &error);
@@ -33,6 +36,11 @@ Merges mergesOf(client::DebugServiceProxy& service) {
   if (at == std::string::npos) throw std::runtime_error("the metrics tell no vacuums");
   return {std::stoull(text->substr(at + kCount.size())),
           text->find("(IN PROGRESS)", at) != std::string::npos};
+}
+
+// Tells one merge from another, and costs nothing. None while there is no merge.
+std::optional<pid_t> mergeThread(const bench::DaemonRun& daemon) {
+  return daemon.threadNamed("tallow-merge");
 }
 
 // Merges and compacts the index until there is nothing more to merge.
@@ -54,20 +62,24 @@ void settle(client::DebugServiceProxy& service) {
 
 // Indexes the mail of the spool under new identifiers, again and again, to make the daemon merge.
 //
-// Threads: one, the maker's. The feeding thread, joined by `stop`, has all but `_stopping` for
-// itself while it runs.
+// Threads: one, the maker's. The feeding thread, which `start` makes and `stop` joins, has all but
+// `_stopping` for itself while it runs.
 class Feeder {
  public:
-  Feeder(const std::string& runtimeDirectory, const std::string& spoolPath)
-      : _service(runtimeDirectory), _spool(spoolPath) {}
+  Feeder(const bench::DaemonRun& daemon, const std::string& spoolPath)
+      : _daemon(daemon), _service(daemon.runtimeDirectory()), _spool(spoolPath) {}
   ~Feeder() { end(); }
   Feeder(const Feeder&) = delete;
   Feeder& operator=(const Feeder&) = delete;
 
-  // Returns once a merge runs, or all mail was sent without.
-  void startMerge(client::DebugServiceProxy& service) {
-    const size_t round = _round;
-    while (_round == round && !mergesOf(service).running) sendBatch(SIZE_MAX);
+  // True once a merge runs; false when all mail was sent without.
+  [[nodiscard]] bool startMerge() {
+    const size_t first = _round;
+    while (!mergeThread(_daemon)) {
+      if (_round > first + 1) return false;  // the first may have been begun already
+      sendBatch(SIZE_MAX);
+    }
+    return true;
   }
 
   // Goes on in a thread, in small calls, as mail comes in.
@@ -76,11 +88,12 @@ class Feeder {
     _thread = std::thread([this] { feed(); });
   }
 
-  // Returns how many mails the thread has sent; throws what it has met.
+  // Returns how many mails the thread has sent since `start`; throws what it has met.
   uint64_t stop() {
     end();
+    _stopping = false;
     if (_failure) std::rethrow_exception(_failure);
-    return _mails;
+    return std::exchange(_mails, 0);
   }
 
  private:
@@ -121,6 +134,7 @@ class Feeder {
     if (_thread.joinable()) _thread.join();
   }
 
+  const bench::DaemonRun& _daemon;
   client::SearchServiceProxy _service;
   bench::ItemSpool _spool;
   std::vector<client::EncodedItem> _batch;
@@ -153,6 +167,28 @@ void indexByClient(const Workload& work, bench::DaemonRun& daemon, const std::st
   figures.residentPeak = static_cast<double>(daemon.memory().residentPeak);
 }
 
+// Asks one query after another while mail comes in. Between merges, mail comes in faster until
+// there is the next one. A query that a merge does not outlast does not count.
+void timeDuringMerge(const Workload& work, const bench::DaemonRun& daemon, const Search& search,
+                     TallowFigures& figures) {
+  Feeder feeder(daemon, work.spoolPath);
+  std::optional<pid_t> latest;
+  for (const std::string& query : work.duringMerge) {
+    if (!mergeThread(daemon)) {
+      figures.mailsFed += feeder.stop();
+      if (!feeder.startMerge()) return;
+      feeder.start();
+    }
+    const std::optional<pid_t> merge = mergeThread(daemon);
+    const bench::TimedSearch answer = search(query);
+    if (!merge || mergeThread(daemon) != merge) continue;
+    figures.duringMerge.add(answer);
+    if (latest != merge) ++figures.merges;
+    latest = merge;
+  }
+  figures.mailsFed += feeder.stop();
+}
+
 }  // namespace
 
 TallowFigures measureTallow(const Workload& work) {
@@ -174,22 +210,15 @@ TallowFigures measureTallow(const Workload& work) {
   const Search search = [&](const std::string& query) {
     return bench::timedSearch(service, query);
   };
-  timeQueries(work, search, false, figures);
-  Feeder feeder(daemon.runtimeDirectory(), work.spoolPath);
-  feeder.startMerge(debugService);
-  const Merges before = mergesOf(debugService);
-  feeder.start();
-  timeQueries(work, search, true, figures.duringMerge);
-  figures.mailsFed = feeder.stop();
-  const Merges after = mergesOf(debugService);
-  figures.merges = after.ended - before.ended + (after.running ? 1 : 0);
+  timeQueries(work, search, figures);
+  timeDuringMerge(work, daemon, search, figures);
 
   figures.anonymousPeak = static_cast<double>(daemon.memory().anonymousPeak);
   daemon.stop();
   return figures;
 }
 
-EncodedFigures measureEncoded(const Workload& work) {
+EncodedFigures measureEncoded(const Workload& work, bool withRaw) {
   const bench::ScratchDirectory scratch;
   const std::string state = scratch / "state";
   const std::string rawPath = scratch / "raw";
@@ -206,9 +235,10 @@ EncodedFigures measureEncoded(const Workload& work) {
   figures.cpuSeconds = daemon.cpuSeconds() - cpuStart;
   figures.anonymousPeak = static_cast<double>(daemon.memory().anonymousPeak);
   daemon.stop();
+  if (!withRaw) return figures;
   sync();
   const bench::RawRun raw = bench::writeRawBatches(bench::indexPath(state), rawPath);
-  figures.suffixes = raw.suffixes;
+  figures.suffixes = static_cast<double>(raw.suffixes);
   figures.rawSeconds = raw.seconds;
   figures.rawDiskBytes = static_cast<double>(bench::bytesOnDisk(rawPath));
   return figures;
