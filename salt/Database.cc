@@ -2,6 +2,7 @@
 
 #include <cstdarg>
 #include <cstdio>
+#include <filesystem>
 
 #include "platform/Files.h"
 
@@ -15,6 +16,7 @@ constexpr size_t kBlockCacheBytes = 1024 * 1024;
 constexpr size_t kBlockBytes = 32 * 1024;
 constexpr size_t kFileBytes = 4 * 1024 * 1024;
 constexpr size_t kLogLineBytes = 100;
+constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one takes at a time
 
 leveldb::Status open(const leveldb::Options& options, const std::string& path,
                      std::unique_ptr<leveldb::DB>* db) {
@@ -47,6 +49,16 @@ void LeveldbLogger::Logv(const char* format, va_list arguments) {
   log.debug("{}", static_cast<const char*>(line));
 }
 
+void compact(const Database& database, const leveldb::Slice* begin, const leveldb::Slice* end) {
+  std::error_code error;
+  const auto space = std::filesystem::space(database.path, error);
+  if (!error && space.available < kCompactionRoom) {
+    Log.error("No compaction: {} bytes are left on the disk", space.available);
+    return;
+  }
+  database.db->CompactRange(begin, end);
+}
+
 leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
   platform::MutexLock lock(_mutex);
   leveldb::Status status;
@@ -59,6 +71,7 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
 
 Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* files) {
   Database result;
+  result.path = path;
   result.logger = std::make_unique<LeveldbLogger>();
   result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
   leveldb::Options options;

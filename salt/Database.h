@@ -24,6 +24,7 @@ class LeveldbLogger final : public leveldb::Logger {
 
 // An open database with what it needs to live; goes down in the order database, cache, logger.
 struct Database {
+  std::string path;
   std::unique_ptr<leveldb::Logger> logger;
   std::unique_ptr<leveldb::Cache> cache;
   std::unique_ptr<leveldb::DB> db;  // null when opening failed
@@ -34,6 +35,11 @@ enum class OpenMode { create, existing };
 // `create` removes what is at `path` first. A failure is logged. `files` outlives the database.
 [[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode,
                                     leveldb::Env* files = leveldb::Env::Default());
+
+// Compacts the keys from `begin` to `end`; null stands for the first and the last. Does nothing,
+// with a log line, where the disk is nearly full: leveldb 1.23 ends the process when it fails to
+// write a memtable during a compaction on demand.
+void compact(const Database& database, const leveldb::Slice* begin, const leveldb::Slice* end);
 
 // The only way batches are written. A write that fails (a full disk, say) can leave half a record
 // in the log, and recovery does not look behind it: the next write starts a new log first, so that

@@ -139,7 +139,7 @@ bool index::Sync() {
 }
 
 void index::Compact() {
-  db->CompactRange(nullptr, nullptr);
+  compact(_database, nullptr, nullptr);
 }
 
 Index::Metrics index::GetMetrics() const {

@@ -92,7 +92,7 @@ bool index::hotPartIsSparse() const {
 void index::compactHotPart() {
   const leveldb::Slice begin("\x00", 1);
   const leveldb::Slice end("\x01", 1);
-  db->CompactRange(&begin, &end);
+  compact(_database, &begin, &end);
 }
 
 bool index::commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta) {

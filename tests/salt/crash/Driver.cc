@@ -126,12 +126,14 @@ class Trial {
  public:
   Trial(const Options& options, uint32_t seed, Tally* tally)
       : _mode(options.mode),
-        _onSmallDisk(!options.disk.empty()),
-        _path(_onSmallDisk ? options.disk + "/index" : _directory / "index"),
+        _shortage(_mode != Mode::enospc  ? Shortage::none
+                  : options.disk.empty() ? Shortage::fileSize
+                                         : Shortage::fullDisk),
+        _path(options.disk.empty() ? _directory / "index" : options.disk + "/index"),
         _seed(seed),
         _tally(*tally),
         _random(seed),
-        _model(workloadOptions(seed)) {}
+        _model(workloadOptions(seed, _shortage)) {}
 
   [[nodiscard]] bool over() const {
     return _generation >= kGenerations || _model.places.size() > kMaxPlaces;
@@ -146,9 +148,7 @@ class Trial {
     task.first = _next;
     task.generation = ++_generation;
     task.create = !_created;
-    if (_mode == Mode::enospc) {
-      task.shortage = _onSmallDisk ? Shortage::fullDisk : Shortage::fileSize;
-    }
+    task.shortage = _shortage;
     std::string reports;
     const int status = killed(WorkerProcess(task), &reports);
     ++_tally.kills;
@@ -266,7 +266,7 @@ class Trial {
 
   const testsupport::TemporaryDirectory _directory;
   const Mode _mode;
-  const bool _onSmallDisk;
+  const Shortage _shortage;
   const std::string _path;
   const uint32_t _seed;
   Tally& _tally;

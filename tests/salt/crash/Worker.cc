@@ -41,7 +41,7 @@ class Worker {
   explicit Worker(const WorkerTask& task) : _task(task), _random(task.seed + task.generation) {}
 
   int run() {
-    if (_task.create) _index = newIndex(_task.path, workloadOptions(_task.seed));
+    if (_task.create) _index = newIndex(_task.path, workloadOptions(_task.seed, _task.shortage));
     if (!_index) reopen();
     say(Report::opened);
     for (uint32_t number = _task.first;; ++number) {

@@ -17,9 +17,12 @@ struct Operation {
   std::vector<uint32_t> offsets;
 };
 
-// What one database is put through. Both follow from the seed alone, so that the process that does
-// the work and the one that checks it need not tell each other.
-[[nodiscard]] salt::Index::Options workloadOptions(uint32_t seed);
+// How a worker is kept from writing at times.
+enum class Shortage { none, fileSize, fullDisk };
+
+// What one database is put through. It follows from these arguments alone, so that the process that
+// does the work and the one that checks it need not tell each other.
+[[nodiscard]] salt::Index::Options workloadOptions(uint32_t seed, Shortage shortage);
 [[nodiscard]] Operation workloadOperation(uint32_t seed, uint32_t number);
 
 // The answers of index and model.
@@ -33,9 +36,6 @@ enum class Report : char {
   refused = 'f',  // the operation was answered with false for good
   failed = 'x',   // there was no space; the operation will be tried again
 };
-
-// How a worker is kept from writing at times.
-enum class Shortage { none, fileSize, fullDisk };
 
 // What a worker is told on its command line.
 struct WorkerTask {
