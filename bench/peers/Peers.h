@@ -63,14 +63,20 @@ using Search = std::function<bench::TimedSearch(const std::string& query)>;
 // Warms up, then runs the queries twice and enters what that took into the figures.
 void timeQueries(const Workload& work, const Search& search, Figures& figures);
 
+// Queries that began and ended while one and the same merge ran.
+struct DuringMerge {
+  SearchTimes times;
+  uint64_t merges = 0;    // that ran during those queries
+  uint64_t mailsFed = 0;  // indexed meanwhile
+};
+
 // This daemon.
 struct TallowFigures : Figures {
   double settleSeconds = 0;  // from the last mail until all merges have ended
   uint64_t settleMerges = 0;
   double anonymousPeak = kUnknown;  // RssAnon, in bytes, of the daemon at any time
-  SearchTimes duringMerge;          // of queries that began and ended while one and the same ran
-  uint64_t merges = 0;              // that ran during those queries
-  uint64_t mailsFed = 0;            // indexed meanwhile
+  DuringMerge duringMerge;          // no mail comes in
+  DuringMerge duringIngest;         // another client indexes mail, too
 };
 [[nodiscard]] TallowFigures measureTallow(const Workload& work);
 

@@ -107,17 +107,21 @@ void printSystem(const std::string& name, const Figures& figures, const std::str
       megabytes(figures.residentPeak), queryText(figures), figures.startSeconds * 1e3, more));
 }
 
+void printDuringMerge(const char* name, const peers::DuringMerge& figures) {
+  printLine(fmt::format(
+      "{0}_p50_ms={1:.2f} {0}_p95_ms={2:.2f} {0}_max_ms={3:.2f} queries={4} "
+      "merges={5} mails_fed={6}",
+      name, milliseconds(figures.times, 0.5), milliseconds(figures.times, 0.95),
+      milliseconds(figures.times, 1), figures.times.queries(), figures.merges, figures.mailsFed));
+}
+
 void printTallow(const peers::TallowFigures& tallow) {
   printSystem(
       "tallow", tallow,
       fmt::format(" rss_anon_peak_mb={:.1f} settle_s={:.1f} merges={}",
                   megabytes(tallow.anonymousPeak), tallow.settleSeconds, tallow.settleMerges));
-  printLine(
-      fmt::format("during_merge_p50_ms={:.2f} during_merge_p95_ms={:.2f} "
-                  "during_merge_max_ms={:.2f} queries={} merges={} mails_fed={}",
-                  milliseconds(tallow.duringMerge, 0.5), milliseconds(tallow.duringMerge, 0.95),
-                  milliseconds(tallow.duringMerge, 1), tallow.duringMerge.queries(), tallow.merges,
-                  tallow.mailsFed));
+  printDuringMerge("during_merge", tallow.duringMerge);
+  printDuringMerge("during_merge_and_ingest", tallow.duringIngest);
 }
 
 void printEncoded(const Workload& work, const peers::EncodedFigures& encoded) {

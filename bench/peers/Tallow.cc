@@ -84,11 +84,10 @@ class Feeder {
 
   // Goes on in a thread, in small calls, as mail comes in.
   void start() {
-    _mails = 0;
     _thread = std::thread([this] { feed(); });
   }
 
-  // Returns how many mails the thread has sent since `start`; throws what it has met.
+  // Returns how many mails were sent since the latest stop; throws what the thread has met.
   uint64_t stop() {
     end();
     _stopping = false;
@@ -167,22 +166,22 @@ void indexByClient(const Workload& work, bench::DaemonRun& daemon, const std::st
   figures.residentPeak = static_cast<double>(daemon.memory().residentPeak);
 }
 
-// Asks one query after another while mail comes in. Between merges, mail comes in faster until
-// there is the next one. A query that a merge does not outlast does not count.
-void timeDuringMerge(const Workload& work, const bench::DaemonRun& daemon, const Search& search,
-                     TallowFigures& figures) {
-  Feeder feeder(daemon, work.spoolPath);
+// Asks one query after another while merges run, with mail coming in as well or with none. Between
+// merges, mail comes in until there is the next one, and nothing is asked. A query that a merge
+// does not outlast does not count.
+void timeDuringMerge(std::span<const std::string> queries, bool feeding, Feeder& feeder,
+                     const bench::DaemonRun& daemon, const Search& search, DuringMerge& figures) {
   std::optional<pid_t> latest;
-  for (const std::string& query : work.duringMerge) {
+  for (const std::string& query : queries) {
     if (!mergeThread(daemon)) {
       figures.mailsFed += feeder.stop();
       if (!feeder.startMerge()) return;
-      feeder.start();
+      if (feeding) feeder.start();
     }
     const std::optional<pid_t> merge = mergeThread(daemon);
     const bench::TimedSearch answer = search(query);
     if (!merge || mergeThread(daemon) != merge) continue;
-    figures.duringMerge.add(answer);
+    figures.times.add(answer);
     if (latest != merge) ++figures.merges;
     latest = merge;
   }
@@ -211,7 +210,11 @@ TallowFigures measureTallow(const Workload& work) {
     return bench::timedSearch(service, query);
   };
   timeQueries(work, search, figures);
-  timeDuringMerge(work, daemon, search, figures);
+  Feeder feeder(daemon, work.spoolPath);
+  const std::span<const std::string> queries(work.duringMerge);
+  const size_t half = queries.size() / 2;
+  timeDuringMerge(queries.first(half), false, feeder, daemon, search, figures.duringMerge);
+  timeDuringMerge(queries.subspan(half), true, feeder, daemon, search, figures.duringIngest);
 
   figures.anonymousPeak = static_cast<double>(daemon.memory().anonymousPeak);
   daemon.stop();
