@@ -9,6 +9,7 @@
 #include "daemon/TALDaemon.h"
 #include "daemon/TLDeviceLockMonitor.h"
 #include "platform/Files.h"
+#include "platform/Memory.h"
 #include "platform/Paths.h"
 #include "platform/ProcessLock.h"
 #include "platform/Queue.h"
@@ -42,6 +43,7 @@ int fail(const std::optional<TLError>& error) {
 
 int main() {
   umask(kPrivateUmask);
+  platform::limitMemoryArenas();
   platform::raiseDescriptorLimit();  // each class may hold a thousand table files open
   // Before any thread starts, so that all threads inherit it.
   for (const int signal : kEndingSignals) platform::takeSignalFromProcess(signal);

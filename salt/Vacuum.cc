@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <system_error>
 
+#include "platform/Memory.h"
 #include "platform/Queue.h"
 #include "salt/IndexImpl.h"
 #include "salt/Merge.h"
@@ -67,6 +68,7 @@ void index::runMerge(uint8_t shard) {
   platform::setThreadName("tallow-merge");
   const auto start = Clock::now();
   Merge(*this, shard).run();
+  platform::returnFreeMemory();
   if (op.CompactAfterVacuum) {
     Compact();
   } else if (hotPartIsSparse()) {
