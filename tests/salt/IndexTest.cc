@@ -274,19 +274,28 @@ TEST(Open, FailsWithoutADatabaseOrWithoutItsRecords) {
   EXPECT_DEATH(static_cast<void>(loadIndex(directory / "i")), "status\\.ok\\(\\)");
 }
 
-// An index as this format's first release wrote it, with a hot part, a page and a deleted document.
+// An index as this format's first release wrote it: three documents merged into a page, a suffix
+// that is hot, and a document deleted since.
 TEST(Open, ReadsTheKeptIndexOfItsVersion) {
   const TemporaryDirectory directory;
   std::filesystem::copy(SALT_TEST_DATA "/v304", directory / "i");
   const auto index = loadIndex(directory / "i");
   ASSERT_TRUE(index);
   EXPECT_TRUE(index->Validate());
-  EXPECT_THAT(scan(*index, ""), ElementsAre("1,12:0", "300,200:0", "1,12:6", "300,12:0", "1,12:0"));
-  EXPECT_THAT(scan(*index, "alpha beta gam"), ElementsAre("1,12:0", "1,12:0"));
+  EXPECT_THAT(scan(*index, ""),
+              ElementsAre("300,200:0", "300,12:0", "1,12:0", "300,12:6", "1,12:6", "1,12:11"));
+  EXPECT_THAT(scan(*index, "alpha beta gam"), ElementsAre("1,12:0"));
+  EXPECT_THAT(index->Dump(),
+              testing::HasSubstr("-- SALT INDEX (HOT)\n"
+                                 "---- [300,200:0]: \"beta\"\n"
+                                 "-- SALT INDEX (SHARD 1)\n"
+                                 "---- [300,12:0]: \"alpha beta delta\"\n"
+                                 "---- [1,12:0 (11)+\"ga\"]: \"alpha beta gamma\"\n"));
   const Index::Metrics m = index->GetMetrics();
   EXPECT_EQ(m.Docs, 2u);
   EXPECT_EQ(m.DeletedDocs, 1u);
-  EXPECT_EQ(m.Suffixes, 6u);
+  EXPECT_EQ(m.Suffixes, 8u);
+  EXPECT_EQ(m.HotSuffixes, 1u);
   EXPECT_EQ(m.Pages, 1u);
 }
 
