@@ -185,7 +185,7 @@ bool index::DeleteDoc(uint32_t docID) {
   const auto add = [&bytes](uint32_t id) {
     bytes.append(reinterpret_cast<const char*>(&id), sizeof id);
   };
-  before->forEach([&add](const DeletedDoc& doc) { add(doc.docID); });
+  before->forEach(add);
   add(docID);
   leveldb::WriteBatch batch;
   batch.Put(kDeletedKey, bytes);
@@ -193,10 +193,10 @@ bool index::DeleteDoc(uint32_t docID) {
     Log.error("Error writing to db: {}", status.ToString());
     return false;
   }
-  DeletedDocs after = *before;
-  after.insert({docID});
+  DocSet after = *before;
+  after.insert(docID);
   platform::MutexLock metricsLock(_metricsMutex);
-  _deleted = std::make_shared<const DeletedDocs>(std::move(after));
+  _deleted = std::make_shared<const DocSet>(std::move(after));
   ++_pageGeneration;
   return true;
 }

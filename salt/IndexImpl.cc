@@ -34,7 +34,7 @@ index::index(Database opened)
       _writer(_database.db.get()),
       db(_database.db.get()),
       _batch(std::in_place),
-      _deleted(std::make_shared<const DeletedDocs>()) {
+      _deleted(std::make_shared<const DocSet>()) {
   std::string bytes;
   leveldb::Status status = db->Get(leveldb::ReadOptions(), kMetricsKey, &bytes);
   if (!status.ok() || !parseRecord(bytes, &metrics)) return;
@@ -46,13 +46,13 @@ index::index(Database opened)
   status = db->Get(leveldb::ReadOptions(), kDeletedKey, &bytes);
   if (status.IsNotFound()) return;
   TL_ASSERT(status.ok());
-  DeletedDocs deleted;
+  DocSet deleted;
   for (size_t at = 0; at + sizeof(uint32_t) <= bytes.size(); at += sizeof(uint32_t)) {
-    DeletedDoc doc;
-    std::memcpy(&doc.docID, bytes.data() + at, sizeof doc.docID);
-    if (doc.docID != 0 && !deleted.contains(doc.docID)) deleted.insert(doc);
+    uint32_t docID = 0;
+    std::memcpy(&docID, bytes.data() + at, sizeof docID);
+    if (docID != 0 && !deleted.contains(docID)) deleted.insert(docID);
   }
-  _deleted = std::make_shared<const DeletedDocs>(std::move(deleted));
+  _deleted = std::make_shared<const DocSet>(std::move(deleted));
 }
 
 Index* NewIndex(const Index::Options& options) {
@@ -127,7 +127,7 @@ std::string index::GetSuffixText(const SuffixMeta& meta) const {
   return std::string(fullText(meta, leveldb::ReadOptions(), &zoneText));
 }
 
-std::shared_ptr<const DeletedDocs> index::deletedDocs() const {
+std::shared_ptr<const DocSet> index::deletedDocs() const {
   platform::MutexLock lock(_metricsMutex);
   return _deleted;
 }

@@ -13,7 +13,7 @@
 #include "platform/Mutex.h"
 #include "salt/Coding.h"
 #include "salt/Database.h"
-#include "salt/DocTable.h"
+#include "salt/DocSet.h"
 #include "salt/Index.h"
 #include "salt/ScanMemory.h"
 
@@ -22,11 +22,6 @@ namespace salt {
 class IndexView;
 class PlaceSet;
 struct ScanCounts;
-
-struct DeletedDoc {
-  uint32_t docID = 0;
-};
-using DeletedDocs = DocTable<DeletedDoc>;
 
 inline constexpr char kDeletedKey[] =
     "\xFF"
@@ -123,7 +118,7 @@ class index final : public Index {
       TL_REQUIRES(_writeMutex);
   [[nodiscard]] std::chrono::nanoseconds throttle(Clock::duration held) TL_REQUIRES(_metricsMutex);
 
-  [[nodiscard]] std::shared_ptr<const DeletedDocs> deletedDocs() const TL_EXCLUDES(_metricsMutex);
+  [[nodiscard]] std::shared_ptr<const DocSet> deletedDocs() const TL_EXCLUDES(_metricsMutex);
 
   // Writes the batch together with the metrics and clears it. A failure is logged.
   [[nodiscard]] bool writeMetrics(leveldb::WriteBatch* batch) TL_REQUIRES(_metricsMutex);
@@ -174,7 +169,7 @@ class index final : public Index {
 
   // Replaced as a whole by each deletion, under both mutexes, so that a view keeps the set of its
   // moment. A deletion writes the whole set anyway.
-  std::shared_ptr<const DeletedDocs> _deleted TL_GUARDED_BY(_metricsMutex);
+  std::shared_ptr<const DocSet> _deleted TL_GUARDED_BY(_metricsMutex);
 
   // Counts what changes the pages or hides documents in them: commits of merges and deletions.
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
@@ -209,7 +204,7 @@ class IndexView {
   leveldb::ReadOptions options;
   std::unique_ptr<leveldb::Iterator> iterator;  // never null
   Index::Metrics metrics;
-  std::shared_ptr<const DeletedDocs> deleted;
+  std::shared_ptr<const DocSet> deleted;
   uint64_t pageGeneration = 0;
 };
 
