@@ -150,7 +150,8 @@ void Merge::commit(bool final) {
   if (_failed) return;
   if (_pending.size() > _idx.op.MaxPageSuffixes) flushPage(_pending.size() / 2);
   if (!_pending.empty()) flushPage(_pending.size());
-  if (!final && _batch.ApproximateSize() < _idx.op.MaxBatchBytes) return;
+  if (!_zoneTexts.good()) _failed = true;
+  if (_failed || (!final && _batch.ApproximateSize() < _idx.op.MaxBatchBytes)) return;
   if (!_idx.commitMerge(&_batch, _hotMerged, _pageDelta)) _failed = true;
   _hotMerged = 0;
   _pageDelta = 0;

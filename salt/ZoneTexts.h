@@ -29,6 +29,9 @@ class ZoneTexts {
   // The whole text of a zone, empty when there is none. Lives until the next call.
   [[nodiscard]] std::string_view find(uint32_t docID, uint16_t zoneID);
 
+  // False once a read has failed, which looks like a text that is not there.
+  [[nodiscard]] bool good() const { return _iterator->status().ok(); }
+
  private:
   using Texts = std::unordered_map<uint64_t, std::string>;
 
