@@ -35,6 +35,11 @@ inline uint32_t readVarint(std::string_view& s) {
   }
 }
 
+// The byte, or 0 past the end, as `extra` has it.
+inline uint8_t byteAt(std::string_view text, size_t at) {
+  return at < text.size() ? static_cast<uint8_t>(text[at]) : 0;
+}
+
 // How many bytes of `text` are the text of a suffix that begins there: up to the first NUL, to the
 // first blank (kept) at or past MinMatchLen, and to MaxMatchLen.
 [[nodiscard]] size_t suffixLength(std::string_view text, const Index::OptionsBlock& op);

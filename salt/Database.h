@@ -57,6 +57,14 @@ class BatchWriter {
   bool _logTorn TL_GUARDED_BY(_mutex) = false;
 };
 
+// With `fillCache` false the reads do not displace the block cache.
+inline leveldb::ReadOptions readOptions(bool fillCache) {
+  leveldb::ReadOptions options;
+  options.verify_checksums = false;
+  options.fill_cache = fillCache;
+  return options;
+}
+
 inline leveldb::Slice slice(std::string_view bytes) {
   return {bytes.data(), bytes.size()};
 }

@@ -178,9 +178,8 @@ bool index::writeMetrics(leveldb::WriteBatch* batch) {
   return status.ok();
 }
 
-IndexView::IndexView(const index& owner, bool fillCache) : idx(owner) {
-  options.verify_checksums = false;
-  options.fill_cache = fillCache;
+IndexView::IndexView(const index& owner, bool fillCache)
+    : idx(owner), options(readOptions(fillCache)) {
   platform::MutexLock lock(owner._metricsMutex);
   iterator.reset(owner.db->NewIterator(options));
   metrics = owner.metrics;

@@ -7,10 +7,6 @@ namespace salt {
 
 namespace {
 
-uint8_t byteAt(std::string_view text, size_t at) {
-  return at < text.size() ? static_cast<uint8_t>(text[at]) : 0;
-}
-
 // The length of the common prefix of what is known of both, of which `from` bytes are equal.
 size_t commonPrefix(std::string_view left, std::string_view right, size_t from) {
   const size_t limit = std::min(left.size(), right.size());
@@ -28,8 +24,8 @@ Merge::Merge(index& owner, uint8_t shard)
       _zoneTexts(owner),
       _old(_oldView, shard, &_zoneTexts),
       _hot(_hotView, 0),
-      _previous(owner, _oldView.options, &_zoneTexts),
-      _first(owner, _oldView.options, &_zoneTexts) {}
+      _previous(owner, &_zoneTexts),
+      _first(owner, &_zoneTexts) {}
 
 void Merge::run() {
   const size_t pageSuffixes = _idx.op.MaxPageSuffixes;

@@ -31,11 +31,10 @@ class PrefixScan {
     }
   }
 
-  void hotPlaces(PlaceSet* places) {
-    visitShard(0, [&] { return visitHotPlaces(places); });
+  // Both are false when a read has failed, which ends the scan.
+  bool hotPlaces(PlaceSet* places) {
+    return visitShard(0, [&] { return visitHotPlaces(places); });
   }
-
-  // False when a read has failed.
   bool pagePlaces(PlaceSet* places) {
     bool good = true;
     for (unsigned shard = 1; good && shard <= _view.lastShard(); ++shard) {
@@ -155,13 +154,14 @@ std::optional<uint64_t> index::ScanPlaces(
   prefix = prefix.substr(0, suffixLength(prefix, op));
   PrefixScan scan(view, prefix);
   PlaceSet hot;
-  scan.hotPlaces(&hot);
+  const bool good = scan.hotPlaces(&hot);
   hot.deliver(callback);
   scan.counts.results = hot.suffixes();
-  if (const auto known = _scanMemory.find(prefix, view.pageGeneration)) {
+  const auto known = good ? _scanMemory.find(prefix, view.pageGeneration) : nullptr;
+  if (known) {
     PlaceSet::deliver(known->places, callback);
     scan.counts.results += known->suffixes;
-  } else {
+  } else if (good) {
     PlaceSet pages;
     const bool complete = scan.pagePlaces(&pages);
     pages.deliver(callback);

@@ -9,20 +9,11 @@
 
 namespace salt {
 
-namespace {
-
 // The few texts that a walk completes are scattered: their blocks would displace those of the walk,
 // which the next token, often a longer or shorter form of this one, goes through again.
-leveldb::ReadOptions sparingTheCache(leveldb::ReadOptions options) {
-  options.fill_cache = false;
-  return options;
-}
-
-}  // namespace
-
-Suffix::Suffix(const index& owner, const leveldb::ReadOptions& readOptions, ZoneTexts* zoneTexts)
+Suffix::Suffix(const index& owner, ZoneTexts* zoneTexts)
     : idx(owner),
-      options(sparingTheCache(readOptions)),
+      options(readOptions(false)),
       _zoneTexts(zoneTexts),
       _text(std::make_unique<char[]>(owner.op.MaxMatchLen)) {}
 
@@ -91,10 +82,7 @@ int Suffix::compareWithPrefix(std::string_view prefix) {
 }
 
 ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts)
-    : idx(view.idx),
-      shard(shardNumber),
-      iterator(view.iterator.get()),
-      suffix(idx, view.options, zoneTexts) {}
+    : idx(view.idx), shard(shardNumber), iterator(view.iterator.get()), suffix(idx, zoneTexts) {}
 
 void ShardCursor::moveTo(uint8_t shardNumber) {
   shard = shardNumber;

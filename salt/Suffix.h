@@ -21,8 +21,7 @@ class ZoneTexts;
 class Suffix {
  public:
   // Reads zone texts from `zoneTexts`, or from the database when that is null.
-  Suffix(const index& owner, const leveldb::ReadOptions& readOptions,
-         ZoneTexts* zoneTexts = nullptr);
+  explicit Suffix(const index& owner, ZoneTexts* zoneTexts = nullptr);
   Suffix(const Suffix&) = delete;
   // Copies the suffix, not where it is read from nor the count of fetches.
   Suffix& operator=(const Suffix& suffix);

@@ -15,10 +15,6 @@ namespace {
 constexpr size_t kDumpedTextBytes = 16;
 constexpr size_t kDumpPieceBytes = 64 * 1024;
 
-uint8_t byteAt(std::string_view text, size_t at) {
-  return at < text.size() ? static_cast<uint8_t>(text[at]) : 0;
-}
-
 // What is wrong with `text` and its place after `previous`, or null. A suffix that its page derives
 // from the one before must also have the right common prefix and extra bytes.
 const char* fault(std::string_view previous, const SuffixMeta& previousMeta, std::string_view text,

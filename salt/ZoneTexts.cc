@@ -11,15 +11,9 @@ uint64_t idOf(uint32_t docID, uint16_t zoneID) {
   return uint64_t{docID} << 16 | zoneID;
 }
 
-leveldb::ReadOptions sparingTheCache() {
-  leveldb::ReadOptions options;
-  options.fill_cache = false;
-  return options;
-}
-
 }  // namespace
 
-ZoneTexts::ZoneTexts(const index& owner) : _iterator(owner.db->NewIterator(sparingTheCache())) {}
+ZoneTexts::ZoneTexts(const index& owner) : _iterator(owner.db->NewIterator(readOptions(false))) {}
 
 std::string_view ZoneTexts::find(uint32_t docID, uint16_t zoneID) {
   const uint64_t id = idOf(docID, zoneID);
@@ -31,13 +25,14 @@ std::string_view ZoneTexts::find(uint32_t docID, uint16_t zoneID) {
 }
 
 std::string_view ZoneTexts::keep(uint64_t id, std::string text) {
-  if (_youngerBytes + text.size() > kKeptBytes / 2) {
+  const size_t bytes = text.size() + kTextOverhead;
+  if (_youngerBytes + bytes > kKeptBytes / 2) {
     _full = !_older.empty();
     _older = std::move(_younger);
     _younger.clear();
     _youngerBytes = 0;
   }
-  _youngerBytes += text.size();
+  _youngerBytes += bytes;
   return _younger.insert_or_assign(id, std::move(text)).first->second;
 }
 

@@ -19,7 +19,7 @@ class index;
 // neighbouring numbers mostly share a shard, so that a read that misses goes on for a stretch until
 // the memory is full for the first time; a shard with more text than that reads one by one.
 //
-// Memory: kKeptBytes of text at most, and one zone. The texts are in two generations: when the
+// Memory: kKeptBytes at most, and one zone. The texts are in two generations: when the
 // younger has its half of the bytes it becomes the older, and what was not used since is dropped.
 // One thread. The index outlives it.
 class ZoneTexts {
@@ -36,6 +36,7 @@ class ZoneTexts {
   using Texts = std::unordered_map<uint64_t, std::string>;
 
   static constexpr size_t kKeptBytes = 32 * 1024 * 1024;
+  static constexpr size_t kTextOverhead = 96;  // table and allocator, roughly
   static constexpr size_t kReadAheadBytes = 64 * 1024;
 
   std::string_view keep(uint64_t id, std::string text);
