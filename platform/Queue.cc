@@ -2,6 +2,8 @@
 
 #include <pthread.h>
 #include <sched.h>
+#include <sys/resource.h>
+#include <unistd.h>
 
 #include <latch>
 #include <utility>
@@ -11,12 +13,18 @@ namespace platform {
 namespace {
 
 constexpr size_t kLongestThreadName = 15;
+constexpr int kBackgroundNiceness = 10;  // a weight of 110 where ordinary threads have 1024
 
 }  // namespace
 
 void setThreadName(const std::string& name) {
   const size_t cut = name.size() > kLongestThreadName ? name.size() - kLongestThreadName : 0;
   pthread_setname_np(pthread_self(), name.c_str() + cut);
+}
+
+// Linux has a niceness for each thread.
+void lowerThreadPriority() {
+  setpriority(PRIO_PROCESS, static_cast<id_t>(gettid()), kBackgroundNiceness);
 }
 
 SerialQueue::SerialQueue(std::string name, QueuePriority priority)

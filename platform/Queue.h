@@ -55,4 +55,8 @@ class SerialQueue {
 // Names the calling thread by the last 15 bytes of `name`.
 void setThreadName(const std::string& name);
 
+// From here on the calling thread leaves the processors to threads of ordinary priority as long as
+// these have work, but for a tenth.
+void lowerThreadPriority();
+
 }  // namespace platform

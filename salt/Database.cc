@@ -74,8 +74,9 @@ Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* file
   result.path = path;
   result.logger = std::make_unique<LeveldbLogger>();
   result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
+  result.files = std::make_unique<IndexFiles>(files);
   leveldb::Options options;
-  options.env = files;
+  options.env = result.files.get();
   options.write_buffer_size = kWriteBufferBytes;
   options.block_cache = result.cache.get();
   options.block_size = kBlockBytes;

@@ -11,6 +11,7 @@
 
 #include "platform/Log.h"
 #include "platform/Mutex.h"
+#include "salt/IndexFiles.h"
 
 namespace salt {
 
@@ -22,9 +23,11 @@ class LeveldbLogger final : public leveldb::Logger {
   void Logv(const char* format, va_list arguments) override;
 };
 
-// An open database with what it needs to live; goes down in the order database, cache, logger.
+// An open database with what it needs to live; goes down in the order database, cache, logger,
+// files.
 struct Database {
   std::string path;
+  std::unique_ptr<IndexFiles> files;
   std::unique_ptr<leveldb::Logger> logger;
   std::unique_ptr<leveldb::Cache> cache;
   std::unique_ptr<leveldb::DB> db;  // null when opening failed

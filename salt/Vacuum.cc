@@ -66,6 +66,7 @@ void index::startMerge(uint8_t shard) {
 
 void index::runMerge(uint8_t shard) {
   platform::setThreadName("tallow-merge");
+  platform::lowerThreadPriority();
   const auto start = Clock::now();
   Merge(*this, shard).run();
   platform::returnFreeMemory();

@@ -1,0 +1,156 @@
+#include "salt/IndexFiles.h"
+
+#include <string_view>
+#include <utility>
+
+namespace salt {
+
+namespace {
+
+constexpr size_t kMostUnsyncedTables = 4;
+
+bool isTable(std::string_view path) {
+  return path.ends_with(".ldb");
+}
+
+bool isManifest(std::string_view path) {
+  return path.substr(path.rfind('/') + 1).starts_with("MANIFEST-");
+}
+
+}  // namespace
+
+// A table is complete when it is synced: what comes then is the closing.
+class IndexFiles::Table final : public leveldb::WritableFile {
+ public:
+  Table(IndexFiles* files, leveldb::WritableFile* file) : _files(*files), _file(file) {}
+
+  leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
+  leveldb::Status Flush() override { return _file->Flush(); }
+
+  // All can be read from here on.
+  leveldb::Status Sync() override {
+    _complete = true;
+    return _file->Flush();
+  }
+
+  leveldb::Status Close() override {
+    if (!_complete) return _file->Close();
+    _files.finish(std::move(_file));
+    return {};
+  }
+
+ private:
+  IndexFiles& _files;
+  std::unique_ptr<leveldb::WritableFile> _file;  // null once it is closed
+  bool _complete = false;
+};
+
+class IndexFiles::Manifest final : public leveldb::WritableFile {
+ public:
+  Manifest(IndexFiles* files, leveldb::WritableFile* file) : _files(*files), _file(file) {}
+
+  leveldb::Status Append(const leveldb::Slice& bytes) override {
+    return later([file = _file, copy = bytes.ToString()] { return file->Append(copy); });
+  }
+  leveldb::Status Flush() override {
+    return later([file = _file] { return file->Flush(); });
+  }
+  leveldb::Status Sync() override {
+    return later([file = _file] { return file->Sync(); });
+  }
+  leveldb::Status Close() override {
+    return later([file = _file] { return file->Close(); });
+  }
+
+ private:
+  leveldb::Status later(Step step) {
+    _files.inOrder(std::move(step));
+    return _files.failure();
+  }
+
+  IndexFiles& _files;
+  const std::shared_ptr<leveldb::WritableFile> _file;  // steps keep it
+};
+
+IndexFiles::IndexFiles(leveldb::Env* files)
+    : EnvWrapper(files),
+      _steps("tallow-files"),
+      _work("tallow-leveldb", platform::QueuePriority::background) {
+  _work.async(platform::lowerThreadPriority);
+}
+
+leveldb::Status IndexFiles::NewWritableFile(const std::string& path, leveldb::WritableFile** file) {
+  const leveldb::Status status = target()->NewWritableFile(path, file);
+  if (!status.ok()) return status;
+  if (isTable(path)) {
+    *file = new Table(this, *file);
+  } else if (isManifest(path)) {
+    *file = new Manifest(this, *file);
+  }
+  return status;
+}
+
+leveldb::Status IndexFiles::NewAppendableFile(const std::string& path,
+                                              leveldb::WritableFile** file) {
+  const leveldb::Status status = target()->NewAppendableFile(path, file);
+  if (status.ok() && isManifest(path)) *file = new Manifest(this, *file);
+  return status;
+}
+
+// leveldb asks again after each compaction for what it finds there and does not need.
+leveldb::Status IndexFiles::RemoveFile(const std::string& path) {
+  inOrder([this, path] {
+    (void)target()->RemoveFile(path);
+    return leveldb::Status();
+  });
+  return {};
+}
+
+leveldb::Status IndexFiles::RenameFile(const std::string& from, const std::string& to) {
+  _steps.drain();
+  const leveldb::Status status = failure();
+  return status.ok() ? target()->RenameFile(from, to) : status;
+}
+
+leveldb::Status IndexFiles::UnlockFile(leveldb::FileLock* lock) {
+  _steps.drain();
+  return target()->UnlockFile(lock);
+}
+
+void IndexFiles::Schedule(void (*work)(void*), void* argument) {
+  _work.async([work, argument] { work(argument); });
+}
+
+void IndexFiles::inOrder(Step step) {
+  _steps.async([this, step = std::move(step)] {
+    if (!failure().ok()) return;
+    const leveldb::Status status = step();
+    platform::MutexLock lock(_mutex);
+    if (_failure.ok()) _failure = status;
+  });
+}
+
+leveldb::Status IndexFiles::failure() {
+  platform::MutexLock lock(_mutex);
+  return _failure;
+}
+
+void IndexFiles::finish(std::unique_ptr<leveldb::WritableFile> table) {
+  {
+    platform::MutexLock lock(_mutex);
+    while (_tables == kMostUnsyncedTables) _tableDone.wait(_mutex);
+    ++_tables;
+  }
+  inOrder([file = std::shared_ptr<leveldb::WritableFile>(std::move(table))] {
+    const leveldb::Status status = file->Sync();
+    const leveldb::Status closed = file->Close();
+    return status.ok() ? closed : status;
+  });
+  _steps.async([this] {
+    platform::MutexLock lock(_mutex);
+    --_tables;
+    _tableDone.notify_one();
+  });
+}
+
+}  // namespace salt

@@ -1,0 +1,175 @@
+#include <gtest/gtest.h>
+#include <leveldb/env.h>
+
+#include <atomic>
+#include <filesystem>
+#include <map>
+#include <random>
+
+#include "platform/Mutex.h"
+#include "salt/IndexImpl.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/TemporaryDirectory.h"
+
+// The power goes while leveldb writes tables and removes what they replace.
+namespace {
+
+using salt::Index;
+using testsupport::TemporaryDirectory;
+
+// Knows how much of each file is sure to be on the disk, and takes pictures of the directory as it
+// would be found if the power went now: each time a file is gone, or a manifest has grown. A
+// manifest reaches the disk sooner than it must, a table not before it is synced.
+class Disk final : public leveldb::EnvWrapper {
+ public:
+  struct Picture {
+    std::string path;
+    uint32_t acknowledged = 0;  // what the caller has set by then
+    bool logsLost = false;      // logs are never synced; in every second picture they are empty
+  };
+
+  explicit Disk(std::string pictures)
+      : leveldb::EnvWrapper(leveldb::Env::Default()), _directory(std::move(pictures)) {}
+
+  std::atomic<uint32_t> acknowledged{0};
+
+  [[nodiscard]] std::vector<Picture> pictures() {
+    platform::MutexLock lock(_mutex);
+    return _pictures;
+  }
+
+  leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override {
+    return wrap(path, target()->NewWritableFile(path, file), file);
+  }
+  leveldb::Status NewAppendableFile(const std::string& path,
+                                    leveldb::WritableFile** file) override {
+    return wrap(path, target()->NewAppendableFile(path, file), file);
+  }
+  leveldb::Status RemoveFile(const std::string& path) override {
+    const leveldb::Status status = target()->RemoveFile(path);
+    platform::MutexLock lock(_mutex);
+    if (_synced.erase(path) != 0) takePicture();
+    return status;
+  }
+  leveldb::Status RenameFile(const std::string& from, const std::string& to) override {
+    platform::MutexLock lock(_mutex);
+    _synced[to] = _synced[from];
+    _synced.erase(from);
+    return target()->RenameFile(from, to);
+  }
+
+ private:
+  class File final : public leveldb::WritableFile {
+   public:
+    File(Disk* disk, std::string path, leveldb::WritableFile* file)
+        : _disk(*disk), _path(std::move(path)), _file(file) {}
+
+    leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
+    leveldb::Status Flush() override {
+      const leveldb::Status status = _file->Flush();
+      if (_path.find("MANIFEST") != std::string::npos) _disk.manifestGrew(_path);
+      return status;
+    }
+    leveldb::Status Sync() override {
+      const leveldb::Status status = _file->Sync();
+      _disk.synced(_path);
+      return status;
+    }
+    leveldb::Status Close() override { return _file->Close(); }
+
+   private:
+    Disk& _disk;
+    const std::string _path;
+    const std::unique_ptr<leveldb::WritableFile> _file;
+  };
+
+  leveldb::Status wrap(const std::string& path, const leveldb::Status& status,
+                       leveldb::WritableFile** file) {
+    platform::MutexLock lock(_mutex);
+    _synced.emplace(path, 0);
+    if (status.ok()) *file = new File(this, path, *file);
+    return status;
+  }
+
+  void synced(const std::string& path) {
+    platform::MutexLock lock(_mutex);
+    _synced[path] = std::filesystem::file_size(path);
+  }
+
+  void manifestGrew(const std::string& path) {
+    platform::MutexLock lock(_mutex);
+    _synced[path] = std::filesystem::file_size(path);
+    takePicture();
+  }
+
+  void takePicture() TL_REQUIRES(_mutex) {
+    const std::string number = std::to_string(_pictures.size());
+    const Picture picture{_directory + '/' + number, acknowledged, _pictures.size() % 2 != 0};
+    std::filesystem::create_directories(picture.path);
+    for (const auto& [path, synced] : _synced) {
+      const std::filesystem::path file = path;
+      const auto copy = std::filesystem::path(picture.path) / file.filename();
+      if (file.extension() == ".ldb" && synced != 0) {
+        std::filesystem::create_hard_link(file, copy);  // it does not change any more
+        continue;
+      }
+      const bool whole = file.extension() == ".log" && !picture.logsLost;
+      std::filesystem::copy_file(file, copy);
+      if (!whole) std::filesystem::resize_file(copy, synced);
+    }
+    _pictures.push_back(picture);
+  }
+
+  const std::string _directory;
+  platform::Mutex _mutex;
+  std::map<std::string, uint64_t> _synced TL_GUARDED_BY(_mutex);  // bytes of files, by path
+  std::vector<Picture> _pictures TL_GUARDED_BY(_mutex);
+};
+
+constexpr uint32_t kWords = 1000;  // of a document
+
+void addDocs(Index& index, Disk& disk, uint32_t count) {
+  std::mt19937 random(5);
+  for (uint32_t docID = 1; docID <= count; ++docID) {
+    std::string text;
+    while (text.size() < kWords * 5) text += std::to_string(random() % 9000 + 1000) + ' ';
+    ASSERT_TRUE(salttest::addZone(index, docID, 1, text, salttest::wordOffsets(text)));
+    disk.acknowledged = docID;
+  }
+}
+
+TEST(PowerLoss, LeavesAnIndexThatLacksNoMoreThanTheLogs) {
+  const TemporaryDirectory directory;
+  Disk disk(directory / "pictures");
+  const std::string path = directory / "index";
+  Index::Options options;
+  options.MaxHotSuffixes = 50000;
+  salttest::newIndex(path, options).reset();
+  auto index = salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, &disk));
+  ASSERT_TRUE(index);
+  addDocs(*index, disk, 400);
+  index.reset();
+
+  uint32_t before = 0;
+  size_t opened = 0;
+  for (const Disk::Picture& picture : disk.pictures()) {
+    if (!std::filesystem::exists(picture.path + "/CURRENT")) continue;
+    const auto found = salttest::loadIndex(picture.path);
+    ASSERT_TRUE(found) << picture.path;
+    const Index::Metrics metrics = found->GetMetrics();
+    EXPECT_TRUE(found->Validate()) << picture.path;
+    EXPECT_EQ(metrics.Docs, metrics.MaxDocID);
+    EXPECT_EQ(metrics.Suffixes, uint64_t{metrics.MaxDocID} * kWords);
+    if (picture.logsLost) {
+      EXPECT_GE(metrics.MaxDocID, before) << picture.path;
+      before = metrics.MaxDocID;
+    } else {
+      EXPECT_GE(metrics.MaxDocID, picture.acknowledged) << picture.path;
+    }
+    ++opened;
+  }
+  EXPECT_GT(opened, 4u);
+  EXPECT_GT(before, 0u);
+}
+
+}  // namespace
