@@ -178,10 +178,10 @@ bool index::writeMetrics(leveldb::WriteBatch* batch) {
   return status.ok();
 }
 
-IndexView::IndexView(const index& owner, bool fillCache)
-    : idx(owner), options(readOptions(fillCache)) {
+IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
+    : idx(owner), options(readOptions(fillCache)), iterators(walks) {
   platform::MutexLock lock(owner._metricsMutex);
-  iterator.reset(owner.db->NewIterator(options));
+  for (auto& iterator : iterators) iterator.reset(owner.db->NewIterator(options));
   metrics = owner.metrics;
   deleted = owner._deleted;
   pageGeneration = owner._pageGeneration;

@@ -14,6 +14,7 @@
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/DocSet.h"
+#include "salt/Helper.h"
 #include "salt/Index.h"
 #include "salt/ScanMemory.h"
 
@@ -173,7 +174,8 @@ class index final : public Index {
 
   // Counts what changes the pages or hides documents in them: commits of merges and deletions.
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
-  mutable ScanMemory _scanMemory;  // synchronised by itself
+  mutable ScanMemory _scanMemory;  // synchronised by itself, as is the next
+  mutable Helper _scanHelper;
 
   // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is
   // taken with no other held.
@@ -181,8 +183,9 @@ class index final : public Index {
   std::thread _mergeThread TL_GUARDED_BY(_mergeThreadMutex);
 };
 
-// What every reader works from: one walk over the database, the metrics and the set of deleted
-// documents, all of the same moment. One thread; the index outlives it.
+// What every reader works from: one walk over the database or several, the metrics and the set of
+// deleted documents, all of the same moment. One thread, save that each walk may be another's; the
+// index outlives it.
 //
 // The iterator holds the keys of its moment by itself. A leveldb snapshot would, too, but while one
 // lives, a compaction keeps a removed key together with the mark that removes it, and may put the
@@ -192,8 +195,9 @@ class index final : public Index {
 // suffix reads the same.
 class IndexView {
  public:
-  // With `fillCache` false the reads do not displace the block cache.
-  IndexView(const index& owner, bool fillCache);
+  // With `fillCache` false the reads do not displace the block cache. There are `walks` iterators,
+  // for as many threads.
+  IndexView(const index& owner, bool fillCache, size_t walks = 1);
   IndexView(const IndexView&) = delete;
   IndexView& operator=(const IndexView&) = delete;
 
@@ -202,7 +206,7 @@ class IndexView {
 
   const index& idx;
   leveldb::ReadOptions options;
-  std::unique_ptr<leveldb::Iterator> iterator;  // never null
+  std::vector<std::unique_ptr<leveldb::Iterator>> iterators;  // none is null
   Index::Metrics metrics;
   std::shared_ptr<const DocSet> deleted;
   uint64_t pageGeneration = 0;

@@ -47,6 +47,16 @@ uint32_t PlaceSet::newBit(uint16_t zoneID) {
   return _bits[zoneID];
 }
 
+void PlaceSet::add(PlaceSet&& other) {
+  if (_suffixes == 0) std::swap(*this, other);
+  if (other._suffixes == 0) return;
+  const uint64_t suffixes = _suffixes + other._suffixes;
+  other.deliver([this](const Place* places, size_t count) {
+    for (const Place* place = places; place != places + count; ++place) add(*place);
+  });
+  _suffixes = suffixes;
+}
+
 // Number of zones, the zones, then for each document its distance from the one before and its mask.
 std::string PlaceSet::encode() const {
   std::string out;

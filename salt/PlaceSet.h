@@ -28,6 +28,9 @@ class PlaceSet {
     }
   }
 
+  // Both are of different suffixes.
+  void add(PlaceSet&& other);
+
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
 
   // The places in few bytes, documents in order; nothing when there are more zones than bits.

@@ -1,4 +1,6 @@
 #include <algorithm>
+#include <array>
+#include <atomic>
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
@@ -18,11 +20,11 @@ struct ScanCounts {
 
 namespace {
 
-// A scan of all shards for one prefix, cut already.
+// One walk through shards for one prefix, cut already.
 class PrefixScan {
  public:
-  PrefixScan(const IndexView& view, std::string_view prefix)
-      : _view(view), _prefix(prefix), _cursor(view, 0) {}
+  PrefixScan(const IndexView& view, std::string_view prefix, size_t walk = 0)
+      : _view(view), _prefix(prefix), _cursor(view, 0, nullptr, walk) {}
 
   // Calls `callback` for each suffix, until it returns false or a read fails.
   void suffixes(const std::function<bool(const SuffixMeta&)>& callback) {
@@ -35,12 +37,8 @@ class PrefixScan {
   bool hotPlaces(PlaceSet* places) {
     return visitShard(0, [&] { return visitHotPlaces(places); });
   }
-  bool pagePlaces(PlaceSet* places) {
-    bool good = true;
-    for (unsigned shard = 1; good && shard <= _view.lastShard(); ++shard) {
-      good = visitShard(shard, [&] { return visitPagePlaces(places); });
-    }
-    return good;
+  bool pagePlaces(unsigned shard, PlaceSet* places) {
+    return visitShard(shard, [&] { return visitPagePlaces(places); });
   }
 
   ScanCounts counts;
@@ -133,6 +131,62 @@ class PrefixScan {
   std::string _page;
 };
 
+// Walks through the pages of a scan at a time: a device has more processors, but while it searches
+// it indexes, too, and shows what it has found.
+constexpr size_t kPageWalks = 2;
+constexpr unsigned kFewShards = 2;  // are not worth waking a thread
+
+// What a scan for places has found.
+struct FoundPlaces {
+  PlaceSet hot;
+  PlaceSet pages;
+  bool complete = true;  // no read has failed
+  ScanCounts counts;
+
+  void add(FoundPlaces&& other) {
+    hot.add(std::move(other.hot));
+    pages.add(std::move(other.pages));
+    complete = complete && other.complete;
+    counts.fetches += other.counts.fetches;
+    counts.hotReads += other.counts.hotReads;
+    counts.pageReads += other.counts.pageReads;
+  }
+};
+
+// The walks of one scan through the shards, the hot part first. Each takes one shard after the
+// other of those that none has taken yet.
+class PlacesScan {
+ public:
+  PlacesScan(const IndexView& view, std::string_view prefix, bool withPages)
+      : _view(view), _prefix(prefix), _last(withPages ? view.lastShard() : 0) {}
+
+  [[nodiscard]] unsigned shards() const { return _last + 1; }
+
+  void walk(size_t number) {
+    FoundPlaces& found = _found[number];
+    PrefixScan scan(_view, _prefix, number);
+    for (unsigned shard = _next++; shard <= _last && found.complete; shard = _next++) {
+      found.complete =
+          shard == 0 ? scan.hotPlaces(&found.hot) : scan.pagePlaces(shard, &found.pages);
+    }
+    found.counts = scan.counts;
+  }
+
+  [[nodiscard]] FoundPlaces take() {
+    for (size_t number = 1; number < kPageWalks; ++number) {
+      _found.front().add(std::move(_found[number]));
+    }
+    return std::move(_found.front());
+  }
+
+ private:
+  const IndexView& _view;
+  const std::string_view _prefix;
+  const unsigned _last;
+  std::atomic<unsigned> _next{0};
+  std::array<FoundPlaces, kPageWalks> _found;
+};
+
 }  // namespace
 
 bool index::ScanPrefix(std::string_view prefix,
@@ -149,27 +203,30 @@ std::optional<uint64_t> index::ScanPlaces(
     std::string_view prefix, uint64_t limit,
     const std::function<void(const Place* places, size_t count)>& callback) const {
   const auto start = Clock::now();
-  const IndexView view(*this, true);
+  const IndexView view(*this, true, kPageWalks);
   if (view.metrics.Suffixes > limit) return std::nullopt;
   prefix = prefix.substr(0, suffixLength(prefix, op));
-  PrefixScan scan(view, prefix);
-  PlaceSet hot;
-  const bool good = scan.hotPlaces(&hot);
-  hot.deliver(callback);
-  scan.counts.results = hot.suffixes();
-  const auto known = good ? _scanMemory.find(prefix, view.pageGeneration) : nullptr;
+  const auto known = _scanMemory.find(prefix, view.pageGeneration);
+  PlacesScan scan(view, prefix, !known);
+  if (scan.shards() <= kFewShards) {
+    scan.walk(0);
+  } else {
+    _scanHelper.share([&scan](size_t walk) { scan.walk(walk); });
+  }
+  const FoundPlaces found = scan.take();
+  found.hot.deliver(callback);
+  ScanCounts counts = found.counts;
+  counts.results = found.hot.suffixes();
   if (known) {
     PlaceSet::deliver(known->places, callback);
-    scan.counts.results += known->suffixes;
-  } else if (good) {
-    PlaceSet pages;
-    const bool complete = scan.pagePlaces(&pages);
-    pages.deliver(callback);
-    scan.counts.results += pages.suffixes();
-    if (complete && !view.metrics.VacuumInProgress) remember(prefix, view, pages);
+    counts.results += known->suffixes;
+  } else {
+    found.pages.deliver(callback);
+    counts.results += found.pages.suffixes();
+    if (found.complete && !view.metrics.VacuumInProgress) remember(prefix, view, found.pages);
   }
-  countScan(start, scan.counts);
-  return scan.counts.results;
+  countScan(start, counts);
+  return counts.results;
 }
 
 void index::remember(std::string_view prefix, const IndexView& view, const PlaceSet& pages) const {
@@ -198,7 +255,7 @@ void index::ForEachZone(
 void index::forEachZone(
     const IndexView& view,
     const std::function<bool(uint32_t, uint16_t, std::string_view)>& callback) const {
-  leveldb::Iterator* const iterator = view.iterator.get();
+  leveldb::Iterator* const iterator = view.iterators.front().get();
   for (iterator->Seek(slice(textKey(0, 0).view())); iterator->Valid(); iterator->Next()) {
     uint32_t docID = 0;
     uint16_t zoneID = 0;

@@ -81,8 +81,12 @@ int Suffix::compareWithPrefix(std::string_view prefix) {
   }
 }
 
-ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts)
-    : idx(view.idx), shard(shardNumber), iterator(view.iterator.get()), suffix(idx, zoneTexts) {}
+ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts,
+                         size_t walk)
+    : idx(view.idx),
+      shard(shardNumber),
+      iterator(view.iterators[walk].get()),
+      suffix(idx, zoneTexts) {}
 
 void ShardCursor::moveTo(uint8_t shardNumber) {
   shard = shardNumber;

@@ -55,12 +55,13 @@ class Suffix {
   std::string _zoneText;                // of the latest fetch; kept for its memory
 };
 
-// A walk over the suffixes of one shard at a time, in order, with the iterator of a view. One
+// A walk over the suffixes of one shard at a time, in order, with an iterator of a view. One
 // thread. The view outlives it, and so do `zoneTexts`, which walks that complete many suffixes
 // give.
 class ShardCursor {
  public:
-  ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts = nullptr);
+  ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts = nullptr,
+              size_t walk = 0);
 
   // Goes on with another shard: the cursor stands nowhere and its counts are 0.
   void moveTo(uint8_t shardNumber);
