@@ -28,7 +28,7 @@ std::shared_ptr<TLQueryNode> inner(Merge mergeOp,
 
 class QueryProcessorTest : public testing::Test {
  protected:
-  QueryProcessorTest() : processor(TALQueryProcessor::initWithZoneManager(zoneManager)) {}
+  QueryProcessorTest() : processor(TALQueryProcessor::initWithZoneManager(zoneManager, nullptr)) {}
 
   std::vector<TALTerm> termsOfText(const TLString& text) const {
     TLQuery query;
