@@ -420,6 +420,7 @@ TEST_F(IndexerTest, SearchesAndStatisticsRunBesideIngest) {
   std::thread reader([&] {
     while (!done) {
       search("word");
+      search("wording ");  // rewritten, beside the batches
       static_cast<void>(indexer->docStats());
       static_cast<void>(indexer->saltMetrics());
     }
