@@ -46,8 +46,7 @@ enum class TALIndexerError {
 // `_textStoreMutex`, so
 //    holding either keeps it. `_queue` work that changes it takes both.
 // 2. A search holds `_indexMutex` for one pass, a batch for all its documents: they never overlap.
-// What
-//    changes the words of a query between two passes reads the index beside batches.
+//    What changes the words of a query between two passes reads the index beside batches.
 // 3. The document store is written before the text index. What a search finds in the index and not
 // in the
 //    store is left out.
