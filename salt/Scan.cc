@@ -150,15 +150,16 @@ std::optional<uint64_t> index::ScanPlaces(
     const std::function<void(const Place* places, size_t count)>& callback) const {
   const auto start = Clock::now();
   const IndexView view(*this, true);
-  if (view.metrics.Suffixes > limit) return std::nullopt;
   prefix = prefix.substr(0, suffixLength(prefix, op));
+  const auto known = _scanMemory.find(prefix, view.pageGeneration);
+  const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
+  if (most > limit) return std::nullopt;
   PrefixScan scan(view, prefix);
   PlaceSet hot;
   const bool good = scan.hotPlaces(&hot);
   hot.deliver(callback);
   scan.counts.results = hot.suffixes();
-  const auto known = good ? _scanMemory.find(prefix, view.pageGeneration) : nullptr;
-  if (known) {
+  if (good && known) {
     PlaceSet::deliver(known->places, callback);
     scan.counts.results += known->suffixes;
   } else if (good) {
