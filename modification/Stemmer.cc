@@ -6,22 +6,27 @@
 
 namespace {
 
-// A suffix and what takes its place.
+// A suffix of two letters or more, and what takes its place.
 struct Rule {
   std::string_view suffix;
   std::string_view replacement;
+
+  // The last letter but one, as a number from 0.
+  [[nodiscard]] constexpr size_t group() const {
+    return static_cast<size_t>(suffix[suffix.size() - 2] - 'a');
+  }
 };
 
-// The rules of a step. Of several that fit, the longest counts. They stand sorted by the last
-// letter but one, longest first within it, so that a word looks at the few that share its own.
+// The rules of a step. Of several that fit, the longest counts. They stand sorted by group, longest
+// first within it, so that a word looks at the few that share its last letter but one.
 template <size_t N>
 class Rules {
  public:
   consteval explicit Rules(const Rule (&rules)[N]) {
     std::copy_n(rules, N, _rules.begin());
     for (size_t i = 0; i < N; ++i) {
-      if (i > 0 && groupOf(_rules[i]) < groupOf(_rules[i - 1])) throw "rules are not sorted";
-      for (size_t group = groupOf(_rules[i]) + 1; group < _begin.size(); ++group) {
+      if (i > 0 && rules[i].group() < rules[i - 1].group()) throw "rules are not sorted";
+      for (size_t group = rules[i].group() + 1; group < _begin.size(); ++group) {
         _begin[group] = static_cast<uint8_t>(i + 1);
       }
     }
@@ -34,10 +39,6 @@ class Rules {
   }
 
  private:
-  static consteval size_t groupOf(const Rule& rule) {
-    return static_cast<size_t>(rule.suffix[rule.suffix.size() - 2] - 'a');
-  }
-
   std::array<Rule, N> _rules{};
   std::array<uint8_t, 27> _begin{};  // of each letter's rules, and the end
 };

@@ -18,6 +18,7 @@ namespace {
 
 // A word with any of these is left out.
 constexpr TLStringView kUnacceptableCharSet = u"!~`@#$%^&*-+();:=_{}[],.<>?\\/|\"'0123456789";
+static_assert(kUnacceptableCharSet.size() == 42);
 
 // What ends a line.
 constexpr TLStringView kNewlines = u"\n\v\f\r\u0085\u2028\u2029";
