@@ -232,7 +232,8 @@ void Merge(benchmark::State& state) {
 }
 BENCHMARK(Merge)->Arg(0)->Arg(1500)->Iterations(1)->Unit(benchmark::kMillisecond)->UseRealTime();
 
-// Two whole words and the beginning of a third.
+// Two whole words and the beginning of a third, with a limit that the whole index is above. The
+// last argument: whether one without limit came before, as before a search with changed words.
 void Search(benchmark::State& state) {
   Filled& data = filled(state.range(0) != 0);
   const auto term = [](const std::string& token) {
@@ -243,15 +244,22 @@ void Search(benchmark::State& state) {
     made.zoneScores = {0.5, 0.3, 0.2};
     return made;
   };
-  const saltsearch::Options options{50, 100000, 0.01};
-  for (auto _ : state) {
+  const auto search = [&](size_t maxSuffixes) {
     std::vector<saltsearch::Term> terms{term(data.texts.word(40) + ' '),
                                         term(data.texts.word(5) + ' '),
                                         term(data.texts.word(20).substr(0, 2))};
-    benchmark::DoNotOptimize(saltsearch::Search(*data.index, terms, options));
-  }
+    benchmark::DoNotOptimize(saltsearch::Search(*data.index, terms, {50, maxSuffixes, 0.01}));
+  };
+  data.index->DeleteDoc(2 * Filled::kDocuments);  // ends what is remembered
+  if (state.range(1) != 0) search(SIZE_MAX);
+  for (auto _ : state) search(100000);
 }
-BENCHMARK(Search)->Arg(0)->Arg(1)->ArgName("pages")->Unit(benchmark::kMicrosecond);
+BENCHMARK(Search)
+    ->Args({0, 0})
+    ->Args({1, 0})
+    ->Args({1, 1})
+    ->ArgNames({"pages", "remembered"})
+    ->Unit(benchmark::kMicrosecond);
 
 }  // namespace
 

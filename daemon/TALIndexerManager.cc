@@ -103,7 +103,8 @@ std::shared_ptr<TALIndexer> TALIndexerManager::_createIndexerWithProtectionType(
     return nullptr;
   }
   const std::string saltPath = platform::textIndexPath(_path, protectionClass);
+  const std::string synonymPath = platform::synonymFilePath();
   log().standard("Creating indexer saltPath={} docStorePath: {} synonymPath: {}", saltPath,
-                 docStorePath, platform::synonymFilePath());
-  return std::make_shared<TALIndexer>(saltPath, protectionClass, std::move(docStore));
+                 docStorePath, synonymPath);
+  return std::make_shared<TALIndexer>(saltPath, protectionClass, std::move(docStore), synonymPath);
 }

@@ -48,8 +48,11 @@ const platform::Log& TALIndexer::log() {
 }
 
 TALIndexer::TALIndexer(std::string path, const std::string& protectionClass,
-                       std::shared_ptr<TALDocStore> docStore)
-    : _path(std::move(path)), _docStore(std::move(docStore)), _queue(kQueueName) {
+                       std::shared_ptr<TALDocStore> docStore, std::string synonymFilePath)
+    : _path(std::move(path)),
+      _synonymFilePath(std::move(synonymFilePath)),
+      _docStore(std::move(docStore)),
+      _queue(kQueueName) {
   {
     MutexLock lock(_indexMutex);
     _init();
@@ -79,8 +82,8 @@ void TALIndexer::setTextStore(std::unique_ptr<salt::Index> index) {
   _textStore = std::move(index);
 }
 
-// Each step makes only what is missing, so that after a reset the zone manager, tokenizer and query
-// processor stay.
+// Each step makes only what is missing, so that after a reset the zone manager, tokenizer, synonyms
+// and query processor stay.
 void TALIndexer::_init() {
   const uint64_t start = platform::monotonicTicks();
   makeQueryObjects();
@@ -117,8 +120,11 @@ void TALIndexer::makeQueryObjects() {
     tk = tokenizer::NewFastLexemonTokenizer(locale);
     if (tk == nullptr) log().error("Failed to create lexemon tokenizer for locale: {}", locale);
   }
-  if (_queryProcessor == nullptr)
-    _queryProcessor = TALQueryProcessor::initWithZoneManager(_zoneManager);
+  if (_queryProcessor == nullptr) {
+    if (!_synonymModel.loadSynonymsFromFile(_synonymFilePath, nullptr))
+      log().error("Failed to load synonym file: {}", _synonymFilePath);
+    _queryProcessor = TALQueryProcessor::initWithZoneManager(_zoneManager, &_synonymModel);
+  }
 }
 
 void TALIndexer::loadTextStore() {

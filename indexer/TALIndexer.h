@@ -10,6 +10,8 @@
 
 #include "docstore/TALDocStore.h"
 #include "indexer/TALZoneManager.h"
+#include "modification/TALStemRewrite.h"
+#include "modification/TALSynonyms.h"
 #include "platform/Log.h"
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
@@ -44,6 +46,7 @@ enum class TALIndexerError {
 // `_textStoreMutex`, so
 //    holding either keeps it. `_queue` work that changes it takes both.
 // 2. A search holds `_indexMutex` for one pass, a batch for all its documents: they never overlap.
+//    What changes the words of a query between two passes reads the index beside batches.
 // 3. The document store is written before the text index. What a search finds in the index and not
 // in the
 //    store is left out.
@@ -54,10 +57,11 @@ class TALIndexer {
   using Strings = std::vector<TLString>;
   using Completion = std::function<void(const std::optional<TLError>&)>;
 
-  // Opens, or makes, the text index in the directory `path`. The store is open. Never fails:
-  // problems are logged, and an indexer without index or tokenizer reports them with each call.
+  // Opens, or makes, the text index in the directory `path`, and reads the synonyms. The store is
+  // open. Never fails: problems are logged, and an indexer without index or tokenizer reports them
+  // with each call.
   TALIndexer(std::string path, const std::string& protectionClass,
-             std::shared_ptr<TALDocStore> docStore);
+             std::shared_ptr<TALDocStore> docStore, std::string synonymFilePath);
   ~TALIndexer();
   TALIndexer(const TALIndexer&) = delete;
   TALIndexer& operator=(const TALIndexer&) = delete;
@@ -89,7 +93,9 @@ class TALIndexer {
   [[nodiscard]] std::string saltMetrics();
 
   // Ranked items, at most "salt.maxTopK", each with its card. Writes the resolved parameters into
-  // the query. With a failure the result is empty and the error set.
+  // the query. With a failure the result is empty and the error set. Where the words as typed find
+  // no more than "queryModification.sufficentRetrievalThreshold" items, the results are those of
+  // changed words, if any can be found.
   [[nodiscard]] Items search(TLQuery& query, TLErrorOut error);
 
   // Every stored document whose subject is one of `subjects`, in the store's order, without scores;
@@ -108,6 +114,11 @@ class TALIndexer {
   // URL.
   [[nodiscard]] static std::optional<TLURL> documentURLForIdentifier(
       const std::optional<TLString>& identifier, const std::string& bundleID);
+
+  // True when there are at most that many results; a threshold below 0 counts as huge.
+  [[nodiscard]] static bool _notSufficientRetrieval(const Items& results, int64_t threshold);
+  [[nodiscard]] static bool _shouldRunQueryModification(const Items& results,
+                                                        int64_t retrievalThreshold);
 
   // -1, 0 or 1; 1 also when either is not a number.
   [[nodiscard]] static int _floatCompare(float a, float b);
@@ -165,11 +176,28 @@ class TALIndexer {
                           double queryTime, float textScoreWeight, float freshnessWeight);
   static float _lightWeightScoring(const TLIndexableItem& item, double queryTime,
                                    float textScoreWeight, float freshnessWeight);
+  // The second pass: with changed terms where a modifier finds some, else `firstResults`. Drops
+  // them when the second pass fails.
+  Items searchModified(const TLQuery& query, const std::vector<saltsearch::Term>& saltQueryTerms,
+                       Items firstResults, TLErrorOut error);
+  // Tries one way after the other to change terms that found too little; the first that changes
+  // something ends it. True when `modifiedQueryTerms` is filled.
+  bool _modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
+                         std::vector<saltsearch::Term>& modifiedQueryTerms,
+                         const TLParameters& searchParams);
+  bool modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms,
+                          std::vector<saltsearch::Term>& modifiedQueryTerms)
+      TL_REQUIRES(_textStoreMutex);
+  bool modifyWithStems(const std::vector<saltsearch::Term>& queryTerms,
+                       std::vector<saltsearch::Term>& modifiedQueryTerms)
+      TL_REQUIRES(_textStoreMutex);
   static void rankItems(Items& items);
   static void logRanking(const TLQuery& query, const Items& items);
 
   const std::string _path;
+  const std::string _synonymFilePath;
   TALZoneManager _zoneManager;                         // self-synchronised
+  TALSynonyms _synonymModel;                           // loaded at construction, then read only
   std::unique_ptr<tokenizer::Tokenizer> tk;            // fixed after construction
   std::unique_ptr<TALQueryProcessor> _queryProcessor;  // fixed after construction
 
@@ -177,6 +205,7 @@ class TALIndexer {
   // Held for as long as one reads `_textStore` without `_indexMutex`; taken after it.
   platform::Mutex _textStoreMutex;
   std::unique_ptr<salt::Index> _textStore;  // see invariant 1
+  TALStemRewrite _stemRewrite TL_GUARDED_BY(_textStoreMutex);
   bool _shutdown TL_GUARDED_BY(_indexMutex) = false;
   mutable platform::Mutex _docStoreMutex;
   std::shared_ptr<TALDocStore> _docStore TL_GUARDED_BY(_docStoreMutex);

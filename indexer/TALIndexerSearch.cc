@@ -104,7 +104,10 @@ TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error) {
     platform::setError(error, *failure);
     return {};
   }
-  return items;
+  const int64_t threshold =
+      query.searchParams()->intValueForKey("queryModification.sufficentRetrievalThreshold");
+  if (!_shouldRunQueryModification(items, threshold)) return items;
+  return searchModified(query, saltQueryTerms, std::move(items), error);
 }
 
 std::vector<saltsearch::Term> TALIndexer::_populateQueryTerms(const std::vector<TALTerm>& terms) {

@@ -4,6 +4,7 @@
 #include <unordered_set>
 #include <utility>
 
+#include "modification/Stemmer.h"
 #include "tokenizer/TLLexemonAssetManager.h"
 
 namespace {
@@ -21,6 +22,7 @@ constexpr TermWorth kWord{1.0, 0.0};      // required
 constexpr TermWorth kEqual{1.0, 0.0};     // required
 constexpr TermWorth kNotEqual{0.0, 1.0};  // forbidden
 constexpr size_t kWordsOfAPhrase = 3;
+constexpr double kStemScore = 0.05;
 
 TLString joinWords(const std::vector<TLString>& words) {
   TLString text;
@@ -29,6 +31,10 @@ TLString joinWords(const std::vector<TLString>& words) {
     text += word;
   }
   return text;
+}
+
+bool isOn(const TLParameters* searchParams, std::string_view key) {
+  return searchParams != nullptr && searchParams->boolValueForKey(key);
 }
 
 TLAttributeKey keyAt(const TLQueryNode& node, size_t index) {
@@ -62,7 +68,7 @@ const std::array<TLAttributeKey, 14>& TALQueryProcessor::queryTermEnumKeyAttribs
 }
 
 std::unique_ptr<TALQueryProcessor> TALQueryProcessor::initWithZoneManager(
-    const TALZoneManager& zoneManager) {
+    const TALZoneManager& zoneManager, const TALSynonyms* synonymModel) {
   const std::string locale = bestLexemonLocale();
   log().info("Creating Lexemon tokenizer for locale: {}", locale);
   auto tokenizer = tokenizer::NewFastLexemonTokenizer(locale);
@@ -71,16 +77,18 @@ std::unique_ptr<TALQueryProcessor> TALQueryProcessor::initWithZoneManager(
     return nullptr;
   }
   return std::unique_ptr<TALQueryProcessor>(
-      new TALQueryProcessor(std::move(tokenizer), zoneManager));
+      new TALQueryProcessor(std::move(tokenizer), zoneManager, synonymModel));
 }
 
 std::vector<TALTerm> TALQueryProcessor::termsFromQuery(const TLQuery& query) const {
-  std::vector<TALTerm> terms = _processQueryString(platform::orEmpty(query.originalQuery()));
+  std::vector<TALTerm> terms =
+      _processQueryString(platform::orEmpty(query.originalQuery()), query.searchParams().get());
   _processQueryNode(query.root().get(), terms);
   return terms;
 }
 
-std::vector<TALTerm> TALQueryProcessor::_processQueryString(TLStringView queryString) const {
+std::vector<TALTerm> TALQueryProcessor::_processQueryString(
+    TLStringView queryString, const TLParameters* searchParams) const {
   std::vector<TALTerm> terms;
   if (queryString.empty()) return terms;
   Zones zones;
@@ -91,18 +99,47 @@ std::vector<TALTerm> TALQueryProcessor::_processQueryString(TLStringView querySt
 
   const bool trailing = hasTrailingSpecialChar(queryString);
   const size_t last = words.size() - 1;
-  const auto append = [&](TLString token, TermWorth worth, bool wholeWord, bool isUnigram) {
+  const auto append = [&](TLString token, TermWorth worth, bool wholeWord) {
     if (wholeWord) token += u' ';
     terms.emplace_back(std::vector<TLString>{std::move(token)}, std::vector<double>{worth.score},
-                       worth.noMatch, zones.ids, zones.scores, isUnigram);
+                       worth.noMatch, zones.ids, zones.scores, false);
   };
   terms.reserve(2 * words.size());
-  if (words.size() >= kWordsOfAPhrase) append(joinWords(words), kPhrase, trailing, false);
+  if (words.size() >= kWordsOfAPhrase) append(joinWords(words), kPhrase, trailing);
   for (size_t i = 1; i <= last; ++i) {
-    append(words[i - 1] + u' ' + words[i], kWordPair, i != last || trailing, false);
+    append(words[i - 1] + u' ' + words[i], kWordPair, i != last || trailing);
   }
-  for (size_t i = 0; i <= last; ++i) append(words[i], kWord, i != last || trailing, true);
+  for (size_t i = 0; i <= last; ++i) {
+    TokenList list = wordTokens(words[i], i != last || trailing, searchParams);
+    terms.emplace_back(std::move(list.tokens), std::move(list.scores), kWord.noMatch, zones.ids,
+                       zones.scores, true);
+  }
   return terms;
+}
+
+TALQueryProcessor::TokenList TALQueryProcessor::wordTokens(const TLString& word, bool wholeWord,
+                                                           const TLParameters* searchParams) const {
+  TokenList list;
+  const auto append = [&list](TLString token, double score, bool whole) {
+    if (whole) token += u' ';
+    list.tokens.push_back(std::move(token));
+    list.scores.push_back(score);
+  };
+  append(word, kWord.score, wholeWord);
+  if (_synonymModel != nullptr &&
+      isOn(searchParams, "queryModification.enableSynonymModificationFirstPass")) {
+    for (const auto& [synonym, score] : _synonymModel->getSynonymsScores(platform::toUTF8(word))) {
+      if (score > 0) append(platform::fromUTF8(synonym), score, wholeWord);
+    }
+  }
+  if (isOn(searchParams, "queryModification.enableStemModificationFirstPass")) {
+    TLString stem = platform::fromUTF8(TALStemWord(platform::toUTF8(word), kMaximumStemmedLength));
+    if (stem != word &&
+        std::find(list.tokens.begin(), list.tokens.end(), stem) == list.tokens.end()) {
+      append(std::move(stem), kStemScore, false);
+    }
+  }
+  return list;
 }
 
 // The tree is walked with a stack of its own, in the order of the leaves: AND nodes unfold in

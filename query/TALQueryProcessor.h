@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "indexer/TALZoneManager.h"
+#include "modification/TALSynonyms.h"
 #include "platform/Log.h"
 #include "query/TALTerm.h"
 #include "records/TLQuery.h"
@@ -24,9 +25,9 @@
 class TALQueryProcessor {
  public:
   // Null, with a line in the log, when there is no tokenizer for the best locale. The zone manager
-  // must outlive the processor.
+  // and the synonyms, which may be null, must outlive the processor.
   [[nodiscard]] static std::unique_ptr<TALQueryProcessor> initWithZoneManager(
-      const TALZoneManager& zoneManager);
+      const TALZoneManager& zoneManager, const TALSynonyms* synonymModel);
 
   // The terms of the free text (`originalQuery`), then those of the condition tree (`root`). Empty
   // for a query that asks for nothing.
@@ -39,15 +40,24 @@ class TALQueryProcessor {
 
  private:
   TALQueryProcessor(std::unique_ptr<tokenizer::Tokenizer> tokenizer,
-                    const TALZoneManager& zoneManager)
-      : _tokenizer(std::move(tokenizer)), _zoneManager(zoneManager) {}
+                    const TALZoneManager& zoneManager, const TALSynonyms* synonymModel)
+      : _tokenizer(std::move(tokenizer)), _zoneManager(zoneManager), _synonymModel(synonymModel) {}
 
   struct Zones {
     std::vector<int32_t> ids;
     std::vector<double> scores;
   };
+  struct TokenList {
+    std::vector<TLString> tokens;
+    std::vector<double> scores;
+  };
 
-  [[nodiscard]] std::vector<TALTerm> _processQueryString(TLStringView queryString) const;
+  [[nodiscard]] std::vector<TALTerm> _processQueryString(TLStringView queryString,
+                                                         const TLParameters* searchParams) const;
+  // The word itself and, where the parameters ask for them, its synonyms and its stem, which always
+  // is a prefix, each at less worth.
+  [[nodiscard]] TokenList wordTokens(const TLString& word, bool wholeWord,
+                                     const TLParameters* searchParams) const;
   void _processQueryNode(const TLQueryNode* node, std::vector<TALTerm>& terms) const;
   void _stringRestrictTermsFromLeafNode(const TLQueryNode& node, TLQueryNodeOp op,
                                         std::vector<TALTerm>& terms) const;
@@ -59,4 +69,5 @@ class TALQueryProcessor {
 
   const std::unique_ptr<tokenizer::Tokenizer> _tokenizer;
   const TALZoneManager& _zoneManager;
+  const TALSynonyms* const _synonymModel;
 };

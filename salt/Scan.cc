@@ -204,9 +204,10 @@ std::optional<uint64_t> index::ScanPlaces(
     const std::function<void(const Place* places, size_t count)>& callback) const {
   const auto start = Clock::now();
   const IndexView view(*this, true, kPageWalks);
-  if (view.metrics.Suffixes > limit) return std::nullopt;
   prefix = prefix.substr(0, suffixLength(prefix, op));
   const auto known = _scanMemory.find(prefix, view.pageGeneration);
+  const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
+  if (most > limit) return std::nullopt;
   PlacesScan scan(view, prefix, !known);
   if (scan.shards() <= kFewShards) {
     scan.walk(0);

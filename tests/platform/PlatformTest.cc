@@ -13,6 +13,7 @@
 #include "platform/Signpost.h"
 #include "platform/StateCapture.h"
 #include "platform/Text.h"
+#include "platform/TextFile.h"
 #include "platform/URL.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -132,6 +133,29 @@ TEST(Files, FailuresNameThePath) {
   EXPECT_NE(error->message.find("none"), std::string::npos);
   EXPECT_TRUE(platform::removeItem(temporary / "file", nullptr));
   EXPECT_EQ(platform::listDirectory(temporary.path(), nullptr)->size(), 0u);
+}
+
+TEST(TextFile, TellsTheEncoding) {
+  using namespace std::string_literals;
+  const TLString text = u"na\u00efve,gr\u00fcn\n";
+  const std::pair<std::string, TLString> cases[] = {
+      {"", u""},
+      {"\xEF\xBB\xBF", u""},
+      {platform::toUTF8(text), text},
+      {"\xEF\xBB\xBF" + platform::toUTF8(text), text},
+      {"\xFF\xFE"
+       "a\0\xEF\0"s,
+       u"a\u00ef"},
+      {"\xFE\xFF\0a\0\xEF"s, u"a\u00ef"},
+      {"\xFF\xFE\0\0a\0\0\0"s, u"a"},
+      {"\0\0\xFE\xFF\0\0\0a"s, u"a"},
+      {"\xFE\xFF\0"s, u"\ufffd"},
+      {"na\xEFve,gr\xFCn\n", text},
+      {"\xE9", u"\u00e9"},
+  };
+  for (const auto& [bytes, expected] : cases) {
+    EXPECT_EQ(platform::decodeText(bytes), expected) << testing::PrintToString(bytes);
+  }
 }
 
 TEST(StateCapture, RecordHasTheStatedLayout) {

@@ -28,7 +28,7 @@ std::shared_ptr<TLQueryNode> inner(Merge mergeOp,
 
 class QueryProcessorTest : public testing::Test {
  protected:
-  QueryProcessorTest() : processor(TALQueryProcessor::initWithZoneManager(zoneManager)) {}
+  QueryProcessorTest() : processor(TALQueryProcessor::initWithZoneManager(zoneManager, nullptr)) {}
 
   std::vector<TALTerm> termsOfText(const TLString& text) const {
     TLQuery query;
@@ -84,6 +84,46 @@ TEST_F(QueryProcessorTest, FreeTextBecomesPhrasePairsAndWords) {
     EXPECT_EQ(print(termsOfText(text)), expected) << platform::toUTF8(text);
   }
   EXPECT_TRUE(log.has("default TALQueryProcessor: Query tree node is empty."));
+}
+
+TEST_F(QueryProcessorTest, TheFirstPassTakesSynonymsAndStemsWhereTheParametersSay) {
+  TALSynonyms synonyms;
+  synonyms.setSynonymVocab({{"invoices", {"bills", "money owed"}}, {"ships", {"ship"}}});
+  processor = TALQueryProcessor::initWithZoneManager(zoneManager, &synonyms);
+  const TLString bySynonyms = u"queryModification.enableSynonymModificationFirstPass=YES";
+  const TLString byStems = u"queryModification.enableStemModificationFirstPass=YES";
+  // The worth of a synonym is a float, that of a stem a double.
+  const struct {
+    TLString text;
+    TLString parameters;
+    std::string terms;
+  } cases[] = {
+      {u"invoices ", u"salt.maxTopK=1", "[\"invoices \" 1] nomatch:0 word\n"},
+      {u"invoices ", bySynonyms,
+       "[\"invoices \" 1 | \"bills \" 0.10000000149011612 | \"money owed \" 0.10000000149011612] "
+       "nomatch:0 word\n"},
+      {u"invoices", bySynonyms,
+       "[\"invoices\" 1 | \"bills\" 0.10000000149011612 | \"money owed\" 0.10000000149011612] "
+       "nomatch:0 word\n"},
+      {u"ship invoices", byStems,
+       "[\"ship invoices\" 2] nomatch:0.8\n[\"ship \" 1] nomatch:0 word\n"
+       "[\"invoices\" 1 | \"invoic\" 0.05] nomatch:0 word\n"},
+      // A stem is a prefix, and so another token than the same word in whole.
+      {u"ships ", bySynonyms + u"," + byStems,
+       "[\"ships \" 1 | \"ship \" 0.10000000149011612 | \"ship\" 0.05] nomatch:0 word\n"},
+      {u"ships", bySynonyms + u"," + byStems,
+       "[\"ships\" 1 | \"ship\" 0.10000000149011612] nomatch:0 word\n"},
+      {u"caf\u00e9s \u4eac\u90fd", byStems,
+       "[\"cafes \u4eac\u90fd\" 2] nomatch:0.8\n[\"cafes \" 1 | \"cafe\" 0.05] nomatch:0 word\n"
+       "[\"\u4eac\u90fd\" 1] nomatch:0 word\n"},
+  };
+  for (const auto& c : cases) {
+    TLQuery query;
+    query.setOriginalQuery(c.text);
+    query.setSearchParams(
+        TLParamsManager::resolveOverrides(*TLParamsManager::paramsFromString(c.parameters), true));
+    EXPECT_EQ(print(processor->termsFromQuery(query)), c.terms);
+  }
 }
 
 TEST_F(QueryProcessorTest, FreeTextLooksInFourteenZonesWithTheirScores) {

@@ -49,6 +49,29 @@ void vacuum(Index& index) {
   while (index.GetMetrics().VacuumInProgress) std::this_thread::yield();
 }
 
+TEST(Vacuum, WhatIsRememberedOfThePagesTellsWhetherALimitHolds) {
+  const TemporaryDirectory directory;
+  const auto index = newIndex(directory / "index", smallOptions(100));
+  Model model(index->GetOptions());
+  addDocs(*index, &model, 1, 10);
+  vacuum(*index);
+  ASSERT_EQ(index->GetMetrics().HotSuffixes, 0u);
+  const auto places = [&index](uint64_t limit) {
+    size_t delivered = 0;
+    const auto count =
+        index->ScanPlaces("two", limit, [&](const auto*, size_t run) { delivered += run; });
+    EXPECT_EQ(delivered, count.value_or(0)) << limit;
+    return count;
+  };
+  EXPECT_EQ(places(49), std::nullopt);  // of 50 suffixes
+  EXPECT_EQ(places(50), 10u);
+  EXPECT_EQ(places(10), 10u);
+  EXPECT_EQ(places(9), std::nullopt);
+  addDocs(*index, &model, 11, 11);
+  EXPECT_EQ(places(14), std::nullopt);  // all 5 hot ones might match
+  EXPECT_EQ(places(15), 11u);
+}
+
 TEST(Vacuum, MovesTheHotPartIntoOneShardAfterTheOther) {
   const TemporaryDirectory directory;
   const std::string path = directory / "index";

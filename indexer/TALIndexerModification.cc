@@ -1,0 +1,85 @@
+#include <optional>
+#include <utility>
+
+#include "indexer/TALIndexer.h"
+
+using platform::MutexLock;
+
+bool TALIndexer::_notSufficientRetrieval(const Items& results, int64_t threshold) {
+  return results.size() <= static_cast<uint64_t>(threshold);
+}
+
+bool TALIndexer::_shouldRunQueryModification(const Items& results, int64_t retrievalThreshold) {
+  return _notSufficientRetrieval(results, retrievalThreshold);
+}
+
+TALIndexer::Items TALIndexer::searchModified(const TLQuery& query,
+                                             const std::vector<saltsearch::Term>& saltQueryTerms,
+                                             Items firstResults, TLErrorOut error) {
+  log().standard("Query modification started for query with {} terms", saltQueryTerms.size());
+  std::vector<saltsearch::Term> modified;
+  if (!_modifyQueryTerms(saltQueryTerms, modified, *query.searchParams()) || modified.empty()) {
+    log().standard("Query modification didnt work out. Return original query results.");
+    return firstResults;
+  }
+  std::optional<TLError> failure;
+  Items items;
+  {
+    MutexLock lock(_indexMutex);
+    items = searchOnce(query, modified, &failure);
+  }
+  if (failure) {
+    log().error("Failed to search modified query in SALT due to error: {}",
+                platform::printable(failure));
+    platform::setError(error, *failure);
+    return {};
+  }
+  log().standard("Query modification finished. Results retrieved with modified query terms.");
+  return items;
+}
+
+// The modifiers read the text index beside ingest; the mutex only keeps the index from being
+// closed, and one caller at a time with them.
+bool TALIndexer::_modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
+                                   std::vector<saltsearch::Term>& modifiedQueryTerms,
+                                   const TLParameters& searchParams) {
+  MutexLock lock(_textStoreMutex);
+  if (_textStore == nullptr) return false;
+  if (searchParams.boolValueForKey("queryModification.enableSynonymModification") &&
+      modifyWithSynonyms(queryTerms, modifiedQueryTerms)) {
+    return true;
+  }
+  return searchParams.boolValueForKey("queryModification.enableStemModification") &&
+         modifyWithStems(queryTerms, modifiedQueryTerms);
+}
+
+bool TALIndexer::modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms,
+                                    std::vector<saltsearch::Term>& modifiedQueryTerms) {
+  log().standard("Synonyms modification started.");
+  std::vector<saltsearch::Term> expanded;
+  const float score = _synonymModel.synonymExpansion(queryTerms, expanded, *_textStore);
+  if (score > 0.0F && !expanded.empty()) {
+    modifiedQueryTerms = std::move(expanded);
+    log().standard(
+        "Synonyms modification finished with query modified. Skipping all other query "
+        "modification.");
+    return true;
+  }
+  log().standard(
+      "Synonyms modification finished without query modified. Continue with other query "
+      "modification.");
+  return false;
+}
+
+bool TALIndexer::modifyWithStems(const std::vector<saltsearch::Term>& queryTerms,
+                                 std::vector<saltsearch::Term>& modifiedQueryTerms) {
+  log().standard("Stem rewrite started.");
+  std::vector<saltsearch::Term> stemmed;
+  if (_stemRewrite.stemRewrite(queryTerms, stemmed, *_textStore)) {
+    modifiedQueryTerms = std::move(stemmed);
+    log().standard("Stem rewrite finished with query modified.");
+    return true;
+  }
+  log().standard("Stem rewrite finished without query modified.");
+  return false;
+}
