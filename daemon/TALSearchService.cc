@@ -221,11 +221,10 @@ void TALSearchService::searchItemsForQuery(
     return reply(found, std::nullopt);
   }
 
-  Items items = indexer->search(query, &error);
+  size_t count = 0;
+  Items items = indexer->search(query, &error, static_cast<uint64_t>(maxResults), &count);
   Signpost::end(signpost, "SearchQuery", "query {} found {} items",
-                platform::redacted(query.rawQuery()), items.size());
-  const auto maximum = static_cast<uint64_t>(maxResults);
-  if (items.size() > maximum) items.resize(maximum);
+                platform::redacted(query.rawQuery()), count);
   log().standard("Finished {}, results={}, timeTaken={} ms", description, items.size(),
                  elapsedMillisSinceMonotonicTime(start));
   reply(std::move(items), error);

@@ -78,6 +78,7 @@ std::shared_ptr<TALDocStore> TALIndexer::docStore() const {
 }
 
 void TALIndexer::setTextStore(std::unique_ptr<salt::Index> index) {
+  _docDates.forgetAll();  // another index, other numbers
   MutexLock lock(_textStoreMutex);
   _textStore = std::move(index);
 }

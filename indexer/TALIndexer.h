@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "docstore/TALDocStore.h"
+#include "indexer/DocDates.h"
 #include "indexer/TALZoneManager.h"
 #include "modification/TALStemRewrite.h"
 #include "modification/TALSynonyms.h"
@@ -96,7 +97,10 @@ class TALIndexer {
   // the query. With a failure the result is empty and the error set. Where the words as typed find
   // no more than "queryModification.sufficentRetrievalThreshold" items, the results are those of
   // changed words, if any can be found.
-  [[nodiscard]] Items search(TLQuery& query, TLErrorOut error);
+  //
+  // The items are the best `most`; `count`, which may be null, receives how many were ranked.
+  [[nodiscard]] Items search(TLQuery& query, TLErrorOut error, size_t most = SIZE_MAX,
+                             size_t* count = nullptr);
 
   // Every stored document whose subject is one of `subjects`, in the store's order, without scores;
   // none with an error set when the store fails. Reads every document.
@@ -116,9 +120,8 @@ class TALIndexer {
       const std::optional<TLString>& identifier, const std::string& bundleID);
 
   // True when there are at most that many results; a threshold below 0 counts as huge.
-  [[nodiscard]] static bool _notSufficientRetrieval(const Items& results, int64_t threshold);
-  [[nodiscard]] static bool _shouldRunQueryModification(const Items& results,
-                                                        int64_t retrievalThreshold);
+  [[nodiscard]] static bool _notSufficientRetrieval(size_t results, int64_t threshold);
+  [[nodiscard]] static bool _shouldRunQueryModification(size_t results, int64_t retrievalThreshold);
 
   // -1, 0 or 1; 1 also when either is not a number.
   [[nodiscard]] static int _floatCompare(float a, float b);
@@ -153,7 +156,8 @@ class TALIndexer {
   bool makeDocURLs(const Items& docs, const std::string& bundleID, Batch& batch, TLErrorOut error);
   bool fetchOldDocs(Batch& batch, TLErrorOut error);
   void mergeDocs(const Items& docs, Batch& batch);
-  bool storeDocs(Batch& batch, TLErrorOut error);
+  bool storeDocs(Batch& batch, TLErrorOut error) TL_REQUIRES(_indexMutex);
+  bool writeDocs(Batch& batch, TLErrorOut error);
   bool indexDocs(const std::string& bundleID, Batch& batch, uint64_t batchStart, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
   bool _indexDoc(const TLIndexableItem& doc, uint32_t docID, uint64_t* docParsingTime)
@@ -167,19 +171,34 @@ class TALIndexer {
   bool _deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
 
-  Items searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms,
+  // What a pass has found: the best items, and how many were ranked.
+  struct Found {
+    Items items;
+    size_t count = 0;
+  };
+  // What one pass ranks by.
+  struct RankParams;
+  struct RankKey;
+
+  Found searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms, size_t most,
                    TLErrorOut error) TL_REQUIRES(_indexMutex);
-  Items retrieveItems(const std::vector<saltsearch::DocResult>& results, const TLQuery& query,
-                      double queryTime, TLErrorOut error);
+  // One for each result, in their order, with an item only where its date was not known or all are
+  // wanted. Results that the store has no document for are left out.
+  std::vector<RankKey> rankKeys(const std::vector<saltsearch::DocResult>& results,
+                                const RankParams& params, size_t most, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
+  bool retrieveItems(const std::vector<RankKey*>& keys, const RankParams& params, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
+  Found bestItems(std::vector<RankKey>& keys, const RankParams& params, size_t most,
+                  TLErrorOut error) TL_REQUIRES(_indexMutex);
   static std::vector<saltsearch::Term> _populateQueryTerms(const std::vector<TALTerm>& terms);
   static void _fillScores(TLIndexableItem& item, const saltsearch::DocResult& indexerResult,
-                          double queryTime, float textScoreWeight, float freshnessWeight);
-  static float _lightWeightScoring(const TLIndexableItem& item, double queryTime,
-                                   float textScoreWeight, float freshnessWeight);
+                          const RankParams& params);
+  static float _lightWeightScoring(const TLIndexableItem& item, const RankParams& params);
   // The second pass: with changed terms where a modifier finds some, else `firstResults`. Drops
   // them when the second pass fails.
-  Items searchModified(const TLQuery& query, const std::vector<saltsearch::Term>& saltQueryTerms,
-                       Items firstResults, TLErrorOut error);
+  Found searchModified(const TLQuery& query, const std::vector<saltsearch::Term>& saltQueryTerms,
+                       Found firstResults, size_t most, TLErrorOut error);
   // Tries one way after the other to change terms that found too little; the first that changes
   // something ends it. True when `modifiedQueryTerms` is filled.
   bool _modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
@@ -191,8 +210,7 @@ class TALIndexer {
   bool modifyWithStems(const std::vector<saltsearch::Term>& queryTerms,
                        std::vector<saltsearch::Term>& modifiedQueryTerms)
       TL_REQUIRES(_textStoreMutex);
-  static void rankItems(Items& items);
-  static void logRanking(const TLQuery& query, const Items& items);
+  static void logRanking(const TLQuery& query, const Found& found);
 
   const std::string _path;
   const std::string _synonymFilePath;
@@ -206,6 +224,7 @@ class TALIndexer {
   platform::Mutex _textStoreMutex;
   std::unique_ptr<salt::Index> _textStore;  // see invariant 1
   TALStemRewrite _stemRewrite TL_GUARDED_BY(_textStoreMutex);
+  DocDates _docDates TL_GUARDED_BY(_indexMutex);
   bool _shutdown TL_GUARDED_BY(_indexMutex) = false;
   mutable platform::Mutex _docStoreMutex;
   std::shared_ptr<TALDocStore> _docStore TL_GUARDED_BY(_docStoreMutex);

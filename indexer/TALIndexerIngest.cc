@@ -192,6 +192,18 @@ void TALIndexer::mergeDocs(const Items& docs, Batch& batch) {
 }
 
 bool TALIndexer::storeDocs(Batch& batch, TLErrorOut error) {
+  if (!writeDocs(batch, error)) {
+    _docDates.forgetAll();
+    return false;
+  }
+  for (const auto& [url, docID] : batch.newDocIDs) {
+    _docDates.set(docID,
+                  batch.mergedDocs[url]->doubleValueForKey(TLAttributeKey::MAIL_DATE_RECEIVED));
+  }
+  return true;
+}
+
+bool TALIndexer::writeDocs(Batch& batch, TLErrorOut error) {
   const uint64_t start = platform::monotonicTicks();
   TLDocumentBatch docsToUpdate;
   TLDocumentBatch docsToInsert;
@@ -316,6 +328,7 @@ bool TALIndexer::_deleteItemsByIdentifiers(const Strings& identifiers, const std
                   platform::printable(failure));
     } else {
       MutexLock lock(_indexMutex);
+      _docDates.forget(docID);
       if (docStore()->deleteDocument(docID, &failure) && _textStore != nullptr) {
         _textStore->DeleteDoc(docID);
       }
@@ -360,6 +373,7 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorO
         const auto doc = store->documentWithID(docID, nullptr);
         if (doc == nullptr || doc->domainIdentifier() != domain) return;
         std::optional<TLError> failure;
+        _docDates.forget(docID);
         if (store->deleteDocument(docID, &failure)) {
           if (index != nullptr) index->DeleteDoc(docID);
           return;

@@ -5,17 +5,17 @@
 
 using platform::MutexLock;
 
-bool TALIndexer::_notSufficientRetrieval(const Items& results, int64_t threshold) {
-  return results.size() <= static_cast<uint64_t>(threshold);
+bool TALIndexer::_notSufficientRetrieval(size_t results, int64_t threshold) {
+  return results <= static_cast<uint64_t>(threshold);
 }
 
-bool TALIndexer::_shouldRunQueryModification(const Items& results, int64_t retrievalThreshold) {
+bool TALIndexer::_shouldRunQueryModification(size_t results, int64_t retrievalThreshold) {
   return _notSufficientRetrieval(results, retrievalThreshold);
 }
 
-TALIndexer::Items TALIndexer::searchModified(const TLQuery& query,
+TALIndexer::Found TALIndexer::searchModified(const TLQuery& query,
                                              const std::vector<saltsearch::Term>& saltQueryTerms,
-                                             Items firstResults, TLErrorOut error) {
+                                             Found firstResults, size_t most, TLErrorOut error) {
   log().standard("Query modification started for query with {} terms", saltQueryTerms.size());
   std::vector<saltsearch::Term> modified;
   if (!_modifyQueryTerms(saltQueryTerms, modified, *query.searchParams()) || modified.empty()) {
@@ -23,10 +23,10 @@ TALIndexer::Items TALIndexer::searchModified(const TLQuery& query,
     return firstResults;
   }
   std::optional<TLError> failure;
-  Items items;
+  Found found;
   {
     MutexLock lock(_indexMutex);
-    items = searchOnce(query, modified, &failure);
+    found = searchOnce(query, modified, most, &failure);
   }
   if (failure) {
     log().error("Failed to search modified query in SALT due to error: {}",
@@ -35,7 +35,7 @@ TALIndexer::Items TALIndexer::searchModified(const TLQuery& query,
     return {};
   }
   log().standard("Query modification finished. Results retrieved with modified query terms.");
-  return items;
+  return found;
 }
 
 // The modifiers read the text index beside ingest; the mutex only keeps the index from being

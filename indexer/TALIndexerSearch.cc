@@ -24,21 +24,6 @@ const platform::Log& rankingLog() {
   return handle;
 }
 
-// What the order of results depends on, read from an item once.
-struct RankKey {
-  float lightScore;
-  float mailDateReceived;  // narrowed: dates within about two minutes tie
-  std::shared_ptr<TLIndexableItem> item;
-};
-
-bool ranksBefore(const RankKey& a, const RankKey& b) {
-  if (const int order = TALIndexer::_floatCompare(b.lightScore, a.lightScore)) return order < 0;
-  if (const int order = TALIndexer::_floatCompare(b.mailDateReceived, a.mailDateReceived)) {
-    return order < 0;
-  }
-  return platform::orEmpty(b.item->identifier()) < platform::orEmpty(a.item->identifier());
-}
-
 std::string _stringFromTLPersons(const std::vector<std::shared_ptr<TLPerson>>* persons) {
   std::string text;
   if (persons == nullptr) return text;
@@ -47,6 +32,13 @@ std::string _stringFromTLPersons(const std::vector<std::shared_ptr<TLPerson>>* p
                         platform::redacted(person->emailAddress()));
   }
   return text;
+}
+
+// How many of the best the ranking log shows, 0 when it is off.
+size_t itemsToLog(const TLParameters& params) {
+  if (!rankingLog().enabled(platform::LogLevel::info)) return 0;
+  return static_cast<size_t>(
+      std::max(params.intValueForKey("ranking.rankingLogsItemCap"), int64_t{0}));
 }
 
 std::string dateText(double secondsSince1970) {
@@ -77,7 +69,53 @@ std::string rankingEntry(const TLIndexableItem& item) {
 
 }  // namespace
 
-TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error) {
+struct TALIndexer::RankParams {
+  RankParams(const TLParameters& params, double now)
+      : queryTime(now),
+        textScoreWeight(params.floatValueForKey("ranking.textScoreWeight").value_or(0.0F)),
+        freshnessWeight(params.floatValueForKey("ranking.freshnessWeight").value_or(0.0F)) {}
+
+  // The text product is rounded to float, the sum made in double, and rounded to float again: the
+  // order is part of the result.
+  [[nodiscard]] float lightScore(float textScore, double freshness) const {
+    const float text = textScoreWeight * textScore;
+    return static_cast<float>(freshness * static_cast<double>(freshnessWeight) +
+                              static_cast<double>(text));
+  }
+
+  double queryTime;
+  float textScoreWeight;
+  float freshnessWeight;
+};
+
+// One result and what its place depends on. The item is there once it is needed.
+struct TALIndexer::RankKey {
+  // Those of which neither comes before the other are told apart by their identifiers.
+  static bool scoresBefore(const RankKey& a, const RankKey& b) {
+    if (const int order = _floatCompare(b.lightScore, a.lightScore)) return order < 0;
+    return _floatCompare(b.mailDateReceived, a.mailDateReceived) < 0;
+  }
+
+  static bool ranksBefore(const RankKey& a, const RankKey& b) {
+    if (scoresBefore(a, b)) return true;
+    if (scoresBefore(b, a)) return false;
+    return platform::orEmpty(b.item->identifier()) < platform::orEmpty(a.item->identifier());
+  }
+
+  void setDate(double date, const RankParams& params) {
+    mailDateReceived = static_cast<float>(date);
+    lightScore = params.lightScore(static_cast<float>(result->score),
+                                   _computeFreshnessPenalty(date, params.queryTime));
+  }
+
+  const saltsearch::DocResult* result = nullptr;
+  std::shared_ptr<TLIndexableItem> item = nullptr;
+  float lightScore = 0;
+  float mailDateReceived = 0;  // narrowed: dates within about two minutes tie
+};
+
+TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t most, size_t* count) {
+  if (count != nullptr) *count = 0;
   query.setSearchParams(query.hasSearchParams()
                             ? TLParamsManager::resolveOverrides(*query.searchParams(), true)
                             : TLParamsManager::getDefaultSearchParamsWithCaching(true));
@@ -94,10 +132,10 @@ TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error) {
   if (saltQueryTerms.empty()) return failWith("Failed to populate salt query terms");
 
   std::optional<TLError> failure;
-  Items items;
+  Found found;
   {
     MutexLock lock(_indexMutex);
-    items = searchOnce(query, saltQueryTerms, &failure);
+    found = searchOnce(query, saltQueryTerms, most, &failure);
   }
   if (failure) {
     log().error("Failed to search query in salt due to error: {}", platform::printable(failure));
@@ -106,8 +144,11 @@ TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error) {
   }
   const int64_t threshold =
       query.searchParams()->intValueForKey("queryModification.sufficentRetrievalThreshold");
-  if (!_shouldRunQueryModification(items, threshold)) return items;
-  return searchModified(query, saltQueryTerms, std::move(items), error);
+  if (_shouldRunQueryModification(found.count, threshold)) {
+    found = searchModified(query, saltQueryTerms, std::move(found), most, error);
+  }
+  if (count != nullptr) *count = found.count;
+  return std::move(found.items);
 }
 
 std::vector<saltsearch::Term> TALIndexer::_populateQueryTerms(const std::vector<TALTerm>& terms) {
@@ -127,8 +168,8 @@ std::vector<saltsearch::Term> TALIndexer::_populateQueryTerms(const std::vector<
   return out;
 }
 
-TALIndexer::Items TALIndexer::searchOnce(const TLQuery& query,
-                                         std::vector<saltsearch::Term>& saltQueryTerms,
+TALIndexer::Found TALIndexer::searchOnce(const TLQuery& query,
+                                         std::vector<saltsearch::Term>& saltQueryTerms, size_t most,
                                          TLErrorOut error) {
   if (_shutdown || _textStore == nullptr) {
     _errorWithCode(TALIndexerError::shuttingDown, "shutting down", error);
@@ -147,74 +188,110 @@ TALIndexer::Items TALIndexer::searchOnce(const TLQuery& query,
   log().standard("Got {} results", results.size());
   if (results.empty()) return {};
 
-  Items items = retrieveItems(results, query, queryTime, error);
-  Signpost::begin(signpost, "ranking items", "ranking {} items", items.size());
-  rankItems(items);
-  Signpost::end(signpost, "ranking items", "ranked {} items", items.size());
-  logRanking(query, items);
-  return items;
+  const RankParams ranking(params, queryTime);
+  const size_t read = std::max(most, itemsToLog(params));
+  Signpost::begin(signpost, "retrieve items", "retrieving {} items", results.size());
+  std::vector<RankKey> keys = rankKeys(results, ranking, read, error);
+  Signpost::end(signpost, "retrieve items", "retrieved {} items", keys.size());
+  Signpost::begin(signpost, "ranking items", "ranking {} items", keys.size());
+  Found found = bestItems(keys, ranking, read, error);
+  Signpost::end(signpost, "ranking items", "ranked {} items", found.count);
+  logRanking(query, found);
+  if (found.items.size() > most) found.items.resize(most);
+  return found;
 }
 
-TALIndexer::Items TALIndexer::retrieveItems(const std::vector<saltsearch::DocResult>& results,
-                                            const TLQuery& query, double queryTime,
-                                            TLErrorOut error) {
-  const uint64_t signpost = Signpost::identifierForObject(&query);
-  Signpost::begin(signpost, "retrieve items", "retrieving {} items", results.size());
-  std::vector<uint32_t> ids;
-  ids.reserve(results.size());
+std::vector<TALIndexer::RankKey> TALIndexer::rankKeys(
+    const std::vector<saltsearch::DocResult>& results, const RankParams& params, size_t most,
+    TLErrorOut error) {
+  std::vector<RankKey> keys;
+  std::vector<RankKey*> unknown;
+  keys.reserve(results.size());
   for (const auto& result : results) {
-    if (result.docID == 0) {
-      log().error("Invalid doc id: {}", result.docID);
+    if (result.docID == 0) log().error("Invalid doc id: {}", result.docID);
+    RankKey& key = keys.emplace_back(RankKey{&result});
+    const auto date = results.size() > most ? _docDates.find(result.docID) : std::nullopt;
+    if (date) {
+      key.setDate(*date, params);
     } else {
-      ids.push_back(result.docID);
+      unknown.push_back(&key);
     }
   }
-  Items items;
+  if (!retrieveItems(unknown, params, error)) return {};
+  std::erase_if(keys, [](const RankKey& key) { return key.result == nullptr; });
+  return keys;
+}
+
+// Reads the items of `keys`. A key without one loses its result. False, with the error, when the
+// store has failed.
+bool TALIndexer::retrieveItems(const std::vector<RankKey*>& keys, const RankParams& params,
+                               TLErrorOut error) {
+  std::vector<uint32_t> ids;
+  ids.reserve(keys.size());
+  for (const RankKey* key : keys) {
+    if (key->result->docID != 0) ids.push_back(key->result->docID);
+  }
   std::optional<TLError> failure;
   const auto documents = docStore()->documentsWithIDs(ids, &failure);
   if (failure) {
     log().error("Internal docid {} not found in docstore, got error: {}", fmt::join(ids, ","),
                 platform::printable(failure));
     platform::setError(error, *failure);
-  } else {
-    const float textScoreWeight =
-        query.searchParams()->floatValueForKey("ranking.textScoreWeight").value_or(0.0F);
-    const float freshnessWeight =
-        query.searchParams()->floatValueForKey("ranking.freshnessWeight").value_or(0.0F);
-    items.reserve(results.size());
-    for (const auto& result : results) {
-      const auto document = documents.find(result.docID);
-      if (document == documents.end()) {
-        log().error("Internal docid {} not found in docstore. Text score: {:f}.", result.docID,
-                    result.score);
-        continue;
-      }
-      _fillScores(*document->second, result, queryTime, textScoreWeight, freshnessWeight);
-      items.push_back(document->second);
-    }
+    return false;
   }
-  Signpost::end(signpost, "retrieve items", "retrieved {} items", items.size());
-  return items;
+  for (RankKey* key : keys) {
+    const uint32_t docID = key->result->docID;
+    const auto document = documents.find(docID);
+    if (document == documents.end()) {
+      log().error("Internal docid {} not found in docstore. Text score: {:f}.", docID,
+                  key->result->score);
+      _docDates.forget(docID);
+      key->result = nullptr;
+      continue;
+    }
+    key->item = document->second;
+    _fillScores(*key->item, *key->result, params);
+    _docDates.set(docID, key->item->card()->mailDateReceived());
+    key->setDate(key->item->card()->mailDateReceived(), params);
+  }
+  return true;
+}
+
+// Only what may be among the best `most` is read: these, and what ties with the last of them.
+TALIndexer::Found TALIndexer::bestItems(std::vector<RankKey>& keys, const RankParams& params,
+                                        size_t most, TLErrorOut error) {
+  std::stable_sort(keys.begin(), keys.end(), RankKey::scoresBefore);
+  size_t end = 0;
+  for (std::vector<RankKey*> unread;;) {
+    end = std::min(most, keys.size());
+    while (end != 0 && end < keys.size() && !RankKey::scoresBefore(keys[end - 1], keys[end])) ++end;
+    unread.clear();
+    for (size_t i = 0; i < end; ++i) {
+      if (keys[i].item == nullptr) unread.push_back(&keys[i]);
+    }
+    if (unread.empty()) break;
+    if (!retrieveItems(unread, params, error)) return {};
+    std::erase_if(keys, [](const RankKey& key) { return key.result == nullptr; });
+  }
+  std::stable_sort(keys.begin(), keys.begin() + static_cast<ptrdiff_t>(end), RankKey::ranksBefore);
+  Found found{{}, keys.size()};
+  found.items.reserve(std::min(most, end));
+  for (size_t i = 0; i < std::min(most, end); ++i) found.items.push_back(std::move(keys[i].item));
+  return found;
 }
 
 void TALIndexer::_fillScores(TLIndexableItem& item, const saltsearch::DocResult& indexerResult,
-                             double queryTime, float textScoreWeight, float freshnessWeight) {
+                             const RankParams& params) {
   item.setCard(std::make_shared<TLCard>());
   item.card()->setTextScore(static_cast<float>(indexerResult.score));
-  item.card()->setLightScore(
-      _lightWeightScoring(item, queryTime, textScoreWeight, freshnessWeight));
+  item.card()->setLightScore(_lightWeightScoring(item, params));
 }
 
-// The text product is rounded to float, the sum made in double, and rounded to float again: the
-// order is part of the result.
-float TALIndexer::_lightWeightScoring(const TLIndexableItem& item, double queryTime,
-                                      float textScoreWeight, float freshnessWeight) {
+float TALIndexer::_lightWeightScoring(const TLIndexableItem& item, const RankParams& params) {
   TLCard& card = *item.card();
   card.setMailDateReceived(item.doubleValueForKey(TLAttributeKey::MAIL_DATE_RECEIVED));
-  card.setFreshness(_computeFreshnessPenalty(card.mailDateReceived(), queryTime));
-  const float text = textScoreWeight * card.textScore();
-  return static_cast<float>(card.freshness() * static_cast<double>(freshnessWeight) +
-                            static_cast<double>(text));
+  card.setFreshness(_computeFreshnessPenalty(card.mailDateReceived(), params.queryTime));
+  return params.lightScore(card.textScore(), card.freshness());
 }
 
 double TALIndexer::_computeFreshnessPenalty(double documentTime, double queryTime) {
@@ -228,26 +305,13 @@ int TALIndexer::_floatCompare(float a, float b) {
   return a < b ? -1 : 1;
 }
 
-void TALIndexer::rankItems(Items& items) {
-  std::vector<RankKey> keys;
-  keys.reserve(items.size());
-  for (auto& item : items) {
-    const float light = item->card()->lightScore();
-    const auto date = static_cast<float>(item->card()->mailDateReceived());
-    keys.push_back({light, date, std::move(item)});
-  }
-  std::stable_sort(keys.begin(), keys.end(), ranksBefore);
-  for (size_t i = 0; i < items.size(); ++i) items[i] = std::move(keys[i].item);
-}
-
-void TALIndexer::logRanking(const TLQuery& query, const Items& items) {
+void TALIndexer::logRanking(const TLQuery& query, const Found& found) {
   if (!rankingLog().enabled(platform::LogLevel::info)) return;
   rankingLog().info("\n\nQuery: {} | Ranked {} items\n", platform::redacted(query.originalQuery()),
-                    items.size());
-  const int64_t cap = query.searchParams()->intValueForKey("ranking.rankingLogsItemCap");
-  const size_t shown = cap < 0 ? 0 : std::min(items.size(), static_cast<size_t>(cap));
+                    found.count);
+  const size_t shown = std::min(found.items.size(), itemsToLog(*query.searchParams()));
   for (size_t i = 0; i < shown; ++i) {
-    rankingLog().info("Result {} of top {}: \n{}", i + 1, shown, rankingEntry(*items[i]));
+    rankingLog().info("Result {} of top {}: \n{}", i + 1, shown, rankingEntry(*found.items[i]));
   }
 }
 

@@ -2,6 +2,7 @@
 
 #include <cmath>
 #include <future>
+#include <random>
 #include <thread>
 
 #include "docstore/TALSqliteDocStore.h"
@@ -114,6 +115,44 @@ TEST_F(IndexerTest, EqualScoresGoByDateThenIdentifier) {
   const double recent = 1.7e9;  // where a float is 128 seconds wide
   ASSERT_EQ(add({mail("m", "near", "", recent + 64), mail("n", "near", "", recent)}), std::nullopt);
   EXPECT_EQ(search("near"), "n m");
+}
+
+TEST_F(IndexerTest, TheBestFewAreTheFirstOfAllWhateverIsKnownOfTheRest) {
+  const auto expectFirstOfAll = [&](const std::string& when) {
+    TLQuery query;
+    query.setOriginalQuery(u"word");
+    query.setSearchParams(
+        parameters(u"ranking.rankingLogsItemCap=0"));  // else the log has them read
+    const auto all = indexer->search(query, nullptr);
+    for (const size_t most : {0, 1, 2, 3, 7, 19, 20, 100}) {
+      size_t count = 0;
+      const auto best = indexer->search(query, nullptr, most, &count);
+      EXPECT_EQ(count, all.size()) << when;
+      ASSERT_EQ(best.size(), std::min(most, all.size())) << when;
+      for (size_t i = 0; i < best.size(); ++i) {
+        EXPECT_EQ(best[i]->identifier(), all[i]->identifier()) << when << ' ' << most << ' ' << i;
+        EXPECT_EQ(best[i]->card()->lightScore(), all[i]->card()->lightScore());
+      }
+    }
+  };
+  std::mt19937 random(3);
+  const auto some = [&](int number) {
+    const bool inSubject = random() % 2 == 0;
+    return mail("id" + std::to_string(number), inSubject ? "word" : "none", "word",
+                1000000.0 * (random() % 4));
+  };
+  TALIndexer::Items items;
+  for (int i = 0; i < 20; ++i) items.push_back(some(i));
+  ASSERT_EQ(add(items), std::nullopt);
+  expectFirstOfAll("added");
+  reopen();
+  expectFirstOfAll("nothing is known");
+  ASSERT_EQ(add({some(3), some(4), some(5), some(20)}), std::nullopt);
+  ASSERT_EQ(remove({u"id6", u"id7"}), std::nullopt);
+  expectFirstOfAll("changed");
+  ASSERT_TRUE(store->deleteDocument(2, nullptr));
+  ASSERT_TRUE(store->deleteDocument(9, nullptr));
+  expectFirstOfAll("two are gone behind the indexer's back");
 }
 
 TEST_F(IndexerTest, FreshnessCountsOnlyWithAWeight) {

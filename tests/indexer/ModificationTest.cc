@@ -132,7 +132,7 @@ TEST_F(QueryModification, RunsWithAtMostAsManyResultsAsTheThreshold) {
   EXPECT_EQ(search(u"billing", kThreshold + u"5"), "c");
   EXPECT_EQ(search(u"bill address june", kThreshold + u"5"), "");
   EXPECT_TRUE(TALIndexer::_notSufficientRetrieval({}, 0));
-  EXPECT_FALSE(TALIndexer::_shouldRunQueryModification(TALIndexer::Items(6), 5));
+  EXPECT_FALSE(TALIndexer::_shouldRunQueryModification(6, 5));
 }
 
 TEST_F(QueryModification, AFailureOfTheSecondPassIsTheSearchs) {
