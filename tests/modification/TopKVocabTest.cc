@@ -49,6 +49,10 @@ class WatchedIndex final : public salt::Index {
       const std::function<void(const salt::Place*, size_t)>&) const override {
     return 0;
   }
+  std::vector<std::vector<salt::SuffixMeta>> ScanPrefixes(const std::vector<std::string>&,
+                                                          size_t) const override {
+    return {};
+  }
   void Vacuum() override {}
   bool Sync() override { return true; }
   void Compact() override {}
