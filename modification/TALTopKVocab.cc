@@ -127,9 +127,20 @@ bool TALTopKVocab::_needRebuildTopKVocab() const {
 
 void TALTopKVocab::checkAndRebuildTopKVocabWithCompletionHandler(Completion handler,
                                                                  bool forceRebuild) {
-  if (forceRebuild || _needRebuildTopKVocab()) {
+  if (!forceRebuild && !_needRebuildTopKVocab()) return;
+  if (forceRebuild || handler) {
     _rebuildTopKVocabWithCompletionHandler(std::move(handler));
+  } else {
+    rebuildUnlessOneWaits();
   }
+}
+
+void TALTopKVocab::rebuildUnlessOneWaits() {
+  if (!_topKVocabQueue || _rebuildWaits.exchange(true)) return;
+  _topKVocabQueue->async([this] {
+    _rebuildWaits = false;
+    rebuild();
+  });
 }
 
 void TALTopKVocab::_rebuildTopKVocabWithCompletionHandler(Completion handler) {

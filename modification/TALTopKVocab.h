@@ -67,6 +67,9 @@ class TALTopKVocab {
 
  private:
   void _rebuildTopKVocabWithCompletionHandler(Completion handler);
+  // The same for one that nobody asked for: not while such a one waits, as it would have a whole
+  // walk for nothing.
+  void rebuildUnlessOneWaits();
   // The body of a rebuild, on the queue.
   std::optional<TLError> rebuild();
   void count();
@@ -75,6 +78,7 @@ class TALTopKVocab {
   const std::shared_ptr<TALDocStore> _docStore;
   const salt::Index* const _textStore;
   std::atomic<bool> _isShutdown{false};
+  std::atomic<bool> _rebuildWaits{false};
   std::atomic<uint32_t> _maxDocID{0};
   std::atomic<uint32_t> _lastTopKRebuildDocID{0};
   std::atomic<double> _lastTopKRebuildDate;
