@@ -1,7 +1,6 @@
 #include <fmt/format.h>
 
 #include <CLI/CLI.hpp>
-#include <filesystem>
 #include <fstream>
 #include <stdexcept>
 
@@ -50,14 +49,13 @@ struct Round {
   double seconds = 0;  // of the rebuilds
 };
 
-void measure(const bench::ScratchDirectory& scratch, const std::string& stateDirectory,
-             const std::vector<std::string>& queries, bench::ItemSpool& spool, Round* out) {
+void measure(const std::string& stateDirectory, const std::vector<std::string>& queries,
+             bench::ItemSpool& spool, Round* out) {
   forgetVocabulary(stateDirectory);
-  const std::string log = scratch / "daemon.log";
-  std::filesystem::remove(log);
+  const bench::ScratchDirectory scratch;
   bench::DaemonRun daemon(scratch, stateDirectory);
   client::SearchServiceProxy service(daemon.runtimeDirectory());
-  DaemonLog said(log);
+  DaemonLog said(scratch / "daemon.log");
   for (const std::string& query : queries) static_cast<void>(bench::timedSearch(service, query));
   for (const std::string& query : queries) {
     out->alone.add(bench::timedSearch(service, query).seconds);
@@ -102,13 +100,14 @@ int run(int argc, char** argv) {
   const std::vector<std::string> queries = source.drawAll(queryCount);
   if (stateDirectory.empty()) {
     stateDirectory = scratch / "state";
-    bench::DaemonRun daemon(scratch, stateDirectory);
+    const bench::ScratchDirectory indexing;
+    bench::DaemonRun daemon(indexing, stateDirectory);
     client::SearchServiceProxy service(daemon.runtimeDirectory());
     spool.send(service);
     daemon.stop();
   }
   Round all;
-  for (size_t i = 0; i < rounds; ++i) measure(scratch, stateDirectory, queries, spool, &all);
+  for (size_t i = 0; i < rounds; ++i) measure(stateDirectory, queries, spool, &all);
   fmt::print(
       "queries={} rebuilds={} rebuild_s={:.2f} alone_median_ms={:.2f} alone_p95_ms={:.2f} "
       "beside={} beside_median_ms={:.2f} beside_p95_ms={:.2f} p95_beside_vs_alone={:.2f}\n",
