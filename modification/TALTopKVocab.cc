@@ -51,6 +51,7 @@ TALTopKVocab::TALTopKVocab(std::shared_ptr<TALDocStore> docStore, const salt::In
       _vocab(std::make_shared<const Words>()) {
   if (_docStore == nullptr || _textStore == nullptr) return;
   _topKVocabQueue.emplace(kQueueName);
+  _topKVocabQueue->async(platform::lowerThreadPriority);
   loadTopKVocabFromDocStore(nullptr);
   log().standard("Last topK rebuild date: {}.", dateText(_lastTopKRebuildDate));
   log().standard("Last topK rebuild docID: {}.", _lastTopKRebuildDocID.load());
