@@ -19,6 +19,10 @@ std::string indexPath(const std::string& stateDirectory) {
   return stateDirectory + "/TallowSearch/" + kProtectionClass + "/salt";
 }
 
+std::string documentStorePath(const std::string& stateDirectory) {
+  return stateDirectory + "/TallowSearch/" + kProtectionClass + "/docstore/docstore.db";
+}
+
 ItemSpool::ItemSpool(std::string path, const char* mode)
     : _path(std::move(path)), _file(std::fopen(_path.c_str(), mode)) {
   if (_file == nullptr) failWithErrno();

@@ -21,6 +21,8 @@ inline constexpr const char* kProtectionClass = "default";
 
 // The index of the class, below a state directory.
 [[nodiscard]] std::string indexPath(const std::string& stateDirectory);
+// Its documents.
+[[nodiscard]] std::string documentStorePath(const std::string& stateDirectory);
 
 // Encoded items in a file, in batches as the client program makes them, so that parsing mail and
 // indexing it can be timed apart at a bounded cost of memory. One thread; others, and other

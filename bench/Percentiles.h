@@ -11,6 +11,8 @@ class Percentiles {
  public:
   void add(double value) { _values.push_back(value); }
 
+  [[nodiscard]] size_t size() const { return _values.size(); }
+
   // The smallest value that at least the share `part` (0 to 1) of all values does not pass; 0
   // without any.
   [[nodiscard]] double at(double part) const {

@@ -6,6 +6,7 @@
 #include <stdexcept>
 
 #include "bench/Corpus.h"
+#include "records/TLParamsManager.h"
 
 namespace bench {
 
@@ -15,6 +16,12 @@ constexpr size_t kSampledMails = 2000;
 constexpr size_t kSampledUnits = 20000;  // of a body, in UTF-16 units
 constexpr size_t kLongestPrefix = 4;
 constexpr size_t kShortestWord = 2;
+constexpr size_t kShortestMistyped = 5;
+
+constexpr TLStringView kAsTyped =
+    u"queryModification.enableSpellModification=NO,"
+    u"queryModification.enableSynonymModification=NO,"
+    u"queryModification.enableStemModification=NO";
 
 bool isLetter(char16_t unit) {
   return (unit | 0x20) >= u'a' && (unit | 0x20) <= u'z';
@@ -33,6 +40,12 @@ std::vector<std::string> lettersOf(TLStringView text) {
   return words;
 }
 
+std::string joined(const std::vector<std::string>& words) {
+  std::string text;
+  for (const std::string& word : words) text += text.empty() ? word : ' ' + word;
+  return text;
+}
+
 }  // namespace
 
 void QuerySource::see(const client::EncodedItem& encoded) {
@@ -47,17 +60,51 @@ void QuerySource::see(const client::EncodedItem& encoded) {
                    lettersOf(body.substr(0, kSampledUnits))};
 }
 
-std::string QuerySource::draw(size_t words) {
+std::vector<std::string> QuerySource::phrase(size_t words) {
   constexpr size_t kMostTries = 100000;
   for (size_t i = 0; i < kMostTries && !_mails.empty(); ++i) {
     const auto& text = _mails[below(_mails.size())][below(2)];
     if (text.size() < words) continue;
-    const size_t first = below(text.size() - words + 1);
-    std::string query;
-    for (size_t w = 0; w + 1 < words; ++w) query += text[first + w] + ' ';
-    return query + text[first + words - 1].substr(0, 1 + below(kLongestPrefix));
+    const auto first = text.begin() + static_cast<ptrdiff_t>(below(text.size() - words + 1));
+    return {first, first + static_cast<ptrdiff_t>(words)};
   }
   throw std::runtime_error("the mail has no words to search for");
+}
+
+std::string QuerySource::draw(size_t words) {
+  std::vector<std::string> parts = phrase(words);
+  parts.back().resize(std::min(parts.back().size(), 1 + below(kLongestPrefix)));
+  return joined(parts);
+}
+
+QuerySource::Mistyped QuerySource::drawMistyped() {
+  constexpr size_t kMostTries = 1000;
+  for (size_t i = 0; i < kMostTries; ++i) {
+    std::vector<std::string> parts = phrase(kMaximumWords);
+    std::string& word = parts[below(kMaximumWords)];
+    if (word.size() < kShortestMistyped) continue;
+    word = mistype(word);
+    return {joined(parts), word};
+  }
+  throw std::runtime_error("the mail has no words to mistype");
+}
+
+std::string QuerySource::mistype(std::string word) {
+  const size_t at = below(word.size() - 1);
+  switch (below(4)) {
+    case 0:
+      word[at] = static_cast<char>('a' + below(26));
+      break;
+    case 1:
+      word.erase(at, 1);
+      break;
+    case 2:
+      word.insert(at, 1, word[at]);
+      break;
+    default:
+      std::swap(word[at], word[at + 1]);
+  }
+  return word;
 }
 
 std::vector<std::string> QuerySource::drawAll(size_t count) {
@@ -89,10 +136,12 @@ std::vector<std::string> wordsOfQuery(const std::string& query) {
   return words;
 }
 
-TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& text) {
+TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& text,
+                        bool asTyped) {
   TLQuery query;
   query.setRawQuery(platform::fromUTF8(text));
   query.setOriginalQuery(platform::fromUTF8(text));
+  if (asTyped) query.setSearchParams(TLParamsManager::paramsFromString(kAsTyped));
   std::optional<TLError> error;
   const double start = secondsNow();
   const auto items = service.searchItems(query, 0, kProtectionClass, kMaximumResults, &error);

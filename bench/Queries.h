@@ -33,9 +33,21 @@ class QuerySource {
   // Queries of one, two, three, one ... words.
   [[nodiscard]] std::vector<std::string> drawAll(size_t count);
 
+  // Three whole words of which one, of five letters or more, has one letter wrong, missing, doubled
+  // or exchanged with its neighbour; the mistyped word by itself as well.
+  struct Mistyped {
+    std::string query;
+    std::string word;
+  };
+  [[nodiscard]] Mistyped drawMistyped();
+
  private:
   // The remainder is the same everywhere, which distributions of the library are not.
   size_t below(size_t limit) { return _random() % limit; }
+
+  // Words of ASCII letters that follow one another.
+  std::vector<std::string> phrase(size_t words);
+  std::string mistype(std::string word);
 
   std::mt19937 _random;
   size_t _seen = 0;
@@ -54,8 +66,9 @@ struct TimedSearch {
   size_t results;
 };
 
-// One search through the daemon, from the call to the decoded items. Throws when it fails.
-[[nodiscard]] TimedSearch timedSearch(client::SearchServiceProxy& service,
-                                      const std::string& query);
+// One search through the daemon, from the call to the decoded items. Throws when it fails. With
+// `asTyped` words that find nothing are not changed.
+[[nodiscard]] TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& query,
+                                      bool asTyped = false);
 
 }  // namespace bench

@@ -111,6 +111,7 @@ void TALIndexer::_init() {
     loadTextStore();
     if (_textStore == nullptr) createTextStore(stored);
   }
+  makeVocabulary();
   log().standard("Finished initing indexer in time: {} ms", elapsedMillisSinceMonotonicTime(start));
 }
 
@@ -175,6 +176,28 @@ void TALIndexer::createTextStore(int64_t storedDocuments) {
   }
 }
 
+void TALIndexer::makeVocabulary() {
+  const auto store = docStore();
+  MutexLock lock(_textStoreMutex);
+  if (_textStore == nullptr) return;
+  if (_topKVocab == nullptr && store != nullptr) {
+    _topKVocab = std::make_shared<TALTopKVocab>(store, _textStore.get());
+  }
+  if (_spellCorrection == nullptr) {
+    _spellCorrection = std::make_unique<TALSpellCorrection>(_textStore.get(), _topKVocab);
+  }
+}
+
+void TALIndexer::dropVocabulary() {
+  std::shared_ptr<TALTopKVocab> vocab;
+  {
+    MutexLock lock(_textStoreMutex);
+    _spellCorrection.reset();
+    vocab = std::exchange(_topKVocab, nullptr);
+  }
+  if (vocab != nullptr) vocab->shutdown();
+}
+
 std::string TALIndexer::clientStateKey(const TLString& name) {
   return std::string(kClientStateKey) + "_" + platform::toUTF8(name);
 }
@@ -232,6 +255,7 @@ void TALIndexer::resetWithCompletionHandler(Completion completionHandler) {
 
 bool TALIndexer::_resetWithError(TLErrorOut error) {
   const auto store = docStore();
+  dropVocabulary();
   if (!_resetSALT(error)) return false;
   if (store == nullptr) return true;
   log().standard("Resetting docstore...");
@@ -278,6 +302,35 @@ void TALIndexer::saltVacuumAndCompactWithCompletionHandler(Completion completion
         return std::nullopt;
       },
       std::move(completionHandler));
+}
+
+std::shared_ptr<TALTopKVocab> TALIndexer::topKVocab() {
+  MutexLock lock(_textStoreMutex);
+  return _topKVocab;
+}
+
+void TALIndexer::checkVocabulary() {
+  if (_topKVocab != nullptr) {
+    _topKVocab->checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
+  }
+}
+
+void TALIndexer::forceRebuildTopKVocabWithCompletionHandler(Completion completionHandler) {
+  if (const auto vocab = topKVocab()) {
+    vocab->checkAndRebuildTopKVocabWithCompletionHandler(std::move(completionHandler), true);
+  }
+}
+
+std::shared_ptr<const TALTopKVocab::Words> TALIndexer::topKVocabulary() {
+  const auto vocab = topKVocab();
+  return vocab == nullptr ? nullptr : vocab->vocab();
+}
+
+std::shared_ptr<const TALTopKVocab::Words> TALIndexer::loadTopKVocabFromDocStore(TLErrorOut error) {
+  const auto vocab = topKVocab();
+  if (vocab == nullptr || docStore() == nullptr) return nullptr;
+  vocab->loadTopKVocabFromDocStore(error);
+  return vocab->vocab();
 }
 
 void TALIndexer::fetchLastClientStateforName(
@@ -343,6 +396,7 @@ std::string TALIndexer::saltMetrics() {
 }
 
 void TALIndexer::close() {
+  dropVocabulary();
   setTextStore(nullptr);
 }
 

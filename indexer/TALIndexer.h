@@ -11,8 +11,10 @@
 #include "docstore/TALDocStore.h"
 #include "indexer/DocDates.h"
 #include "indexer/TALZoneManager.h"
+#include "modification/TALSpellCorrection.h"
 #include "modification/TALStemRewrite.h"
 #include "modification/TALSynonyms.h"
+#include "modification/TALTopKVocab.h"
 #include "platform/Log.h"
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
@@ -43,9 +45,11 @@ enum class TALIndexerError {
 // the client state run on the caller's thread.
 //
 // Invariants.
-// 1. `_textStore` is replaced or deleted only by who holds both `_indexMutex` and
-// `_textStoreMutex`, so
-//    holding either keeps it. `_queue` work that changes it takes both.
+// 1. `_textStore`, and `_topKVocab` and `_spellCorrection` which read it, are replaced or deleted
+// only
+//    by who holds both `_indexMutex` and `_textStoreMutex`, so holding either keeps them. Only work
+//    on `_queue` and the end of a shutdown do so. The vocabulary is shut down before the index
+//    goes.
 // 2. A search holds `_indexMutex` for one pass, a batch for all its documents: they never overlap.
 //    What changes the words of a query between two passes reads the index beside batches.
 // 3. The document store is written before the text index. What a search finds in the index and not
@@ -81,6 +85,14 @@ class TALIndexer {
   // Forgets all documents and all client states.
   void resetWithCompletionHandler(Completion completionHandler);
   void saltVacuumAndCompactWithCompletionHandler(Completion completionHandler);
+
+  // Counts the frequent words anew, in the background. The handler runs on the vocabulary's queue
+  // and must not wait for the indexer; without vocabulary it is not called.
+  void forceRebuildTopKVocabWithCompletionHandler(Completion completionHandler);
+  // The frequent words, most frequent first; null without vocabulary.
+  [[nodiscard]] std::shared_ptr<const TALTopKVocab::Words> topKVocabulary();
+  // The same, read from the store again.
+  std::shared_ptr<const TALTopKVocab::Words> loadTopKVocabFromDocStore(TLErrorOut error);
 
   // The bytes stored under a client's name, none when there are none. Synchronous.
   void fetchLastClientStateforName(
@@ -141,6 +153,12 @@ class TALIndexer {
   void createTextStore(int64_t storedDocuments) TL_REQUIRES(_indexMutex);
   void makeQueryObjects();
   void setTextStore(std::unique_ptr<salt::Index> index) TL_REQUIRES(_indexMutex);
+  void makeVocabulary() TL_REQUIRES(_indexMutex);
+  // Waits for a rebuild that runs.
+  void dropVocabulary() TL_REQUIRES(_indexMutex);
+  std::shared_ptr<TALTopKVocab> topKVocab();
+  // For work on the queue: starts a rebuild of the vocabulary if enough documents have come.
+  void checkVocabulary();
   void close() TL_REQUIRES(_indexMutex);
 
   void _scheduleWork(std::string name, Task task, Completion completionHandler);
@@ -204,6 +222,9 @@ class TALIndexer {
   bool _modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
                          std::vector<saltsearch::Term>& modifiedQueryTerms,
                          const TLParameters& searchParams);
+  bool modifyWithSpelling(const std::vector<saltsearch::Term>& queryTerms,
+                          std::vector<saltsearch::Term>& modifiedQueryTerms)
+      TL_REQUIRES(_textStoreMutex);
   bool modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms,
                           std::vector<saltsearch::Term>& modifiedQueryTerms)
       TL_REQUIRES(_textStoreMutex);
@@ -222,7 +243,9 @@ class TALIndexer {
   platform::Mutex _indexMutex;
   // Held for as long as one reads `_textStore` without `_indexMutex`; taken after it.
   platform::Mutex _textStoreMutex;
-  std::unique_ptr<salt::Index> _textStore;  // see invariant 1
+  std::unique_ptr<salt::Index> _textStore;  // see invariant 1, for this and the next two
+  std::shared_ptr<TALTopKVocab> _topKVocab;
+  std::unique_ptr<TALSpellCorrection> _spellCorrection;
   TALStemRewrite _stemRewrite TL_GUARDED_BY(_textStoreMutex);
   DocDates _docDates TL_GUARDED_BY(_indexMutex);
   bool _shutdown TL_GUARDED_BY(_indexMutex) = false;

@@ -66,11 +66,14 @@ void TALIndexer::addDocs(Items docs, std::string bundleID, Completion completion
       "addDocs",
       [this, docs = std::move(docs), bundleID = std::move(bundleID)] {
         std::optional<TLError> error;
-        MutexLock lock(_indexMutex);
-        const uint64_t signpost = Signpost::identifierForObject(&docs);
-        Signpost::begin(signpost, "addDocs", "index {} items", docs.size());
-        _addDocs(docs, bundleID, &error);
-        Signpost::end(signpost, "addDocs", "");
+        {
+          MutexLock lock(_indexMutex);
+          const uint64_t signpost = Signpost::identifierForObject(&docs);
+          Signpost::begin(signpost, "addDocs", "index {} items", docs.size());
+          _addDocs(docs, bundleID, &error);
+          Signpost::end(signpost, "addDocs", "");
+        }
+        checkVocabulary();
         return error;
       },
       std::move(completionHandler));
@@ -83,17 +86,18 @@ void TALIndexer::addDocs(Items docs, Strings deleteItemsByIdentifiers,
       "addDocs:deleteDoscsByIdentifiers:clientStates:",
       [this, docs = std::move(docs), identifiers = std::move(deleteItemsByIdentifiers),
        state = std::move(clientState), name = std::move(clientStateName),
-       bundleID = std::move(bundleID)]() -> std::optional<TLError> {
+       bundleID = std::move(bundleID)] {
+        std::optional<TLError> error;
         if (!identifiers.empty()) {
-          std::optional<TLError> error;
           const uint64_t signpost = Signpost::identifierForObject(&identifiers);
           Signpost::begin(signpost, "deleteItemsByIdentifiers", "delete {} items",
                           identifiers.size());
           _deleteItemsByIdentifiers(identifiers, bundleID, &error);
           Signpost::end(signpost, "deleteItemsByIdentifiers", "");
-          if (error) return error;
         }
-        return addAndStoreState(docs, state, name, bundleID);
+        if (!error) error = addAndStoreState(docs, state, name, bundleID);
+        checkVocabulary();
+        return error;
       },
       std::move(completionHandler));
 }
@@ -268,6 +272,9 @@ bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t b
           indexed, static_cast<int64_t>(batch.urlsToIndex.size()) - indexed,
           platform::printable(failure));
       return false;
+    }
+    if (_topKVocab != nullptr && _topKVocab->maxDocID() < docID->second) {
+      _topKVocab->setMaxDocID(docID->second);
     }
     batch.mergedDocs.erase(merged);
     textStoreMillis += docParsingTime;

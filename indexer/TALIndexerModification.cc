@@ -45,12 +45,33 @@ bool TALIndexer::_modifyQueryTerms(const std::vector<saltsearch::Term>& queryTer
                                    const TLParameters& searchParams) {
   MutexLock lock(_textStoreMutex);
   if (_textStore == nullptr) return false;
+  if (searchParams.boolValueForKey("queryModification.enableSpellModification") &&
+      _spellCorrection != nullptr && modifyWithSpelling(queryTerms, modifiedQueryTerms)) {
+    return true;
+  }
   if (searchParams.boolValueForKey("queryModification.enableSynonymModification") &&
       modifyWithSynonyms(queryTerms, modifiedQueryTerms)) {
     return true;
   }
   return searchParams.boolValueForKey("queryModification.enableStemModification") &&
          modifyWithStems(queryTerms, modifiedQueryTerms);
+}
+
+bool TALIndexer::modifyWithSpelling(const std::vector<saltsearch::Term>& queryTerms,
+                                    std::vector<saltsearch::Term>& modifiedQueryTerms) {
+  log().standard("Spelling correction started.");
+  std::vector<saltsearch::Term> corrected;
+  const float score = _spellCorrection->correctSpelling(queryTerms, corrected, *_textStore);
+  if (score > 0.0F && !corrected.empty()) {
+    modifiedQueryTerms = std::move(corrected);
+    log().standard(
+        "Spelling correction finished with query modified. Skipping all other query modification.");
+    return true;
+  }
+  log().standard(
+      "Spelling correction finished without query modified. Continue with other query "
+      "modification.");
+  return false;
 }
 
 bool TALIndexer::modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms,

@@ -22,7 +22,14 @@ namespace salt {
 
 class IndexView;
 class PlaceSet;
-struct ScanCounts;
+
+// What a scan adds to the metrics.
+struct ScanCounts {
+  uint64_t results = 0;
+  uint64_t fetches = 0;
+  uint64_t hotReads = 0;
+  uint64_t pageReads = 0;
+};
 
 inline constexpr char kDeletedKey[] =
     "\xFF"
@@ -66,6 +73,8 @@ class index final : public Index {
   std::optional<uint64_t> ScanPlaces(
       std::string_view prefix, uint64_t limit,
       const std::function<void(const Place* places, size_t count)>& callback) const override;
+  [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
+      const std::vector<std::string>& prefixes, size_t limit) const override;
 
   // The text of Dump, in pieces of some 64 KiB. `sink` returns false to stop. False when it did,
   // or, with a log line, when reading failed.

@@ -10,14 +10,6 @@
 // The reading half of the index.
 namespace salt {
 
-// What a scan adds to the metrics.
-struct ScanCounts {
-  uint64_t results = 0;
-  uint64_t fetches = 0;
-  uint64_t hotReads = 0;
-  uint64_t pageReads = 0;
-};
-
 namespace {
 
 // One walk through shards for one prefix, cut already.

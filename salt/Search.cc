@@ -6,82 +6,11 @@
 #include <cstdint>
 
 #include "salt/Candidates.h"
-#include "salt/Database.h"
+#include "salt/TermRules.h"
 
 namespace saltsearch {
 
 namespace {
-
-// What the terms from one on can still multiply a document's score by, computed from the last term
-// back. It is what lets a search drop documents early.
-struct Bounds {
-  std::vector<double> zone;     // of one term: sum of its zone weights, at most 1
-  std::vector<double> matched;  // highest product if at least one of the terms really matches
-  std::vector<double> any;      // highest product
-};
-
-double cappedSum(const std::vector<double>& weights) {
-  double sum = 0;
-  for (const double weight : weights) sum += weight;
-  return std::min(sum, 1.0);
-}
-
-Bounds boundsOf(const std::vector<Term>& terms) {
-  const size_t n = terms.size();
-  Bounds bounds{std::vector<double>(n), std::vector<double>(n + 1), std::vector<double>(n + 1)};
-  bounds.matched[n] = 0;
-  bounds.any[n] = 1;
-  for (size_t i = n; i-- > 0;) {
-    const Term& term = terms[i];
-    bounds.zone[i] = term.zones.empty() ? 1.0 : cappedSum(term.zoneScores);
-    double best = 0;
-    for (const double score : term.tokenScores) best = std::max(best, score);
-    best *= bounds.zone[i];
-    bounds.any[i] = std::max(term.defaultScore, best) * bounds.any[i + 1];
-    bounds.matched[i] =
-        std::max(term.defaultScore * bounds.matched[i + 1], best * bounds.any[i + 1]);
-  }
-  return bounds;
-}
-
-bool wellFormed(const Term& term) {
-  if (term.tokens.size() != term.tokenScores.size()) {
-    salt::Log.error("Mismatched tokens in query.");
-    return false;
-  }
-  if (term.zones.size() != term.zoneScores.size()) {
-    salt::Log.error("Mismatched zones in query.");
-    return false;
-  }
-  if (term.zones.size() > kMaxTermZones) {
-    salt::Log.error("Too many zones in query: {}.", term.zones.size());
-    return false;
-  }
-  return true;
-}
-
-// The bit in a zone mask that a match in a zone sets, 0 when it does not count.
-class ZoneBits {
- public:
-  explicit ZoneBits(const std::vector<uint16_t>& zones) {
-    if (zones.empty()) _others = 1;
-    for (size_t i = 0; i < zones.size(); ++i) {
-      const uint32_t bit = uint32_t{1} << i;
-      if (zones[i] == 0) _others = bit;  // the last entry of this kind stands for all not listed
-      if (zones[i] >= _bits.size()) _bits.resize(zones[i] + size_t{1});
-      if (_bits[zones[i]] == 0) _bits[zones[i]] = bit;
-    }
-  }
-
-  [[nodiscard]] uint32_t of(uint16_t zoneID) const {
-    const uint32_t bit = zoneID < _bits.size() ? _bits[zoneID] : 0;
-    return bit != 0 ? bit : _others;
-  }
-
- private:
-  std::vector<uint32_t> _bits;  // by zone
-  uint32_t _others = 0;
-};
 
 // The evaluation of one term: collects its matches, then multiplies them into the scores.
 class TermRun {
@@ -116,7 +45,7 @@ class TermRun {
 
   void score() {
     _candidates.retain([this](DocResult& doc) {
-      doc.score *= factor(doc);
+      doc.score *= factorOf(_term, doc);
       if (_reach < _options.threshold && doc.score < _need) return false;
       doc.tokenScore = -1.0;
       doc.zoneMask = 0;
@@ -187,17 +116,6 @@ class TermRun {
                                     : std::max(doc->tokenScore, _tokenScore);
     }
     doc->zoneMask |= bit;
-  }
-
-  // What this term multiplies the document's score by.
-  [[nodiscard]] double factor(const DocResult& doc) const {
-    if (doc.tokenScore == -1.0) return _term.defaultScore;
-    if (_term.zones.empty()) return doc.tokenScore;
-    double sum = 0;
-    for (size_t i = 0; i < _term.zones.size(); ++i) {
-      if ((doc.zoneMask >> i & 1) != 0) sum += _term.zoneScores[i];
-    }
-    return doc.tokenScore * std::min(sum, 1.0);
   }
 
   Term& _term;

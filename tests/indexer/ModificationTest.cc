@@ -71,25 +71,38 @@ class QueryModification : public testing::Test {
 };
 
 const TLString kThreshold = u"queryModification.sufficentRetrievalThreshold=";
+const TLString kSpellingOff = u"queryModification.enableSpellModification=NO";
 const TLString kSynonymsOff = u"queryModification.enableSynonymModification=NO";
 const TLString kStemsOff = u"queryModification.enableStemModification=NO";
 using Lines = std::vector<std::string>;
+const char* const kSpellingGoesOn =
+    "Spelling correction finished without query modified. Continue with other query modification.";
 
 }  // namespace
 
-TEST_F(QueryModification, TriesSynonymsThenStemsAndTheFirstThatChangesSomethingEndsIt) {
+TEST_F(QueryModification, TriesSpellingSynonymsStemsAndTheFirstThatChangesSomethingEndsIt) {
   EXPECT_EQ(search(u"bill june"), "a");
   EXPECT_EQ(
       driverLines(),
-      (Lines{"Query modification started for query with 3 terms", "Synonyms modification started.",
+      (Lines{"Query modification started for query with 3 terms", "Spelling correction started.",
+             kSpellingGoesOn, "Synonyms modification started.",
              "Synonyms modification finished with query modified. Skipping all other query "
+             "modification.",
+             "Query modification finished. Results retrieved with modified query terms."}));
+  log.clear();
+  EXPECT_EQ(search(u"invoise june"), "a");
+  EXPECT_EQ(
+      driverLines(),
+      (Lines{"Query modification started for query with 3 terms", "Spelling correction started.",
+             "Spelling correction finished with query modified. Skipping all other query "
              "modification.",
              "Query modification finished. Results retrieved with modified query terms."}));
   log.clear();
   EXPECT_EQ(search(u"ordering june"), "b");
   EXPECT_EQ(
       driverLines(),
-      (Lines{"Query modification started for query with 3 terms", "Synonyms modification started.",
+      (Lines{"Query modification started for query with 3 terms", "Spelling correction started.",
+             kSpellingGoesOn, "Synonyms modification started.",
              "Synonyms modification finished without query modified. Continue with other "
              "query modification.",
              "Stem rewrite started.", "Stem rewrite finished with query modified.",
@@ -106,7 +119,7 @@ TEST_F(QueryModification, LeavesWhatCannotBeChanged) {
             "Query modification didnt work out. Return original query results.");
   EXPECT_TRUE(log.has("default TALIndexer: Stem rewrite finished without query modified."));
   log.clear();
-  EXPECT_EQ(search(u"bill ", kSynonymsOff + u"," + kStemsOff), "");
+  EXPECT_EQ(search(u"bill ", kSpellingOff + u"," + kSynonymsOff + u"," + kStemsOff), "");
   EXPECT_EQ(driverLines(),
             (Lines{"Query modification started for query with 1 terms",
                    "Query modification didnt work out. Return original query results."}));

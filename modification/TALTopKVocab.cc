@@ -1,0 +1,199 @@
+#include "modification/TALTopKVocab.h"
+
+#include <ctime>
+#include <utility>
+
+#include "modification/TopKVocabArchive.h"
+#include "platform/Clock.h"
+#include "salt/Search.h"
+#include "salt/TopTokens.h"
+
+using platform::MutexLock;
+
+namespace {
+
+constexpr const char* kQueueName = "com.quill.tallow.indexer.topkvocab.topkvocabqueue";
+constexpr const char* kErrorDomain = "TALTopKVocab";
+constexpr int kDamagedArchive = 1;
+
+// When a rebuild is due, by documents that came since the last.
+constexpr int64_t kLeastDocs = 51;     // whatever else holds
+constexpr int64_t kEnoughDocs = 2001;  // on their own
+constexpr float kGrowth = 0.5F;        // of the documents there were before
+constexpr float kOldSeconds = 432000;  // 5 days
+
+TLError damaged(const char* what) {
+  return {kErrorDomain, kDamagedArchive, std::string("the stored vocabulary has no ") + what};
+}
+
+std::string dateText(double secondsSince1970) {
+  constexpr double kLatest = 253402300799.0;  // the last second of year 9999
+  if (!(secondsSince1970 >= 0 && secondsSince1970 <= kLatest)) return "(none)";
+  const auto seconds = static_cast<time_t>(secondsSince1970);
+  tm local{};
+  char text[64];
+  localtime_r(&seconds, &local);
+  strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S", &local);
+  return text;
+}
+
+}  // namespace
+
+const platform::Log& TALTopKVocab::log() {
+  static const platform::Log handle(platform::kSubsystem, "TALTopKVocab");
+  return handle;
+}
+
+TALTopKVocab::TALTopKVocab(std::shared_ptr<TALDocStore> docStore, const salt::Index* textStore)
+    : _docStore(std::move(docStore)),
+      _textStore(textStore),
+      _lastTopKRebuildDate(platform::secondsSince1970()),
+      _vocab(std::make_shared<const Words>()) {
+  if (_docStore == nullptr || _textStore == nullptr) return;
+  _topKVocabQueue.emplace(kQueueName);
+  _topKVocabQueue->async(platform::lowerThreadPriority);
+  loadTopKVocabFromDocStore(nullptr);
+  log().standard("Last topK rebuild date: {}.", dateText(_lastTopKRebuildDate));
+  log().standard("Last topK rebuild docID: {}.", _lastTopKRebuildDocID.load());
+  log().standard("Last topK has {} tokens.", vocab()->size());
+}
+
+TALTopKVocab::~TALTopKVocab() {
+  shutdown();
+}
+
+void TALTopKVocab::shutdown() {
+  _isShutdown = true;
+  if (_topKVocabQueue) _topKVocabQueue->drain();
+}
+
+std::shared_ptr<const TALTopKVocab::Words> TALTopKVocab::vocab() const {
+  MutexLock lock(_vocabMutex);
+  return _vocab;
+}
+
+void TALTopKVocab::setVocab(Words words) {
+  auto made = std::make_shared<const Words>(std::move(words));
+  MutexLock lock(_vocabMutex);
+  _vocab = std::move(made);
+}
+
+void TALTopKVocab::loadTopKVocabFromDocStore(TLErrorOut error) {
+  if (_docStore == nullptr) return;
+  std::optional<TLError> failure;
+  const auto blob = _docStore->loadTopKVocab(&failure);
+  if (failure) {
+    log().standard("TopK is not loaded from docstore: {}", platform::printable(failure));
+    platform::setError(error, *failure);
+    return;
+  }
+  const auto entries = blob ? topkvocab::unarchive(*blob) : std::nullopt;
+  if (!entries) {
+    platform::setError(error, damaged("values"));
+    return;
+  }
+  if (entries->size() != 3) return;
+  auto words = topkvocab::unarchiveWords(entries->at(0));
+  if (!words) {
+    setVocab({});
+    const TLError noWords = damaged("words");
+    log().error("TopK cannot be unarchived: {}", platform::printable(noWords));
+    platform::setError(error, noWords);
+    return;
+  }
+  setVocab(std::move(*words));
+  log().standard("TopK loaded from docstore.");
+  if (const auto docID = topkvocab::unarchiveDocID(entries->at(1))) {
+    _lastTopKRebuildDocID = *docID;
+  } else {
+    platform::setError(error, damaged("document ID"));
+  }
+  _maxDocID = _lastTopKRebuildDocID.load();
+  if (const auto date = topkvocab::unarchiveDate(entries->at(2))) {
+    _lastTopKRebuildDate = *date;
+  } else {
+    platform::setError(error, damaged("date"));
+  }
+}
+
+bool TALTopKVocab::_needRebuildTopKVocab() const {
+  const int64_t last = _lastTopKRebuildDocID;
+  const int64_t delta = _maxDocID - last;
+  if (delta < kLeastDocs) return false;
+  if (delta >= kEnoughDocs || vocab()->empty()) return true;
+  if (static_cast<float>(last) * kGrowth < static_cast<float>(delta)) return true;
+  const double age = platform::secondsSince1970() - _lastTopKRebuildDate;
+  return static_cast<float>(age) > kOldSeconds;
+}
+
+void TALTopKVocab::checkAndRebuildTopKVocabWithCompletionHandler(Completion handler,
+                                                                 bool forceRebuild) {
+  if (!forceRebuild && !_needRebuildTopKVocab()) return;
+  if (forceRebuild || handler) {
+    _rebuildTopKVocabWithCompletionHandler(std::move(handler));
+  } else {
+    rebuildUnlessOneWaits();
+  }
+}
+
+void TALTopKVocab::rebuildUnlessOneWaits() {
+  if (!_topKVocabQueue || _rebuildWaits.exchange(true)) return;
+  _topKVocabQueue->async([this] {
+    _rebuildWaits = false;
+    rebuild();
+  });
+}
+
+void TALTopKVocab::_rebuildTopKVocabWithCompletionHandler(Completion handler) {
+  if (!_topKVocabQueue) return;
+  _topKVocabQueue->async([this, completion = std::move(handler)] {
+    const std::optional<TLError> outcome = rebuild();
+    if (completion) completion(outcome);
+  });
+}
+
+// The figures change before the work, so that a rebuild that is given up counts as done.
+std::optional<TLError> TALTopKVocab::rebuild() {
+  log().standard("Starting to rebuild topK vocab from SALT.");
+  _lastTopKRebuildDocID = _maxDocID.load();
+  _lastTopKRebuildDate = platform::secondsSince1970();
+  if (_isShutdown) {
+    log().standard("TopKVocab is shutting down before TopKTokens.");
+    return std::nullopt;
+  }
+  count();
+  log().standard("Rebuild date: {}.", dateText(_lastTopKRebuildDate));
+  log().standard("Rebuild docID: {}.", _lastTopKRebuildDocID.load());
+  log().standard("TopK vocab has {} tokens.", vocab()->size());
+  log().standard("TopK vocab rebuild is done.");
+  const std::string blob =
+      topkvocab::archive(*vocab(), _lastTopKRebuildDocID, _lastTopKRebuildDate);
+  if (_isShutdown) {
+    log().standard("TopKVocab is shutting down before storeTopKVocab.");
+    return std::nullopt;
+  }
+  return store(blob);
+}
+
+// A count that a shutdown cuts short leaves the words as they were.
+void TALTopKVocab::count() {
+  const auto tokens =
+      saltsearch::TopKTokens(*_textStore, kWords, saltsearch::ZoneScoreDefault,
+                             saltsearch::TokenizeSpace, [this] { return !_isShutdown; });
+  if (_isShutdown) return;
+  Words words;
+  words.reserve(tokens.size());
+  for (const auto& [token, weight] : tokens) words.push_back(token);
+  setVocab(std::move(words));
+}
+
+std::optional<TLError> TALTopKVocab::store(const std::string& blob) {
+  std::optional<TLError> failure;
+  _docStore->storeTopKVocab(blob, &failure);
+  if (failure) {
+    log().error("Rebuilt topK vocab cannot be saved to docstore: {}", platform::printable(failure));
+  } else {
+    log().standard("Rebuilt topK vocab saved to docstore.");
+  }
+  return failure;
+}

@@ -1,0 +1,155 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <future>
+
+#include "docstore/TALSqliteDocStore.h"
+#include "indexer/TALIndexer.h"
+#include "records/TLParamsManager.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using Outcome = std::optional<TLError>;
+
+// Documents by which a vocabulary is due when there is none.
+constexpr int kDue = 51;
+
+class IndexerVocabularyTest : public testing::Test {
+ protected:
+  IndexerVocabularyTest() { open(); }
+  ~IndexerVocabularyTest() override { indexer->shutdown(); }
+
+  void open() {
+    store = std::make_shared<TALSqliteDocStore>(directory / "docstore/docstore.db");
+    ASSERT_TRUE(store->openWithError(nullptr));
+    indexer = std::make_unique<TALIndexer>(directory / "salt", "testing", store, "");
+  }
+  void reopen() {
+    indexer->shutdown();
+    open();
+  }
+
+  template <typename Start>
+  static Outcome wait(const Start& start) {
+    std::promise<Outcome> promise;
+    start([&promise](const Outcome& outcome) { promise.set_value(outcome); });
+    return promise.get_future().get();
+  }
+  // Mail that is named by its subject.
+  Outcome add(const std::vector<std::string>& subjects) {
+    TALIndexer::Items items;
+    for (const std::string& subject : subjects) {
+      auto item = std::make_shared<TLIndexableItem>();
+      std::string identifier = subject;
+      std::replace(identifier.begin(), identifier.end(), ' ', '-');
+      item->setIdentifier(platform::fromUTF8(identifier));
+      item->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, platform::fromUTF8(subject));
+      items.push_back(std::move(item));
+    }
+    return wait([&](auto done) { indexer->addDocs(std::move(items), "mail_bundle_id", done); });
+  }
+  Outcome addMany(int count) {
+    std::vector<std::string> subjects;
+    for (int i = 0; i < count; ++i) subjects.push_back("common " + std::to_string(i));
+    return add(subjects);
+  }
+  // Adds documents so that a rebuild is due, and waits for it and one more.
+  void build() {
+    ASSERT_EQ(addMany(kDue), std::nullopt);
+    EXPECT_EQ(rebuild(), std::nullopt);
+  }
+  Outcome rebuild() {
+    return wait([&](auto done) { indexer->forceRebuildTopKVocabWithCompletionHandler(done); });
+  }
+  std::string search(const std::string& text, TLStringView overrides = u"") {
+    TLQuery query;
+    query.setOriginalQuery(platform::fromUTF8(text));
+    if (!overrides.empty()) query.setSearchParams(TLParamsManager::paramsFromString(overrides));
+    std::string out;
+    for (const auto& item : indexer->search(query, nullptr)) {
+      if (!out.empty()) out += ' ';
+      out += platform::printable(item->identifier());
+    }
+    return out;
+  }
+
+  const testsupport::LogCapture log;
+  const testsupport::TemporaryDirectory directory;
+  std::shared_ptr<TALSqliteDocStore> store;
+  std::unique_ptr<TALIndexer> indexer;
+};
+
+}  // namespace
+
+TEST_F(IndexerVocabularyTest, AMistypedWordFindsTheMailOfTheRightOne) {
+  ASSERT_EQ(add({"quarterly invoice attached", "meeting minutes", "invitation"}), std::nullopt);
+  for (const char* typed :
+       {"invoise", "invoce", "invvoice", "invocie", "invoise attached",
+        "quarterly invoise attached", "quarterly invoice attacehd", "Qarterly invoice "}) {
+    EXPECT_EQ(search(typed), "quarterly-invoice-attached") << typed;
+  }
+  EXPECT_TRUE(log.has("default TALIndexer: Spelling correction started."));
+  EXPECT_TRUE(log.contains("modified with candidate <\"in...\"<7 chars>>."));
+  EXPECT_TRUE(
+      log.has("default TALIndexer: Spelling correction finished with query modified. "
+              "Skipping all other query modification."));
+  EXPECT_TRUE(
+      log.has("default TALIndexer: Query modification finished. Results retrieved with "
+              "modified query terms."));
+  EXPECT_EQ(search("invoise",
+                   u"queryModification.enableSpellModification=NO,"
+                   u"queryModification.enableStemModification=NO"),
+            "");
+  EXPECT_EQ(search("qarterly invoise"), "");
+  EXPECT_EQ(search("\xF0\x9F\x98\x80"), "");
+  EXPECT_FALSE(log.contains("invoise"));
+}
+
+TEST_F(IndexerVocabularyTest, IsBuiltDuringIngestAndSurvivesARestart) {
+  EXPECT_TRUE(indexer->topKVocabulary()->empty());
+  ASSERT_EQ(addMany(kDue - 1), std::nullopt);
+  EXPECT_FALSE(log.contains("Starting to rebuild topK vocab"));
+  ASSERT_EQ(addMany(kDue), std::nullopt);
+  EXPECT_EQ(rebuild(), std::nullopt);  // behind the one that has begun
+  EXPECT_EQ(log.count("default TALTopKVocab: Starting to rebuild topK vocab from SALT."), 2U);
+  EXPECT_EQ(log.count("default TALTopKVocab: Rebuild docID: 51."), 2U);
+  EXPECT_EQ(indexer->topKVocabulary()->front(), "common ");
+  ASSERT_EQ(addMany(kDue), std::nullopt);  // nothing new
+  reopen();
+  EXPECT_EQ(indexer->topKVocabulary()->size(), kDue + 1U);
+  Outcome error;
+  EXPECT_EQ(indexer->loadTopKVocabFromDocStore(&error)->front(), "common ");
+  EXPECT_EQ(error, std::nullopt);
+  EXPECT_EQ(log.count("default TALTopKVocab: Starting to rebuild topK vocab from SALT."), 2U);
+}
+
+TEST_F(IndexerVocabularyTest, AResetForgetsItAndGoesOn) {
+  build();
+  EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+  EXPECT_TRUE(indexer->topKVocabulary()->empty());
+  EXPECT_EQ(store->loadTopKVocab(nullptr), std::nullopt);
+  build();
+  EXPECT_EQ(search("comon 7"), "common-7");
+}
+
+TEST_F(IndexerVocabularyTest, AResetOrShutdownDuringARebuildNeitherHangsNorReadsWhatIsGone) {
+  for (int round = 0; round < 4; ++round) {
+    ASSERT_EQ(addMany(kDue), std::nullopt);
+    for (int i = 0; i < 3; ++i) indexer->forceRebuildTopKVocabWithCompletionHandler(nullptr);
+    std::thread searching([&] { static_cast<void>(search("comon")); });
+    if (round % 2 == 0) {
+      EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+      searching.join();
+    } else {
+      searching.join();
+      reopen();
+    }
+  }
+  indexer->shutdown();
+  EXPECT_EQ(indexer->topKVocabulary(), nullptr);
+  EXPECT_EQ(indexer->loadTopKVocabFromDocStore(nullptr), nullptr);
+  indexer->forceRebuildTopKVocabWithCompletionHandler([](const Outcome&) { FAIL(); });
+  EXPECT_FALSE(log.contains("cannot be saved"));
+}

@@ -1,0 +1,272 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <map>
+
+#include "docstore/TALSqliteDocStore.h"
+#include "modification/TALSpellCorrection.h"
+#include "modification/WeightedDistance.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using saltsearch::Term;
+using salttest::addZone;
+using testing::ElementsAre;
+
+namespace {
+
+constexpr uint16_t kZone = 13;
+
+Term word(const std::string& token) {
+  Term term;
+  term.tokens = {token};
+  term.tokenScores = {0.5};
+  term.zones = {kZone};
+  term.zoneScores = {0.5};
+  term.isUnigram = true;
+  return term;
+}
+
+std::vector<std::string> tokens(const std::vector<TALCorrectionCandidate>& candidates) {
+  std::vector<std::string> result;
+  for (const auto& candidate : candidates) result.push_back(candidate._token);
+  return result;
+}
+
+class SpellCorrectionTest : public testing::Test {
+ protected:
+  SpellCorrectionTest() {
+    EXPECT_TRUE(store->openWithError(nullptr));
+    vocab = std::make_shared<TALTopKVocab>(store, index.get());
+    spelling = std::make_unique<TALSpellCorrection>(index.get(), vocab);
+  }
+
+  // Searches, so that `found` is set, and corrects. The terms' first tokens afterwards, "-" when
+  // nothing changed.
+  std::string correct(std::vector<Term> terms) {
+    static_cast<void>(saltsearch::Search(*index, terms, {1000, 1000000, 0.02}));
+    std::vector<Term> corrected;
+    score = spelling->correctSpelling(terms, corrected, *index);
+    if (score <= 0) {
+      EXPECT_EQ(score, -1);
+      EXPECT_TRUE(corrected.empty());
+      return "-";
+    }
+    std::string result;
+    for (const Term& term : corrected) result += term.tokens[0] + '|';
+    return result;
+  }
+
+  void add(uint32_t docID, const std::string& text, uint16_t zone = kZone) {
+    ASSERT_TRUE(addZone(*index, docID, zone, text, salttest::wordOffsets(text)));
+  }
+
+  const testsupport::TemporaryDirectory directory;
+  const testsupport::LogCapture log;
+  const std::shared_ptr<TALSqliteDocStore> store =
+      std::make_shared<TALSqliteDocStore>(directory / "docs.db");
+  const std::unique_ptr<salt::Index> index = salttest::newIndex(directory / "i");
+  std::shared_ptr<TALTopKVocab> vocab;
+  std::unique_ptr<TALSpellCorrection> spelling;
+  float score = 0;
+};
+
+}  // namespace
+
+// Two letters: no deletion; one pair, which is the first.
+TEST_F(SpellCorrectionTest, EditsComeInOrderOfPosition) {
+  const auto all = spelling->editOneCandidates("ab");
+  std::vector<std::pair<std::string, float>> expected{{"ba", 0.61F}};
+  const auto letters = [&expected](const std::string& before, const std::string& after, char not_,
+                                   float worth) {
+    for (char c = 'a'; c <= 'z'; ++c) {
+      if (c != not_) expected.emplace_back(before + c + after, worth);
+    }
+  };
+  letters("", "b", 'a', 0.73F);
+  letters("", "ab", 0, 0.55F);
+  letters("a", "", 'b', 0.81F);
+  letters("a", "b", 0, 0.82F);
+  letters("ab", "", 0, 0.75F);
+  ASSERT_EQ(all.size(), expected.size());
+  for (size_t i = 0; i < all.size(); ++i) {
+    EXPECT_EQ(std::pair(all[i]._token, all[i]._scoreError), expected[i]) << i;
+    EXPECT_EQ(all[i]._scoreTopicality, 0);
+  }
+  EXPECT_TRUE(spelling->editOneCandidates("a").empty());
+  EXPECT_TRUE(spelling->editOneCandidates("").empty());
+}
+
+TEST_F(SpellCorrectionTest, EditsByLengthOfTheWord) {
+  const struct {
+    std::string word;
+    size_t count;
+    std::vector<std::pair<std::string, float>> some;  // candidate and score, in order
+    std::vector<std::string> none;
+  } cases[] = {
+      {"abc",
+       2 + 3 * 51 + 26,
+       {{"bac", 0.61F},
+        {"zabc", 0.55F},
+        {"acb", 0.62F},
+        {"azc", 0.8F},
+        {"abz", 0.81F},
+        {"abzc", 0.82F},
+        {"abcz", 0.75F}},
+       {"ab", "ac", "bc"}},
+      {"abcd",
+       3 + 4 + 4 * 51 + 26,
+       {{"bacd", 0.61F},
+        {"bcd", 0.6F},
+        {"acbd", 0.7F},
+        {"acd", 0.72F},
+        {"abdc", 0.62F},
+        {"abc", 0.79F},
+        {"abcdz", 0.75F}},
+       {"cd"}},
+      {"aabb", 1 + 4 + 4 * 51 + 26, {{"abb", 0.6F}, {"abab", 0.7F}, {"aab", 0.72F}}, {}},
+      // The budget of 1000 is used up at the nineteenth letter: 18 * 53 candidates before it.
+      {"abcdefghijklmnopqrst", 1000, {{"abcdefghijklmnopqrts", 0.62F}}, {"abcdefghijklmnopqrstz"}},
+      {"abcdefghijklmnopqrstu", 1000, {{"abcdefghijklmnopqrtsu", 0.7F}}, {"abcdefghijklmnopqrsut"}},
+  };
+  for (const auto& c : cases) {
+    const auto made = spelling->editOneCandidates(c.word);
+    EXPECT_EQ(made.size(), c.count) << c.word;
+    auto from = made.begin();
+    for (const auto& [token, worth] : c.some) {
+      from = std::find_if(from, made.end(), [&](const auto& m) { return m._token == token; });
+      ASSERT_NE(from, made.end()) << token;
+      EXPECT_EQ(from->_scoreError, worth) << token;
+    }
+    for (const std::string& token : c.none) {
+      EXPECT_THAT(tokens(made), testing::Not(testing::Contains(token)));
+    }
+  }
+  const TALSpellCorrection frugal(index.get(), vocab, 5, 2);
+  EXPECT_THAT(tokens(frugal.editOneCandidates("abcd")),
+              ElementsAre("bacd", "bcd", "bbcd", "cbcd", "dbcd"));
+}
+
+TEST_F(SpellCorrectionTest, OnlyUnmatchedSingleWordsOfSomeLengthAreCorrected) {
+  const auto refused = [](const std::function<void(Term&)>& change) {
+    Term term = word("word ");
+    change(term);
+    return TALSpellCorrection::_doNotCorrect(term);
+  };
+  EXPECT_FALSE(refused([](Term&) {}));
+  EXPECT_TRUE(refused([](Term& t) { t.isUnigram = false; }));
+  EXPECT_TRUE(refused([](Term& t) { t.found = true; }));
+  EXPECT_TRUE(refused([](Term& t) { t.tokens.clear(); }));
+  EXPECT_TRUE(refused([](Term& t) { t.tokenScores.clear(); }));
+  const std::map<size_t, bool> byLength{{0, true}, {1, true}, {2, false}, {21, false}, {22, true}};
+  for (const auto& [length, expected] : byLength) {
+    EXPECT_EQ(refused([&](Term& t) { t.tokens[0] = std::string(length, 'a'); }), expected);
+  }
+}
+
+TEST_F(SpellCorrectionTest, FindsTheRightWordAfterEachKindOfMistake) {
+  add(1, "quarterly invoice attached ");
+  add(2, "lunch ");
+  for (const char* typed : {"invoise ", "invoce ", "invvoice ", "invocie ", "nvoice ", "invoic "}) {
+    EXPECT_EQ(correct({word("quarterly "), word(typed)}), "quarterly |invoice |") << typed;
+  }
+  // A prefix is corrected to a prefix.
+  EXPECT_EQ(correct({word("quarterly "), word("invxi")}), "quarterly |invoi|");
+  EXPECT_TRUE(
+      log.has("default TALSpellCorrection: No match token <\"in...\"<8 chars>> is "
+              "considered for spelling correction."));
+  EXPECT_TRUE(log.has("default TALSpellCorrection: Found 1 candidates in lexicon."));
+  EXPECT_TRUE(
+      log.has("default TALSpellCorrection: Spelling returns best candidate with overall "
+              "score: 0.925000, error score: 0.800000, text score: 0.125000. Term "
+              "<\"in...\"<8 chars>> modified with candidate <\"in...\"<8 chars>>."));
+}
+
+TEST_F(SpellCorrectionTest, ChangesOneTokenAndItsScore) {
+  add(1, "invoice ");
+  std::vector<Term> terms{word("invoise ")};
+  terms[0].tokens.push_back("other ");
+  terms[0].tokenScores.push_back(0.25);
+  std::vector<Term> corrected;
+  EXPECT_FLOAT_EQ(spelling->correctSpelling(terms, corrected, *index), 0.8F + 0.5F);
+  ASSERT_EQ(corrected.size(), 1U);
+  EXPECT_THAT(corrected[0].tokens, ElementsAre("invoice ", "other "));
+  EXPECT_THAT(corrected[0].tokenScores, ElementsAre(1.0, 0.25));
+  EXPECT_EQ(corrected[0].zones, terms[0].zones);
+  EXPECT_TRUE(corrected[0].isUnigram);
+}
+
+TEST_F(SpellCorrectionTest, TheWholeQueryJudgesAndTheFirstOfEqualsWins) {
+  add(1, "cart red ");
+  add(2, "cast blue ");
+  add(3, "carp red ");
+  EXPECT_EQ(correct({word("cazt "), word("blue ")}), "cast |blue |");
+  // Both replace the third letter.
+  EXPECT_EQ(correct({word("caqt ")}), "cart |");
+  // None is in a document with the other word.
+  EXPECT_EQ(correct({word("cazt "), word("green ")}), "-");
+  EXPECT_TRUE(
+      log.has("default TALSpellCorrection: Skipping spelling correction as more than 1 "
+              "term has no-matched document."));
+  add(4, "green ");
+  EXPECT_EQ(correct({word("cazt "), word("green ")}), "-");
+  EXPECT_TRUE(
+      log.has("default TALSpellCorrection: Best spelling candidate <\"ca...\"<5 chars>> has "
+              "sub-zero textScore."));
+  EXPECT_TRUE(log.has("default TALSpellCorrection: Spelling correction returns score -1."));
+  EXPECT_EQ(correct({word("green ")}), "-");
+  EXPECT_TRUE(
+      log.has("default TALSpellCorrection: Skipping spelling correction as criteria not met."));
+}
+
+TEST_F(SpellCorrectionTest, CandidatesMustBeInTheTermsZonesAndWithinTheBudget) {
+  add(1, "cart ", 99);
+  EXPECT_EQ(correct({word("cazt ")}), "-");
+  EXPECT_TRUE(log.has("default TALSpellCorrection: No candidates found in lexicon."));
+  for (uint32_t docID = 2; docID < 8; ++docID) add(docID, "cast ", kZone - 1);
+  add(9, "cast ");
+  add(10, "cant ");
+  add(11, "catt ");
+  // Five suffixes in other zones come before the one that would count.
+  EXPECT_THAT(tokens(spelling->_getCandidates("cazt ", word("cazt "))),
+              ElementsAre("cant ", "catt "));
+  const TALSpellCorrection frugal(index.get(), vocab, 1000, 1);
+  EXPECT_THAT(tokens(frugal._getCandidates("cazt ", word("cazt "))), ElementsAre("cant "));
+}
+
+TEST_F(SpellCorrectionTest, TakesFrequentWordsWhereNoEditFits) {
+  add(1, "international ");
+  vocab->setVocab({"in ", "international ", "internationalisation", "internatioal", "intern "});
+  EXPECT_EQ(correct({word("interantionel ")}), "international |");
+  EXPECT_TRUE(
+      log.has("default TALSpellCorrection: Spelling did not find any candidate from edit "
+              "distance 1. Continue with topK method."));
+  EXPECT_TRUE(log.has("default TALSpellCorrection: topKVocab has 5 entries."));
+  // The entry's own form counts, whatever was typed.
+  const auto candidates = spelling->_getCandidatesFromTopKVocab("interantionel", true);
+  ASSERT_THAT(tokens(candidates), ElementsAre("international ", "internatioal"));
+  EXPECT_FLOAT_EQ(candidates[0]._scoreError, 1 - (cSwapMid + cSubMid) / 13);
+  const TALSpellCorrection frugal(index.get(), vocab, 1, 100);
+  EXPECT_EQ(frugal._getCandidatesFromTopKVocab("interantionel", false).size(), 1U);
+
+  vocab->setVocab({"na\xC3\xAFvet\xC3\xA9 "});
+  add(2, "na\xC3\xAFvet\xC3\xA9 ");
+  EXPECT_EQ(correct({word("na\xC3\xAFvetx\xC3\xA9 ")}), "na\xC3\xAFvet\xC3\xA9 |");
+  EXPECT_TRUE(log.has("debug TALSpellCorrection: Token has unsupported char."));
+  EXPECT_EQ(correct({word("\xF0\x9F\x98\x80\xF0\x9F\x98\x80 ")}), "-");
+}
+
+TEST_F(SpellCorrectionTest, AThousandWordsAreNoTrouble) {
+  add(1, "word ");
+  std::vector<Term> terms(1000, word("word "));
+  terms[500] = word("wrd ");
+  for (Term& term : terms) {
+    term.tokenScores = {1};
+    term.zoneScores = {1};
+  }
+  EXPECT_NE(correct(terms), "-");
+  terms[501] = word("wrd ");
+  EXPECT_EQ(correct(terms), "-");
+}

@@ -1,0 +1,292 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <future>
+#include <latch>
+#include <random>
+
+#include "docstore/TALSqliteDocStore.h"
+#include "modification/TALTopKVocab.h"
+#include "modification/TopKVocabArchive.h"
+#include "platform/Clock.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/Seed.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using testing::ElementsAre;
+
+namespace {
+
+using Outcome = std::optional<TLError>;
+using Words = TALTopKVocab::Words;
+
+// An index of a hundred zones, whose walks call a function at each.
+class WatchedIndex final : public salt::Index {
+ public:
+  std::function<void()> atZone = [] {};
+  mutable std::atomic<int> zones = 0;
+
+  void ForEachZone(
+      std::function<bool(uint32_t, uint16_t, std::string_view)> callback) const override {
+    for (uint32_t docID = 1; docID <= 100; ++docID) {
+      ++zones;
+      atZone();
+      if (!callback(docID, 1, "word ")) return;
+    }
+  }
+  const Options& GetOptions() const override { return _options; }
+  std::string GetSuffixText(const salt::SuffixMeta&) const override { return ""; }
+  bool AddZone(uint32_t, uint16_t, std::string_view, std::vector<uint32_t>&, bool) override {
+    return false;
+  }
+  bool DeleteDoc(uint32_t) override { return false; }
+  bool ScanPrefix(std::string_view, std::function<bool(const salt::SuffixMeta&)>) const override {
+    return true;
+  }
+  std::optional<uint64_t> ScanPlaces(
+      std::string_view, uint64_t,
+      const std::function<void(const salt::Place*, size_t)>&) const override {
+    return 0;
+  }
+  std::vector<std::vector<salt::SuffixMeta>> ScanPrefixes(const std::vector<std::string>&,
+                                                          size_t) const override {
+    return {};
+  }
+  void Vacuum() override {}
+  bool Sync() override { return true; }
+  void Compact() override {}
+  Metrics GetMetrics() const override { return {}; }
+  void ResetScanMetrics() override {}
+  bool Validate() const override { return true; }
+  std::string Dump() const override { return ""; }
+
+ private:
+  Options _options;
+};
+
+class TopKVocabTest : public testing::Test {
+ protected:
+  TopKVocabTest() { EXPECT_TRUE(store->openWithError(nullptr)); }
+
+  static Outcome rebuild(TALTopKVocab& vocab) {
+    std::promise<Outcome> promise;
+    vocab.checkAndRebuildTopKVocabWithCompletionHandler(
+        [&](const Outcome& outcome) { promise.set_value(outcome); }, true);
+    return promise.get_future().get();
+  }
+
+  // What loading gives for a stored blob: an object, its error, and what it has then.
+  struct Loaded {
+    Outcome error;
+    Words words;
+    uint32_t docID;
+    double date;
+  };
+  Loaded load(const std::string& blob) {
+    store->storeTopKVocab(blob, nullptr);
+    TALTopKVocab vocab(store, index.get());
+    vocab.setVocab({"old"});
+    vocab.setLastTopKRebuildDocID(1);
+    vocab.setLastTopKRebuildDate(1);
+    Loaded loaded;
+    vocab.loadTopKVocabFromDocStore(&loaded.error);
+    return {loaded.error, *vocab.vocab(), vocab.lastTopKRebuildDocID(),
+            vocab.lastTopKRebuildDate()};
+  }
+
+  const testsupport::TemporaryDirectory directory;
+  const testsupport::LogCapture log;
+  const std::shared_ptr<TALSqliteDocStore> store =
+      std::make_shared<TALSqliteDocStore>(directory / "docs.db");
+  std::unique_ptr<salt::Index> index = salttest::newIndex(directory / "i");
+};
+
+}  // namespace
+
+TEST_F(TopKVocabTest, IsDueByDocumentsThatCameAndByAge) {
+  const double now = platform::secondsSince1970();
+  const double old = now - 432010;
+  const struct {
+    uint32_t last;
+    uint32_t maxDocID;
+    bool words;
+    double date;
+    bool due;
+  } cases[] = {
+      {0, 50, false, now, false},         {0, 50, true, old, false},
+      {0, 51, false, now, true},          {0, 100, true, now, true},
+      {1000, 1500, true, now, false},     {1000, 1500, true, old, true},
+      {1000, 1501, true, now, true},      {1000, 1500, false, now, true},
+      {100000, 102000, true, now, false}, {100000, 102001, true, now, true},
+      {100000, 99000, true, old, false},  {100000, 100050, true, old, false},
+      {100000, 100051, true, old, true},
+  };
+  TALTopKVocab vocab(store, index.get());
+  for (const auto& c : cases) {
+    vocab.setLastTopKRebuildDocID(c.last);
+    vocab.setMaxDocID(c.maxDocID);
+    vocab.setLastTopKRebuildDate(c.date);
+    vocab.setVocab(c.words ? Words{"word"} : Words{});
+    EXPECT_EQ(vocab._needRebuildTopKVocab(), c.due) << c.last << ' ' << c.maxDocID;
+  }
+  vocab.setLastTopKRebuildDocID(0);
+  vocab.setMaxDocID(50);
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler([](const Outcome&) { FAIL(); }, false);
+  vocab.shutdown();
+  EXPECT_FALSE(log.contains("Starting to rebuild"));
+}
+
+TEST_F(TopKVocabTest, CountsStoresAndSurvivesARestart) {
+  ASSERT_TRUE(salttest::addZone(*index, 1, 1, "b a b c\xF0\x9F\x98\x80 b"));
+  {
+    TALTopKVocab vocab(store, index.get());
+    EXPECT_FALSE(log.contains("TopK loaded from docstore."));
+    EXPECT_TRUE(log.has("default TALTopKVocab: Last topK rebuild docID: 0."));
+    EXPECT_TRUE(log.has("default TALTopKVocab: Last topK has 0 tokens."));
+    vocab.setMaxDocID(77);
+    EXPECT_EQ(rebuild(vocab), std::nullopt);
+    vocab.setMaxDocID(200);
+    EXPECT_THAT(*vocab.vocab(), ElementsAre("b ", "a ", "b", "c\xF0\x9F\x98\x80 "));
+    const auto lines = log.lines();
+    const auto at = [&lines](const std::string& line) {
+      return std::find_if(lines.begin(), lines.end(),
+                          [&](const auto& l) { return l.find(line) != std::string::npos; }) -
+             lines.begin();
+    };
+    const std::vector<ptrdiff_t> order{at("Starting to rebuild topK vocab from SALT."),
+                                       at("Rebuild date: 20"),
+                                       at("Rebuild docID: 77."),
+                                       at("TopK vocab has 4 tokens."),
+                                       at("TopK vocab rebuild is done."),
+                                       at("Rebuilt topK vocab saved to docstore.")};
+    EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
+    EXPECT_LT(order.back(), std::ssize(lines));
+  }
+  const TALTopKVocab again(store, index.get());
+  EXPECT_THAT(*again.vocab(), ElementsAre("b ", "a ", "b", "c\xF0\x9F\x98\x80 "));
+  EXPECT_EQ(again.lastTopKRebuildDocID(), 77U);
+  EXPECT_EQ(again.maxDocID(), 77U);  // those that had piled up are forgotten
+  EXPECT_NEAR(again.lastTopKRebuildDate(), platform::secondsSince1970(), 60);
+  EXPECT_TRUE(log.has("default TALTopKVocab: TopK loaded from docstore."));
+}
+
+TEST_F(TopKVocabTest, AnEmptyIndexGivesAnEmptyVocabularyWhichIsNoDamage) {
+  TALTopKVocab vocab(store, index.get());
+  EXPECT_EQ(rebuild(vocab), std::nullopt);
+  Outcome error;
+  vocab.loadTopKVocabFromDocStore(&error);
+  EXPECT_EQ(error, std::nullopt);
+  EXPECT_TRUE(vocab.vocab()->empty());
+  TALTopKVocab nothing(nullptr, nullptr);
+  nothing.checkAndRebuildTopKVocabWithCompletionHandler([](const Outcome&) { FAIL(); }, true);
+  nothing.shutdown();
+  EXPECT_TRUE(nothing.vocab()->empty());
+}
+
+TEST_F(TopKVocabTest, DamagedBlobsLeaveWhatTheDamageIsNotIn) {
+  const std::string words = "\x82\x63one\x63two";
+  const std::string docID = "\x18\x64";
+  const std::string date = std::string("\xFB\x41\xD9\0\0\0\0\0\0", 9);  // 1677721600
+  const auto entry = [](const std::string& bytes) {
+    return static_cast<char>(0x40 + bytes.size()) + bytes;
+  };
+  const auto three = [&](const std::string& a, const std::string& b, const std::string& c) {
+    return "\x83" + entry(a) + entry(b) + entry(c);
+  };
+  const Words old{"old"};
+  const Words stored{"one", "two"};
+  const struct {
+    std::string blob;
+    bool error;
+    Words words;
+    uint32_t docID;
+    double date;
+  } cases[] = {
+      {three(words, docID, date), false, stored, 100, 1677721600},
+      {"\x82" + entry(words) + entry(docID), false, old, 1, 1},
+      {"\x80", false, old, 1, 1},
+      {"", true, old, 1, 1},
+      {"\x83\x01\x02\x03", true, old, 1, 1},
+      {three(words, docID, date) + "x", true, old, 1, 1},
+      {std::string(1000000, '\x81'), true, old, 1, 1},
+      {three("\x01", docID, date), true, {}, 1, 1},
+      {three("\x82\x63one", docID, date), true, {}, 1, 1},
+      {three("\x9B\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFF", docID, date), true, {}, 1, 1},
+      {three("", docID, date), true, {}, 1, 1},
+      {three(words, std::string("\x1B\0\0\0\1\0\0\0\0", 9), date), true, stored, 1, 1677721600},
+      {three(words, docID, "\x01"), true, stored, 100, 1},
+      {three(words, docID, "\xF9\x3C"), true, stored, 100, 1},
+  };
+  for (const auto& c : cases) {
+    const Loaded loaded = load(c.blob);
+    const std::string shown = testing::PrintToString(c.blob.substr(0, 40));
+    EXPECT_EQ(loaded.error.has_value(), c.error) << shown;
+    EXPECT_EQ(loaded.words, c.words) << shown;
+    EXPECT_EQ(loaded.docID, c.docID) << shown;
+    EXPECT_EQ(loaded.date, c.date) << shown;
+  }
+  EXPECT_TRUE(log.contains("error TALTopKVocab: TopK cannot be unarchived: TALTopKVocab 1: "));
+}
+
+TEST_F(TopKVocabTest, TruncatedOrChangedBlobsAreReadSoundly) {
+  const std::string blob = topkvocab::archive({"one", std::string(300, 'x'), ""}, 70000, 1.5e9);
+  EXPECT_EQ(load(blob).words, (Words{"one", std::string(300, 'x'), ""}));
+  EXPECT_EQ(load(blob).docID, 70000U);
+  for (size_t size = 0; size < blob.size(); ++size) {
+    ASSERT_FALSE(topkvocab::unarchive(std::string_view(blob).substr(0, size))) << size;
+  }
+  std::mt19937 random(testsupport::firstSeed());
+  for (int round = 0; round < 20000; ++round) {
+    std::string bytes = blob;
+    for (size_t n = 1 + random() % 4; n > 0; --n) {
+      bytes[random() % std::min<size_t>(bytes.size(), 40)] = static_cast<char>(random());
+    }
+    const auto entries = topkvocab::unarchive(bytes);
+    if (!entries || entries->size() != 3) continue;
+    if (const auto words = topkvocab::unarchiveWords(entries->at(0))) {
+      ASSERT_LE(words->size(), bytes.size());
+    }
+    static_cast<void>(topkvocab::unarchiveDocID(entries->at(1)));
+    static_cast<void>(topkvocab::unarchiveDate(entries->at(2)));
+  }
+}
+
+TEST_F(TopKVocabTest, ShutdownEndsTheCountAndWhatWaitsBehindIt) {
+  auto watched = std::make_unique<WatchedIndex>();
+  std::latch counting(1);
+  std::latch shuttingDown(1);
+  watched->atZone = [&, first = true]() mutable {
+    if (std::exchange(first, false)) {
+      counting.count_down();
+      shuttingDown.wait();
+    }
+  };
+  TALTopKVocab vocab(store, watched.get());
+  vocab.setVocab({"old"});
+  std::vector<Outcome> outcomes;
+  const auto keep = [&outcomes](const Outcome& outcome) { outcomes.push_back(outcome); };
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
+  counting.wait();
+  vocab.setMaxDocID(2001);
+  for (int batch = 0; batch < 3; ++batch) {
+    vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
+  }
+  std::thread ending([&] { vocab.shutdown(); });
+  while (!vocab.isShutdown()) std::this_thread::yield();
+  shuttingDown.count_down();
+  ending.join();
+  EXPECT_EQ(watched->zones, 2);  // one a pass
+  watched.reset();
+  store->close();
+  EXPECT_THAT(*vocab.vocab(), ElementsAre("old"));
+  EXPECT_TRUE(log.has("default TALTopKVocab: TopKVocab is shutting down before storeTopKVocab."));
+  // One that was asked for, and one for three batches.
+  EXPECT_EQ(log.count("default TALTopKVocab: TopKVocab is shutting down before TopKTokens."), 2U);
+  EXPECT_FALSE(log.contains("saved to docstore"));
+  // None begins any more.
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
+  vocab.shutdown();
+  EXPECT_THAT(outcomes, ElementsAre(std::nullopt, std::nullopt, std::nullopt));
+}
