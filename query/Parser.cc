@@ -285,6 +285,13 @@ std::string_view spellingOf(int32_t token) {
   return {};
 }
 
+void appendEscaped(std::string_view text, std::string_view special, std::string& out) {
+  for (const char c : text) {
+    if (special.find(c) != std::string_view::npos) out.push_back('\\');
+    out.push_back(c);
+  }
+}
+
 void appendLeaf(const node& leaf, std::string& out) {
   if (isTimeOperator(leaf.type)) {
     out.append("$").append(spellingOf(leaf.type)).append("(").append(leaf.text).append(")");
@@ -292,7 +299,9 @@ void appendLeaf(const node& leaf, std::string& out) {
              std::all_of(leaf.text.begin(), leaf.text.end(), continuesWord)) {
     out += leaf.text;
   } else {
-    out += quoted(leaf.text);
+    out.push_back('"');
+    appendEscaped(leaf.text, "\"\\", out);
+    out.push_back('"');
   }
 }
 
@@ -356,13 +365,9 @@ std::string expressionText(const node& tree) {
   return out;
 }
 
-std::string quoted(std::string_view text, char quote) {
-  std::string out(1, quote);
-  for (const char c : text) {
-    if (c == '"' || c == '\'' || c == '\\' || c == '*') out.push_back('\\');
-    out.push_back(c);
-  }
-  out.push_back(quote);
+std::string escaped(std::string_view text) {
+  std::string out;
+  appendEscaped(text, "\"'\\*", out);
   return out;
 }
 

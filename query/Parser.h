@@ -87,8 +87,8 @@ using Tree = std::unique_ptr<node>;
 // tree of `parse` only.
 [[nodiscard]] std::string expressionText(const node& tree);
 
-// A text as a literal in these quotes, " or '. Quotes of both kinds, backslashes and asterisks are
-// escaped. The text holds no NUL.
-[[nodiscard]] std::string quoted(std::string_view text, char quote = '"');
+// A text as it stands between quotes of either kind: quotes, backslashes and asterisks have a
+// backslash before them. The text holds no NUL.
+[[nodiscard]] std::string escaped(std::string_view text);
 
 }  // namespace sq

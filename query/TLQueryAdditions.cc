@@ -15,6 +15,11 @@ TLString join(const std::vector<TLString>& texts, TLStringView separator) {
   return out;
 }
 
+void printResult(const TLQuery& query) {
+  TLQueryAdditions::_printQueryTree(query.root().get());
+  TLQueryAdditions::log().info("original query:->{}<-", platform::redacted(query.originalQuery()));
+}
+
 }  // namespace
 
 const platform::Log& TLQueryAdditions::log() {
@@ -37,11 +42,7 @@ std::shared_ptr<TLQuery> TLQueryAdditions::initWithBeaconQueryString(const TLStr
   query->setOriginalQuery(TLString());
   log().info("query tree before optimization");
   _printQueryTree(query->root().get());
-  if (!optimize) return query;
-  optimizeQuery(*query);
-  log().info("query tree after optimization");
-  _printQueryTree(query->root().get());
-  log().info("original query:->{}<-", platform::redacted(query->originalQuery()));
+  if (optimize) optimizeQuery(*query);
   return query;
 }
 
@@ -49,6 +50,8 @@ void TLQueryAdditions::optimizeQuery(TLQuery& query) {
   Parts parts;
   query.setRoot(optimizeQuery(query.root(), parts));
   query.setOriginalQuery(join(parts, u" "));
+  log().info("query tree after optimization");
+  printResult(query);
 }
 
 void TLQueryAdditions::addFiltersToQuery(TLQuery& query, const std::vector<TLString>& filters,
@@ -57,12 +60,14 @@ void TLQueryAdditions::addFiltersToQuery(TLQuery& query, const std::vector<TLStr
   query.setRoot(_parse(join(filters, u" && ")));
   log().info("FilterQuery tree before optimization");
   _printQueryTree(query.root().get());
-  if (!optimize) return;
+  if (optimize) optimizeFiltersOfQuery(query);
+}
+
+void TLQueryAdditions::optimizeFiltersOfQuery(TLQuery& query) {
   Parts dropped;
   query.setRoot(optimizeQuery(query.root(), dropped));
   log().info("FilterQuery tree after optimization");
-  _printQueryTree(query.root().get());
-  log().info("original query:->{}<-", platform::redacted(query.originalQuery()));
+  printResult(query);
 }
 
 TLQueryAdditions::Node TLQueryAdditions::_parse(const TLString& string) {

@@ -46,6 +46,11 @@ class TLQueryAdditions {
   static void addFiltersToQuery(TLQuery& query, const std::vector<TLString>& filters,
                                 bool optimize);
 
+  // What `optimize` asks of the two operations above, for a query that they have built without: who
+  // wants to see a tree before it is optimised calls these afterwards.
+  static void optimizeQuery(TLQuery& query);
+  static void optimizeFiltersOfQuery(TLQuery& query);
+
   // The tree of a text before optimisation, an AND node; null, with a fault in the log, for a text
   // that does not parse or is nested deeper than kMaximumTreeHeight.
   [[nodiscard]] static Node _parse(const TLString& string);
@@ -72,9 +77,6 @@ class TLQueryAdditions {
   // more by one OR, go to `originalQueryParts`; constants are worked in; what stands twice below
   // one node stands once. An OR of nothing but false disappears as well.
   [[nodiscard]] static Node optimizeQuery(const Node& node, Parts& originalQueryParts);
-
-  // What optimising does to a whole query: root, and with `parts` joined, originalQuery.
-  static void optimizeQuery(TLQuery& query);
 
   // One line a node, each behind a line feed, indented by a tab a level: names of the ops and keys,
   // values, strings redacted unless `inClear`. Empty for no tree.

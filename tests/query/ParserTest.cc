@@ -46,8 +46,8 @@ TEST(Parser, OperandsAndValues) {
       {"a = b", "a = b"},
       {"a==\"x y\"", "a == \"x y\""},
       {"a!='x'", "a != x"},
-      {"a = 'it\\'s'", "a = \"it\\'s\""},
-      {"a = \"\\\\ \\\" \\*\"", "a = \"\\\\ \\\" \\*\""},
+      {"a = 'it\\'s'", "a = \"it's\""},
+      {"a = \"\\\\ \\\" \\*\"", "a = \"\\\\ \\\" *\""},
       {"a = ''", "a = \"\""},
       {"a == b*", "a == b*"},
       {"** == *", "** == *"},
@@ -142,6 +142,15 @@ TEST(Parser, ATextLastsUntilTheNext) {
       {"$time.now(12 == c", "\"12 \" == c"},
       {"$time.now == c", "0 == c"},
   });
+}
+
+TEST(Parser, EscapedTextIsReadBackInQuotesOfBothKinds) {
+  const std::string text = "it's \"a\\b\" *\\* \xE6\x97\xA5\n";
+  for (const char quote : {'"', '\''}) {
+    sq::Tree tree;
+    ASSERT_TRUE(sq::parse(("a = " + (quote + sq::escaped(text) + quote)).c_str(), tree));
+    EXPECT_EQ(tree->right->text, text);
+  }
 }
 
 TEST(Parser, TellsWhereItStopped) {
