@@ -91,8 +91,9 @@ std::string explanationText(const QueryInput& input, const std::vector<TALTerm>&
                             const Palette& palette) {
   std::string out = stepsText(input.main, "query", palette);
   if (input.filter) out += stepsText(*input.filter, "filter", palette);
-  out += section("original query",
-                 platform::toUTF8(platform::orEmpty(input.query->originalQuery())), palette);
+  // Between marks, since a blank at the end means that the last word is whole.
+  const std::string text = platform::toUTF8(platform::orEmpty(input.query->originalQuery()));
+  out += section("original query", "->" + text + "<-", palette);
   std::string lines;
   for (const TALTerm& term : terms) lines += term.description() + '\n';
   return out + section("terms", terms.empty() ? "(none)" : lines, palette);
