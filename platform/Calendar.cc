@@ -17,13 +17,9 @@ constexpr double kMillisInSecond = 1000;
 constexpr double kFarthest = 5e6 * 366 * 86400;  // seconds
 constexpr int32_t kLargestField = 5000000;
 
-// Null where ICU has no calendar.
-std::unique_ptr<icu::GregorianCalendar> newCalendar(Zone zone) {
-  const auto locale = currentLocale();
+std::unique_ptr<icu::GregorianCalendar> newCalendar(const icu::Locale& locale) {
   UErrorCode status = U_ZERO_ERROR;
-  auto calendar = std::make_unique<icu::GregorianCalendar>(
-      zone == Zone::utc ? icu::TimeZone::getGMT()->clone() : icu::TimeZone::createDefault(),
-      locale ? icu::Locale(locale->identifier.c_str()) : icu::Locale::getRoot(), status);
+  auto calendar = std::make_unique<icu::GregorianCalendar>(locale, status);
   if (U_FAILURE(status)) return nullptr;
   calendar->setGregorianChange(-std::numeric_limits<double>::infinity(), status);
   calendar->setSkippedWallTimeOption(UCAL_WALLTIME_LAST);
@@ -31,21 +27,30 @@ std::unique_ptr<icu::GregorianCalendar> newCalendar(Zone zone) {
   return U_SUCCESS(status) ? std::move(calendar) : nullptr;
 }
 
-// Null also for a time that is out of range.
-std::unique_ptr<icu::GregorianCalendar> calendarAt(double time, Zone zone) {
-  if (!(std::fabs(time) <= kFarthest)) return nullptr;
-  auto calendar = newCalendar(zone);
-  if (calendar == nullptr) return nullptr;
+// The calling thread's calendar, in this zone; null where ICU has none. Making one costs more than
+// all that is done with it.
+icu::GregorianCalendar* calendarIn(Zone zone) {
+  thread_local const auto calendar = newCalendar(icu::Locale::getRoot());
+  if (calendar != nullptr) {
+    calendar->adoptTimeZone(zone == Zone::utc ? icu::TimeZone::getGMT()->clone()
+                                              : icu::TimeZone::createDefault());
+  }
+  return calendar.get();
+}
+
+// False for a time that is out of range.
+bool setTime(icu::GregorianCalendar& calendar, double time) {
+  if (!(std::fabs(time) <= kFarthest)) return false;
   UErrorCode status = U_ZERO_ERROR;
-  calendar->setTime(std::floor(time) * kMillisInSecond, status);
-  return U_SUCCESS(status) ? std::move(calendar) : nullptr;
+  calendar.setTime(std::floor(time) * kMillisInSecond, status);
+  return U_SUCCESS(status);
 }
 
 }  // namespace
 
 std::optional<CalendarFields> fieldsOfTime(double time, Zone zone) {
-  const auto calendar = calendarAt(time, zone);
-  if (calendar == nullptr) return std::nullopt;
+  icu::GregorianCalendar* const calendar = calendarIn(zone);
+  if (calendar == nullptr || !setTime(*calendar, time)) return std::nullopt;
   UErrorCode status = U_ZERO_ERROR;
   const auto get = [&](UCalendarDateFields field) { return calendar->get(field, status); };
   const CalendarFields fields{get(UCAL_EXTENDED_YEAR), get(UCAL_MONTH) + 1, get(UCAL_DATE),
@@ -58,7 +63,7 @@ std::optional<double> timeOfFields(const CalendarFields& fields, Zone zone) {
        {fields.year, fields.month, fields.day, fields.hour, fields.minute, fields.second}) {
     if (field > kLargestField || field < -kLargestField) return std::nullopt;
   }
-  const auto calendar = newCalendar(zone);
+  icu::GregorianCalendar* const calendar = calendarIn(zone);
   if (calendar == nullptr) return std::nullopt;
   calendar->clear();
   calendar->set(UCAL_EXTENDED_YEAR, fields.year);
@@ -75,8 +80,10 @@ std::optional<double> timeOfFields(const CalendarFields& fields, Zone zone) {
 
 std::optional<int32_t> dayOfWeek(double time) {
   constexpr int32_t kDaysInWeek = 7;
-  const auto calendar = calendarAt(time, Zone::system);
-  if (calendar == nullptr) return std::nullopt;
+  const auto locale = currentLocale();
+  const auto calendar =
+      newCalendar(locale ? icu::Locale(locale->identifier.c_str()) : icu::Locale::getRoot());
+  if (calendar == nullptr || !setTime(*calendar, time)) return std::nullopt;
   UErrorCode status = U_ZERO_ERROR;
   const int32_t day = calendar->get(UCAL_DAY_OF_WEEK, status);
   const int32_t first = calendar->getFirstDayOfWeek(status);

@@ -52,6 +52,10 @@ int32_t added(int32_t field, double delta) {
   return asField(static_cast<double>(field) + std::trunc(delta));
 }
 
+bool needsWeekday(int32_t token) {
+  return token == sq::kTokenTimeThisWeek || token == sq::kTokenTimeLastWeek;
+}
+
 // Moves the fields of a moment to the start of what the function names. The delta counts in the
 // result's unit of seconds; 0 where it has gone into a field.
 double moveToStart(int32_t token, double delta, int32_t weekday, CalendarFields& fields) {
@@ -172,7 +176,7 @@ double evalTimeExpressionAt(int32_t token, std::string_view deltaString, double 
   const double sinceReference = now - platform::kReferenceDate;
   if (token == sq::kTokenTimeNow) return sinceReference + delta;
   auto fields = platform::fieldsOfTime(now, Zone::system);
-  const auto weekday = platform::dayOfWeek(now);
+  const auto weekday = needsWeekday(token) ? platform::dayOfWeek(now) : 1;
   if (!fields || !weekday) {
     TLQueryAdditions::log().error("error decomposing time into components {:f}", sinceReference);
     return 0;

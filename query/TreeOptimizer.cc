@@ -90,7 +90,7 @@ class Optimizer {
     // The constant that decides: false an AND, true an OR.
     const bool deciding = node->mergeOp() == OR;
     std::vector<Node> kept;
-    std::unordered_set<Subtree, HashOf, SameTree> known;
+    std::unordered_set<Subtree, HashOf, SameTree> known(node->childsCount());
     Subtree result{node, static_cast<size_t>(node->mergeOp())};
     for (const Node& child : node->childs()) {
       Subtree subtree = optimize(child, height + 1);
