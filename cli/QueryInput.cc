@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <array>
+#include <set>
 
 #include "query/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
@@ -42,6 +43,7 @@ std::string shown(std::string_view text) {
 }
 
 void remarkUnknownNames(const sq::node& tree, std::vector<std::string>& remarks) {
+  std::set<std::string> unknown;
   std::vector<const sq::node*> open{&tree};
   while (!open.empty()) {
     const sq::node& node = *open.back();
@@ -51,11 +53,11 @@ void remarkUnknownNames(const sq::node& tree, std::vector<std::string>& remarks)
       open.push_back(node.right.get());
       open.push_back(node.left.get());
     } else if (!TLAttributeKeyForQueryName(node.left->text)) {
-      std::string remark = fmt::format("there is no attribute {}", shown(node.left->text));
-      if (std::find(remarks.begin(), remarks.end(), remark) == remarks.end()) {
-        remarks.push_back(std::move(remark));
-      }
+      unknown.insert(shown(node.left->text));
     }
+  }
+  for (const std::string& name : unknown) {
+    remarks.push_back(fmt::format("there is no attribute {}", name));
   }
 }
 
