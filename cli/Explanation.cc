@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <nlohmann/json.hpp>
 
+#include "modification/TALSynonyms.h"
+#include "platform/Paths.h"
 #include "query/TALQueryProcessor.h"
 #include "query/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
@@ -12,6 +14,8 @@
 namespace cli {
 
 namespace {
+
+constexpr const char* kSynonymsInFirstPass = "queryModification.enableSynonymModificationFirstPass";
 
 // A heading, and the text below it, indented.
 std::string section(const std::string& heading, const std::string& text, const Palette& palette) {
@@ -83,7 +87,11 @@ std::vector<TALTerm> termsOf(const TLQuery& query) {
                                 : TLParamsManager::getDefaultSearchParamsWithCaching(true));
   TALZoneManager zones;
   zones.setupAttributeScoresWithSearchParams(*resolved->searchParams());
-  const auto processor = TALQueryProcessor::initWithZoneManager(zones);
+  TALSynonyms synonyms;
+  if (resolved->searchParams()->boolValueForKey(kSynonymsInFirstPass)) {
+    synonyms.loadSynonymsFromFile(platform::synonymFilePath(), nullptr);
+  }
+  const auto processor = TALQueryProcessor::initWithZoneManager(zones, &synonyms);
   return processor == nullptr ? std::vector<TALTerm>() : processor->termsFromQuery(*resolved);
 }
 
