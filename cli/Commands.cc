@@ -23,51 +23,6 @@ std::string withLineFeed(std::string text) {
   return text;
 }
 
-// The words as they were typed, joined by single blanks; a blank at the end stays.
-std::string joinedWords(const Options& options) {
-  std::string words;
-  for (const std::string& word : options.arguments) {
-    if (&word != &options.arguments.front()) words.push_back(' ');
-    words += word;
-  }
-  return words;
-}
-
-// The daemon's answer to a text that holds no word, such as the first quote mark of a phrase that
-// is being typed: it finds nothing.
-bool asksForNothing(const std::optional<TLError>& error) {
-  constexpr int kNoTerms = 3;
-  return error && error->domain == "TALIndexer" && error->code == kNoTerms;
-}
-
-ExitStatus runSearch(const Options& options) {
-  const std::string words = joinedWords(options);
-  TLQuery query;
-  query.setRawQuery(platform::fromUTF8(words));
-  query.setOriginalQuery(platform::fromUTF8(words));
-  std::optional<TLError> error;
-  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
-  const int64_t limit = options.limit == 0 ? service.kNoMaximum : options.limit;
-  auto items = service.searchItems(query, 0, options.protectionClass, limit, &error);
-  if (!items && asksForNothing(error)) items.emplace();
-  if (!items) return complain(error);
-
-  const Palette palette(colorAllowed(options.color, STDOUT_FILENO));
-  const bool explain = options.command == Command::explain;
-  const auto status = items->empty() ? ExitStatus::nothingFound : ExitStatus::done;
-  switch (options.format) {
-    case OutputFormat::json:
-      return print(explain ? explanationJSON(query, *items) : resultsJSON(*items), status);
-    case OutputFormat::files:
-      return print(resultsFiles(*items), status);
-    case OutputFormat::text:
-      break;
-  }
-  return print(
-      explain ? explanationText(query, *items, palette) : resultsText(*items, words, palette),
-      status);
-}
-
 // One call an identifier, so that one that fails does not stop the others.
 ExitStatus runDelete(const Options& options) {
   client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
@@ -196,7 +151,7 @@ struct CommandFunction {
 constexpr std::array<CommandFunction, 12> kFunctions{{
     {Command::index, runIndex},
     {Command::search, runSearch},
-    {Command::explain, runSearch},
+    {Command::explain, runExplain},
     {Command::remove, runDelete},
     {Command::reset, runReset},
     {Command::stats, runStats},

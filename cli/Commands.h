@@ -14,6 +14,10 @@ namespace cli {
 // Of runCommand, the one that reads mail.
 [[nodiscard]] ExitStatus runIndex(const Options& options);
 
+// Of runCommand, those that search.
+[[nodiscard]] ExitStatus runSearch(const Options& options);
+[[nodiscard]] ExitStatus runExplain(const Options& options);
+
 // Of runCommand, those that look at an index without the daemon.
 [[nodiscard]] ExitStatus runDump(const Options& options);
 [[nodiscard]] ExitStatus runValidate(const Options& options);

@@ -27,9 +27,9 @@ constexpr std::array<CommandRow, 12> kCommands{{
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
     {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
-     "WORDS", true},
-    {Command::explain, "explain", "Search, and show the query record and the scores", "WORDS",
-     true},
+     "WORDS", false},
+    {Command::explain, "explain", "Search, and show how the query was understood and the scores",
+     "WORDS", false},
     {Command::remove, "delete", "Delete messages by identifier", "ID", true},
     {Command::reset, "reset", "Delete everything that is indexed", nullptr, false},
     {Command::stats, "stats", "Show the statistics of store and index", nullptr, false},
@@ -73,6 +73,21 @@ void addGlobalOptions(CLI::App& app, Options& options) {
   app.add_flag("-v,--verbose", options.verbose, "Name what was cut or ignored");
 }
 
+bool isSearch(Command command) {
+  return command == Command::search || command == Command::explain;
+}
+
+void addQueryOptions(CLI::App& sub, Options& options) {
+  sub.add_option("--query", options.query,
+                 "Search by an expression instead of words; see tallow-query(7)")
+      ->type_name("EXPR");
+  sub.add_option("--filter", options.filters, "Only what the expression holds for; may be repeated")
+      ->allow_extra_args(false)
+      ->type_name("EXPR");
+  sub.add_option("--param", options.parameters, "Parameters of this search")
+      ->type_name("KEY=VALUE,...");
+}
+
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   CLI::App* const sub = app.add_subcommand(row.name, row.help);
   sub->fallthrough();
@@ -81,16 +96,24 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
     operands->required(row.operandsRequired)->type_name(" ");
     if (row.command == Command::ping) operands->expected(0, 1);
   }
+  if (isSearch(row.command)) addQueryOptions(*sub, options);
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 
-// What is wrong with the format that was asked for, or null.
-const char* misusedFormat(const Options& options) {
+// What is wrong with options that do not go together, or null.
+const char* misuse(const Options& options) {
   if (options.format == OutputFormat::files && options.command != Command::search) {
     return "--format=files is for search only";
   }
   if (options.format == OutputFormat::json && options.command == Command::dump) {
     return "a dump is text only";
+  }
+  if (!isSearch(options.command)) return nullptr;
+  if (options.arguments.empty() == options.query.empty()) {
+    return "a search is for WORDS, or for the expression of --query";
+  }
+  if (!options.query.empty() && !options.filters.empty()) {
+    return "--filter goes with WORDS; in the expression of --query, join conditions with &&";
   }
   return nullptr;
 }
@@ -110,7 +133,7 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
     status = app.exit(error) == 0 ? ExitStatus::done : ExitStatus::failure;
     return std::nullopt;
   }
-  if (const char* const misused = misusedFormat(options)) {
+  if (const char* const misused = misuse(options)) {
     std::cerr << "tallow: " << misused << '\n';
     status = ExitStatus::failure;
     return std::nullopt;

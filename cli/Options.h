@@ -38,6 +38,9 @@ enum class OutputFormat { text, json, files };
 struct Options {
   Command command = Command::ping;
   std::vector<std::string> arguments;  // of the command: paths, words, identifiers or a text
+  std::string query;                   // an expression in place of words
+  std::vector<std::string> filters;    // expressions beside words
+  std::string parameters;              // key=value,...
 
   std::string runtimeDirectory;
   std::string stateDirectory;  // empty: where the daemon has it by itself

@@ -59,7 +59,7 @@ nlohmann::json personsJSON(const TLIndexableItem& item, Key key) {
   return list;
 }
 
-nlohmann::json scoresJSON(const TLIndexableItem& item) {
+nlohmann::json cardJSON(const TLIndexableItem& item) {
   nlohmann::json json = nlohmann::json::object();
   if (!item.hasCard()) return json;
   const TLCard& card = *item.card();
@@ -70,7 +70,7 @@ nlohmann::json scoresJSON(const TLIndexableItem& item) {
 }
 
 nlohmann::json resultJSON(const TLIndexableItem& item, size_t rank) {
-  nlohmann::json json = scoresJSON(item);
+  nlohmann::json json = cardJSON(item);
   json["rank"] = rank;
   json["identifier"] = textOf(item.identifier());
   json["domainIdentifier"] = textOf(item.domainIdentifier());
@@ -141,11 +141,10 @@ std::string resultsFiles(const ResultItems& items) {
   return out;
 }
 
-std::string explanationText(const TLQuery& query, const ResultItems& items,
-                            const Palette& palette) {
-  std::string out = "query " + jsonText(query.dictionaryRepresentation());
-  out += fmt::format("{}{:>4}  {:>10}  {:>10}  {:>9}  {:16}  {}{}\n", palette.faint, "rank",
-                     "textScore", "lightScore", "freshness", "date", "identifier", palette.end);
+std::string scoresText(const ResultItems& items, const Palette& palette) {
+  std::string out =
+      fmt::format("{}{:>4}  {:>10}  {:>10}  {:>9}  {:16}  {}{}\n", palette.faint, "rank",
+                  "textScore", "lightScore", "freshness", "date", "identifier", palette.end);
   size_t rank = 0;
   for (const auto& item : items) {
     const TLCard none;
@@ -159,17 +158,17 @@ std::string explanationText(const TLQuery& query, const ResultItems& items,
   return out;
 }
 
-std::string explanationJSON(const TLQuery& query, const ResultItems& items) {
+nlohmann::json scoresJSON(const ResultItems& items) {
   nlohmann::json list = nlohmann::json::array();
   for (const auto& item : items) {
-    nlohmann::json row = scoresJSON(*item);
+    nlohmann::json row = cardJSON(*item);
     const auto date = dateOf(*item);
     row["rank"] = list.size() + 1;
     row["date"] = date ? nlohmann::json(*date) : nlohmann::json();
     row["identifier"] = textOf(item->identifier());
     list.push_back(std::move(row));
   }
-  return jsonText({{"query", query.dictionaryRepresentation()}, {"results", std::move(list)}});
+  return list;
 }
 
 }  // namespace cli

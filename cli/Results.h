@@ -8,7 +8,6 @@
 #include "cli/Options.h"
 #include "cli/Terminal.h"
 #include "records/TLIndexableItem.h"
-#include "records/TLQuery.h"
 
 namespace cli {
 
@@ -22,10 +21,9 @@ using ResultItems = std::vector<std::shared_ptr<TLIndexableItem>>;
 // stands as it is.
 [[nodiscard]] std::string resultsFiles(const ResultItems& items);
 
-// The output of explain: the query as it was sent, and the scores of each result.
-[[nodiscard]] std::string explanationText(const TLQuery& query, const ResultItems& items,
-                                          const Palette& palette);
-[[nodiscard]] std::string explanationJSON(const TLQuery& query, const ResultItems& items);
+// A line, or a row, a result: rank, scores, date, identifier.
+[[nodiscard]] std::string scoresText(const ResultItems& items, const Palette& palette);
+[[nodiscard]] nlohmann::json scoresJSON(const ResultItems& items);
 
 // JSON as it goes out: indented, valid UTF-8, harmless to terminals, with a line feed.
 [[nodiscard]] std::string jsonText(const nlohmann::json& json);

@@ -1,5 +1,7 @@
 #include "client/Batches.h"
 
+#include "client/Channel.h"
+
 namespace client {
 
 namespace {
@@ -26,6 +28,30 @@ const std::string& nameOf(const std::string& text) {
 }
 
 constexpr size_t kNameLength = 200;
+constexpr int kTooLarge = 1;
+
+// The first limit on records that the query goes beyond, in words; empty for one that keeps to
+// them. Goes through the tree level by level, since one that is too high must not be written.
+std::string brokenLimit(const TLQuery& query) {
+  size_t records = query.hasSearchParams() ? 1 + query.searchParams()->keyvaluesCount() : 0;
+  std::vector<const TLQueryNode*> level;
+  if (query.hasRoot()) level.push_back(query.root().get());
+  for (int height = 1; !level.empty(); ++height) {
+    if (height > kMaximumRecordDepth) {
+      return fmt::format("nests conditions more than {} deep", kMaximumRecordDepth);
+    }
+    records += level.size();
+    if (records > kMaximumRecordElements) {
+      return fmt::format("holds more than {} conditions", kMaximumRecordElements);
+    }
+    std::vector<const TLQueryNode*> next;
+    for (const TLQueryNode* node : level) {
+      for (const auto& child : node->childs()) next.push_back(child.get());
+    }
+    level = std::move(next);
+  }
+  return {};
+}
 
 template <typename Element>
 std::optional<std::vector<std::span<const Element>>> split(std::span<const Element> elements,
@@ -37,7 +63,7 @@ std::optional<std::vector<std::span<const Element>>> split(std::span<const Eleme
     const size_t size = sizeOf(elements[i]);
     if (size > limit) {
       platform::setError(error,
-                         {"com.quill.tallow.client", 1,
+                         {kClientDomain, kTooLarge,
                           fmt::format("{} takes {} bytes, more than the {} that one call can carry",
                                       nameOf(elements[i]).substr(0, kNameLength), size, limit)});
       return std::nullopt;
@@ -67,6 +93,18 @@ std::optional<std::vector<std::span<const EncodedItem>>> splitItems(
 std::optional<std::vector<std::span<const std::string>>> splitTexts(
     std::span<const std::string> texts, TLErrorOut error, size_t limit) {
   return split(texts, error, limit);
+}
+
+std::optional<std::string> encode(const TLQuery& query, TLErrorOut error, size_t limit) {
+  std::string broken = brokenLimit(query);
+  std::string bytes = broken.empty() ? query.data() : std::string();
+  if (bytes.size() > limit) {
+    broken = fmt::format("takes {} bytes, more than the {} that one call can carry", bytes.size(),
+                         limit);
+  }
+  if (broken.empty()) return bytes;
+  platform::setError(error, {kClientDomain, kTooLarge, "the query " + broken});
+  return std::nullopt;
 }
 
 }  // namespace client

@@ -8,6 +8,7 @@
 
 #include "platform/TLError.h"
 #include "records/TLIndexableItem.h"
+#include "records/TLQuery.h"
 
 namespace client {
 
@@ -29,5 +30,11 @@ struct EncodedItem {
     std::span<const EncodedItem> items, TLErrorOut error, size_t limit = kMaximumArrayBytes);
 [[nodiscard]] std::optional<std::vector<std::span<const std::string>>> splitTexts(
     std::span<const std::string> texts, TLErrorOut error, size_t limit = kMaximumArrayBytes);
+
+// The query in wire form. None, with an error that says by what, when it goes beyond what the
+// daemon takes: kMaximumRecordDepth nodes above each other, kMaximumRecordElements records in all,
+// or `limit` bytes.
+[[nodiscard]] std::optional<std::string> encode(const TLQuery& query, TLErrorOut error,
+                                                size_t limit = kMaximumArrayBytes);
 
 }  // namespace client

@@ -156,9 +156,11 @@ bool SearchServiceProxy::deleteAllItems(const std::string& name, const std::stri
 std::optional<SearchServiceProxy::Items> SearchServiceProxy::searchItems(
     const TLQuery& query, uint64_t options, const std::string& protectionClass, int64_t maxResults,
     TLErrorOut error) {
+  const auto bytes = encode(query, error);
+  if (!bytes) return std::nullopt;
   Items items;
   const auto append = [&](sd_bus_message* call) {
-    const int result = appendBytes(call, query.data());
+    const int result = appendBytes(call, *bytes);
     return result < 0
                ? result
                : sd_bus_message_append(call, "tsx", options, protectionClass.c_str(), maxResults);

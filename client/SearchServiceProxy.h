@@ -55,7 +55,7 @@ class SearchServiceProxy {
   using Items = std::vector<std::shared_ptr<TLIndexableItem>>;
   static constexpr int64_t kNoMaximum = std::numeric_limits<int64_t>::max();
 
-  // Best first; none after a failure.
+  // Best first; none after a failure, such as a query that is too large for a call (see `encode`).
   [[nodiscard]] std::optional<Items> searchItems(const TLQuery& query, uint64_t options,
                                                  const std::string& protectionClass,
                                                  int64_t maxResults, TLErrorOut error);

@@ -28,6 +28,8 @@ constexpr std::array<LevelRow, 5> kLevels{{{LogLevel::debug, "debug", 7},
                                            {LogLevel::error, "error", 3},
                                            {LogLevel::fault, "fault", 2}}};
 
+std::atomic<LogLevel> processThreshold{LogLevel::standard};
+
 const LevelRow& row(LogLevel level) {
   return kLevels[static_cast<size_t>(level)];
 }
@@ -85,13 +87,17 @@ void setLogSink(LogSink sink) {
   h.sink = std::move(sink);
 }
 
+void setProcessLogThreshold(LogLevel level) {
+  processThreshold = level;
+}
+
 LogLevel logThreshold() {
   static const LogLevel threshold = [] {
     const char* name = std::getenv("TALLOW_LOG");
     for (const LevelRow& r : kLevels) {
       if (name != nullptr && std::string_view(name) == r.name) return r.level;
     }
-    return LogLevel::standard;
+    return processThreshold.load();
   }();
   return threshold;
 }

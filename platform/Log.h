@@ -34,9 +34,12 @@ using LogSink = std::function<void(const LogRecord&)>;
 // call that replaces it has returned. Any thread.
 void setLogSink(LogSink sink);
 
-// The threshold of TALLOW_LOG (debug, info, default, error or fault), read once; `standard` unless
-// set.
+// The threshold of TALLOW_LOG (debug, info, default, error or fault), read once; where that is not
+// set, the one of this process.
 [[nodiscard]] LogLevel logThreshold();
+
+// The process's own threshold, `standard` unless it is set before the first message.
+void setProcessLogThreshold(LogLevel level);
 
 // One handle per subsystem and category, made once and kept, usually by a function-local static.
 // Any thread. The arguments of a message below the threshold are not formatted.

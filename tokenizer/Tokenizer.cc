@@ -197,7 +197,11 @@ UnitSet makeSpecialUnits() {
 
 }  // namespace
 
-bool hasTrailingSpecialChar(TLStringView text) {
+bool isSpecialUnit(char16_t unit) {
   static const UnitSet kSpecial = makeSpecialUnits();
-  return !text.empty() && kSpecial[text.back()];
+  return kSpecial[unit];
+}
+
+bool hasTrailingSpecialChar(TLStringView text) {
+  return !text.empty() && isSpecialUnit(text.back());
 }

@@ -44,6 +44,10 @@ class Tokenizer {
 
 }  // namespace tokenizer
 
-// True when the last UTF-16 unit is white space, a line end, punctuation, a control or format
-// character or a symbol: a query word that is typed to its end. False for an empty text.
+// True for a UTF-16 unit that is white space, a line end, punctuation, a control or format
+// character or a symbol.
+[[nodiscard]] bool isSpecialUnit(char16_t unit);
+
+// True when the last unit is such a one: a query word that is typed to its end. False for an empty
+// text.
 [[nodiscard]] bool hasTrailingSpecialChar(TLStringView text);

@@ -5,7 +5,7 @@ _tallow() {
   local commands='index search explain delete reset stats metrics ping vacuum state dump
     validate'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
-    --verbose --help --version'
+    --verbose --query --filter --param --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
     prev=${COMP_WORDS[COMP_CWORD - 2]}
@@ -17,7 +17,7 @@ _tallow() {
     --format) mapfile -t COMPREPLY < <(compgen -W 'text json files' -- "$cur"); return ;;
     --color) mapfile -t COMPREPLY < <(compgen -W 'auto always never' -- "$cur"); return ;;
     --runtime-dir | --state-dir) compopt -o dirnames; return ;;
-    --class | --name | --limit | --wait) return ;;
+    --class | --name | --limit | --wait | --query | --filter | --param) return ;;
   esac
   if [[ $cur == -* ]]; then
     mapfile -t COMPREPLY < <(compgen -W "$options" -- "$cur")

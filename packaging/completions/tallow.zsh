@@ -5,7 +5,7 @@ local -a commands options
 commands=(
   'index:index mail'
   'search:search for messages'
-  'explain:search and show the scores'
+  'explain:search and show how the query is understood'
   'delete:delete messages by identifier'
   'reset:delete everything that is indexed'
   'stats:show the statistics of store and index'
@@ -25,6 +25,9 @@ options=(
   '--limit=[most results]:number:'
   '--color=[colours]:when:(auto always never)'
   '--wait=[seconds to wait for the daemon]:seconds:'
+  '--query=[search by an expression]:expression:'
+  '*--filter=[only what it holds for]:expression:'
+  '--param=[parameters of this search]:KEY=VALUE,...:'
   '(-y --yes)'{-y,--yes}'[do not ask]'
   '(-v --verbose)'{-v,--verbose}'[name what was cut or ignored]'
   '(-h --help)'{-h,--help}'[show help]'

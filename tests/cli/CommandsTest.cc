@@ -6,6 +6,7 @@
 
 #include "cli/Commands.h"
 #include "platform/Files.h"
+#include "query/TLQueryAdditions.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
 #include "tests/client/FakeDaemon.h"
@@ -44,6 +45,20 @@ class CommandsTest : public testing::Test {
                   [bytes](platform::RPCReply& reply) { reply.send({bytes}); });
   }
 
+  // The query of the last search that reached the daemon.
+  [[nodiscard]] std::shared_ptr<TLQuery> lastQuery() const {
+    const std::string call = daemon.calls().back();
+    const std::string begin = "SearchItemsForQuery(<";
+    EXPECT_TRUE(call.starts_with(begin));
+    auto query = std::make_shared<TLQuery>();
+    EXPECT_TRUE(query->initWithData(call.substr(begin.size(), call.rfind(">, ") - begin.size())));
+    return query;
+  }
+  static std::string printed(const TLQuery& query) {
+    return platform::toUTF8(*query.originalQuery()) +
+           TLQueryAdditions::_stringifyQueryTree(query.root().get(), 0, true);
+  }
+
   static std::shared_ptr<TLIndexableItem> result(const char* identifier) {
     auto item = std::make_shared<TLIndexableItem>();
     item->setIdentifier(platform::fromUTF8(identifier));
@@ -66,22 +81,120 @@ class CommandsTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(CommandsTest, TheQueryIsWhatWasTyped) {
-  setenv("TZ", "UTC", 1);
-  const auto sent = [](TLStringView words) {
-    TLQuery query;
-    query.setRawQuery(TLString(words));
-    query.setOriginalQuery(TLString(words));
-    return query.data();
+// What is sent is the text that was typed, without conditions, whatever it holds.
+TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
+  const std::vector<std::pair<std::vector<std::string>, TLString>> cases{
+      {{"invoice", "li"}, u"invoice li"},
+      {{"invoice "}, u"invoice "},
+      {{"--", "-x", "--limit"}, u"-x --limit"},
+      {{"it's", "\"a\\b\"", "\\"}, u"it's \"a\\b\" \\"},
+      {{"*", "**a*"}, u"* **a*"},
+      {{"*"}, u"*"},
+      {{"true"}, u"true"},
+      {{"') || (a == 'b", "&&", "$time.now"}, u"') || (a == 'b && $time.now"},
+      {{"京都\t\n"}, u"\u4EAC\u90FD\t\n"},
+      {{"caf\xE9"}, u"caf\uFFFD"},
+      {{""}, u""},
   };
-  EXPECT_EQ(run({"search", "invoice", "li"}), ExitStatus::nothingFound);
-  EXPECT_EQ(run({"search", "--limit", "0", "--class=work", "invoice "}), ExitStatus::nothingFound);
-  EXPECT_EQ(run({"search", "--limit=3", "--", "-x", "--limit"}), ExitStatus::nothingFound);
-  EXPECT_THAT(
-      daemon.calls(),
-      ElementsAre("SearchItemsForQuery(<" + sent(u"invoice li") + ">, 0, default, 20)",
-                  "SearchItemsForQuery(<" + sent(u"invoice ") + ">, 0, work, 9223372036854775807)",
-                  "SearchItemsForQuery(<" + sent(u"-x --limit") + ">, 0, default, 3)"));
+  for (const auto& [words, text] : cases) {
+    std::vector<std::string> arguments{"search"};
+    arguments.insert(arguments.end(), words.begin(), words.end());
+    EXPECT_EQ(run(arguments), ExitStatus::nothingFound);
+    EXPECT_EQ(errors, "");
+    const auto sent = lastQuery();
+    EXPECT_EQ(sent->originalQuery(), text);
+    EXPECT_FALSE(sent->hasRoot() || sent->hasSearchParams());
+    EXPECT_TRUE(sent->rawQuery()->starts_with(u"(kTLItemSubject == \"*"));
+  }
+  EXPECT_EQ(run({"search", "--limit", "0", "--class=work", "x"}), ExitStatus::nothingFound);
+  EXPECT_THAT(daemon.calls().back(), testing::EndsWith(", 0, work, 9223372036854775807)"));
+}
+
+TEST_F(CommandsTest, ExpressionsFiltersAndParameters) {
+  EXPECT_EQ(run({"search", "--query", "** == \"*a\" && kTLItemAuthors != b"}),
+            ExitStatus::nothingFound);
+  EXPECT_EQ(printed(*lastQuery()), "a\nLEAF, STRING_NOT_EQUAL, AUTHORS, b");
+  EXPECT_EQ(lastQuery()->rawQuery(), u"** == \"*a\" && kTLItemAuthors != b");
+  // Each filter is a condition of its own.
+  EXPECT_EQ(
+      run({"search", "x", "--filter", "kTLItemAuthors = a || kTLItemAuthors = b", "y",
+           "--filter=kTLItemSubject = c", "--param", "salt.maxTopK=5,ranking.freshnessWeight=1"}),
+      ExitStatus::nothingFound);
+  EXPECT_EQ(errors, "");
+  EXPECT_EQ(printed(*lastQuery()),
+            "x y\nAND, \n\tOR, \n\t\tLEAF, STRING_EQUAL, AUTHORS, a\n\t\tLEAF, STRING_EQUAL, "
+            "AUTHORS, b\n\tLEAF, STRING_EQUAL, SUBJECT, c");
+  EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 5);
+  EXPECT_EQ(run({"search", "--query", "kTLItemSubject = a) || b", "--class", "c"}),
+            ExitStatus::nothingFound);
+  EXPECT_EQ(errors, "tallow: the expression ends before \"|| b\", the rest is ignored\n");
+  EXPECT_EQ(run({"search", "x", "--filter", "none = a"}), ExitStatus::nothingFound);
+  EXPECT_THAT(errors, HasSubstr("tallow: there is no attribute none\n"));
+}
+
+TEST_F(CommandsTest, WhatCannotBeReadIsNotSent) {
+  std::string deep;
+  for (int i = 0; i < 200; ++i) deep += "kTLItemSubject = a || kTLItemAuthors = b && ";
+  const std::vector<std::pair<std::vector<std::string>, std::string>> cases{
+      {{"--query", "kTLItemSubject == 'a"}, "the expression cannot be read from \"'a\" on"},
+      {{"--query", "kTLItemSubject =="}, "the expression cannot be read from its end on"},
+      {{"--query", deep + "true"}, "nests && and || more than 254 deep"},
+      {{"x", "--filter", ""}, "the expression cannot be read from its end on"},
+      {{"x", "--filter", "true", "--filter", "a > 5"}, "cannot be read from \"5\" on"},
+      {{"x", "--filter", deep + "true"}, "nests && and || more than 254 deep"},
+      {{"x", "--param", "salt.maxTopK"}, "\"salt.maxTopK\" is no list of parameters"},
+      {{"x", "--param", "a=1"}, "\"a=1\" is no list of parameters"},
+      {{"x", "--query", "true"}, "a search is for WORDS, or for the expression of --query"},
+      {{"--query", "true", "--filter", "true"}, "--filter goes with WORDS"},
+  };
+  for (const auto& [arguments, message] : cases) {
+    for (const char* command : {"search", "explain"}) {
+      std::vector<std::string> all{command};
+      all.insert(all.end(), arguments.begin(), arguments.end());
+      EXPECT_EQ(run(all), ExitStatus::failure) << message;
+      EXPECT_THAT(errors, HasSubstr(message));
+      EXPECT_EQ(output, "");
+    }
+  }
+  EXPECT_TRUE(daemon.calls().empty());
+}
+
+TEST_F(CommandsTest, ExplainShowsEachStep) {
+  EXPECT_EQ(run({"explain", "Invo", "li ", "--filter", "kTLItemAuthors = A || false", "--param",
+                 "zoneScore.Subject=0.25"}),
+            ExitStatus::nothingFound);
+  for (const char* text : {
+           "query parse tree\n  kTLItemSubject == \"*Invo li *\" || kTLItemTextContent ==",
+           "query tree before optimization\n  AND, \n    OR, \n      LEAF, STRING_EQUAL, SUBJECT, "
+           "*Invo li *\n",
+           "query tree after optimization\n  (nothing)\n",
+           "filter parse tree\n  (kTLItemAuthors = A || false)\n",
+           "filter tree after optimization\n  LEAF, STRING_EQUAL, AUTHORS, A\n",
+           "original query\n  ->Invo li <-\n",
+           "terms\n  [\"invo li \" 2] nomatch:0.8 zones:{13:0.25,171:0.5,",
+           "  [\"invo \" 1] nomatch:0 zones:",
+           "  [\"a\" 1] nomatch:0 zones:{13:0,171:0,104:0,107:1,",
+       }) {
+    EXPECT_THAT(output, HasSubstr(text));
+  }
+  EXPECT_EQ(run({"explain", "--format=json", "--query", "** = a && true"}),
+            ExitStatus::nothingFound);
+  const auto json = nlohmann::json::parse(output);
+  EXPECT_EQ(json["steps"]["parseTree"], "** = a && true");
+  EXPECT_EQ(json["steps"]["treeBeforeOptimization"]["child"].size(), 2u);
+  EXPECT_TRUE(json["steps"]["treeAfterOptimization"].is_null());
+  EXPECT_EQ(json["query"]["originalQuery"], "a");
+  EXPECT_EQ(json["terms"][0]["tokens"][0], nlohmann::json({{"token", "a"}, {"score", 1.0}}));
+  EXPECT_EQ(json["terms"][0]["zones"][0]["name"], "SUBJECT");
+  EXPECT_FALSE(json.contains("filterSteps"));
+  daemon.failOnce("SearchItemsForQuery", {"TALIndexer", 3, "no terms"});
+  EXPECT_EQ(run({"explain", "--query", "com_quill_mail_read = 1"}), ExitStatus::nothingFound);
+  EXPECT_THAT(output, HasSubstr("terms\n  (none)\n"));
+  EXPECT_THAT(errors, HasSubstr("nothing in the expression can be looked up"));
+  // Without the daemon the steps are shown as well.
+  daemon.stop();
+  EXPECT_EQ(run({"explain", "x"}), ExitStatus::unreachable);
+  EXPECT_THAT(output, HasSubstr("->x<-"));
 }
 
 TEST_F(CommandsTest, ResultsInEveryFormat) {
@@ -107,7 +220,6 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
   EXPECT_EQ(output.find('\x1b'), std::string::npos);
 
   EXPECT_EQ(run({"explain", "invo"}), ExitStatus::done);
-  EXPECT_THAT(output, HasSubstr("\"originalQuery\": \"invo\""));
   EXPECT_THAT(
       output,
       HasSubstr("   2      1.5000      0.7500     0.5000  2024-01-08 08:00  file/m/a.eml\n"));

@@ -64,3 +64,38 @@ TEST(Batches, AnItemThatIsTooLongAloneIsNamed) {
   EXPECT_EQ(error->message, "0123456789 takes 16 bytes, more than the 12 that one call can carry");
   EXPECT_EQ(client::splitTexts(texts, &error, 16)->size(), 2u);
 }
+
+// A query that the daemon would refuse is not even written.
+TEST(Batches, AQueryKeepsToTheLimitsOfARecord) {
+  const auto inner = [](std::vector<std::shared_ptr<TLQueryNode>> childs) {
+    auto node = std::make_shared<TLQueryNode>();
+    node->setMergeOp(TLQueryNodeMergeOp::AND);
+    node->setChilds(std::move(childs));
+    return node;
+  };
+  const auto encoded = [](std::shared_ptr<TLQueryNode> root, size_t limit) {
+    TLQuery query;
+    query.setRoot(std::move(root));
+    std::optional<TLError> error;
+    const auto bytes = client::encode(query, &error, limit);
+    EXPECT_NE(bytes.has_value(), error.has_value());
+    TLQuery read;
+    EXPECT_TRUE(!bytes || read.initWithData(*bytes));
+    return error ? error->message : std::string();
+  };
+  constexpr size_t kBytes = client::kMaximumArrayBytes;
+  auto high = std::make_shared<TLQueryNode>();
+  for (int i = 1; i < kMaximumRecordDepth; ++i) high = inner({high});
+  EXPECT_EQ(encoded(high, kBytes), "");
+  high = inner({high});
+  EXPECT_EQ(encoded(high, kBytes), "the query nests conditions more than 256 deep");
+  for (int i = 0; i < 100000; ++i) high = inner({high});
+  EXPECT_EQ(encoded(high, kBytes), "the query nests conditions more than 256 deep");
+  std::vector<std::shared_ptr<TLQueryNode>> many(kMaximumRecordElements - 1, inner({}));
+  EXPECT_EQ(encoded(inner(many), kBytes), "");
+  many.push_back(inner({}));
+  EXPECT_EQ(encoded(inner(many), kBytes), "the query holds more than 262144 conditions");
+  EXPECT_EQ(encoded(inner({}), 3),
+            "the query takes 4 bytes, more than the 3 that one call can carry");
+  EXPECT_EQ(encoded(inner({}), 4), "");
+}

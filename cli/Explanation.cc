@@ -1,0 +1,120 @@
+#include "cli/Explanation.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <nlohmann/json.hpp>
+
+#include "modification/TALSynonyms.h"
+#include "platform/Paths.h"
+#include "query/TALQueryProcessor.h"
+#include "query/TLQueryAdditions.h"
+#include "records/TLParamsManager.h"
+
+namespace cli {
+
+namespace {
+
+constexpr const char* kSynonymsInFirstPass = "queryModification.enableSynonymModificationFirstPass";
+
+// A heading, and the text below it, indented.
+std::string section(const std::string& heading, const std::string& text, const Palette& palette) {
+  std::string out = fmt::format("{}{}{}\n", palette.faint, heading, palette.end);
+  for (size_t at = 0; at < text.size();) {
+    const size_t end = std::min(text.find('\n', at), text.size());
+    if (end > at) out += "  " + cleanForTerminal(text.substr(at, end - at)) + '\n';
+    at = end + 1;
+  }
+  return out;
+}
+
+// As the log has it, but in clear, and with indents that the terminal keeps.
+std::string treeText(const TLQueryNode* tree) {
+  if (tree == nullptr) return "(nothing)";
+  std::string out;
+  for (const char c : TLQueryAdditions::_stringifyQueryTree(tree, 0, true)) {
+    if (c == '\t') {
+      out += "  ";
+    } else {
+      out += c;
+    }
+  }
+  return out;
+}
+
+std::string stepsText(const Understanding& steps, const std::string& kind, const Palette& palette) {
+  return section(kind + " parse tree", steps.parseTree, palette) +
+         section(kind + " tree before optimization", treeText(steps.before.get()), palette) +
+         section(kind + " tree after optimization", treeText(steps.after.get()), palette);
+}
+
+nlohmann::json treeJSON(const std::shared_ptr<TLQueryNode>& tree) {
+  return tree == nullptr ? nlohmann::json() : tree->dictionaryRepresentation();
+}
+
+nlohmann::json stepsJSON(const Understanding& steps) {
+  return {{"expression", steps.expression},
+          {"parseTree", steps.parseTree},
+          {"treeBeforeOptimization", treeJSON(steps.before)},
+          {"treeAfterOptimization", treeJSON(steps.after)}};
+}
+
+nlohmann::json termJSON(const TALTerm& term) {
+  nlohmann::json tokens = nlohmann::json::array();
+  for (size_t i = 0; i < term.tokens().size(); ++i) {
+    tokens.push_back(
+        {{"token", platform::toUTF8(term.tokens()[i])}, {"score", term.tokenScores()[i]}});
+  }
+  nlohmann::json zones = nlohmann::json::array();
+  for (size_t i = 0; i < term.zoneIDs().size(); ++i) {
+    const int32_t zone = term.zoneIDs()[i];
+    zones.push_back({{"zone", zone},
+                     {"name", TLQueryNode::keysAsString(zone)},
+                     {"score", term.zoneScores()[i]}});
+  }
+  return {{"tokens", std::move(tokens)},
+          {"scoreNoMatch", term.scoreNoMatch()},
+          {"zones", std::move(zones)},
+          {"unigram", term.isUnigram()}};
+}
+
+}  // namespace
+
+std::vector<TALTerm> termsOf(const TLQuery& query) {
+  const auto resolved = query.copyWithZone();
+  resolved->setSearchParams(query.hasSearchParams()
+                                ? TLParamsManager::resolveOverrides(*query.searchParams(), true)
+                                : TLParamsManager::getDefaultSearchParamsWithCaching(true));
+  TALZoneManager zones;
+  zones.setupAttributeScoresWithSearchParams(*resolved->searchParams());
+  TALSynonyms synonyms;
+  if (resolved->searchParams()->boolValueForKey(kSynonymsInFirstPass)) {
+    synonyms.loadSynonymsFromFile(platform::synonymFilePath(), nullptr);
+  }
+  const auto processor = TALQueryProcessor::initWithZoneManager(zones, &synonyms);
+  return processor == nullptr ? std::vector<TALTerm>() : processor->termsFromQuery(*resolved);
+}
+
+std::string explanationText(const QueryInput& input, const std::vector<TALTerm>& terms,
+                            const Palette& palette) {
+  std::string out = stepsText(input.main, "query", palette);
+  if (input.filter) out += stepsText(*input.filter, "filter", palette);
+  // Between marks, since a blank at the end means that the last word is whole.
+  const std::string text = platform::toUTF8(platform::orEmpty(input.query->originalQuery()));
+  out += section("original query", "->" + text + "<-", palette);
+  std::string lines;
+  for (const TALTerm& term : terms) lines += term.description() + '\n';
+  return out + section("terms", terms.empty() ? "(none)" : lines, palette);
+}
+
+nlohmann::json explanationJSON(const QueryInput& input, const std::vector<TALTerm>& terms) {
+  nlohmann::json list = nlohmann::json::array();
+  for (const TALTerm& term : terms) list.push_back(termJSON(term));
+  nlohmann::json json{{"query", input.query->dictionaryRepresentation()},
+                      {"steps", stepsJSON(input.main)},
+                      {"terms", std::move(list)}};
+  if (input.filter) json["filterSteps"] = stepsJSON(*input.filter);
+  return json;
+}
+
+}  // namespace cli

@@ -1,0 +1,154 @@
+#include "cli/QueryInput.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <array>
+#include <set>
+
+#include "query/TLQueryAdditions.h"
+#include "records/TLParamsManager.h"
+
+namespace cli {
+
+namespace {
+
+constexpr const char* kErrorDomain = "tallow";
+constexpr int kUnreadable = 1;
+constexpr size_t kShownText = 60;
+
+// What free text is looked for in. More than four, so that optimising knows them for free text.
+constexpr std::array<const char*, 6> kTextAttributes{
+    "kTLItemSubject",    "kTLItemTextContent",
+    "kTLItemAuthors",    "kTLItemAuthorEmailAddresses",
+    "kTLItemRecipients", "kTLItemRecipientEmailAddresses"};
+
+std::string joinedWords(const std::vector<std::string>& arguments) {
+  return fmt::format("{}", fmt::join(arguments, " "));
+}
+
+// Optimising takes one asterisk off each end; what the user typed stays as it is.
+std::string disjunctionOf(const std::string& words) {
+  std::string out = "(";
+  for (const char* const attribute : kTextAttributes) {
+    if (out.size() > 1) out += " || ";
+    out += fmt::format("{} == \"*{}*\"", attribute, sq::escaped(words));
+  }
+  return out + ')';
+}
+
+std::string shown(std::string_view text) {
+  if (text.size() <= kShownText) return std::string(text);
+  return platform::toUTF8(platform::fromUTF8(text.substr(0, kShownText))) + "...";
+}
+
+void remarkUnknownNames(const sq::node& tree, std::vector<std::string>& remarks) {
+  std::set<std::string> unknown;
+  std::vector<const sq::node*> open{&tree};
+  while (!open.empty()) {
+    const sq::node& node = *open.back();
+    open.pop_back();
+    if (node.left == nullptr) continue;
+    if (node.type == sq::kTokenAnd || node.type == sq::kTokenOr) {
+      open.push_back(node.right.get());
+      open.push_back(node.left.get());
+    } else if (!TLAttributeKeyForQueryName(node.left->text)) {
+      unknown.insert(shown(node.left->text));
+    }
+  }
+  for (const std::string& name : unknown) {
+    remarks.push_back(fmt::format("there is no attribute {}", name));
+  }
+}
+
+// Reads an expression only to tell what is wrong with it. None after an error.
+sq::Tree checked(const std::string& expression, std::vector<std::string>& remarks,
+                 TLErrorOut error) {
+  sq::Tree tree;
+  size_t stop = 0;
+  const bool good = sq::parse(expression.c_str(), tree, &stop);
+  std::string_view rest = std::string_view(expression).substr(stop);
+  if (!good) {
+    const std::string place = rest.empty() ? "its end" : fmt::format("\"{}\"", shown(rest));
+    platform::setError(error, {kErrorDomain, kUnreadable,
+                               fmt::format("the expression cannot be read from {} on", place)});
+    return nullptr;
+  }
+  rest.remove_prefix(std::min(rest.find_first_not_of(" \t\n)"), rest.size()));
+  if (!rest.empty()) {
+    remarks.push_back(
+        fmt::format("the expression ends before \"{}\", the rest is ignored", shown(rest)));
+  }
+  remarkUnknownNames(*tree, remarks);
+  return tree;
+}
+
+// The tree that was built for a text that can be read; null, with an error, where it is too high.
+std::shared_ptr<TLQueryNode> builtTree(const TLQuery& query, TLErrorOut error) {
+  if (query.hasRoot()) return query.root()->copyWithZone();
+  platform::setError(error, {kErrorDomain, kUnreadable,
+                             fmt::format("the expression nests && and || more than {} deep",
+                                         TLQueryAdditions::kMaximumTreeHeight - 2)});
+  return nullptr;
+}
+
+bool readMain(const std::string& expression, QueryInput& input, TLErrorOut error) {
+  const sq::Tree tree = checked(expression, input.remarks, error);
+  if (tree == nullptr) return false;
+  input.query = TLQueryAdditions::initWithBeaconQueryString(platform::fromUTF8(expression), false);
+  auto before = builtTree(*input.query, error);
+  if (before == nullptr) return false;
+  TLQueryAdditions::optimizeQuery(*input.query);
+  input.main = {expression, sq::expressionText(*tree), std::move(before), input.query->root()};
+  return true;
+}
+
+// Each filter stands for itself, whatever it looks like beside the others.
+bool readFilters(const std::vector<std::string>& filters, QueryInput& input, TLErrorOut error) {
+  if (filters.empty()) return true;
+  std::vector<std::string> texts;
+  std::vector<TLString> strings;
+  for (const std::string& filter : filters) {
+    const sq::Tree tree = checked(filter, input.remarks, error);
+    if (tree == nullptr) return false;
+    texts.push_back(fmt::format("({})", sq::expressionText(*tree)));
+    strings.push_back(platform::fromUTF8(texts.back()));
+  }
+  TLQueryAdditions::addFiltersToQuery(*input.query, strings, false);
+  auto before = builtTree(*input.query, error);
+  if (before == nullptr) return false;
+  TLQueryAdditions::optimizeFiltersOfQuery(*input.query);
+  input.filter = {fmt::format("{}", fmt::join(filters, " && ")),
+                  fmt::format("{}", fmt::join(texts, " && ")), std::move(before),
+                  input.query->root()};
+  return true;
+}
+
+bool readParameters(const std::string& text, TLQuery& query, TLErrorOut error) {
+  if (text.empty()) return true;
+  const auto parameters = TLParamsManager::paramsFromString(platform::fromUTF8(text));
+  const auto pairs = static_cast<size_t>(std::count(text.begin(), text.end(), ',')) + 1;
+  if (parameters == nullptr || parameters->keyvaluesCount() != pairs) {
+    platform::setError(
+        error, {kErrorDomain, kUnreadable,
+                fmt::format("\"{}\" is no list of parameters, KEY=VALUE,...", shown(text))});
+    return false;
+  }
+  query.setSearchParams(parameters);
+  return true;
+}
+
+}  // namespace
+
+std::optional<QueryInput> queryInput(const Options& options, TLErrorOut error) {
+  QueryInput input;
+  input.words = joinedWords(options.arguments);
+  const std::string expression = options.query.empty() ? disjunctionOf(input.words) : options.query;
+  if (!readMain(expression, input, error) || !readFilters(options.filters, input, error) ||
+      !readParameters(options.parameters, *input.query, error)) {
+    return std::nullopt;
+  }
+  return input;
+}
+
+}  // namespace cli

@@ -1,0 +1,131 @@
+#include <gtest/gtest.h>
+
+#include <future>
+#include <set>
+
+#include "daemon/TALSearchService.h"
+#include "query/TLQueryAdditions.h"
+#include "records/TLParamsManager.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+// Verification queries from their text to the mails that are found.
+namespace {
+
+using Identifiers = std::multiset<TLString>;
+
+// Subjects that are hard to quote, each other than the rest.
+TLString subjectNumber(size_t i) {
+  static const std::vector<std::string> kForms{"It's the {} o'clock news",
+                                               "\"{}\", she said",
+                                               "C:\\mail\\{}\\",
+                                               "* {} stars **",
+                                               "one, two, {}",
+                                               "京都旅行の予定 {}",
+                                               "\\' and \\\" and \\* {} \\\\'",
+                                               "({}) || kTLItemSubject = x",
+                                               "{}",
+                                               "Re: Fwd: Größe {} – ça va ?"};
+  return platform::fromUTF8(fmt::format(fmt::runtime(kForms[i % kForms.size()]), i));
+}
+
+class Verification : public testing::Test {
+ protected:
+  Verification()
+      : service(std::make_shared<TALIndexerManager>(directory.path(), [] {
+          return TALIndexerManager::LockState{true, true};
+        })) {}
+  ~Verification() override { service.shutdown(); }
+
+  void add(const TLString& subject) {
+    auto item = std::make_shared<TLIndexableItem>();
+    item->setIdentifier(platform::fromUTF8(std::to_string(items.size())));
+    item->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, subject);
+    items.push_back(std::move(item));
+  }
+  void index() {
+    std::promise<std::optional<TLError>> done;
+    service.indexItems(items, "test", "default",
+                       [&](const std::optional<TLError>& error) { done.set_value(error); });
+    ASSERT_EQ(done.get_future().get(), std::nullopt);
+  }
+
+  static std::shared_ptr<TLQuery> queryFor(const std::vector<TLString>& subjects) {
+    std::string text;
+    for (const TLString& subject : subjects) {
+      text += text.empty() ? "(" : " || ";
+      text += "kTLItemSubject = '" + sq::escaped(platform::toUTF8(subject)) + "'";
+    }
+    return TLQueryAdditions::initWithBeaconQueryString(platform::fromUTF8(text + ")"), true);
+  }
+  Identifiers found(const TLQuery& query, const char16_t* parameters) {
+    const auto copy = query.copyWithZone();
+    copy->setSearchParams(TLParamsManager::paramsFromString(parameters));
+    Identifiers identifiers;
+    service.searchItemsForQuery(*copy, 0, "default", 1,
+                                [&](const auto& results, const std::optional<TLError>& error) {
+                                  ASSERT_EQ(error, std::nullopt);
+                                  for (const auto& item : *results) {
+                                    identifiers.insert(*item->identifier());
+                                  }
+                                });
+    return identifiers;
+  }
+  // The mails that have one of the subjects.
+  [[nodiscard]] Identifiers expected(const std::vector<TLString>& subjects) const {
+    const std::set<TLString> wanted(subjects.begin(), subjects.end());
+    Identifiers identifiers;
+    for (const auto& item : items) {
+      if (wanted.contains(*item->stringValueForKey(TLAttributeKey::SUBJECT))) {
+        identifiers.insert(*item->identifier());
+      }
+    }
+    return identifiers;
+  }
+
+  testsupport::LogCapture log;
+  testsupport::TemporaryDirectory directory;
+  TALSearchService service;
+  TALSearchService::Items items;
+};
+
+constexpr const char* kLinear = "will use a slow linear search";
+
+}  // namespace
+
+TEST_F(Verification, AnySubjectsAreFoundExactlyByBothPaths) {
+  constexpr size_t kSubjects = 1000;
+  for (size_t i = 0; i < kSubjects; ++i) {
+    add(subjectNumber(i));
+    if (i % 7 == 0) add(subjectNumber(i));                 // twice
+    if (i % 3 == 0) add(subjectNumber(i) + u" tomorrow");  // found by the words, and not meant
+  }
+  index();
+  for (const size_t count : {size_t{5}, size_t{50}, kSubjects}) {
+    std::vector<TLString> subjects;
+    for (size_t i = 0; i < count; ++i) subjects.push_back(subjectNumber(i));
+    subjects.push_back(subjects.front());
+    const auto query = queryFor(subjects);
+    ASSERT_TRUE(TALSearchService::isMailVerificationQuery(query.get()));
+    EXPECT_EQ(TALSearchService::subjectsFromRawQuery(*query->rawQuery()), subjects);
+    log.clear();
+    EXPECT_EQ(found(*query, u"salt.maxTopK=100000"), expected(subjects)) << count;
+    EXPECT_EQ(log.count(kLinear), 0u) << count;
+    EXPECT_EQ(found(*query, u"salt.maxTopK=1"), expected(subjects)) << count;
+    EXPECT_EQ(log.count(kLinear), 1u) << count;
+    EXPECT_EQ(log.count("Verification Query Successful"), 2u) << count;
+  }
+}
+
+// A subject without a word is in no index, and one that nobody has is nowhere.
+TEST_F(Verification, TheLinearPathFindsWhatTheIndexCannot) {
+  for (const char16_t* const subject : {u"one", u"two", u"three", u"four", u"!!!", u"!!!"})
+    add(subject);
+  index();
+  std::vector<TLString> subjects{u"one", u"two", u"three", u"four", u"!!!"};
+  EXPECT_EQ(found(*queryFor(subjects), u"salt.maxTopK=100"), expected(subjects));
+  EXPECT_EQ(log.count(kLinear), 1u);
+  subjects.back() = u"five";
+  EXPECT_EQ(found(*queryFor(subjects), u"salt.maxTopK=100"), expected(subjects));
+  EXPECT_TRUE(log.has("fault TALIndexer: Verification Query Failed"));
+}
