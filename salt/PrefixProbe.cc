@@ -104,16 +104,28 @@ std::vector<std::vector<SuffixMeta>> firstOfEach(const std::vector<std::vector<F
 
 }  // namespace
 
+void index::learnStarts() const {
+  _starts.beginWith([this](const std::function<bool(std::string_view)>& enter) {
+    const IndexView view(*this, false);
+    bool all = true;
+    forEachZone(view, [&](uint32_t, uint16_t, std::string_view text) { return all = enter(text); });
+    return all && view.iterators.front()->status().ok();
+  });
+}
+
 std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::string>& prefixes,
                                                          size_t limit) const {
   const auto start = Clock::now();
+  if (!_starts.complete()) learnStarts();
   const IndexView view(*this, true, kWalks);
   const auto cut = [this](const std::string& prefix) {
     return std::string_view(prefix).substr(0, suffixLength(prefix, op));
   };
   std::vector<std::string_view> sorted;
   sorted.reserve(prefixes.size());
-  for (const std::string& prefix : prefixes) sorted.push_back(cut(prefix));
+  for (const std::string& prefix : prefixes) {
+    if (_starts.mayBegin(cut(prefix))) sorted.push_back(cut(prefix));
+  }
   std::sort(sorted.begin(), sorted.end());
   sorted.erase(std::unique(sorted.begin(), sorted.end()), sorted.end());
 
@@ -148,7 +160,9 @@ std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::
   result.reserve(prefixes.size());
   for (const std::string& prefix : prefixes) {
     const auto at = std::lower_bound(sorted.begin(), sorted.end(), cut(prefix));
-    result.push_back(found[static_cast<size_t>(at - sorted.begin())]);
+    const bool looked = at != sorted.end() && *at == cut(prefix);
+    result.push_back(looked ? found[static_cast<size_t>(at - sorted.begin())]
+                            : std::vector<SuffixMeta>());
   }
   return result;
 }
