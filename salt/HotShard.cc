@@ -125,6 +125,7 @@ void index::putZone(const TextKey& key, uint32_t docID, uint16_t zoneID, std::st
   meta.ZoneID = zoneID;
   for (const uint32_t offset : offsets) {
     const std::string_view suffix = text.substr(offset);
+    _starts.add(suffix);
     meta.Offset = offset;
     suffixKey(0, suffix.substr(0, suffixLength(suffix, op)), meta, &_key);
     _batch->Put(_key, {});

@@ -39,6 +39,7 @@ index::index(Database opened)
   leveldb::Status status = db->Get(leveldb::ReadOptions(), kMetricsKey, &bytes);
   if (!status.ok() || !parseRecord(bytes, &metrics)) return;
   if (metrics.CodeVersion != CODE_VERSION) return;
+  if (metrics.Suffixes == 0) _starts.beginEmpty();
   status = db->Get(leveldb::ReadOptions(), kOptionsKey, &bytes);
   TL_ASSERT(status.ok());
   TL_ASSERT(parseRecord(bytes, &op));

@@ -17,6 +17,7 @@
 #include "salt/Helper.h"
 #include "salt/Index.h"
 #include "salt/ScanMemory.h"
+#include "salt/SuffixStarts.h"
 
 namespace salt {
 
@@ -75,6 +76,9 @@ class index final : public Index {
       const std::function<void(const Place* places, size_t count)>& callback) const override;
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override;
+
+  // Whether ScanPrefixes leaves out what it need not look for.
+  [[nodiscard]] bool knowsStarts() const { return _starts.complete(); }
 
   // The text of Dump, in pieces of some 64 KiB. `sink` returns false to stop. False when it did,
   // or, with a log line, when reading failed.
@@ -148,6 +152,8 @@ class index final : public Index {
   // False, with a log line, when the loaded counters cannot be those of a sound index.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
 
+  // Has SuffixStarts walk over what was there before it.
+  void learnStarts() const;
   void remember(std::string_view prefix, const IndexView& view, const PlaceSet& pages) const;
   void countScan(Clock::time_point start, const ScanCounts& counts) const
       TL_EXCLUDES(_metricsMutex);
@@ -190,6 +196,8 @@ class index final : public Index {
   // taken with no other held.
   platform::Mutex _mergeThreadMutex;
   std::thread _mergeThread TL_GUARDED_BY(_mergeThreadMutex);
+
+  mutable SuffixStarts _starts;  // synchronised by itself; last, since its thread reads the index
 };
 
 // What every reader works from: one walk over the database or several, the metrics and the set of

@@ -1,5 +1,7 @@
 #include <algorithm>
-#include <numeric>
+#include <array>
+#include <atomic>
+#include <string>
 #include <string_view>
 
 #include "salt/Coding.h"
@@ -11,30 +13,37 @@ namespace salt {
 
 namespace {
 
-// Goes through each shard once, from prefix to prefix in their order. Between what one prefix found
-// and the next thing in the shard there is nothing: prefixes that fall in there need no look, which
-// most of a word's neighbours do.
+// As for a scan for places.
+constexpr size_t kWalks = 2;
+constexpr unsigned kFewShards = 2;  // are not worth waking a thread
+
+// A suffix that begins with the prefix of that number.
+struct Find {
+  size_t prefix;
+  SuffixMeta meta;
+};
+
+// Goes through a shard from prefix to prefix in their order. Between what one prefix found and the
+// next thing in the shard there is nothing: prefixes that fall in there need no look, which most of
+// a word's neighbours do.
 class PrefixProbe {
  public:
-  // The prefixes are cut, in order and all different.
-  PrefixProbe(const IndexView& view, const std::vector<std::string_view>& prefixes, size_t limit)
-      : _view(view), _prefixes(prefixes), _limit(limit), _cursor(view, 0), found(prefixes.size()) {}
+  // The prefixes are cut, in order and all different. `walk` is the number of the view's iterator.
+  PrefixProbe(const IndexView& view, const std::vector<std::string_view>& prefixes, size_t limit,
+              size_t walk)
+      : _view(view), _prefixes(prefixes), _limit(limit), _cursor(view, 0, nullptr, walk) {}
 
-  // False when a read failed.
-  bool visit(unsigned shard) {
+  // Adds the first `limit` finds of each prefix, by prefix. False when a read failed.
+  bool visit(unsigned shard, std::vector<Find>* found) {
     _cursor.moveTo(static_cast<uint8_t>(shard));
-    const std::string_view* before = nullptr;
-    bool passed = false;  // the cursor stands behind matches of `before`
+    bool passed = false;  // the cursor stands behind matches of the prefix before
     for (size_t i = 0; i < _prefixes.size(); ++i) {
-      const std::string_view prefix = _prefixes[i];
-      if (found[i].size() == _limit) continue;
-      if (before == nullptr || (passed && prefix.starts_with(*before))) {
-        _cursor.seek(prefix);
+      if (i == 0 || (passed && _prefixes[i].starts_with(_prefixes[i - 1]))) {
+        _cursor.seek(_prefixes[i]);
       } else {
-        moveOnTo(prefix);
+        moveOnTo(_prefixes[i]);
       }
-      passed = collect(prefix, &found[i]);
-      before = &_prefixes[i];
+      passed = collect(i, found);
     }
     counts.fetches += _cursor.suffix.fetches;
     (shard == 0 ? counts.hotReads : counts.pageReads) += _cursor.loads;
@@ -42,6 +51,8 @@ class PrefixProbe {
     if (!status.ok()) Log.error("Error scanning index: {}", status.ToString());
     return status.ok();
   }
+
+  ScanCounts counts;
 
  private:
   // From a place that is not behind the first suffix wanted: a step to the next page costs much
@@ -58,11 +69,13 @@ class PrefixProbe {
   }
 
   // Takes matches up to the limit; true when the cursor has moved.
-  bool collect(std::string_view prefix, std::vector<SuffixMeta>* out) {
+  bool collect(size_t prefix, std::vector<Find>* found) {
     bool moved = false;
-    for (; out->size() < _limit && matches(prefix); _cursor.next()) {
+    for (size_t taken = 0; taken < _limit && matches(_prefixes[prefix]); _cursor.next()) {
       moved = true;
-      if (!_view.deleted->contains(_cursor.suffix.meta.DocID)) out->push_back(_cursor.suffix.meta);
+      if (_view.deleted->contains(_cursor.suffix.meta.DocID)) continue;
+      found->push_back({prefix, _cursor.suffix.meta});
+      ++taken;
     }
     return moved;
   }
@@ -75,38 +88,81 @@ class PrefixProbe {
   const std::vector<std::string_view>& _prefixes;
   const size_t _limit;
   ShardCursor _cursor;
-
- public:
-  std::vector<std::vector<SuffixMeta>> found;
-  ScanCounts counts;
 };
 
+// The first finds of all shards, of `prefixes` prefixes.
+std::vector<std::vector<SuffixMeta>> firstOfEach(const std::vector<std::vector<Find>>& byShard,
+                                                 size_t prefixes, size_t limit) {
+  std::vector<std::vector<SuffixMeta>> first(prefixes);
+  for (const auto& finds : byShard) {
+    for (const Find& find : finds) {
+      if (first[find.prefix].size() < limit) first[find.prefix].push_back(find.meta);
+    }
+  }
+  return first;
+}
+
 }  // namespace
+
+void index::learnStarts() const {
+  _starts.beginWith([this](const std::function<bool(std::string_view)>& enter) {
+    const IndexView view(*this, false);
+    bool all = true;
+    forEachZone(view, [&](uint32_t, uint16_t, std::string_view text) { return all = enter(text); });
+    return all && view.iterators.front()->status().ok();
+  });
+}
 
 std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::string>& prefixes,
                                                          size_t limit) const {
   const auto start = Clock::now();
-  const IndexView view(*this, true);
+  if (!_starts.complete()) learnStarts();
+  const IndexView view(*this, true, kWalks);
   const auto cut = [this](const std::string& prefix) {
     return std::string_view(prefix).substr(0, suffixLength(prefix, op));
   };
   std::vector<std::string_view> sorted;
   sorted.reserve(prefixes.size());
-  for (const std::string& prefix : prefixes) sorted.push_back(cut(prefix));
+  for (const std::string& prefix : prefixes) {
+    if (_starts.mayBegin(cut(prefix))) sorted.push_back(cut(prefix));
+  }
   std::sort(sorted.begin(), sorted.end());
   sorted.erase(std::unique(sorted.begin(), sorted.end()), sorted.end());
 
-  PrefixProbe probe(view, sorted, limit);
-  bool good = true;
-  for (unsigned shard = 0; good && shard <= view.lastShard(); ++shard) good = probe.visit(shard);
-  for (const auto& metas : probe.found) probe.counts.results += metas.size();
-  countScan(start, probe.counts);
+  std::vector<std::vector<Find>> byShard(view.lastShard() + size_t{1});
+  std::atomic<size_t> next{0};
+  std::array<ScanCounts, kWalks> counts;
+  const auto walk = [&](size_t number) {
+    PrefixProbe probe(view, sorted, limit, number);
+    bool good = true;
+    for (size_t shard = next++; good && shard < byShard.size(); shard = next++) {
+      good = probe.visit(static_cast<unsigned>(shard), &byShard[shard]);
+    }
+    counts[number] = probe.counts;
+  };
+  if (byShard.size() <= kFewShards) {
+    walk(0);
+  } else {
+    _scanHelper.share(walk);
+  }
+
+  const auto found = firstOfEach(byShard, sorted.size(), limit);
+  ScanCounts all;
+  for (const ScanCounts& one : counts) {
+    all.fetches += one.fetches;
+    all.hotReads += one.hotReads;
+    all.pageReads += one.pageReads;
+  }
+  for (const auto& metas : found) all.results += metas.size();
+  countScan(start, all);
 
   std::vector<std::vector<SuffixMeta>> result;
   result.reserve(prefixes.size());
   for (const std::string& prefix : prefixes) {
     const auto at = std::lower_bound(sorted.begin(), sorted.end(), cut(prefix));
-    result.push_back(probe.found[static_cast<size_t>(at - sorted.begin())]);
+    const bool looked = at != sorted.end() && *at == cut(prefix);
+    result.push_back(looked ? found[static_cast<size_t>(at - sorted.begin())]
+                            : std::vector<SuffixMeta>());
   }
   return result;
 }

@@ -136,7 +136,8 @@ TEST_F(SpellCorrectionTest, EditsByLengthOfTheWord) {
     EXPECT_EQ(made.size(), c.count) << c.word;
     auto from = made.begin();
     for (const auto& [token, worth] : c.some) {
-      from = std::find_if(from, made.end(), [&](const auto& m) { return m._token == token; });
+      from = std::find_if(from, made.end(),
+                          [&name = token](const auto& m) { return m._token == name; });
       ASSERT_NE(from, made.end()) << token;
       EXPECT_EQ(from->_scoreError, worth) << token;
     }
@@ -162,7 +163,8 @@ TEST_F(SpellCorrectionTest, OnlyUnmatchedSingleWordsOfSomeLengthAreCorrected) {
   EXPECT_TRUE(refused([](Term& t) { t.tokenScores.clear(); }));
   const std::map<size_t, bool> byLength{{0, true}, {1, true}, {2, false}, {21, false}, {22, true}};
   for (const auto& [length, expected] : byLength) {
-    EXPECT_EQ(refused([&](Term& t) { t.tokens[0] = std::string(length, 'a'); }), expected);
+    EXPECT_EQ(refused([size = length](Term& t) { t.tokens[0] = std::string(size, 'a'); }),
+              expected);
   }
 }
 

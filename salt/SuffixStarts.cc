@@ -1,0 +1,29 @@
+#include "salt/SuffixStarts.h"
+
+#include <utility>
+
+#include "platform/Queue.h"
+
+namespace salt {
+
+SuffixStarts::~SuffixStarts() {
+  _ending = true;
+  platform::MutexLock lock(_mutex);
+  if (_thread.joinable()) _thread.join();
+}
+
+void SuffixStarts::beginWith(Walk walk) {
+  platform::MutexLock lock(_mutex);
+  if (_complete || _thread.joinable()) return;
+  _thread = std::thread([this, walk = std::move(walk)] {
+    platform::setThreadName("tallow-starts");
+    platform::lowerThreadPriority();
+    const bool all = walk([this](std::string_view text) {
+      for (; text.size() >= kBytes && !_ending; text.remove_prefix(1)) add(text);
+      return !_ending;
+    });
+    if (all && !_ending) _complete = true;
+  });
+}
+
+}  // namespace salt
