@@ -240,7 +240,8 @@ class TALIndexer {
   std::unique_ptr<tokenizer::Tokenizer> tk;            // fixed after construction
   std::unique_ptr<TALQueryProcessor> _queryProcessor;  // fixed after construction
 
-  platform::Mutex _indexMutex;
+  // Fair: a search that waits for a batch does not wait for those behind it.
+  platform::FairMutex _indexMutex;
   // Held for as long as one reads `_textStore` without `_indexMutex`; taken after it.
   platform::Mutex _textStoreMutex;
   std::unique_ptr<salt::Index> _textStore;  // see invariant 1, for this and the next two

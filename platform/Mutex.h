@@ -31,15 +31,31 @@ class TL_CAPABILITY("mutex") Mutex {
   std::mutex _mutex;
 };
 
+// A mutex that whoever waits gets before the one who gives it back and wants it again at once: of a
+// std::mutex that one is mostly the next owner, too.
+class TL_CAPABILITY("mutex") FairMutex {
+ public:
+  void lock() TL_ACQUIRE() {
+    std::lock_guard turn(_turn);
+    _mutex.lock();
+  }
+  void unlock() TL_RELEASE() { _mutex.unlock(); }
+
+ private:
+  std::mutex _turn;  // of the next owner
+  std::mutex _mutex;
+};
+
+template <typename AnyMutex>
 class TL_SCOPED_CAPABILITY MutexLock {
  public:
-  explicit MutexLock(Mutex& mutex) TL_ACQUIRE(mutex) : _mutex(mutex) { _mutex.lock(); }
+  explicit MutexLock(AnyMutex& mutex) TL_ACQUIRE(mutex) : _mutex(mutex) { _mutex.lock(); }
   ~MutexLock() TL_RELEASE() { _mutex.unlock(); }
   MutexLock(const MutexLock&) = delete;
   MutexLock& operator=(const MutexLock&) = delete;
 
  private:
-  Mutex& _mutex;
+  AnyMutex& _mutex;
 };
 
 }  // namespace platform

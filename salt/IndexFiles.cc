@@ -75,9 +75,7 @@ class IndexFiles::Manifest final : public leveldb::WritableFile {
 IndexFiles::IndexFiles(leveldb::Env* files)
     : EnvWrapper(files),
       _steps("tallow-files"),
-      _work("tallow-leveldb", platform::QueuePriority::background) {
-  _work.async(platform::lowerThreadPriority);
-}
+      _work("tallow-leveldb", platform::QueuePriority::background) {}
 
 leveldb::Status IndexFiles::NewWritableFile(const std::string& path, leveldb::WritableFile** file) {
   const leveldb::Status status = target()->NewWritableFile(path, file);

@@ -23,8 +23,8 @@ namespace salt {
 // is on the disk. With the first failure all of this ends, the manifest refuses to grow, and
 // leveldb refuses to write; logs and tables that the last good manifest needs are all still there.
 //
-// leveldb's background work runs on a thread of this database's own, below searches in priority:
-// in leveldb's default environment all databases of the process share one.
+// leveldb's background work runs on a thread of this database's own: in leveldb's default
+// environment all databases of the process share one.
 //
 // Any thread. Outlives the database; the destructor ends both threads.
 class IndexFiles final : public leveldb::EnvWrapper {

@@ -66,7 +66,6 @@ void index::startMerge(uint8_t shard) {
 
 void index::runMerge(uint8_t shard) {
   platform::setThreadName("tallow-merge");
-  platform::lowerThreadPriority();
   const auto start = Clock::now();
   Merge(*this, shard).run();
   platform::returnFreeMemory();
