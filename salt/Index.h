@@ -175,8 +175,8 @@ class Index {
       const std::function<void(const Place* places, size_t count)>& callback) const = 0;
 
   // For each prefix the first `limit` suffixes that ScanPrefix would call with: for many prefixes
-  // that are alike, most of which nothing begins with, at a fraction of its cost. The first call has
-  // the index learn in the background with what its suffixes begin; later ones cost less still.
+  // that are alike, most of which nothing begins with, at a fraction of its cost. The first call
+  // has the index learn in the background with what its suffixes begin; later ones cost less still.
   [[nodiscard]] virtual std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const = 0;
 };
