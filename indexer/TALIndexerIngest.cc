@@ -374,13 +374,14 @@ void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
 
 bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error) {
   salt::Index* index = _textStore.get();
+  DocDates* const dates = &_docDates;
   const auto store = docStore();
   return store->enumerateDocIDs(
       error, [&](int64_t, uint32_t docID, const TLURL&, bool* stop, TLErrorOut handlerError) {
         const auto doc = store->documentWithID(docID, nullptr);
         if (doc == nullptr || doc->domainIdentifier() != domain) return;
         std::optional<TLError> failure;
-        _docDates.forget(docID);
+        dates->forget(docID);
         if (store->deleteDocument(docID, &failure)) {
           if (index != nullptr) index->DeleteDoc(docID);
           return;
