@@ -1,5 +1,7 @@
 #include <algorithm>
-#include <unordered_set>
+#include <bit>
+#include <cstdint>
+#include <utility>
 
 #include "platform/Assert.h"
 #include "query/TLQueryAdditions.h"
@@ -19,11 +21,34 @@ struct Subtree {
   size_t hash = 0;
 };
 
-struct HashOf {
-  size_t operator()(const Subtree& subtree) const { return subtree.hash; }
-};
-struct SameTree {
-  bool operator()(const Subtree& a, const Subtree& b) const { return a.node->isEqual(*b.node); }
+// Subtrees that all differ, in the order in which they came. Their places are looked up by hash, in
+// a table with linear probing; the hashes of both kinds lie side by side, so that a list of any
+// length costs a few steps a subtree.
+class DistinctSubtrees {
+ public:
+  explicit DistinctSubtrees(size_t most) : _places(std::bit_ceil(2 * most + 1)) {
+    _subtrees.reserve(most);
+  }
+
+  [[nodiscard]] const std::vector<Subtree>& all() const { return _subtrees; }
+
+  void add(Subtree subtree) {
+    const size_t mask = _places.size() - 1;
+    size_t at = spread(subtree.hash) & mask;
+    for (; _places[at] != 0; at = (at + 1) & mask) {
+      const Subtree& other = _subtrees[_places[at] - 1];
+      if (other.hash == subtree.hash && other.node->isEqual(*subtree.node)) return;
+    }
+    _subtrees.push_back(std::move(subtree));
+    _places[at] = static_cast<uint32_t>(_subtrees.size());
+  }
+
+ private:
+  // Hashes of like subtrees have like lower bits.
+  static size_t spread(size_t hash) { return (hash * 0x9E3779B97F4A7C15) >> 32; }
+
+  std::vector<Subtree> _subtrees;
+  std::vector<uint32_t> _places;  // in _subtrees, from 1; 0 where there is none
 };
 
 bool isConstant(const TLQueryNode& node) {
@@ -89,9 +114,7 @@ class Optimizer {
     }
     // The constant that decides: false an AND, true an OR.
     const bool deciding = node->mergeOp() == OR;
-    std::vector<Node> kept;
-    std::unordered_set<Subtree, HashOf, SameTree> known(node->childsCount());
-    Subtree result{node, static_cast<size_t>(node->mergeOp())};
+    DistinctSubtrees kept(node->childsCount());
     for (const Node& child : node->childs()) {
       Subtree subtree = optimize(child, height + 1);
       if (subtree.node == nullptr) continue;
@@ -99,13 +122,18 @@ class Optimizer {
         if (subtree.node->boolValue() == deciding) return subtree;
         continue;
       }
-      if (!known.insert(subtree).second) continue;
-      result.hash = combined(result.hash, subtree.hash);
-      kept.push_back(std::move(subtree.node));
+      kept.add(std::move(subtree));
     }
-    if (kept.empty()) return {};
-    if (kept.size() == 1) return *known.begin();
-    node->setChilds(std::move(kept));
+    if (kept.all().empty()) return {};
+    if (kept.all().size() == 1) return kept.all().front();
+    Subtree result{node, static_cast<size_t>(node->mergeOp())};
+    std::vector<Node> childs;
+    childs.reserve(kept.all().size());
+    for (const Subtree& subtree : kept.all()) {
+      result.hash = combined(result.hash, subtree.hash);
+      childs.push_back(subtree.node);
+    }
+    node->setChilds(std::move(childs));
     return result;
   }
 
