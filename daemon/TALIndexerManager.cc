@@ -5,12 +5,13 @@
 
 #include "daemon/TLDeviceLockMonitor.h"
 #include "docstore/TALSqliteDocStore.h"
-#include "platform/Files.h"
 #include "platform/Paths.h"
 
 namespace {
 
 constexpr int kIndexerUnavailable = -2;
+// More than recovering the two databases of a class writes.
+constexpr uint64_t kOpeningRoom = 32 * 1024 * 1024;
 
 bool createClassDirectory(const std::string& root, const std::string& protectionClass,
                           TLErrorOut error) {
@@ -40,9 +41,11 @@ TALIndexerManager::TALIndexerManager(std::string path)
         return LockState{TLDeviceUnlockedSinceBoot(), TLProtectedDataAvailable()};
       }) {}
 
-TALIndexerManager::TALIndexerManager(std::string path, LockStateSource lockState)
+TALIndexerManager::TALIndexerManager(std::string path, LockStateSource lockState,
+                                     FreeBytesSource freeBytes)
     : _path(std::move(path)),
       _lockState(std::move(lockState)),
+      _freeBytes(std::move(freeBytes)),
       _indexersQueue("com.quill.tallow.IndexerManager", platform::QueuePriority::background) {}
 
 std::vector<std::shared_ptr<TALIndexer>> TALIndexerManager::allIndexers() {
@@ -95,6 +98,11 @@ std::shared_ptr<TALIndexer> TALIndexerManager::_createIndexerWithProtectionType(
     return nullptr;
   }
   const std::string directory = platform::joinPath(_path, protectionClass);
+  if (const uint64_t free = _freeBytes(directory); free < kOpeningRoom) {
+    log().error("Not opening {}: {} bytes are left on the disk", directory, free);
+    platform::setError(error, platform::posixError(ENOSPC, directory));
+    return nullptr;
+  }
   const std::string docStorePath = platform::joinPath(directory, "docstore/docstore.db");
   auto docStore = std::make_shared<TALSqliteDocStore>(docStorePath);
   if (!docStore->openWithError(&failure)) {

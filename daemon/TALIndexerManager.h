@@ -1,11 +1,14 @@
 #pragma once
 
+#include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 #include <unordered_map>
 #include <vector>
 
 #include "indexer/TALIndexer.h"
+#include "platform/Files.h"
 #include "platform/Log.h"
 #include "platform/Queue.h"
 #include "platform/TLError.h"
@@ -29,14 +32,18 @@ class TALIndexerManager {
     bool protectedDataAvailable;
   };
   using LockStateSource = std::function<LockState()>;
+  using FreeBytesSource = std::function<uint64_t(const std::string& path)>;
 
   explicit TALIndexerManager(std::string path);
-  TALIndexerManager(std::string path, LockStateSource lockState);
+  TALIndexerManager(std::string path, LockStateSource lockState,
+                    FreeBytesSource freeBytes = platform::freeBytes);
 
   [[nodiscard]] std::vector<std::shared_ptr<TALIndexer>> allIndexers();
 
   // The indexer of the class, or null with an error: indexerUnavailableError, or that of the file
-  // system or of the store, and then nothing is kept and the next request tries again.
+  // system or of the store, and then nothing is kept and the next request tries again. A class is
+  // not opened on a disk that is nearly full (ENOSPC): recovering its databases takes room, and an
+  // index that cannot be recovered starts empty.
   [[nodiscard]] std::shared_ptr<TALIndexer> indexerWithProtectionClass(
       const std::string& protectionClass, TLErrorOut error);
 
@@ -52,6 +59,7 @@ class TALIndexerManager {
 
   const std::string _path;
   const LockStateSource _lockState;
+  const FreeBytesSource _freeBytes;
   std::unordered_map<std::string, std::shared_ptr<TALIndexer>> _indexers;  // of the queue's thread
   platform::SerialQueue _indexersQueue;
 };

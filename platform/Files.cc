@@ -137,6 +137,12 @@ bool writeFileAtomically(const std::string& path, const std::string& bytes, TLEr
   return true;
 }
 
+uint64_t freeBytes(const std::string& path) {
+  std::error_code error;
+  const auto space = fs::space(path, error);
+  return error ? UINT64_MAX : space.available;
+}
+
 void raiseDescriptorLimit() {
   rlimit limit;
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;

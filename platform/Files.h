@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <vector>
@@ -31,6 +32,10 @@ bool removeItem(const std::string& path, TLErrorOut error);
 
 // Written beside the target, synced, then renamed over it.
 bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error);
+
+// How many bytes this process could still write on the file system of `path`; as many as a number
+// can hold where that cannot be told.
+[[nodiscard]] uint64_t freeBytes(const std::string& path);
 
 // As many open files as the system lets this process have.
 void raiseDescriptorLimit();

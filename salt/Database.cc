@@ -2,7 +2,6 @@
 
 #include <cstdarg>
 #include <cstdio>
-#include <filesystem>
 
 #include "platform/Files.h"
 
@@ -50,10 +49,8 @@ void LeveldbLogger::Logv(const char* format, va_list arguments) {
 }
 
 void compact(const Database& database, const leveldb::Slice* begin, const leveldb::Slice* end) {
-  std::error_code error;
-  const auto space = std::filesystem::space(database.path, error);
-  if (!error && space.available < kCompactionRoom) {
-    Log.error("No compaction: {} bytes are left on the disk", space.available);
+  if (const uint64_t free = platform::freeBytes(database.path); free < kCompactionRoom) {
+    Log.error("No compaction: {} bytes are left on the disk", free);
     return;
   }
   database.db->CompactRange(begin, end);

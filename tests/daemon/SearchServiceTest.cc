@@ -50,7 +50,9 @@ std::shared_ptr<TLQuery> verificationQuery(const std::vector<TLString>& subjects
 class SearchServiceTest : public testing::Test {
  protected:
   SearchServiceTest()
-      : service(std::make_shared<TALIndexerManager>(directory.path(), [this] { return lock; })) {}
+      : service(std::make_shared<TALIndexerManager>(
+            directory.path(), [this] { return lock; },
+            [this](const std::string&) { return freeBytes; })) {}
   ~SearchServiceTest() override { service.shutdown(); }
 
   template <typename Start>
@@ -78,6 +80,7 @@ class SearchServiceTest : public testing::Test {
   testsupport::LogCapture log;
   testsupport::TemporaryDirectory directory;
   TALIndexerManager::LockState lock{true, true};
+  uint64_t freeBytes = 1 << 30;
   TALSearchService service;
   Outcome lastError;
 };
@@ -164,6 +167,19 @@ TEST_F(SearchServiceTest, AFailedStoreOpenIsTriedAgain) {
   EXPECT_TRUE(log.contains("error TALIndexerManager: Could not create doc store in"));
   ASSERT_TRUE(platform::removeItem(directory / "default/docstore", nullptr));
   EXPECT_EQ(index({mail(u"a", u"x")}), std::nullopt);
+}
+
+TEST_F(SearchServiceTest, OnAFullDiskAnOpenClassGoesOnAndNoOtherIsOpened) {
+  ASSERT_EQ(index({mail(u"a", u"x")}), std::nullopt);
+  freeBytes = 0;
+  EXPECT_EQ(search(textQuery(u"x")), 1);
+  const Outcome refused = index({mail(u"a", u"x")}, "other");
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(refused->code, ENOSPC);
+  EXPECT_TRUE(log.contains("other: 0 bytes are left on the disk"));
+  EXPECT_TRUE(platform::listDirectory(directory / "other", nullptr)->empty());
+  freeBytes = 1 << 30;
+  EXPECT_EQ(index({mail(u"a", u"x")}, "other"), std::nullopt);
 }
 
 TEST_F(SearchServiceTest, StatisticsStateVacuumAndReset) {
