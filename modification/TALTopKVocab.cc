@@ -22,6 +22,9 @@ constexpr int64_t kEnoughDocs = 2001;  // on their own
 constexpr float kGrowth = 0.5F;        // of the documents there were before
 constexpr float kOldSeconds = 432000;  // 5 days
 
+// How many times as long as a count took, in processor time, the next one rests.
+constexpr int kRest = 9;
+
 TLError damaged(const char* what) {
   return {kErrorDomain, kDamagedArchive, std::string("the stored vocabulary has no ") + what};
 }
@@ -63,7 +66,11 @@ TALTopKVocab::~TALTopKVocab() {
 }
 
 void TALTopKVocab::shutdown() {
-  _isShutdown = true;
+  {
+    MutexLock lock(_restMutex);
+    _isShutdown = true;
+  }
+  _restEnds.notify_all();
   if (_topKVocabQueue) _topKVocabQueue->drain();
 }
 
@@ -139,14 +146,31 @@ void TALTopKVocab::checkAndRebuildTopKVocabWithCompletionHandler(Completion hand
 void TALTopKVocab::rebuildUnlessOneWaits() {
   if (!_topKVocabQueue || _rebuildWaits.exchange(true)) return;
   _topKVocabQueue->async([this] {
+    rest();
     _rebuildWaits = false;
     rebuild();
   });
 }
 
+void TALTopKVocab::rest() {
+  MutexLock lock(_restMutex);
+  while (!_isShutdown && _askedFor == 0 && std::chrono::steady_clock::now() < _restUntil) {
+    _restEnds.wait_until(_restMutex, _restUntil);
+  }
+}
+
 void TALTopKVocab::_rebuildTopKVocabWithCompletionHandler(Completion handler) {
   if (!_topKVocabQueue) return;
+  {
+    MutexLock lock(_restMutex);
+    ++_askedFor;
+  }
+  _restEnds.notify_all();
   _topKVocabQueue->async([this, completion = std::move(handler)] {
+    {
+      MutexLock lock(_restMutex);
+      --_askedFor;
+    }
     const std::optional<TLError> outcome = rebuild();
     if (completion) completion(outcome);
   });
@@ -177,6 +201,7 @@ std::optional<TLError> TALTopKVocab::rebuild() {
 
 // A count that a shutdown cuts short leaves the words as they were.
 void TALTopKVocab::count() {
+  const auto start = platform::threadProcessorTime();
   const auto tokens =
       saltsearch::TopKTokens(*_textStore, kWords, saltsearch::ZoneScoreDefault,
                              saltsearch::TokenizeSpace, [this] { return !_isShutdown; });
@@ -185,6 +210,9 @@ void TALTopKVocab::count() {
   words.reserve(tokens.size());
   for (const auto& [token, weight] : tokens) words.push_back(token);
   setVocab(std::move(words));
+  const auto taken = platform::threadProcessorTime() - start;
+  MutexLock lock(_restMutex);
+  _restUntil = std::chrono::steady_clock::now() + kRest * taken;
 }
 
 std::optional<TLError> TALTopKVocab::store(const std::string& blob) {

@@ -1,6 +1,9 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -68,8 +71,11 @@ class TALTopKVocab {
  private:
   void _rebuildTopKVocabWithCompletionHandler(Completion handler);
   // The same for one that nobody asked for: not while such a one waits, as it would have a whole
-  // walk for nothing.
+  // walk for nothing, and after a rest.
   void rebuildUnlessOneWaits();
+  // On the queue: waits until the last count is as long ago as makes counting a small part of all
+  // time, however fast documents come. Ends early for a rebuild that was asked for and at shutdown.
+  void rest() TL_EXCLUDES(_restMutex);
   // The body of a rebuild, on the queue.
   std::optional<TLError> rebuild();
   void count();
@@ -82,6 +88,10 @@ class TALTopKVocab {
   std::atomic<uint32_t> _maxDocID{0};
   std::atomic<uint32_t> _lastTopKRebuildDocID{0};
   std::atomic<double> _lastTopKRebuildDate;
+  platform::Mutex _restMutex;
+  std::condition_variable_any _restEnds;
+  std::chrono::steady_clock::time_point _restUntil TL_GUARDED_BY(_restMutex);
+  size_t _askedFor TL_GUARDED_BY(_restMutex) = 0;  // rebuilds that wait and were asked for
   mutable platform::Mutex _vocabMutex;
   std::shared_ptr<const Words> _vocab TL_GUARDED_BY(_vocabMutex);
   // None without store or index. Last, so that it ends before what its work uses.

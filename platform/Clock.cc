@@ -1,6 +1,7 @@
 #include "platform/Clock.h"
 
 #include <chrono>
+#include <ctime>
 
 namespace platform {
 
@@ -17,6 +18,12 @@ TickRatio tickRatio() {
 uint64_t millisFromTicks(uint64_t ticks, TickRatio ratio) {
   if (ratio.denominator == 0) return 0;
   return ticks * ratio.numerator / ratio.denominator / 1000000;
+}
+
+std::chrono::nanoseconds threadProcessorTime() {
+  timespec time{};
+  clock_gettime(CLOCK_THREAD_CPUTIME_ID, &time);
+  return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
 double secondsSince1970() {

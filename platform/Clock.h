@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 
 namespace platform {
@@ -15,6 +16,9 @@ struct TickRatio {
 
 // Ticks to whole milliseconds, rounded down; 0 when the denominator is 0.
 [[nodiscard]] uint64_t millisFromTicks(uint64_t ticks, TickRatio ratio);
+
+// What the calling thread has computed so far.
+[[nodiscard]] std::chrono::nanoseconds threadProcessorTime();
 
 // Wall clock, seconds since 1970-01-01 00:00:00 UTC.
 [[nodiscard]] double secondsSince1970();

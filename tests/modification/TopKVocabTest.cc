@@ -252,6 +252,22 @@ TEST_F(TopKVocabTest, TruncatedOrChangedBlobsAreReadSoundly) {
   }
 }
 
+TEST_F(TopKVocabTest, OneThatIsAskedForEndsTheRestOfOneThatIsNot) {
+  WatchedIndex watched;
+  watched.atZone = [] {
+    const auto end = platform::threadProcessorTime() + std::chrono::milliseconds(1);
+    while (platform::threadProcessorTime() < end) continue;
+  };
+  TALTopKVocab vocab(store, &watched);
+  EXPECT_EQ(rebuild(vocab), std::nullopt);
+  watched.atZone = [] {};
+  vocab.setMaxDocID(2001);
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
+  EXPECT_EQ(watched.zones, 200);
+  EXPECT_EQ(rebuild(vocab), std::nullopt);
+  EXPECT_EQ(watched.zones, 600);
+}
+
 TEST_F(TopKVocabTest, ShutdownEndsTheCountAndWhatWaitsBehindIt) {
   auto watched = std::make_unique<WatchedIndex>();
   std::latch counting(1);
