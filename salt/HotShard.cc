@@ -136,25 +136,27 @@ std::optional<index::Aftermath> index::commitZone(Clock::time_point start, Clock
                                                   uint32_t docID, uint16_t zoneID,
                                                   size_t suffixes) {
   const size_t batchBytes = _batch->ApproximateSize();
-  platform::MutexLock lock(_metricsMutex);
-  const MetricsBlock undo = metrics;
-  const auto now = Clock::now();
-  metrics.MaxDocID = std::max(metrics.MaxDocID, docID);
-  metrics.LastDocID = docID;
-  metrics.Suffixes += suffixes;
-  metrics.HotSuffixes += suffixes;
-  metrics.IndexingCalls += 1;
-  metrics.IndexingSeconds += seconds(now - start);
+  uint32_t newestBefore = 0;
   Aftermath aftermath;
-  aftermath.delay = throttle(now - locked);
-  aftermath.vacuumDue = !metrics.VacuumInProgress && metrics.HotSuffixes > op.MaxHotSuffixes;
-  const bool written = writeMetrics(&*_batch);
-  if (batchBytes > kMaxKeptBatchBytes) _batch.emplace();
-  if (!written) {
-    static_cast<MetricsBlock&>(metrics) = undo;
-    return std::nullopt;
+  bool written = false;
+  {
+    platform::MutexLock lock(_commitMutex);
+    const auto now = Clock::now();
+    written = commit(&*_batch, false, [&](MetricsBlock& counters) {
+      newestBefore = counters.MaxDocID;
+      counters.MaxDocID = std::max(counters.MaxDocID, docID);
+      counters.LastDocID = docID;
+      counters.Suffixes += suffixes;
+      counters.HotSuffixes += suffixes;
+      counters.IndexingCalls += 1;
+      counters.IndexingSeconds += seconds(now - start);
+      aftermath.delay = throttle(now - locked, counters);
+      aftermath.vacuumDue = !counters.VacuumInProgress && counters.HotSuffixes > op.MaxHotSuffixes;
+    });
   }
-  if (docID > undo.MaxDocID) {
+  if (batchBytes > kMaxKeptBatchBytes) _batch.emplace();
+  if (!written) return std::nullopt;
+  if (docID > newestBefore) {
     _newestDoc = docID;
     _newestZones.clear();
   }
@@ -164,15 +166,15 @@ std::optional<index::Aftermath> index::commitZone(Clock::time_point start, Clock
 
 // No delay below twice MaxHotSuffixes, from there whole multiples of the time the write lock was
 // held.
-std::chrono::nanoseconds index::throttle(Clock::duration held) {
-  const auto hot = static_cast<double>(metrics.HotSuffixes);
+std::chrono::nanoseconds index::throttle(Clock::duration held, MetricsBlock& counters) const {
+  const auto hot = static_cast<double>(counters.HotSuffixes);
   const double most = op.MaxHotSuffixes;
   if (!(hot > most * 1.1)) return std::chrono::nanoseconds(0);
   // Without a limit every suffix counts as one time over.
   const auto times = static_cast<uint64_t>(hot / std::max(most, 1.0) - 1.0);
   const std::chrono::nanoseconds delay(static_cast<uint64_t>(held.count()) * times *
                                        op.ThrottleFactor);
-  metrics.ThrottlingSeconds += seconds(delay);
+  counters.ThrottlingSeconds += seconds(delay);
   return delay;
 }
 

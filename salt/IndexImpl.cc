@@ -170,22 +170,46 @@ void index::ResetScanMetrics() {
   metrics.ScanPageReads = 0;
 }
 
-bool index::writeMetrics(leveldb::WriteBatch* batch) {
+void index::putMetrics(leveldb::WriteBatch* batch) const {
   const MetricsBlock& block = metrics;
   batch->Put(kMetricsKey, {reinterpret_cast<const char*>(&block), sizeof block});
+}
+
+bool index::write(leveldb::WriteBatch* batch) {
   const leveldb::Status status = _writer.write(batch);
   batch->Clear();
   if (!status.ok()) Log.error("Error writing to db: {}", status.ToString());
   return status.ok();
 }
 
+void index::restore(const MetricsBlock& before) {
+  MetricsBlock block = before;
+  block.Scans = metrics.Scans;
+  block.ScanSeconds = metrics.ScanSeconds;
+  block.ScanResults = metrics.ScanResults;
+  block.ScanTextFetches = metrics.ScanTextFetches;
+  block.ScanHotReads = metrics.ScanHotReads;
+  block.ScanPageReads = metrics.ScanPageReads;
+  static_cast<MetricsBlock&>(metrics) = block;
+}
+
 IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
-    : idx(owner), options(readOptions(fillCache)), iterators(walks) {
-  platform::MutexLock lock(owner._metricsMutex);
-  for (auto& iterator : iterators) iterator.reset(owner.db->NewIterator(options));
-  metrics = owner.metrics;
-  deleted = owner._deleted;
-  pageGeneration = owner._pageGeneration;
+    : idx(owner), options(readOptions(fillCache)) {
+  if (fillCache) {
+    take(walks);
+  } else {
+    platform::MutexLock lock(owner._commitMutex);
+    take(walks);
+  }
+}
+
+void IndexView::take(size_t walks) {
+  platform::MutexLock lock(idx._metricsMutex);
+  iterators.resize(idx._suffixesMove ? 1 : walks);
+  for (auto& iterator : iterators) iterator.reset(idx.db->NewIterator(options));
+  metrics = idx.metrics;
+  deleted = idx._deleted;
+  pageGeneration = idx._suffixesMove ? 0 : idx._pageGeneration;
 }
 
 uint8_t IndexView::lastShard() const {

@@ -39,13 +39,16 @@ inline constexpr char kDeletedKey[] =
 // 0xFF is the first byte of texts and named keys.
 inline constexpr uint8_t kMaxShardNumber = 0xFE;
 
-// The index over a leveldb database. Two locks, the write mutex always before the metrics mutex:
-// the first makes whole calls of AddZone and DeleteDoc follow one another, the second guards the
-// metrics and the taking of a view.
+// The index over a leveldb database. Three locks, taken in this order: the write mutex makes whole
+// calls of AddZone and DeleteDoc follow one another; the commit mutex the writes of batches with
+// metrics, which can wait long for leveldb; the metrics mutex, never held for long, guards the
+// metrics and the taking of a view, so that no scan waits for a write.
 //
 // What holds at all times: the metrics in the database are those of the same batch as the keys that
-// they count; a reader's walk and its copy of the metrics are of the same moment, and what is
-// deleted later stays visible to it.
+// they count, and those in memory are changed under the commit mutex, but for the counts of scans.
+// A reader's walk and its copy of the metrics are of the same moment, save those of a scan that
+// begins while a batch is written: there the metrics may count what its walk does not see yet. What
+// is deleted later stays visible to a reader.
 class index final : public Index {
  public:
   explicit index(Database opened);
@@ -102,7 +105,7 @@ class index final : public Index {
   // to, and clears it. `pageDelta` is pages written less pages removed. False when it failed, which
   // is logged.
   [[nodiscard]] bool commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta)
-      TL_EXCLUDES(_metricsMutex);
+      TL_EXCLUDES(_commitMutex, _metricsMutex);
 
  private:
   using Clock = std::chrono::steady_clock;
@@ -129,23 +132,34 @@ class index final : public Index {
   [[nodiscard]] std::optional<Aftermath> commitZone(Clock::time_point start,
                                                     Clock::time_point locked, uint32_t docID,
                                                     uint16_t zoneID, size_t suffixes)
-      TL_REQUIRES(_writeMutex);
-  [[nodiscard]] std::chrono::nanoseconds throttle(Clock::duration held) TL_REQUIRES(_metricsMutex);
+      TL_REQUIRES(_writeMutex) TL_EXCLUDES(_commitMutex);
+  // The delay that the counters ask for, which is counted.
+  [[nodiscard]] std::chrono::nanoseconds throttle(Clock::duration held,
+                                                  MetricsBlock& counters) const;
 
   [[nodiscard]] std::shared_ptr<const DocSet> deletedDocs() const TL_EXCLUDES(_metricsMutex);
 
-  // Writes the batch together with the metrics and clears it. A failure is logged.
-  [[nodiscard]] bool writeMetrics(leveldb::WriteBatch* batch) TL_REQUIRES(_metricsMutex);
+  // Writes the batch together with the metrics as change(metrics) leaves them, and clears it. After
+  // a failure, which is logged, the metrics are what they were. `movesSuffixes` tells of a batch
+  // after which pages hold what they did not.
+  template <typename Change>
+  [[nodiscard]] bool commit(leveldb::WriteBatch* batch, bool movesSuffixes, const Change& change)
+      TL_REQUIRES(_commitMutex) TL_EXCLUDES(_metricsMutex);
+  void putMetrics(leveldb::WriteBatch* batch) const TL_REQUIRES(_metricsMutex);
+  [[nodiscard]] bool write(leveldb::WriteBatch* batch);
+  // All but the counts of scans.
+  void restore(const MetricsBlock& before) TL_REQUIRES(_metricsMutex);
 
   void vacuumAfterAdding();
   // The shard that the next merge goes into; a new one is counted.
-  [[nodiscard]] uint8_t chooseShard() TL_REQUIRES(_metricsMutex);
+  [[nodiscard]] uint8_t chooseShard(MetricsBlock& counters) const;
   // Marks a merge as running and chooses its shard; none when it is not worthwhile, one runs
   // already, or the mark cannot be written.
-  [[nodiscard]] std::optional<uint8_t> beginVacuum() TL_EXCLUDES(_metricsMutex);
-  void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex);
+  [[nodiscard]] std::optional<uint8_t> beginVacuum() TL_EXCLUDES(_commitMutex, _metricsMutex);
+  [[nodiscard]] bool vacuumIsDue() const TL_EXCLUDES(_metricsMutex);
+  void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex, _commitMutex);
   // The body of the merge thread.
-  void runMerge(uint8_t shard) TL_EXCLUDES(_metricsMutex);
+  void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
   [[nodiscard]] bool hotPartIsSparse() const TL_EXCLUDES(_metricsMutex);
   void compactHotPart();
 
@@ -174,8 +188,13 @@ class index final : public Index {
  private:
   mutable platform::Mutex _metricsMutex;
   mutable Metrics metrics TL_GUARDED_BY(_metricsMutex);
+  // A batch is being written that moves suffixes from the hot part into pages.
+  bool _suffixesMove TL_GUARDED_BY(_metricsMutex) = false;
 
-  platform::Mutex _writeMutex TL_ACQUIRED_BEFORE(_metricsMutex);
+  // Fair, so that a merge, which comes more seldom, gets its turn.
+  mutable platform::FairMutex _commitMutex TL_ACQUIRED_BEFORE(_metricsMutex);
+
+  platform::Mutex _writeMutex TL_ACQUIRED_BEFORE(_commitMutex);
   // Kept for their memory.
   std::optional<leveldb::WriteBatch> _batch TL_GUARDED_BY(_writeMutex);
   std::string _key TL_GUARDED_BY(_writeMutex);
@@ -200,6 +219,24 @@ class index final : public Index {
   mutable SuffixStarts _starts;  // synchronised by itself; last, since its thread reads the index
 };
 
+template <typename Change>
+bool index::commit(leveldb::WriteBatch* batch, bool movesSuffixes, const Change& change) {
+  MetricsBlock before;
+  {
+    platform::MutexLock lock(_metricsMutex);
+    before = metrics;
+    change(static_cast<MetricsBlock&>(metrics));
+    putMetrics(batch);
+    if (movesSuffixes) ++_pageGeneration;
+    _suffixesMove = movesSuffixes;
+  }
+  const bool written = write(batch);
+  platform::MutexLock lock(_metricsMutex);
+  _suffixesMove = false;
+  if (!written) restore(before);
+  return written;
+}
+
 // What every reader works from: one walk over the database or several, the metrics and the set of
 // deleted documents, all of the same moment. One thread, save that each walk may be another's; the
 // index outlives it.
@@ -212,8 +249,10 @@ class index final : public Index {
 // suffix reads the same.
 class IndexView {
  public:
-  // With `fillCache` false the reads do not displace the block cache. There are `walks` iterators,
-  // for as many threads.
+  // For scans, which fill the block cache: there are `walks` iterators, for as many threads, or one
+  // while suffixes move, since another could be of the moment behind the batch.
+  // With `fillCache` false the reads do not displace the block cache, and the view is of a moment
+  // between batches, for which it waits.
   IndexView(const index& owner, bool fillCache, size_t walks = 1);
   IndexView(const IndexView&) = delete;
   IndexView& operator=(const IndexView&) = delete;
@@ -226,7 +265,10 @@ class IndexView {
   std::vector<std::unique_ptr<leveldb::Iterator>> iterators;  // none is null
   Index::Metrics metrics;
   std::shared_ptr<const DocSet> deleted;
-  uint64_t pageGeneration = 0;
+  uint64_t pageGeneration = 0;  // 0 where it cannot be told
+
+ private:
+  void take(size_t walks);
 };
 
 }  // namespace salt

@@ -140,7 +140,7 @@ std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::
     }
     counts[number] = probe.counts;
   };
-  if (byShard.size() <= kFewShards) {
+  if (byShard.size() <= kFewShards || view.iterators.size() == 1) {
     walk(0);
   } else {
     _scanHelper.share(walk);

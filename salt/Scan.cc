@@ -201,7 +201,7 @@ std::optional<uint64_t> index::ScanPlaces(
   const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
   if (most > limit) return std::nullopt;
   PlacesScan scan(view, prefix, !known);
-  if (scan.shards() <= kFewShards) {
+  if (scan.shards() <= kFewShards || view.iterators.size() == 1) {
     scan.walk(0);
   } else {
     _scanHelper.share([&scan](size_t walk) { scan.walk(walk); });
@@ -216,7 +216,9 @@ std::optional<uint64_t> index::ScanPlaces(
   } else {
     found.pages.deliver(callback);
     counts.results += found.pages.suffixes();
-    if (found.complete && !view.metrics.VacuumInProgress) remember(prefix, view, found.pages);
+    if (found.complete && view.pageGeneration != 0 && !view.metrics.VacuumInProgress) {
+      remember(prefix, view, found.pages);
+    }
   }
   countScan(start, counts);
   return counts.results;

@@ -26,30 +26,35 @@ void index::Vacuum() {
 }
 
 std::optional<uint8_t> index::beginVacuum() {
-  platform::MutexLock lock(_metricsMutex);
-  if (metrics.VacuumInProgress || metrics.HotSuffixes < op.MaxHotSuffixes / 2) return std::nullopt;
-  if (op.MaxPageSuffixes == 0) return std::nullopt;  // no page could hold anything
-  const MetricsBlock undo = metrics;
-  metrics.VacuumInProgress = true;
-  const uint8_t shard = chooseShard();
-  metrics.LastShardVacuumed = shard;
+  platform::MutexLock lock(_commitMutex);
+  if (!vacuumIsDue()) return std::nullopt;
+  uint8_t shard = 0;
   leveldb::WriteBatch batch;
-  if (writeMetrics(&batch)) return shard;
-  static_cast<MetricsBlock&>(metrics) = undo;
-  return std::nullopt;
+  const bool written = commit(&batch, false, [&](MetricsBlock& counters) {
+    counters.VacuumInProgress = true;
+    shard = chooseShard(counters);
+    counters.LastShardVacuumed = shard;
+  });
+  return written ? std::optional(shard) : std::nullopt;
+}
+
+bool index::vacuumIsDue() const {
+  if (op.MaxPageSuffixes == 0) return false;  // no page could hold anything
+  platform::MutexLock lock(_metricsMutex);
+  return !metrics.VacuumInProgress && metrics.HotSuffixes >= op.MaxHotSuffixes / 2;
 }
 
 // The newest until it is full, then a new one; when all are there, they take turns.
-uint8_t index::chooseShard() {
-  if (metrics.Shards == 0 || metrics.LastShardSuffixes >= op.MaxShardSuffixes) {
-    if (metrics.Shards >= std::min<uint64_t>(op.MaxShards, kMaxShardNumber)) {
-      const uint64_t next = metrics.LastShardVacuumed + 1;
-      return static_cast<uint8_t>(next > metrics.Shards ? 1 : next);
+uint8_t index::chooseShard(MetricsBlock& counters) const {
+  if (counters.Shards == 0 || counters.LastShardSuffixes >= op.MaxShardSuffixes) {
+    if (counters.Shards >= std::min<uint64_t>(op.MaxShards, kMaxShardNumber)) {
+      const uint64_t next = counters.LastShardVacuumed + 1;
+      return static_cast<uint8_t>(next > counters.Shards ? 1 : next);
     }
-    ++metrics.Shards;
-    metrics.LastShardSuffixes = 0;
+    ++counters.Shards;
+    counters.LastShardSuffixes = 0;
   }
-  return static_cast<uint8_t>(metrics.Shards);
+  return static_cast<uint8_t>(counters.Shards);
 }
 
 void index::startMerge(uint8_t shard) {
@@ -58,6 +63,7 @@ void index::startMerge(uint8_t shard) {
   try {
     _mergeThread = std::thread([this, shard] { runMerge(shard); });
   } catch (const std::system_error&) {
+    platform::MutexLock commitLock(_commitMutex);
     platform::MutexLock metricsLock(_metricsMutex);
     metrics.VacuumInProgress = false;
     throw;
@@ -75,12 +81,16 @@ void index::runMerge(uint8_t shard) {
     compactHotPart();
   }
   const std::chrono::duration<double> elapsed = Clock::now() - start;
-  platform::MutexLock lock(_metricsMutex);
-  metrics.VacuumInProgress = false;
-  metrics.Vacuums += 1;
-  metrics.VacuumSeconds += elapsed.count();
+  const auto finish = [&elapsed](MetricsBlock& counters) {
+    counters.VacuumInProgress = false;
+    counters.Vacuums += 1;
+    counters.VacuumSeconds += elapsed.count();
+  };
+  platform::MutexLock lock(_commitMutex);
   leveldb::WriteBatch batch;
-  (void)writeMetrics(&batch);
+  if (commit(&batch, false, finish)) return;
+  platform::MutexLock metricsLock(_metricsMutex);
+  finish(metrics);
 }
 
 // A merge leaves a removed key for each suffix that was hot, and a seek walks over them up to the
@@ -98,15 +108,12 @@ void index::compactHotPart() {
 }
 
 bool index::commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta) {
-  platform::MutexLock lock(_metricsMutex);
-  const MetricsBlock undo = metrics;
-  if (metrics.LastShardVacuumed == metrics.Shards) metrics.LastShardSuffixes += hotMerged;
-  metrics.HotSuffixes -= std::min(hotMerged, metrics.HotSuffixes);
-  metrics.Pages += static_cast<uint64_t>(pageDelta);
-  ++_pageGeneration;
-  const bool written = writeMetrics(batch);
-  if (!written) static_cast<MetricsBlock&>(metrics) = undo;
-  return written;
+  platform::MutexLock lock(_commitMutex);
+  return commit(batch, true, [&](MetricsBlock& counters) {
+    if (counters.LastShardVacuumed == counters.Shards) counters.LastShardSuffixes += hotMerged;
+    counters.HotSuffixes -= std::min(hotMerged, counters.HotSuffixes);
+    counters.Pages += static_cast<uint64_t>(pageDelta);
+  });
 }
 
 }  // namespace salt
