@@ -1,0 +1,137 @@
+#include <gtest/gtest.h>
+#include <leveldb/env.h>
+
+#include <algorithm>
+#include <condition_variable>
+#include <thread>
+
+#include "platform/Mutex.h"
+#include "salt/IndexImpl.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/TemporaryDirectory.h"
+
+// A disk that takes its time over a batch.
+namespace {
+
+using salt::Index;
+using salttest::addZone;
+
+// Whose logs can be held up: who writes a record waits until they go on.
+class SlowDisk final : public leveldb::EnvWrapper {
+ public:
+  SlowDisk() : leveldb::EnvWrapper(leveldb::Env::Default()) {}
+
+  // From the record on that follows so many others.
+  void holdUpAfter(int records) {
+    platform::MutexLock lock(_mutex);
+    _heldUp = true;
+    _pass = records;
+  }
+  void goOn() {
+    platform::MutexLock lock(_mutex);
+    _heldUp = _waiting = false;
+    _changed.notify_all();
+  }
+  // Returns when somebody waits.
+  void waitForWriter() {
+    platform::MutexLock lock(_mutex);
+    while (!_waiting) _changed.wait(_mutex);
+  }
+
+  leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override {
+    return wrap(path, target()->NewWritableFile(path, file), file);
+  }
+  leveldb::Status NewAppendableFile(const std::string& path,
+                                    leveldb::WritableFile** file) override {
+    return wrap(path, target()->NewAppendableFile(path, file), file);
+  }
+
+ private:
+  class Log final : public leveldb::WritableFile {
+   public:
+    Log(SlowDisk* disk, leveldb::WritableFile* file) : _disk(*disk), _file(file) {}
+    leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
+    leveldb::Status Close() override { return _file->Close(); }
+    leveldb::Status Flush() override {
+      _disk.pass();
+      return _file->Flush();
+    }
+    leveldb::Status Sync() override { return _file->Sync(); }
+
+   private:
+    SlowDisk& _disk;
+    const std::unique_ptr<leveldb::WritableFile> _file;
+  };
+
+  leveldb::Status wrap(const std::string& path, const leveldb::Status& status,
+                       leveldb::WritableFile** file) {
+    if (status.ok() && path.ends_with(".log")) *file = new Log(this, *file);
+    return status;
+  }
+  void pass() {
+    platform::MutexLock lock(_mutex);
+    if (!_heldUp || _pass-- > 0) return;
+    _waiting = true;
+    _changed.notify_all();
+    while (_heldUp) _changed.wait(_mutex);
+  }
+
+  platform::Mutex _mutex;
+  std::condition_variable_any _changed;
+  bool _heldUp TL_GUARDED_BY(_mutex) = false;
+  bool _waiting TL_GUARDED_BY(_mutex) = false;
+  int _pass TL_GUARDED_BY(_mutex) = 0;
+};
+
+std::vector<std::string> sortedScan(const Index& index) {
+  std::vector<std::string> found = salttest::scan(index, "");
+  std::sort(found.begin(), found.end());
+  return found;
+}
+
+std::optional<uint64_t> countOfPlaces(const Index& index) {
+  return index.ScanPlaces("a", 1000, [](const salt::Place*, size_t) {});
+}
+
+}  // namespace
+
+// Were a scan to wait for the write, this would wait for ever.
+TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
+  constexpr uint32_t kDocs = 20;
+  const testsupport::TemporaryDirectory directory;
+  Index::Options options;
+  options.MaxHotSuffixes = 2 * kDocs;
+  options.MaxPageSuffixes = 3;
+  {
+    const auto index = salttest::newIndex(directory / "i", options);
+    for (uint32_t docID = 1; docID < kDocs; ++docID) {
+      ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
+    }
+  }
+  SlowDisk disk;
+  auto index =
+      salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
+  ASSERT_NE(index, nullptr);
+
+  disk.holdUpAfter(0);
+  std::thread adding([&index] { EXPECT_TRUE(addZone(*index, kDocs, 1, "a b", {0, 2})); });
+  disk.waitForWriter();
+  EXPECT_EQ(sortedScan(*index).size(), 2 * (kDocs - 1));
+  EXPECT_EQ(countOfPlaces(*index), kDocs - 1);
+  disk.goOn();
+  adding.join();
+  const auto all = sortedScan(*index);
+  EXPECT_EQ(all.size(), 2 * kDocs);
+
+  disk.holdUpAfter(1);  // the mark of a merge passes, its pages do not
+  index->Vacuum();
+  disk.waitForWriter();
+  EXPECT_EQ(sortedScan(*index), all);
+  EXPECT_EQ(countOfPlaces(*index), kDocs);
+  disk.goOn();
+  while (index->GetMetrics().VacuumInProgress) std::this_thread::yield();
+  EXPECT_GT(index->GetMetrics().Pages, 0u);
+  EXPECT_EQ(sortedScan(*index), all);
+  EXPECT_EQ(countOfPlaces(*index), kDocs);
+  EXPECT_TRUE(index->Validate());
+}
