@@ -1,17 +1,17 @@
 #include <gtest/gtest.h>
 
-#include <future>
-
 #include "daemon/TALSearchService.h"
 #include "platform/Files.h"
 #include "platform/Signpost.h"
 #include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
 
-using Outcome = std::optional<TLError>;
+using testsupport::Outcome;
+using testsupport::outcomeOf;
 using Items = TALSearchService::Items;
 
 std::shared_ptr<TLIndexableItem> mail(const TLString& identifier, const TLString& subject) {
@@ -55,14 +55,8 @@ class SearchServiceTest : public testing::Test {
             [this](const std::string&) { return freeBytes; })) {}
   ~SearchServiceTest() override { service.shutdown(); }
 
-  template <typename Start>
-  static Outcome wait(const Start& start) {
-    std::promise<Outcome> promise;
-    start([&promise](const Outcome& outcome) { promise.set_value(outcome); });
-    return promise.get_future().get();
-  }
   Outcome index(Items items, const std::string& protectionClass = "default") {
-    return wait(
+    return outcomeOf(
         [&](auto reply) { service.indexItems(std::move(items), "test", protectionClass, reply); });
   }
   // Number of results, -1 after an error, which goes to `lastError`.
@@ -183,7 +177,7 @@ TEST_F(SearchServiceTest, OnAFullDiskAnOpenClassGoesOnAndNoOtherIsOpened) {
 }
 
 TEST_F(SearchServiceTest, StatisticsStateVacuumAndReset) {
-  ASSERT_EQ(wait([&](auto reply) {
+  ASSERT_EQ(outcomeOf([&](auto reply) {
               service.indexItems({mail(u"a", u"x")}, {}, "state", "client", "default", reply);
             }),
             std::nullopt);
@@ -199,18 +193,20 @@ TEST_F(SearchServiceTest, StatisticsStateVacuumAndReset) {
   service.fetchStatsForSaltNamed("n", "default",
                                  [&](const auto& value, const auto&) { metrics = *value; });
   EXPECT_NE(metrics.find("SALT INDEX METRICS\n"), std::string::npos);
-  EXPECT_EQ(
-      wait([&](auto reply) { service.forceVacuumAndCompactForProtectionClass("default", reply); }),
-      std::nullopt);
-  EXPECT_EQ(
-      wait([&](auto reply) { service.deleteItemsWithIdentifiers({u"a"}, "n", "default", reply); }),
-      std::nullopt);
-  EXPECT_EQ(wait([&](auto reply) {
+  EXPECT_EQ(outcomeOf([&](auto reply) {
+              service.forceVacuumAndCompactForProtectionClass("default", reply);
+            }),
+            std::nullopt);
+  EXPECT_EQ(outcomeOf([&](auto reply) {
+              service.deleteItemsWithIdentifiers({u"a"}, "n", "default", reply);
+            }),
+            std::nullopt);
+  EXPECT_EQ(outcomeOf([&](auto reply) {
               service.deleteItemsWithDomainIdentifiers({u"d"}, "n", "default", reply);
             }),
             std::nullopt);
   EXPECT_EQ(
-      wait([&](auto reply) { service.deleteAllItemsFromIndexerNamed("n", "default", reply); }),
+      outcomeOf([&](auto reply) { service.deleteAllItemsFromIndexerNamed("n", "default", reply); }),
       std::nullopt);
   std::string answer;
   service.ping("hello", [&](const std::string& text) { answer = text; });

@@ -1,12 +1,12 @@
 #include <gtest/gtest.h>
 
-#include <future>
 #include <set>
 
 #include "daemon/TALSearchService.h"
 #include "query/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
 
 // Verification queries from their text to the mails that are found.
@@ -44,10 +44,9 @@ class Verification : public testing::Test {
     items.push_back(std::move(item));
   }
   void index() {
-    std::promise<std::optional<TLError>> done;
-    service.indexItems(items, "test", "default",
-                       [&](const std::optional<TLError>& error) { done.set_value(error); });
-    ASSERT_EQ(done.get_future().get(), std::nullopt);
+    ASSERT_EQ(testsupport::outcomeOf(
+                  [this](auto done) { service.indexItems(items, "test", "default", done); }),
+              std::nullopt);
   }
 
   static std::shared_ptr<TLQuery> queryFor(const std::vector<TLString>& subjects) {

@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
-#include <future>
 #include <random>
 #include <thread>
 
@@ -13,12 +12,14 @@
 #include "records/TLParamsManager.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
 
 using enum TLAttributeKey;
-using Outcome = std::optional<TLError>;
+using testsupport::Outcome;
+using testsupport::outcomeOf;
 
 std::shared_ptr<TLIndexableItem> mail(const std::string& identifier, const std::string& subject,
                                       const std::string& body = "", double date = 0) {
@@ -53,18 +54,12 @@ class IndexerTest : public testing::Test {
     open();
   }
 
-  // Calls an operation with a completion and waits for its outcome.
-  template <typename Start>
-  static Outcome wait(const Start& start) {
-    std::promise<Outcome> promise;
-    start([&promise](const Outcome& outcome) { promise.set_value(outcome); });
-    return promise.get_future().get();
-  }
   Outcome add(TALIndexer::Items items) {
-    return wait([&](auto done) { indexer->addDocs(std::move(items), "mail_bundle_id", done); });
+    return outcomeOf(
+        [&](auto done) { indexer->addDocs(std::move(items), "mail_bundle_id", done); });
   }
   Outcome remove(TALIndexer::Strings identifiers) {
-    return wait([&](auto done) {
+    return outcomeOf([&](auto done) {
       indexer->deleteItemsByIdentifiers(std::move(identifiers), "mail_bundle_id", done);
     });
   }
@@ -275,7 +270,7 @@ TEST_F(IndexerTest, DeletesByDomain) {
     items.back()->setDomainIdentifier(i % 2 == 0 ? u"even" : u"odd");
   }
   ASSERT_EQ(add(items), std::nullopt);
-  EXPECT_EQ(wait([&](auto done) {
+  EXPECT_EQ(outcomeOf([&](auto done) {
               indexer->deleteItemsByDomainIdentifiers({u"even", u"none"}, done);
             }),
             std::nullopt);
@@ -310,7 +305,7 @@ TEST_F(IndexerTest, AZoneTooLargeFailsTheRestOfTheBatchAndASecondTryHeals) {
 TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccess) {
   const auto combined = [&](TALIndexer::Items items, TALIndexer::Strings gone,
                             std::optional<std::string> state) {
-    return wait([&](auto done) {
+    return outcomeOf([&](auto done) {
       indexer->addDocs(std::move(items), std::move(gone), std::move(state), u"client",
                        "mail_bundle_id", done);
     });
@@ -331,13 +326,13 @@ TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccess) {
   EXPECT_EQ(combined({mail("b", "word")}, {u"a"}, std::nullopt), std::nullopt);
   EXPECT_EQ(search("word"), "b");
   EXPECT_EQ(fetch(u"client"), std::string("one\0two", 7));
-  EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+  EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
   EXPECT_EQ(fetch(u"client"), std::nullopt);
 }
 
 TEST_F(IndexerTest, AResetForgetsAllAndGoesOn) {
   ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
-  EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+  EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
   EXPECT_EQ(search("word"), "");
   ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
   EXPECT_EQ(search("word"), "b");
@@ -399,7 +394,7 @@ TEST_F(IndexerTest, AFileInPlaceOfTheIndexIsLeftAloneAndFailsWhatNeedsTheIndex) 
   EXPECT_TRUE(log.contains("error TALIndexer: Could not create intermediate directory " + salt));
   EXPECT_EQ(search("word"), "shutting down");
   EXPECT_EQ(add({mail("b", "word")}), (TLError{"TALIndexer", 1, "index failed"}));
-  EXPECT_EQ(wait([&](auto done) { indexer->saltVacuumAndCompactWithCompletionHandler(done); }),
+  EXPECT_EQ(outcomeOf([&](auto done) { indexer->saltVacuumAndCompactWithCompletionHandler(done); }),
             std::nullopt);
   EXPECT_TRUE(indexer->docStats().is_null());
   EXPECT_EQ(indexer->saltMetrics(), "");
@@ -471,8 +466,9 @@ TEST_F(IndexerTest, SearchesAndStatisticsRunBesideIngest) {
     ASSERT_EQ(add(items), std::nullopt);
     ASSERT_EQ(remove({u"0", u"5"}), std::nullopt);
     if (round == 10) {
-      ASSERT_EQ(wait([&](auto completion) { indexer->resetWithCompletionHandler(completion); }),
-                std::nullopt);
+      ASSERT_EQ(
+          outcomeOf([&](auto completion) { indexer->resetWithCompletionHandler(completion); }),
+          std::nullopt);
     }
   }
   done = true;

@@ -1,17 +1,18 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <future>
 
 #include "docstore/TALSqliteDocStore.h"
 #include "indexer/TALIndexer.h"
 #include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
 
-using Outcome = std::optional<TLError>;
+using testsupport::Outcome;
+using testsupport::outcomeOf;
 
 // Documents by which a vocabulary is due when there is none.
 constexpr int kDue = 51;
@@ -31,12 +32,6 @@ class IndexerVocabularyTest : public testing::Test {
     open();
   }
 
-  template <typename Start>
-  static Outcome wait(const Start& start) {
-    std::promise<Outcome> promise;
-    start([&promise](const Outcome& outcome) { promise.set_value(outcome); });
-    return promise.get_future().get();
-  }
   // Mail that is named by its subject.
   Outcome add(const std::vector<std::string>& subjects) {
     TALIndexer::Items items;
@@ -48,7 +43,8 @@ class IndexerVocabularyTest : public testing::Test {
       item->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, platform::fromUTF8(subject));
       items.push_back(std::move(item));
     }
-    return wait([&](auto done) { indexer->addDocs(std::move(items), "mail_bundle_id", done); });
+    return outcomeOf(
+        [&](auto done) { indexer->addDocs(std::move(items), "mail_bundle_id", done); });
   }
   Outcome addMany(int count) {
     std::vector<std::string> subjects;
@@ -61,7 +57,7 @@ class IndexerVocabularyTest : public testing::Test {
     EXPECT_EQ(rebuild(), std::nullopt);
   }
   Outcome rebuild() {
-    return wait([&](auto done) { indexer->forceRebuildTopKVocabWithCompletionHandler(done); });
+    return outcomeOf([&](auto done) { indexer->forceRebuildTopKVocabWithCompletionHandler(done); });
   }
   std::string search(const std::string& text, TLStringView overrides = u"") {
     TLQuery query;
@@ -127,7 +123,7 @@ TEST_F(IndexerVocabularyTest, IsBuiltDuringIngestAndSurvivesARestart) {
 
 TEST_F(IndexerVocabularyTest, AResetForgetsItAndGoesOn) {
   build();
-  EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+  EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
   EXPECT_TRUE(indexer->topKVocabulary()->empty());
   EXPECT_EQ(store->loadTopKVocab(nullptr), std::nullopt);
   build();
@@ -140,7 +136,8 @@ TEST_F(IndexerVocabularyTest, AResetOrShutdownDuringARebuildNeitherHangsNorReads
     for (int i = 0; i < 3; ++i) indexer->forceRebuildTopKVocabWithCompletionHandler(nullptr);
     std::thread searching([&] { static_cast<void>(search("comon")); });
     if (round % 2 == 0) {
-      EXPECT_EQ(wait([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+      EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }),
+                std::nullopt);
       searching.join();
     } else {
       searching.join();

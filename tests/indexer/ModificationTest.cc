@@ -8,6 +8,7 @@
 #include "platform/Files.h"
 #include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
@@ -20,11 +21,13 @@ class QueryModification : public testing::Test {
         platform::writeFileAtomically(synonyms, "bill,invoice\nshipping,invoice\n", nullptr));
     EXPECT_TRUE(store->openWithError(nullptr));
     indexer = std::make_unique<TALIndexer>(directory / "salt", "testing", store, synonyms);
-    std::promise<std::optional<TLError>> done;
-    indexer->addDocs({mail(u"a", u"your invoice of june"), mail(u"b", u"orders shipped in june"),
-                      mail(u"c", u"the billing address")},
-                     "bundle", [&done](const auto& error) { done.set_value(error); });
-    EXPECT_EQ(done.get_future().get(), std::nullopt);
+    EXPECT_EQ(testsupport::outcomeOf([this](auto done) {
+                indexer->addDocs(
+                    {mail(u"a", u"your invoice of june"), mail(u"b", u"orders shipped in june"),
+                     mail(u"c", u"the billing address")},
+                    "bundle", done);
+              }),
+              std::nullopt);
     log.clear();
   }
   ~QueryModification() override { indexer->shutdown(); }

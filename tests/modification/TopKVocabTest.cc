@@ -1,7 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <future>
 #include <latch>
 #include <random>
 
@@ -11,6 +10,7 @@
 #include "platform/Clock.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Outcome.h"
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -18,7 +18,8 @@ using testing::ElementsAre;
 
 namespace {
 
-using Outcome = std::optional<TLError>;
+using testsupport::Outcome;
+using testsupport::outcomeOf;
 using Words = TALTopKVocab::Words;
 
 // An index of a hundred zones, whose walks call a function at each.
@@ -70,10 +71,8 @@ class TopKVocabTest : public testing::Test {
   TopKVocabTest() { EXPECT_TRUE(store->openWithError(nullptr)); }
 
   static Outcome rebuild(TALTopKVocab& vocab) {
-    std::promise<Outcome> promise;
-    vocab.checkAndRebuildTopKVocabWithCompletionHandler(
-        [&](const Outcome& outcome) { promise.set_value(outcome); }, true);
-    return promise.get_future().get();
+    return outcomeOf(
+        [&vocab](auto done) { vocab.checkAndRebuildTopKVocabWithCompletionHandler(done, true); });
   }
 
   // What loading gives for a stored blob: an object, its error, and what it has then.

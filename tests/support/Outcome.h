@@ -1,0 +1,22 @@
+#pragma once
+
+#include <future>
+#include <optional>
+
+#include "platform/TLError.h"
+
+namespace testsupport {
+
+// No value is success.
+using Outcome = std::optional<TLError>;
+
+// Calls start(completion), which starts an operation that completes on whatever thread, and waits
+// for its outcome.
+template <typename Start>
+Outcome outcomeOf(const Start& start) {
+  std::promise<Outcome> promise;
+  start([&promise](const Outcome& outcome) { promise.set_value(outcome); });
+  return promise.get_future().get();
+}
+
+}  // namespace testsupport
