@@ -22,9 +22,6 @@ constexpr int64_t kEnoughDocs = 2001;  // on their own
 constexpr float kGrowth = 0.5F;        // of the documents there were before
 constexpr float kOldSeconds = 432000;  // 5 days
 
-// How many times as long as a count took, in processor time, the next one rests.
-constexpr int kRest = 9;
-
 TLError damaged(const char* what) {
   return {kErrorDomain, kDamagedArchive, std::string("the stored vocabulary has no ") + what};
 }
@@ -47,9 +44,11 @@ const platform::Log& TALTopKVocab::log() {
   return handle;
 }
 
-TALTopKVocab::TALTopKVocab(std::shared_ptr<TALDocStore> docStore, const salt::Index* textStore)
+TALTopKVocab::TALTopKVocab(std::shared_ptr<TALDocStore> docStore, const salt::Index* textStore,
+                           int rest)
     : _docStore(std::move(docStore)),
       _textStore(textStore),
+      _rest(rest),
       _lastTopKRebuildDate(platform::secondsSince1970()),
       _vocab(std::make_shared<const Words>()) {
   if (_docStore == nullptr || _textStore == nullptr) return;
@@ -212,7 +211,7 @@ void TALTopKVocab::count() {
   setVocab(std::move(words));
   const auto taken = platform::threadProcessorTime() - start;
   MutexLock lock(_restMutex);
-  _restUntil = std::chrono::steady_clock::now() + kRest * taken;
+  _restUntil = std::chrono::steady_clock::now() + _rest * taken;
 }
 
 std::optional<TLError> TALTopKVocab::store(const std::string& blob) {

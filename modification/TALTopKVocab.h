@@ -30,9 +30,12 @@ class TALTopKVocab {
   using Completion = std::function<void(const std::optional<TLError>&)>;
 
   static constexpr size_t kWords = 5000;
+  static constexpr int kRest = 9;
 
-  // Loads what the store has. Without store or index there are no words, ever.
-  TALTopKVocab(std::shared_ptr<TALDocStore> docStore, const salt::Index* textStore);
+  // Loads what the store has. Without store or index there are no words, ever. A rebuild that
+  // nobody asks for rests for `rest` times the processor time of the last count.
+  TALTopKVocab(std::shared_ptr<TALDocStore> docStore, const salt::Index* textStore,
+               int rest = kRest);
   ~TALTopKVocab();
   TALTopKVocab(const TALTopKVocab&) = delete;
   TALTopKVocab& operator=(const TALTopKVocab&) = delete;
@@ -73,8 +76,8 @@ class TALTopKVocab {
   // The same for one that nobody asked for: not while such a one waits, as it would have a whole
   // walk for nothing, and after a rest.
   void rebuildUnlessOneWaits();
-  // On the queue: waits until the last count is as long ago as makes counting a small part of all
-  // time, however fast documents come. Ends early for a rebuild that was asked for and at shutdown.
+  // On the queue: sees to it that counting stays a small part of all time, however fast documents
+  // come. Ends early for a rebuild that was asked for and at shutdown.
   void rest() TL_EXCLUDES(_restMutex);
   // The body of a rebuild, on the queue.
   std::optional<TLError> rebuild();
@@ -83,6 +86,7 @@ class TALTopKVocab {
 
   const std::shared_ptr<TALDocStore> _docStore;
   const salt::Index* const _textStore;
+  const int _rest;
   std::atomic<bool> _isShutdown{false};
   std::atomic<bool> _rebuildWaits{false};
   std::atomic<uint32_t> _maxDocID{0};

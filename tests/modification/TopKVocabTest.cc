@@ -251,19 +251,20 @@ TEST_F(TopKVocabTest, TruncatedOrChangedBlobsAreReadSoundly) {
   }
 }
 
-TEST_F(TopKVocabTest, OneThatIsAskedForEndsTheRestOfOneThatIsNot) {
+// It rests for hours, unless the rest is ended.
+TEST_F(TopKVocabTest, OneThatIsAskedForAndShutdownEndTheRestOfOneThatIsNot) {
+  constexpr int kForHours = 1000000000;
   WatchedIndex watched;
-  watched.atZone = [] {
-    const auto end = platform::threadProcessorTime() + std::chrono::milliseconds(1);
-    while (platform::threadProcessorTime() < end) continue;
-  };
-  TALTopKVocab vocab(store, &watched);
+  TALTopKVocab vocab(store, &watched, kForHours);
   EXPECT_EQ(rebuild(vocab), std::nullopt);
-  watched.atZone = [] {};
   vocab.setMaxDocID(2001);
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   EXPECT_EQ(watched.zones, 200);
   EXPECT_EQ(rebuild(vocab), std::nullopt);
+  EXPECT_EQ(watched.zones, 600);
+  vocab.setMaxDocID(5000);
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
+  vocab.shutdown();
   EXPECT_EQ(watched.zones, 600);
 }
 

@@ -1,6 +1,5 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <leveldb/env.h>
 
 #include <algorithm>
 #include <atomic>
@@ -8,6 +7,7 @@
 #include <set>
 
 #include "salt/IndexImpl.h"
+#include "tests/salt/FilesBetween.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
@@ -24,45 +24,30 @@ using testsupport::LogCapture;
 using testsupport::TemporaryDirectory;
 
 // A disk with so many bytes left. A write that does not fit is cut and fails, as on a real one.
-class FullDisk final : public leveldb::EnvWrapper {
+class FullDisk final : public salttest::FilesBetween {
  public:
-  FullDisk() : leveldb::EnvWrapper(leveldb::Env::Default()) {}
-
   void setBytesLeft(int64_t bytes) { _bytesLeft = bytes; }
   [[nodiscard]] int64_t bytesLeft() const { return _bytesLeft; }
 
-  leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override {
-    return wrap(target()->NewWritableFile(path, file), file);
-  }
-  leveldb::Status NewAppendableFile(const std::string& path,
-                                    leveldb::WritableFile** file) override {
-    return wrap(target()->NewAppendableFile(path, file), file);
-  }
-
  private:
-  class File final : public leveldb::WritableFile {
+  class File final : public salttest::FileBetween {
    public:
-    File(FullDisk* disk, leveldb::WritableFile* file) : _disk(disk), _file(file) {}
+    File(FullDisk* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
     leveldb::Status Append(const leveldb::Slice& data) override {
       const auto size = static_cast<int64_t>(data.size());
-      const int64_t left = std::max<int64_t>(_disk->_bytesLeft.fetch_sub(size), 0);
-      if (left >= size) return _file->Append(data);
-      static_cast<void>(_file->Append({data.data(), static_cast<size_t>(left)}));
-      static_cast<void>(_file->Flush());
+      const int64_t left = std::max<int64_t>(_disk._bytesLeft.fetch_sub(size), 0);
+      if (left >= size) return FileBetween::Append(data);
+      static_cast<void>(FileBetween::Append({data.data(), static_cast<size_t>(left)}));
+      static_cast<void>(Flush());
       return leveldb::Status::IOError("No space left on device");
     }
-    leveldb::Status Close() override { return _file->Close(); }
-    leveldb::Status Flush() override { return _file->Flush(); }
-    leveldb::Status Sync() override { return _file->Sync(); }
 
    private:
-    FullDisk* const _disk;
-    const std::unique_ptr<leveldb::WritableFile> _file;
+    FullDisk& _disk;
   };
 
-  leveldb::Status wrap(const leveldb::Status& status, leveldb::WritableFile** file) {
-    if (status.ok()) *file = new File(this, *file);
-    return status;
+  leveldb::WritableFile* between(const std::string&, leveldb::WritableFile* file) override {
+    return new File(this, file);
   }
 
   std::atomic<int64_t> _bytesLeft{INT64_MAX};

@@ -1,5 +1,4 @@
 #include <gtest/gtest.h>
-#include <leveldb/env.h>
 
 #include <atomic>
 #include <filesystem>
@@ -8,6 +7,7 @@
 
 #include "platform/Mutex.h"
 #include "salt/IndexImpl.h"
+#include "tests/salt/FilesBetween.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -20,7 +20,7 @@ using testsupport::TemporaryDirectory;
 // Knows how much of each file is sure to be on the disk, and takes pictures of the directory as it
 // would be found if the power went now: each time a file is gone, or a manifest has grown. A
 // manifest reaches the disk sooner than it must, a table not before it is synced.
-class Disk final : public leveldb::EnvWrapper {
+class Disk final : public salttest::FilesBetween {
  public:
   struct Picture {
     std::string path;
@@ -28,8 +28,7 @@ class Disk final : public leveldb::EnvWrapper {
     bool logsLost = false;      // logs are never synced; in every second picture they are empty
   };
 
-  explicit Disk(std::string pictures)
-      : leveldb::EnvWrapper(leveldb::Env::Default()), _directory(std::move(pictures)) {}
+  explicit Disk(std::string pictures) : _directory(std::move(pictures)) {}
 
   std::atomic<uint32_t> acknowledged{0};
 
@@ -38,13 +37,6 @@ class Disk final : public leveldb::EnvWrapper {
     return _pictures;
   }
 
-  leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override {
-    return wrap(path, target()->NewWritableFile(path, file), file);
-  }
-  leveldb::Status NewAppendableFile(const std::string& path,
-                                    leveldb::WritableFile** file) override {
-    return wrap(path, target()->NewAppendableFile(path, file), file);
-  }
   leveldb::Status RemoveFile(const std::string& path) override {
     const leveldb::Status status = target()->RemoveFile(path);
     platform::MutexLock lock(_mutex);
@@ -59,36 +51,31 @@ class Disk final : public leveldb::EnvWrapper {
   }
 
  private:
-  class File final : public leveldb::WritableFile {
+  class File final : public salttest::FileBetween {
    public:
     File(Disk* disk, std::string path, leveldb::WritableFile* file)
-        : _disk(*disk), _path(std::move(path)), _file(file) {}
+        : FileBetween(file), _disk(*disk), _path(std::move(path)) {}
 
-    leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
     leveldb::Status Flush() override {
-      const leveldb::Status status = _file->Flush();
+      const leveldb::Status status = FileBetween::Flush();
       if (_path.find("MANIFEST") != std::string::npos) _disk.manifestGrew(_path);
       return status;
     }
     leveldb::Status Sync() override {
-      const leveldb::Status status = _file->Sync();
+      const leveldb::Status status = FileBetween::Sync();
       _disk.synced(_path);
       return status;
     }
-    leveldb::Status Close() override { return _file->Close(); }
 
    private:
     Disk& _disk;
     const std::string _path;
-    const std::unique_ptr<leveldb::WritableFile> _file;
   };
 
-  leveldb::Status wrap(const std::string& path, const leveldb::Status& status,
-                       leveldb::WritableFile** file) {
+  leveldb::WritableFile* between(const std::string& path, leveldb::WritableFile* file) override {
     platform::MutexLock lock(_mutex);
     _synced.emplace(path, 0);
-    if (status.ok()) *file = new File(this, path, *file);
-    return status;
+    return new File(this, path, file);
   }
 
   void synced(const std::string& path) {

@@ -1,5 +1,4 @@
 #include <gtest/gtest.h>
-#include <leveldb/env.h>
 
 #include <algorithm>
 #include <condition_variable>
@@ -7,6 +6,7 @@
 
 #include "platform/Mutex.h"
 #include "salt/IndexImpl.h"
+#include "tests/salt/FilesBetween.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -17,10 +17,8 @@ using salt::Index;
 using salttest::addZone;
 
 // Whose logs can be held up: who writes a record waits until they go on.
-class SlowDisk final : public leveldb::EnvWrapper {
+class SlowDisk final : public salttest::FilesBetween {
  public:
-  SlowDisk() : leveldb::EnvWrapper(leveldb::Env::Default()) {}
-
   // From the record on that follows so many others.
   void holdUpAfter(int records) {
     platform::MutexLock lock(_mutex);
@@ -38,35 +36,21 @@ class SlowDisk final : public leveldb::EnvWrapper {
     while (!_waiting) _changed.wait(_mutex);
   }
 
-  leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override {
-    return wrap(path, target()->NewWritableFile(path, file), file);
-  }
-  leveldb::Status NewAppendableFile(const std::string& path,
-                                    leveldb::WritableFile** file) override {
-    return wrap(path, target()->NewAppendableFile(path, file), file);
-  }
-
  private:
-  class Log final : public leveldb::WritableFile {
+  class Log final : public salttest::FileBetween {
    public:
-    Log(SlowDisk* disk, leveldb::WritableFile* file) : _disk(*disk), _file(file) {}
-    leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
-    leveldb::Status Close() override { return _file->Close(); }
+    Log(SlowDisk* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
     leveldb::Status Flush() override {
       _disk.pass();
-      return _file->Flush();
+      return FileBetween::Flush();
     }
-    leveldb::Status Sync() override { return _file->Sync(); }
 
    private:
     SlowDisk& _disk;
-    const std::unique_ptr<leveldb::WritableFile> _file;
   };
 
-  leveldb::Status wrap(const std::string& path, const leveldb::Status& status,
-                       leveldb::WritableFile** file) {
-    if (status.ok() && path.ends_with(".log")) *file = new Log(this, *file);
-    return status;
+  leveldb::WritableFile* between(const std::string& path, leveldb::WritableFile* file) override {
+    return path.ends_with(".log") ? new Log(this, file) : file;
   }
   void pass() {
     platform::MutexLock lock(_mutex);

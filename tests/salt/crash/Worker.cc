@@ -7,6 +7,7 @@
 #include <variant>
 
 #include "platform/Assert.h"
+#include "platform/Files.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/salt/crash/Workload.h"
 
@@ -21,7 +22,7 @@ constexpr uint32_t kShortages = 25;    // the same for a shortage of space
 class FullDisk {
  public:
   FullDisk(const std::string& path, uint64_t room) : _ballast(ballastOf(path)) {
-    const uint64_t free = std::filesystem::space(_ballast.parent_path()).available;
+    const uint64_t free = platform::freeBytes(_ballast.parent_path());
     const int file = open(_ballast.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600);
     TL_ASSERT(file >= 0);
     static_cast<void>(
