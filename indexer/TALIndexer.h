@@ -169,6 +169,8 @@ class TALIndexer {
   static std::string clientStateKey(const TLString& name);
   static TLError _errorWithCode(TALIndexerError code, const char* message, TLErrorOut error);
 
+  // Waits while the text index wants nothing added. On `_queue`.
+  void holdBack() TL_EXCLUDES(_indexMutex);
   bool _addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
   bool makeDocURLs(const Items& docs, const std::string& bundleID, Batch& batch, TLErrorOut error);

@@ -66,6 +66,7 @@ void TALIndexer::addDocs(Items docs, std::string bundleID, Completion completion
       "addDocs",
       [this, docs = std::move(docs), bundleID = std::move(bundleID)] {
         std::optional<TLError> error;
+        holdBack();
         {
           MutexLock lock(_indexMutex);
           const uint64_t signpost = Signpost::identifierForObject(&docs);
@@ -107,6 +108,7 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
                                                     const TLString& clientStateName,
                                                     const std::string& bundleID) {
   std::optional<TLError> error;
+  if (!docs.empty()) holdBack();
   MutexLock lock(_indexMutex);
   if (!docs.empty()) {
     const uint64_t signpost = Signpost::identifierForObject(&docs);
@@ -121,6 +123,11 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
     docStore()->setMetadataValue(*clientState, clientStateKey(clientStateName), &error);
   }
   return error;
+}
+
+// Searches go on meanwhile.
+void TALIndexer::holdBack() {
+  if (_textStore != nullptr) _textStore->WaitWhileCompacting();
 }
 
 bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error) {

@@ -13,6 +13,7 @@ namespace {
 
 constexpr char kOptionsKey[] = "\xFFOPTIONS";
 constexpr char kMetricsKey[] = "\xFFMETRICS";
+constexpr std::chrono::seconds kLongestHoldBack{10};
 
 template <typename Record>
 leveldb::Status putRecord(leveldb::DB* db, const char* key, const Record& record) {
@@ -140,7 +141,25 @@ bool index::Sync() {
 }
 
 void index::Compact() {
-  compact(_database, nullptr, nullptr);
+  compactRange(nullptr, nullptr);
+}
+
+void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
+  {
+    platform::MutexLock lock(_compactionMutex);
+    ++_compactions;
+  }
+  compact(_database, begin, end);
+  platform::MutexLock lock(_compactionMutex);
+  if (--_compactions == 0) _compactionEnded.notify_all();
+}
+
+void index::WaitWhileCompacting() {
+  platform::MutexLock lock(_compactionMutex);
+  const auto deadline = Clock::now() + kLongestHoldBack;
+  while (_compactions > 0) {
+    if (_compactionEnded.wait_until(_compactionMutex, deadline) == std::cv_status::timeout) return;
+  }
 }
 
 Index::Metrics index::GetMetrics() const {

@@ -4,6 +4,7 @@
 #include <leveldb/write_batch.h>
 
 #include <chrono>
+#include <condition_variable>
 #include <memory>
 #include <optional>
 #include <string>
@@ -17,6 +18,7 @@
 #include "salt/Helper.h"
 #include "salt/Index.h"
 #include "salt/ScanMemory.h"
+#include "salt/ScanTraffic.h"
 #include "salt/SuffixStarts.h"
 
 namespace salt {
@@ -79,6 +81,7 @@ class index final : public Index {
       const std::function<void(const Place* places, size_t count)>& callback) const override;
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override;
+  void WaitWhileCompacting() override TL_EXCLUDES(_compactionMutex);
 
   // Whether ScanPrefixes leaves out what it need not look for.
   [[nodiscard]] bool knowsStarts() const { return _starts.complete(); }
@@ -106,6 +109,8 @@ class index final : public Index {
   // is logged.
   [[nodiscard]] bool commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta)
       TL_EXCLUDES(_commitMutex, _metricsMutex);
+
+  [[nodiscard]] ScanTraffic& scanTraffic() const { return _scanTraffic; }
 
  private:
   using Clock = std::chrono::steady_clock;
@@ -160,8 +165,10 @@ class index final : public Index {
   void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex, _commitMutex);
   // The body of the merge thread.
   void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
-  [[nodiscard]] bool hotPartIsSparse() const TL_EXCLUDES(_metricsMutex);
-  void compactHotPart();
+  [[nodiscard]] bool hotPartWantsCompaction() const TL_EXCLUDES(_metricsMutex);
+  // The keys from `begin` to `end`, while those who add a lot hold back.
+  void compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
+      TL_EXCLUDES(_compactionMutex);
 
   // False, with a log line, when the loaded counters cannot be those of a sound index.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
@@ -210,6 +217,12 @@ class index final : public Index {
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
   mutable ScanMemory _scanMemory;  // synchronised by itself, as is the next
   mutable Helper _scanHelper;
+  mutable ScanTraffic _scanTraffic;
+
+  // Those on demand that run.
+  platform::Mutex _compactionMutex;
+  std::condition_variable_any _compactionEnded;
+  int _compactions TL_GUARDED_BY(_compactionMutex) = 0;
 
   // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is
   // taken with no other held.

@@ -19,6 +19,7 @@ size_t commonPrefix(std::string_view left, std::string_view right, size_t from) 
 Merge::Merge(index& owner, uint8_t shard)
     : _idx(owner),
       _shard(shard),
+      _pace(owner.scanTraffic()),
       _oldView(owner, false),
       _hotView(owner, false),
       _zoneTexts(owner),
@@ -126,6 +127,7 @@ void Merge::flushPage(size_t count) {
   pageToValue(_pending.data(), count, &_value);
   putPage();
   ++_pageDelta;
+  _pace.giveWay();
   const auto taken = static_cast<ptrdiff_t>(count);
   _pending.erase(_pending.begin(), _pending.begin() + taken);
   std::rotate(_pendingTexts.begin(), _pendingTexts.begin() + taken, _pendingTexts.end());

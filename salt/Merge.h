@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "salt/IndexImpl.h"
+#include "salt/MergePace.h"
 #include "salt/Suffix.h"
 #include "salt/ZoneTexts.h"
 
@@ -50,6 +51,7 @@ class Merge {
 
   index& _idx;
   const uint8_t _shard;
+  MergePace _pace;
   const IndexView _oldView;
   const IndexView _hotView;
   ZoneTexts _zoneTexts;

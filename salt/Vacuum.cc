@@ -13,6 +13,12 @@ namespace {
 
 // A hot part below this part of the most it may hold is sparse.
 constexpr uint32_t kSparseHotPart = 16;
+// On the disk; a hot suffix takes some 16 bytes there, and a mark that removes one takes as much.
+constexpr uint64_t kManyHotBytes = 96 * 1024 * 1024;
+constexpr uint64_t kManyBytesASuffix = 64;
+
+const leveldb::Slice kHotBegin("\x00", 1);
+const leveldb::Slice kHotEnd("\x01", 1);
 
 }  // namespace
 
@@ -77,8 +83,8 @@ void index::runMerge(uint8_t shard) {
   platform::returnFreeMemory();
   if (op.CompactAfterVacuum) {
     Compact();
-  } else if (hotPartIsSparse()) {
-    compactHotPart();
+  } else if (hotPartWantsCompaction()) {
+    compactRange(&kHotBegin, &kHotEnd);
   }
   const std::chrono::duration<double> elapsed = Clock::now() - start;
   const auto finish = [&elapsed](MetricsBlock& counters) {
@@ -93,18 +99,24 @@ void index::runMerge(uint8_t shard) {
   finish(metrics);
 }
 
-// A merge leaves a removed key for each suffix that was hot, and a seek walks over them up to the
-// next one that lives. While mail comes in fast there is always one near, and leveldb, busy then,
-// soon drops the removed keys by itself.
-bool index::hotPartIsSparse() const {
-  platform::MutexLock lock(_metricsMutex);
-  return metrics.HotSuffixes < op.MaxHotSuffixes / kSparseHotPart;
-}
-
-void index::compactHotPart() {
-  const leveldb::Slice begin("\x00", 1);
-  const leveldb::Slice end("\x01", 1);
-  compact(_database, &begin, &end);
+// A merge leaves a mark for each suffix that was hot, and a seek walks over them up to the next
+// suffix that lives.
+//
+// While mail comes in fast there is always one near. But once leveldb has hot suffixes in a level
+// deep down, it keeps the marks that come in above them, merges these with all that follows, and
+// hardly ever gets to the level where they meet: the marks get more and more until most of its work
+// is theirs.
+bool index::hotPartWantsCompaction() const {
+  uint64_t hot = 0;
+  {
+    platform::MutexLock lock(_metricsMutex);
+    hot = metrics.HotSuffixes;
+  }
+  if (hot < op.MaxHotSuffixes / kSparseHotPart) return true;
+  const leveldb::Range range(kHotBegin, kHotEnd);
+  uint64_t bytes = 0;
+  db->GetApproximateSizes(&range, 1, &bytes);
+  return bytes > kManyHotBytes && bytes > kManyBytesASuffix * hot;
 }
 
 bool index::commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta) {
