@@ -30,7 +30,7 @@ class TALTopKVocab {
   using Completion = std::function<void(const std::optional<TLError>&)>;
 
   static constexpr size_t kWords = 5000;
-  static constexpr int kRest = 9;
+  static constexpr int kRest = 19;
 
   // Loads what the store has. Without store or index there are no words, ever. A rebuild that
   // nobody asks for rests for `rest` times the processor time of the last count.

@@ -37,8 +37,9 @@ class IndexFiles final : public leveldb::EnvWrapper {
   leveldb::Status RemoveFile(const std::string& path) override;
   void Schedule(void (*work)(void*), void* argument) override;
 
-  // These wait for what is still to reach the disk: the first makes a manifest the one that counts,
-  // the second lets others open the database.
+  // Waits for what is still to reach the disk. So do the next two: the first makes a manifest the
+  // one that counts, the second lets others open the database.
+  void waitForDisk();
   leveldb::Status RenameFile(const std::string& from, const std::string& to) override;
   leveldb::Status UnlockFile(leveldb::FileLock* lock) override;
 

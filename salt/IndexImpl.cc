@@ -142,6 +142,7 @@ bool index::Sync() {
 
 void index::Compact() {
   compactRange(nullptr, nullptr);
+  _database.files->waitForDisk();
 }
 
 void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
@@ -151,7 +152,20 @@ void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
   }
   compact(_database, begin, end);
   platform::MutexLock lock(_compactionMutex);
+  ++_compactionsEnded;
   if (--_compactions == 0) _compactionEnded.notify_all();
+}
+
+uint64_t index::compactionsEnded() const {
+  platform::MutexLock lock(_compactionMutex);
+  return _compactionsEnded;
+}
+
+// leveldb does so whenever it has written its memtable. That is all there is to compact behind the
+// last key.
+void index::removeObsoleteFiles() const {
+  const leveldb::Slice behind("\xFF\xFF", 2);
+  compact(_database, &behind, &behind);
 }
 
 void index::WaitWhileCompacting() {
@@ -213,13 +227,21 @@ void index::restore(const MetricsBlock& before) {
 }
 
 IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
-    : idx(owner), options(readOptions(fillCache)) {
+    : idx(owner), options(readOptions(fillCache)), _compactionsEnded(owner.compactionsEnded()) {
   if (fillCache) {
     take(walks);
   } else {
     platform::MutexLock lock(owner._commitMutex);
     take(walks);
   }
+}
+
+// A compaction on demand may be the last work for a long time, and removes nothing that a walk
+// reads when it ends. Scans are too short to matter.
+IndexView::~IndexView() {
+  iterators.clear();
+  if (options.fill_cache || idx.compactionsEnded() == _compactionsEnded) return;
+  idx.removeObsoleteFiles();
 }
 
 void IndexView::take(size_t walks) {

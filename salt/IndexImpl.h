@@ -169,6 +169,8 @@ class index final : public Index {
   // The keys from `begin` to `end`, while those who add a lot hold back.
   void compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
       TL_EXCLUDES(_compactionMutex);
+  [[nodiscard]] uint64_t compactionsEnded() const TL_EXCLUDES(_compactionMutex);
+  void removeObsoleteFiles() const;
 
   // False, with a log line, when the loaded counters cannot be those of a sound index.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
@@ -219,10 +221,11 @@ class index final : public Index {
   mutable Helper _scanHelper;
   mutable ScanTraffic _scanTraffic;
 
-  // Those on demand that run.
-  platform::Mutex _compactionMutex;
+  // Of compactions on demand: how many run, and how many have ended.
+  mutable platform::Mutex _compactionMutex;
   std::condition_variable_any _compactionEnded;
   int _compactions TL_GUARDED_BY(_compactionMutex) = 0;
+  uint64_t _compactionsEnded TL_GUARDED_BY(_compactionMutex) = 0;
 
   // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is
   // taken with no other held.
@@ -267,6 +270,8 @@ class IndexView {
   // With `fillCache` false the reads do not displace the block cache, and the view is of a moment
   // between batches, for which it waits.
   IndexView(const index& owner, bool fillCache, size_t walks = 1);
+  // Files that only a long walk has kept go with it.
+  ~IndexView();
   IndexView(const IndexView&) = delete;
   IndexView& operator=(const IndexView&) = delete;
 
@@ -282,6 +287,8 @@ class IndexView {
 
  private:
   void take(size_t walks);
+
+  uint64_t _compactionsEnded;
 };
 
 }  // namespace salt

@@ -14,7 +14,7 @@ namespace {
 // A hot part below this part of the most it may hold is sparse.
 constexpr uint32_t kSparseHotPart = 16;
 // On the disk; a hot suffix takes some 16 bytes there, and a mark that removes one takes as much.
-constexpr uint64_t kManyHotBytes = 96 * 1024 * 1024;
+constexpr uint64_t kManyHotBytes = 64 * 1024 * 1024;
 constexpr uint64_t kManyBytesASuffix = 64;
 
 const leveldb::Slice kHotBegin("\x00", 1);

@@ -1,6 +1,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <filesystem>
 
 #include "salt/Index.h"
@@ -213,6 +214,29 @@ TEST(ForEachZone, VisitsTextsInKeyOrderUntilToldToStop) {
   seen.assign(5, "");
   index->ForEachZone(visit);
   EXPECT_EQ(seen.size(), 6u);
+}
+
+TEST(Compact, WhatAWalkStillReadGoesWhenItEnds) {
+  const TemporaryDirectory directory;
+  const auto tablesLeft = [&directory](const char* name, bool walking) {
+    auto index = newIndex(directory / name);
+    EXPECT_TRUE(addZone(*index, 1, 1, "one text"));
+    index->Compact();
+    EXPECT_TRUE(addZone(*index, 2, 1, "another text"));
+    if (walking) {
+      index->ForEachZone([&index](auto...) {
+        index->Compact();
+        return false;
+      });
+    } else {
+      index->Compact();
+    }
+    index.reset();
+    const std::filesystem::directory_iterator files(directory / name);
+    return std::count_if(begin(files), end(files),
+                         [](const auto& file) { return file.path().extension() == ".ldb"; });
+  };
+  EXPECT_EQ(tablesLeft("walked", true), tablesLeft("not walked", false));
 }
 
 TEST(Open, NewIndexWipesAndOptionsComeFromTheDatabase) {

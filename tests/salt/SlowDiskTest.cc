@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <atomic>
 #include <condition_variable>
 #include <thread>
 
@@ -10,20 +11,22 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// A disk that takes its time over a batch.
+// A disk that takes its time.
 namespace {
 
 using salt::Index;
 using salttest::addZone;
 
-// Whose logs can be held up: who writes a record waits until they go on.
+// Where files of one kind can be held up: who writes to one waits until they go on.
 class SlowDisk final : public salttest::FilesBetween {
  public:
-  // From the record on that follows so many others.
-  void holdUpAfter(int records) {
+  explicit SlowDisk(std::string suffix) : _suffix(std::move(suffix)) {}
+
+  // From the write on that follows so many others; a record of a log is two.
+  void holdUpAfter(int writes) {
     platform::MutexLock lock(_mutex);
     _heldUp = true;
-    _pass = records;
+    _pass = writes;
   }
   void goOn() {
     platform::MutexLock lock(_mutex);
@@ -37,12 +40,12 @@ class SlowDisk final : public salttest::FilesBetween {
   }
 
  private:
-  class Log final : public salttest::FileBetween {
+  class SlowFile final : public salttest::FileBetween {
    public:
-    Log(SlowDisk* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
-    leveldb::Status Flush() override {
+    SlowFile(SlowDisk* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
+    leveldb::Status Append(const leveldb::Slice& bytes) override {
       _disk.pass();
-      return FileBetween::Flush();
+      return FileBetween::Append(bytes);
     }
 
    private:
@@ -50,7 +53,7 @@ class SlowDisk final : public salttest::FilesBetween {
   };
 
   leveldb::WritableFile* between(const std::string& path, leveldb::WritableFile* file) override {
-    return path.ends_with(".log") ? new Log(this, file) : file;
+    return path.ends_with(_suffix) ? new SlowFile(this, file) : file;
   }
   void pass() {
     platform::MutexLock lock(_mutex);
@@ -60,6 +63,7 @@ class SlowDisk final : public salttest::FilesBetween {
     while (_heldUp) _changed.wait(_mutex);
   }
 
+  const std::string _suffix;
   platform::Mutex _mutex;
   std::condition_variable_any _changed;
   bool _heldUp TL_GUARDED_BY(_mutex) = false;
@@ -92,7 +96,7 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
       ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
     }
   }
-  SlowDisk disk;
+  SlowDisk disk(".log");
   auto index =
       salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
   ASSERT_NE(index, nullptr);
@@ -107,7 +111,7 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   const auto all = sortedScan(*index);
   EXPECT_EQ(all.size(), 2 * kDocs);
 
-  disk.holdUpAfter(1);  // the mark of a merge passes, its pages do not
+  disk.holdUpAfter(2);  // the mark of a merge passes, its pages do not
   index->Vacuum();
   disk.waitForWriter();
   EXPECT_EQ(sortedScan(*index), all);
@@ -118,4 +122,33 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   EXPECT_EQ(sortedScan(*index), all);
   EXPECT_EQ(countOfPlaces(*index), kDocs);
   EXPECT_TRUE(index->Validate());
+}
+
+// Were nobody to wait, `goesOn` would be false; were the end of it not told, this would take ten
+// seconds.
+TEST(SlowDisk, WhoAddsALotHoldsBackWhileTheIndexCompacts) {
+  const testsupport::TemporaryDirectory directory;
+  ASSERT_NE(salttest::newIndex(directory / "i"), nullptr);
+  SlowDisk disk(".ldb");
+  const auto index =
+      salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
+  ASSERT_NE(index, nullptr);
+  index->WaitWhileCompacting();  // for nothing
+  ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
+
+  disk.holdUpAfter(0);
+  std::thread compacting([&index] { index->Compact(); });
+  disk.waitForWriter();
+  std::atomic<bool> holdsBack = false;
+  std::atomic<bool> goesOn = false;
+  std::thread releasing([&] {
+    while (!holdsBack) std::this_thread::yield();
+    goesOn = true;
+    disk.goOn();
+  });
+  holdsBack = true;
+  index->WaitWhileCompacting();
+  EXPECT_TRUE(goesOn);
+  releasing.join();
+  compacting.join();
 }

@@ -143,6 +143,24 @@ TEST(Vacuum, ScansAndAddsGoOnBesideMerges) {
 }
 
 // With the first batch of a merge or a later one, into a new shard or into one with pages.
+// The merge is long enough to give way more than once.
+TEST(Vacuum, EndsWhileAScanGoesOn) {
+  constexpr uint32_t kDocs = 4000;
+  const TemporaryDirectory directory;
+  const auto index = newIndex(directory / "index", smallOptions(5 * kDocs));
+  for (uint32_t docID = 1; docID <= kDocs; ++docID) {
+    ASSERT_TRUE(addZone(*index, docID, 1, kText, kOffsets));
+  }
+  bool vacuumed = false;
+  index->ScanPrefix("two", [&](const auto&) {
+    vacuum(*index);
+    vacuumed = true;
+    return false;
+  });
+  EXPECT_TRUE(vacuumed);
+  EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
+}
+
 TEST(Vacuum, AFailedWriteEndsAMergeAndLosesNothing) {
   for (const uint64_t room : {400u, 3000u, 400u + 1, 3000u + 1}) {
     const TemporaryDirectory directory;
