@@ -21,18 +21,20 @@ TEST(ScanTraffic, WhoWaitsGoesOnBehindTheLastScan) {
   traffic.waitForEnd(hours(1));
   std::optional<ScanTraffic::Scan> first(std::in_place, traffic);
   std::optional<ScanTraffic::Scan> second(std::in_place, traffic);
-  std::atomic<int> ended = 0;
-  std::thread waiting([&] {
-    traffic.waitForEnd(hours(1));
-    EXPECT_EQ(ended, 2);
+  std::atomic<bool> waiting = false;
+  std::atomic<bool> last = false;
+  std::thread scans([&] {
+    while (!waiting) std::this_thread::yield();
+    first.reset();
+    EXPECT_TRUE(traffic.any());
+    last = true;
+    second.reset();
   });
-  ended = 1;
-  first.reset();
-  EXPECT_TRUE(traffic.any());
-  ended = 2;
-  second.reset();
-  waiting.join();
+  waiting = true;
+  traffic.waitForEnd(hours(1));
+  EXPECT_TRUE(last);
   EXPECT_FALSE(traffic.any());
+  scans.join();
 }
 
 TEST(ScanTraffic, NobodyWaitsLongerThanTheyWant) {
