@@ -32,14 +32,14 @@ struct SuffixMeta {
   explicit operator std::string() const;
 };
 
-// Threads: all operations may run on any threads at once. Readers work from a snapshot and block
-// nobody; what is added or deleted while one runs does not change what it sees.
 // Where a suffix stands, but for its offset.
 struct Place {
   uint32_t DocID = 0;
   uint16_t ZoneID = 0;
 };
 
+// Threads: all operations may run on any threads at once. Readers work from a snapshot and block
+// nobody; what is added or deleted while one runs does not change what it sees.
 class Index {
  public:
   // The members of the stream, in its layout: 40 bytes, little-endian.
