@@ -69,11 +69,13 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
 Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* files) {
   Database result;
   result.path = path;
+  result.order = std::make_unique<KeyOrder>();
   result.logger = std::make_unique<LeveldbLogger>();
   result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
   result.files = std::make_unique<IndexFiles>(files);
   leveldb::Options options;
   options.env = result.files.get();
+  options.comparator = result.order.get();
   options.write_buffer_size = kWriteBufferBytes;
   options.block_cache = result.cache.get();
   options.block_size = kBlockBytes;

@@ -12,6 +12,7 @@
 #include "platform/Log.h"
 #include "platform/Mutex.h"
 #include "salt/IndexFiles.h"
+#include "salt/KeyOrder.h"
 
 namespace salt {
 
@@ -24,10 +25,11 @@ class LeveldbLogger final : public leveldb::Logger {
 };
 
 // An open database with what it needs to live; goes down in the order database, cache, logger,
-// files.
+// order, files.
 struct Database {
   std::string path;
   std::unique_ptr<IndexFiles> files;
+  std::unique_ptr<KeyOrder> order;
   std::unique_ptr<leveldb::Logger> logger;
   std::unique_ptr<leveldb::Cache> cache;
   std::unique_ptr<leveldb::DB> db;  // null when opening failed

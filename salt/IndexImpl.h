@@ -165,6 +165,8 @@ class index final : public Index {
   void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex, _commitMutex);
   // The body of the merge thread.
   void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
+  void waitForMore() const TL_EXCLUDES(_metricsMutex);
+  [[nodiscard]] uint64_t hotSuffixes() const TL_EXCLUDES(_metricsMutex);
   [[nodiscard]] bool hotPartWantsCompaction() const TL_EXCLUDES(_metricsMutex);
   // The keys from `begin` to `end`, while those who add a lot hold back.
   void compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)

@@ -14,8 +14,16 @@ namespace {
 // A hot part below this part of the most it may hold is sparse.
 constexpr uint32_t kSparseHotPart = 16;
 // On the disk; a hot suffix takes some 16 bytes there, and a mark that removes one takes as much.
-constexpr uint64_t kManyHotBytes = 64 * 1024 * 1024;
+constexpr uint64_t kManyHotBytes = 96 * 1024 * 1024;
 constexpr uint64_t kManyBytesASuffix = 64;
+
+// A merge waits for a hot part of so many times MaxHotSuffixes, if that many suffixes come in, and
+// no longer than this.
+constexpr uint32_t kWorthwhile = 2;
+constexpr uint32_t kLeastWorthwhile = 100000;  // MaxHotSuffixes
+constexpr std::chrono::milliseconds kInterval{20};
+constexpr uint64_t kPouring = 1000;  // suffixes an interval, two to three mails
+constexpr std::chrono::seconds kLongestWait{5};
 
 const leveldb::Slice kHotBegin("\x00", 1);
 const leveldb::Slice kHotEnd("\x01", 1);
@@ -78,6 +86,7 @@ void index::startMerge(uint8_t shard) {
 
 void index::runMerge(uint8_t shard) {
   platform::setThreadName("tallow-merge");
+  waitForMore();
   const auto start = Clock::now();
   Merge(*this, shard).run();
   platform::returnFreeMemory();
@@ -99,6 +108,24 @@ void index::runMerge(uint8_t shard) {
   finish(metrics);
 }
 
+// Each merge rewrites its whole shard, so that while mail pours in fewer and larger ones cost less.
+void index::waitForMore() const {
+  if (op.MaxHotSuffixes < kLeastWorthwhile) return;
+  const auto deadline = Clock::now() + kLongestWait;
+  uint64_t before = hotSuffixes();
+  while (before < kWorthwhile * uint64_t{op.MaxHotSuffixes} && Clock::now() < deadline) {
+    std::this_thread::sleep_for(kInterval);
+    const uint64_t hot = hotSuffixes();
+    if (hot < before + kPouring) return;
+    before = hot;
+  }
+}
+
+uint64_t index::hotSuffixes() const {
+  platform::MutexLock lock(_metricsMutex);
+  return metrics.HotSuffixes;
+}
+
 // A merge leaves a mark for each suffix that was hot, and a seek walks over them up to the next
 // suffix that lives.
 //
@@ -107,11 +134,7 @@ void index::runMerge(uint8_t shard) {
 // hardly ever gets to the level where they meet: the marks get more and more until most of its work
 // is theirs.
 bool index::hotPartWantsCompaction() const {
-  uint64_t hot = 0;
-  {
-    platform::MutexLock lock(_metricsMutex);
-    hot = metrics.HotSuffixes;
-  }
+  const uint64_t hot = hotSuffixes();
   if (hot < op.MaxHotSuffixes / kSparseHotPart) return true;
   const leveldb::Range range(kHotBegin, kHotEnd);
   uint64_t bytes = 0;

@@ -8,7 +8,9 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
+#include "salt/KeyOrder.h"
 #include "tests/salt/Model.h"
+#include "tests/support/Seed.h"
 
 using salt::Index;
 using salt::SuffixMeta;
@@ -110,6 +112,27 @@ TEST(Keys, OnlyTextKeysParseAsSuch) {
                          "1,2"s,
                          &docID, &zoneID));
   EXPECT_FALSE(salt::parseTextKey("", &docID, &zoneID));
+}
+
+// An index written in one order and read in the other would be lost.
+TEST(Keys, SortAsLeveldbSortsThem) {
+  const salt::KeyOrder order;
+  const leveldb::Comparator& bytewise = *leveldb::BytewiseComparator();
+  EXPECT_STREQ(order.Name(), bytewise.Name());
+  const auto sign = [](int result) { return (result > 0) - (result < 0); };
+  std::mt19937 random(testsupport::firstSeed());
+  const std::string_view alphabet("\0a\x7F\x80\xFF", 5);
+  for (int round = 0; round < 20000; ++round) {
+    std::string left(random() % 20, 'x');
+    std::string right = left;  // in common, up to where the tails below begin
+    for (std::string* key : {&left, &right}) {
+      for (auto bytes = random() % 10; bytes > 0; --bytes) {
+        key->push_back(alphabet[random() % alphabet.size()]);
+      }
+    }
+    ASSERT_EQ(sign(order.Compare(left, right)), sign(bytewise.Compare(left, right)))
+        << testing::PrintToString(left) << testing::PrintToString(right);
+  }
 }
 
 TEST(SuffixMeta, SortsAsItsKeysDo) {
