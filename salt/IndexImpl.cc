@@ -227,7 +227,9 @@ void index::restore(const MetricsBlock& before) {
 }
 
 IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
-    : idx(owner), options(readOptions(fillCache)), _compactionsEnded(owner.compactionsEnded()) {
+    : idx(owner),
+      options(readOptions(fillCache)),
+      _compactionsEnded(fillCache ? 0 : owner.compactionsEnded()) {
   if (fillCache) {
     take(walks);
   } else {

@@ -290,7 +290,7 @@ class IndexView {
  private:
   void take(size_t walks);
 
-  uint64_t _compactionsEnded;
+  uint64_t _compactionsEnded;  // before; scans do not ask
 };
 
 }  // namespace salt

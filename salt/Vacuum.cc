@@ -17,12 +17,12 @@ constexpr uint32_t kSparseHotPart = 16;
 constexpr uint64_t kManyHotBytes = 96 * 1024 * 1024;
 constexpr uint64_t kManyBytesASuffix = 64;
 
-// A merge waits for a hot part of so many times MaxHotSuffixes, if that many suffixes come in, and
-// no longer than this.
+// While kPouring suffixes or more come in each interval, a merge waits until the hot part is
+// kWorthwhile times MaxHotSuffixes, unless that is small anyway.
 constexpr uint32_t kWorthwhile = 2;
-constexpr uint32_t kLeastWorthwhile = 100000;  // MaxHotSuffixes
+constexpr uint32_t kSmallHotPart = 100000;
 constexpr std::chrono::milliseconds kInterval{20};
-constexpr uint64_t kPouring = 1000;  // suffixes an interval, two to three mails
+constexpr uint64_t kPouring = 1000;  // two to three mails
 constexpr std::chrono::seconds kLongestWait{5};
 
 const leveldb::Slice kHotBegin("\x00", 1);
@@ -110,7 +110,7 @@ void index::runMerge(uint8_t shard) {
 
 // Each merge rewrites its whole shard, so that while mail pours in fewer and larger ones cost less.
 void index::waitForMore() const {
-  if (op.MaxHotSuffixes < kLeastWorthwhile) return;
+  if (op.MaxHotSuffixes < kSmallHotPart) return;
   const auto deadline = Clock::now() + kLongestWait;
   uint64_t before = hotSuffixes();
   while (before < kWorthwhile * uint64_t{op.MaxHotSuffixes} && Clock::now() < deadline) {
