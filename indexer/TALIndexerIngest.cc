@@ -127,7 +127,7 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
 
 // Searches go on meanwhile.
 void TALIndexer::holdBack() {
-  if (_textStore != nullptr) _textStore->WaitWhileCompacting();
+  if (_textStore != nullptr) _textStore->WaitWhileTidying();
 }
 
 bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error) {

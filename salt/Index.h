@@ -181,8 +181,9 @@ class Index {
       const std::vector<std::string>& prefixes, size_t limit) const = 0;
 
   // For those who add a lot, between two batches and holding nothing that a search needs: waits
-  // while the index compacts itself, which does not end while much is added; 10 seconds at most.
-  virtual void WaitWhileCompacting() = 0;
+  // while a merge or a compaction runs, which costs much more while much is added; 10 seconds at
+  // most.
+  virtual void WaitWhileTidying() = 0;
 };
 
 // Makes a new index in the directory `options.Path`; what was there is removed. Never null: a

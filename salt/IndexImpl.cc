@@ -13,7 +13,7 @@ namespace {
 
 constexpr char kOptionsKey[] = "\xFFOPTIONS";
 constexpr char kMetricsKey[] = "\xFFMETRICS";
-constexpr std::chrono::seconds kLongestHoldBack{10};
+constexpr std::chrono::seconds kLongestWait{10};
 
 template <typename Record>
 leveldb::Status putRecord(leveldb::DB* db, const char* key, const Record& record) {
@@ -141,24 +141,14 @@ bool index::Sync() {
 }
 
 void index::Compact() {
+  const Housekeeping::Work compaction(_housekeeping);
   compactRange(nullptr, nullptr);
   _database.files->waitForDisk();
 }
 
 void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
-  {
-    platform::MutexLock lock(_compactionMutex);
-    ++_compactions;
-  }
   compact(_database, begin, end);
-  platform::MutexLock lock(_compactionMutex);
   ++_compactionsEnded;
-  if (--_compactions == 0) _compactionEnded.notify_all();
-}
-
-uint64_t index::compactionsEnded() const {
-  platform::MutexLock lock(_compactionMutex);
-  return _compactionsEnded;
 }
 
 // leveldb does so whenever it has written its memtable. That is all there is to compact behind the
@@ -168,12 +158,8 @@ void index::removeObsoleteFiles() const {
   compact(_database, &behind, &behind);
 }
 
-void index::WaitWhileCompacting() {
-  platform::MutexLock lock(_compactionMutex);
-  const auto deadline = Clock::now() + kLongestHoldBack;
-  while (_compactions > 0) {
-    if (_compactionEnded.wait_until(_compactionMutex, deadline) == std::cv_status::timeout) return;
-  }
+void index::WaitWhileTidying() {
+  _housekeeping.waitForEnd(kLongestWait);
 }
 
 Index::Metrics index::GetMetrics() const {
@@ -229,7 +215,7 @@ void index::restore(const MetricsBlock& before) {
 IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
     : idx(owner),
       options(readOptions(fillCache)),
-      _compactionsEnded(fillCache ? 0 : owner.compactionsEnded()) {
+      _compactionsEnded(fillCache ? 0 : owner._compactionsEnded.load()) {
   if (fillCache) {
     take(walks);
   } else {
@@ -242,7 +228,7 @@ IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
 // reads when it ends. Scans are too short to matter.
 IndexView::~IndexView() {
   iterators.clear();
-  if (options.fill_cache || idx.compactionsEnded() == _compactionsEnded) return;
+  if (options.fill_cache || idx._compactionsEnded == _compactionsEnded) return;
   idx.removeObsoleteFiles();
 }
 

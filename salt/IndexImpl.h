@@ -3,8 +3,8 @@
 #include <leveldb/db.h>
 #include <leveldb/write_batch.h>
 
+#include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <memory>
 #include <optional>
 #include <string>
@@ -16,6 +16,7 @@
 #include "salt/Database.h"
 #include "salt/DocSet.h"
 #include "salt/Helper.h"
+#include "salt/Housekeeping.h"
 #include "salt/Index.h"
 #include "salt/ScanMemory.h"
 #include "salt/ScanTraffic.h"
@@ -81,7 +82,7 @@ class index final : public Index {
       const std::function<void(const Place* places, size_t count)>& callback) const override;
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override;
-  void WaitWhileCompacting() override TL_EXCLUDES(_compactionMutex);
+  void WaitWhileTidying() override;
 
   // Whether ScanPrefixes leaves out what it need not look for.
   [[nodiscard]] bool knowsStarts() const { return _starts.complete(); }
@@ -167,11 +168,9 @@ class index final : public Index {
   void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
   void waitForMore() const TL_EXCLUDES(_metricsMutex);
   [[nodiscard]] uint64_t hotSuffixes() const TL_EXCLUDES(_metricsMutex);
-  [[nodiscard]] bool hotPartWantsCompaction() const TL_EXCLUDES(_metricsMutex);
-  // The keys from `begin` to `end`, while those who add a lot hold back.
-  void compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
-      TL_EXCLUDES(_compactionMutex);
-  [[nodiscard]] uint64_t compactionsEnded() const TL_EXCLUDES(_compactionMutex);
+  void compactPart(uint8_t shard);
+  // The keys from `begin` to `end`.
+  void compactRange(const leveldb::Slice* begin, const leveldb::Slice* end);
   void removeObsoleteFiles() const;
 
   // False, with a log line, when the loaded counters cannot be those of a sound index.
@@ -223,11 +222,8 @@ class index final : public Index {
   mutable Helper _scanHelper;
   mutable ScanTraffic _scanTraffic;
 
-  // Of compactions on demand: how many run, and how many have ended.
-  mutable platform::Mutex _compactionMutex;
-  std::condition_variable_any _compactionEnded;
-  int _compactions TL_GUARDED_BY(_compactionMutex) = 0;
-  uint64_t _compactionsEnded TL_GUARDED_BY(_compactionMutex) = 0;
+  Housekeeping _housekeeping;                  // synchronised by itself
+  std::atomic<uint64_t> _compactionsEnded{0};  // of those on demand
 
   // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is
   // taken with no other held.

@@ -11,22 +11,15 @@ namespace salt {
 
 namespace {
 
-// A hot part below this part of the most it may hold is sparse.
-constexpr uint32_t kSparseHotPart = 16;
-// On the disk; a hot suffix takes some 16 bytes there, and a mark that removes one takes as much.
-constexpr uint64_t kManyHotBytes = 96 * 1024 * 1024;
-constexpr uint64_t kManyBytesASuffix = 64;
+constexpr uint8_t kHotPart = 0;
 
 // While kPouring suffixes or more come in each interval, a merge waits until the hot part is
 // kWorthwhile times MaxHotSuffixes, unless that is small anyway.
 constexpr uint32_t kWorthwhile = 2;
 constexpr uint32_t kSmallHotPart = 100000;
-constexpr std::chrono::milliseconds kInterval{20};
-constexpr uint64_t kPouring = 1000;  // two to three mails
+constexpr std::chrono::milliseconds kInterval{250};
+constexpr uint64_t kPouring = 10000;  // some 25 mails
 constexpr std::chrono::seconds kLongestWait{5};
-
-const leveldb::Slice kHotBegin("\x00", 1);
-const leveldb::Slice kHotEnd("\x01", 1);
 
 }  // namespace
 
@@ -88,12 +81,16 @@ void index::runMerge(uint8_t shard) {
   platform::setThreadName("tallow-merge");
   waitForMore();
   const auto start = Clock::now();
-  Merge(*this, shard).run();
-  platform::returnFreeMemory();
-  if (op.CompactAfterVacuum) {
-    Compact();
-  } else if (hotPartWantsCompaction()) {
-    compactRange(&kHotBegin, &kHotEnd);
+  {
+    const Housekeeping::Work merge(_housekeeping);
+    Merge(*this, shard).run();
+    platform::returnFreeMemory();
+    if (op.CompactAfterVacuum) {
+      Compact();
+    } else {
+      compactPart(kHotPart);
+      compactPart(shard);
+    }
   }
   const std::chrono::duration<double> elapsed = Clock::now() - start;
   const auto finish = [&elapsed](MetricsBlock& counters) {
@@ -127,19 +124,19 @@ uint64_t index::hotSuffixes() const {
 }
 
 // A merge leaves a mark for each suffix that was hot, and a seek walks over them up to the next
-// suffix that lives.
+// suffix that lives. leveldb drops marks as they move down, but not above the few hot suffixes that
+// it once got into a level deep down, and those stay there. With nothing hot left, the marks and
+// what they remove come to nothing; while much is added there would always be something.
 //
-// While mail comes in fast there is always one near. But once leveldb has hot suffixes in a level
-// deep down, it keeps the marks that come in above them, merges these with all that follows, and
-// hardly ever gets to the level where they meet: the marks get more and more until most of its work
-// is theirs.
-bool index::hotPartWantsCompaction() const {
-  const uint64_t hot = hotSuffixes();
-  if (hot < op.MaxHotSuffixes / kSparseHotPart) return true;
-  const leveldb::Range range(kHotBegin, kHotEnd);
-  uint64_t bytes = 0;
-  db->GetApproximateSizes(&range, 1, &bytes);
-  return bytes > kManyHotBytes && bytes > kManyBytesASuffix * hot;
+// Nor may new pages stay where mail passes on its way down. leveldb cuts its files by size alone: a
+// file of the last hot suffixes and the first texts spans all shards, and is merged with all of
+// their pages in the next level.
+void index::compactPart(uint8_t shard) {
+  const char first = static_cast<char>(shard);
+  const char behind = static_cast<char>(shard + 1);
+  const leveldb::Slice begin(&first, 1);
+  const leveldb::Slice end(&behind, 1);
+  compactRange(&begin, &end);
 }
 
 bool index::commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta) {

@@ -61,7 +61,7 @@ class WatchedIndex final : public salt::Index {
   void ResetScanMetrics() override {}
   bool Validate() const override { return true; }
   std::string Dump() const override { return ""; }
-  void WaitWhileCompacting() override {}
+  void WaitWhileTidying() override {}
 
  private:
   Options _options;

@@ -81,6 +81,22 @@ std::optional<uint64_t> countOfPlaces(const Index& index) {
   return index.ScanPlaces("a", 1000, [](const salt::Place*, size_t) {});
 }
 
+// Were nobody to wait, `goesOn` would be false; were the end of it not told, this would take ten
+// seconds. Somebody waits for the disk already.
+void expectHoldingBack(Index& index, SlowDisk* disk) {
+  std::atomic<bool> holdsBack = false;
+  std::atomic<bool> goesOn = false;
+  std::thread releasing([&] {
+    while (!holdsBack) std::this_thread::yield();
+    goesOn = true;
+    disk->goOn();
+  });
+  holdsBack = true;
+  index.WaitWhileTidying();
+  EXPECT_TRUE(goesOn);
+  releasing.join();
+}
+
 }  // namespace
 
 // Were a scan to wait for the write, this would wait for ever.
@@ -124,31 +140,37 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   EXPECT_TRUE(index->Validate());
 }
 
-// Were nobody to wait, `goesOn` would be false; were the end of it not told, this would take ten
-// seconds.
-TEST(SlowDisk, WhoAddsALotHoldsBackWhileTheIndexCompacts) {
+TEST(SlowDisk, WhoAddsALotHoldsBackDuringACompaction) {
   const testsupport::TemporaryDirectory directory;
   ASSERT_NE(salttest::newIndex(directory / "i"), nullptr);
   SlowDisk disk(".ldb");
   const auto index =
       salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
   ASSERT_NE(index, nullptr);
-  index->WaitWhileCompacting();  // for nothing
+  index->WaitWhileTidying();  // for nothing
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
 
   disk.holdUpAfter(0);
   std::thread compacting([&index] { index->Compact(); });
   disk.waitForWriter();
-  std::atomic<bool> holdsBack = false;
-  std::atomic<bool> goesOn = false;
-  std::thread releasing([&] {
-    while (!holdsBack) std::this_thread::yield();
-    goesOn = true;
-    disk.goOn();
-  });
-  holdsBack = true;
-  index->WaitWhileCompacting();
-  EXPECT_TRUE(goesOn);
-  releasing.join();
+  expectHoldingBack(*index, &disk);
   compacting.join();
+}
+
+TEST(SlowDisk, WhoAddsALotHoldsBackDuringAMerge) {
+  const testsupport::TemporaryDirectory directory;
+  Index::Options options;
+  options.MaxHotSuffixes = 4;
+  ASSERT_NE(salttest::newIndex(directory / "i", options), nullptr);
+  SlowDisk disk(".log");
+  const auto index =
+      salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
+  ASSERT_NE(index, nullptr);
+  ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
+
+  disk.holdUpAfter(2);  // the mark of a merge passes, its pages do not
+  index->Vacuum();
+  disk.waitForWriter();
+  expectHoldingBack(*index, &disk);
+  EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
 }
