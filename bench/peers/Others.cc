@@ -51,7 +51,8 @@ class ToolRun {
   ToolRun(Tool tool, const Workload& work, std::string output)
       : _tool(std::move(tool)), _work(work), _output(std::move(output)) {}
 
-  Figures measure() {
+  // The figures of indexing alone.
+  [[nodiscard]] Figures index() const {
     Figures figures;
     if (!_tool.prepare.empty()) run(_tool.prepare, {0}, false);
     sync();
@@ -60,6 +61,11 @@ class ToolRun {
     figures.cpuSeconds = indexing.cpuSeconds;
     figures.residentPeak = static_cast<double>(indexing.residentPeak);
     figures.diskBytes = static_cast<double>(bench::bytesOnDisk(_tool.directory));
+    return figures;
+  }
+
+  Figures measure() {
+    Figures figures = index();
     const Search searchAndStart = [this](const std::string& query) {
       constexpr uint64_t kQueriesAStart = 5;
       if (_queries++ % kQueriesAStart == 0) _starts.add(search("zqxjvwzqxjvw").seconds);
@@ -100,22 +106,30 @@ class ToolRun {
 
 const std::string kMaximum = std::to_string(bench::kMaximumResults);
 
+Tool mu(const Workload& work, const bench::ScratchDirectory& scratch) {
+  const std::string home = "--muhome=" + scratch / "mu";
+  const auto search = [home](const std::string& query) -> Arguments {
+    const auto words = bench::wordsOfQuery(query);
+    return {"mu", "find", home, "--maxnum=" + kMaximum, quotedWords(words) + words.back() + '*'};
+  };
+  return {scratch / "mu/xapian",
+          {{"HOME", scratch / ""}, {"LC_ALL", "C.UTF-8"}},
+          {"mu", "init", home, "--maildir=" + work.maildir},
+          {"mu", "index", home, "--quiet"},
+          search,
+          {0, 2, 4}};  // nothing found is 2 or 4, by version
+}
+
 }  // namespace
 
 Figures measureMu(const Workload& work) {
   const bench::ScratchDirectory scratch;
-  const std::string home = "--muhome=" + scratch / "mu";
-  const auto search = [&](const std::string& query) -> Arguments {
-    const auto words = bench::wordsOfQuery(query);
-    return {"mu", "find", home, "--maxnum=" + kMaximum, quotedWords(words) + words.back() + '*'};
-  };
-  const Tool tool{scratch / "mu/xapian",
-                  {{"HOME", scratch / ""}, {"LC_ALL", "C.UTF-8"}},
-                  {"mu", "init", home, "--maildir=" + work.maildir},
-                  {"mu", "index", home, "--quiet"},
-                  search,
-                  {0, 2, 4}};  // nothing found is 2 or 4, by version
-  return ToolRun(tool, work, scratch / "output").measure();
+  return ToolRun(mu(work, scratch), work, scratch / "output").measure();
+}
+
+Figures indexByMu(const Workload& work) {
+  const bench::ScratchDirectory scratch;
+  return ToolRun(mu(work, scratch), work, scratch / "output").index();
 }
 
 Figures measureNotmuch(const Workload& work) {

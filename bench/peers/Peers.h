@@ -80,6 +80,9 @@ struct TallowFigures : Figures {
 };
 [[nodiscard]] TallowFigures measureTallow(const Workload& work);
 
+// As above, but for indexing alone: there are no searches in the figures.
+[[nodiscard]] Figures indexByTallow(const Workload& work);
+
 // This daemon without the parsing of mail, and the same keys as raw batches. What is not known is
 // NaN.
 struct EncodedFigures {
@@ -93,6 +96,7 @@ struct EncodedFigures {
 [[nodiscard]] EncodedFigures measureEncoded(const Workload& work, bool withRaw);
 
 [[nodiscard]] Figures measureMu(const Workload& work);
+[[nodiscard]] Figures indexByMu(const Workload& work);  // alone, as above
 [[nodiscard]] Figures measureNotmuch(const Workload& work);
 
 // With `optimize`, all segments of the full-text index are merged into one before searching.

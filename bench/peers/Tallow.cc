@@ -153,7 +153,7 @@ void openIndex(client::SearchServiceProxy& service) {
 }
 
 void indexByClient(const Workload& work, bench::DaemonRun& daemon, const std::string& output,
-                   TallowFigures& figures) {
+                   Figures& figures) {
   sync();
   const double cpuStart = daemon.cpuSeconds();
   const bench::Run run = bench::runProgram({{bench::programBeside("tallow"), "--runtime-dir",
@@ -217,6 +217,17 @@ TallowFigures measureTallow(const Workload& work) {
   timeDuringMerge(queries.subspan(half), true, feeder, daemon, search, figures.duringIngest);
 
   figures.anonymousPeak = static_cast<double>(daemon.memory().anonymousPeak);
+  daemon.stop();
+  return figures;
+}
+
+Figures indexByTallow(const Workload& work) {
+  const bench::ScratchDirectory scratch;
+  bench::DaemonRun daemon(scratch, scratch / "state");
+  client::SearchServiceProxy service(daemon.runtimeDirectory());
+  openIndex(service);
+  Figures figures;
+  indexByClient(work, daemon, scratch / "output", figures);
   daemon.stop();
   return figures;
 }
