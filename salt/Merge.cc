@@ -28,7 +28,7 @@ Merge::Merge(index& owner, uint8_t shard)
       _previous(owner, &_zoneTexts),
       _first(owner, &_zoneTexts) {}
 
-void Merge::run() {
+bool Merge::run() {
   const size_t pageSuffixes = _idx.op.MaxPageSuffixes;
   _old.seekToFirst();
   _hot.seekToFirst();
@@ -44,6 +44,7 @@ void Merge::run() {
     }
   }
   commit(true);
+  return !_failed;
 }
 
 bool Merge::oldIsNext() {

@@ -25,7 +25,8 @@ class Merge {
   Merge(index& owner, uint8_t shard);
 
   // To the end, or to the first read or write that fails; what was committed until then stays.
-  void run();
+  // False when one failed.
+  [[nodiscard]] bool run();
 
  private:
   [[nodiscard]] bool oldIsNext();

@@ -83,11 +83,11 @@ void index::runMerge(uint8_t shard) {
   const auto start = Clock::now();
   {
     const Housekeeping::Work merge(_housekeeping);
-    Merge(*this, shard).run();
+    const bool merged = Merge(*this, shard).run();
     platform::returnFreeMemory();
     if (op.CompactAfterVacuum) {
       Compact();
-    } else {
+    } else if (merged) {
       compactPart(kHotPart);
       compactPart(shard);
     }
