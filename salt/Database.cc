@@ -1,5 +1,7 @@
 #include "salt/Database.h"
 
+#include <algorithm>
+#include <chrono>
 #include <cstdarg>
 #include <cstdio>
 
@@ -16,6 +18,9 @@ constexpr size_t kBlockBytes = 32 * 1024;
 constexpr size_t kFileBytes = 4 * 1024 * 1024;
 constexpr size_t kLogLineBytes = 100;
 constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one takes at a time
+// In a memtable a batch takes up to three times as much.
+constexpr size_t kBatchesBesideCompaction = kWriteBufferBytes / 4;
+constexpr std::chrono::seconds kLongestWait{10};
 
 leveldb::Status open(const leveldb::Options& options, const std::string& path,
                      std::unique_ptr<leveldb::DB>* db) {
@@ -48,16 +53,39 @@ void LeveldbLogger::Logv(const char* format, va_list arguments) {
   log.debug("{}", static_cast<const char*>(line));
 }
 
-void compact(const Database& database, const leveldb::Slice* begin, const leveldb::Slice* end) {
-  if (const uint64_t free = platform::freeBytes(database.path); free < kCompactionRoom) {
+void BatchWriter::compact(const std::string& path, const leveldb::Slice* begin,
+                          const leveldb::Slice* end) {
+  if (const uint64_t free = platform::freeBytes(path); free < kCompactionRoom) {
     Log.error("No compaction: {} bytes are left on the disk", free);
     return;
   }
-  database.db->CompactRange(begin, end);
+  {
+    platform::MutexLock lock(_mutex);
+    while (_compacts) _compacted.wait(_mutex);
+    _compacts = true;
+    _room = kBatchesBesideCompaction;
+  }
+  _db->CompactRange(begin, end);  // begins with a new memtable
+  platform::MutexLock lock(_mutex);
+  _compacts = false;
+  _compacted.notify_all();
+}
+
+bool BatchWriter::waitForCompaction(size_t bytes) {
+  const auto deadline = std::chrono::steady_clock::now() + kLongestWait;
+  while (_compacts && (_logTorn || bytes > _room)) {
+    if (_compacted.wait_until(_mutex, deadline) == std::cv_status::timeout) return false;
+  }
+  return true;
 }
 
 leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
   platform::MutexLock lock(_mutex);
+  const size_t bytes = batch->ApproximateSize();
+  if (!waitForCompaction(bytes) && _logTorn) {
+    return leveldb::Status::IOError("no new log beside a compaction");
+  }
+  _room -= std::min(bytes, _room);
   leveldb::Status status;
   if (_logTorn) status = _db->Write(leveldb::WriteOptions(), nullptr);
   if (!status.ok()) return status;

@@ -5,6 +5,7 @@
 #include <leveldb/env.h>
 #include <leveldb/write_batch.h>
 
+#include <condition_variable>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -41,14 +42,14 @@ enum class OpenMode { create, existing };
 [[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode,
                                     leveldb::Env* files = leveldb::Env::Default());
 
-// Compacts the keys from `begin` to `end`; null stands for the first and the last. Does nothing,
-// with a log line, where the disk is nearly full: leveldb 1.23 ends the process when it fails to
-// write a memtable during a compaction on demand.
-void compact(const Database& database, const leveldb::Slice* begin, const leveldb::Slice* end);
-
-// The only way batches are written. A write that fails (a full disk, say) can leave half a record
-// in the log, and recovery does not look behind it: the next write starts a new log first, so that
-// what it acknowledges survives. Any thread.
+// The only way batches are written and keys compacted. Any thread.
+//
+// A write that fails (a full disk, say) can leave half a record in the log, and recovery does not
+// look behind it: the next write starts a new log first, so that what it acknowledges survives.
+//
+// leveldb 1.23 ends the process when it fails to write a memtable during a compaction on demand. So
+// none begins on a disk that is nearly full or beside another, and writes that would fill the
+// memtable meanwhile wait, 10 seconds at most.
 class BatchWriter {
  public:
   explicit BatchWriter(leveldb::DB* db) : _db(db) {}
@@ -56,9 +57,20 @@ class BatchWriter {
   // Not synced to the disk.
   [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch) TL_EXCLUDES(_mutex);
 
+  // The keys from `begin` to `end`; null stands for the first and the last. Does nothing, with a
+  // log line, where fewer than 128 MiB are free at `path`.
+  void compact(const std::string& path, const leveldb::Slice* begin, const leveldb::Slice* end)
+      TL_EXCLUDES(_mutex);
+
  private:
+  // False when it took too long.
+  [[nodiscard]] bool waitForCompaction(size_t bytes) TL_REQUIRES(_mutex);
+
   leveldb::DB* const _db;
   platform::Mutex _mutex;
+  std::condition_variable_any _compacted;
+  bool _compacts TL_GUARDED_BY(_mutex) = false;
+  size_t _room TL_GUARDED_BY(_mutex) = 0;  // for batches, until it has
   bool _logTorn TL_GUARDED_BY(_mutex) = false;
 };
 

@@ -147,7 +147,7 @@ void index::Compact() {
 }
 
 void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
-  compact(_database, begin, end);
+  _writer.compact(_database.path, begin, end);
   ++_compactionsEnded;
 }
 
@@ -155,7 +155,7 @@ void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
 // last key.
 void index::removeObsoleteFiles() const {
   const leveldb::Slice behind("\xFF\xFF", 2);
-  compact(_database, &behind, &behind);
+  _writer.compact(_database.path, &behind, &behind);
 }
 
 void index::WaitWhileTidying() {

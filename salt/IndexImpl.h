@@ -188,7 +188,7 @@ class index final : public Index {
   friend Index* NewIndex(const Options& options);
 
   Database _database;
-  BatchWriter _writer;
+  mutable BatchWriter _writer;
 
  public:
   // Fixed from the construction on.

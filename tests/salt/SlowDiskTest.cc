@@ -81,18 +81,19 @@ std::optional<uint64_t> countOfPlaces(const Index& index) {
   return index.ScanPlaces("a", 1000, [](const salt::Place*, size_t) {});
 }
 
-// Were nobody to wait, `goesOn` would be false; were the end of it not told, this would take ten
-// seconds. Somebody waits for the disk already.
-void expectHoldingBack(Index& index, SlowDisk* disk) {
-  std::atomic<bool> holdsBack = false;
+// Runs `waits` while somebody waits for the disk already. Were it not to wait, `goesOn` would be
+// false; were the end not told, it would take ten seconds.
+template <typename Waits>
+void expectWaiting(SlowDisk* disk, const Waits& waits) {
+  std::atomic<bool> begins = false;
   std::atomic<bool> goesOn = false;
   std::thread releasing([&] {
-    while (!holdsBack) std::this_thread::yield();
+    while (!begins) std::this_thread::yield();
     goesOn = true;
     disk->goOn();
   });
-  holdsBack = true;
-  index.WaitWhileTidying();
+  begins = true;
+  waits();
   EXPECT_TRUE(goesOn);
   releasing.join();
 }
@@ -153,7 +154,7 @@ TEST(SlowDisk, WhoAddsALotHoldsBackDuringACompaction) {
   disk.holdUpAfter(0);
   std::thread compacting([&index] { index->Compact(); });
   disk.waitForWriter();
-  expectHoldingBack(*index, &disk);
+  expectWaiting(&disk, [&index] { index->WaitWhileTidying(); });
   compacting.join();
 }
 
@@ -171,6 +172,29 @@ TEST(SlowDisk, WhoAddsALotHoldsBackDuringAMerge) {
   disk.holdUpAfter(2);  // the mark of a merge passes, its pages do not
   index->Vacuum();
   disk.waitForWriter();
-  expectHoldingBack(*index, &disk);
+  expectWaiting(&disk, [&index] { index->WaitWhileTidying(); });
   EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
+}
+
+// leveldb would end the process if it failed to write that memtable.
+TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
+  const testsupport::TemporaryDirectory directory;
+  SlowDisk disk(".ldb");
+  const salt::Database database =
+      salt::openDatabase(directory / "i", salt::OpenMode::create, &disk);
+  ASSERT_NE(database.db, nullptr);
+  salt::BatchWriter writer(database.db.get());
+  const auto write = [&writer](size_t bytes) {
+    leveldb::WriteBatch batch;
+    batch.Put("a", std::string(bytes, 'a'));
+    EXPECT_TRUE(writer.write(&batch).ok());
+  };
+  write(1);
+
+  disk.holdUpAfter(0);
+  std::thread compacting([&] { writer.compact(database.path, nullptr, nullptr); });
+  disk.waitForWriter();
+  write(1);
+  expectWaiting(&disk, [&write] { write(2 << 20); });
+  compacting.join();
 }
