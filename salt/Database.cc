@@ -53,9 +53,8 @@ void LeveldbLogger::Logv(const char* format, va_list arguments) {
   log.debug("{}", static_cast<const char*>(line));
 }
 
-void BatchWriter::compact(const std::string& path, const leveldb::Slice* begin,
-                          const leveldb::Slice* end) {
-  if (const uint64_t free = platform::freeBytes(path); free < kCompactionRoom) {
+void BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end) {
+  if (const uint64_t free = platform::freeBytes(_database.path); free < kCompactionRoom) {
     Log.error("No compaction: {} bytes are left on the disk", free);
     return;
   }
@@ -65,7 +64,7 @@ void BatchWriter::compact(const std::string& path, const leveldb::Slice* begin,
     _compacts = true;
     _room = kBatchesBesideCompaction;
   }
-  _db->CompactRange(begin, end);  // begins with a new memtable
+  _database.db->CompactRange(begin, end);  // begins with a new memtable
   platform::MutexLock lock(_mutex);
   _compacts = false;
   _compacted.notify_all();
@@ -82,14 +81,14 @@ bool BatchWriter::waitForCompaction(size_t bytes) {
 leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
   platform::MutexLock lock(_mutex);
   const size_t bytes = batch->ApproximateSize();
-  if (!waitForCompaction(bytes) && _logTorn) {
+  if (_compacts && !waitForCompaction(bytes) && _logTorn) {
     return leveldb::Status::IOError("no new log beside a compaction");
   }
   _room -= std::min(bytes, _room);
   leveldb::Status status;
-  if (_logTorn) status = _db->Write(leveldb::WriteOptions(), nullptr);
+  if (_logTorn) status = _database.db->Write(leveldb::WriteOptions(), nullptr);
   if (!status.ok()) return status;
-  status = _db->Write(leveldb::WriteOptions(), batch);
+  status = _database.db->Write(leveldb::WriteOptions(), batch);
   _logTorn = !status.ok();
   return status;
 }

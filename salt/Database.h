@@ -52,21 +52,21 @@ enum class OpenMode { create, existing };
 // memtable meanwhile wait, 10 seconds at most.
 class BatchWriter {
  public:
-  explicit BatchWriter(leveldb::DB* db) : _db(db) {}
+  // Of the open database, which outlives this.
+  explicit BatchWriter(const Database& database) : _database(database) {}
 
   // Not synced to the disk.
   [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch) TL_EXCLUDES(_mutex);
 
   // The keys from `begin` to `end`; null stands for the first and the last. Does nothing, with a
-  // log line, where fewer than 128 MiB are free at `path`.
-  void compact(const std::string& path, const leveldb::Slice* begin, const leveldb::Slice* end)
-      TL_EXCLUDES(_mutex);
+  // log line, where fewer than 128 MiB are free.
+  void compact(const leveldb::Slice* begin, const leveldb::Slice* end) TL_EXCLUDES(_mutex);
 
  private:
   // False when it took too long.
   [[nodiscard]] bool waitForCompaction(size_t bytes) TL_REQUIRES(_mutex);
 
-  leveldb::DB* const _db;
+  const Database& _database;
   platform::Mutex _mutex;
   std::condition_variable_any _compacted;
   bool _compacts TL_GUARDED_BY(_mutex) = false;

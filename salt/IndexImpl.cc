@@ -32,7 +32,7 @@ bool parseRecord(const std::string& bytes, Record* record) {
 
 index::index(Database opened)
     : _database(std::move(opened)),
-      _writer(_database.db.get()),
+      _writer(_database),
       db(_database.db.get()),
       _batch(std::in_place),
       _deleted(std::make_shared<const DocSet>()) {
@@ -141,13 +141,13 @@ bool index::Sync() {
 }
 
 void index::Compact() {
-  const Housekeeping::Work compaction(_housekeeping);
+  const Activity::Work compaction(_housekeeping);
   compactRange(nullptr, nullptr);
   _database.files->waitForDisk();
 }
 
 void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
-  _writer.compact(_database.path, begin, end);
+  _writer.compact(begin, end);
   ++_compactionsEnded;
 }
 
@@ -155,7 +155,7 @@ void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
 // last key.
 void index::removeObsoleteFiles() const {
   const leveldb::Slice behind("\xFF\xFF", 2);
-  _writer.compact(_database.path, &behind, &behind);
+  _writer.compact(&behind, &behind);
 }
 
 void index::WaitWhileTidying() {

@@ -12,14 +12,13 @@
 #include <vector>
 
 #include "platform/Mutex.h"
+#include "salt/Activity.h"
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/DocSet.h"
 #include "salt/Helper.h"
-#include "salt/Housekeeping.h"
 #include "salt/Index.h"
 #include "salt/ScanMemory.h"
-#include "salt/ScanTraffic.h"
 #include "salt/SuffixStarts.h"
 
 namespace salt {
@@ -111,7 +110,7 @@ class index final : public Index {
   [[nodiscard]] bool commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta)
       TL_EXCLUDES(_commitMutex, _metricsMutex);
 
-  [[nodiscard]] ScanTraffic& scanTraffic() const { return _scanTraffic; }
+  [[nodiscard]] Activity& scans() const { return _scans; }
 
  private:
   using Clock = std::chrono::steady_clock;
@@ -220,9 +219,9 @@ class index final : public Index {
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
   mutable ScanMemory _scanMemory;  // synchronised by itself, as is the next
   mutable Helper _scanHelper;
-  mutable ScanTraffic _scanTraffic;
+  mutable Activity _scans{std::chrono::milliseconds(5)};  // one search makes several
 
-  Housekeeping _housekeeping;                  // synchronised by itself
+  Activity _housekeeping;                      // merges and compactions; synchronised by itself
   std::atomic<uint64_t> _compactionsEnded{0};  // of those on demand
 
   // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is

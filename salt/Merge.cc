@@ -19,7 +19,7 @@ size_t commonPrefix(std::string_view left, std::string_view right, size_t from) 
 Merge::Merge(index& owner, uint8_t shard)
     : _idx(owner),
       _shard(shard),
-      _pace(owner.scanTraffic()),
+      _pace(owner.scans()),
       _oldView(owner, false),
       _hotView(owner, false),
       _zoneTexts(owner),

@@ -4,7 +4,7 @@
 #include <utility>
 
 #include "platform/Clock.h"
-#include "salt/ScanTraffic.h"
+#include "salt/Activity.h"
 
 namespace salt {
 
@@ -20,8 +20,7 @@ constexpr milliseconds kLeastCredit{2};  // waking up costs, too
 
 }  // namespace
 
-MergePace::MergePace(ScanTraffic& scans)
-    : _scans(scans), _computed(platform::threadProcessorTime()) {}
+MergePace::MergePace(Activity& scans) : _scans(scans), _computed(platform::threadProcessorTime()) {}
 
 void MergePace::giveWay() {
   if (!_scans.any()) return;

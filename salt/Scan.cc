@@ -184,7 +184,7 @@ class PlacesScan {
 bool index::ScanPrefix(std::string_view prefix,
                        std::function<bool(const SuffixMeta&)> callback) const {
   const auto start = Clock::now();
-  const ScanTraffic::Scan running(_scanTraffic);
+  const Activity::Work running(_scans);
   const IndexView view(*this, true);
   PrefixScan scan(view, prefix.substr(0, suffixLength(prefix, op)));
   scan.suffixes(callback);
@@ -196,7 +196,7 @@ std::optional<uint64_t> index::ScanPlaces(
     std::string_view prefix, uint64_t limit,
     const std::function<void(const Place* places, size_t count)>& callback) const {
   const auto start = Clock::now();
-  const ScanTraffic::Scan running(_scanTraffic);
+  const Activity::Work running(_scans);
   const IndexView view(*this, true, kPageWalks);
   prefix = prefix.substr(0, suffixLength(prefix, op));
   const auto known = _scanMemory.find(prefix, view.pageGeneration);

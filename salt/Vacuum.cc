@@ -82,7 +82,7 @@ void index::runMerge(uint8_t shard) {
   waitForMore();
   const auto start = Clock::now();
   {
-    const Housekeeping::Work merge(_housekeeping);
+    const Activity::Work merge(_housekeeping);
     const bool merged = Merge(*this, shard).run();
     platform::returnFreeMemory();
     if (op.CompactAfterVacuum) {

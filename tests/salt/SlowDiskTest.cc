@@ -81,6 +81,10 @@ std::optional<uint64_t> countOfPlaces(const Index& index) {
   return index.ScanPlaces("a", 1000, [](const salt::Place*, size_t) {});
 }
 
+std::unique_ptr<salt::index> openOn(SlowDisk* disk, const std::string& path) {
+  return salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, disk));
+}
+
 // Runs `waits` while somebody waits for the disk already. Were it not to wait, `goesOn` would be
 // false; were the end not told, it would take ten seconds.
 template <typename Waits>
@@ -114,8 +118,7 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
     }
   }
   SlowDisk disk(".log");
-  auto index =
-      salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
+  const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
 
   disk.holdUpAfter(0);
@@ -145,8 +148,7 @@ TEST(SlowDisk, WhoAddsALotHoldsBackDuringACompaction) {
   const testsupport::TemporaryDirectory directory;
   ASSERT_NE(salttest::newIndex(directory / "i"), nullptr);
   SlowDisk disk(".ldb");
-  const auto index =
-      salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
+  const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
   index->WaitWhileTidying();  // for nothing
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
@@ -164,8 +166,7 @@ TEST(SlowDisk, WhoAddsALotHoldsBackDuringAMerge) {
   options.MaxHotSuffixes = 4;
   ASSERT_NE(salttest::newIndex(directory / "i", options), nullptr);
   SlowDisk disk(".log");
-  const auto index =
-      salt::index::load(salt::openDatabase(directory / "i", salt::OpenMode::existing, &disk));
+  const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
 
@@ -183,7 +184,7 @@ TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   const salt::Database database =
       salt::openDatabase(directory / "i", salt::OpenMode::create, &disk);
   ASSERT_NE(database.db, nullptr);
-  salt::BatchWriter writer(database.db.get());
+  salt::BatchWriter writer(database);
   const auto write = [&writer](size_t bytes) {
     leveldb::WriteBatch batch;
     batch.Put("a", std::string(bytes, 'a'));
@@ -192,7 +193,7 @@ TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   write(1);
 
   disk.holdUpAfter(0);
-  std::thread compacting([&] { writer.compact(database.path, nullptr, nullptr); });
+  std::thread compacting([&] { writer.compact(nullptr, nullptr); });
   disk.waitForWriter();
   write(1);
   expectWaiting(&disk, [&write] { write(2 << 20); });

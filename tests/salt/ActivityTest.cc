@@ -4,22 +4,22 @@
 #include <optional>
 #include <thread>
 
-#include "salt/ScanTraffic.h"
+#include "salt/Activity.h"
 
 namespace {
 
-using salt::ScanTraffic;
+using salt::Activity;
 using std::chrono::hours;
 
 }  // namespace
 
 // An end that is not told would be waited for until the test is killed.
-TEST(ScanTraffic, WhoWaitsGoesOnBehindTheLastScan) {
-  ScanTraffic traffic;
+TEST(Activity, WhoWaitsGoesOnBehindTheLastScan) {
+  Activity traffic;
   EXPECT_FALSE(traffic.any());
   traffic.waitForEnd(hours(1));
-  std::optional<ScanTraffic::Scan> first(std::in_place, traffic);
-  std::optional<ScanTraffic::Scan> second(std::in_place, traffic);
+  std::optional<Activity::Work> first(std::in_place, traffic);
+  std::optional<Activity::Work> second(std::in_place, traffic);
   std::atomic<bool> waiting = false;
   std::atomic<bool> last = false;
   std::thread scans([&] {

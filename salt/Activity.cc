@@ -1,4 +1,4 @@
-#include "salt/ScanTraffic.h"
+#include "salt/Activity.h"
 
 #include <algorithm>
 
@@ -8,27 +8,24 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-// From one scan of a search to its next, or to its end.
-constexpr std::chrono::milliseconds kGap{5};
-
 }  // namespace
 
-void ScanTraffic::begin() {
+void Activity::begin() {
   platform::MutexLock lock(_mutex);
   if (_running++ == 0) _changed.notify_all();
 }
 
-void ScanTraffic::end() {
+void Activity::end() {
   platform::MutexLock lock(_mutex);
   if (--_running == 0) _changed.notify_all();
 }
 
-void ScanTraffic::waitForEnd(std::chrono::nanoseconds most) {
+void Activity::waitForEnd(std::chrono::nanoseconds most) {
   const auto deadline = Clock::now() + most;
   platform::MutexLock lock(_mutex);
   for (;;) {
     if (!_changed.wait_until(_mutex, deadline, [this] { return !any(); })) return;
-    const auto quiet = std::min(deadline, Clock::now() + kGap);
+    const auto quiet = std::min(deadline, Clock::now() + _gap);
     if (!_changed.wait_until(_mutex, quiet, [this] { return any(); })) return;
   }
 }
