@@ -86,14 +86,15 @@ void TLDeviceLockMonitor::notifyDelegate(Call call, bool readDelegateAgain) {
   if (queue == nullptr) {
     ((*delegate).*call)();
   } else if (!readDelegateAgain) {
-    queue->async([delegate, call] { ((*delegate).*call)(); });
+    queue->submit([delegate, call] { ((*delegate).*call)(); });
   } else {
     // The delegate of that time; it is read on the queue that it belongs to.
-    queue->async([this, call] {
+    const bool submitted = queue->async([this, call] {
       std::shared_ptr<TLDeviceLockObserver> current;
       _dispatchQueue.sync([&] { current = _delegate.lock(); });
       if (current != nullptr) ((*current).*call)();
     });
+    if (!submitted) ((*delegate).*call)();
   }
 }
 

@@ -61,8 +61,11 @@ int main() {
     sources[i] = loop.addSignal(kEndingSignals[i], handleEndingSignal);
   }
   platform::SerialQueue captureQueue("com.quill.tallow.capture");
-  auto captureSource = loop.addSignal(
-      kCaptureSignal, [&captureQueue](int) { captureQueue.async(platform::logCapturedState); });
+  auto captureSource = loop.addSignal(kCaptureSignal, [&captureQueue](int) {
+    if (!captureQueue.async(platform::logCapturedState)) {
+      log().error("No thread for a capture of the state");
+    }
+  });
 
   const auto lock = platform::ProcessLock::acquire(platform::processLockPath(), &error);
   TALDaemon* daemon = TALDaemon::sharedInstance();

@@ -210,8 +210,8 @@ TLError TALIndexer::_errorWithCode(TALIndexerError code, const char* message, TL
 
 void TALIndexer::_scheduleWork(std::string name, Task task, Completion completionHandler) {
   log().debug("{} requested", name);
-  _queue.async([this, name = std::move(name), task = std::move(task),
-                completion = std::move(completionHandler)] {
+  _queue.submit([this, name = std::move(name), task = std::move(task),
+                 completion = std::move(completionHandler)] {
     const uint64_t start = platform::monotonicTicks();
     log().debug("{} started", name);
     const std::optional<TLError> outcome = runWork(task);

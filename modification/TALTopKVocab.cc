@@ -52,8 +52,7 @@ TALTopKVocab::TALTopKVocab(std::shared_ptr<TALDocStore> docStore, const salt::In
       _lastTopKRebuildDate(platform::secondsSince1970()),
       _vocab(std::make_shared<const Words>()) {
   if (_docStore == nullptr || _textStore == nullptr) return;
-  _topKVocabQueue.emplace(kQueueName);
-  _topKVocabQueue->async(platform::lowerThreadPriority);
+  _topKVocabQueue.emplace(kQueueName, platform::QueuePriority::low);
   loadTopKVocabFromDocStore(nullptr);
   log().standard("Last topK rebuild date: {}.", dateText(_lastTopKRebuildDate));
   log().standard("Last topK rebuild docID: {}.", _lastTopKRebuildDocID.load());
@@ -144,11 +143,12 @@ void TALTopKVocab::checkAndRebuildTopKVocabWithCompletionHandler(Completion hand
 
 void TALTopKVocab::rebuildUnlessOneWaits() {
   if (!_topKVocabQueue || _rebuildWaits.exchange(true)) return;
-  _topKVocabQueue->async([this] {
+  const bool submitted = _topKVocabQueue->async([this] {
     rest();
     _rebuildWaits = false;
     rebuild();
   });
+  if (!submitted) _rebuildWaits = false;
 }
 
 void TALTopKVocab::rest() {
@@ -165,7 +165,7 @@ void TALTopKVocab::_rebuildTopKVocabWithCompletionHandler(Completion handler) {
     ++_askedFor;
   }
   _restEnds.notify_all();
-  _topKVocabQueue->async([this, completion = std::move(handler)] {
+  _topKVocabQueue->submit([this, completion = std::move(handler)] {
     {
       MutexLock lock(_restMutex);
       --_askedFor;

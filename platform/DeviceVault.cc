@@ -86,7 +86,7 @@ class FileDeviceVault : public DeviceVault {
       const ssize_t size = read(_inotify, buffer.data(), buffer.size());
       for (ssize_t at = 0; at < size;) {
         const auto* event = reinterpret_cast<const inotify_event*>(buffer.data() + at);
-        if (event->len != 0 && name == event->name) queue.async(handler);
+        if (event->len != 0 && name == event->name) queue.submit(handler);
         at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
       }
     }

@@ -5,7 +5,7 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include <latch>
+#include <system_error>
 #include <utility>
 
 namespace platform {
@@ -27,33 +27,97 @@ void lowerThreadPriority() {
   setpriority(PRIO_PROCESS, static_cast<id_t>(gettid()), kBackgroundNiceness);
 }
 
-SerialQueue::SerialQueue(std::string name, QueuePriority priority)
-    : _name(std::move(name)), _priority(priority), _thread([this] { run(); }) {}
+SerialQueue::SerialQueue(std::string name, QueuePriority priority, std::chrono::milliseconds idle)
+    : _name(std::move(name)), _priority(priority), _idle(idle) {}
 
 SerialQueue::~SerialQueue() {
+  std::thread thread;
   {
     MutexLock lock(_mutex);
     _ending = true;
+    thread = std::move(_thread);
   }
   _changed.notify_all();
-  _thread.join();
+  if (thread.joinable()) thread.join();
 }
 
-void SerialQueue::async(Item item) {
+bool SerialQueue::start() {
+  MutexLock lock(_mutex);
+  return _threaded || startThread();
+}
+
+bool SerialQueue::startThread() {
+  // One that has ended has given the mutex back for good.
+  if (_thread.joinable()) _thread.join();
+  try {
+    _thread = std::thread([this] { run(); });
+  } catch (const std::system_error&) {
+    return false;
+  }
+  _threaded = true;
+  return true;
+}
+
+bool SerialQueue::async(Item item) {
   {
     MutexLock lock(_mutex);
-    _items.push_back(std::move(item));
+    if (!_threaded && !startThread()) return false;
+    _entries.push_back({std::move(item), nullptr});
   }
-  _changed.notify_one();
+  _changed.notify_all();
+  return true;
 }
 
 void SerialQueue::sync(const Item& item) {
-  std::latch done(1);
-  async([&] {
-    item();
-    done.count_down();
-  });
-  done.wait();
+  {
+    MutexLock lock(_mutex);
+    const void* const self = &item;
+    if (_busy || !_entries.empty()) {
+      _entries.push_back({nullptr, self});
+      while (_busy || _entries.front().caller != self) _changed.wait(_mutex);
+      _entries.pop_front();
+    }
+    _busy = true;
+  }
+  struct End {
+    SerialQueue& queue;
+    ~End() { queue.endItem(); }
+  } const end{*this};
+  item();
+}
+
+void SerialQueue::endItem() {
+  {
+    MutexLock lock(_mutex);
+    _busy = false;
+    if (_entries.empty()) return;
+  }
+  _changed.notify_all();
+}
+
+SerialQueue::Item SerialQueue::nextItem() {
+  MutexLock lock(_mutex);
+  const auto mine = [this]() TL_REQUIRES(_mutex) {
+    return !_busy && !_entries.empty() && _entries.front().caller == nullptr;
+  };
+  const auto idle = [this]() TL_REQUIRES(_mutex) { return !_busy && _entries.empty(); };
+  while (!mine()) {
+    const bool timed = idle() && !_ending && _idle != kForever;
+    if (_ending && idle()) break;
+    if (!timed) {
+      _changed.wait(_mutex);
+    } else if (_changed.wait_for(_mutex, _idle) == std::cv_status::timeout && idle()) {
+      break;
+    }
+  }
+  if (!mine()) {
+    _threaded = false;
+    return nullptr;
+  }
+  _busy = true;
+  Item item = std::move(_entries.front().item);
+  _entries.pop_front();
+  return item;
 }
 
 void SerialQueue::run() {
@@ -61,17 +125,13 @@ void SerialQueue::run() {
   if (_priority == QueuePriority::background) {
     const sched_param parameters{};
     pthread_setschedparam(pthread_self(), SCHED_BATCH, &parameters);
+  } else if (_priority == QueuePriority::low) {
+    lowerThreadPriority();
   }
-  for (;;) {
-    Item item;
-    {
-      MutexLock lock(_mutex);
-      while (_items.empty() && !_ending) _changed.wait(_mutex);
-      if (_items.empty()) return;
-      item = std::move(_items.front());
-      _items.pop_front();
-    }
+  while (Item item = nextItem()) {
     item();
+    item = nullptr;  // what it holds goes before the queue counts as idle
+    endItem();
   }
 }
 

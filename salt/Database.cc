@@ -1,9 +1,11 @@
 #include "salt/Database.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
 #include <cstdarg>
 #include <cstdio>
+#include <cstring>
 
 #include "platform/Files.h"
 
@@ -110,7 +112,9 @@ Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* file
   options.reuse_logs = true;
   options.info_log = result.logger.get();
   leveldb::Status status;
-  if (mode == OpenMode::create) {
+  if (!result.files->start()) {
+    status = leveldb::Status::IOError(path, std::strerror(EAGAIN));
+  } else if (mode == OpenMode::create) {
     platform::removeItem(path, nullptr);
     options.create_if_missing = true;
     options.error_if_exists = true;

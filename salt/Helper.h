@@ -14,16 +14,17 @@ namespace salt {
 class Helper {
  public:
   // Runs half(0) here and half(1) on the helper's thread, at the same time. half(1) is left out
-  // when half(0) has ended before it began, so each half does what the other has not done yet.
+  // when half(0) has ended before it began, or no thread can be had, so each half does what the
+  // other has not done yet.
   void share(const std::function<void(size_t half)>& half) {
     const auto job = std::make_shared<Job>();
-    _thread.async([job, &half] {
+    const bool begun = _thread.async([job, &half] {
       if (job->taken.exchange(true)) return;
       half(1);
       job->done.count_down();
     });
     half(0);
-    if (job->taken.exchange(true)) job->done.wait();
+    if (begun && job->taken.exchange(true)) job->done.wait();
   }
 
  private:

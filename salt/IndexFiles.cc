@@ -3,6 +3,8 @@
 #include <string_view>
 #include <utility>
 
+#include "platform/Assert.h"
+
 namespace salt {
 
 namespace {
@@ -76,7 +78,8 @@ class IndexFiles::Manifest final : public leveldb::WritableFile {
 IndexFiles::IndexFiles(leveldb::Env* files)
     : EnvWrapper(files),
       _steps("tallow-files"),
-      _work("tallow-leveldb", platform::QueuePriority::background) {}
+      _work("tallow-leveldb", platform::QueuePriority::background,
+            platform::SerialQueue::kForever) {}
 
 leveldb::Status IndexFiles::NewWritableFile(const std::string& path, leveldb::WritableFile** file) {
   const leveldb::Status status = target()->NewWritableFile(path, file);
@@ -121,11 +124,12 @@ leveldb::Status IndexFiles::UnlockFile(leveldb::FileLock* lock) {
 }
 
 void IndexFiles::Schedule(void (*work)(void*), void* argument) {
-  _work.async([work, argument] { work(argument); });
+  // leveldb holds its mutex here, and the work takes it: it must not run on this thread.
+  TL_ASSERT(_work.async([work, argument] { work(argument); }));
 }
 
 void IndexFiles::inOrder(Step step) {
-  _steps.async([this, step = std::move(step)] {
+  _steps.submit([this, step = std::move(step)] {
     if (!failure().ok()) return;
     const leveldb::Status status = step();
     platform::MutexLock lock(_mutex);
@@ -149,7 +153,7 @@ void IndexFiles::finish(std::unique_ptr<leveldb::WritableFile> table) {
     const leveldb::Status closed = file->Close();
     return status.ok() ? closed : status;
   });
-  _steps.async([this] {
+  _steps.submit([this] {
     platform::MutexLock lock(_mutex);
     --_tables;
     _tableDone.notify_one();

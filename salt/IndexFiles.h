@@ -32,6 +32,10 @@ class IndexFiles final : public leveldb::EnvWrapper {
   // Makes and reads files with `files`, which outlives this.
   explicit IndexFiles(leveldb::Env* files);
 
+  // Starts the thread that leveldb works on; before the database is opened. False when the system
+  // has none to give.
+  [[nodiscard]] bool start() { return _work.start(); }
+
   leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override;
   leveldb::Status NewAppendableFile(const std::string& path, leveldb::WritableFile** file) override;
   leveldb::Status RemoveFile(const std::string& path) override;

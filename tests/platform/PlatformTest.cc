@@ -2,7 +2,9 @@
 #include <sys/stat.h>
 #include <sys/xattr.h>
 
+#include <chrono>
 #include <random>
+#include <thread>
 #include <vector>
 
 #include "platform/Clock.h"
@@ -74,12 +76,52 @@ TEST(Queue, RunsInOrderAndDrainsAtTheEnd) {
   std::vector<int> order;
   {
     platform::SerialQueue queue("com.quill.tallow.test");
-    for (int i = 0; i < 100; ++i) queue.async([&order, i] { order.push_back(i); });
+    for (int i = 0; i < 100; ++i) EXPECT_TRUE(queue.async([&order, i] { order.push_back(i); }));
     queue.sync([&order] { EXPECT_EQ(order.size(), 100u); });
-    queue.async([&order] { order.push_back(100); });
+    EXPECT_TRUE(queue.async([&order] { order.push_back(100); }));
   }
   ASSERT_EQ(order.size(), 101u);
   for (int i = 0; i <= 100; ++i) EXPECT_EQ(order[static_cast<size_t>(i)], i);
+}
+
+// A thread that ends as soon as it has nothing to do, so that items meet it in all its states.
+TEST(Queue, LosesNothingWhenThreadsComeAndGo) {
+  constexpr int kThreads = 4;
+  constexpr int kItems = 500;
+  int count = 0;  // of the queue
+  std::vector<int> orders(kThreads, 0);
+  {
+    platform::SerialQueue queue("queue", platform::QueuePriority::unspecified,
+                                std::chrono::milliseconds(0));
+    std::vector<std::jthread> callers;
+    for (int caller = 0; caller < kThreads; ++caller) {
+      callers.emplace_back([&, caller] {
+        for (int i = 0; i < kItems; ++i) {
+          const auto item = [&count, &last = orders[static_cast<size_t>(caller)], i] {
+            EXPECT_EQ(last, i);
+            last = i + 1;
+            ++count;
+          };
+          if (i % 3 == 0) {
+            queue.sync(item);
+          } else {
+            EXPECT_TRUE(queue.async(item));
+          }
+        }
+      });
+    }
+  }
+  EXPECT_EQ(count, kThreads * kItems);
+}
+
+TEST(Queue, RunsSynchronousItemsOnTheCallersThread) {
+  platform::SerialQueue queue("queue");
+  std::thread::id ran;
+  queue.sync([&] { ran = std::this_thread::get_id(); });
+  EXPECT_EQ(ran, std::this_thread::get_id());
+  EXPECT_TRUE(queue.async([&] { ran = std::this_thread::get_id(); }));
+  queue.drain();
+  EXPECT_NE(ran, std::this_thread::get_id());
 }
 
 TEST(Concurrent, VisitsEveryIndexOnce) {

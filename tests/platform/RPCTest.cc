@@ -88,7 +88,7 @@ class RPCTest : public testing::Test {
          [this](platform::RPCArguments& arguments, std::shared_ptr<platform::RPCReply> reply) {
            std::string text(arguments.readString());
            if (text == "fail") return reply->sendError({"Domain", -2, "went wrong"});
-           queue.async([text, reply] { reply->send({text}); });
+           queue.submit([text, reply] { reply->send({text}); });
          }});
     interface.methods.push_back(
         {"Make",
@@ -227,7 +227,7 @@ TEST_F(RPCTest, AClientThatVanishesInMidCallHarmsNobody) {
     sd_bus_message_unref(call);
     auto reply = held.get_future().get();
     shutdown(client.descriptor, SHUT_RDWR);
-    queue.async([reply] { reply->send({}); });
+    queue.submit([reply] { reply->send({}); });
   }
   queue.drain();
   EXPECT_EQ(Client(path()).echo("next"), "next");
@@ -292,7 +292,7 @@ TEST_F(RPCTest, WhatIsReadyGoesOutBeforeTheEnd) {
   sd_bus_message* answer = nullptr;
   std::thread caller([&] { sd_bus_call(client.bus, call, 0, nullptr, &answer); });
   auto reply = held.get_future().get();
-  queue.async([reply = std::move(reply)] { reply->send({}); });
+  queue.submit([reply = std::move(reply)] { reply->send({}); });
   queue.drain();
   stop();
   caller.join();
