@@ -12,7 +12,7 @@ namespace cli {
 
 namespace {
 
-constexpr const char* kVersion = "tallow 0.1.0";
+constexpr const char* kVersion = "tallow " TALLOW_VERSION;
 
 // One command. `operands` is how its arguments are called in the help, null for none.
 struct CommandRow {

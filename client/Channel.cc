@@ -12,6 +12,7 @@
 #include <cstdlib>
 #include <memory>
 
+#include "platform/Files.h"
 #include "platform/Paths.h"
 
 namespace client {
@@ -110,13 +111,12 @@ int exchange(sd_bus* bus, sd_bus_message* request, std::chrono::microseconds tim
 }  // namespace
 
 std::string defaultRuntimeDirectory() {
-  const auto variable = [](const char* name) {
-    const char* value = std::getenv(name);
-    return std::string(value == nullptr ? "" : value);
-  };
-  if (variable("RUNTIME_DIRECTORY").empty()) {
-    const std::string own = variable("XDG_RUNTIME_DIR");
-    if (!own.empty()) return platform::joinPath(own, "tallow");
+  // Root may have a daemon of its own beside the system's.
+  const char* const own = std::getenv("XDG_RUNTIME_DIR");
+  const char* const given = std::getenv("RUNTIME_DIRECTORY");
+  if (geteuid() == 0 && own != nullptr && *own == '/' && (given == nullptr || *given == '\0')) {
+    std::string directory = platform::joinPath(own, "tallow");
+    if (platform::fileExists(directory)) return directory;
   }
   return platform::runtimeDirectory();
 }

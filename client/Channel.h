@@ -33,7 +33,8 @@ inline constexpr std::chrono::seconds kLongTimeout = std::chrono::hours(6);
 // How long to wait for a daemon that is not there.
 using Patience = std::chrono::milliseconds;
 
-// $RUNTIME_DIRECTORY, else tallow in $XDG_RUNTIME_DIR, else /run/tallow.
+// $RUNTIME_DIRECTORY, else tallow in $XDG_RUNTIME_DIR (for root only if it exists), else
+// /run/tallow.
 [[nodiscard]] std::string defaultRuntimeDirectory();
 
 // The connection to one service of the daemon, over the socket of that name in the runtime

@@ -80,29 +80,26 @@ void TLDeviceLockMonitor::lockStateChanged() {
 }
 
 void TLDeviceLockMonitor::notifyDelegate(Call call, bool readDelegateAgain) {
-  const auto delegate = _delegate.lock();
-  if (delegate == nullptr) return;
-  const auto queue = _delegateQueue.lock();
+  const auto observer = _delegate->lock();
+  if (observer == nullptr) return;
+  const auto queue = _delegate->lockQueue();
   if (queue == nullptr) {
-    ((*delegate).*call)();
+    ((*observer).*call)();
   } else if (!readDelegateAgain) {
-    queue->submit([delegate, call] { ((*delegate).*call)(); });
+    queue->submit([observer, call] { ((*observer).*call)(); });
   } else {
-    // The delegate of that time; it is read on the queue that it belongs to.
-    const bool submitted = queue->async([this, call] {
-      std::shared_ptr<TLDeviceLockObserver> current;
-      _dispatchQueue.sync([&] { current = _delegate.lock(); });
-      if (current != nullptr) ((*current).*call)();
+    queue->submit([delegate = _delegate, call] {
+      if (const auto current = delegate->lock()) ((*current).*call)();
     });
-    if (!submitted) ((*delegate).*call)();
   }
 }
 
 void TLDeviceLockMonitor::setDelegate(const std::shared_ptr<TLDeviceLockObserver>& delegate,
                                       const std::shared_ptr<platform::SerialQueue>& delegateQueue) {
   _dispatchQueue.sync([&] {
-    _delegate = delegate;
-    _delegateQueue = delegateQueue;
+    platform::MutexLock lock(_delegate->mutex);
+    _delegate->observer = delegate;
+    _delegate->queue = delegateQueue;
   });
 }
 

@@ -54,9 +54,23 @@ class TLDeviceLockMonitor {
   int32_t _lockStateNotifyToken = -1;
   std::atomic<bool> _deviceUnlockedSinceBoot;
   std::atomic<bool> _protectedDataAvailable{false};
-  // Of the queue's thread.
-  std::weak_ptr<TLDeviceLockObserver> _delegate;
-  std::weak_ptr<platform::SerialQueue> _delegateQueue;
+  // What setDelegate sets; shared with calls on the delegate's queue, which may outlive the
+  // monitor.
+  struct Delegate {
+    platform::Mutex mutex;
+    std::weak_ptr<TLDeviceLockObserver> observer TL_GUARDED_BY(mutex);
+    std::weak_ptr<platform::SerialQueue> queue TL_GUARDED_BY(mutex);
+
+    std::shared_ptr<TLDeviceLockObserver> lock() TL_EXCLUDES(mutex) {
+      platform::MutexLock held(mutex);
+      return observer.lock();
+    }
+    std::shared_ptr<platform::SerialQueue> lockQueue() TL_EXCLUDES(mutex) {
+      platform::MutexLock held(mutex);
+      return queue.lock();
+    }
+  };
+  const std::shared_ptr<Delegate> _delegate = std::make_shared<Delegate>();
   platform::SerialQueue _dispatchQueue;  // last, so that it ends before what its items use
 };
 

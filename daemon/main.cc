@@ -5,6 +5,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstring>
+#include <string_view>
 
 #include "daemon/TALDaemon.h"
 #include "daemon/TLDeviceLockMonitor.h"
@@ -17,7 +18,7 @@
 
 namespace {
 
-constexpr std::array<int, 3> kEndingSignals{SIGHUP, SIGPIPE, SIGTERM};
+constexpr std::array<int, 4> kEndingSignals{SIGHUP, SIGINT, SIGPIPE, SIGTERM};
 constexpr int kCaptureSignal = SIGUSR1;
 constexpr mode_t kPrivateUmask = 0077;
 
@@ -39,9 +40,35 @@ int fail(const std::optional<TLError>& error) {
   return 1;
 }
 
+constexpr const char* kUsage =
+    "Usage: tallowsearchd [--help | --version]\n"
+    "\n"
+    "Keeps a private full-text index of mail and answers queries over local sockets, until it "
+    "gets\n"
+    "SIGTERM, SIGINT or SIGHUP. Data is kept in $STATE_DIRECTORY, sockets are in\n"
+    "$RUNTIME_DIRECTORY; see tallowsearchd(8) for where they are unless set.\n";
+
+// The status to end with: 2 for anything that is not understood, so that a mistyped option never
+// leaves a daemon running.
+int answerCommandLine(int argc, char** argv) {
+  const std::string_view argument = argv[1];
+  if (argc == 2 && argument == "--help") {
+    std::fputs(kUsage, stdout);
+    return 0;
+  }
+  if (argc == 2 && argument == "--version") {
+    std::puts("tallowsearchd " TALLOW_VERSION);
+    return 0;
+  }
+  std::fprintf(stderr, "tallowsearchd: unexpected argument: %s\n%s", argv[argc == 2 ? 1 : 2],
+               kUsage);
+  return 2;
+}
+
 }  // namespace
 
-int main() {
+int main(int argc, char** argv) {
+  if (argc > 1) return answerCommandLine(argc, argv);
   umask(kPrivateUmask);
   platform::limitMemoryArenas();
   platform::raiseDescriptorLimit();  // each class may hold a thousand table files open

@@ -74,15 +74,25 @@ UDateFormat* openFormat(const char16_t* pattern, Mode mode) {
   return format;
 }
 
+// The quoted text that a pattern ends with.
+TLStringView literalEnding(TLStringView pattern) {
+  if (!pattern.ends_with(u'\'')) return {};
+  pattern.remove_suffix(1);
+  return pattern.substr(pattern.rfind(u'\'') + 1);
+}
+
 }  // namespace
 
 TALDateFormatter::TALDateFormatter(const char16_t* pattern, Mode mode)
-    : _format(std::make_unique<Format>(openFormat(pattern, mode))) {}
+    : _format(std::make_unique<Format>(openFormat(pattern, mode))),
+      _ending(mode == Mode::strict ? literalEnding(pattern) : TLStringView()) {}
 
 TALDateFormatter::~TALDateFormatter() = default;
 
 std::optional<double> TALDateFormatter::dateFromString(TLStringView text) const {
   if (text.empty() || text.size() > kLongestDate) return std::nullopt;
+  // ICU takes a text that ends before its pattern's last literal, however strict.
+  if (!text.ends_with(_ending)) return std::nullopt;
   const auto length = static_cast<int32_t>(text.size());
   platform::MutexLock lock(_mutex);
   UErrorCode status = U_ZERO_ERROR;

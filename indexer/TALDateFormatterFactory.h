@@ -16,6 +16,7 @@ class TALDateFormatter {
  public:
   enum class Mode { strict, lenient };
 
+  // `pattern` outlives this.
   TALDateFormatter(const char16_t* pattern, Mode mode);
   ~TALDateFormatter();
   TALDateFormatter(const TALDateFormatter&) = delete;
@@ -30,6 +31,7 @@ class TALDateFormatter {
 
   mutable platform::Mutex _mutex;
   const std::unique_ptr<Format> _format TL_PT_GUARDED_BY(_mutex);
+  const TLStringView _ending;  // of each strict date; part of the pattern, which lives as long
 };
 
 // Makes formatters of ISO 8601. Those of a list are lenient and to be tried in order, so that a

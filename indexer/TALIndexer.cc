@@ -184,7 +184,7 @@ void TALIndexer::makeVocabulary() {
     _topKVocab = std::make_shared<TALTopKVocab>(store, _textStore.get());
   }
   if (_spellCorrection == nullptr) {
-    _spellCorrection = std::make_unique<TALSpellCorrection>(_textStore.get(), _topKVocab);
+    _spellCorrection = std::make_unique<TALSpellCorrection>(_topKVocab);
   }
 }
 

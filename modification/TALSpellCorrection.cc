@@ -72,11 +72,9 @@ const platform::Log& TALSpellCorrection::log() {
   return handle;
 }
 
-TALSpellCorrection::TALSpellCorrection(const salt::Index* textStore,
-                                       std::shared_ptr<const TALTopKVocab> topKVocab,
+TALSpellCorrection::TALSpellCorrection(std::shared_ptr<const TALTopKVocab> topKVocab,
                                        int64_t candidateBudget, int64_t inLexiconCandidateBudget)
-    : _textStore(textStore),
-      _candidateBudget(candidateBudget),
+    : _candidateBudget(candidateBudget),
       _inLexiconCandidateBudget(inLexiconCandidateBudget),
       _topKVocab(std::move(topKVocab)) {}
 
@@ -97,8 +95,7 @@ bool TALSpellCorrection::_doNotCorrect(const saltsearch::Term& term) {
 
 float TALSpellCorrection::correctSpelling(const std::vector<saltsearch::Term>& terms,
                                           std::vector<saltsearch::Term>& correctedTerms,
-                                          const salt::Index& withTextStore) {
-  _textStore = &withTextStore;
+                                          const salt::Index& withTextStore) const {
   const auto mayCorrect = [](const saltsearch::Term& term) { return !_doNotCorrect(term); };
   const auto found = std::find_if(terms.begin(), terms.end(), mayCorrect);
   if (found == terms.end()) {
@@ -112,14 +109,14 @@ float TALSpellCorrection::correctSpelling(const std::vector<saltsearch::Term>& t
   const auto target = static_cast<size_t>(found - terms.begin());
   const std::string& word = found->tokens[0];
   log().standard("No match token <{}> is considered for spelling correction.", redacted(word));
-  std::vector<TALCorrectionCandidate> candidates = _getCandidates(word, *found);
+  std::vector<TALCorrectionCandidate> candidates = _getCandidates(word, *found, withTextStore);
   if (candidates.empty()) {
     log().standard("No candidates found in lexicon.");
     return -1;
   }
   log().standard("Found {} candidates in lexicon.", candidates.size());
 
-  score(terms, target, &candidates);
+  score(terms, target, withTextStore, &candidates);
   // Of equal ones the first generated.
   const auto best = std::max_element(
       candidates.begin(), candidates.end(),
@@ -143,11 +140,12 @@ float TALSpellCorrection::correctSpelling(const std::vector<saltsearch::Term>& t
 
 // The whole query, with the other terms, judges each candidate.
 void TALSpellCorrection::score(const std::vector<saltsearch::Term>& terms, size_t target,
-                               std::vector<TALCorrectionCandidate>* candidates) const {
+                               const salt::Index& textStore,
+                               std::vector<TALCorrectionCandidate>* candidates) {
   std::vector<std::string> tokens;
   tokens.reserve(candidates->size());
   for (const auto& candidate : *candidates) tokens.push_back(candidate._token);
-  const auto best = saltsearch::BestScores(*_textStore, terms, target, tokens, kScoring);
+  const auto best = saltsearch::BestScores(textStore, terms, target, tokens, kScoring);
   for (size_t i = 0; i < candidates->size(); ++i) {
     TALCorrectionCandidate& candidate = (*candidates)[i];
     if (best[i]) {
@@ -159,14 +157,14 @@ void TALSpellCorrection::score(const std::vector<saltsearch::Term>& terms, size_
 }
 
 std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidates(
-    std::string_view word, saltsearch::Term term) const {
+    std::string_view word, saltsearch::Term term, const salt::Index& textStore) const {
   const bool wholeWord = word.ends_with(' ');
   word = withoutTrailingBlank(word);
   if (!isPrintableASCII(word)) {
     log().debug("Token has unsupported char.");
   } else {
     term.tokenScores[0] = 1.0;
-    auto candidates = _foundInIndex(editOneCandidates(word), wholeWord, term);
+    auto candidates = _foundInIndex(editOneCandidates(word), wholeWord, term, textStore);
     if (!candidates.empty()) return candidates;
   }
   log().standard(
@@ -175,15 +173,15 @@ std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidates(
 }
 
 std::vector<TALCorrectionCandidate> TALSpellCorrection::_foundInIndex(
-    std::vector<TALCorrectionCandidate> candidates, bool wholeWord,
-    const saltsearch::Term& term) const {
+    std::vector<TALCorrectionCandidate> candidates, bool wholeWord, const saltsearch::Term& term,
+    const salt::Index& textStore) const {
   std::vector<std::string> tokens;
   tokens.reserve(candidates.size());
   for (auto& candidate : candidates) {
     if (wholeWord) candidate._token += ' ';
     tokens.push_back(candidate._token);
   }
-  const auto found = saltsearch::AnyDocument(*_textStore, term, tokens, kProbeSuffixes);
+  const auto found = saltsearch::AnyDocument(textStore, term, tokens, kProbeSuffixes);
   std::vector<TALCorrectionCandidate> kept;
   for (size_t i = 0; i < candidates.size(); ++i) {
     if (static_cast<int64_t>(kept.size()) >= _inLexiconCandidateBudget) break;

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <array>
-#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <string>
@@ -25,22 +24,22 @@ struct TALCorrectionCandidate {
 // word at one edit from it, or else by one of the most frequent words.
 //
 // A token with a trailing blank is a whole word, one without is a prefix; candidates are the same.
-// Threads: any number may correct at once. The index given to a call outlives that call.
+// Threads: any number may correct at once, each in an index of its own, which outlives the call.
 class TALSpellCorrection {
  public:
   static constexpr int64_t kCandidateBudget = 1000;
   static constexpr int64_t kInLexiconCandidateBudget = 100;
 
-  TALSpellCorrection(const salt::Index* textStore, std::shared_ptr<const TALTopKVocab> topKVocab,
-                     int64_t candidateBudget = kCandidateBudget,
-                     int64_t inLexiconCandidateBudget = kInLexiconCandidateBudget);
+  explicit TALSpellCorrection(std::shared_ptr<const TALTopKVocab> topKVocab,
+                              int64_t candidateBudget = kCandidateBudget,
+                              int64_t inLexiconCandidateBudget = kInLexiconCandidateBudget);
 
   // `terms` as a search has left them, `found` set. Above 0: `correctedTerms` is `terms` with
   // another first token, of score 1, in one term, and the result is how good it is; else -1, and
   // `correctedTerms` is what it was.
   [[nodiscard]] float correctSpelling(const std::vector<saltsearch::Term>& terms,
                                       std::vector<saltsearch::Term>& correctedTerms,
-                                      const salt::Index& withTextStore);
+                                      const salt::Index& withTextStore) const;
 
   // "a" to "z".
   [[nodiscard]] static const std::array<std::string, 26>& kLettersEn();
@@ -54,8 +53,8 @@ class TALSpellCorrection {
 
   // The candidates for the first token of `term`: those at one edit that the index holds, else
   // those of the vocabulary.
-  [[nodiscard]] std::vector<TALCorrectionCandidate> _getCandidates(std::string_view word,
-                                                                   saltsearch::Term term) const;
+  [[nodiscard]] std::vector<TALCorrectionCandidate> _getCandidates(
+      std::string_view word, saltsearch::Term term, const salt::Index& textStore) const;
   // `isPrefix` makes no difference.
   [[nodiscard]] std::vector<TALCorrectionCandidate> _getCandidatesFromTopKVocab(
       std::string_view word, bool isPrefix) const;
@@ -66,12 +65,11 @@ class TALSpellCorrection {
   // The candidates of which the index holds a document, in order, up to the budget; their tokens
   // get the blank back.
   std::vector<TALCorrectionCandidate> _foundInIndex(std::vector<TALCorrectionCandidate> candidates,
-                                                    bool wholeWord,
-                                                    const saltsearch::Term& term) const;
-  void score(const std::vector<saltsearch::Term>& terms, size_t target,
-             std::vector<TALCorrectionCandidate>* candidates) const;
+                                                    bool wholeWord, const saltsearch::Term& term,
+                                                    const salt::Index& textStore) const;
+  static void score(const std::vector<saltsearch::Term>& terms, size_t target,
+                    const salt::Index& textStore, std::vector<TALCorrectionCandidate>* candidates);
 
-  std::atomic<const salt::Index*> _textStore;  // of the latest call
   const int64_t _candidateBudget;
   const int64_t _inLexiconCandidateBudget;
   const std::shared_ptr<const TALTopKVocab> _topKVocab;  // may be null

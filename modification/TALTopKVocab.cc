@@ -83,9 +83,31 @@ void TALTopKVocab::setVocab(Words words) {
   _vocab = std::move(made);
 }
 
+void TALTopKVocab::setCounted(Words words) {
+  auto made = std::make_shared<const Words>(std::move(words));
+  MutexLock lock(_vocabMutex);
+  _vocab = std::move(made);
+  _newerThanStored = true;
+  ++_counts;
+}
+
+bool TALTopKVocab::setStored(Words words, uint64_t counts) {
+  auto made = std::make_shared<const Words>(std::move(words));
+  MutexLock lock(_vocabMutex);
+  if (_newerThanStored || counts != _counts) return false;
+  _vocab = std::move(made);
+  return true;
+}
+
+uint64_t TALTopKVocab::counts() const {
+  MutexLock lock(_vocabMutex);
+  return _counts;
+}
+
 void TALTopKVocab::loadTopKVocabFromDocStore(TLErrorOut error) {
   if (_docStore == nullptr) return;
   std::optional<TLError> failure;
+  const uint64_t countsBefore = counts();
   const auto blob = _docStore->loadTopKVocab(&failure);
   if (failure) {
     log().standard("TopK is not loaded from docstore: {}", platform::printable(failure));
@@ -99,14 +121,13 @@ void TALTopKVocab::loadTopKVocabFromDocStore(TLErrorOut error) {
   }
   if (entries->size() != 3) return;
   auto words = topkvocab::unarchiveWords(entries->at(0));
+  if (!setStored(words.value_or(Words()), countsBefore)) return;
   if (!words) {
-    setVocab({});
     const TLError noWords = damaged("words");
     log().error("TopK cannot be unarchived: {}", platform::printable(noWords));
     platform::setError(error, noWords);
     return;
   }
-  setVocab(std::move(*words));
   log().standard("TopK loaded from docstore.");
   if (const auto docID = topkvocab::unarchiveDocID(entries->at(1))) {
     _lastTopKRebuildDocID = *docID;
@@ -146,7 +167,7 @@ void TALTopKVocab::rebuildUnlessOneWaits() {
   const bool submitted = _topKVocabQueue->async([this] {
     rest();
     _rebuildWaits = false;
-    rebuild();
+    rebuild(true);
   });
   if (!submitted) _rebuildWaits = false;
 }
@@ -170,13 +191,13 @@ void TALTopKVocab::_rebuildTopKVocabWithCompletionHandler(Completion handler) {
       MutexLock lock(_restMutex);
       --_askedFor;
     }
-    const std::optional<TLError> outcome = rebuild();
+    const std::optional<TLError> outcome = rebuild(false);
     if (completion) completion(outcome);
   });
 }
 
 // The figures change before the work, so that a rebuild that is given up counts as done.
-std::optional<TLError> TALTopKVocab::rebuild() {
+std::optional<TLError> TALTopKVocab::rebuild(bool routine) {
   log().standard("Starting to rebuild topK vocab from SALT.");
   _lastTopKRebuildDocID = _maxDocID.load();
   _lastTopKRebuildDate = platform::secondsSince1970();
@@ -184,7 +205,10 @@ std::optional<TLError> TALTopKVocab::rebuild() {
     log().standard("TopKVocab is shutting down before TopKTokens.");
     return std::nullopt;
   }
-  count();
+  if (!count(routine)) {
+    if (_isShutdown) log().standard("TopKVocab is shutting down before storeTopKVocab.");
+    return std::nullopt;
+  }
   log().standard("Rebuild date: {}.", dateText(_lastTopKRebuildDate));
   log().standard("Rebuild docID: {}.", _lastTopKRebuildDocID.load());
   log().standard("TopK vocab has {} tokens.", vocab()->size());
@@ -198,20 +222,20 @@ std::optional<TLError> TALTopKVocab::rebuild() {
   return store(blob);
 }
 
-// A count that a shutdown cuts short leaves the words as they were.
-void TALTopKVocab::count() {
+bool TALTopKVocab::count(bool routine) {
   const auto start = platform::threadProcessorTime();
-  const auto tokens =
-      saltsearch::TopKTokens(*_textStore, kWords, saltsearch::ZoneScoreDefault,
-                             saltsearch::TokenizeSpace, [this] { return !_isShutdown; });
-  if (_isShutdown) return;
+  const auto goesOn = [this, routine] { return !_isShutdown && !(routine && _askedFor != 0); };
+  const auto tokens = saltsearch::TopKTokens(*_textStore, kWords, saltsearch::ZoneScoreDefault,
+                                             saltsearch::TokenizeSpace, goesOn);
+  if (!goesOn()) return false;
   Words words;
   words.reserve(tokens.size());
   for (const auto& [token, weight] : tokens) words.push_back(token);
-  setVocab(std::move(words));
+  setCounted(std::move(words));
   const auto taken = platform::threadProcessorTime() - start;
   MutexLock lock(_restMutex);
   _restUntil = std::chrono::steady_clock::now() + _rest * taken;
+  return true;
 }
 
 std::optional<TLError> TALTopKVocab::store(const std::string& blob) {
@@ -221,6 +245,8 @@ std::optional<TLError> TALTopKVocab::store(const std::string& blob) {
     log().error("Rebuilt topK vocab cannot be saved to docstore: {}", platform::printable(failure));
   } else {
     log().standard("Rebuilt topK vocab saved to docstore.");
+    MutexLock lock(_vocabMutex);
+    _newerThanStored = false;
   }
   return failure;
 }

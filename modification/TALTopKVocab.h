@@ -40,8 +40,8 @@ class TALTopKVocab {
   TALTopKVocab(const TALTopKVocab&) = delete;
   TALTopKVocab& operator=(const TALTopKVocab&) = delete;
 
-  // Replaces words and figures by the stored ones. None stored, or damaged ones, is an error; words
-  // of another shape are passed over without one.
+  // Replaces words and figures by the stored ones, unless those in memory are newer. None stored,
+  // or damaged ones, is an error; words of another shape are passed over without one.
   void loadTopKVocabFromDocStore(TLErrorOut error);
 
   // Starts a rebuild when it is due, or forced. The handler, which may be empty, gets the outcome;
@@ -79,9 +79,14 @@ class TALTopKVocab {
   // On the queue: sees to it that counting stays a small part of all time, however fast documents
   // come. Ends early for a rebuild that was asked for and at shutdown.
   void rest() TL_EXCLUDES(_restMutex);
-  // The body of a rebuild, on the queue.
-  std::optional<TLError> rebuild();
-  void count();
+  // The body of a rebuild, on the queue. A routine one gives way to one that was asked for.
+  std::optional<TLError> rebuild(bool routine);
+  // False, with the words as they were, when the count was cut short.
+  [[nodiscard]] bool count(bool routine) TL_EXCLUDES(_restMutex, _vocabMutex);
+  void setCounted(Words words) TL_EXCLUDES(_vocabMutex);
+  // Sets what the store had after `counts` counts; false where newer words are in memory.
+  [[nodiscard]] bool setStored(Words words, uint64_t counts) TL_EXCLUDES(_vocabMutex);
+  [[nodiscard]] uint64_t counts() const TL_EXCLUDES(_vocabMutex);
   std::optional<TLError> store(const std::string& blob);
 
   const std::shared_ptr<TALDocStore> _docStore;
@@ -95,9 +100,12 @@ class TALTopKVocab {
   platform::Mutex _restMutex;
   std::condition_variable_any _restEnds;
   std::chrono::steady_clock::time_point _restUntil TL_GUARDED_BY(_restMutex);
-  size_t _askedFor TL_GUARDED_BY(_restMutex) = 0;  // rebuilds that wait and were asked for
+  std::atomic<size_t> _askedFor{
+      0};  // rebuilds that wait and were asked for; changed under the mutex
   mutable platform::Mutex _vocabMutex;
   std::shared_ptr<const Words> _vocab TL_GUARDED_BY(_vocabMutex);
+  bool _newerThanStored TL_GUARDED_BY(_vocabMutex) = false;  // counted, and not in the store yet
+  uint64_t _counts TL_GUARDED_BY(_vocabMutex) = 0;           // that have set the words
   // None without store or index. Last, so that it ends before what its work uses.
   std::optional<platform::SerialQueue> _topKVocabQueue;
 };

@@ -8,9 +8,11 @@
 #include <array>
 #include <cerrno>
 #include <sstream>
+#include <system_error>
 #include <thread>
 #include <utility>
 
+#include "platform/FileDescriptor.h"
 #include "platform/Files.h"
 #include "platform/Mutex.h"
 #include "platform/Paths.h"
@@ -55,58 +57,90 @@ class FileDeviceVault : public DeviceVault {
                                 std::function<void()> handler, int32_t* token) override {
     MutexLock lock(_mutex);
     if (_watcher.joinable()) return EBUSY;
-    _inotify = inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
-    if (_inotify < 0) return static_cast<uint32_t>(errno);
-    const size_t slash = _path.rfind('/');
-    const std::string directory = slash == std::string::npos ? "." : _path.substr(0, slash);
-    if (inotify_add_watch(_inotify, directory.c_str(),
-                          IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE) < 0) {
-      const int code = errno;
-      close(_inotify);
-      return static_cast<uint32_t>(code);
+    FileDescriptor inotify(inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
+    if (inotify.get() < 0) return static_cast<uint32_t>(errno);
+    if (!addWatch(inotify.get())) return static_cast<uint32_t>(errno);
+    FileDescriptor end(eventfd(0, EFD_CLOEXEC));
+    if (end.get() < 0) return static_cast<uint32_t>(errno);
+    try {
+      _watcher = std::thread([this, inotify = inotify.get(), end = end.get(), &queue,
+                              call = std::move(handler)] { watch(inotify, end, queue, call); });
+    } catch (const std::system_error&) {
+      return EAGAIN;
     }
-    _end = eventfd(0, EFD_CLOEXEC);
-    _watcher = std::thread([this, name = _path.substr(slash + 1), &queue,
-                            call = std::move(handler)] { watch(name, queue, call); });
-    *token = _inotify;
+    *token = inotify.get();
+    _inotify = std::move(inotify);
+    _end = std::move(end);
     return 0;
   }
 
   void cancel(int32_t) override { endWatch(); }
 
  private:
-  void watch(const std::string& name, SerialQueue& queue,
-             const std::function<void()>& handler) const {
+  static constexpr int kLookAgainMilliseconds = 1000;
+
+  [[nodiscard]] bool addWatch(int inotify) const {
+    const size_t slash = _path.rfind('/');
+    const std::string directory = slash == std::string::npos ? "." : _path.substr(0, slash);
+    return inotify_add_watch(inotify, directory.c_str(),
+                             IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE |
+                                 IN_MOVE_SELF | IN_ONLYDIR) >= 0;
+  }
+
+  // The directory may be replaced by another of its name. While there is none, this looks for it
+  // once a second.
+  void watch(int inotify, int end, SerialQueue& queue, const std::function<void()>& handler) const {
     setThreadName("tallow.vault");
-    std::array<pollfd, 2> descriptors{{{_inotify, POLLIN, 0}, {_end, POLLIN, 0}}};
-    alignas(inotify_event) std::array<char, 4096> buffer;
+    std::array<pollfd, 2> descriptors{{{inotify, POLLIN, 0}, {end, POLLIN, 0}}};
+    bool watching = true;
     for (;;) {
-      if (poll(descriptors.data(), descriptors.size(), -1) < 0 && errno != EINTR) return;
+      const int timeout = watching ? -1 : kLookAgainMilliseconds;
+      if (poll(descriptors.data(), descriptors.size(), timeout) < 0 && errno != EINTR) return;
       if (descriptors[1].revents != 0) return;
-      const ssize_t size = read(_inotify, buffer.data(), buffer.size());
-      for (ssize_t at = 0; at < size;) {
-        const auto* event = reinterpret_cast<const inotify_event*>(buffer.data() + at);
-        if (event->len != 0 && name == event->name) queue.submit(handler);
-        at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
-      }
+      const Changes changes = readChanges(inotify);
+      if (changes.ofDirectory) watching = false;
+      const bool found = !watching && addWatch(inotify);
+      if (found) watching = true;
+      if (changes.ofStatus || changes.ofDirectory || found) queue.submit(handler);
     }
+  }
+
+  struct Changes {
+    bool ofStatus = false;
+    bool ofDirectory = false;  // it is no longer the one that the path names
+  };
+
+  [[nodiscard]] Changes readChanges(int inotify) const {
+    Changes changes;
+    const std::string name = _path.substr(_path.rfind('/') + 1);
+    alignas(inotify_event) std::array<char, 4096> buffer;
+    const ssize_t size = read(inotify, buffer.data(), buffer.size());
+    for (ssize_t at = 0; at < size;) {
+      const auto* event = reinterpret_cast<const inotify_event*>(buffer.data() + at);
+      if (event->len != 0 && name == event->name) changes.ofStatus = true;
+      if ((event->mask & IN_Q_OVERFLOW) != 0) changes.ofStatus = true;
+      if ((event->mask & IN_MOVE_SELF) != 0) inotify_rm_watch(inotify, event->wd);
+      if ((event->mask & (IN_MOVE_SELF | IN_IGNORED)) != 0) changes.ofDirectory = true;
+      at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
+    }
+    return changes;
   }
 
   void endWatch() {
     MutexLock lock(_mutex);
     if (!_watcher.joinable()) return;
     const uint64_t one = 1;
-    [[maybe_unused]] const ssize_t n = write(_end, &one, sizeof one);
+    [[maybe_unused]] const ssize_t n = write(_end.get(), &one, sizeof one);
     _watcher.join();
-    close(_inotify);
-    close(_end);
+    _inotify.reset();
+    _end.reset();
   }
 
   const std::string _path;
   Mutex _mutex;
   std::thread _watcher TL_GUARDED_BY(_mutex);
-  int _inotify = -1;  // fixed while the watcher runs
-  int _end = -1;
+  FileDescriptor _inotify TL_GUARDED_BY(_mutex);
+  FileDescriptor _end TL_GUARDED_BY(_mutex);
 };
 
 }  // namespace

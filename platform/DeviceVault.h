@@ -37,8 +37,9 @@ namespace platform {
 [[nodiscard]] DeviceVault& deviceVault();
 
 // A vault over a text file that holds the lock state and 0 or 1 for unlocked-since-boot, separated
-// by blanks. Without the file the device counts as unlocked; a garbled one counts as locked and not
-// yet unlocked. Its directory is watched with inotify, on a thread that the vault owns and joins.
+// by spaces. Without the file the device counts as unlocked; a garbled one counts as locked and not
+// yet unlocked. Its directory is watched with inotify, also after another has taken its
+// place, on a thread that the vault owns and joins.
 [[nodiscard]] std::unique_ptr<DeviceVault> makeFileDeviceVault(std::string path);
 
 }  // namespace platform

@@ -4,10 +4,12 @@
 #include <sys/uio.h>
 #define SD_JOURNAL_SUPPRESS_LOCATION
 #include <systemd/sd-journal.h>
+#include <unistd.h>
 
 #include <array>
 #include <atomic>
-#include <cstdio>
+#include <cerrno>
+#include <csignal>
 #include <cstdlib>
 
 #include "platform/Mutex.h"
@@ -65,13 +67,30 @@ void writeToJournal(std::string_view subsystem, std::string_view category, LogLe
   sd_journal_sendv(parts.data(), static_cast<int>(parts.size()));
 }
 
-// One message is one line: line ends and other control characters inside it come out as blanks.
+// The kernel sends SIGPIPE to the thread that writes, which only the main thread's loop would hear.
+// It goes to the process instead, so that a log that nobody reads ends the daemon in order,
+// whichever thread meets it first.
+void writeLine(std::string_view line) {
+  while (!line.empty()) {
+    const ssize_t written = write(STDERR_FILENO, line.data(), line.size());
+    if (written >= 0) {
+      line.remove_prefix(static_cast<size_t>(written));
+    } else if (errno == EPIPE) {
+      kill(getpid(), SIGPIPE);
+      return;
+    } else if (errno != EINTR) {
+      return;  // a message that cannot be written is lost
+    }
+  }
+}
+
+// One message is one line: line ends and other control characters inside it come out as spaces.
 void writeToStandardError(std::string_view subsystem, std::string_view category, LogLevel level,
                           std::string_view message) {
   std::string line = fmt::format("{:<7} {}:{} ", row(level).name, subsystem, category);
   for (const char c : message) line += static_cast<unsigned char>(c) < 0x20 || c == 0x7F ? ' ' : c;
   line += '\n';
-  std::fwrite(line.data(), 1, line.size(), stderr);
+  writeLine(line);
 }
 
 }  // namespace

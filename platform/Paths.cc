@@ -1,26 +1,46 @@
 #include "platform/Paths.h"
 
+#include <unistd.h>
+
 #include <cstdlib>
 
 namespace platform {
 
 namespace {
 
-std::string directoryFromEnvironment(const char* variable, const char* fallback) {
-  const char* value = std::getenv(variable);
-  if (value == nullptr || *value == '\0') return fallback;
-  const std::string_view list(value);
-  return std::string(list.substr(0, list.find(':')));
+std::string_view variable(const char* name) {
+  const char* value = std::getenv(name);
+  return value == nullptr ? "" : value;
+}
+
+// Empty unless it names an absolute path: one relative to wherever the program was started is not
+// what anybody means.
+std::string_view directoryVariable(const char* name) {
+  const std::string_view value = variable(name);
+  return value.starts_with('/') ? value : "";
+}
+
+// `given` is the variable of systemd, `base` the directory of the user's own, empty for none.
+std::string chooseDirectory(const char* given, const std::string& base, const char* system) {
+  if (const std::string_view list = variable(given); !list.empty()) {
+    return std::string(list.substr(0, list.find(':')));
+  }
+  return base.empty() || geteuid() == 0 ? system : joinPath(base, "tallow");
 }
 
 }  // namespace
 
 std::string stateDirectory() {
-  return directoryFromEnvironment("STATE_DIRECTORY", "/var/lib/tallow");
+  std::string base(directoryVariable("XDG_STATE_HOME"));
+  if (const std::string home(directoryVariable("HOME")); base.empty() && !home.empty()) {
+    base = joinPath(home, ".local/state");
+  }
+  return chooseDirectory("STATE_DIRECTORY", base, "/var/lib/tallow");
 }
 
 std::string runtimeDirectory() {
-  return directoryFromEnvironment("RUNTIME_DIRECTORY", "/run/tallow");
+  return chooseDirectory("RUNTIME_DIRECTORY", std::string(directoryVariable("XDG_RUNTIME_DIR")),
+                         "/run/tallow");
 }
 
 std::string processLockPath(const std::string& state) {

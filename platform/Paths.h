@@ -5,11 +5,13 @@
 
 namespace platform {
 
-// $STATE_DIRECTORY or /var/lib/tallow: data root, synonym file and defaults file lie below it. Of a
-// colon-separated list, as systemd may set it, the first entry counts.
+// $STATE_DIRECTORY; else, for a user who is not root, tallow below $XDG_STATE_HOME, which is
+// ~/.local/state unless set; else /var/lib/tallow. Data root, synonym file and defaults file lie
+// below it. Of a colon-separated list, as systemd may set it, the first entry counts.
 [[nodiscard]] std::string stateDirectory();
 
-// $RUNTIME_DIRECTORY or /run/tallow: sockets and the lock status lie below it.
+// $RUNTIME_DIRECTORY; else, for a user who is not root, tallow below $XDG_RUNTIME_DIR; else
+// /run/tallow. Sockets and the lock status lie below it.
 [[nodiscard]] std::string runtimeDirectory();
 
 // What a running daemon holds as long as it may touch anything below its state directory.

@@ -104,7 +104,7 @@ TLQueryNodeOp TLQueryAdditions::_lookupOperator(int32_t token) {
 TLAttributeKey TLQueryAdditions::_lookupAttribute(std::string_view name) {
   const auto key = TLAttributeKeyForQueryName(name);
   if (!key) {
-    log().error("Unknown attribute key: {}", platform::redacted(platform::fromUTF8(name)));
+    log().error("Unknown attribute key: {}", name);
   }
   return key.value_or(TLAttributeKey::UNKNOWN);
 }

@@ -201,7 +201,8 @@ struct TLFieldKind<std::shared_ptr<Record>> {
   }
   static bool equal(const Value& a, const Value& b) {
     const recordfields::NestingGuard guard;
-    return a == b || (a != nullptr && b != nullptr && a->isEqual(*b));
+    // Also of a record with itself: one that holds NaN equals nothing.
+    return a != nullptr && b != nullptr ? a->isEqual(*b) : a == b;
   }
   static uint64_t hash(const Value& value) {
     const recordfields::NestingGuard guard;

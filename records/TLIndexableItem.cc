@@ -107,9 +107,18 @@ const TLAttribute& attributeOrEmpty(const TLIndexableItem& item, TLAttributeKey 
   return attribute ? *attribute : empty;
 }
 
+// An empty list is one that was set where the attribute has no other value.
 template <typename Element>
-const std::vector<Element>* nullIfEmpty(const std::vector<Element>& list) {
-  return list.empty() ? nullptr : &list;
+const std::vector<Element>* listOf(const TLAttribute* attribute,
+                                   const std::vector<Element>& (TLAttribute::*list)() const) {
+  if (attribute == nullptr) return nullptr;
+  const std::vector<Element>& found = (attribute->*list)();
+  const bool otherValue = attribute->hasStringValue() || attribute->hasIntValue() ||
+                          attribute->hasFloatValue() || attribute->hasDoubleValue() ||
+                          attribute->hasBoolValue() || attribute->hasPersonValue() ||
+                          attribute->hasBytesValue() || attribute->stringValuesCount() != 0 ||
+                          attribute->personValuesCount() != 0;
+  return found.empty() && otherValue ? nullptr : &found;
 }
 
 }  // namespace
@@ -144,9 +153,9 @@ const std::optional<TLString>& TLIndexableItem::stringValueForKey(TLAttributeKey
 
 const std::vector<std::shared_ptr<TLPerson>>* TLIndexableItem::personValuesForKey(
     TLAttributeKey key) const {
-  return nullIfEmpty(attributeOrEmpty(*this, key).personValues());
+  return listOf(attributeForKey(key).get(), &TLAttribute::personValues);
 }
 
 const std::vector<TLString>* TLIndexableItem::stringValuesForKey(TLAttributeKey key) const {
-  return nullIfEmpty(attributeOrEmpty(*this, key).stringValues());
+  return listOf(attributeForKey(key).get(), &TLAttribute::stringValues);
 }

@@ -51,7 +51,7 @@ class TLIndexableItem final : public TLRecord<TLIndexableItem> {
   [[nodiscard]] const std::optional<std::string>& bytesValueForKey(TLAttributeKey key) const;
   [[nodiscard]] const std::shared_ptr<TLPerson>& personValueForKey(TLAttributeKey key) const;
   [[nodiscard]] const std::optional<TLString>& stringValueForKey(TLAttributeKey key) const;
-  // Null also for an empty list.
+  // Null also where the attribute has another value and no list.
   [[nodiscard]] const std::vector<std::shared_ptr<TLPerson>>* personValuesForKey(
       TLAttributeKey key) const;
   [[nodiscard]] const std::vector<TLString>* stringValuesForKey(TLAttributeKey key) const;

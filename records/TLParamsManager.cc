@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <cmath>
 #include <limits>
 
 namespace {
@@ -122,7 +123,15 @@ std::optional<int32_t> leadingInteger(std::string_view text) {
   return value;
 }
 
-// Names of infinities and NaN are no decimal numbers; nor is what no float can hold.
+// Of a decimal number whose size no double can hold: whether it is too small rather than too large.
+bool underflows(std::string_view number) {
+  const size_t exponent = number.find_first_of("eE");
+  if (exponent != std::string_view::npos) return number.substr(exponent + 1).starts_with('-');
+  return number.substr(0, number.find('.')).find_first_not_of("-0") == std::string_view::npos;
+}
+
+// Names of infinities and NaN are no decimal numbers; nor is what is too large for a float. What is
+// too small for one is 0.
 std::optional<float> leadingFloat(std::string_view text) {
   if (text.starts_with('+') && !text.starts_with("+-")) text.remove_prefix(1);
   const size_t first = text.find_first_of("0123456789");
@@ -130,10 +139,15 @@ std::optional<float> leadingFloat(std::string_view text) {
       text.substr(0, first).find_first_not_of("-.") != std::string_view::npos) {
     return std::nullopt;
   }
-  float value = 0;
+  double value = 0;
   const auto result = std::from_chars(text.data(), text.data() + text.size(), value);
+  if (result.ec == std::errc::result_out_of_range) {
+    const auto length = static_cast<size_t>(result.ptr - text.data());
+    return underflows(text.substr(0, length)) ? std::optional(0.0F) : std::nullopt;
+  }
   if (result.ec != std::errc()) return std::nullopt;
-  return value;
+  const auto narrow = static_cast<float>(value);
+  return std::isfinite(narrow) ? std::optional(narrow) : std::nullopt;
 }
 
 // The record of one override; a value that does not read as the row's type gives the default.

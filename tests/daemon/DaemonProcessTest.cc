@@ -1,3 +1,4 @@
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -5,6 +6,7 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <cstdlib>
 #include <fstream>
 #include <regex>
 #include <set>
@@ -153,7 +155,21 @@ TEST_P(EndingSignal, EndsInOrderBesideABatchAndASearchAndLosesNothingAcknowledge
   EXPECT_GE(static_cast<int>(items->size()), 50 + acknowledged);
 }
 
-INSTANTIATE_TEST_SUITE_P(Signals, EndingSignal, testing::Values(SIGHUP, SIGPIPE, SIGTERM));
+INSTANTIATE_TEST_SUITE_P(Signals, EndingSignal, testing::Values(SIGHUP, SIGINT, SIGPIPE, SIGTERM));
+
+TEST_F(DaemonProcessTest, TheCommandLineNeverStartsADaemon) {
+  const auto run = [this](const std::string& arguments) {
+    const std::string command =
+        fmt::format("{} {} >{}/out 2>&1", TALLOW_DAEMON_PROGRAM, arguments, directory.path());
+    const int status = std::system(command.c_str());
+    return std::pair(WEXITSTATUS(status),
+                     platform::readFile(directory / "out", 4096, nullptr).value_or(""));
+  };
+  EXPECT_THAT(run("--help"), testing::Pair(0, testing::HasSubstr("Usage: tallowsearchd")));
+  EXPECT_THAT(run("--version"), testing::Pair(0, testing::StartsWith("tallowsearchd ")));
+  EXPECT_THAT(run("--verison"), testing::Pair(2, testing::HasSubstr("--verison")));
+  EXPECT_THAT(run("--help more"), testing::Pair(2, testing::HasSubstr("argument: more")));
+}
 
 TEST_F(DaemonProcessTest, WhatWasAcknowledgedSurvivesAKill) {
   {

@@ -1,6 +1,8 @@
 #include <gtest/gtest.h>
 
+#include <filesystem>
 #include <future>
+#include <mutex>
 
 #include "daemon/TLDeviceLockMonitor.h"
 #include "platform/Files.h"
@@ -142,4 +144,25 @@ TEST(FileDeviceVault, ReadsItsFileAndSeesChanges) {
     EXPECT_EQ(vault->DVLGetDeviceLockState(0), 1u) << garbled;
     EXPECT_EQ(vault->DVLDeviceUnlockedSinceBoot(), 0) << garbled;
   }
+}
+
+TEST(FileDeviceVault, SeesChangesAfterItsDirectoryWasReplaced) {
+  const testsupport::TemporaryDirectory directory;
+  const std::string runtime = directory / "run";
+  const std::string path = runtime + "/lock_status";
+  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
+  const auto vault = platform::makeFileDeviceVault(path);
+  std::promise<void> locked;
+  std::once_flag once;
+  platform::SerialQueue queue("vault");
+  int32_t token = -1;
+  const auto handler = [&] {
+    if (vault->DVLGetDeviceLockState(0) == 1) std::call_once(once, [&] { locked.set_value(); });
+  };
+  ASSERT_EQ(vault->registerNotification("n", queue, handler, &token), 0u);
+  std::filesystem::rename(runtime, directory / "old");
+  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
+  ASSERT_TRUE(platform::writeFileAtomically(path, "1 1\n", nullptr));
+  locked.get_future().wait();
+  vault->cancel(token);
 }

@@ -78,6 +78,11 @@ TEST(DateFormatter, SingleOnesAreStrictAndWriteTheirPattern) {
       EXPECT_EQ(each.formatter->dateFromString(bad), std::nullopt) << platform::toUTF8(bad);
     }
   }
+  for (const TLStringView bad : {u"2024-03-05T10:20:30", u"2024-03-05T10:20:30+00:00"}) {
+    EXPECT_EQ(Factory::newDateTimeFormatterWithTimeZoneStyle(2)->dateFromString(bad), std::nullopt);
+  }
+  EXPECT_EQ(Factory::newTimeFormatterWithTimeZoneStyle(2)->dateFromString(u"10:20:30"),
+            std::nullopt);
   for (const int64_t style : {int64_t{-1}, int64_t{3}, INT64_MAX, INT64_MIN}) {
     EXPECT_EQ(Factory::newDateTimeFormatterWithTimeZoneStyle(style), nullptr);
     EXPECT_EQ(Factory::newTimeFormatterWithTimeZoneStyle(style), nullptr);

@@ -40,7 +40,7 @@ class SpellCorrectionTest : public testing::Test {
   SpellCorrectionTest() {
     EXPECT_TRUE(store->openWithError(nullptr));
     vocab = std::make_shared<TALTopKVocab>(store, index.get());
-    spelling = std::make_unique<TALSpellCorrection>(index.get(), vocab);
+    spelling = std::make_unique<TALSpellCorrection>(vocab);
   }
 
   // Searches, so that `found` is set, and corrects. The terms' first tokens afterwards, "-" when
@@ -145,7 +145,7 @@ TEST_F(SpellCorrectionTest, EditsByLengthOfTheWord) {
       EXPECT_THAT(tokens(made), testing::Not(testing::Contains(token)));
     }
   }
-  const TALSpellCorrection frugal(index.get(), vocab, 5, 2);
+  const TALSpellCorrection frugal(vocab, 5, 2);
   EXPECT_THAT(tokens(frugal.editOneCandidates("abcd")),
               ElementsAre("bacd", "bcd", "bbcd", "cbcd", "dbcd"));
 }
@@ -232,10 +232,10 @@ TEST_F(SpellCorrectionTest, CandidatesMustBeInTheTermsZonesAndWithinTheBudget) {
   add(10, "cant ");
   add(11, "catt ");
   // Five suffixes in other zones come before the one that would count.
-  EXPECT_THAT(tokens(spelling->_getCandidates("cazt ", word("cazt "))),
+  EXPECT_THAT(tokens(spelling->_getCandidates("cazt ", word("cazt "), *index)),
               ElementsAre("cant ", "catt "));
-  const TALSpellCorrection frugal(index.get(), vocab, 1000, 1);
-  EXPECT_THAT(tokens(frugal._getCandidates("cazt ", word("cazt "))), ElementsAre("cant "));
+  const TALSpellCorrection frugal(vocab, 1000, 1);
+  EXPECT_THAT(tokens(frugal._getCandidates("cazt ", word("cazt "), *index)), ElementsAre("cant "));
 }
 
 TEST_F(SpellCorrectionTest, TakesFrequentWordsWhereNoEditFits) {
@@ -250,7 +250,7 @@ TEST_F(SpellCorrectionTest, TakesFrequentWordsWhereNoEditFits) {
   const auto candidates = spelling->_getCandidatesFromTopKVocab("interantionel", true);
   ASSERT_THAT(tokens(candidates), ElementsAre("international ", "internatioal"));
   EXPECT_FLOAT_EQ(candidates[0]._scoreError, 1 - (cSwapMid + cSubMid) / 13);
-  const TALSpellCorrection frugal(index.get(), vocab, 1, 100);
+  const TALSpellCorrection frugal(vocab, 1, 100);
   EXPECT_EQ(frugal._getCandidatesFromTopKVocab("interantionel", false).size(), 1U);
 
   vocab->setVocab({"na\xC3\xAFvet\xC3\xA9 "});

@@ -1,6 +1,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sqlite3.h>
 
+#include <future>
 #include <latch>
 #include <random>
 
@@ -262,11 +264,11 @@ TEST_F(TopKVocabTest, OneThatIsAskedForAndShutdownEndTheRestOfOneThatIsNot) {
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   EXPECT_EQ(watched.zones, 200);
   EXPECT_EQ(rebuild(vocab), std::nullopt);
-  EXPECT_EQ(watched.zones, 600);
+  EXPECT_EQ(watched.zones, 402);  // the one that rested gives way at once
   vocab.setMaxDocID(5000);
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   vocab.shutdown();
-  EXPECT_EQ(watched.zones, 600);
+  EXPECT_EQ(watched.zones, 402);
 }
 
 TEST_F(TopKVocabTest, ShutdownEndsTheCountAndWhatWaitsBehindIt) {
@@ -306,4 +308,46 @@ TEST_F(TopKVocabTest, ShutdownEndsTheCountAndWhatWaitsBehindIt) {
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
   vocab.shutdown();
   EXPECT_THAT(outcomes, ElementsAre(std::nullopt, std::nullopt, std::nullopt));
+}
+
+TEST_F(TopKVocabTest, OneThatIsAskedForEndsARoutineCount) {
+  auto watched = std::make_unique<WatchedIndex>();
+  std::latch counting(1);
+  std::latch asked(1);
+  watched->atZone = [&, first = true]() mutable {
+    if (std::exchange(first, false)) {
+      counting.count_down();
+      asked.wait();
+    }
+  };
+  TALTopKVocab vocab(store, watched.get());
+  vocab.setMaxDocID(2001);
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
+  counting.wait();
+  std::promise<Outcome> done;
+  vocab.checkAndRebuildTopKVocabWithCompletionHandler(
+      [&done](const Outcome& outcome) { done.set_value(outcome); }, true);
+  asked.count_down();
+  EXPECT_EQ(done.get_future().get(), std::nullopt);
+  EXPECT_EQ(log.count("Starting to rebuild topK vocab from SALT."), 2U);
+  EXPECT_EQ(log.count("TopK vocab rebuild is done."), 1U);
+  vocab.shutdown();
+}
+
+TEST_F(TopKVocabTest, ALoadNeverBringsOlderWordsBack) {
+  TALTopKVocab vocab(store, index.get());
+  std::optional<TLError> error;
+  store->storeTopKVocab(topkvocab::archive({"stored"}, 1, platform::secondsSince1970()), &error);
+  vocab.loadTopKVocabFromDocStore(&error);
+  ASSERT_EQ(error, std::nullopt);
+  ASSERT_THAT(*vocab.vocab(), ElementsAre("stored"));
+  sqlite3* other = nullptr;  // keeps the store from being written
+  ASSERT_EQ(sqlite3_open((directory / "docs.db").c_str(), &other), SQLITE_OK);
+  ASSERT_EQ(sqlite3_exec(other, "begin immediate;", nullptr, nullptr, nullptr), SQLITE_OK);
+  EXPECT_NE(rebuild(vocab), std::nullopt);
+  vocab.loadTopKVocabFromDocStore(&error);
+  EXPECT_THAT(*vocab.vocab(), testing::IsEmpty());
+  sqlite3_close(other);
+  EXPECT_EQ(rebuild(vocab), std::nullopt);
+  vocab.shutdown();
 }

@@ -1,8 +1,11 @@
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/xattr.h>
+#include <unistd.h>
 
 #include <chrono>
+#include <csignal>
 #include <random>
 #include <thread>
 #include <vector>
@@ -10,6 +13,8 @@
 #include "platform/Clock.h"
 #include "platform/Concurrent.h"
 #include "platform/Files.h"
+#include "platform/Log.h"
+#include "platform/Paths.h"
 #include "platform/Queue.h"
 #include "platform/Redaction.h"
 #include "platform/Signpost.h"
@@ -70,6 +75,49 @@ TEST(Clock, MillisecondsAreWholeAndADenominatorOfZeroGivesZero) {
   EXPECT_EQ(platform::millisFromTicks(1999999, {1, 1}), 1u);
   EXPECT_EQ(platform::millisFromTicks(24000, {125, 3}), 1u);
   EXPECT_EQ(platform::millisFromTicks(5000000, {1, 0}), 0u);
+}
+
+// Also on a thread whose own pending signals nobody looks at.
+TEST(Log, ALogThatNobodyReadsAsksTheProcessToEnd) {
+  sigset_t broken;
+  sigemptyset(&broken);
+  sigaddset(&broken, SIGPIPE);
+  pthread_sigmask(SIG_BLOCK, &broken, nullptr);
+  int ends[2];
+  ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
+  const int standardError = dup(STDERR_FILENO);
+  dup2(ends[1], STDERR_FILENO);
+  close(ends[0]);
+  close(ends[1]);
+  std::thread([] { platform::Log(platform::kSubsystem, "test").error("lost"); }).join();
+  dup2(standardError, STDERR_FILENO);
+  close(standardError);
+  const timespec atOnce{};
+  EXPECT_EQ(sigtimedwait(&broken, nullptr, &atOnce), SIGPIPE);
+}
+
+TEST(Paths, AUserWhoIsNotRootGetsDirectoriesOfTheirOwn) {
+  for (const char* name : {"STATE_DIRECTORY", "RUNTIME_DIRECTORY", "XDG_STATE_HOME"})
+    unsetenv(name);
+  setenv("HOME", "/home/mara", 1);
+  setenv("XDG_RUNTIME_DIR", "/run/user/7", 1);
+  const uid_t user = geteuid();
+  if (user == 0) {
+    EXPECT_EQ(platform::stateDirectory(), "/var/lib/tallow");
+    EXPECT_EQ(platform::runtimeDirectory(), "/run/tallow");
+    ASSERT_EQ(seteuid(65534), 0);
+  }
+  EXPECT_EQ(platform::stateDirectory(), "/home/mara/.local/state/tallow");
+  EXPECT_EQ(platform::runtimeDirectory(), "/run/user/7/tallow");
+  setenv("XDG_STATE_HOME", "/data/mara", 1);
+  EXPECT_EQ(platform::stateDirectory(), "/data/mara/tallow");
+  setenv("XDG_STATE_HOME", "relative", 1);
+  EXPECT_EQ(platform::stateDirectory(), "/home/mara/.local/state/tallow");
+  setenv("STATE_DIRECTORY", "/srv/a:/srv/b", 1);
+  setenv("RUNTIME_DIRECTORY", "/srv/run", 1);
+  EXPECT_EQ(platform::stateDirectory(), "/srv/a");
+  EXPECT_EQ(platform::runtimeDirectory(), "/srv/run");
+  ASSERT_EQ(seteuid(user), 0);
 }
 
 TEST(Queue, RunsInOrderAndDrainsAtTheEnd) {

@@ -146,7 +146,7 @@ TEST_F(QueryTree, EveryStepIsLoggedAndNoTextInClear) {
           "info TLQueryParsing: original query:->\"wo...\"<5 chars><-"}));
   log.clear();
   EXPECT_EQ(Additions::_lookupAttribute("REPLIED_TO"), TLAttributeKey::UNKNOWN);
-  EXPECT_TRUE(log.has("error TLQueryParsing: Unknown attribute key: \"RE...\"<10 chars>"));
+  EXPECT_TRUE(log.has("error TLQueryParsing: Unknown attribute key: REPLIED_TO"));
 }
 
 TEST_F(QueryTree, FiltersReplaceTheRoot) {

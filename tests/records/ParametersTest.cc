@@ -133,6 +133,13 @@ TEST(Parameters, OverrideText) {
       {u"ranking.textScoreWeight=inf", R"([{"floatValue":1.0,"key":"ranking.textScoreWeight"}])",
        "error TLParamsManager: invalid type for override Param = ranking.textScoreWeight=inf "
        "(Float expected) [Using Default Value]"},
+      {u"ranking.textScoreWeight=1e-50,ranking.freshnessWeight=-1e-400",
+       R"([{"floatValue":0.0,"key":"ranking.textScoreWeight"},)"
+       R"({"floatValue":0.0,"key":"ranking.freshnessWeight"}])",
+       ""},
+      {u"ranking.textScoreWeight=1e50", R"([{"floatValue":1.0,"key":"ranking.textScoreWeight"}])",
+       "error TLParamsManager: invalid type for override Param = ranking.textScoreWeight=1e50 "
+       "(Float expected) [Using Default Value]"},
       {u"queryModification.enableStemModification=yes",
        R"([{"boolValue":true,"key":"queryModification.enableStemModification"}])",
        "error TLParamsManager: invalid type for override Param = "

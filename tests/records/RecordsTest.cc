@@ -409,6 +409,9 @@ TEST(Records, TypedReadersSeeTheFirstAttributeOnly) {
   EXPECT_FALSE(item.boolValueForKey(TLAttributeKey::URL));
   EXPECT_EQ(item.personValuesForKey(TLAttributeKey::URL), nullptr);
   EXPECT_EQ(item.stringValuesForKey(TLAttributeKey::SUBJECT), nullptr);
+  item.addPersonsWithKey(TLAttributeKey::HIDDEN_ADDITIONAL_RECIPIENTS, {});
+  ASSERT_NE(item.personValuesForKey(TLAttributeKey::HIDDEN_ADDITIONAL_RECIPIENTS), nullptr);
+  EXPECT_TRUE(item.personValuesForKey(TLAttributeKey::HIDDEN_ADDITIONAL_RECIPIENTS)->empty());
   EXPECT_TRUE(item.attributesForKey(TLAttributeKey::URL).empty());
 }
 
