@@ -1,0 +1,467 @@
+// Runs the daemon while single system calls fail or it is killed in front of them, and while
+// descriptors, threads or address space run out. It must go on answering or end in order, and after
+// a restart everything that was acknowledged must be there exactly once. Ends with 1 at the first
+// fault.
+#include <fmt/format.h>
+#include <sys/resource.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <condition_variable>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <map>
+#include <mutex>
+#include <random>
+#include <set>
+#include <thread>
+
+#include "client/DebugServiceProxy.h"
+#include "client/SearchServiceProxy.h"
+#include "platform/Paths.h"
+#include "salt/Index.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/daemon/DaemonSupport.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using client::SearchServiceProxy;
+using testsupport::DaemonProcess;
+namespace fs = std::filesystem;
+
+constexpr const char* kUsage =
+    "Usage: fault_driver [--mode faults] [--runs N] [--seed N]\n"
+    "       fault_driver --mode descriptors|threads|memory\n"
+    "faults: N random ones; without --runs each call at each place.\n";
+
+constexpr const char* kClient = "fault driver";
+constexpr const char* kClass = "default";
+constexpr int kBefore = 60;  // mails that are there before the daemon under test starts
+constexpr int kBatches = 6;
+constexpr int kMailsInBatch = 25;
+constexpr int kPlaces = 50;  // of each call
+constexpr std::chrono::seconds kPatience{60};
+constexpr std::chrono::seconds kLongPatience{600};
+
+// By call, the errors that it can give.
+const std::map<const char*, std::vector<int>>& errorsOfCalls() {
+  static const std::map<const char*, std::vector<int>> rows{{"write", {ENOSPC, EIO, EINTR}},
+                                                            {"pwrite64", {ENOSPC, EIO}},
+                                                            {"fdatasync", {EIO, ENOSPC}},
+                                                            {"fsync", {EIO, ENOSPC}},
+                                                            {"openat", {EMFILE, EIO}},
+                                                            {"rename", {EIO, ENOSPC}},
+                                                            {"unlink", {EIO}},
+                                                            {"mmap", {ENOMEM, EIO}},
+                                                            {"accept4", {EMFILE, EINTR}},
+                                                            {"clone3", {EAGAIN}},
+                                                            {"ftruncate", {EIO, ENOSPC}}};
+  return rows;
+}
+
+struct Trial {
+  std::string call;
+  int at;              // counted from 1
+  std::string action;  // an errno, or "kill"
+  [[nodiscard]] std::string text() const { return fmt::format("{} {} {}", call, at, action); }
+};
+
+std::vector<Trial> allTrials() {
+  std::vector<Trial> trials;
+  for (const auto& [call, errors] : errorsOfCalls()) {
+    for (int at = 1; at <= kPlaces; ++at) {
+      for (const int error : errors) trials.push_back({call, at, std::to_string(error)});
+      trials.push_back({call, at, "kill"});
+    }
+  }
+  return trials;
+}
+
+// Ends a process that does not come to an end in time.
+class Watchdog {
+ public:
+  explicit Watchdog(pid_t process, std::chrono::seconds patience = kPatience)
+      : _thread([this, process, patience](const std::stop_token& stop) {
+          std::unique_lock lock(_mutex);
+          if (_wake.wait_for(lock, stop, patience, [] { return false; }) || stop.stop_requested()) {
+            return;
+          }
+          _bitten = true;
+          kill(process, SIGABRT);
+        }) {}
+
+  // Ends the watch; false when the process had to be ended.
+  [[nodiscard]] bool end() {
+    _thread.request_stop();
+    _thread.join();
+    return !_bitten;
+  }
+
+ private:
+  std::mutex _mutex;
+  std::condition_variable_any _wake;
+  bool _bitten = false;
+  std::jthread _thread;
+};
+
+// Sets variables for the daemons that are started while it lives.
+class Environment {
+ public:
+  explicit Environment(std::map<std::string, std::string> variables)
+      : _variables(std::move(variables)) {
+    for (const auto& [name, value] : _variables) setenv(name.c_str(), value.c_str(), 1);
+  }
+  ~Environment() {
+    for (const auto& [name, value] : _variables) unsetenv(name.c_str());
+  }
+  Environment(const Environment&) = delete;
+  Environment& operator=(const Environment&) = delete;
+
+ private:
+  const std::map<std::string, std::string> _variables;
+};
+
+std::optional<std::multiset<std::string>> found(SearchServiceProxy& service, TLErrorOut error,
+                                                const std::string& protectionClass = kClass) {
+  TLQuery query;
+  query.setRawQuery(u"word");
+  query.setOriginalQuery(u"word");
+  const auto items =
+      service.searchItems(query, 0, protectionClass, SearchServiceProxy::kNoMaximum, error);
+  if (!items) return std::nullopt;
+  std::multiset<std::string> identifiers;
+  for (const auto& item : *items) {
+    identifiers.insert(platform::toUTF8(item->identifier().value_or(u"")));
+  }
+  return identifiers;
+}
+
+std::string nameOf(int batch, int mail) {
+  return fmt::format("b{}x{}", batch, mail);
+}
+
+// What the daemon has acknowledged, and what it may or may not have done.
+class Ledger {
+ public:
+  Ledger() {
+    for (int i = 0; i < kBefore; ++i) _present.insert(fmt::format("old{}", i));
+  }
+
+  // The batch of the number: new mails, and two earlier ones that go; when it is sent again, mails
+  // alone, as deletions may have been done. True when acknowledged.
+  bool send(SearchServiceProxy& service, int batch, bool again) {
+    const auto items = testsupport::mails(fmt::format("b{}x", batch), kMailsInBatch);
+    std::vector<std::string> going;
+    for (int i = 0; i < 2 && !again; ++i) going.push_back(fmt::format("old{}", 2 * batch + i));
+    std::optional<TLError> error;
+    const bool done =
+        service.indexItems(items, going, std::to_string(batch), kClient, kClass, &error);
+    for (const std::string& name : going) (done ? _deleted : _maybeDeleted).insert(name);
+    for (int i = 0; i < kMailsInBatch; ++i) {
+      (done ? _present : _maybePresent).insert(nameOf(batch, i));
+    }
+    if (done) _state = batch;
+    if (!done) _statesTried.insert(batch);
+    return done;
+  }
+
+  // The first thing wrong with what a search has found, or empty.
+  [[nodiscard]] std::string check(const std::multiset<std::string>& identifiers) const {
+    for (const std::string& name : identifiers) {
+      if (identifiers.count(name) != 1) return name + " is found twice";
+      if (_deleted.contains(name)) return name + " was deleted and is found";
+      if (!_present.contains(name) && !_maybePresent.contains(name)) return name + " is unknown";
+    }
+    for (const std::string& name : _present) {
+      if (_deleted.contains(name) || _maybeDeleted.contains(name)) continue;
+      if (!identifiers.contains(name)) return name + " was acknowledged and is not found";
+    }
+    return "";
+  }
+
+  // The same of a stored state: it is the last acknowledged one or a later try, and all that it
+  // covers is found.
+  [[nodiscard]] std::string checkState(const std::optional<std::string>& state,
+                                       const std::multiset<std::string>& identifiers) const {
+    if (!state) return _state < 0 ? "" : "the client state is gone";
+    const int batch = std::atoi(state->c_str());
+    if (batch != _state && !_statesTried.contains(batch)) return "the client state is " + *state;
+    for (int i = 0; i < kMailsInBatch; ++i) {
+      if (!identifiers.contains(nameOf(batch, i))) {
+        return nameOf(batch, i) + " is covered by the client state and not found";
+      }
+    }
+    return "";
+  }
+
+ private:
+  std::set<std::string> _present, _maybePresent, _deleted, _maybeDeleted;
+  int _state = -1;
+  std::set<int> _statesTried;
+};
+
+struct Tally {
+  int runs = 0;
+  int notReached = 0;
+  int ended = 0;  // by the daemon, in order
+  int killed = 0;
+  int errors = 0;  // calls that were answered with one
+};
+
+// A state directory with mail in it, left by a daemon that was killed, so that opening recovers.
+void makeTemplate(const std::string& directory) {
+  DaemonProcess daemon(directory);
+  SearchServiceProxy service(daemon.runtimeDirectory());
+  std::optional<TLError> error;
+  if (!service.indexItems(testsupport::mails("old", kBefore), kClient, kClass, &error)) {
+    throw std::runtime_error("no mail could be indexed: " + platform::printable(error));
+  }
+  daemon.signal(SIGKILL);
+  daemon.wait();
+}
+
+// Works with a daemon under a fault until it has ended. The result is what is wrong, or empty.
+std::string work(DaemonProcess& daemon, const Trial& trial, Ledger& ledger, Tally& tally) {
+  if (daemon.ready()) {
+    SearchServiceProxy service(daemon.runtimeDirectory());
+    client::DebugServiceProxy debug(daemon.runtimeDirectory());
+    for (int batch = 0; batch < kBatches; ++batch) {
+      if (!ledger.send(service, batch, false)) {
+        ++tally.errors;
+        ledger.send(service, batch, true);
+      }
+      std::optional<TLError> error;
+      if (const auto identifiers = found(service, &error)) {
+        if (std::string fault = ledger.check(*identifiers); !fault.empty()) return fault;
+      }
+      if (batch == kBatches / 2) debug.forceVacuumAndCompact(kClass, &error);
+    }
+    daemon.signal(SIGTERM);
+  }
+  const bool ready = daemon.ready();
+  const int status = daemon.wait();
+  if (status == 128 + SIGKILL && trial.action == "kill") {
+    ++tally.killed;
+    return "";
+  }
+  if (!ready) ++tally.ended;
+  if (status == 0 || (!ready && status == 1)) return "";
+  return fmt::format("the daemon ended with status {}", status);
+}
+
+std::string checkAfterRestart(const std::string& directory, Ledger& ledger) {
+  {
+    DaemonProcess daemon(directory);
+    SearchServiceProxy service(daemon.runtimeDirectory());
+    std::optional<TLError> error;
+    const auto identifiers = found(service, &error);
+    if (!identifiers) return "no search after the restart: " + platform::printable(error);
+    if (std::string fault = ledger.check(*identifiers); !fault.empty()) {
+      return "after the restart " + fault;
+    }
+    const auto state = service.fetchLastClientState(kClient, kClass, &error);
+    if (std::string fault = ledger.checkState(state, *identifiers); !fault.empty()) return fault;
+    for (int batch = 0; batch < kBatches; ++batch) {
+      if (!service.indexItems(testsupport::mails(fmt::format("b{}x", batch), kMailsInBatch),
+                              kClient, kClass, &error)) {
+        return "sending again failed: " + platform::printable(error);
+      }
+    }
+    const auto all = found(service, &error);
+    for (int batch = 0; batch < kBatches; ++batch) {
+      for (int i = 0; i < kMailsInBatch; ++i) {
+        if (!all || all->count(nameOf(batch, i)) != 1) {
+          return nameOf(batch, i) + " was sent again and is not found once";
+        }
+      }
+    }
+    daemon.signal(SIGTERM);
+    if (const int status = daemon.wait(); status != 0) {
+      return fmt::format("the restarted daemon ended with status {}", status);
+    }
+  }
+  const std::unique_ptr<salt::Index> index(
+      salt::LoadIndex(platform::textIndexPath(platform::dataRoot(directory + "/state"), kClass)));
+  return index != nullptr && index->Validate() ? "" : "the index does not validate";
+}
+
+std::string run(const Trial& trial, const std::string& pattern, const std::string& directory,
+                Tally& tally) {
+  ++tally.runs;
+  fs::remove_all(directory);
+  fs::create_directories(directory);
+  fs::copy(pattern + "/state", directory + "/state", fs::copy_options::recursive);
+  const std::string mark = directory + "/mark";
+  Ledger ledger;
+  std::string fault;
+  {
+    std::optional<DaemonProcess> daemon;
+    {
+      const Environment injected({{"LD_PRELOAD", TALLOW_FAULT_INJECTION},
+                                  {"TALLOW_FAULT", trial.text()},
+                                  {"TALLOW_FAULT_MARK", mark}});
+      daemon.emplace(directory);
+    }
+    Watchdog watchdog(daemon->pid());
+    fault = work(*daemon, trial, ledger, tally);
+    if (!watchdog.end()) fault = "the daemon hung";
+    if (!fs::exists(mark)) ++tally.notReached;
+    if (!fault.empty()) {
+      fmt::print(stderr, "{}\n", daemon->log().substr(0, 20000));
+      return fault;
+    }
+  }
+  return checkAfterRestart(directory, ledger);
+}
+
+int runFaults(int runs, uint32_t seed) {
+  const testsupport::TemporaryDirectory scratch;
+  const std::string pattern = scratch / "template";
+  makeTemplate(pattern);
+  std::vector<Trial> trials = allTrials();
+  if (runs > 0) {
+    std::mt19937 random(seed);
+    std::shuffle(trials.begin(), trials.end(), random);
+    trials.resize(std::min(trials.size(), static_cast<size_t>(runs)));
+  }
+  Tally tally;
+  const auto start = std::chrono::steady_clock::now();
+  for (const Trial& trial : trials) {
+    const std::string fault = run(trial, pattern, scratch / "run", tally);
+    if (fault.empty()) continue;
+    fmt::print(stderr, "FAULT under \"{}\" of seed {}: {}\n{} is left\n", trial.text(), seed, fault,
+               scratch / "run");
+    _exit(1);
+  }
+  const std::chrono::duration<double> seconds = std::chrono::steady_clock::now() - start;
+  fmt::print(
+      "runs={} not_reached={} ended_in_order={} killed={} failed_calls={} seed={} seconds={:.1f}\n",
+      tally.runs, tally.notReached, tally.ended, tally.killed, tally.errors, seed, seconds.count());
+  return 0;
+}
+
+// ---- descriptors, threads and memory run out ----
+
+constexpr int kClasses = 500;
+constexpr int kConnections = 100;
+constexpr int kMailsInClass = 5;
+
+std::string className(int number) {
+  return fmt::format("class{}", number);
+}
+
+// Open connections that do nothing.
+std::vector<std::unique_ptr<client::DebugServiceProxy>> connectMany(const std::string& directory) {
+  std::vector<std::unique_ptr<client::DebugServiceProxy>> connections;
+  for (int i = 0; i < kConnections; ++i) {
+    connections.push_back(std::make_unique<client::DebugServiceProxy>(directory));
+    static_cast<void>(connections.back()->ping("x", nullptr));
+  }
+  return connections;
+}
+
+// Asks for many classes over one connection after the other has gone; then those that were opened
+// must answer rightly, from another connection, too.
+std::string exhaust(DaemonProcess& daemon) {
+  std::set<int> open;
+  std::map<int, int> refusals;  // by code
+  int lost = 0;                 // calls that met no connection
+  std::optional<SearchServiceProxy> service;
+  for (int number = 0; number < kClasses; ++number) {
+    if (!service) service.emplace(daemon.runtimeDirectory());
+    std::optional<TLError> error;
+    const auto items = testsupport::mails("m", kMailsInClass);
+    if (service->indexItems(items, kClient, className(number), &error)) {
+      open.insert(number);
+    } else if (error) {
+      ++refusals[error->code];
+      if (error->domain != "POSIX" && error->domain != "com.quill.tallow.TALIndexerManager") ++lost;
+    }
+  }
+  const auto idle = connectMany(daemon.runtimeDirectory());
+  int wrong = 0;
+  int unanswered = 0;
+  SearchServiceProxy other(daemon.runtimeDirectory());
+  for (const int number : open) {
+    std::optional<TLError> error;
+    auto identifiers = found(other, &error, className(number));
+    if (!identifiers) identifiers = found(*service, &error, className(number));
+    if (!identifiers) {
+      ++unanswered;
+    } else if (identifiers->size() != kMailsInClass) {
+      ++wrong;
+    }
+  }
+  std::string codes;
+  for (const auto& [code, count] : refusals) codes += fmt::format(" {}:{}", code, count);
+  fmt::print("classes_open={} refused_by_code={{{}}} other_errors={} wrong={} unanswered={}\n",
+             open.size(), codes, lost, wrong, unanswered);
+  if (open.empty()) return "no class was opened";
+  if (open.size() == kClasses) return "nothing ran out";
+  if (wrong != 0) return "a class answered wrongly";
+  if (unanswered != 0) return "an open class did not answer";
+  return "";
+}
+
+struct Limit {
+  const char* mode;
+  int resource;  // of setrlimit, -1 for none
+  rlim_t most;
+};
+
+constexpr Limit kLimits[] = {{"descriptors", RLIMIT_NOFILE, 256},
+                             {"threads", -1, 200},
+                             {"memory", RLIMIT_AS, rlim_t{1} << 30}};
+
+int runLimit(const Limit& limit) {
+  const testsupport::TemporaryDirectory scratch;
+  std::map<std::string, std::string> variables;
+  if (limit.resource < 0) {
+    variables = {{"LD_PRELOAD", TALLOW_FAULT_INJECTION},
+                 {"TALLOW_FAULT_THREADS", std::to_string(limit.most)}};
+  }
+  std::optional<DaemonProcess> daemon;
+  {
+    const Environment limited(variables);
+    daemon.emplace(scratch.path());
+  }
+  if (limit.resource >= 0) {
+    const rlimit most{limit.most, limit.most};
+    prlimit(daemon->pid(), static_cast<__rlimit_resource>(limit.resource), &most, nullptr);
+  }
+  Watchdog watchdog(daemon->pid(), kLongPatience);
+  std::string fault = exhaust(*daemon);
+  daemon->signal(SIGTERM);
+  const int status = daemon->wait();
+  if (!watchdog.end()) fault = "the daemon hung";
+  if (status != 0) fault = fmt::format("the daemon ended with status {}; {}", status, fault);
+  if (fault.empty()) return 0;
+  const std::string log = daemon->log();
+  fmt::print(stderr, "{}\nFAULT without {}: {}\n",
+             log.substr(log.size() - std::min<size_t>(log.size(), 4000)), limit.mode, fault);
+  return 1;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  std::string mode = "faults";
+  int runs = 0;
+  uint32_t seed = std::random_device()();
+  for (int i = 1; i + 1 < argc; i += 2) {
+    const std::string_view name = argv[i];
+    if (name == "--mode") mode = argv[i + 1];
+    if (name == "--runs") runs = std::atoi(argv[i + 1]);
+    if (name == "--seed") seed = static_cast<uint32_t>(std::strtoul(argv[i + 1], nullptr, 10));
+  }
+  if (mode == "faults" && argc % 2 == 1) return runFaults(runs, seed);
+  for (const Limit& limit : kLimits) {
+    if (mode == limit.mode) return runLimit(limit);
+  }
+  fmt::print(stderr, "{}", kUsage);
+  return 2;
+}
