@@ -1,0 +1,345 @@
+// Clients of all kinds work with one daemon for as long as one likes, while it is locked and
+// unlocked, asked for its state, and killed and restarted. Each client knows what it may find: a
+// wrong answer ends with 1. The memory of the daemon is reported by thirds of the time.
+#include <fmt/format.h>
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <fstream>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <random>
+#include <set>
+#include <stop_token>
+#include <thread>
+
+#include "client/DebugServiceProxy.h"
+#include "client/SearchServiceProxy.h"
+#include "platform/Files.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/daemon/DaemonSupport.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using client::SearchServiceProxy;
+using testsupport::DaemonProcess;
+using Clock = std::chrono::steady_clock;
+using std::chrono::milliseconds;
+using std::chrono::seconds;
+
+constexpr const char* kUsage =
+    "Usage: soak_driver [--seconds N] [--clients N] [--kill-every SECONDS] [--seed N]\n";
+
+// The class of a client by its number; the first is refused while the device is locked.
+constexpr const char* kClasses[] = {"SysFileProtectionComplete", "default", "other"};
+constexpr const char* kName = "soak";
+constexpr size_t kMostMails = 200;  // that one client keeps
+constexpr milliseconds kPause{20};  // at most, between two calls of a client
+constexpr client::Patience kPatience{20000};
+
+struct Options {
+  seconds length{1800};
+  int clients = 16;
+  seconds killEvery{60};
+  uint32_t seed = std::random_device()();
+};
+
+// What all threads count.
+struct Tally {
+  std::atomic<uint64_t> calls{0};
+  std::atomic<uint64_t> searches{0};
+  std::atomic<uint64_t> refused{0};  // while locked
+  std::atomic<uint64_t> failed{0};   // by a kill
+  std::atomic<bool> wrong{false};
+};
+
+// Waits until the time has passed or the stop is requested; false then.
+bool pauseFor(const std::stop_token& stop, milliseconds time) {
+  std::mutex mutex;
+  std::condition_variable_any wake;
+  std::unique_lock lock(mutex);
+  wake.wait_for(lock, stop, time, [] { return false; });
+  return !stop.stop_requested();
+}
+
+// One client with mails of its own in one class.
+class Client {
+ public:
+  Client(int number, const Options& options, std::string directory, Tally& tally)
+      : _prefix(fmt::format("c{}m", number)),
+        _class(kClasses[static_cast<size_t>(number) % std::size(kClasses)]),
+        _directory(std::move(directory)),
+        _random(options.seed + static_cast<uint32_t>(number)),
+        _tally(tally) {}
+
+  void work(const std::stop_token& stop) {
+    while (!_tally.wrong && pauseFor(stop, milliseconds(_random() % (kPause.count() + 1)))) {
+      if (!_service) _service.emplace(_directory, kPatience);
+      ++_tally.calls;
+      switch (_random() % 10) {
+        case 0:
+        case 1:
+        case 2:
+          add();
+          break;
+        case 3:
+        case 4:
+          remove();
+          break;
+        case 5:
+          diagnose();
+          break;
+        default:
+          searchOne();
+      }
+    }
+  }
+
+ private:
+  enum class State { present, gone, unknown };
+
+  [[nodiscard]] std::string wordOf(uint32_t mail) const {
+    return fmt::format("{}{}z", _prefix, mail);
+  }
+
+  void add() {
+    std::vector<uint32_t> numbers;
+    for (const auto& [mail, state] : _mails) {  // what a kill left open is sent again
+      if (state == State::unknown && numbers.size() < 20) numbers.push_back(mail);
+    }
+    for (size_t i = _random() % 5 + 1; i > 0 && _mails.size() < kMostMails; --i) {
+      numbers.push_back(_next++);
+      _mails[numbers.back()] = State::unknown;
+    }
+    std::vector<client::EncodedItem> items;
+    for (const uint32_t mail : numbers) {
+      std::string body;
+      for (int i = 0; i < 20; ++i) body += fmt::format("text{} ", _random() % 5000);
+      items.push_back(testsupport::mail(wordOf(mail), "soak " + wordOf(mail), body));
+    }
+    std::optional<TLError> error;
+    if (settle(_service->indexItems(items, kName, _class, &error), error)) {
+      for (const uint32_t mail : numbers) _mails[mail] = State::present;
+    }
+  }
+
+  void remove() {
+    std::vector<std::string> identifiers;
+    std::vector<uint32_t> numbers;
+    for (const auto& [mail, state] : _mails) {
+      if (state == State::present && _random() % 20 == 0) {
+        numbers.push_back(mail);
+        identifiers.push_back(wordOf(mail));
+      }
+    }
+    if (numbers.empty()) return;
+    std::optional<TLError> error;
+    const bool done = _service->deleteItemsWithIdentifiers(identifiers, kName, _class, &error);
+    const State state = settle(done, error) ? State::gone : State::unknown;
+    for (const uint32_t mail : numbers) {
+      if (state == State::gone) {
+        _mails.erase(mail);
+        _gone.insert(mail);
+      } else if (!refusedByLock(error)) {
+        _mails[mail] = state;
+      }
+    }
+    while (_gone.size() > kMostMails) _gone.erase(_gone.begin());
+  }
+
+  void searchOne() {
+    const bool gone = !_gone.empty() && _random() % 4 == 0;
+    if (!gone && _mails.empty()) return;
+    const uint32_t mail = gone ? *std::next(_gone.begin(), _random() % _gone.size())
+                               : std::next(_mails.begin(), _random() % _mails.size())->first;
+    if (!gone && _mails[mail] == State::unknown) return;
+    TLQuery query;
+    const std::string word = wordOf(mail);
+    query.setRawQuery(platform::fromUTF8(word));
+    query.setOriginalQuery(platform::fromUTF8(word));
+    std::optional<TLError> error;
+    const auto items =
+        _service->searchItems(query, 0, _class, SearchServiceProxy::kNoMaximum, &error);
+    if (!settle(items.has_value(), error)) return;
+    ++_tally.searches;
+    size_t count = 0;
+    for (const auto& item : *items) {
+      if (item->identifier() == platform::fromUTF8(word)) ++count;
+    }
+    if (count == (gone ? 0U : 1U)) return;
+    fmt::print(stderr, "WRONG: {} of {} is found {} times\n", word, _class, count);
+    _tally.wrong = true;
+  }
+
+  void diagnose() {
+    client::DebugServiceProxy debug(_directory, kPatience);
+    std::optional<TLError> error;
+    switch (_random() % 40) {
+      case 0:
+        settle(debug.forceVacuumAndCompact(_class, &error), error);
+        break;
+      case 1:
+        settle(debug.fetchStatsForIndexer(kName, _class, &error).has_value(), error);
+        break;
+      case 2:
+        settle(_service->fetchLastClientState(kName, _class, &error).has_value(), error);
+        break;
+      default:
+        settle(debug.ping(_prefix, &error).has_value(), error);
+    }
+  }
+
+  static bool refusedByLock(const std::optional<TLError>& error) {
+    return error && error->domain == "com.quill.tallow.TALIndexerManager";
+  }
+
+  // Counts the outcome of a call; after a failure the next has a new connection.
+  bool settle(bool done, const std::optional<TLError>& error) {
+    if (done || !error) return done;
+    if (refusedByLock(error)) {
+      ++_tally.refused;
+    } else {
+      ++_tally.failed;
+      _service.reset();
+    }
+    return false;
+  }
+
+  const std::string _prefix;
+  const std::string _class;
+  const std::string _directory;
+  std::mt19937 _random;
+  Tally& _tally;
+  std::optional<SearchServiceProxy> _service;
+  std::map<uint32_t, State> _mails;
+  std::set<uint32_t> _gone;  // the latest
+  uint32_t _next = 0;
+};
+
+// In kilobytes; 0 for a process that has ended.
+size_t anonymousMemory(pid_t process) {
+  std::ifstream status(fmt::format("/proc/{}/status", process));
+  std::string name;
+  size_t value = 0;
+  while (status >> name) {
+    if (name == "RssAnon:" && status >> value) return value;
+  }
+  return 0;
+}
+
+// The daemon and what is done to it, on the main thread.
+class Supervisor {
+ public:
+  Supervisor(const Options& options, const std::string& directory)
+      : _options(options), _directory(directory), _random(options.seed) {
+    _daemon.emplace(directory);
+  }
+
+  [[nodiscard]] std::string runtimeDirectory() const { return _directory + "/run"; }
+
+  // Until the end of the time or a wrong answer. False when the daemon ended by itself.
+  bool supervise(const Tally& tally) {
+    const auto start = Clock::now();
+    auto nextKill = start + _options.killEvery;
+    while (Clock::now() - start < _options.length && !tally.wrong) {
+      std::this_thread::sleep_for(milliseconds(200));
+      const auto third = static_cast<size_t>(3 * (Clock::now() - start) / _options.length);
+      size_t& most = _memory[std::min<size_t>(third, 2)];
+      most = std::max(most, anonymousMemory(_daemon->pid()));
+      if (_random() % 25 == 0) _daemon->signal(SIGUSR1);
+      if (_random() % 25 == 0) {
+        platform::writeFileAtomically(runtimeDirectory() + "/lock_status",
+                                      _random() % 2 == 0 ? "1 1\n" : "0 1\n", nullptr);
+      }
+      if (Clock::now() < nextKill) continue;
+      nextKill = Clock::now() + _options.killEvery;
+      _daemon->signal(SIGKILL);
+      const int status = _daemon->wait();
+      if (status != 128 + SIGKILL) return ended(status);
+      ++_kills;
+      _daemon.emplace(_directory);
+      if (!_daemon->ready()) return ended(_daemon->wait());
+    }
+    return true;
+  }
+
+  // Ends the daemon in order; false when it did not.
+  bool end() {
+    _daemon->signal(SIGTERM);
+    const int status = _daemon->wait();
+    return status == 0 || ended(status);
+  }
+
+  void report(const Tally& tally) const {
+    fmt::print(
+        "calls={} searches={} refused_while_locked={} failed_by_kills={} kills={} wrong={:d} "
+        "rss_anon_mb={:.1f},{:.1f},{:.1f} seed={}\n",
+        tally.calls.load(), tally.searches.load(), tally.refused.load(), tally.failed.load(),
+        _kills, tally.wrong.load(), static_cast<double>(_memory[0]) / 1024,
+        static_cast<double>(_memory[1]) / 1024, static_cast<double>(_memory[2]) / 1024,
+        _options.seed);
+  }
+
+ private:
+  bool ended(int status) const {
+    fmt::print(stderr, "the daemon ended with status {}\n{}\n", status,
+               _daemon->log().substr(0, 4000));
+    return false;
+  }
+
+  const Options& _options;
+  const std::string _directory;
+  std::mt19937 _random;
+  std::optional<DaemonProcess> _daemon;
+  size_t _memory[3] = {0, 0, 0};  // highest of each third, in kilobytes
+  int _kills = 0;
+};
+
+int soak(const Options& options) {
+  setenv("TALLOW_LOG", "error", 1);
+  const testsupport::TemporaryDirectory scratch;
+  Tally tally;
+  Supervisor supervisor(options, scratch.path());
+  bool sound = true;
+  {
+    std::vector<std::jthread> threads;
+    for (int number = 0; number < options.clients; ++number) {
+      threads.emplace_back([&, number](const std::stop_token& stop) {
+        Client(number, options, supervisor.runtimeDirectory(), tally).work(stop);
+      });
+    }
+    sound = supervisor.supervise(tally);
+  }
+  sound = sound && supervisor.end();
+  supervisor.report(tally);
+  return sound && !tally.wrong ? 0 : 1;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  Options options;
+  for (int i = 1; i < argc; i += 2) {
+    const std::string_view name = argv[i];
+    const int value = i + 1 < argc ? std::atoi(argv[i + 1]) : -1;
+    if (name == "--seconds" && value > 0) {
+      options.length = seconds(value);
+    } else if (name == "--clients" && value > 0) {
+      options.clients = value;
+    } else if (name == "--kill-every" && value > 0) {
+      options.killEvery = seconds(value);
+    } else if (name == "--seed" && value >= 0) {
+      options.seed = static_cast<uint32_t>(value);
+    } else {
+      fmt::print(stderr, "{}", kUsage);
+      return 2;
+    }
+  }
+  return soak(options);
+}
