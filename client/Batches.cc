@@ -1,6 +1,7 @@
 #include "client/Batches.h"
 
 #include "client/Channel.h"
+#include "platform/RPC.h"
 
 namespace client {
 
@@ -68,7 +69,7 @@ std::optional<std::vector<std::span<const Element>>> split(std::span<const Eleme
                                       nameOf(elements[i]).substr(0, kNameLength), size, limit)});
       return std::nullopt;
     }
-    if (bytes + size > limit) {
+    if (bytes + size > limit || i - begin == platform::kMaximumArrayElements) {
       pieces.push_back(elements.subspan(begin, i - begin));
       begin = i;
       bytes = 0;

@@ -2,6 +2,7 @@
 #include <systemd/sd-daemon.h>
 
 #include <array>
+#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstring>
@@ -83,6 +84,7 @@ int main(int argc, char** argv) {
                  platform::yesNo(TLProtectedDataAvailable()));
 
   platform::RunLoop& loop = platform::mainRunLoop();
+  if (!loop.good()) return fail(TLError{kPOSIXErrorDomain, ENOMEM, "no event loop"});
   std::array<std::unique_ptr<platform::RunLoop::Source>, kEndingSignals.size()> sources;
   for (size_t i = 0; i < kEndingSignals.size(); ++i) {
     sources[i] = loop.addSignal(kEndingSignals[i], handleEndingSignal);

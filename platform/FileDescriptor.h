@@ -19,6 +19,7 @@ class FileDescriptor {
   ~FileDescriptor() { reset(); }
 
   [[nodiscard]] int get() const { return _descriptor; }
+  [[nodiscard]] int release() { return std::exchange(_descriptor, -1); }
   void reset() {
     if (_descriptor >= 0) ::close(std::exchange(_descriptor, -1));
   }

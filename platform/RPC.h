@@ -9,6 +9,7 @@
 #include <variant>
 #include <vector>
 
+#include "platform/Assert.h"
 #include "platform/RunLoop.h"
 #include "platform/TLError.h"
 
@@ -25,7 +26,10 @@ namespace platform {
 inline constexpr const char* kRPCErrorName = "com.quill.tallow.Error";
 inline constexpr const char* kRPCInvalidArgs = "org.freedesktop.DBus.Error.InvalidArgs";
 
-// Bounds. A connection beyond the first, or a peer past the others, is closed and logged.
+// Bounds. Each peer beyond one of them is closed and logged.
+//
+// Where all connections are taken, the one that has been idle longest with no call in flight makes
+// room for a new one.
 inline constexpr size_t kMaximumConnections = 64;
 inline constexpr uint64_t kAuthenticationMilliseconds = 5000;
 inline constexpr uint64_t kMaximumQueuedMessages = 256;
@@ -33,19 +37,49 @@ inline constexpr size_t kMaximumQueuedBytes = size_t{256} << 20;
 // Calls of one connection whose reply is outstanding; while there are as many, no more of it are
 // read.
 inline constexpr size_t kMaximumPendingCalls = 4;
+inline constexpr size_t kMaximumMessageBytes = size_t{128} << 20;  // as the protocol has it
+inline constexpr size_t kMaximumArrayElements = 262144;            // of an argument
+// Bytes of the requests of all connections that are being received or whose reply is outstanding.
+// One that is larger waits until there is no other. Small ones may take as much again, so that
+// searches do not wait for large batches.
+inline constexpr size_t kMaximumWaitingBytes = size_t{64} << 20;
+inline constexpr size_t kSmallMessageBytes = size_t{64} << 10;
+// A message that has begun must go on by so much in each interval.
+inline constexpr uint64_t kProgressMilliseconds = 5000;
+inline constexpr size_t kProgressBytes = size_t{64} << 10;
 
-// The arguments of a call, read in the order of the signature. The bytes live as long as the call's
-// handler runs. Asking for another type than the signature has is a programming error.
+// The arguments of a call, which have been decoded in full before its handler runs; read in the
+// order of the signature. The bytes live as long as the handler runs. Asking for another type than
+// the signature has is a programming error.
 class RPCArguments {
  public:
-  virtual ~RPCArguments() = default;
-  [[nodiscard]] virtual std::string_view readString() = 0;                    // s
-  [[nodiscard]] virtual bool readBoolean() = 0;                               // b
-  [[nodiscard]] virtual int64_t readInt64() = 0;                              // x
-  [[nodiscard]] virtual uint64_t readUInt64() = 0;                            // t
-  [[nodiscard]] virtual std::string_view readBytes() = 0;                     // ay
-  [[nodiscard]] virtual std::vector<std::string_view> readStringArray() = 0;  // as
-  [[nodiscard]] virtual std::vector<std::string_view> readBytesArray() = 0;   // aay
+  // By type: s and ay, b, x, t, as and aay.
+  using Value =
+      std::variant<std::string_view, bool, int64_t, uint64_t, std::vector<std::string_view>>;
+
+  explicit RPCArguments(std::vector<Value> values) : _values(std::move(values)) {}
+
+  [[nodiscard]] std::string_view readString() { return next<std::string_view>(); }
+  [[nodiscard]] bool readBoolean() { return next<bool>(); }
+  [[nodiscard]] int64_t readInt64() { return next<int64_t>(); }
+  [[nodiscard]] uint64_t readUInt64() { return next<uint64_t>(); }
+  [[nodiscard]] std::string_view readBytes() { return next<std::string_view>(); }
+  [[nodiscard]] std::vector<std::string_view> readStringArray() {
+    return next<std::vector<std::string_view>>();
+  }
+  [[nodiscard]] std::vector<std::string_view> readBytesArray() {
+    return next<std::vector<std::string_view>>();
+  }
+
+ private:
+  template <typename T>
+  T next() {
+    TL_ASSERT(_next < _values.size() && std::holds_alternative<T>(_values[_next]));
+    return std::get<T>(std::move(_values[_next++]));
+  }
+
+  std::vector<Value> _values;
+  size_t _next = 0;
 };
 
 // One value of a reply, by D-Bus type: s, b, ay (Bytes), aay and a{sv} (Dictionary).

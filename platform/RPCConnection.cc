@@ -1,15 +1,23 @@
 #include "platform/RPCConnection.h"
 
+#include <fcntl.h>
+#include <sys/socket.h>
 #include <systemd/sd-id128.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
+#include <new>
+#include <optional>
+#include <system_error>
 #include <utility>
 
 #include "platform/Assert.h"
+#include "platform/Clock.h"
 #include "platform/Log.h"
 #include "platform/Queue.h"
+#include "platform/Text.h"
 
 namespace platform {
 
@@ -26,62 +34,100 @@ std::string objectPath(const std::string& serviceName) {
   return path;
 }
 
-class MessageArguments : public RPCArguments {
+// Reads one value of the call after the other. Anything that a client sends may end a read early:
+// the bus library looks at the header of a message when it comes, and at its content only here.
+class ArgumentReader {
  public:
-  explicit MessageArguments(sd_bus_message* message) : _message(message) {}
+  explicit ArgumentReader(sd_bus_message* message) : _message(message) {}
 
-  std::string_view readString() override {
-    const char* value = nullptr;
-    TL_ASSERT(sd_bus_message_read_basic(_message, 's', &value) > 0);
-    return value;
-  }
-  bool readBoolean() override {
-    int value = 0;
-    TL_ASSERT(sd_bus_message_read_basic(_message, 'b', &value) > 0);
-    return value != 0;
-  }
-  int64_t readInt64() override {
-    int64_t value = 0;
-    TL_ASSERT(sd_bus_message_read_basic(_message, 'x', &value) > 0);
-    return value;
-  }
-  uint64_t readUInt64() override {
-    uint64_t value = 0;
-    TL_ASSERT(sd_bus_message_read_basic(_message, 't', &value) > 0);
-    return value;
-  }
-  std::string_view readBytes() override {
-    const void* data = nullptr;
-    size_t size = 0;
-    TL_ASSERT(sd_bus_message_read_array(_message, 'y', &data, &size) >= 0);
-    return size == 0 ? std::string_view() : std::string_view(static_cast<const char*>(data), size);
-  }
-  std::vector<std::string_view> readStringArray() override {
-    return readArray("s", [this] { return readString(); });
-  }
-  std::vector<std::string_view> readBytesArray() override {
-    return readArray("ay", [this] { return readBytes(); });
+  // None where the content is not what the signature says, or has too many elements.
+  [[nodiscard]] std::optional<std::vector<RPCArguments::Value>> read(std::string_view signature) {
+    std::vector<RPCArguments::Value> values;
+    while (!signature.empty()) {
+      const std::string_view type = firstType(signature);
+      signature.remove_prefix(type.size());
+      auto value = readValue(type);
+      if (!value) return std::nullopt;
+      values.push_back(std::move(*value));
+    }
+    return values;
   }
 
  private:
+  using Value = RPCArguments::Value;
+
+  // Of those that interfaces use.
+  static std::string_view firstType(std::string_view signature) {
+    return signature.substr(0, signature.find_first_not_of('a') + 1);
+  }
+
+  std::optional<Value> readValue(std::string_view type) {
+    if (type == "s") return text();
+    if (type == "b") {
+      int value = 0;
+      return basic('b', &value) ? std::optional<Value>(value != 0) : std::nullopt;
+    }
+    if (type == "x") return number<int64_t>('x');
+    if (type == "t") return number<uint64_t>('t');
+    if (type == "ay") return bytes();
+    if (type == "as") return array("s", [this] { return text(); });
+    TL_ASSERT(type == "aay");
+    return array("ay", [this] { return bytes(); });
+  }
+
+  bool basic(char type, void* value) {
+    return sd_bus_message_read_basic(_message, type, value) > 0;
+  }
+  template <typename T>
+  std::optional<Value> number(char type) {
+    T value = 0;
+    return basic(type, &value) ? std::optional<Value>(value) : std::nullopt;
+  }
+  std::optional<std::string_view> text() {
+    const char* value = nullptr;
+    if (!basic('s', &value)) return std::nullopt;
+    return value;
+  }
+  std::optional<std::string_view> bytes() {
+    const void* data = nullptr;
+    size_t size = 0;
+    if (sd_bus_message_read_array(_message, 'y', &data, &size) < 0) return std::nullopt;
+    return size == 0 ? std::string_view() : std::string_view(static_cast<const char*>(data), size);
+  }
   template <typename Read>
-  std::vector<std::string_view> readArray(const char* contents, const Read& read) {
+  std::optional<Value> array(const char* contents, const Read& readElement) {
     std::vector<std::string_view> values;
-    TL_ASSERT(sd_bus_message_enter_container(_message, 'a', contents) >= 0);
-    while (sd_bus_message_at_end(_message, 0) == 0) values.push_back(read());
-    TL_ASSERT(sd_bus_message_exit_container(_message) >= 0);
+    if (sd_bus_message_enter_container(_message, 'a', contents) < 0) return std::nullopt;
+    for (;;) {
+      const int atEnd = sd_bus_message_at_end(_message, 0);
+      if (atEnd < 0 || values.size() > kMaximumArrayElements) return std::nullopt;
+      if (atEnd > 0) break;
+      const auto value = readElement();
+      if (!value) return std::nullopt;
+      values.push_back(*value);
+    }
+    if (sd_bus_message_exit_container(_message) < 0) return std::nullopt;
     return values;
   }
 
   sd_bus_message* _message;
 };
 
+// D-Bus carries no NUL and nothing that is not UTF-8 in a text.
+std::string carriedText(const std::string& text) {
+  std::string carried = toUTF8(fromUTF8(text));
+  for (size_t at = 0; (at = carried.find('\0', at)) != std::string::npos;) {
+    carried.replace(at, 1, "\uFFFD");
+  }
+  return carried;
+}
+
 // Appends one value; the result is negative where D-Bus cannot carry it.
 struct Append {
   sd_bus_message* message;
 
   int operator()(const std::string& text) const {
-    return sd_bus_message_append_basic(message, 's', text.c_str());
+    return sd_bus_message_append_basic(message, 's', carriedText(text).c_str());
   }
   int operator()(bool value) const {
     const int number = value ? 1 : 0;
@@ -110,7 +156,8 @@ struct Append {
           const char* type = std::is_same_v<T, double>    ? "d"
                              : std::is_same_v<T, int64_t> ? "x"
                                                           : "t";
-          return sd_bus_message_append(message, "{sv}", entry.first.c_str(), type, number);
+          return sd_bus_message_append(message, "{sv}", carriedText(entry.first).c_str(), type,
+                                       number);
         },
         entry.second);
   }
@@ -140,14 +187,16 @@ int buildReturn(sd_bus_message* call, const RPCValues& values, sd_bus_message** 
 
 int buildFailure(sd_bus_message* call, const char* name, const std::string& message,
                  sd_bus_message** reply) {
-  const sd_bus_error failure{name, message.c_str(), 0};
+  const std::string text = carriedText(message);
+  const sd_bus_error failure{name, text.c_str(), 0};
   return sd_bus_message_new_method_error(call, reply, &failure);
 }
 
 int buildError(sd_bus_message* call, const TLError& error, sd_bus_message** reply) {
   const int result = buildFailure(call, kRPCErrorName, error.message, reply);
-  return result < 0 ? result
-                    : sd_bus_message_append(*reply, "si", error.domain.c_str(), error.code);
+  return result < 0
+             ? result
+             : sd_bus_message_append(*reply, "si", carriedText(error.domain).c_str(), error.code);
 }
 
 }  // namespace
@@ -182,13 +231,20 @@ void RPCOutbox::close() {
 
 // Knows its call by number only: the messages of the bus library are not for several threads, so
 // the connection keeps them and frees what is left when it ends.
+//
+// Holds the bytes of its request in the budget: whoever works on a request has its reply, also when
+// the connection has gone.
 class RPCServerReply : public RPCReply {
  public:
-  RPCServerReply(RPCServerConnection& connection, uint64_t call)
-      : _connection(connection), _outbox(connection._outbox), _call(call) {}
+  RPCServerReply(RPCServerConnection& connection, uint64_t call, size_t requestBytes)
+      : _connection(connection),
+        _outbox(connection._outbox),
+        _call(call),
+        _requestBytes(requestBytes) {}
 
   ~RPCServerReply() override {
     finish([](sd_bus_message*, sd_bus_message**) { return 0; }, 0);
+    RPCRequestBudget::shared().give(_requestBytes);
   }
 
   void send(RPCValues values) override {
@@ -226,70 +282,98 @@ class RPCServerReply : public RPCReply {
   RPCServerConnection& _connection;  // touched only where the outbox says that it lives
   const std::shared_ptr<RPCOutbox> _outbox;
   const uint64_t _call;
+  const size_t _requestBytes;
   std::atomic<bool> _finished{false};
 };
 
 RPCServerConnection::RPCServerConnection(int descriptor, std::string serviceName, std::string peer)
-    : _serviceName(std::move(serviceName)), _peer(std::move(peer)), _descriptor(descriptor) {}
+    : _serviceName(std::move(serviceName)),
+      _peer(std::move(peer)),
+      _socket(descriptor),
+      _idleSince(monotonicTicks()) {}
 
 RPCServerConnection::~RPCServerConnection() {
   if (_thread.joinable()) _thread.join();
-  if (_descriptor >= 0) close(_descriptor);
 }
 
-void RPCServerConnection::start(std::function<void()> ended) {
+bool RPCServerConnection::start(std::function<void()> ended) {
   _ended = std::move(ended);
   _loop = std::make_unique<RunLoop>();
+  if (!_loop->good()) return false;
   _outbox->open(_loop.get());
-  _thread = std::thread([this] { serve(); });
+  try {
+    _thread = std::thread([this] { serve(); });
+  } catch (const std::system_error&) {
+    _outbox->close();
+    return false;
+  }
+  return true;
 }
 
 void RPCServerConnection::finish(uint64_t milliseconds) {
   _outbox->post([this, milliseconds] { endSoon(milliseconds); });
 }
 
+RPCServerConnection::Idleness RPCServerConnection::idleness() const {
+  return {_inFlight != 0 || _evicted, _called, _idleSince};
+}
+
+void RPCServerConnection::evict() {
+  _evicted = true;
+  _outbox->post([this] { endBecause("another needs its place"); });
+}
+
 void RPCServerConnection::serve() {
   setThreadName("tallow.rpc");
   _outbox->begin();
   if (openBus() && exportInterface()) {
-    _authenticationTimer = _loop->addTimer(kAuthenticationMilliseconds, [this] {
-      if (sd_bus_is_ready(_bus) > 0) return;
-      log().error("Closing connection {}: not authenticated in time", description());
-      end();
-    });
     _loop->run();
+  } else {
+    log().error("Could not serve connection {}", description());
   }
   _outbox->close();
+  _source.reset();
   _authenticationTimer.reset();
+  _progressTimer.reset();
   _deadlineTimer.reset();
   _idleTimer.reset();
   for (const auto& [number, call] : _calls) sd_bus_message_unref(call);
+  RPCRequestBudget::shared().give(_messageBytes);
   if (_bus != nullptr) {
     sd_bus_detach_event(_bus);
     sd_bus_close_unref(_bus);
   }
+  _inlet.reset();
+  _socket.reset();
   _loop.reset();
   _ended();
 }
 
 bool RPCServerConnection::openBus() {
+  int ends[2];
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) return false;
+  _inlet = FileDescriptor(ends[0]);
+  FileDescriptor input(ends[1]);
+  FileDescriptor output(fcntl(_socket.get(), F_DUPFD_CLOEXEC, 0));
   sd_id128_t id;
-  if (sd_bus_new(&_bus) < 0) return false;
-  const int descriptor = std::exchange(_descriptor, -1);
-  const auto matchLocalSignal = [this](const char* member, sd_bus_message_handler_t handler) {
-    constexpr const char* kLocal = "org.freedesktop.DBus.Local";
-    return sd_bus_match_signal_async(_bus, nullptr, kLocal, nullptr, kLocal, member, handler,
-                                     nullptr, this) >= 0;
-  };
-  const bool ready = sd_bus_set_fd(_bus, descriptor, descriptor) >= 0 &&
-                     sd_id128_randomize(&id) >= 0 && sd_bus_set_server(_bus, 1, id) >= 0 &&
-                     sd_bus_negotiate_fds(_bus, 0) >= 0 && sd_bus_set_trusted(_bus, 1) >= 0 &&
-                     sd_bus_set_connected_signal(_bus, 1) >= 0 && sd_bus_start(_bus) >= 0 &&
-                     matchLocalSignal("Connected", onConnected) &&
-                     matchLocalSignal("Disconnected", onDisconnected) &&
-                     sd_bus_attach_event(_bus, _loop->event(), SD_EVENT_PRIORITY_NORMAL) >= 0;
-  if (!ready) log().error("Could not serve connection {}", description());
-  return ready;
+  if (output.get() < 0 || sd_bus_new(&_bus) < 0) return false;
+  if (sd_bus_set_fd(_bus, input.get(), output.get()) < 0) return false;
+  static_cast<void>(input.release());
+  static_cast<void>(output.release());
+  constexpr const char* kLocal = "org.freedesktop.DBus.Local";
+  const bool ready =
+      sd_id128_randomize(&id) >= 0 && sd_bus_set_server(_bus, 1, id) >= 0 &&
+      sd_bus_negotiate_fds(_bus, 0) >= 0 && sd_bus_set_trusted(_bus, 1) >= 0 &&
+      sd_bus_start(_bus) >= 0 &&
+      sd_bus_match_signal_async(_bus, nullptr, kLocal, nullptr, kLocal, "Disconnected",
+                                onDisconnected, nullptr, this) >= 0 &&
+      sd_bus_attach_event(_bus, _loop->event(), SD_EVENT_PRIORITY_NORMAL) >= 0;
+  if (!ready) return false;
+  _source = _loop->addSocket(_socket.get(), [this](bool peerGone) { onSocket(peerGone); });
+  _authenticationTimer = _loop->addTimer(kAuthenticationMilliseconds, [this] {
+    if (sd_bus_is_ready(_bus) <= 0) endBecause("not authenticated in time");
+  });
+  return _source != nullptr && _authenticationTimer != nullptr;
 }
 
 bool RPCServerConnection::exportInterface() {
@@ -323,17 +407,130 @@ bool RPCServerConnection::exportInterface() {
   return result >= 0;
 }
 
-// A call that came in one piece with the end of the authentication is in the bus's buffer now, and
-// the loop would not look at it before more bytes arrive.
-int RPCServerConnection::onConnected(sd_bus_message*, void* data, sd_bus_error*) {
-  auto* connection = static_cast<RPCServerConnection*>(data);
-  connection->_loop->post([connection] { connection->processWaiting(); });
-  return 1;
+void RPCServerConnection::onSocket(bool peerGone) {
+  if (_reading) {
+    pump();
+  } else if (peerGone) {
+    end();
+  }
 }
 
-void RPCServerConnection::processWaiting() {
-  while (!_ending && !_paused && sd_bus_process(_bus, nullptr) > 0) {
+void RPCServerConnection::pump() {
+  constexpr uint64_t kMessagesAtATime =
+      16;  // then replies and the rest of the loop have their turn
+  const uint64_t last = _messages + kMessagesAtATime;
+  if (_awaitsRoom && !admit()) return;
+  while (!_ending) {
+    if (_messages == last) {
+      return _loop->post([this] {
+        if (!_ending) pump();
+      });
+    }
+    const bool betweenMessages = !_framer.inMessage();
+    if (betweenMessages && _calls.size() >= kMaximumPendingCalls) return setReading(false);
+    if (_unread.empty() && !readSome()) break;
+    const RPCFramer::Piece piece = _framer.next(_unread);
+    const std::string_view bytes = _unread.substr(0, piece.size);
+    _unread.remove_prefix(piece.size);
+    switch (piece.part) {
+      case RPCFramer::Part::header:
+        break;
+      case RPCFramer::Part::begins:
+        if (!admit()) return;
+        break;
+      case RPCFramer::Part::more:
+        feed(bytes);
+        break;
+      case RPCFramer::Part::ends:
+        feed(bytes);
+        endMessage();
+        break;
+      case RPCFramer::Part::unacceptable:
+        return endBecause("it sends what is no message");
+    }
   }
+  if (_ending) return;
+  setReading(true);
+  watchProgress();
+}
+
+bool RPCServerConnection::readSome() {
+  constexpr size_t kBufferBytes = size_t{64} << 10;
+  _buffer.resize(kBufferBytes);
+  const ssize_t size = recv(_socket.get(), _buffer.data(), _buffer.size(), 0);
+  if (size > 0) {
+    _unread = std::string_view(_buffer).substr(0, static_cast<size_t>(size));
+    _received += static_cast<uint64_t>(size);
+    return true;
+  }
+  if (size == 0 || (errno != EAGAIN && errno != EINTR)) end();
+  return false;
+}
+
+bool RPCServerConnection::admit() {
+  const size_t bytes = _framer.messageBytes();
+  const auto resume = [this, outbox = _outbox] { outbox->post([this] { pump(); }); };
+  _awaitsRoom = !RPCRequestBudget::shared().take(bytes, resume);
+  if (_awaitsRoom) {
+    setReading(false);
+    return false;
+  }
+  _messageBytes = bytes;
+  feed(_framer.header());
+  return true;
+}
+
+// The bus takes all that it is given, so that a full inlet is empty once it has worked.
+void RPCServerConnection::feed(std::string_view bytes) {
+  while (!bytes.empty() && !_ending) {
+    const ssize_t size = send(_inlet.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    if (size > 0) {
+      bytes.remove_prefix(static_cast<size_t>(size));
+    } else if (errno == EAGAIN || errno == EINTR) {
+      processBus();
+    } else {
+      end();
+    }
+  }
+}
+
+void RPCServerConnection::processBus() {
+  int result = 1;
+  while (!_ending && result > 0) result = sd_bus_process(_bus, nullptr);
+  if (result < 0) end();
+}
+
+void RPCServerConnection::endMessage() {
+  ++_messages;
+  processBus();
+  // What the bus has not handed over is no call of the interface.
+  RPCRequestBudget::shared().give(std::exchange(_messageBytes, 0));
+}
+
+void RPCServerConnection::watchProgress() {
+  if (!_framer.inMessage() || _progressTimer != nullptr) return;
+  _receivedBefore = _received;
+  _messagesBefore = _messages;
+  _progressTimer =
+      _loop->addTimer(kProgressMilliseconds, [this] { _loop->post([this] { checkProgress(); }); });
+}
+
+// What waits in the socket counts: this thread may have been busy with a call.
+void RPCServerConnection::checkProgress() {
+  if (_ending) return;
+  if (_reading) pump();
+  if (_ending) return;
+  const bool stuck = _reading && _framer.inMessage() && _messages == _messagesBefore &&
+                     _received - _receivedBefore < kProgressBytes;
+  if (stuck) return endBecause("a message does not go on");
+  _progressTimer.reset();
+  watchProgress();
+}
+
+void RPCServerConnection::setReading(bool reading) {
+  if (_reading == reading) return;
+  _reading = reading;
+  _source->setReading(reading);
 }
 
 int RPCServerConnection::onDisconnected(sd_bus_message*, void* data, sd_bus_error*) {
@@ -342,34 +539,74 @@ int RPCServerConnection::onDisconnected(sd_bus_message*, void* data, sd_bus_erro
 }
 
 int RPCServerConnection::onMessage(sd_bus_message* message, void* data, sd_bus_error*) {
-  static_cast<RPCServerConnection*>(data)->dispatch(message);
-  return 1;
+  return static_cast<RPCServerConnection*>(data)->dispatch(message);
 }
 
-void RPCServerConnection::dispatch(sd_bus_message* message) {
-  const std::string_view member = sd_bus_message_get_member(message);
-  const auto method = std::find_if(_interface->methods.begin(), _interface->methods.end(),
-                                   [&](const RPCMethod& m) { return member == m.member; });
-  TL_ASSERT(method != _interface->methods.end());
-  const uint64_t number = _nextCall++;
-  _calls.emplace(number, sd_bus_message_ref(message));
-  if (_calls.size() >= kMaximumPendingCalls) {
-    sd_bus_detach_event(_bus);
-    _paused = true;
+// A message of this side with the cookie of the call and nothing of its content: all that a reply
+// needs to know. Null for want of memory.
+sd_bus_message* standInFor(sd_bus* bus, sd_bus_message* call) {
+  uint64_t cookie = 0;
+  sd_bus_message* made = nullptr;
+  const bool good =
+      sd_bus_message_get_cookie(call, &cookie) >= 0 &&
+      sd_bus_message_new_method_call(bus, &made, nullptr, "/", nullptr, "Call") >= 0 &&
+      sd_bus_message_set_expect_reply(made, sd_bus_message_get_expect_reply(call)) >= 0 &&
+      sd_bus_message_seal(made, cookie, 0) >= 0;
+  return good ? made : sd_bus_message_unref(made);
+}
+
+int RPCServerConnection::dispatch(sd_bus_message* message) {
+  const char* const member = sd_bus_message_get_member(message);
+  const auto method =
+      std::find_if(_interface->methods.begin(), _interface->methods.end(), [&](const RPCMethod& m) {
+        return member != nullptr && std::string_view(member) == m.member;
+      });
+  if (method == _interface->methods.end()) return 0;
+  try {
+    auto values = ArgumentReader(message).read(method->inputSignature);
+    if (!values) {
+      return sd_bus_reply_method_errorf(message, kRPCInvalidArgs,
+                                        "The content of the call to %s is not \"%s\"", member,
+                                        method->inputSignature);
+    }
+    sd_bus_message* const call = standInFor(_bus, message);
+    if (call == nullptr) return -ENOMEM;
+    const uint64_t number = _nextCall++;
+    _calls.emplace(number, call);
+    _inFlight = _calls.size();
+    _called = true;
+    const auto reply =
+        std::make_shared<RPCServerReply>(*this, number, std::exchange(_messageBytes, 0));
+    try {
+      RPCArguments arguments(std::move(*values));
+      method->handler(arguments, reply);
+    } catch (const std::bad_alloc&) {
+      reply->sendFailure(SD_BUS_ERROR_NO_MEMORY, "There is not enough memory for the call");
+    } catch (const std::system_error& failure) {
+      reply->sendError(posixError(failure.code().value(), member));
+    } catch (const std::exception& failure) {
+      log().fault("{} failed on {}: {}", member, description(), failure.what());
+      reply->sendFailure(SD_BUS_ERROR_FAILED, failure.what());
+    }
+  } catch (const std::bad_alloc&) {
+    return -ENOMEM;
   }
-  MessageArguments arguments(message);
-  method->handler(arguments, std::make_shared<RPCServerReply>(*this, number));
+  return 1;
 }
 
 void RPCServerConnection::endCall(uint64_t number, const BuildReply& build, size_t bytes) {
   const auto entry = _calls.find(number);
+  if (entry == _calls.end()) return;
   sendReply(entry->second, build);
   sd_bus_message_unref(entry->second);
   _calls.erase(entry);
+  _idleSince = monotonicTicks();
+  _inFlight = _calls.size();
   checkQueue(bytes);
-  if (_paused && !_ending && _calls.size() < kMaximumPendingCalls) {
-    _paused = false;
-    sd_bus_attach_event(_bus, _loop->event(), SD_EVENT_PRIORITY_NORMAL);
+  if (!_reading && !_ending) {
+    _loop->post([this] {
+      if (!_ending) pump();
+    });
   }
   if (_finishing) endIfIdle();
 }
@@ -381,8 +618,11 @@ void RPCServerConnection::sendReply(sd_bus_message* call, const BuildReply& buil
   if (result < 0) {
     sd_bus_message_unref(reply);
     reply = nullptr;
-    result = buildFailure(call, SD_BUS_ERROR_LIMITS_EXCEEDED,
-                          "The reply is too large for one message", &reply);
+    const bool invalid = result == -EINVAL;
+    result = buildFailure(
+        call, invalid ? SD_BUS_ERROR_FAILED : SD_BUS_ERROR_LIMITS_EXCEEDED,
+        invalid ? "The reply cannot be carried by D-Bus" : "The reply is too large for one message",
+        &reply);
   }
   if (result >= 0 && reply != nullptr) result = sd_bus_send(_bus, reply, nullptr);
   sd_bus_message_unref(reply);
@@ -394,7 +634,11 @@ void RPCServerConnection::checkQueue(size_t bytes) {
   sd_bus_get_n_queued_write(_bus, &waiting);
   _queuedBytes = waiting == 0 ? 0 : _queuedBytes + bytes;
   if (waiting < kMaximumQueuedMessages && _queuedBytes <= kMaximumQueuedBytes) return;
-  log().error("Closing connection {}: {} replies are not read", description(), waiting);
+  endBecause("its replies are not read");
+}
+
+void RPCServerConnection::endBecause(const char* reason) {
+  log().error("Closing connection {}: {}", description(), reason);
   end();
 }
 

@@ -5,12 +5,15 @@
 #include <atomic>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <unordered_map>
 #include <vector>
 
+#include "platform/FileDescriptor.h"
 #include "platform/Mutex.h"
 #include "platform/RPC.h"
+#include "platform/RPCInlet.h"
 
 namespace platform {
 
@@ -32,9 +35,14 @@ class RPCOutbox {
   std::thread::id _thread TL_GUARDED_BY(_mutex);
 };
 
-// One accepted connection: the bus object and the thread that serves it. Made and destroyed on the
-// listener's thread; all fields but the ones named below belong to the connection's thread once
-// `start` has been called.
+// One accepted connection: the bus object and the thread that serves it.
+//
+// What the peer sends is read here and passed on to the bus one message at a time, once there is
+// room for it. So no request is held twice, and not to read from a peer leaves replies and its end
+// alone.
+//
+// Made and destroyed on the listener's thread; all fields but the ones named below belong to the
+// connection's thread once `start` has been called.
 class RPCServerConnection : public RPCConnection {
  public:
   // Takes over `descriptor`.
@@ -45,12 +53,24 @@ class RPCServerConnection : public RPCConnection {
   [[nodiscard]] std::string description() const override { return _serviceName + " " + _peer; }
   void setExportedInterface(const RPCInterface* interface) override { _interface = interface; }
 
-  // Starts the thread; `ended` is called on it as the last thing that it does.
-  void start(std::function<void()> ended);
+  // Starts the thread; `ended` is called on it as the last thing that it does. False when the
+  // system has no thread, descriptors or memory for it.
+  [[nodiscard]] bool start(std::function<void()> ended);
 
   // Any thread: the connection ends once no call of it is pending and what is ready has gone out,
   // or after `milliseconds`.
   void finish(uint64_t milliseconds);
+
+  // Whether, and for how long, it does nothing. Any thread.
+  struct Idleness {
+    bool calling = false;  // a call is in flight, or it has been told to go
+    bool called = false;   // it has ever made one
+    uint64_t since = 0;    // the monotonic clock, in nanoseconds
+  };
+  [[nodiscard]] Idleness idleness() const;
+  // Any thread: ends it, to make room for another.
+  void evict();
+  [[nodiscard]] bool evicted() const { return _evicted; }
 
  private:
   friend class RPCServerReply;
@@ -61,38 +81,73 @@ class RPCServerConnection : public RPCConnection {
   void serve();
   bool openBus();
   bool exportInterface();
-  void processWaiting();
-  void dispatch(sd_bus_message* message);
+
+  void onSocket(bool peerGone);
+  // Passes on what the peer has sent, as far as calls in flight and room allow.
+  void pump();
+  // False when there is nothing to read now.
+  bool readSome();
+  // Passes the header on once there is room for its message.
+  bool admit();
+  void feed(std::string_view bytes);
+  // Has the bus do what it can; a message has reached it in full.
+  void processBus();
+  void endMessage();
+  void watchProgress();
+  void checkProgress();
+  void setReading(bool reading);
+
+  int dispatch(sd_bus_message* message);
   void endCall(uint64_t number, const BuildReply& build, size_t bytes);
   void sendReply(sd_bus_message* call, const BuildReply& build);
   void checkQueue(size_t bytes);
   void endSoon(uint64_t milliseconds);
   void endIfIdle();
   void end();
+  void endBecause(const char* reason);
   static int onMessage(sd_bus_message* message, void* data, sd_bus_error* error);
-  static int onConnected(sd_bus_message* message, void* data, sd_bus_error* error);
   static int onDisconnected(sd_bus_message* message, void* data, sd_bus_error* error);
 
   const std::string _serviceName;
   const std::string _peer;
-  int _descriptor;
   const RPCInterface* _interface = nullptr;
   std::function<void()> _ended;
 
+  FileDescriptor _socket;
+  FileDescriptor _inlet;  // the bus reads what is written here
   std::unique_ptr<RunLoop> _loop;
   const std::shared_ptr<RPCOutbox> _outbox = std::make_shared<RPCOutbox>();  // self-synchronised
   sd_bus* _bus = nullptr;
   std::vector<sd_bus_vtable> _vtable;
   std::vector<std::string> _vtableNames;
+  std::unique_ptr<RunLoop::Socket> _source;
   std::unique_ptr<RunLoop::Source> _authenticationTimer;
+  std::unique_ptr<RunLoop::Source> _progressTimer;
   std::unique_ptr<RunLoop::Source> _deadlineTimer;
   std::unique_ptr<RunLoop::Source> _idleTimer;
-  std::unordered_map<uint64_t, sd_bus_message*> _calls;  // whose reply is outstanding
+
+  RPCFramer _framer;
+  std::string _buffer;       // what was read
+  std::string_view _unread;  // of it, what was not passed on
+  bool _reading = true;
+  bool _awaitsRoom = false;      // the message whose header is complete
+  size_t _messageBytes = 0;      // of the budget, for the message that is being received
+  uint64_t _received = 0;        // bytes
+  uint64_t _messages = 0;        // received in full
+  uint64_t _receivedBefore = 0;  // at the last look at the progress, as is the next
+  uint64_t _messagesBefore = 0;
+
+  // Whose reply is outstanding: a message that stands for the call, with its cookie and no content.
+  std::unordered_map<uint64_t, sd_bus_message*> _calls;
   uint64_t _nextCall = 0;
   size_t _queuedBytes = 0;  // of the replies in the bus's write queue, an upper bound
-  bool _paused = false;     // detached from the loop, as too many calls are pending
   bool _finishing = false;
   bool _ending = false;
+
+  std::atomic<size_t> _inFlight{0};  // the size of _calls; any thread reads these four
+  std::atomic<bool> _called{false};
+  std::atomic<uint64_t> _idleSince;
+  std::atomic<bool> _evicted{false};
 
   std::thread _thread;
 };

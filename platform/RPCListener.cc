@@ -6,12 +6,13 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <atomic>
 #include <cerrno>
 #include <list>
+#include <vector>
 
 #include "platform/Files.h"
 #include "platform/Log.h"
+#include "platform/Mutex.h"
 #include "platform/Paths.h"
 #include "platform/RPCConnection.h"
 
@@ -20,14 +21,62 @@ namespace platform {
 namespace {
 
 constexpr int kBacklog = 64;
+// Between two looks at a peer that cannot even be refused.
+constexpr useconds_t kNoDescriptorsMicroseconds = 10000;
 
 const Log& log() {
   static const Log handle(kSubsystem, "RPC");
   return handle;
 }
 
-// Of the whole process, over all listeners.
-std::atomic<size_t> openConnections{0};
+// The connections of the process, over all listeners, in the order of their coming. Any thread;
+// those in it are alive.
+class ConnectionTable {
+ public:
+  // False when all places are taken by connections that have calls in flight.
+  bool enter(RPCServerConnection* connection) TL_EXCLUDES(_mutex) {
+    MutexLock lock(_mutex);
+    // Those that were told to go are still there for a moment.
+    if (_connections.size() >= 2 * kMaximumConnections) return false;
+    const auto staying = std::count_if(_connections.begin(), _connections.end(),
+                                       [](const auto* one) { return !one->evicted(); });
+    if (static_cast<size_t>(staying) >= kMaximumConnections && !evictOne()) return false;
+    _connections.push_back(connection);
+    return true;
+  }
+
+  void leave(const RPCServerConnection* connection) TL_EXCLUDES(_mutex) {
+    MutexLock lock(_mutex);
+    std::erase(_connections, connection);
+  }
+
+ private:
+  // Those that have never made a call go first, so that many that come and say nothing push nobody
+  // else out.
+  bool evictOne() TL_REQUIRES(_mutex) {
+    RPCServerConnection* chosen = nullptr;
+    RPCServerConnection::Idleness least;
+    for (RPCServerConnection* connection : _connections) {
+      const auto idle = connection->idleness();
+      if (idle.calling) continue;
+      const bool longer = chosen == nullptr || (least.called && !idle.called) ||
+                          (least.called == idle.called && idle.since < least.since);
+      if (!longer) continue;
+      chosen = connection;
+      least = idle;
+    }
+    if (chosen != nullptr) chosen->evict();
+    return chosen != nullptr;
+  }
+
+  Mutex _mutex;
+  std::vector<RPCServerConnection*> _connections TL_GUARDED_BY(_mutex);
+};
+
+ConnectionTable& connectionTable() {
+  static auto* instance = new ConnectionTable;
+  return *instance;
+}
 
 // The socket that systemd handed over under `name`, -1 for none.
 int activatedSocket(const std::string& name) {
@@ -105,7 +154,8 @@ class SocketListener : public RPCListener {
     if (_descriptor < 0) return false;
     _spare = open("/dev/null", O_RDONLY | O_CLOEXEC);
     _source = _loop.addReadable(_descriptor, [this] { acceptOne(); });
-    return true;
+    if (_source == nullptr) setError(error, posixError(ENOMEM, _serviceName));
+    return _source != nullptr;
   }
 
   void invalidate(uint64_t milliseconds) override {
@@ -116,7 +166,7 @@ class SocketListener : public RPCListener {
       if (!_path.empty()) unlink(_path.c_str());
     }
     for (const auto& connection : _connections) connection->finish(milliseconds);
-    openConnections -= _connections.size();
+    for (const auto& connection : _connections) connectionTable().leave(connection.get());
     _connections.clear();
     *_alive = false;
   }
@@ -129,6 +179,7 @@ class SocketListener : public RPCListener {
     } else if (errno == EMFILE || errno == ENFILE) {
       // Out of descriptors: the spare one lets the peer be refused rather than wait for ever.
       log().error("Refusing connection on {}: out of file descriptors", _serviceName);
+      if (_spare < 0) usleep(kNoDescriptorsMicroseconds);
       close(_spare);
       close(accept4(_descriptor, nullptr, nullptr, SOCK_CLOEXEC));
       _spare = open("/dev/null", O_RDONLY | O_CLOEXEC);
@@ -143,24 +194,34 @@ class SocketListener : public RPCListener {
         descriptor, _serviceName, fmt::format("pid {} uid {}", peer.pid, peer.uid));
     if (peer.uid != geteuid() && peer.uid != 0) {
       log().error("Refusing connection {}: foreign user", connection->description());
-    } else if (openConnections >= kMaximumConnections) {
+    } else if (!_delegate(*this, *connection)) {
+      return;
+    } else if (!connectionTable().enter(connection.get())) {
       log().error("Refusing connection {}: {} are open", connection->description(),
                   kMaximumConnections);
-    } else if (_delegate(*this, *connection)) {
-      ++openConnections;
+    } else {
+      begin(std::move(connection));
+    }
+  }
+
+  void begin(std::unique_ptr<RPCServerConnection> connection) {
+    RPCServerConnection* const which = connection.get();
+    const bool started = connection->start([this, &loop = _loop, alive = _alive, which] {
+      loop.post([this, alive, which] {
+        if (*alive) reap(which);
+      });
+    });
+    if (started) {
       _connections.push_back(std::move(connection));
-      _connections.back()->start(
-          [this, &loop = _loop, alive = _alive, which = _connections.back().get()] {
-            loop.post([this, alive, which] {
-              if (*alive) reap(which);
-            });
-          });
+    } else {
+      log().error("Refusing connection {}: no thread or no descriptors", which->description());
+      connectionTable().leave(which);
     }
   }
 
   void reap(const RPCServerConnection* which) {
-    openConnections -= _connections.remove_if(
-        [which](const auto& connection) { return connection.get() == which; });
+    connectionTable().leave(which);
+    _connections.remove_if([which](const auto& connection) { return connection.get() == which; });
   }
 
   RunLoop& _loop;

@@ -10,7 +10,6 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Assert.h"
 #include "platform/Mutex.h"
 
 namespace platform {
@@ -24,9 +23,13 @@ void takeSignalFromProcess(int signal) {
 
 namespace {
 
-class EventSource : public RunLoop::Source {
+class EventSource : public RunLoop::Socket {
  public:
   ~EventSource() override { sd_event_source_disable_unref(_source); }
+
+  void setReading(bool reading) override {
+    sd_event_source_set_io_events(_source, reading ? uint32_t{EPOLLIN} : 0);
+  }
 
   std::function<void(int)> handler;
   sd_event_source* _source = nullptr;
@@ -39,6 +42,11 @@ int onSignal(sd_event_source*, const signalfd_siginfo* info, void* data) {
 
 int onReadable(sd_event_source*, int descriptor, uint32_t, void* data) {
   static_cast<EventSource*>(data)->handler(descriptor);
+  return 0;
+}
+
+int onSocket(sd_event_source*, int, uint32_t events, void* data) {
+  static_cast<EventSource*>(data)->handler((events & (EPOLLHUP | EPOLLERR)) != 0 ? 1 : 0);
   return 0;
 }
 
@@ -78,23 +86,28 @@ struct RunLoop::Body {
 };
 
 RunLoop::RunLoop() : _body(std::make_unique<Body>()) {
-  TL_ASSERT(sd_event_new(&_body->event) >= 0);
+  if (sd_event_new(&_body->event) < 0) return;
   _body->wake = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-  TL_ASSERT(_body->wake >= 0);
+  if (_body->wake < 0) return;
   _body->wakeSource = addReadable(_body->wake, [body = _body.get()] { body->runItems(); });
 }
 
 RunLoop::~RunLoop() {
   _body->wakeSource.reset();
-  close(_body->wake);
+  if (_body->wake >= 0) close(_body->wake);
   sd_event_unref(_body->event);
+}
+
+bool RunLoop::good() const {
+  return _body->wakeSource != nullptr;
 }
 
 std::unique_ptr<RunLoop::Source> RunLoop::addSignal(int signal, std::function<void(int)> handler) {
   auto source = std::make_unique<EventSource>();
   source->handler = std::move(handler);
-  TL_ASSERT(sd_event_add_signal(_body->event, &source->_source, signal, onSignal, source.get()) >=
-            0);
+  if (sd_event_add_signal(_body->event, &source->_source, signal, onSignal, source.get()) < 0) {
+    return nullptr;
+  }
   return source;
 }
 
@@ -102,8 +115,21 @@ std::unique_ptr<RunLoop::Source> RunLoop::addReadable(int descriptor,
                                                       std::function<void()> handler) {
   auto source = std::make_unique<EventSource>();
   source->handler = [handler = std::move(handler)](int) { handler(); };
-  TL_ASSERT(sd_event_add_io(_body->event, &source->_source, descriptor, EPOLLIN, onReadable,
-                            source.get()) >= 0);
+  if (sd_event_add_io(_body->event, &source->_source, descriptor, EPOLLIN, onReadable,
+                      source.get()) < 0) {
+    return nullptr;
+  }
+  return source;
+}
+
+std::unique_ptr<RunLoop::Socket> RunLoop::addSocket(int descriptor,
+                                                    std::function<void(bool)> handler) {
+  auto source = std::make_unique<EventSource>();
+  source->handler = [handler = std::move(handler)](int peerGone) { handler(peerGone != 0); };
+  if (sd_event_add_io(_body->event, &source->_source, descriptor, EPOLLIN, onSocket, source.get()) <
+      0) {
+    return nullptr;
+  }
   return source;
 }
 
@@ -111,8 +137,10 @@ std::unique_ptr<RunLoop::Source> RunLoop::addTimer(uint64_t milliseconds,
                                                    std::function<void()> handler) {
   auto source = std::make_unique<EventSource>();
   source->handler = [handler = std::move(handler)](int) { handler(); };
-  TL_ASSERT(sd_event_add_time_relative(_body->event, &source->_source, CLOCK_MONOTONIC,
-                                       milliseconds * 1000, 0, onTimer, source.get()) >= 0);
+  if (sd_event_add_time_relative(_body->event, &source->_source, CLOCK_MONOTONIC,
+                                 milliseconds * 1000, 0, onTimer, source.get()) < 0) {
+    return nullptr;
+  }
   return source;
 }
 

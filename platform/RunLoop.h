@@ -26,17 +26,32 @@ class RunLoop {
    public:
     virtual ~Source() = default;
   };
+  class Socket : public Source {
+   public:
+    // While not reading, only the end of the peer is told.
+    virtual void setReading(bool reading) = 0;
+  };
 
   RunLoop();
   ~RunLoop();
   RunLoop(const RunLoop&) = delete;
   RunLoop& operator=(const RunLoop&) = delete;
 
+  // False when the system had no descriptors or memory for it; nothing else may be called then.
+  [[nodiscard]] bool good() const;
+
+  // Sources are null when the system has no descriptors or memory for them.
+
   // Calls `handler` with the number each time the signal arrives; needs takeSignalFromProcess.
   [[nodiscard]] std::unique_ptr<Source> addSignal(int signal, std::function<void(int)> handler);
 
   // Calls `handler` while `descriptor` can be read.
   [[nodiscard]] std::unique_ptr<Source> addReadable(int descriptor, std::function<void()> handler);
+
+  // Calls `handler` while `descriptor`, a connected socket, can be read, and once its peer has gone
+  // for good.
+  [[nodiscard]] std::unique_ptr<Socket> addSocket(int descriptor,
+                                                  std::function<void(bool peerGone)> handler);
 
   // Calls `handler` once, `milliseconds` from now.
   [[nodiscard]] std::unique_ptr<Source> addTimer(uint64_t milliseconds,

@@ -1,3 +1,4 @@
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -6,13 +7,17 @@
 #include <systemd/sd-bus.h>
 #include <unistd.h>
 
+#include <cstring>
+#include <filesystem>
 #include <future>
 #include <latch>
+#include <system_error>
 #include <thread>
 
 #include "platform/Files.h"
 #include "platform/Queue.h"
 #include "platform/RPC.h"
+#include "platform/RPCInlet.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -42,6 +47,50 @@ bool waitForEnd(int descriptor) {
   return n == 0 || errno == ECONNRESET;
 }
 
+std::string authentication() {
+  std::string text = std::string(1, '\0') + "AUTH EXTERNAL ";
+  for (const char digit : std::to_string(getuid())) text += fmt::format("{:02x}", digit);
+  return text + "\r\n";
+}
+
+// What comes next, empty at the end.
+std::string receiveSome(int descriptor) {
+  char buffer[4096];
+  const ssize_t size = recv(descriptor, buffer, sizeof buffer, 0);
+  return {buffer, static_cast<size_t>(std::max<ssize_t>(size, 0))};
+}
+
+void authenticate(int descriptor) {
+  const std::string text = authentication();
+  ASSERT_GT(send(descriptor, text.data(), text.size(), 0), 0);
+  ASSERT_FALSE(receiveSome(descriptor).empty());
+  ASSERT_EQ(send(descriptor, "BEGIN\r\n", 7, 0), 7);
+}
+
+// A little-endian call with serial 1, put together by hand.
+std::string messageOf(const char* member, const char* signature, const std::string& body) {
+  std::string fields;
+  const auto number = [](size_t value) {
+    std::string bytes;
+    for (size_t i = 0; i < 4; ++i) bytes += static_cast<char>(value >> (8 * i));
+    return bytes;
+  };
+  const auto field = [&](char code, const char* type, const std::string& value) {
+    while (fields.size() % 8 != 0) fields += '\0';
+    fields += std::string({code, 1}) + type + '\0';
+    fields += *type == 'g' ? std::string(1, static_cast<char>(value.size())) : number(value.size());
+    fields += value + '\0';
+  };
+  field(1, "o", kPath);
+  field(2, "s", kService);
+  field(3, "s", member);
+  field(8, "g", signature);
+  std::string message =
+      std::string("l\1\0\1", 4) + number(body.size()) + number(1) + number(fields.size()) + fields;
+  while (message.size() % 8 != 0) message += '\0';
+  return message + body;
+}
+
 class Client {
  public:
   explicit Client(const std::string& path) {
@@ -56,6 +105,15 @@ class Client {
     sd_bus_message* call = nullptr;
     sd_bus_message_new_method_call(bus, &call, nullptr, kPath, kService, member);
     return call;
+  }
+
+  // Makes a call that the test answers.
+  void hold() const {
+    sd_bus_message* call = newCall("Hold");
+    uint64_t cookie = 0;  // asking for it asks for a reply
+    EXPECT_GE(sd_bus_send(bus, call, &cookie), 0);
+    sd_bus_message_unref(call);
+    EXPECT_GE(sd_bus_flush(bus), 0);
   }
 
   // The text of the reply, or the name of the error.
@@ -88,6 +146,9 @@ class RPCTest : public testing::Test {
          [this](platform::RPCArguments& arguments, std::shared_ptr<platform::RPCReply> reply) {
            std::string text(arguments.readString());
            if (text == "fail") return reply->sendError({"Domain", -2, "went wrong"});
+           if (text == "memory") throw std::bad_alloc();
+           if (text == "thread") throw std::system_error(EAGAIN, std::generic_category());
+           if (text == "binary") return reply->send({std::string("\xFF\0x", 3)});
            queue.submit([text, reply] { reply->send({text}); });
          }});
     interface.methods.push_back(
@@ -106,6 +167,14 @@ class RPCTest : public testing::Test {
          {},
          [this](platform::RPCArguments&, std::shared_ptr<platform::RPCReply> reply) {
            held.set_value(std::move(reply));
+         }});
+    interface.methods.push_back(
+        {"List",
+         "as",
+         "s",
+         {"texts", "output"},
+         [](platform::RPCArguments& arguments, std::shared_ptr<platform::RPCReply> reply) {
+           reply->send({std::to_string(arguments.readStringArray().size())});
          }});
     listener = platform::makeRPCListener(loop, directory.path(), kService);
     listener->setDelegate([this](platform::RPCListener& l, platform::RPCConnection& connection) {
@@ -126,10 +195,23 @@ class RPCTest : public testing::Test {
 
   std::string path() const { return directory / kService; }
 
+  // Waits until no connection has a thread any more.
+  static void waitForThreads() {
+    const auto serving = [] {
+      for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+        const auto name = platform::readFile(task.path() / "comm", 64, nullptr);
+        if (name == "tallow.rpc\n") return true;
+      }
+      return false;
+    };
+    while (serving()) std::this_thread::yield();
+  }
+
   testsupport::TemporaryDirectory directory;
   testsupport::LogCapture log;
   platform::SerialQueue queue;
   std::promise<std::shared_ptr<platform::RPCReply>> held;
+  std::vector<std::shared_ptr<platform::RPCReply>> replies;
   platform::RPCInterface interface;
   platform::RunLoop loop;
   std::unique_ptr<platform::RPCListener> listener;
@@ -184,47 +266,24 @@ TEST(RPCListener, AStaleSocketIsReplaced) {
 
 // The call comes in one piece with the end of the authentication, as some libraries send it.
 TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
+  using namespace std::string_literals;
   const int descriptor = connectTo(path());
-  const std::string begin = "BEGIN\r\n";
-  std::string authentication = std::string(1, '\0') + "AUTH EXTERNAL ";
-  for (const char digit : std::to_string(getuid())) authentication += fmt::format("{:02x}", digit);
-  authentication += "\r\n";
-  ASSERT_GT(send(descriptor, authentication.data(), authentication.size(), 0), 0);
-  char buffer[256];
-  ASSERT_GT(recv(descriptor, buffer, sizeof buffer, 0), 0);
-  // Little-endian method call, serial 1, object path, interface, member, signature "s", body "hi".
-  std::string message("l\1\0\1\7\0\0\0\1\0\0\0", 12);
-  std::string fields;
-  const auto field = [&fields](char code, const char* type, const std::string& value) {
-    while (fields.size() % 8 != 0) fields += '\0';
-    fields += std::string({code, 1}) + type + '\0';
-    if (*type != 'g') fields += std::string({static_cast<char>(value.size()), 0, 0, 0});
-    if (*type == 'g') fields += static_cast<char>(value.size());
-    fields += value + '\0';
-  };
-  field(1, "o", kPath);
-  field(2, "s", kService);
-  field(3, "s", "Echo");
-  field(8, "g", "s");
-  message += std::string({static_cast<char>(fields.size()), 0, 0, 0}) + fields;
-  while (message.size() % 8 != 0) message += '\0';
-  message += std::string("\2\0\0\0hi\0", 7);
-  const std::string eager = begin + message;
+  const std::string eager =
+      authentication() + "BEGIN\r\n" + messageOf("Echo", "s", "\2\0\0\0hi\0"s);
   ASSERT_EQ(send(descriptor, eager.data(), eager.size(), 0), static_cast<ssize_t>(eager.size()));
-  const ssize_t size = recv(descriptor, buffer, sizeof buffer, 0);
-  EXPECT_NE(std::string(buffer, static_cast<size_t>(std::max<ssize_t>(size, 0))).find("hi"),
-            std::string::npos);
+  std::string answer;
+  while (answer.find("hi") == std::string::npos) {
+    const std::string more = receiveSome(descriptor);
+    ASSERT_FALSE(more.empty());
+    answer += more;
+  }
   close(descriptor);
 }
 
 TEST_F(RPCTest, AClientThatVanishesInMidCallHarmsNobody) {
   {
     const Client client(path());
-    sd_bus_message* call = client.newCall("Hold");
-    uint64_t cookie = 0;  // asking for it asks for a reply
-    sd_bus_send(client.bus, call, &cookie);
-    sd_bus_flush(client.bus);
-    sd_bus_message_unref(call);
+    client.hold();
     auto reply = held.get_future().get();
     shutdown(client.descriptor, SHUT_RDWR);
     queue.submit([reply] { reply->send({}); });
@@ -272,18 +331,173 @@ TEST_F(RPCTest, RubbishEndsOnlyItsOwnConnection) {
   EXPECT_EQ(Client(path()).echo("alive"), "alive");
 }
 
-TEST_F(RPCTest, ConnectionsAreBoundedAndAnIdleOneTimesOut) {
-  std::vector<int> idle;
-  for (size_t i = 0; i < platform::kMaximumConnections; ++i) idle.push_back(connectTo(path()));
-  const int refused = connectTo(path());
-  EXPECT_TRUE(waitForEnd(refused));
-  EXPECT_TRUE(log.contains("Refusing connection"));
-  for (const int descriptor : idle) {
+// The longest idle one makes room, but never one that works while others have said nothing.
+TEST_F(RPCTest, ConnectionsAreBoundedAndSilentOnesGo) {
+  const Client working(path());
+  EXPECT_EQ(working.echo("before"), "before");
+  std::vector<int> silent;
+  for (size_t i = 0; i < platform::kMaximumConnections; ++i) silent.push_back(connectTo(path()));
+  EXPECT_TRUE(waitForEnd(silent.front()));
+  EXPECT_EQ(Client(path()).echo("new"), "new");
+  EXPECT_EQ(working.echo("after"), "after");
+  for (const int descriptor : silent) {
     EXPECT_TRUE(waitForEnd(descriptor));
     close(descriptor);
   }
+  EXPECT_EQ(log.count("not authenticated in time") + log.count("another needs its place"),
+            platform::kMaximumConnections);
+  EXPECT_EQ(working.echo("still"), "still");
+}
+
+TEST_F(RPCTest, AConnectionWithCallsInFlightKeepsItsPlace) {
+  std::vector<std::unique_ptr<Client>> busy;
+  for (size_t i = 0; i < platform::kMaximumConnections; ++i) {
+    busy.push_back(std::make_unique<Client>(path()));
+    held = {};
+    busy.back()->hold();
+    replies.push_back(held.get_future().get());
+  }
+  const int refused = connectTo(path());
+  EXPECT_TRUE(waitForEnd(refused));
   close(refused);
-  EXPECT_EQ(log.count("not authenticated in time"), platform::kMaximumConnections);
+  EXPECT_TRUE(log.contains("Refusing connection"));
+  replies.pop_back();  // without an answer
+  EXPECT_EQ(Client(path()).echo("room"), "room");
+}
+
+// While four calls are in flight no more are read; what was answered goes out all the same, and the
+// end of the peer is seen.
+TEST_F(RPCTest, APausedConnectionSendsAndSeesTheEnd) {
+  {
+    const Client client(path());
+    sd_bus_message* large = client.newCall("Make");
+    sd_bus_message_append(large, "x", int64_t{20} << 20);
+    uint64_t cookie = 0;
+    ASSERT_GE(sd_bus_send(client.bus, large, &cookie), 0);
+    sd_bus_message_unref(large);
+    for (size_t i = 0; i < platform::kMaximumPendingCalls; ++i) {
+      held = {};
+      client.hold();
+      replies.push_back(held.get_future().get());
+    }
+    sd_bus_message* answer = nullptr;
+    while (answer == nullptr && sd_bus_wait(client.bus, UINT64_MAX) >= 0) {
+      while (sd_bus_process(client.bus, &answer) > 0 && answer == nullptr) {
+      }
+    }
+    ASSERT_NE(answer, nullptr);
+    uint64_t answered = 0;
+    sd_bus_message_get_reply_cookie(answer, &answered);
+    EXPECT_EQ(answered, cookie);
+    sd_bus_message_unref(answer);
+  }
+  // Its thread ends, though its calls are still in flight.
+  waitForThreads();
+}
+
+// All of these have a sound header; what is wrong shows only when the content is read.
+TEST_F(RPCTest, ContentThatIsNotWhatItsSignatureSaysIsRefused) {
+  const auto call = [this](const char* member, const char* signature, const std::string& body) {
+    const int descriptor = connectTo(path());
+    authenticate(descriptor);
+    const std::string message = messageOf(member, signature, body);
+    EXPECT_EQ(send(descriptor, message.data(), message.size(), MSG_NOSIGNAL),
+              static_cast<ssize_t>(message.size()));
+    const std::string answer = receiveSome(descriptor);
+    close(descriptor);
+    return answer;
+  };
+  using namespace std::string_literals;
+  EXPECT_THAT(call("Echo", "s", "\2\0\0\0hi\0"s), testing::HasSubstr("hi"));
+  const std::vector<std::pair<const char*, std::string>> bad{
+      {"s", "\2\0\0\0\xFF\xFE\0"s},  // no UTF-8
+      {"s", "\2\0\0\0hi!"s},         // no NUL at the end
+      {"s", "\xFF\0\0\0hi\0"s},      // longer than the body
+      {"s", ""s},
+  };
+  for (const auto& [signature, body] : bad) {
+    EXPECT_THAT(call("Echo", signature, body),
+                testing::AnyOf(testing::HasSubstr(platform::kRPCInvalidArgs), testing::IsEmpty()));
+  }
+  EXPECT_THAT(call("List", "as", "\x10\0\0\0\4\0\0\0abcd"s),
+              testing::AnyOf(testing::HasSubstr(platform::kRPCInvalidArgs), testing::IsEmpty()));
+  std::string many("\0\0\0\0", 4);
+  const size_t count = platform::kMaximumArrayElements + 1;
+  for (size_t i = 0; i < count; ++i) many += std::string(8, '\0');
+  many.resize(many.size() - 3);  // the last has no padding
+  const auto length = static_cast<uint32_t>(many.size() - 4);
+  std::memcpy(many.data(), &length, sizeof length);
+  EXPECT_THAT(call("List", "as", many), testing::HasSubstr(platform::kRPCInvalidArgs));
+  EXPECT_EQ(Client(path()).echo("alive"), "alive");
+}
+
+TEST_F(RPCTest, AHandlerThatFailsAnswersItsCall) {
+  const Client client(path());
+  EXPECT_EQ(client.echo("memory"), SD_BUS_ERROR_NO_MEMORY);
+  EXPECT_EQ(client.echo("thread"), platform::kRPCErrorName);
+  EXPECT_EQ(client.echo("binary"), "\uFFFD\uFFFDx");
+  EXPECT_EQ(client.echo("next"), "next");
+}
+
+TEST(RPCFramer, FindsMessagesHoweverTheyAreCut) {
+  using platform::RPCFramer;
+  std::string stream = std::string(1, '\0') + "AUTH EXTERNAL 30\r\nBEGIN x\r\nBEGIN\r\n";
+  const size_t authentication = stream.size();
+  const std::vector<size_t> sizes{24, 16 + 8 + 1000, 70000};
+  for (const size_t size : sizes) {
+    std::string message(size, 'm');
+    const auto put = [&message](size_t at, size_t value) {
+      for (size_t i = 0; i < 4; ++i) message[at + i] = static_cast<char>(value >> (8 * i));
+    };
+    message[0] = 'l';
+    put(4, size - 24);
+    put(12, 5);  // padded to 8
+    stream += message;
+  }
+  for (const size_t step : {size_t{1}, size_t{7}, size_t{16}, size_t{4096}, stream.size()}) {
+    RPCFramer framer;
+    std::vector<size_t> found;
+    size_t at = 0;
+    while (at < stream.size()) {
+      const auto piece = framer.next(std::string_view(stream).substr(at, step));
+      ASSERT_NE(piece.part, RPCFramer::Part::unacceptable);
+      at += piece.size;
+      if (piece.part == RPCFramer::Part::begins) found.push_back(framer.messageBytes());
+      if (piece.part == RPCFramer::Part::ends && found.empty()) {
+        EXPECT_EQ(at, authentication);
+      }
+    }
+    EXPECT_EQ(found, sizes);
+    EXPECT_FALSE(framer.inMessage());
+  }
+  RPCFramer endless;
+  EXPECT_EQ(endless.next(std::string(20000, 'A')).part, RPCFramer::Part::unacceptable);
+  for (const std::string& header :
+       {std::string("x") + std::string(15, '\0'), std::string("l") + std::string(15, '\0'),
+        std::string("l\0\0\0\xFF\xFF\xFF\xFF\0\0\0\0\1\0\0\0", 16)}) {
+    RPCFramer framer;
+    EXPECT_EQ(framer.next("BEGIN\r\n").part, RPCFramer::Part::ends);
+    EXPECT_EQ(framer.next(header).part, RPCFramer::Part::unacceptable);
+  }
+}
+
+// Large requests wait for each other, small ones do not, and one that is larger than the budget
+// comes once there is no other.
+TEST(RPCRequestBudget, BoundsWhatAllRequestsHold) {
+  platform::RPCRequestBudget budget;
+  int resumed = 0;
+  const auto resume = [&resumed] { ++resumed; };
+  const size_t half = platform::kMaximumWaitingBytes / 2;
+  EXPECT_TRUE(budget.take(half + 1, resume));
+  EXPECT_FALSE(budget.take(half, resume));
+  EXPECT_TRUE(budget.take(platform::kSmallMessageBytes, resume));
+  EXPECT_FALSE(budget.take(3 * half, resume));
+  budget.give(platform::kSmallMessageBytes);
+  EXPECT_EQ(resumed, 2);
+  EXPECT_FALSE(budget.take(3 * half, resume));
+  budget.give(half + 1);
+  EXPECT_EQ(resumed, 3);
+  EXPECT_TRUE(budget.take(3 * half, resume));
 }
 
 TEST_F(RPCTest, WhatIsReadyGoesOutBeforeTheEnd) {
