@@ -1,3 +1,4 @@
+#include <cerrno>
 #include <unordered_map>
 #include <unordered_set>
 #include <utility>
@@ -118,6 +119,10 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
     if (error) return error;
   }
   if (clientState) {
+    // A client goes on from its state, so that all before it must survive a loss of power.
+    if (_textStore != nullptr && !_textStore->Sync()) {
+      return platform::posixError(EIO, "the text index cannot be written to the disk");
+    }
     log().standard("storing client state name: {} (length {})", platform::toUTF8(clientStateName),
                    clientState->size());
     docStore()->setMetadataValue(*clientState, clientStateKey(clientStateName), &error);

@@ -81,6 +81,16 @@ bool BatchWriter::waitForCompaction(size_t bytes) {
 }
 
 leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
+  return write(batch, false);
+}
+
+// A batch of nothing: leveldb takes no batch at all for the wish to write its memtable.
+leveldb::Status BatchWriter::sync() {
+  leveldb::WriteBatch empty;
+  return write(&empty, true);
+}
+
+leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch, bool sync) {
   platform::MutexLock lock(_mutex);
   const size_t bytes = batch->ApproximateSize();
   if (_compacts && !waitForCompaction(bytes) && _logTorn) {
@@ -90,7 +100,9 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
   leveldb::Status status;
   if (_logTorn) status = _database.db->Write(leveldb::WriteOptions(), nullptr);
   if (!status.ok()) return status;
-  status = _database.db->Write(leveldb::WriteOptions(), batch);
+  leveldb::WriteOptions options;
+  options.sync = sync;
+  status = _database.db->Write(options, batch);
   _logTorn = !status.ok();
   return status;
 }

@@ -55,8 +55,11 @@ class BatchWriter {
   // Of the open database, which outlives this.
   explicit BatchWriter(const Database& database) : _database(database) {}
 
-  // Not synced to the disk.
+  // On the disk within a second or so.
   [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch) TL_EXCLUDES(_mutex);
+
+  // Returns once all that was written is on the disk.
+  [[nodiscard]] leveldb::Status sync() TL_EXCLUDES(_mutex);
 
   // The keys from `begin` to `end`; null stands for the first and the last. Does nothing, with a
   // log line, where fewer than 128 MiB are free.
@@ -65,6 +68,7 @@ class BatchWriter {
  private:
   // False when it took too long.
   [[nodiscard]] bool waitForCompaction(size_t bytes) TL_REQUIRES(_mutex);
+  [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch, bool sync) TL_EXCLUDES(_mutex);
 
   const Database& _database;
   platform::Mutex _mutex;

@@ -150,6 +150,7 @@ class Index {
   // Starts to move the hot suffixes into a shard, in the background, if that is worthwhile.
   virtual void Vacuum() = 0;
 
+  // True once all that was added and deleted is on the disk.
   virtual bool Sync() = 0;
   virtual void Compact() = 0;
 

@@ -15,6 +15,10 @@ bool isTable(std::string_view path) {
   return path.ends_with(".ldb");
 }
 
+bool isLog(std::string_view path) {
+  return path.ends_with(".log");
+}
+
 bool isManifest(std::string_view path) {
   return path.substr(path.rfind('/') + 1).starts_with("MANIFEST-");
 }
@@ -77,26 +81,31 @@ class IndexFiles::Manifest final : public leveldb::WritableFile {
 
 IndexFiles::IndexFiles(leveldb::Env* files)
     : EnvWrapper(files),
+      _logs(files),
       _steps("tallow-files"),
       _work("tallow-leveldb", platform::QueuePriority::background,
             platform::SerialQueue::kForever) {}
 
 leveldb::Status IndexFiles::NewWritableFile(const std::string& path, leveldb::WritableFile** file) {
   const leveldb::Status status = target()->NewWritableFile(path, file);
-  if (!status.ok()) return status;
-  if (isTable(path)) {
-    *file = new Table(this, *file);
-  } else if (isManifest(path)) {
-    *file = new Manifest(this, *file);
-  }
-  return status;
+  return status.ok() ? wrap(path, file) : status;
 }
 
 leveldb::Status IndexFiles::NewAppendableFile(const std::string& path,
                                               leveldb::WritableFile** file) {
   const leveldb::Status status = target()->NewAppendableFile(path, file);
-  if (status.ok() && isManifest(path)) *file = new Manifest(this, *file);
-  return status;
+  return status.ok() ? wrap(path, file) : status;
+}
+
+leveldb::Status IndexFiles::wrap(const std::string& path, leveldb::WritableFile** file) {
+  if (isTable(path)) {
+    *file = new Table(this, *file);
+  } else if (isManifest(path)) {
+    *file = new Manifest(this, *file);
+  } else if (isLog(path)) {
+    return _logs.follow(path, std::unique_ptr<leveldb::WritableFile>(*file), file);
+  }
+  return {};
 }
 
 // leveldb asks again after each compaction for what it finds there and does not need.

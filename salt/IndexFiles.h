@@ -9,6 +9,7 @@
 
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
+#include "salt/LogSync.h"
 
 namespace salt {
 
@@ -20,8 +21,9 @@ namespace salt {
 // files, all in the order in which leveldb has asked for it, while leveldb goes on. At any moment
 // the directory is one that leveldb's own order of calls could have left: tables are on the disk
 // before the manifest names them, and nothing is removed before the manifest that makes it obsolete
-// is on the disk. With the first failure all of this ends, the manifest refuses to grow, and
-// leveldb refuses to write; logs and tables that the last good manifest needs are all still there.
+// is on the disk. Logs are synced in their order, too (see LogSync). With the first failure all of
+// this ends, the manifest refuses to grow, and leveldb refuses to write; logs and tables that the
+// last good manifest needs are all still there.
 //
 // leveldb's background work runs on a thread of this database's own: in leveldb's default
 // environment all databases of the process share one.
@@ -52,6 +54,8 @@ class IndexFiles final : public leveldb::EnvWrapper {
   class Manifest;
   using Step = std::function<leveldb::Status()>;
 
+  // What leveldb gets for a file that it writes; takes it.
+  [[nodiscard]] leveldb::Status wrap(const std::string& path, leveldb::WritableFile** file);
   // Runs the step after all before it, unless one of them has failed.
   void inOrder(Step step);
   // The first failure, which stays.
@@ -64,6 +68,7 @@ class IndexFiles final : public leveldb::EnvWrapper {
   std::condition_variable_any _tableDone;
   size_t _tables TL_GUARDED_BY(_mutex) = 0;  // that are not on the disk yet
   leveldb::Status _failure TL_GUARDED_BY(_mutex);
+  LogSync _logs;
   platform::SerialQueue _steps;
   platform::SerialQueue _work;  // ends first: it makes steps
 };

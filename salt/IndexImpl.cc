@@ -135,9 +135,9 @@ std::shared_ptr<const DocSet> index::deletedDocs() const {
 }
 
 bool index::Sync() {
-  leveldb::WriteOptions options;
-  options.sync = true;
-  return db->Write(options, nullptr).ok();
+  const leveldb::Status status = _writer.sync();
+  if (!status.ok()) Log.error("Error syncing db: {}", status.ToString());
+  return status.ok();
 }
 
 void index::Compact() {
