@@ -12,6 +12,7 @@ namespace {
 constexpr int kIndexerUnavailable = -2;
 // More than recovering the two databases of a class writes.
 constexpr uint64_t kOpeningRoom = 32 * 1024 * 1024;
+constexpr size_t kOpeningDescriptors = 16;  // more than opening the two databases takes at a time
 
 bool createClassDirectory(const std::string& root, const std::string& protectionClass,
                           TLErrorOut error) {
@@ -103,6 +104,11 @@ std::shared_ptr<TALIndexer> TALIndexerManager::_createIndexerWithProtectionType(
     platform::setError(error, platform::posixError(ENOSPC, directory));
     return nullptr;
   }
+  if (platform::freeDescriptors() < kOpeningDescriptors + platform::descriptorReserve()) {
+    log().error("Not opening {}: too few file descriptors are left", directory);
+    platform::setError(error, platform::posixError(EMFILE, directory));
+    return nullptr;
+  }
   const std::string docStorePath = platform::joinPath(directory, "docstore/docstore.db");
   auto docStore = std::make_shared<TALSqliteDocStore>(docStorePath);
   if (!docStore->openWithError(&failure)) {
@@ -114,5 +120,12 @@ std::shared_ptr<TALIndexer> TALIndexerManager::_createIndexerWithProtectionType(
   const std::string synonymPath = platform::synonymFilePath();
   log().standard("Creating indexer saltPath={} docStorePath: {} synonymPath: {}", saltPath,
                  docStorePath, synonymPath);
-  return std::make_shared<TALIndexer>(saltPath, protectionClass, std::move(docStore), synonymPath);
+  auto indexer = std::make_shared<TALIndexer>(saltPath, protectionClass, docStore, synonymPath);
+  if (const auto opening = indexer->openingError()) {
+    log().error("Could not open {}: {}", protectionClass, platform::printable(opening));
+    platform::setError(error, *opening);
+    indexer->shutdown();
+    return nullptr;
+  }
+  return indexer;
 }

@@ -8,7 +8,6 @@
 namespace {
 
 // 256 MiB, some 700,000 mails; what lies beyond is read by calls.
-constexpr char kMapFile[] = "pragma mmap_size=268435456;";
 
 constexpr const char* kErrorDomain = "DocStore";
 constexpr int kNoConnection = 1001;
@@ -98,9 +97,6 @@ bool TALSqliteDocStore::_openConnection(TLErrorOut error) {
   sqlite3_db_config(_database, SQLITE_DBCONFIG_DQS_DML, 1, nullptr);
   const int wal = sqlite3_exec(_database, "pragma journal_mode=wal;", nullptr, nullptr, nullptr);
   if (wal != SQLITE_OK) log().error("Failed to set journal mode WAL with error code {}", wal);
-  // Ranking reads a thousand documents of a search: through a mapping this takes no call each.
-  // Without one it is slower and nothing else.
-  sqlite3_exec(_database, kMapFile, nullptr, nullptr, nullptr);
   return true;
 }
 

@@ -1,5 +1,8 @@
 #include "indexer/TALIndexer.h"
 
+#include <cerrno>
+#include <new>
+#include <system_error>
 #include <utility>
 
 #include "platform/Clock.h"
@@ -93,9 +96,16 @@ void TALIndexer::_init() {
     log().fault("No path specified for index.");
   } else {
     std::optional<TLError> error;
-    const int64_t stored = docStore() == nullptr ? 0 : docStore()->count(&error);
-    if (error) log().error("Could not get docstore count: {}", platform::printable(error));
-    if (stored == 0 && !error) {
+    _openingError.reset();
+    int64_t stored = 0;
+    const std::optional<bool> empty = storeIsEmpty(&stored, &error);
+    if (!empty) {
+      // What cannot be read may be there: neither index nor store is touched.
+      log().error("Could not get docstore count: {}", platform::printable(error));
+      _openingError = error;
+      return;
+    }
+    if (*empty) {
       log().standard("Docstore is empty, resetting SALT...");
       if (_resetSALT(&error)) {
         log().standard("SALT was reset");
@@ -106,13 +116,51 @@ void TALIndexer::_init() {
     if (!platform::createDirectories(_path, &error)) {
       log().error("Could not create intermediate directory {}: {}", _path,
                   platform::printable(error));
+      _openingError = error;
       return;
     }
-    loadTextStore();
-    if (_textStore == nullptr) createTextStore(stored);
+    if (!openTextStore(stored)) return;
   }
   makeVocabulary();
   log().standard("Finished initing indexer in time: {} ms", elapsedMillisSinceMonotonicTime(start));
+}
+
+// The count of a store that cannot be read is 0, too; a walk tells.
+std::optional<bool> TALIndexer::storeIsEmpty(int64_t* stored, TLErrorOut error) {
+  const auto store = docStore();
+  std::optional<TLError> failure;
+  if (store != nullptr) *stored = store->count(&failure);
+  bool empty = *stored == 0;
+  if (store != nullptr && empty && !failure) {
+    store->enumerateDocIDs(&failure, [&](int64_t, uint32_t, const TLURL&, bool* stop, TLErrorOut) {
+      empty = false;
+      *stop = true;
+    });
+  }
+  if (!failure) return empty;
+  platform::setError(error, *failure);
+  return std::nullopt;
+}
+
+bool TALIndexer::openTextStore(int64_t storedDocuments) {
+  std::optional<TLError> error;
+  loadTextStore(&error);
+  if (_textStore == nullptr && !error) createTextStore(storedDocuments, &error);
+  if (error) {
+    log().error("Could not open the text index: {}", platform::printable(error));
+    _openingError = error;
+  }
+  return !error;
+}
+
+std::optional<TLError> TALIndexer::openingError() {
+  MutexLock lock(_indexMutex);
+  return _openingError;
+}
+
+TLError TALIndexer::noIndexError() const {
+  if (_shutdown) return _errorWithCode(TALIndexerError::shuttingDown, "shutting down", nullptr);
+  return _openingError.value_or(platform::posixError(ENOENT, "there is no text index at " + _path));
 }
 
 void TALIndexer::makeQueryObjects() {
@@ -129,11 +177,11 @@ void TALIndexer::makeQueryObjects() {
   }
 }
 
-void TALIndexer::loadTextStore() {
+void TALIndexer::loadTextStore(TLErrorOut error) {
   log().standard("Loading textstore...");
   const uint64_t start = platform::monotonicTicks();
   setTextStore(nullptr);
-  setTextStore(std::unique_ptr<salt::Index>(salt::LoadIndex(_path)));
+  setTextStore(std::unique_ptr<salt::Index>(salt::LoadIndex(_path, error)));
   if (_textStore == nullptr) return;
   log().standard("Loaded textstore from path: {} in time: {} ms", _path,
                  elapsedMillisSinceMonotonicTime(start));
@@ -158,21 +206,22 @@ void TALIndexer::loadTextStore() {
 
 // A text index made from nothing empties the document store, so that the two never differ in what
 // they know of.
-void TALIndexer::createTextStore(int64_t storedDocuments) {
+void TALIndexer::createTextStore(int64_t storedDocuments, TLErrorOut error) {
   log().standard("Could not find path, creating new textstore at path {}", _path);
   uint64_t start = platform::monotonicTicks();
-  setTextStore(std::unique_ptr<salt::Index>(salt::NewIndex(newIndexOptions(_path))));
+  setTextStore(std::unique_ptr<salt::Index>(salt::NewIndex(newIndexOptions(_path), error)));
+  if (_textStore == nullptr) return;
   log().standard("Created new textstore at path: {} in time: {} ms", _path,
                  elapsedMillisSinceMonotonicTime(start));
-  if (_textStore == nullptr || docStore() == nullptr) return;
+  if (docStore() == nullptr) return;
   log().standard("Resetting docstore after creating a new textstore...");
   start = platform::monotonicTicks();
-  std::optional<TLError> error;
-  if (docStore()->resetWithError(&error)) {
+  std::optional<TLError> failure;
+  if (docStore()->resetWithError(&failure)) {
     log().standard("Reset docstore with {} items in time: {} ms", storedDocuments,
                    elapsedMillisSinceMonotonicTime(start));
   } else {
-    log().error("Error resetting docstore: {}", platform::printable(error));
+    log().error("Error resetting docstore: {}", platform::printable(failure));
   }
 }
 
@@ -232,8 +281,16 @@ std::optional<TLError> TALIndexer::runWork(const Task& task) {
   {
     MutexLock lock(_indexMutex);
     if (_shutdown) return _errorWithCode(TALIndexerError::shuttingDown, "shutting down", nullptr);
+    if (_textStore == nullptr && _openingError) _init();
+    if (_openingError) return _openingError;
   }
-  return task();
+  try {
+    return task();
+  } catch (const std::bad_alloc&) {
+    return platform::posixError(ENOMEM, "not enough memory for the work");
+  } catch (const std::system_error& failure) {
+    return platform::posixError(failure.code().value(), "no thread for the work");
+  }
 }
 
 void TALIndexer::resetWithCompletionHandler(Completion completionHandler) {

@@ -64,7 +64,7 @@ class TALIndexer {
 
   // Opens, or makes, the text index in the directory `path`, and reads the synonyms. The store is
   // open. Never fails: problems are logged, and an indexer without index or tokenizer reports them
-  // with each call.
+  // with each call. See `openingError`.
   TALIndexer(std::string path, const std::string& protectionClass,
              std::shared_ptr<TALDocStore> docStore, std::string synonymFilePath);
   ~TALIndexer();
@@ -123,6 +123,10 @@ class TALIndexer {
   // queue.
   void shutdown();
 
+  // Why there is no text index, none where there is one. What is on the disk is as it was: it is
+  // tried again with the next add, or by an indexer made anew.
+  [[nodiscard]] std::optional<TLError> openingError();
+
   [[nodiscard]] const std::string& path() const { return _path; }
   [[nodiscard]] std::shared_ptr<TALDocStore> docStore() const;
 
@@ -149,8 +153,12 @@ class TALIndexer {
   struct Batch;
 
   void _init() TL_REQUIRES(_indexMutex);
-  void loadTextStore() TL_REQUIRES(_indexMutex);
-  void createTextStore(int64_t storedDocuments) TL_REQUIRES(_indexMutex);
+  // Whether the store has no documents; none, with an error, where it cannot be read.
+  std::optional<bool> storeIsEmpty(int64_t* stored, TLErrorOut error);
+  // False when the system does not let the index be opened or made: then `_openingError` tells.
+  bool openTextStore(int64_t storedDocuments) TL_REQUIRES(_indexMutex);
+  void loadTextStore(TLErrorOut error) TL_REQUIRES(_indexMutex);
+  void createTextStore(int64_t storedDocuments, TLErrorOut error) TL_REQUIRES(_indexMutex);
   void makeQueryObjects();
   void setTextStore(std::unique_ptr<salt::Index> index) TL_REQUIRES(_indexMutex);
   void makeVocabulary() TL_REQUIRES(_indexMutex);
@@ -168,6 +176,8 @@ class TALIndexer {
   // The key of a client's state in the store's metadata.
   static std::string clientStateKey(const TLString& name);
   static TLError _errorWithCode(TALIndexerError code, const char* message, TLErrorOut error);
+  // The error of a call that needs the index where there is none.
+  [[nodiscard]] TLError noIndexError() const TL_REQUIRES(_indexMutex);
 
   // Waits while the text index wants nothing added. On `_queue`.
   void holdBack() TL_EXCLUDES(_indexMutex);
@@ -251,6 +261,7 @@ class TALIndexer {
   std::unique_ptr<TALSpellCorrection> _spellCorrection;
   TALStemRewrite _stemRewrite TL_GUARDED_BY(_textStoreMutex);
   DocDates _docDates TL_GUARDED_BY(_indexMutex);
+  std::optional<TLError> _openingError TL_GUARDED_BY(_indexMutex);
   bool _shutdown TL_GUARDED_BY(_indexMutex) = false;
   mutable platform::Mutex _docStoreMutex;
   std::shared_ptr<TALDocStore> _docStore TL_GUARDED_BY(_docStoreMutex);

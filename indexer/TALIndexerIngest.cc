@@ -142,6 +142,10 @@ bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErro
     log().error("bundleID not set");
     return true;
   }
+  if (_shutdown || _textStore == nullptr || docStore() == nullptr) {
+    platform::setError(error, noIndexError());
+    return false;
+  }
   platform::concurrentApply(docs.size(), [&docs](size_t i) { prepareText(*docs[i]); });
 
   Batch batch;
@@ -302,7 +306,6 @@ bool TALIndexer::_indexDoc(const TLIndexableItem& doc, uint32_t docID, uint64_t*
   zone::Zones zones;
   populateZones(zones, doc, _zoneManager, tk.get());
   const uint64_t start = platform::monotonicTicks();
-  if (_textStore == nullptr) return false;
   for (auto& [zoneID, zone] : zones) {
     if (zone.text.empty() || zone.offsets.empty()) continue;
     // The offsets may be changed by the call; this is their last use.

@@ -172,7 +172,7 @@ TALIndexer::Found TALIndexer::searchOnce(const TLQuery& query,
                                          std::vector<saltsearch::Term>& saltQueryTerms, size_t most,
                                          TLErrorOut error) {
   if (_shutdown || _textStore == nullptr) {
-    _errorWithCode(TALIndexerError::shuttingDown, "shutting down", error);
+    platform::setError(error, noIndexError());
     return {};
   }
   const TLParameters& params = *query.searchParams();
@@ -338,7 +338,7 @@ std::optional<TALIndexer::Items> TALIndexer::iterateAllDocsToFindMatchingSubject
             results.push_back(doc);
             unmatched.erase(*subject);
           });
-  if (!walked) {
+  if (!walked || failure) {
     log().error("Error in retriving via DocStore: {}", platform::printable(failure));
     if (!failure) _errorWithCode(TALIndexerError::shuttingDown, "shutting down", &failure);
     platform::setError(error, *failure);

@@ -150,4 +150,26 @@ void raiseDescriptorLimit() {
   setrlimit(RLIMIT_NOFILE, &limit);
 }
 
+namespace {
+
+size_t descriptorLimit() {
+  rlimit limit;
+  return getrlimit(RLIMIT_NOFILE, &limit) == 0 ? limit.rlim_cur : 0;
+}
+
+}  // namespace
+
+size_t freeDescriptors() {
+  std::error_code failure;
+  std::filesystem::directory_iterator open("/proc/self/fd", failure);
+  if (failure) return 0;
+  const auto count = static_cast<size_t>(std::distance(begin(open), end(open)));
+  return descriptorLimit() - std::min(count, descriptorLimit());
+}
+
+size_t descriptorReserve() {
+  constexpr size_t kMaxReserve = 256;
+  return std::min(descriptorLimit() / 4, kMaxReserve);
+}
+
 }  // namespace platform

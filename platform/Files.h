@@ -40,4 +40,10 @@ bool writeFileAtomically(const std::string& path, const std::string& bytes, TLEr
 // As many open files as the system lets this process have.
 void raiseDescriptorLimit();
 
+// How many more files this process can open. Reads a directory of /proc.
+[[nodiscard]] size_t freeDescriptors();
+
+// Of these, how many databases leave for connections: a quarter of all, 256 at most.
+[[nodiscard]] size_t descriptorReserve();
+
 }  // namespace platform

@@ -1,5 +1,6 @@
 #include "platform/StateCapture.h"
 
+#include <condition_variable>
 #include <cstring>
 #include <map>
 #include <memory>
@@ -22,16 +23,45 @@ const Log& log() {
   return handle;
 }
 
+// One registered block. A capture that waits for its queue holds it; a cancellation waits for such
+// a capture, since the queue goes with whoever cancels.
 struct Registration {
+  Registration(SerialQueue& on, std::string name, std::function<nlohmann::json()> make)
+      : queue(on), title(std::move(name)), block(std::move(make)) {}
+
   SerialQueue& queue;
-  std::string title;
-  std::function<nlohmann::json()> block;
+  const std::string title;
+  const std::function<nlohmann::json()> block;
+  Mutex mutex;
+  std::condition_variable_any changed;
+  int capturing TL_GUARDED_BY(mutex) = 0;
+  bool cancelled TL_GUARDED_BY(mutex) = false;
+
+  // False once it is cancelled.
+  bool begin() {
+    MutexLock lock(mutex);
+    if (!cancelled) ++capturing;
+    return !cancelled;
+  }
+  void end() {
+    MutexLock lock(mutex);
+    --capturing;
+    changed.notify_all();
+  }
+  void cancel() {
+    MutexLock lock(mutex);
+    cancelled = true;
+    while (capturing != 0) changed.wait(mutex);
+  }
+  bool isCancelled() {
+    MutexLock lock(mutex);
+    return cancelled;
+  }
 };
 
-// The mutex is held while blocks run, so that a cancellation waits for a running capture.
 struct Registry {
   Mutex mutex;
-  std::map<uint64_t, Registration> entries TL_GUARDED_BY(mutex);
+  std::map<uint64_t, std::shared_ptr<Registration>> entries TL_GUARDED_BY(mutex);
   uint64_t next TL_GUARDED_BY(mutex) = 0;
 };
 
@@ -78,14 +108,21 @@ std::optional<std::string> stateCaptureRecord(const std::string& title,
 
 std::vector<std::string> captureState() {
   std::vector<std::string> records;
+  std::vector<std::shared_ptr<Registration>> entries;
   Registry& r = registry();
-  MutexLock lock(r.mutex);
-  for (auto& [id, entry] : r.entries) {
-    entry.queue.sync([&records, &entry = entry] {
-      if (auto record = stateCaptureRecord(entry.title, entry.block())) {
+  {
+    MutexLock lock(r.mutex);
+    for (const auto& [id, entry] : r.entries) entries.push_back(entry);
+  }
+  for (const auto& entry : entries) {
+    if (!entry->begin()) continue;
+    entry->queue.sync([&records, &entry] {
+      if (entry->isCancelled()) return;
+      if (auto record = stateCaptureRecord(entry->title, entry->block())) {
         records.push_back(std::move(*record));
       }
     });
+    entry->end();
   }
   return records;
 }
@@ -106,10 +143,15 @@ std::function<void()> TLLogRegisterStateCaptureBlock(platform::SerialQueue& queu
   platform::Registry& r = platform::registry();
   platform::MutexLock lock(r.mutex);
   const uint64_t id = r.next++;
-  r.entries.try_emplace(id, platform::Registration{queue, std::move(title), std::move(block)});
-  return [id] {
+  const auto entry =
+      std::make_shared<platform::Registration>(queue, std::move(title), std::move(block));
+  r.entries.emplace(id, entry);
+  return [id, entry] {
     platform::Registry& owner = platform::registry();
-    platform::MutexLock cancelLock(owner.mutex);
-    owner.entries.erase(id);
+    {
+      platform::MutexLock cancelLock(owner.mutex);
+      owner.entries.erase(id);
+    }
+    entry->cancel();
   };
 }

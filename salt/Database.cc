@@ -107,6 +107,18 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch, bool sync) {
   return status;
 }
 
+// leveldb hands on the text of an errno and not its number. All of its input and output errors are
+// the system's, but for files that are not there, which it tells apart.
+std::optional<TLError> systemError(const leveldb::Status& status) {
+  if (!status.IsIOError()) return std::nullopt;
+  const std::string text = status.ToString();
+  for (const int code :
+       {EMFILE, ENFILE, ENOMEM, EAGAIN, ENOSPC, EDQUOT, EROFS, EACCES, EPERM, EINTR}) {
+    if (text.ends_with(std::strerror(code))) return platform::posixError(code, text);
+  }
+  return platform::posixError(EIO, text);
+}
+
 Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* files) {
   Database result;
   result.path = path;
@@ -135,6 +147,7 @@ Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* file
     status = openExisting(options, path, &result.db);
   }
   if (!status.ok()) Log.error("Error opening db: {}", status.ToString());
+  result.status = status;
   return result;
 }
 

@@ -7,11 +7,13 @@
 
 #include <condition_variable>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 
 #include "platform/Log.h"
 #include "platform/Mutex.h"
+#include "platform/TLError.h"
 #include "salt/IndexFiles.h"
 #include "salt/KeyOrder.h"
 
@@ -34,7 +36,12 @@ struct Database {
   std::unique_ptr<leveldb::Logger> logger;
   std::unique_ptr<leveldb::Cache> cache;
   std::unique_ptr<leveldb::DB> db;  // null when opening failed
+  leveldb::Status status;           // of opening
 };
+
+// What the system lacks when it is the reason of a failure: descriptors, memory, space, a readable
+// disk. None for a database that is not there, or is damaged.
+[[nodiscard]] std::optional<TLError> systemError(const leveldb::Status& status);
 
 enum class OpenMode { create, existing };
 

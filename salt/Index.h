@@ -9,6 +9,8 @@
 #include <unordered_map>
 #include <vector>
 
+#include "platform/TLError.h"
+
 // A suffix index on disk over short texts: tells which (document, zone, offset) places have a text
 // that begins with a prefix. One leveldb database per index; FORMAT.md has the bytes.
 namespace salt {
@@ -187,12 +189,15 @@ class Index {
   virtual void WaitWhileTidying() = 0;
 };
 
-// Makes a new index in the directory `options.Path`; what was there is removed. Never null: a
-// failure ends the process. The caller owns the result.
+// Makes a new index in the directory `options.Path`; what was there is removed. Null with an error
+// when the system does not let it. The caller owns the result.
+[[nodiscard]] Index* NewIndex(const Index::Options& options, TLErrorOut error);
+// The same, where a failure ends the process.
 [[nodiscard]] Index* NewIndex(const Index::Options& options);
 
 // Opens the index in the directory `path`, with the options it was made with; null, with a log
-// line, on failure. The caller owns the result.
-[[nodiscard]] Index* LoadIndex(const std::string& path);
+// line, on failure. The error is set when that is the system's, for want of descriptors, say: there
+// may be a sound index, and it may be opened later. The caller owns the result.
+[[nodiscard]] Index* LoadIndex(const std::string& path, TLErrorOut error = nullptr);
 
 }  // namespace salt

@@ -1,6 +1,7 @@
 #include "salt/IndexImpl.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
 #include <ctime>
 #include <sstream>
@@ -35,18 +36,30 @@ index::index(Database opened)
       _writer(_database),
       db(_database.db.get()),
       _batch(std::in_place),
-      _deleted(std::make_shared<const DocSet>()) {
+      _deleted(std::make_shared<const DocSet>()) {}
+
+// Damage ends the process, but not what a read of sound data may meet.
+bool index::readRecords(TLErrorOut error) {
+  const auto read = [this, error](const char* key, std::string* bytes) {
+    leveldb::Status status = db->Get(leveldb::ReadOptions(), key, bytes);
+    if (const auto failure = systemError(status)) platform::setError(error, *failure);
+    return status;
+  };
   std::string bytes;
-  leveldb::Status status = db->Get(leveldb::ReadOptions(), kMetricsKey, &bytes);
-  if (!status.ok() || !parseRecord(bytes, &metrics)) return;
-  if (metrics.CodeVersion != CODE_VERSION) return;
+  platform::MutexLock lock(_metricsMutex);
+  leveldb::Status status = read(kMetricsKey, &bytes);
+  if (status.IsIOError()) return false;
+  if (!status.ok() || !parseRecord(bytes, &metrics)) return true;
+  if (metrics.CodeVersion != CODE_VERSION) return true;
   if (metrics.Suffixes == 0) _starts.beginEmpty();
-  status = db->Get(leveldb::ReadOptions(), kOptionsKey, &bytes);
+  status = read(kOptionsKey, &bytes);
+  if (status.IsIOError()) return false;
   TL_ASSERT(status.ok());
   TL_ASSERT(parseRecord(bytes, &op));
   TL_ASSERT(op.Valid());
-  status = db->Get(leveldb::ReadOptions(), kDeletedKey, &bytes);
-  if (status.IsNotFound()) return;
+  status = read(kDeletedKey, &bytes);
+  if (status.IsNotFound()) return true;
+  if (status.IsIOError()) return false;
   TL_ASSERT(status.ok());
   DocSet deleted;
   for (size_t at = 0; at + sizeof(uint32_t) <= bytes.size(); at += sizeof(uint32_t)) {
@@ -55,32 +68,49 @@ index::index(Database opened)
     if (docID != 0 && !deleted.contains(docID)) deleted.insert(docID);
   }
   _deleted = std::make_shared<const DocSet>(std::move(deleted));
+  return true;
 }
 
-Index* NewIndex(const Index::Options& options) {
+Index* NewIndex(const Index::Options& options, TLErrorOut error) {
   Database database = openDatabase(options.Path, OpenMode::create);
-  leveldb::DB* const ldb = database.db.get();
-  TL_ASSERT(ldb);
-  leveldb::Status status = putRecord(ldb, kOptionsKey, options);
-  TL_ASSERT(status.ok());
+  leveldb::Status status = database.status;
+  if (status.ok()) status = putRecord(database.db.get(), kOptionsKey, options);
   Index::Metrics metrics;
   metrics.CodeVersion = CODE_VERSION;
   metrics.CreationTime = std::time(nullptr);
-  status = putRecord(ldb, kMetricsKey, metrics);
-  TL_ASSERT(status.ok());
+  if (status.ok()) status = putRecord(database.db.get(), kMetricsKey, metrics);
+  if (!status.ok()) {
+    platform::setError(error,
+                       systemError(status).value_or(platform::posixError(EIO, status.ToString())));
+    return nullptr;
+  }
   auto idx = std::make_unique<index>(std::move(database));
+  if (!idx->readRecords(error)) return nullptr;
   platform::MutexLock lock(idx->_metricsMutex);
   TL_ASSERT(idx->metrics.CodeVersion == CODE_VERSION);
   return idx.release();
 }
 
-Index* LoadIndex(const std::string& path) {
-  return index::load(openDatabase(path, OpenMode::existing)).release();
+Index* NewIndex(const Index::Options& options) {
+  Index* const made = NewIndex(options, nullptr);
+  TL_ASSERT(made);
+  return made;
 }
 
-std::unique_ptr<index> index::load(Database opened) {
-  if (!opened.db) return nullptr;
+Index* LoadIndex(const std::string& path, TLErrorOut error) {
+  return index::load(openDatabase(path, OpenMode::existing), error).release();
+}
+
+std::unique_ptr<index> index::load(Database opened, TLErrorOut error) {
+  if (!opened.db) {
+    if (const auto failure = systemError(opened.status)) platform::setError(error, *failure);
+    return nullptr;
+  }
   auto idx = std::make_unique<index>(std::move(opened));
+  if (!idx->readRecords(error)) {
+    Log.error("Loading failure: The database cannot be read.");
+    return nullptr;
+  }
   if (!idx->metricsSound()) return nullptr;
   if (idx->op.ValidateOnLoad && !idx->Validate()) {
     Log.fault("Loading failure: Validation failed.");

@@ -55,8 +55,8 @@ class index final : public Index {
  public:
   explicit index(Database opened);
   // An index over a database that exists; null, with a log line, when there is none or it is not
-  // sound.
-  [[nodiscard]] static std::unique_ptr<index> load(Database opened);
+  // sound; the error as of LoadIndex.
+  [[nodiscard]] static std::unique_ptr<index> load(Database opened, TLErrorOut error = nullptr);
   // Waits for a merge that runs.
   ~index() override;
 
@@ -172,6 +172,9 @@ class index final : public Index {
   void compactRange(const leveldb::Slice* begin, const leveldb::Slice* end);
   void removeObsoleteFiles() const;
 
+  // Reads options, metrics and the deleted documents; false, with an error, when the system does
+  // not let it. Metrics that are not there stay as they are.
+  [[nodiscard]] bool readRecords(TLErrorOut error) TL_EXCLUDES(_metricsMutex);
   // False, with a log line, when the loaded counters cannot be those of a sound index.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
 
@@ -184,7 +187,7 @@ class index final : public Index {
                    const std::function<bool(uint32_t, uint16_t, std::string_view)>& callback) const;
 
   friend class IndexView;
-  friend Index* NewIndex(const Options& options);
+  friend Index* NewIndex(const Options& options, TLErrorOut error);
 
   Database _database;
   mutable BatchWriter _writer;

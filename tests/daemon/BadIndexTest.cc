@@ -84,7 +84,7 @@ TEST_F(BadIndexTest, DamageOfOneClassLeavesTheOtherAlone) {
       {[&] { salttest::editMetrics(index, [](auto& m) { m.CodeVersion = 303; }); }, 0,
        "SALT Loading failure: Mismatched code version."},
       {[&] { damageTables(); }, 0, "SALT Error scanning index: Corruption: corrupted"},
-      {[&] { makeFile(index); }, 4, "TALIndexer Could not create intermediate directory"},
+      {[&] { makeFile(index); }, 17, "TALIndexer Could not create intermediate directory"},
       {[&] { makeFile(root + "/bad"); }, 17, "Could not create bad protected directory"},
   };
   for (const auto& c : cases) {

@@ -1,4 +1,5 @@
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 #include <cmath>
 #include <random>
@@ -391,14 +392,38 @@ TEST_F(IndexerTest, AFileInPlaceOfTheIndexIsLeftAloneAndFailsWhatNeedsTheIndex) 
   ASSERT_TRUE(platform::writeFileAtomically(salt, "mine", nullptr));
   open();
   EXPECT_TRUE(log.contains("error TALIndexer: Could not create intermediate directory " + salt));
-  EXPECT_EQ(search("word"), "shutting down");
-  EXPECT_EQ(add({mail("b", "word")}), (TLError{"TALIndexer", 1, "index failed"}));
-  EXPECT_EQ(outcomeOf([&](auto done) { indexer->saltVacuumAndCompactWithCompletionHandler(done); }),
-            std::nullopt);
+  EXPECT_EQ(search("word"), salt + ": File exists");
+  ASSERT_TRUE(indexer->openingError());
+  EXPECT_EQ(indexer->openingError()->code, EEXIST);
+  EXPECT_EQ(add({mail("b", "word")}), indexer->openingError());
   EXPECT_TRUE(indexer->docStats().is_null());
   EXPECT_EQ(indexer->saltMetrics(), "");
   EXPECT_EQ(platform::readFile(salt, 100, nullptr), "mine");
-  EXPECT_EQ(store->count(nullptr), 2);
+  EXPECT_EQ(store->count(nullptr), 1);
+  // Once the reason is gone, so is the error.
+  ASSERT_TRUE(platform::removeItem(salt, nullptr));
+  EXPECT_EQ(add({mail("b", "word")}), std::nullopt);
+  EXPECT_EQ(search("word"), "b");
+}
+
+// Neither index nor store is lost when the system lacks something at the wrong moment.
+TEST_F(IndexerTest, AnIndexThatCannotBeOpenedNowKeepsItsMail) {
+  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
+  indexer->shutdown();
+  rlimit before;
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &before), 0);
+  // The store opens, and the index lacks descriptors at one point after the other.
+  for (rlim_t most = 8; most < 40; ++most) {
+    const rlimit few{most, before.rlim_max};
+    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &few), 0);
+    open();
+    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &before), 0);
+    indexer->shutdown();
+  }
+  open();
+  EXPECT_EQ(indexer->openingError(), std::nullopt);
+  EXPECT_EQ(search("word"), "a");
+  EXPECT_TRUE(log.contains("Could not open the text index"));
 }
 
 TEST_F(IndexerTest, ADocumentThatTheStoreLostIsLeftOut) {

@@ -6,6 +6,7 @@
 
 #include <chrono>
 #include <csignal>
+#include <future>
 #include <random>
 #include <thread>
 #include <vector>
@@ -269,6 +270,23 @@ TEST(StateCapture, RecordHasTheStatedLayout) {
   cancel();
   cancelEmpty();
   EXPECT_TRUE(platform::captureState().empty());
+}
+
+// A class that works for long holds up neither the coming nor the going of another.
+TEST(StateCapture, WaitsForABusyQueueWithoutHoldingUpOthers) {
+  platform::SerialQueue busy("busy");
+  platform::SerialQueue other("other");
+  std::promise<void> release;
+  ASSERT_TRUE(busy.async([&release] { release.get_future().wait(); }));
+  const auto block = [] { return nlohmann::json{{"n", 1}}; };
+  auto cancelBusy = TLLogRegisterStateCaptureBlock(busy, "busy", block);
+  std::promise<size_t> captured;
+  std::thread capturing([&] { captured.set_value(platform::captureState().size()); });
+  for (int i = 0; i < 100; ++i) TLLogRegisterStateCaptureBlock(other, "other", block)();
+  release.set_value();
+  EXPECT_EQ(captured.get_future().get(), 1U);
+  cancelBusy();
+  capturing.join();
 }
 
 TEST(Signpost, ReachesASinkAndSkipsTheReservedIdentifiers) {
