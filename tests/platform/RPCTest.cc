@@ -19,21 +19,17 @@
 #include "platform/RPC.h"
 #include "platform/RPCInlet.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/RawMessages.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
 
+using testsupport::authenticate;
+using testsupport::connectTo;
+using testsupport::receiveSome;
+
 constexpr const char* kService = "com.quill.test.Echo";
 constexpr const char* kPath = "/com/quill/test/Echo";
-
-int connectTo(const std::string& path) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  path.copy(address.sun_path, sizeof address.sun_path - 1);
-  const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  EXPECT_EQ(connect(descriptor, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-  return descriptor;
-}
 
 // True once the other side has closed; waits for it.
 bool waitForEnd(int descriptor) {
@@ -47,48 +43,8 @@ bool waitForEnd(int descriptor) {
   return n == 0 || errno == ECONNRESET;
 }
 
-std::string authentication() {
-  std::string text = std::string(1, '\0') + "AUTH EXTERNAL ";
-  for (const char digit : std::to_string(getuid())) text += fmt::format("{:02x}", digit);
-  return text + "\r\n";
-}
-
-// What comes next, empty at the end.
-std::string receiveSome(int descriptor) {
-  char buffer[4096];
-  const ssize_t size = recv(descriptor, buffer, sizeof buffer, 0);
-  return {buffer, static_cast<size_t>(std::max<ssize_t>(size, 0))};
-}
-
-void authenticate(int descriptor) {
-  const std::string text = authentication();
-  ASSERT_GT(send(descriptor, text.data(), text.size(), 0), 0);
-  ASSERT_FALSE(receiveSome(descriptor).empty());
-  ASSERT_EQ(send(descriptor, "BEGIN\r\n", 7, 0), 7);
-}
-
-// A little-endian call with serial 1, put together by hand.
 std::string messageOf(const char* member, const char* signature, const std::string& body) {
-  std::string fields;
-  const auto number = [](size_t value) {
-    std::string bytes;
-    for (size_t i = 0; i < 4; ++i) bytes += static_cast<char>(value >> (8 * i));
-    return bytes;
-  };
-  const auto field = [&](char code, const char* type, const std::string& value) {
-    while (fields.size() % 8 != 0) fields += '\0';
-    fields += std::string({code, 1}) + type + '\0';
-    fields += *type == 'g' ? std::string(1, static_cast<char>(value.size())) : number(value.size());
-    fields += value + '\0';
-  };
-  field(1, "o", kPath);
-  field(2, "s", kService);
-  field(3, "s", member);
-  field(8, "g", signature);
-  std::string message =
-      std::string("l\1\0\1", 4) + number(body.size()) + number(1) + number(fields.size()) + fields;
-  while (message.size() % 8 != 0) message += '\0';
-  return message + body;
+  return testsupport::rawCall(kPath, kService, member, signature, body);
 }
 
 class Client {
@@ -269,7 +225,7 @@ TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
   using namespace std::string_literals;
   const int descriptor = connectTo(path());
   const std::string eager =
-      authentication() + "BEGIN\r\n" + messageOf("Echo", "s", "\2\0\0\0hi\0"s);
+      testsupport::authenticationLines() + "BEGIN\r\n" + messageOf("Echo", "s", "\2\0\0\0hi\0"s);
   ASSERT_EQ(send(descriptor, eager.data(), eager.size(), 0), static_cast<ssize_t>(eager.size()));
   std::string answer;
   while (answer.find("hi") == std::string::npos) {
@@ -400,7 +356,7 @@ TEST_F(RPCTest, APausedConnectionSendsAndSeesTheEnd) {
 TEST_F(RPCTest, ContentThatIsNotWhatItsSignatureSaysIsRefused) {
   const auto call = [this](const char* member, const char* signature, const std::string& body) {
     const int descriptor = connectTo(path());
-    authenticate(descriptor);
+    EXPECT_TRUE(authenticate(descriptor));
     const std::string message = messageOf(member, signature, body);
     EXPECT_EQ(send(descriptor, message.data(), message.size(), MSG_NOSIGNAL),
               static_cast<ssize_t>(message.size()));

@@ -1,0 +1,352 @@
+// Clients that do not keep to the protocol, beside one that does: calls with wrong bytes,
+// connections that say nothing, that send a byte a second, that never read. The daemon must live,
+// and the good client must get right answers only. Ends with 1 otherwise.
+#include <fmt/format.h>
+#include <sys/resource.h>
+
+#include <atomic>
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <fstream>
+#include <functional>
+#include <optional>
+#include <random>
+#include <stop_token>
+#include <thread>
+#include <vector>
+
+#include "client/DebugServiceProxy.h"
+#include "client/SearchServiceProxy.h"
+#include "platform/FileDescriptor.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/daemon/DaemonSupport.h"
+#include "tests/support/RawMessages.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using client::SearchServiceProxy;
+using platform::FileDescriptor;
+using testsupport::DaemonProcess;
+using testsupport::RawBody;
+using Clock = std::chrono::steady_clock;
+using std::chrono::milliseconds;
+
+constexpr const char* kUsage =
+    "Usage: rpc_hostile_driver [--messages N] [--seed N]\n"
+    "       rpc_hostile_driver --mode flood [--seconds N]\n";
+
+constexpr const char* kGoodClass = "the class of the good client";
+constexpr const char* kBadClass = "e";  // short, so that few changed bytes make another class
+constexpr rlim_t kDescriptors = 512;    // of the daemon, which bounds its classes
+constexpr int kMessagesOfConnection = 16;
+constexpr size_t kMaxDaemonKilobytes = 300 * 1024;
+
+struct Options {
+  bool flood = false;
+  int messages = 1000000;
+  int seconds = 30;
+  uint32_t seed = std::random_device()();
+};
+
+// A client that keeps to everything. Each of its searches has one right answer.
+class GoodClient {
+ public:
+  GoodClient(const std::string& directory, int batch) : _directory(directory), _batch(batch) {}
+
+  // Until the stop or the first wrong answer, which is left in `wrong`.
+  void work(const std::stop_token& stop) {
+    SearchServiceProxy service(_directory, client::Patience(5000));
+    client::DebugServiceProxy debug(_directory, client::Patience(5000));
+    while (!stop.stop_requested() && wrong.empty()) {
+      std::optional<TLError> error;
+      const std::string prefix = fmt::format("good{}x", _rounds++);
+      if (_rounds % 20 == 1) {
+        timed(_indexing, [&] {
+          expect(service.indexItems(testsupport::mails(prefix, _batch), "good", kGoodClass, &error),
+                 "index", error);
+        });
+        _indexed = prefix;
+      }
+      timed(_answers, [&] {
+        const auto answer = debug.ping(prefix, &error);
+        expect(answer && answer->find("Received " + prefix) == 0, "ping", error);
+      });
+      timed(_answers, [&] {
+        const int64_t found = testsupport::search(service, _indexed + " ", kGoodClass);
+        expect(found == _batch, fmt::format("search gives {} for {}", found, _batch), error);
+      });
+    }
+  }
+
+  [[nodiscard]] std::string report() const {
+    return fmt::format("good_rounds={} answers {} batches {}", _rounds, percentiles(_answers),
+                       percentiles(_indexing));
+  }
+
+  std::string wrong;
+
+ private:
+  void expect(bool right, const std::string& what, const std::optional<TLError>& error) {
+    if (!right && wrong.empty()) wrong = what + " " + platform::printable(error);
+  }
+  template <typename Work>
+  static void timed(std::vector<double>& times, const Work& work) {
+    const auto start = Clock::now();
+    work();
+    times.push_back(std::chrono::duration<double, std::milli>(Clock::now() - start).count());
+  }
+  static std::string percentiles(std::vector<double> times) {
+    if (times.empty()) return "none";
+    std::sort(times.begin(), times.end());
+    const auto at = [&](double part) {
+      return times[static_cast<size_t>(part * static_cast<double>(times.size() - 1))];
+    };
+    return fmt::format("p50_ms={:.2f} p99_ms={:.2f} max_ms={:.1f}", at(0.5), at(0.99), at(1));
+  }
+
+  const std::string _directory;
+  const int _batch;
+  int _rounds = 0;
+  std::string _indexed;
+  std::vector<double> _answers, _indexing;
+};
+
+struct Call {
+  std::string service;
+  std::string message;
+};
+
+// One valid call of each operation.
+std::vector<Call> validCalls() {
+  const std::string search = client::kSearchServiceName;
+  const std::string debug = client::kDebugServiceName;
+  const auto items = testsupport::mails("bad", 2);
+  const std::vector<std::string> names{"bad0", "bad1"};
+  TLQuery query;
+  query.setRawQuery(u"word");
+  query.setOriginalQuery(u"word");
+  std::vector<Call> calls;
+  const auto add = [&](const std::string& service, const char* member, const char* signature,
+                       const RawBody& body) {
+    std::string path = "/" + service;
+    std::replace(path.begin(), path.end(), '.', '/');
+    calls.push_back(
+        {service, testsupport::rawCall(path, service, member, signature, body.content())});
+  };
+  const std::string encoded = query.data();
+  add(search, "IndexItems", "aayss", RawBody().bytesArray(items).text("n").text(kBadClass));
+  add(search, "DeleteItemsWithIdentifiers", "asss",
+      RawBody().texts(names).text("n").text(kBadClass));
+  add(search, "IndexItemsDeleteItemsWithIdentifiers", "aayasbayss",
+      RawBody().bytesArray(items).texts(names).number32(1).bytes("state").text("n").text(
+          kBadClass));
+  add(search, "FetchLastClientState", "ss", RawBody().text("n").text(kBadClass));
+  add(search, "DeleteItemsWithDomainIdentifiers", "asss",
+      RawBody().texts(names).text("n").text(kBadClass));
+  add(search, "DeleteAllItems", "ss", RawBody().text("n").text(kBadClass));
+  add(search, "SearchItemsForQuery", "aytsx",
+      RawBody().bytes(encoded).number64(0).text(kBadClass).number64(10));
+  add(debug, "Ping", "s", RawBody().text("hello"));
+  add(debug, "FetchStatsForIndexer", "ss", RawBody().text("n").text(kBadClass));
+  add(debug, "FetchStatsForSalt", "ss", RawBody().text("n").text(kBadClass));
+  add(debug, "ForceVacuumAndCompact", "s", RawBody().text(kBadClass));
+  return calls;
+}
+
+std::string mutated(std::string message, std::mt19937& random) {
+  if (random() % 50 == 0) message.resize(random() % message.size());
+  for (size_t i = random() % 6 + 1; i > 0 && !message.empty(); --i) {
+    // The header as often as the content.
+    const size_t range = random() % 2 == 0 ? std::min<size_t>(message.size(), 200) : message.size();
+    message[random() % range] = static_cast<char>(random());
+  }
+  return message;
+}
+
+// Waits for room to send or for something to read, but not for long, since a peer that was lied to
+// about a length waits for the rest. False when the connection has ended.
+bool exchange(int socket, std::string_view message) {
+  while (!message.empty()) {
+    const ssize_t size = send(socket, message.data(), message.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
+    if (size > 0) {
+      message.remove_prefix(static_cast<size_t>(size));
+      continue;
+    }
+    if (errno != EAGAIN) return false;
+    pollfd ready{socket, POLLIN | POLLOUT, 0};
+    if (poll(&ready, 1, 1000) <= 0) return false;
+    if ((ready.revents & POLLIN) != 0 && testsupport::receiveSome(socket).empty()) return false;
+  }
+  char buffer[4096];
+  ssize_t size;
+  while ((size = recv(socket, buffer, sizeof buffer, MSG_DONTWAIT)) > 0) {
+  }
+  return size < 0 && errno == EAGAIN;
+}
+
+// Sends wrong messages; the number of those sent.
+int sendWrongMessages(const DaemonProcess& daemon, const Options& options,
+                      const std::function<bool()>& goesOn) {
+  std::mt19937 random(options.seed);
+  const std::vector<Call> calls = validCalls();
+  int sent = 0;
+  while (sent < options.messages && goesOn()) {
+    const std::string service = calls[random() % calls.size()].service;
+    const FileDescriptor socket(testsupport::connectTo(daemon.socketOf(service)));
+    if (socket.get() < 0 || !testsupport::authenticate(socket.get())) continue;
+    for (int i = 0; i < kMessagesOfConnection && sent < options.messages; ++i) {
+      const Call* call = &calls[random() % calls.size()];
+      while (call->service != service) call = &calls[random() % calls.size()];
+      ++sent;
+      if (!exchange(socket.get(), mutated(call->message, random))) break;
+    }
+  }
+  return sent;
+}
+
+bool lives(const DaemonProcess& daemon) {
+  return kill(daemon.pid(), 0) == 0;
+}
+
+size_t anonymousKilobytes(pid_t process) {
+  std::ifstream status(fmt::format("/proc/{}/status", process));
+  std::string name;
+  size_t value = 0;
+  while (status >> name) {
+    if (name == "RssAnon:" && status >> value) return value;
+  }
+  return 0;
+}
+
+// Ends the daemon in order and says what was wrong. The status of the driver.
+int conclude(DaemonProcess& daemon, const GoodClient& good, const std::string& line) {
+  daemon.signal(SIGTERM);
+  const int status = daemon.wait();
+  fmt::print("{} {} status={}\n", line, good.report(), status);
+  if (!good.wrong.empty()) fmt::print(stderr, "WRONG: {}\n", good.wrong);
+  if (status != 0) {
+    const std::string log = daemon.log();
+    fmt::print(stderr, "{}\n", log.substr(log.size() - std::min<size_t>(log.size(), 3000)));
+  }
+  return status == 0 && good.wrong.empty() ? 0 : 1;
+}
+
+int runMutations(const Options& options) {
+  fmt::print("seed={}\n", options.seed);
+  const testsupport::TemporaryDirectory scratch;
+  DaemonProcess daemon(scratch.path());
+  const rlimit limit{kDescriptors, kDescriptors};
+  prlimit(daemon.pid(), RLIMIT_NOFILE, &limit, nullptr);
+  GoodClient good(daemon.runtimeDirectory(), 20);
+  int sent = 0;
+  {
+    const std::jthread working([&good](const std::stop_token& stop) { good.work(stop); });
+    sent = sendWrongMessages(daemon, options, [&] { return good.wrong.empty() && lives(daemon); });
+  }
+  return conclude(daemon, good, fmt::format("messages={}", sent));
+}
+
+// ---- floods ----
+
+// Connections that are held and say nothing: until `stop`, then how many are still open after the
+// time that they have to authenticate.
+void holdSilentOnes(const std::string& path, int count, const std::stop_token& stop) {
+  std::vector<FileDescriptor> held;
+  for (int i = 0; i < count && !stop.stop_requested(); ++i) {
+    held.emplace_back(testsupport::connectTo(path));
+  }
+  while (!stop.stop_requested()) std::this_thread::sleep_for(milliseconds(50));
+}
+
+// Send a byte a second of a message that says to be large.
+void drip(const std::string& path, int count, const std::stop_token& stop) {
+  std::vector<FileDescriptor> sockets(static_cast<size_t>(count));
+  const std::string header = std::string("l\1\0\1\0\0\0\2\1\0\0\0\x60\0\0\0", 16);  // 32 MiB
+  while (!stop.stop_requested()) {
+    for (FileDescriptor& socket : sockets) {
+      if (socket.get() >= 0 && testsupport::sendAll(socket.get(), "x")) continue;
+      socket = FileDescriptor(testsupport::connectTo(path));
+      if (socket.get() >= 0 && testsupport::authenticate(socket.get())) {
+        testsupport::sendAll(socket.get(), header);
+      }
+    }
+    std::this_thread::sleep_for(milliseconds(1000));
+  }
+}
+
+// Searches for everything, again and again, and never reads an answer.
+void neverRead(const std::string& path, const std::string& message, const std::stop_token& stop) {
+  while (!stop.stop_requested()) {
+    const FileDescriptor socket(testsupport::connectTo(path));
+    if (socket.get() < 0 || !testsupport::authenticate(socket.get())) continue;
+    while (!stop.stop_requested()) {
+      const ssize_t size =
+          send(socket.get(), message.data(), message.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
+      if (size < 0 && errno != EAGAIN) break;
+      if (size != static_cast<ssize_t>(message.size())) {
+        std::this_thread::sleep_for(milliseconds(10));
+      }
+    }
+  }
+}
+
+int runFlood(const Options& options) {
+  constexpr int kBatch = 500;
+  const testsupport::TemporaryDirectory scratch;
+  DaemonProcess daemon(scratch.path());
+  const std::string path = daemon.socketOf(client::kSearchServiceName);
+  GoodClient good(daemon.runtimeDirectory(), kBatch);
+  size_t most = 0;
+  {
+    std::vector<std::jthread> threads;
+    const auto start = [&threads](auto body) { threads.emplace_back(body); };
+    start([&](const std::stop_token& stop) { good.work(stop); });
+    start([&](const std::stop_token& stop) { holdSilentOnes(path, 2000, stop); });
+    start([&](const std::stop_token& stop) { holdSilentOnes(path, 64, stop); });
+    start([&](const std::stop_token& stop) { drip(path, 64, stop); });
+    const std::string message = validCalls()[6].message;
+    for (int i = 0; i < 15; ++i) {
+      start([&](const std::stop_token& stop) { neverRead(path, message, stop); });
+    }
+    const auto end = Clock::now() + std::chrono::seconds(options.seconds);
+    while (Clock::now() < end && good.wrong.empty() && lives(daemon)) {
+      std::this_thread::sleep_for(milliseconds(20));
+      most = std::max(most, anonymousKilobytes(daemon.pid()));
+    }
+  }
+  const int status = conclude(
+      daemon, good, fmt::format("rss_anon_peak_mb={:.0f}", static_cast<double>(most) / 1024));
+  if (most <= kMaxDaemonKilobytes) return status;
+  fmt::print(stderr, "The daemon took more than {} KiB\n", kMaxDaemonKilobytes);
+  return 1;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  setenv("TALLOW_LOG", "fault", 1);
+  rlimit descriptors;
+  getrlimit(RLIMIT_NOFILE, &descriptors);
+  descriptors.rlim_cur = descriptors.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &descriptors);
+  Options options;
+  for (int i = 1; i < argc; i += 2) {
+    const std::string_view name = argv[i];
+    const std::string_view value = i + 1 < argc ? argv[i + 1] : "";
+    if (name == "--messages") {
+      options.messages = std::atoi(value.data());
+    } else if (name == "--seconds") {
+      options.seconds = std::atoi(value.data());
+    } else if (name == "--seed") {
+      options.seed = static_cast<uint32_t>(std::strtoul(value.data(), nullptr, 10));
+    } else if (name == "--mode" && value == "flood") {
+      options.flood = true;
+    } else {
+      fmt::print(stderr, "{}", kUsage);
+      return 2;
+    }
+  }
+  return options.flood ? runFlood(options) : runMutations(options);
+}
