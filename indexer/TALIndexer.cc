@@ -354,7 +354,9 @@ void TALIndexer::saltVacuumAndCompactWithCompletionHandler(Completion completion
         // On the queue the index cannot be replaced, so neither mutex is needed.
         if (_textStore != nullptr) {
           _textStore->Vacuum();
-          _textStore->Compact();
+          if (!_textStore->Compact()) {
+            return platform::posixError(ENOSPC, "the disk lacks the room for a compaction");
+          }
         }
         return std::nullopt;
       },
@@ -462,6 +464,10 @@ void TALIndexer::shutdown() {
   {
     MutexLock lock(_indexMutex);
     _shutdown = true;
+  }
+  {
+    MutexLock lock(_textStoreMutex);
+    if (_textStore != nullptr) _textStore->Interrupt();
   }
   _queue.drain();
   std::shared_ptr<TALDocStore> store;

@@ -20,13 +20,21 @@ void Activity::end() {
   if (--_running == 0) _changed.notify_all();
 }
 
+void Activity::interrupt() {
+  platform::MutexLock lock(_mutex);
+  _interrupted = true;
+  _changed.notify_all();
+}
+
 void Activity::waitForEnd(std::chrono::nanoseconds most) {
   const auto deadline = Clock::now() + most;
   platform::MutexLock lock(_mutex);
   for (;;) {
-    if (!_changed.wait_until(_mutex, deadline, [this] { return !any(); })) return;
+    const auto over = [this]() TL_REQUIRES(_mutex) { return _interrupted || !any(); };
+    if (!_changed.wait_until(_mutex, deadline, over) || _interrupted) return;
     const auto quiet = std::min(deadline, Clock::now() + _gap);
-    if (!_changed.wait_until(_mutex, quiet, [this] { return any(); })) return;
+    const auto again = [this]() TL_REQUIRES(_mutex) { return _interrupted || any(); };
+    if (!_changed.wait_until(_mutex, quiet, again) || _interrupted) return;
   }
 }
 

@@ -29,8 +29,11 @@ class Activity {
   // Cheap enough to ask all the time.
   [[nodiscard]] bool any() const { return _running.load(std::memory_order_relaxed) != 0; }
 
-  // Waits until no work has gone on for the length of the gap; no longer than `most`.
+  // Waits until no work has gone on for the length of the gap; no longer than `most`, and not after
+  // an interruption.
   void waitForEnd(std::chrono::nanoseconds most) TL_EXCLUDES(_mutex);
+  // Ends all waiting, for good.
+  void interrupt() TL_EXCLUDES(_mutex);
 
  private:
   void begin() TL_EXCLUDES(_mutex);
@@ -40,6 +43,7 @@ class Activity {
   std::atomic<int> _running{0};  // changed under the mutex
   platform::Mutex _mutex;
   std::condition_variable_any _changed;
+  bool _interrupted TL_GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace salt

@@ -22,7 +22,7 @@ constexpr size_t kLogLineBytes = 100;
 constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one takes at a time
 // In a memtable a batch takes up to three times as much.
 constexpr size_t kBatchesBesideCompaction = kWriteBufferBytes / 4;
-constexpr std::chrono::seconds kLongestWait{10};
+constexpr std::chrono::seconds kLongestWait{1};  // with locks held that searches need
 
 leveldb::Status open(const leveldb::Options& options, const std::string& path,
                      std::unique_ptr<leveldb::DB>* db) {
@@ -55,10 +55,10 @@ void LeveldbLogger::Logv(const char* format, va_list arguments) {
   log.debug("{}", static_cast<const char*>(line));
 }
 
-void BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end) {
+bool BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end) {
   if (const uint64_t free = platform::freeBytes(_database.path); free < kCompactionRoom) {
     Log.error("No compaction: {} bytes are left on the disk", free);
-    return;
+    return false;
   }
   {
     platform::MutexLock lock(_mutex);
@@ -70,6 +70,7 @@ void BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end
   platform::MutexLock lock(_mutex);
   _compacts = false;
   _compacted.notify_all();
+  return true;
 }
 
 bool BatchWriter::waitForCompaction(size_t bytes) {

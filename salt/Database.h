@@ -56,7 +56,8 @@ enum class OpenMode { create, existing };
 //
 // leveldb 1.23 ends the process when it fails to write a memtable during a compaction on demand. So
 // none begins on a disk that is nearly full or beside another, and writes that would fill the
-// memtable meanwhile wait, 10 seconds at most.
+// memtable meanwhile wait, a second at most: who adds a lot has waited before, holding no lock (see
+// WaitWhileTidying).
 class BatchWriter {
  public:
   // Of the open database, which outlives this.
@@ -68,9 +69,9 @@ class BatchWriter {
   // Returns once all that was written is on the disk.
   [[nodiscard]] leveldb::Status sync() TL_EXCLUDES(_mutex);
 
-  // The keys from `begin` to `end`; null stands for the first and the last. Does nothing, with a
-  // log line, where fewer than 128 MiB are free.
-  void compact(const leveldb::Slice* begin, const leveldb::Slice* end) TL_EXCLUDES(_mutex);
+  // The keys from `begin` to `end`; null stands for the first and the last. Does nothing and gives
+  // false, with a log line, where fewer than 128 MiB are free.
+  bool compact(const leveldb::Slice* begin, const leveldb::Slice* end) TL_EXCLUDES(_mutex);
 
  private:
   // False when it took too long.

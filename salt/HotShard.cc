@@ -42,7 +42,7 @@ bool index::AddZone(uint32_t docID, uint16_t zoneID, std::string_view text,
 // The zone is stored by now, whatever becomes of the merge; the next zone asks for one again.
 void index::vacuumAfterAdding() {
   try {
-    Vacuum();
+    vacuum();
   } catch (const std::system_error& error) {
     Log.error("Error starting vacuum: {}", error.what());
   }

@@ -149,12 +149,15 @@ class Index {
       std::function<bool(uint32_t docID, uint16_t zoneID, std::string_view text)> callback)
       const = 0;
 
-  // Starts to move the hot suffixes into a shard, in the background, if that is worthwhile.
+  // Starts to move the hot suffixes into a shard, in the background, if that is worthwhile. One
+  // that waits for more begins at once.
   virtual void Vacuum() = 0;
 
   // True once all that was added and deleted is on the disk.
   virtual bool Sync() = 0;
-  virtual void Compact() = 0;
+  // Waits for a merge that runs, then compacts all. False, with a log line, where the disk lacks
+  // the room for it.
+  virtual bool Compact() = 0;
 
   // Reads all stored text to count it: for diagnosis.
   [[nodiscard]] virtual Metrics GetMetrics() const = 0;
@@ -187,6 +190,10 @@ class Index {
   // while a merge or a compaction runs, which costs much more while much is added; 10 seconds at
   // most.
   virtual void WaitWhileTidying() = 0;
+
+  // For who is about to delete the index: merges end with the batch in hand, and nobody waits for
+  // them or for compactions any more.
+  virtual void Interrupt() = 0;
 };
 
 // Makes a new index in the directory `options.Path`; what was there is removed. Null with an error

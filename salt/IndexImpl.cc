@@ -170,26 +170,39 @@ bool index::Sync() {
   return status.ok();
 }
 
-void index::Compact() {
+bool index::Compact() {
+  waitForMerge();
+  if (_interrupted) return true;
   const Activity::Work compaction(_housekeeping);
-  compactRange(nullptr, nullptr);
+  const bool done = compactRange(nullptr, nullptr);
   _database.files->waitForDisk();
+  return done;
 }
 
-void index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
-  _writer.compact(begin, end);
+bool index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
+  if (!_writer.compact(begin, end)) return false;
   ++_compactionsEnded;
+  return true;
 }
 
 // leveldb does so whenever it has written its memtable. That is all there is to compact behind the
 // last key.
 void index::removeObsoleteFiles() const {
   const leveldb::Slice behind("\xFF\xFF", 2);
-  _writer.compact(&behind, &behind);
+  (void)_writer.compact(&behind, &behind);
 }
 
 void index::WaitWhileTidying() {
   _housekeeping.waitForEnd(kLongestWait);
+}
+
+void index::Interrupt() {
+  {
+    platform::MutexLock lock(_paceMutex);
+    _interrupted = true;
+  }
+  _paceChanged.notify_all();
+  _housekeeping.interrupt();
 }
 
 Index::Metrics index::GetMetrics() const {
@@ -259,7 +272,10 @@ IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
 IndexView::~IndexView() {
   iterators.clear();
   if (options.fill_cache || idx._compactionsEnded == _compactionsEnded) return;
-  idx.removeObsoleteFiles();
+  // Not here: it takes as long as writing a memtable, and waits for a compaction that runs.
+  (void)idx._tidying.async([&owner = idx] {
+    if (!owner._interrupted) owner.removeObsoleteFiles();
+  });
 }
 
 void IndexView::take(size_t walks) {

@@ -5,6 +5,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <condition_variable>
 #include <memory>
 #include <optional>
 #include <string>
@@ -12,6 +13,7 @@
 #include <vector>
 
 #include "platform/Mutex.h"
+#include "platform/Queue.h"
 #include "salt/Activity.h"
 #include "salt/Coding.h"
 #include "salt/Database.h"
@@ -71,7 +73,7 @@ class index final : public Index {
                        callback) const override;
   void Vacuum() override;
   bool Sync() override;
-  void Compact() override;
+  bool Compact() override;
   [[nodiscard]] Metrics GetMetrics() const override;
   void ResetScanMetrics() override;
   [[nodiscard]] bool Validate() const override;
@@ -82,6 +84,8 @@ class index final : public Index {
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override;
   void WaitWhileTidying() override;
+  void Interrupt() override;
+  [[nodiscard]] bool interrupted() const { return _interrupted; }
 
   // Whether ScanPrefixes leaves out what it need not look for.
   [[nodiscard]] bool knowsStarts() const { return _starts.complete(); }
@@ -164,12 +168,16 @@ class index final : public Index {
   [[nodiscard]] bool vacuumIsDue() const TL_EXCLUDES(_metricsMutex);
   void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex, _commitMutex);
   // The body of the merge thread.
-  void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
-  void waitForMore() const TL_EXCLUDES(_metricsMutex);
+  void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex, _paceMutex);
+  void mergeInto(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
+  void waitForMore() TL_EXCLUDES(_metricsMutex, _paceMutex);
+  // Starts a merge if it is worthwhile and none runs.
+  void vacuum();
+  void waitForMerge() TL_EXCLUDES(_paceMutex);
   [[nodiscard]] uint64_t hotSuffixes() const TL_EXCLUDES(_metricsMutex);
   void compactPart(uint8_t shard);
-  // The keys from `begin` to `end`.
-  void compactRange(const leveldb::Slice* begin, const leveldb::Slice* end);
+  // The keys from `begin` to `end`; false without room.
+  bool compactRange(const leveldb::Slice* begin, const leveldb::Slice* end);
   void removeObsoleteFiles() const;
 
   // Reads options, metrics and the deleted documents; false, with an error, when the system does
@@ -232,7 +240,16 @@ class index final : public Index {
   platform::Mutex _mergeThreadMutex;
   std::thread _mergeThread TL_GUARDED_BY(_mergeThreadMutex);
 
-  mutable SuffixStarts _starts;  // synchronised by itself; last, since its thread reads the index
+  // What a merge that waits for more and those who wait for a merge look at.
+  platform::Mutex _paceMutex;
+  std::condition_variable_any _paceChanged;
+  bool _mergeAtOnce TL_GUARDED_BY(_paceMutex) = false;
+  bool _merging TL_GUARDED_BY(_paceMutex) = false;
+  std::atomic<bool> _interrupted{false};  // set under _paceMutex
+
+  mutable SuffixStarts _starts;  // synchronised by itself; its thread reads the index
+  // Removes files behind long walks; last, since it uses all the rest.
+  mutable platform::SerialQueue _tidying{"tallow-tidy", platform::QueuePriority::low};
 };
 
 template <typename Change>

@@ -32,7 +32,7 @@ bool Merge::run() {
   const size_t pageSuffixes = _idx.op.MaxPageSuffixes;
   _old.seekToFirst();
   _hot.seekToFirst();
-  while (!_failed && (_old.valid || _hot.valid)) {
+  while (!_failed && !_interrupted && (_old.valid || _hot.valid)) {
     if (_pending.size() >= 2 * pageSuffixes) {
       flushPage(pageSuffixes);
       if (!_tookOld) commit(false);
@@ -43,8 +43,8 @@ bool Merge::run() {
       takeHot();
     }
   }
-  commit(true);
-  return !_failed;
+  if (!_interrupted) commit(true);
+  return !_failed && !_interrupted;
 }
 
 bool Merge::oldIsNext() {
@@ -129,6 +129,7 @@ void Merge::flushPage(size_t count) {
   putPage();
   ++_pageDelta;
   _pace.giveWay();
+  _interrupted = _idx.interrupted();
   const auto taken = static_cast<ptrdiff_t>(count);
   _pending.erase(_pending.begin(), _pending.begin() + taken);
   std::rotate(_pendingTexts.begin(), _pendingTexts.begin() + taken, _pendingTexts.end());

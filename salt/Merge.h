@@ -24,8 +24,8 @@ class Merge {
  public:
   Merge(index& owner, uint8_t shard);
 
-  // To the end, or to the first read or write that fails; what was committed until then stays.
-  // False when one failed.
+  // To the end, or to the first read or write that fails, or an interruption of the index; what was
+  // committed until then stays. False when it did not come to the end.
   [[nodiscard]] bool run();
 
  private:
@@ -66,6 +66,7 @@ class Merge {
   uint64_t _hotMerged = 0;                 // since the latest commit, like _pageDelta
   int64_t _pageDelta = 0;
   bool _failed = false;
+  bool _interrupted = false;
   bool _tookOld = false;
   bool _lastFromHot = false;
   std::string _key;

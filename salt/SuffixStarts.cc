@@ -1,5 +1,6 @@
 #include "salt/SuffixStarts.h"
 
+#include <system_error>
 #include <utility>
 
 #include "platform/Queue.h"
@@ -15,7 +16,7 @@ SuffixStarts::~SuffixStarts() {
 void SuffixStarts::beginWith(Walk walk) {
   platform::MutexLock lock(_mutex);
   if (_complete || _thread.joinable()) return;
-  _thread = std::thread([this, walk = std::move(walk)] {
+  const auto body = [this, walk = std::move(walk)] {
     platform::setThreadName("tallow-starts");
     platform::lowerThreadPriority();
     const bool all = walk([this](std::string_view text) {
@@ -23,7 +24,12 @@ void SuffixStarts::beginWith(Walk walk) {
       return !_ending;
     });
     if (all && !_ending) _complete = true;
-  });
+  };
+  try {
+    _thread = std::thread(body);
+  } catch (const std::system_error&) {
+    // Until then a look at the index tells.
+  }
 }
 
 }  // namespace salt

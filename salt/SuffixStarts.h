@@ -2,11 +2,13 @@
 
 #include <atomic>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
 #include <functional>
+#include <memory>
+#include <new>
 #include <string_view>
 #include <thread>
-#include <vector>
 
 #include "platform/Mutex.h"
 
@@ -27,7 +29,9 @@ class SuffixStarts {
   // Calls its argument for each stored text until that returns false; true when all were read.
   using Walk = std::function<bool(const std::function<bool(std::string_view text)>&)>;
 
-  SuffixStarts() : _bits(kBits / 64) {}
+  SuffixStarts() : _bits(static_cast<uint64_t*>(std::calloc(kBits / 64, sizeof(uint64_t)))) {
+    if (_bits == nullptr) throw std::bad_alloc();
+  }
   // Ends a walk that runs.
   ~SuffixStarts();
   SuffixStarts(const SuffixStarts&) = delete;
@@ -35,7 +39,7 @@ class SuffixStarts {
 
   // There was nothing before.
   void beginEmpty() { _complete = true; }
-  // Starts the walk, once.
+  // Starts the walk, once; later where the system has no thread to give now.
   void beginWith(Walk walk) TL_EXCLUDES(_mutex);
   [[nodiscard]] bool complete() const { return _complete; }
 
@@ -43,7 +47,7 @@ class SuffixStarts {
   void add(std::string_view text) {
     if (text.size() < kBytes) return;
     const uint64_t hash = hashOf(text.data());
-    std::atomic<uint64_t>& bits = _bits[hash / 64];
+    const std::atomic_ref<uint64_t> bits(_bits.get()[hash / 64]);
     const uint64_t bit = uint64_t{1} << hash % 64;
     if ((bits.load(std::memory_order_relaxed) & bit) == 0) {
       bits.fetch_or(bit, std::memory_order_relaxed);
@@ -54,7 +58,8 @@ class SuffixStarts {
   [[nodiscard]] bool mayBegin(std::string_view prefix) const {
     if (prefix.size() < kBytes || !_complete) return true;
     const uint64_t hash = hashOf(prefix.data());
-    return (_bits[hash / 64].load(std::memory_order_relaxed) >> hash % 64 & 1) != 0;
+    const std::atomic_ref<uint64_t> bits(_bits.get()[hash / 64]);
+    return (bits.load(std::memory_order_relaxed) >> hash % 64 & 1) != 0;
   }
 
  private:
@@ -68,7 +73,11 @@ class SuffixStarts {
     return value * UINT64_C(0x9E3779B97F4A7C15) >> (64 - kLogBits);
   }
 
-  std::vector<std::atomic<uint64_t>> _bits;
+  struct Free {
+    void operator()(uint64_t* bits) const { std::free(bits); }
+  };
+  // Pages of it come into being with their first bit: of an index that nobody uses there are none.
+  const std::unique_ptr<uint64_t, Free> _bits;
   std::atomic<bool> _complete{false};
   std::atomic<bool> _ending{false};
   platform::Mutex _mutex;

@@ -29,6 +29,16 @@ index::~index() {
 }
 
 void index::Vacuum() {
+  {
+    platform::MutexLock lock(_paceMutex);
+    _mergeAtOnce = true;
+  }
+  _paceChanged.notify_all();
+  vacuum();
+}
+
+void index::vacuum() {
+  if (_interrupted) return;
   if (const std::optional<uint8_t> shard = beginVacuum()) startMerge(*shard);
 }
 
@@ -67,9 +77,15 @@ uint8_t index::chooseShard(MetricsBlock& counters) const {
 void index::startMerge(uint8_t shard) {
   platform::MutexLock lock(_mergeThreadMutex);
   if (_mergeThread.joinable()) _mergeThread.join();
+  const auto setMerging = [this](bool merging) {
+    platform::MutexLock paceLock(_paceMutex);
+    _merging = merging;
+  };
   try {
+    setMerging(true);
     _mergeThread = std::thread([this, shard] { runMerge(shard); });
   } catch (const std::system_error&) {
+    setMerging(false);
     platform::MutexLock commitLock(_commitMutex);
     platform::MutexLock metricsLock(_metricsMutex);
     metrics.VacuumInProgress = false;
@@ -80,13 +96,27 @@ void index::startMerge(uint8_t shard) {
 void index::runMerge(uint8_t shard) {
   platform::setThreadName("tallow-merge");
   waitForMore();
+  mergeInto(shard);
+  platform::MutexLock lock(_paceMutex);
+  _merging = false;
+  _mergeAtOnce = false;
+  _paceChanged.notify_all();
+}
+
+void index::waitForMerge() {
+  platform::MutexLock lock(_paceMutex);
+  while (_merging && !_interrupted) _paceChanged.wait(_paceMutex);
+}
+
+void index::mergeInto(uint8_t shard) {
   const auto start = Clock::now();
   {
     const Activity::Work merge(_housekeeping);
     const bool merged = Merge(*this, shard).run();
     platform::returnFreeMemory();
-    if (op.CompactAfterVacuum) {
-      Compact();
+    if (op.CompactAfterVacuum && !_interrupted) {
+      compactRange(nullptr, nullptr);
+      _database.files->waitForDisk();
     } else if (merged) {
       compactPart(kHotPart);
       compactPart(shard);
@@ -106,12 +136,17 @@ void index::runMerge(uint8_t shard) {
 }
 
 // Each merge rewrites its whole shard, so that while mail pours in fewer and larger ones cost less.
-void index::waitForMore() const {
+void index::waitForMore() {
   if (op.MaxHotSuffixes < kSmallHotPart) return;
+  const auto pause = [this] {
+    platform::MutexLock lock(_paceMutex);
+    const auto over = [this]() TL_REQUIRES(_paceMutex) { return _mergeAtOnce || _interrupted; };
+    return !_paceChanged.wait_for(_paceMutex, kInterval, over);
+  };
   const auto deadline = Clock::now() + kLongestWait;
   uint64_t before = hotSuffixes();
   while (before < kWorthwhile * uint64_t{op.MaxHotSuffixes} && Clock::now() < deadline) {
-    std::this_thread::sleep_for(kInterval);
+    if (!pause()) return;
     const uint64_t hot = hotSuffixes();
     if (hot < before + kPouring) return;
     before = hot;
@@ -132,6 +167,7 @@ uint64_t index::hotSuffixes() const {
 // file of the last hot suffixes and the first texts spans all shards, and is merged with all of
 // their pages in the next level.
 void index::compactPart(uint8_t shard) {
+  if (_interrupted) return;
   const char first = static_cast<char>(shard);
   const char behind = static_cast<char>(shard + 1);
   const leveldb::Slice begin(&first, 1);

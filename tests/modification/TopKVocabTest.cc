@@ -58,12 +58,13 @@ class WatchedIndex final : public salt::Index {
   }
   void Vacuum() override {}
   bool Sync() override { return true; }
-  void Compact() override {}
+  bool Compact() override { return true; }
   Metrics GetMetrics() const override { return {}; }
   void ResetScanMetrics() override {}
   bool Validate() const override { return true; }
   std::string Dump() const override { return ""; }
   void WaitWhileTidying() override {}
+  void Interrupt() override {}
 
  private:
   Options _options;

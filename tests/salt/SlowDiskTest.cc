@@ -177,6 +177,38 @@ TEST(SlowDisk, WhoAddsALotHoldsBackDuringAMerge) {
   EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
 }
 
+// A merge that would go on for long, and an index that nobody needs any more.
+TEST(SlowDisk, AnInterruptionEndsAMergeAndAllWaitingForIt) {
+  constexpr uint32_t kDocs = 400;
+  const testsupport::TemporaryDirectory directory;
+  Index::Options options;
+  options.MaxHotSuffixes = 2 * kDocs;
+  options.MaxPageSuffixes = 2;
+  options.MaxBatchBytes = 1;
+  ASSERT_NE(salttest::newIndex(directory / "i", options), nullptr);
+  SlowDisk disk(".log");
+  auto index = openOn(&disk, directory / "i");
+  ASSERT_NE(index, nullptr);
+  for (uint32_t docID = 1; docID <= kDocs; ++docID) {
+    ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
+  }
+  disk.holdUpAfter(2);  // the mark of the merge and its first pages pass
+  index->Vacuum();
+  disk.waitForWriter();
+  std::thread compacting([&index] { EXPECT_TRUE(index->Compact()); });
+  std::thread adding([&index] { index->WaitWhileTidying(); });
+  index->Interrupt();
+  compacting.join();
+  adding.join();
+  disk.goOn();
+  index.reset();
+  const auto again = salttest::loadIndex(directory / "i");
+  ASSERT_NE(again, nullptr);
+  EXPECT_GT(again->GetMetrics().HotSuffixes, kDocs);
+  EXPECT_EQ(sortedScan(*again).size(), 2 * kDocs);
+  EXPECT_TRUE(again->Validate());
+}
+
 // leveldb would end the process if it failed to write that memtable.
 TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   const testsupport::TemporaryDirectory directory;
