@@ -597,11 +597,13 @@ int RPCServerConnection::dispatch(sd_bus_message* message) {
 void RPCServerConnection::endCall(uint64_t number, const BuildReply& build, size_t bytes) {
   const auto entry = _calls.find(number);
   if (entry == _calls.end()) return;
-  sendReply(entry->second, build);
-  sd_bus_message_unref(entry->second);
+  sd_bus_message* const call = entry->second;
+  // First, so that a peer that has its answer finds the connection idle.
   _calls.erase(entry);
   _idleSince = monotonicTicks();
   _inFlight = _calls.size();
+  sendReply(call, build);
+  sd_bus_message_unref(call);
   checkQueue(bytes);
   if (!_reading && !_ending) {
     _loop->post([this] {

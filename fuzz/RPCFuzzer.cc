@@ -1,0 +1,99 @@
+// What a peer sends behind the handshake: the bytes go through the framer and the bus library into
+// handlers that read every kind of argument, in a connection as the daemon serves it.
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <future>
+#include <string_view>
+
+#include "platform/RPCConnection.h"
+#include "records/TLIndexableItem.h"
+#include "records/TLQuery.h"
+#include "tests/support/RawMessages.h"
+
+namespace {
+
+using platform::RPCArguments;
+using platform::RPCReply;
+
+constexpr const char* kService = "f.f";  // short, so that an input hits it
+
+// Reads one argument after the other, and decodes records, as the handlers of the daemon do.
+void handle(const char* signature, RPCArguments& arguments,
+            const std::shared_ptr<RPCReply>& reply) {
+  size_t sum = 0;
+  for (const char* type = signature; *type != 0; ++type) {
+    const std::string_view rest = type;
+    if (rest.starts_with("aay")) {
+      for (const std::string_view bytes : arguments.readBytesArray()) {
+        TLIndexableItem item;
+        sum += item.initWithData(bytes) ? 1 : 0;
+      }
+      type += 2;
+    } else if (rest.starts_with("as")) {
+      sum += arguments.readStringArray().size();
+      ++type;
+    } else if (rest.starts_with("ay")) {
+      TLQuery query;
+      sum += query.initWithData(arguments.readBytes()) ? 1 : 0;
+      ++type;
+    } else if (*type == 'b') {
+      sum += arguments.readBoolean() ? 1 : 0;
+    } else if (*type == 'x') {
+      sum += static_cast<size_t>(arguments.readInt64());
+    } else if (*type == 't') {
+      sum += arguments.readUInt64();
+    } else {
+      sum += arguments.readString().size();
+    }
+  }
+  reply->send({std::to_string(sum)});
+}
+
+const platform::RPCInterface& interface() {
+  static const platform::RPCInterface made = [] {
+    platform::RPCInterface methods;
+    int number = 0;
+    static const char* const names[] = {"A", "B", "C", "D", "E", "F"};
+    for (const char* signature : {"aayss", "asss", "aayasbayss", "ss", "aytsx", "s"}) {
+      methods.methods.push_back(
+          {names[number++],
+           signature,
+           "s",
+           {},
+           [signature](RPCArguments& arguments, const std::shared_ptr<RPCReply>& reply) {
+             handle(signature, arguments, reply);
+           }});
+    }
+    return methods;
+  }();
+  return made;
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  setenv("TALLOW_LOG", "fault", 0);
+  int ends[2];
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return 0;
+  fcntl(ends[1], F_SETFL, O_NONBLOCK);
+  {
+    std::promise<void> ended;
+    platform::RPCServerConnection connection(ends[1], kService, "fuzzer");
+    connection.setExportedInterface(&interface());
+    if (connection.start([&ended] { ended.set_value(); })) {
+      const std::string_view bytes(reinterpret_cast<const char*>(data), size);
+      testsupport::sendAll(ends[0], testsupport::authenticationLines() + "BEGIN\r\n");
+      testsupport::sendAll(ends[0], bytes);
+      shutdown(ends[0], SHUT_WR);
+      while (!testsupport::receiveSome(ends[0]).empty()) {
+      }
+      ended.get_future().wait();
+    }
+  }
+  close(ends[0]);
+  return 0;
+}
