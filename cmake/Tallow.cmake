@@ -16,7 +16,7 @@ target_include_directories(tallow_flags INTERFACE ${CMAKE_SOURCE_DIR})
 target_compile_options(
   tallow_flags INTERFACE -Wall -Wextra -Wpedantic -Wshadow -Werror)
 if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
-  target_compile_options(tallow_flags INTERFACE -Wthread-safety)
+  target_compile_options(tallow_flags INTERFACE -Wthread-safety -Wthread-safety-beta)
 endif()
 if(TALLOW_SANITIZE)
   target_compile_options(tallow_flags INTERFACE -fsanitize=${TALLOW_SANITIZE} -fno-omit-frame-pointer
