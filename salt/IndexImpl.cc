@@ -142,9 +142,11 @@ bool index::metricsSound() const {
 }
 
 std::string_view index::fullText(const SuffixMeta& meta, const leveldb::ReadOptions& options,
-                                 std::string* zoneText) const {
+                                 std::string* zoneText, bool* readable) const {
   const leveldb::Status status =
       db->Get(options, slice(textKey(meta.DocID, meta.ZoneID).view()), zoneText);
+  *readable = status.ok() || status.IsNotFound();
+  if (!*readable) Log.error("Error reading from db: {}", status.ToString());
   return status.ok() ? suffixText(meta, *zoneText) : "";
 }
 
@@ -156,7 +158,8 @@ std::string_view index::suffixText(const SuffixMeta& meta, std::string_view zone
 
 std::string index::GetSuffixText(const SuffixMeta& meta) const {
   std::string zoneText;
-  return std::string(fullText(meta, leveldb::ReadOptions(), &zoneText));
+  bool readable = true;
+  return std::string(fullText(meta, leveldb::ReadOptions(), &zoneText, &readable));
 }
 
 std::shared_ptr<const DocSet> index::deletedDocs() const {

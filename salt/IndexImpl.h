@@ -99,11 +99,11 @@ class index final : public Index {
     return {shard, docID, zoneID};
   }
 
-  // The cut text of a suffix, empty when its zone cannot be read or is too short. It points into
-  // `zoneText`, which takes the text of the whole zone.
+  // The cut text of a suffix, empty when its zone is not there, or cannot be read, which `readable`
+  // tells, or is too short. It points into `zoneText`, which takes the text of the whole zone.
   [[nodiscard]] std::string_view fullText(const SuffixMeta& meta,
                                           const leveldb::ReadOptions& options,
-                                          std::string* zoneText) const;
+                                          std::string* zoneText, bool* readable) const;
   // The same, of a zone's text at hand.
   [[nodiscard]] std::string_view suffixText(const SuffixMeta& meta,
                                             std::string_view zoneText) const;

@@ -60,13 +60,19 @@ void Suffix::fetch() {
   if (full) return;
   TL_ASSERT(meta.DocID > 0);
   ++fetches;
-  const std::string_view text =
-      _zoneTexts != nullptr ? idx.suffixText(meta, _zoneTexts->find(meta.DocID, meta.ZoneID))
-                            : idx.fullText(meta, options, &_zoneText);
+  bool readable = true;
+  std::string_view text;
+  if (_zoneTexts != nullptr) {
+    text = idx.suffixText(meta, _zoneTexts->find(meta.DocID, meta.ZoneID));
+    readable = _zoneTexts->good();
+  } else {
+    text = idx.fullText(meta, options, &_zoneText, &readable);
+  }
+  full = true;
+  if (!readable) return;  // by the system: what is known has to do
   TL_ASSERT(text.size() >= size);
   std::memcpy(_text.get() + size, text.data() + size, text.size() - size);
   size = text.size();
-  full = true;
 }
 
 int Suffix::compareWithPrefix(std::string_view prefix) {
