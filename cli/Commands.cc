@@ -11,6 +11,7 @@
 #include "cli/Results.h"
 #include "client/DebugServiceProxy.h"
 #include "client/SearchServiceProxy.h"
+#include "records/TLDebugServiceKeys.h"
 
 namespace cli {
 
@@ -79,10 +80,19 @@ ExitStatus runStats(const Options& options) {
   if (!statistics) return complain(error);
   nlohmann::ordered_json json = nlohmann::ordered_json::object();
   std::string text;
+  int64_t unsearchable = 0;
   for (const auto& [key, value] : *statistics) {
     const auto number = std::visit([](auto v) { return nlohmann::ordered_json(v); }, value);
     json[key] = number;
     text += fmt::format("{:50} {:>14}\n", cleanForTerminal(key), number.dump());
+    const int64_t* const count = std::get_if<int64_t>(&value);
+    if (count == nullptr) continue;
+    if (key == TLDebugServiceDocStoreNumOfItems) unsearchable += *count;
+    if (key == TLDebugServiceTextStoreNumOfItems) unsearchable -= *count;
+  }
+  // A batch that was never acknowledged, since the daemon was killed in its midst, say.
+  if (unsearchable > 0) {
+    text += fmt::format("{} stored and not searchable: index the mail again\n", unsearchable);
   }
   return print(options.format == OutputFormat::json ? escapeJSONForTerminal(json.dump(2)) + '\n'
                                                     : text);

@@ -280,6 +280,12 @@ TEST_F(CommandsTest, Diagnostics) {
   EXPECT_THAT(output, testing::MatchesRegex("Count +3\nSeconds +0.5\n"));
   EXPECT_EQ(run({"stats", "--format=json"}), ExitStatus::done);
   EXPECT_EQ(nlohmann::json::parse(output), nlohmann::json::parse(R"({"Count":3,"Seconds":0.5})"));
+  daemon.answer("FetchStatsForIndexer", [](platform::RPCReply& reply) {
+    reply.send({platform::RPCDictionary{{"TLDebugServiceDocStoreNumOfItems", int64_t{30}},
+                                        {"TLDebugServiceTextStoreNumOfItems", uint64_t{28}}}});
+  });
+  EXPECT_EQ(run({"stats"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("2 stored and not searchable"));
   EXPECT_EQ(run({"metrics"}), ExitStatus::done);
   EXPECT_EQ(output, "metrics\n");
   EXPECT_EQ(run({"ping", "hello"}), ExitStatus::done);
