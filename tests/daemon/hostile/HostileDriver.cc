@@ -298,6 +298,7 @@ int runFlood(const Options& options) {
   DaemonProcess daemon(scratch.path());
   const std::string path = daemon.socketOf(client::kSearchServiceName);
   GoodClient good(daemon.runtimeDirectory(), kBatch);
+  const std::string message = validCalls()[6].message;
   size_t most = 0;
   {
     std::vector<std::jthread> threads;
@@ -306,7 +307,6 @@ int runFlood(const Options& options) {
     start([&](const std::stop_token& stop) { holdSilentOnes(path, 2000, stop); });
     start([&](const std::stop_token& stop) { holdSilentOnes(path, 64, stop); });
     start([&](const std::stop_token& stop) { drip(path, 64, stop); });
-    const std::string message = validCalls()[6].message;
     for (int i = 0; i < 15; ++i) {
       start([&](const std::stop_token& stop) { neverRead(path, message, stop); });
     }
