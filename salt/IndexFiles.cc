@@ -79,12 +79,41 @@ class IndexFiles::Manifest final : public leveldb::WritableFile {
   const std::shared_ptr<leveldb::WritableFile> _file;  // steps keep it
 };
 
+class IndexFiles::RecoveredLog final : public leveldb::SequentialFile {
+ public:
+  RecoveredLog(IndexFiles* files, leveldb::SequentialFile* file) : _files(*files), _file(file) {}
+
+  leveldb::Status Read(size_t size, leveldb::Slice* result, char* scratch) override {
+    const leveldb::Status status = _file->Read(size, result, scratch);
+    _files.fail(status);
+    return status;
+  }
+  leveldb::Status Skip(uint64_t size) override {
+    const leveldb::Status status = _file->Skip(size);
+    _files.fail(status);
+    return status;
+  }
+
+ private:
+  IndexFiles& _files;
+  const std::unique_ptr<leveldb::SequentialFile> _file;
+};
+
 IndexFiles::IndexFiles(leveldb::Env* files)
     : EnvWrapper(files),
       _logs(files),
       _steps("tallow-files"),
       _work("tallow-leveldb", platform::QueuePriority::background,
             platform::SerialQueue::kForever) {}
+
+leveldb::Status IndexFiles::NewSequentialFile(const std::string& path,
+                                              leveldb::SequentialFile** file) {
+  const leveldb::Status status = target()->NewSequentialFile(path, file);
+  if (!isLog(path)) return status;
+  fail(status);
+  if (status.ok()) *file = new RecoveredLog(this, *file);
+  return status;
+}
 
 leveldb::Status IndexFiles::NewWritableFile(const std::string& path, leveldb::WritableFile** file) {
   const leveldb::Status status = target()->NewWritableFile(path, file);
@@ -140,10 +169,13 @@ void IndexFiles::Schedule(void (*work)(void*), void* argument) {
 void IndexFiles::inOrder(Step step) {
   _steps.submit([this, step = std::move(step)] {
     if (!failure().ok()) return;
-    const leveldb::Status status = step();
-    platform::MutexLock lock(_mutex);
-    if (_failure.ok()) _failure = status;
+    fail(step());
   });
+}
+
+void IndexFiles::fail(const leveldb::Status& status) {
+  platform::MutexLock lock(_mutex);
+  if (_failure.ok()) _failure = status;
 }
 
 leveldb::Status IndexFiles::failure() {

@@ -38,6 +38,10 @@ class IndexFiles final : public leveldb::EnvWrapper {
   // has none to give.
   [[nodiscard]] bool start() { return _work.start(); }
 
+  // leveldb passes over a log that it cannot read when it recovers, and removes it afterwards. Here
+  // a read that fails ends everything as any other failure does, and the log stays.
+  leveldb::Status NewSequentialFile(const std::string& path,
+                                    leveldb::SequentialFile** file) override;
   leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override;
   leveldb::Status NewAppendableFile(const std::string& path, leveldb::WritableFile** file) override;
   leveldb::Status RemoveFile(const std::string& path) override;
@@ -52,6 +56,7 @@ class IndexFiles final : public leveldb::EnvWrapper {
  private:
   class Table;
   class Manifest;
+  class RecoveredLog;
   using Step = std::function<leveldb::Status()>;
 
   // What leveldb gets for a file that it writes; takes it.
@@ -60,6 +65,7 @@ class IndexFiles final : public leveldb::EnvWrapper {
   void inOrder(Step step);
   // The first failure, which stays.
   [[nodiscard]] leveldb::Status failure() TL_EXCLUDES(_mutex);
+  void fail(const leveldb::Status& status) TL_EXCLUDES(_mutex);
   // Has a complete table synced and closed; takes it. Waits while many others are not on the disk
   // yet.
   void finish(std::unique_ptr<leveldb::WritableFile> table) TL_EXCLUDES(_mutex);
