@@ -1,21 +1,39 @@
 #pragma once
 
 #include <algorithm>
+#include <atomic>
 #include <cstddef>
-#include <execution>
-#include <numeric>
+#include <system_error>
+#include <thread>
 #include <vector>
+
+#include "platform/Queue.h"
 
 namespace platform {
 
-// Runs body(0) to body(count - 1) on the pool of the platform, in no order, and returns when all
-// have ended. `body` must not throw.
+// Runs body(0) to body(count - 1) on this thread and on one for each further processor, as far as the
+// system has them to give, in no order, and returns when all have ended. `body` must not throw.
 template <typename Body>
 void concurrentApply(size_t count, const Body& body) {
-  if (count == 1) return body(size_t{0});
-  std::vector<size_t> indices(count);
-  std::iota(indices.begin(), indices.end(), size_t{0});
-  std::for_each(std::execution::par, indices.begin(), indices.end(), body);
+  std::atomic<size_t> next{0};
+  const auto work = [&] {
+    for (size_t i = next++; i < count; i = next++) body(i);
+  };
+  const size_t processors = std::max(1U, std::thread::hardware_concurrency());
+  std::vector<std::thread> helpers;
+  helpers.reserve(processors);
+  try {
+    while (helpers.size() + 1 < std::min(processors, count)) {
+      helpers.emplace_back([&work] {
+        setThreadName("tallow.apply");
+        work();
+      });
+    }
+  } catch (const std::system_error&) {
+    // Those that are there do it.
+  }
+  work();
+  for (std::thread& helper : helpers) helper.join();
 }
 
 }  // namespace platform
