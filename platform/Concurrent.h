@@ -11,8 +11,8 @@
 
 namespace platform {
 
-// Runs body(0) to body(count - 1) on this thread and on one for each further processor, as far as the
-// system has them to give, in no order, and returns when all have ended. `body` must not throw.
+// Runs body(0) to body(count - 1) on this thread and on one for each further processor, as far as
+// the system has them to give, in no order, and returns when all have ended. `body` must not throw.
 template <typename Body>
 void concurrentApply(size_t count, const Body& body) {
   std::atomic<size_t> next{0};
