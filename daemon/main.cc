@@ -10,6 +10,7 @@
 
 #include "daemon/TALDaemon.h"
 #include "daemon/TLDeviceLockMonitor.h"
+#include "platform/CrashNote.h"
 #include "platform/Files.h"
 #include "platform/Memory.h"
 #include "platform/Paths.h"
@@ -71,6 +72,7 @@ int answerCommandLine(int argc, char** argv) {
 int main(int argc, char** argv) {
   if (argc > 1) return answerCommandLine(argc, argv);
   umask(kPrivateUmask);
+  platform::CrashNote::begin();
   platform::limitMemoryArenas();
   platform::raiseDescriptorLimit();  // each class may hold a thousand table files open
   // Before any thread starts, so that all threads inherit it.

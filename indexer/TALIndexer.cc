@@ -11,6 +11,7 @@
 #include "platform/Signpost.h"
 #include "platform/StateCapture.h"
 #include "records/TLDebugServiceKeys.h"
+#include "salt/Quarantine.h"
 #include "tokenizer/TLLexemonAssetManager.h"
 
 using platform::MutexLock;
@@ -97,6 +98,11 @@ void TALIndexer::_init() {
   } else {
     std::optional<TLError> error;
     _openingError.reset();
+    if (salt::hasCrashedTwice(_path) && !setTextStoreAside(&error)) {
+      log().error("Could not set the text index aside: {}", platform::printable(error));
+      _openingError = error;
+      return;
+    }
     int64_t stored = 0;
     const std::optional<bool> empty = storeIsEmpty(&stored, &error);
     if (!empty) {
@@ -123,6 +129,18 @@ void TALIndexer::_init() {
   }
   makeVocabulary();
   log().standard("Finished initing indexer in time: {} ms", elapsedMillisSinceMonotonicTime(start));
+}
+
+// The store first: an index of an empty store is made anew, whatever happens in between, while with
+// a full store and its client states no client would send again.
+bool TALIndexer::setTextStoreAside(TLErrorOut error) {
+  const auto store = docStore();
+  if (store != nullptr && !store->resetWithError(error)) return false;
+  const auto aside = salt::setAside(_path, error);
+  if (!aside) return false;
+  log().fault("The text index has ended the process twice within an hour and is set aside as {}.",
+              *aside);
+  return true;
 }
 
 // The count of a store that cannot be read is 0, too; a walk tells.
@@ -314,6 +332,10 @@ bool TALIndexer::_resetWithError(TLErrorOut error) {
   const auto store = docStore();
   dropVocabulary();
   if (!_resetSALT(error)) return false;
+  // It holds mail, too.
+  for (const std::string& aside : salt::indexesSetAside(_path)) {
+    if (!platform::removeItem(aside, error)) return false;
+  }
   if (store == nullptr) return true;
   log().standard("Resetting docstore...");
   std::optional<TLError> failure;

@@ -153,6 +153,8 @@ class TALIndexer {
   struct Batch;
 
   void _init() TL_REQUIRES(_indexMutex);
+  // Has the class start empty, since its index is damaged.
+  bool setTextStoreAside(TLErrorOut error) TL_REQUIRES(_indexMutex);
   // Whether the store has no documents; none, with an error, where it cannot be read.
   std::optional<bool> storeIsEmpty(int64_t* stored, TLErrorOut error);
   // False when the system does not let the index be opened or made: then `_openingError` tells.

@@ -11,6 +11,7 @@
 #include "platform/Paths.h"
 #include "platform/ProcessLock.h"
 #include "salt/Inspection.h"
+#include "salt/Quarantine.h"
 
 // Looks at the text index of one protection class while no daemon runs on it:
 //
@@ -91,5 +92,10 @@ int main(int argc, char** argv) {
     if (!isInUse(*error)) return complain(error->message);
     return complain(error->message + "; stop it first", kInUse);
   }
-  return command == "dump" ? dump(*inspection) : validate(*inspection);
+  if (command == "dump") return dump(*inspection);
+  const std::string index = platform::textIndexPath(platform::dataRoot(state), protectionClass);
+  for (const std::string& aside : salt::indexesSetAside(index)) {
+    complain("an earlier index was damaged and has been set aside: " + aside);
+  }
+  return validate(*inspection);
 }

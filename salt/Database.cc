@@ -7,6 +7,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "platform/CrashNote.h"
 #include "platform/Files.h"
 
 namespace salt {
@@ -126,7 +127,8 @@ Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* file
   result.order = std::make_unique<KeyOrder>();
   result.logger = std::make_unique<LeveldbLogger>();
   result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
-  result.files = std::make_unique<IndexFiles>(files);
+  result.files = std::make_unique<IndexFiles>(path, files);
+  const platform::CrashNote note(result.files->crashNotes());
   leveldb::Options options;
   options.env = result.files.get();
   options.comparator = result.order.get();

@@ -4,6 +4,8 @@
 #include <utility>
 
 #include "platform/Assert.h"
+#include "platform/CrashNote.h"
+#include "salt/Quarantine.h"
 
 namespace salt {
 
@@ -99,8 +101,9 @@ class IndexFiles::RecoveredLog final : public leveldb::SequentialFile {
   const std::unique_ptr<leveldb::SequentialFile> _file;
 };
 
-IndexFiles::IndexFiles(leveldb::Env* files)
+IndexFiles::IndexFiles(const std::string& path, leveldb::Env* files)
     : EnvWrapper(files),
+      _crashNotes(crashNotesPath(path)),
       _logs(files),
       _steps("tallow-files"),
       _work("tallow-leveldb", platform::QueuePriority::background,
@@ -163,7 +166,10 @@ leveldb::Status IndexFiles::UnlockFile(leveldb::FileLock* lock) {
 
 void IndexFiles::Schedule(void (*work)(void*), void* argument) {
   // leveldb holds its mutex here, and the work takes it: it must not run on this thread.
-  TL_ASSERT(_work.async([work, argument] { work(argument); }));
+  TL_ASSERT(_work.async([this, work, argument] {
+    const platform::CrashNote note(_crashNotes);
+    work(argument);
+  }));
 }
 
 void IndexFiles::inOrder(Step step) {

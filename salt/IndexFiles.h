@@ -31,8 +31,12 @@ namespace salt {
 // Any thread. Outlives the database; the destructor ends both threads.
 class IndexFiles final : public leveldb::EnvWrapper {
  public:
-  // Makes and reads files with `files`, which outlives this.
-  explicit IndexFiles(leveldb::Env* files);
+  // The database is in the directory `path`. Makes and reads files with `files`, which outlives
+  // this.
+  IndexFiles(const std::string& path, leveldb::Env* files);
+
+  // Where it is noted that the process ended at work on this database (see platform::CrashNote).
+  [[nodiscard]] const std::string& crashNotes() const { return _crashNotes; }
 
   // Starts the thread that leveldb works on; before the database is opened. False when the system
   // has none to give.
@@ -70,6 +74,7 @@ class IndexFiles final : public leveldb::EnvWrapper {
   // yet.
   void finish(std::unique_ptr<leveldb::WritableFile> table) TL_EXCLUDES(_mutex);
 
+  const std::string _crashNotes;
   platform::Mutex _mutex;
   std::condition_variable_any _tableDone;
   size_t _tables TL_GUARDED_BY(_mutex) = 0;  // that are not on the disk yet

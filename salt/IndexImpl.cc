@@ -106,6 +106,7 @@ std::unique_ptr<index> index::load(Database opened, TLErrorOut error) {
     if (const auto failure = systemError(opened.status)) platform::setError(error, *failure);
     return nullptr;
   }
+  const platform::CrashNote note(opened.files->crashNotes());
   auto idx = std::make_unique<index>(std::move(opened));
   if (!idx->readRecords(error)) {
     Log.error("Loading failure: The database cannot be read.");
@@ -261,7 +262,8 @@ void index::restore(const MetricsBlock& before) {
 IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
     : idx(owner),
       options(readOptions(fillCache)),
-      _compactionsEnded(fillCache ? 0 : owner._compactionsEnded.load()) {
+      _compactionsEnded(fillCache ? 0 : owner._compactionsEnded.load()),
+      _note(owner.crashNotes()) {
   if (fillCache) {
     take(walks);
   } else {

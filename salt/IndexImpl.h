@@ -12,6 +12,7 @@
 #include <thread>
 #include <vector>
 
+#include "platform/CrashNote.h"
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
 #include "salt/Activity.h"
@@ -115,6 +116,9 @@ class index final : public Index {
       TL_EXCLUDES(_commitMutex, _metricsMutex);
 
   [[nodiscard]] Activity& scans() const { return _scans; }
+
+  // See IndexFiles.
+  [[nodiscard]] const std::string& crashNotes() const { return _database.files->crashNotes(); }
 
  private:
   using Clock = std::chrono::steady_clock;
@@ -306,6 +310,7 @@ class IndexView {
   void take(size_t walks);
 
   uint64_t _compactionsEnded;  // before; scans do not ask
+  const platform::CrashNote _note;
 };
 
 }  // namespace salt

@@ -154,7 +154,9 @@ class PlacesScan {
 
   [[nodiscard]] unsigned shards() const { return _last + 1; }
 
+  // On a thread of its own, each.
   void walk(size_t number) {
+    const platform::CrashNote note(_view.idx.crashNotes());
     FoundPlaces& found = _found[number];
     PrefixScan scan(_view, _prefix, number);
     for (unsigned shard = _next++; shard <= _last && found.complete; shard = _next++) {

@@ -95,6 +95,7 @@ void index::startMerge(uint8_t shard) {
 
 void index::runMerge(uint8_t shard) {
   platform::setThreadName("tallow-merge");
+  const platform::CrashNote note(crashNotes());
   waitForMore();
   mergeInto(shard);
   platform::MutexLock lock(_paceMutex);

@@ -13,6 +13,7 @@
 #include "platform/Files.h"
 #include "platform/Paths.h"
 #include "platform/ProcessLock.h"
+#include "salt/Quarantine.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -105,6 +106,31 @@ TEST_F(InspectTest, DumpsWhatTheIndexDumpsAndChangesNothing) {
   EXPECT_EQ(run("validate"), 0) << errors;
   EXPECT_EQ(errors, "");
   EXPECT_EQ(files(), before);
+}
+
+TEST_F(InspectTest, ValidateTellsOfTheLatestIndexThatWasSetAside) {
+  makeIndex({kFirst, kSecond});
+  EXPECT_EQ(run("validate"), 0);
+  EXPECT_EQ(errors, "");
+  ASSERT_TRUE(salt::setAside(index, nullptr));
+  makeIndex({kFirst, kSecond});
+  const auto second = salt::setAside(index, nullptr);
+  ASSERT_TRUE(second);
+  makeIndex({kFirst, kSecond});
+  EXPECT_EQ(salt::indexesSetAside(index), std::vector{*second});
+  EXPECT_EQ(run("validate"), 0);
+  EXPECT_THAT(errors, HasSubstr("has been set aside: " + *second + "\n"));
+}
+
+TEST_F(InspectTest, TwoCrashesOfOneHourAreOneTooMany) {
+  const std::pair<std::string, bool> cases[] = {
+      {"", false},           {"10\n", false},           {"10\n3609\n", true},
+      {"10\n3610\n", false}, {"10\n20\n5000\n", false}, {"10\nrubbish\n\n20", true},
+  };
+  for (const auto& [notes, twice] : cases) {
+    ASSERT_TRUE(platform::writeFileAtomically(salt::crashNotesPath(index), notes, nullptr));
+    EXPECT_EQ(salt::hasCrashedTwice(index), twice) << notes;
+  }
 }
 
 TEST_F(InspectTest, AReaderThatGoesAwayEndsTheDump) {

@@ -9,6 +9,7 @@
 
 #include "client/DebugServiceProxy.h"
 #include "platform/Files.h"
+#include "salt/Quarantine.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
 #include "tests/salt/SaltSupport.h"
@@ -101,7 +102,7 @@ TEST_F(BadIndexTest, DamageOfOneClassLeavesTheOtherAlone) {
   }
 }
 
-TEST_F(BadIndexTest, WhatEndsTheProcessLeavesTheOtherClassSoundForTheNext) {
+TEST_F(BadIndexTest, WhatEndsTheProcessTwiceIsSetAsideAndTheOtherClassStays) {
   const std::string page("\x02", 1);
   const struct {
     std::function<void()> damage;
@@ -121,20 +122,37 @@ TEST_F(BadIndexTest, WhatEndsTheProcessLeavesTheOtherClassSoundForTheNext) {
   for (const auto& c : cases) {
     restore();
     c.damage();
-    {
+    for (int start = 0; start < 2; ++start) {
       DaemonProcess daemon(directory.path());
       client::SearchServiceProxy service(daemon.runtimeDirectory());
       EXPECT_EQ(search(service, "a", "good"), 10);
-      EXPECT_TRUE(service.indexItems(mails("b", 1), "test", "good", nullptr));
       EXPECT_NE(search(service, "a", "bad"), 0);
       EXPECT_EQ(daemon.wait(), 128 + SIGABRT);
       EXPECT_NE(daemon.log().find(c.line), std::string::npos) << c.line;
+      EXPECT_TRUE(salt::indexesSetAside(index).empty());
     }
     DaemonProcess daemon(directory.path());
     client::SearchServiceProxy service(daemon.runtimeDirectory());
-    EXPECT_EQ(search(service, "word", "good"), 11) << c.line;
+    EXPECT_EQ(search(service, "a", "bad"), 0);
+    EXPECT_TRUE(daemon.waitForLog("The text index has ended the process twice within an hour"));
+    EXPECT_EQ(salt::indexesSetAside(index).size(), 1u);
+    EXPECT_EQ(search(service, "a", "good"), 10);
+    EXPECT_TRUE(service.indexItems(mails("b", 2), "test", "bad", nullptr));
+    EXPECT_EQ(search(service, "word", "bad"), 2);
     end(daemon);
+    EXPECT_FALSE(fs::exists(salt::crashNotesPath(index)));
   }
+}
+
+TEST_F(BadIndexTest, KillsAreNoSignOfDamage) {
+  for (int start = 0; start < 3; ++start) {
+    DaemonProcess daemon(directory.path());
+    client::SearchServiceProxy service(daemon.runtimeDirectory());
+    EXPECT_EQ(search(service, "a", "bad"), 10);
+    daemon.signal(SIGKILL);
+    daemon.wait();
+  }
+  EXPECT_TRUE(salt::indexesSetAside(index).empty());
 }
 
 // The disk is full for files above a limit that the merge passes and nothing else does.
