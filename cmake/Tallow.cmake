@@ -15,7 +15,7 @@ target_include_directories(tallow_flags INTERFACE ${CMAKE_SOURCE_DIR})
 target_compile_options(
   tallow_flags INTERFACE -Wall -Wextra -Wpedantic -Wshadow -Werror)
 if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
-  target_compile_options(tallow_flags INTERFACE -Wthread-safety)
+  target_compile_options(tallow_flags INTERFACE -Wthread-safety -Wthread-safety-beta)
 endif()
 if(TALLOW_SANITIZE)
   target_compile_options(tallow_flags INTERFACE -fsanitize=${TALLOW_SANITIZE} -fno-omit-frame-pointer
@@ -34,9 +34,6 @@ function(tallow_library name)
   add_library(${name} STATIC ${ARG_SOURCES})
   target_link_libraries(${name} PUBLIC tallow_flags ${ARG_DEPS})
   target_compile_options(${name} PRIVATE -Wconversion -Wno-sign-conversion)
-  if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
-    target_compile_options(${name} PRIVATE -Wthread-safety-beta)
-  endif()
 endfunction()
 
 function(tallow_program name)

@@ -7,8 +7,6 @@
 
 namespace {
 
-// 256 MiB, some 700,000 mails; what lies beyond is read by calls.
-
 constexpr const char* kErrorDomain = "DocStore";
 constexpr int kNoConnection = 1001;
 

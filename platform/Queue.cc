@@ -90,8 +90,8 @@ void SerialQueue::endItem() {
   {
     MutexLock lock(_mutex);
     _busy = false;
-    if (_entries.empty()) return;
   }
+  // Also with nothing queued: the thread counts its idle time from here.
   _changed.notify_all();
 }
 

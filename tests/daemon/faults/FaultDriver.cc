@@ -44,6 +44,8 @@ constexpr int kBefore = 60;  // mails that are there before the daemon under tes
 constexpr int kBatches = 6;
 constexpr int kMailsInBatch = 25;
 constexpr int kPlaces = 50;  // of each call
+constexpr int kOtherClasses =
+    10;  // opened with each batch, where that is needed to reach all places
 constexpr std::chrono::seconds kPatience{60};
 constexpr std::chrono::seconds kLongPatience{600};
 
@@ -63,10 +65,15 @@ const std::map<const char*, std::vector<int>>& errorsOfCalls() {
   return rows;
 }
 
+// Made as a class or a connection comes and goes, and seldom otherwise.
+const std::set<std::string_view> kCallsOfOpening{"rename", "unlink",    "mmap", "accept4",
+                                                 "clone3", "ftruncate", "fsync"};
+
 struct Trial {
   std::string call;
   int at;              // counted from 1
   std::string action;  // an errno, or "kill"
+  [[nodiscard]] bool wantsClasses() const { return kCallsOfOpening.contains(call); }
   [[nodiscard]] std::string text() const { return fmt::format("{} {} {}", call, at, action); }
 };
 
@@ -144,6 +151,10 @@ std::string nameOf(int batch, int mail) {
   return fmt::format("b{}x{}", batch, mail);
 }
 
+std::string className(int number) {
+  return fmt::format("class{}", number);
+}
+
 // What the daemon has acknowledged, and what it may or may not have done.
 class Ledger {
  public:
@@ -167,6 +178,29 @@ class Ledger {
     if (done) _state = batch;
     if (!done) _statesTried.insert(batch);
     return done;
+  }
+
+  // Sends a mail to each of some more classes, over a connection of its own.
+  void openClasses(const std::string& runtimeDirectory) {
+    for (int i = 0; i < kOtherClasses; ++i) {
+      SearchServiceProxy service(runtimeDirectory);
+      const int number = _classesTried++;
+      std::optional<TLError> error;
+      if (service.indexItems(testsupport::mails("m", 1), kClient, className(number), &error)) {
+        _classes.insert(number);
+      }
+    }
+  }
+
+  // What of these is wrong after a restart, or empty.
+  [[nodiscard]] std::string checkClasses(SearchServiceProxy& service) const {
+    for (const int number : _classes) {
+      std::optional<TLError> error;
+      const auto identifiers = found(service, &error, className(number));
+      if (!identifiers) return "no search in another class: " + platform::printable(error);
+      if (identifiers->size() != 1) return className(number) + " has lost its mail";
+    }
+    return "";
   }
 
   // The first thing wrong with what a search has found, or empty.
@@ -202,12 +236,14 @@ class Ledger {
   std::set<std::string> _present, _maybePresent, _deleted, _maybeDeleted;
   int _state = -1;
   std::set<int> _statesTried;
+  int _classesTried = 0;
+  std::set<int> _classes;  // whose mail was acknowledged
 };
 
 struct Tally {
   int runs = 0;
-  int notReached = 0;
-  int ended = 0;  // by the daemon, in order
+  std::map<std::string, int> notReached;  // by call
+  int ended = 0;                          // by the daemon, in order
   int killed = 0;
   int errors = 0;  // calls that were answered with one
 };
@@ -238,6 +274,7 @@ std::string work(DaemonProcess& daemon, const Trial& trial, Ledger& ledger, Tall
       if (const auto identifiers = found(service, &error)) {
         if (std::string fault = ledger.check(*identifiers); !fault.empty()) return fault;
       }
+      if (trial.wantsClasses()) ledger.openClasses(daemon.runtimeDirectory());
       if (batch == kBatches / 2) debug.forceVacuumAndCompact(kClass, &error);
     }
     daemon.signal(SIGTERM);
@@ -265,6 +302,7 @@ std::string checkAfterRestart(const std::string& directory, Ledger& ledger) {
     }
     const auto state = service.fetchLastClientState(kClient, kClass, &error);
     if (std::string fault = ledger.checkState(state, *identifiers); !fault.empty()) return fault;
+    if (std::string fault = ledger.checkClasses(service); !fault.empty()) return fault;
     for (int batch = 0; batch < kBatches; ++batch) {
       if (!service.indexItems(testsupport::mails(fmt::format("b{}x", batch), kMailsInBatch),
                               kClient, kClass, &error)) {
@@ -309,7 +347,7 @@ std::string run(const Trial& trial, const std::string& pattern, const std::strin
     Watchdog watchdog(daemon->pid());
     fault = work(*daemon, trial, ledger, tally);
     if (!watchdog.end()) fault = "the daemon hung";
-    if (!fs::exists(mark)) ++tally.notReached;
+    if (!fs::exists(mark)) ++tally.notReached[trial.call];
     if (!fault.empty()) {
       fmt::print(stderr, "{}\n", daemon->log().substr(0, 20000));
       return fault;
@@ -338,9 +376,13 @@ int runFaults(int runs, uint32_t seed) {
     _exit(1);
   }
   const std::chrono::duration<double> seconds = std::chrono::steady_clock::now() - start;
+  std::string notReached;
+  for (const auto& [call, count] : tally.notReached)
+    notReached += fmt::format(" {}:{}", call, count);
   fmt::print(
-      "runs={} not_reached={} ended_in_order={} killed={} failed_calls={} seed={} seconds={:.1f}\n",
-      tally.runs, tally.notReached, tally.ended, tally.killed, tally.errors, seed, seconds.count());
+      "runs={} not_reached={{{}}} ended_in_order={} killed={} failed_calls={} seed={} "
+      "seconds={:.1f}\n",
+      tally.runs, notReached, tally.ended, tally.killed, tally.errors, seed, seconds.count());
   return 0;
 }
 
@@ -349,10 +391,6 @@ int runFaults(int runs, uint32_t seed) {
 constexpr int kClasses = 500;
 constexpr int kConnections = 100;
 constexpr int kMailsInClass = 5;
-
-std::string className(int number) {
-  return fmt::format("class{}", number);
-}
 
 // Open connections that do nothing.
 std::vector<std::unique_ptr<client::DebugServiceProxy>> connectMany(const std::string& directory) {
