@@ -81,10 +81,9 @@ std::shared_ptr<TALDocStore> TALIndexer::docStore() const {
   return _docStore;
 }
 
-void TALIndexer::setTextStore(std::unique_ptr<salt::Index> index) {
+void TALIndexer::closeTextStore() {
   _docDates.forgetAll();  // another index, other numbers
-  MutexLock lock(_textStoreMutex);
-  _textStore = std::move(index);
+  _text.close();
 }
 
 // Each step makes only what is missing, so that after a reset the zone manager, tokenizer, synonyms
@@ -127,7 +126,6 @@ void TALIndexer::_init() {
     }
     if (!openTextStore(stored)) return;
   }
-  makeVocabulary();
   log().standard("Finished initing indexer in time: {} ms", elapsedMillisSinceMonotonicTime(start));
 }
 
@@ -162,12 +160,21 @@ std::optional<bool> TALIndexer::storeIsEmpty(int64_t* stored, TLErrorOut error) 
 
 bool TALIndexer::openTextStore(int64_t storedDocuments) {
   std::optional<TLError> error;
-  loadTextStore(&error);
-  if (_textStore == nullptr && !error) createTextStore(storedDocuments, &error);
+  log().standard("Loading textstore...");
+  closeTextStore();
+  std::unique_ptr<salt::Index> index = loadTextStore(&error);
+  if (index == nullptr && !error) index = createTextStore(storedDocuments, &error);
   if (error) {
     log().error("Could not open the text index: {}", platform::printable(error));
     _openingError = error;
   }
+  if (index == nullptr) return !error;
+  auto text = std::make_unique<OpenText>(std::move(index));
+  if (const auto store = docStore()) {
+    text->vocab = std::make_shared<TALTopKVocab>(store, text->index.get());
+  }
+  text->spelling = std::make_unique<TALSpellCorrection>(text->vocab);
+  _text.open(std::move(text));
   return !error;
 }
 
@@ -195,23 +202,22 @@ void TALIndexer::makeQueryObjects() {
   }
 }
 
-void TALIndexer::loadTextStore(TLErrorOut error) {
-  log().standard("Loading textstore...");
+std::unique_ptr<salt::Index> TALIndexer::loadTextStore(TLErrorOut error) {
   const uint64_t start = platform::monotonicTicks();
-  setTextStore(nullptr);
-  setTextStore(std::unique_ptr<salt::Index>(salt::LoadIndex(_path, error)));
-  if (_textStore == nullptr) return;
+  std::unique_ptr<salt::Index> index(salt::LoadIndex(_path, error));
+  if (index == nullptr) return nullptr;
   log().standard("Loaded textstore from path: {} in time: {} ms", _path,
                  elapsedMillisSinceMonotonicTime(start));
   if (!_shouldRunValidation) {
     log().standard("Validation disabled, skipping...");
-    return;
+    return index;
   }
   log().standard("Running validation...");
   _scheduleWork(
       "validateOnLoad",
       [this]() -> std::optional<TLError> {
-        _validated = _textStore->Validate();
+        const auto text = _text.get();
+        _validated = text != nullptr && text->index->Validate();
         if (_validated) {
           log().standard("Index passed validation");
         } else {
@@ -220,18 +226,20 @@ void TALIndexer::loadTextStore(TLErrorOut error) {
         return std::nullopt;
       },
       nullptr);
+  return index;
 }
 
 // A text index made from nothing empties the document store, so that the two never differ in what
 // they know of.
-void TALIndexer::createTextStore(int64_t storedDocuments, TLErrorOut error) {
+std::unique_ptr<salt::Index> TALIndexer::createTextStore(int64_t storedDocuments,
+                                                         TLErrorOut error) {
   log().standard("Could not find path, creating new textstore at path {}", _path);
   uint64_t start = platform::monotonicTicks();
-  setTextStore(std::unique_ptr<salt::Index>(salt::NewIndex(newIndexOptions(_path), error)));
-  if (_textStore == nullptr) return;
+  std::unique_ptr<salt::Index> index(salt::NewIndex(newIndexOptions(_path), error));
+  if (index == nullptr) return nullptr;
   log().standard("Created new textstore at path: {} in time: {} ms", _path,
                  elapsedMillisSinceMonotonicTime(start));
-  if (docStore() == nullptr) return;
+  if (docStore() == nullptr) return index;
   log().standard("Resetting docstore after creating a new textstore...");
   start = platform::monotonicTicks();
   std::optional<TLError> failure;
@@ -241,28 +249,7 @@ void TALIndexer::createTextStore(int64_t storedDocuments, TLErrorOut error) {
   } else {
     log().error("Error resetting docstore: {}", platform::printable(failure));
   }
-}
-
-void TALIndexer::makeVocabulary() {
-  const auto store = docStore();
-  MutexLock lock(_textStoreMutex);
-  if (_textStore == nullptr) return;
-  if (_topKVocab == nullptr && store != nullptr) {
-    _topKVocab = std::make_shared<TALTopKVocab>(store, _textStore.get());
-  }
-  if (_spellCorrection == nullptr) {
-    _spellCorrection = std::make_unique<TALSpellCorrection>(_topKVocab);
-  }
-}
-
-void TALIndexer::dropVocabulary() {
-  std::shared_ptr<TALTopKVocab> vocab;
-  {
-    MutexLock lock(_textStoreMutex);
-    _spellCorrection.reset();
-    vocab = std::exchange(_topKVocab, nullptr);
-  }
-  if (vocab != nullptr) vocab->shutdown();
+  return index;
 }
 
 std::string TALIndexer::clientStateKey(const TLString& name) {
@@ -299,7 +286,7 @@ std::optional<TLError> TALIndexer::runWork(const Task& task) {
   {
     MutexLock lock(_indexMutex);
     if (_shutdown) return _errorWithCode(TALIndexerError::shuttingDown, "shutting down", nullptr);
-    if (_textStore == nullptr && _openingError) _init();
+    if (_text.get() == nullptr && _openingError) _init();
     if (_openingError) return _openingError;
   }
   try {
@@ -330,7 +317,6 @@ void TALIndexer::resetWithCompletionHandler(Completion completionHandler) {
 
 bool TALIndexer::_resetWithError(TLErrorOut error) {
   const auto store = docStore();
-  dropVocabulary();
   if (!_resetSALT(error)) return false;
   // It holds mail, too.
   for (const std::string& aside : salt::indexesSetAside(_path)) {
@@ -356,7 +342,7 @@ bool TALIndexer::_resetSALT(TLErrorOut error) {
     platform::setError(error, *failure);
     return false;
   }
-  setTextStore(nullptr);
+  closeTextStore();
   for (const std::string& name : *names) {
     const std::string file = platform::joinPath(_path, name);
     log().standard("Removing file {}", file);
@@ -373,10 +359,9 @@ void TALIndexer::saltVacuumAndCompactWithCompletionHandler(Completion completion
   _scheduleWork(
       "saltVacuum",
       [this]() -> std::optional<TLError> {
-        // On the queue the index cannot be replaced, so neither mutex is needed.
-        if (_textStore != nullptr) {
-          _textStore->Vacuum();
-          if (!_textStore->Compact()) {
+        if (const auto text = _text.get()) {
+          text->index->Vacuum();
+          if (!text->index->Compact()) {
             return platform::posixError(ENOSPC, "the disk lacks the room for a compaction");
           }
         }
@@ -386,13 +371,13 @@ void TALIndexer::saltVacuumAndCompactWithCompletionHandler(Completion completion
 }
 
 std::shared_ptr<TALTopKVocab> TALIndexer::topKVocab() {
-  MutexLock lock(_textStoreMutex);
-  return _topKVocab;
+  const auto text = _text.get();
+  return text == nullptr ? nullptr : text->vocab;
 }
 
 void TALIndexer::checkVocabulary() {
-  if (_topKVocab != nullptr) {
-    _topKVocab->checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
+  if (const auto vocab = topKVocab()) {
+    vocab->checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   }
 }
 
@@ -442,12 +427,9 @@ nlohmann::json TALIndexer::docStats() {
   const auto store = docStore();
   if (store == nullptr) return nullptr;
   const int64_t documents = store->count(nullptr);
-  salt::Index::Metrics m;
-  {
-    MutexLock lock(_indexMutex);
-    if (_textStore == nullptr) return nullptr;
-    m = _textStore->GetMetrics();
-  }
+  const auto text = _text.get();
+  if (text == nullptr) return nullptr;
+  const salt::Index::Metrics m = text->index->GetMetrics();
   return {
       {TLDebugServiceDocStoreNumOfItems, documents},
       {TLDebugServiceTextStoreNumOfItems, m.Docs},
@@ -472,13 +454,8 @@ nlohmann::json TALIndexer::docStats() {
 }
 
 std::string TALIndexer::saltMetrics() {
-  MutexLock lock(_textStoreMutex);
-  return _textStore == nullptr ? std::string() : std::string(_textStore->GetMetrics());
-}
-
-void TALIndexer::close() {
-  dropVocabulary();
-  setTextStore(nullptr);
+  const auto text = _text.get();
+  return text == nullptr ? std::string() : std::string(text->index->GetMetrics());
 }
 
 void TALIndexer::shutdown() {
@@ -487,15 +464,12 @@ void TALIndexer::shutdown() {
     MutexLock lock(_indexMutex);
     _shutdown = true;
   }
-  {
-    MutexLock lock(_textStoreMutex);
-    if (_textStore != nullptr) _textStore->Interrupt();
-  }
+  if (const auto text = _text.get()) text->index->Interrupt();
   _queue.drain();
   std::shared_ptr<TALDocStore> store;
   {
     MutexLock lock(_indexMutex);
-    close();
+    closeTextStore();
     MutexLock storeLock(_docStoreMutex);
     store = std::exchange(_docStore, nullptr);
   }

@@ -10,11 +10,10 @@
 
 #include "docstore/TALDocStore.h"
 #include "indexer/DocDates.h"
+#include "indexer/OpenText.h"
 #include "indexer/TALZoneManager.h"
-#include "modification/TALSpellCorrection.h"
 #include "modification/TALStemRewrite.h"
 #include "modification/TALSynonyms.h"
-#include "modification/TALTopKVocab.h"
 #include "platform/Log.h"
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
@@ -45,11 +44,9 @@ enum class TALIndexerError {
 // the client state run on the caller's thread.
 //
 // Invariants.
-// 1. `_textStore`, and `_topKVocab` and `_spellCorrection` which read it, are replaced or deleted
-// only
-//    by who holds both `_indexMutex` and `_textStoreMutex`, so holding either keeps them. Only work
-//    on `_queue` and the end of a shutdown do so. The vocabulary is shut down before the index
-//    goes.
+// 1. The text index is opened and closed with `_indexMutex` held, by work on `_queue` and at the
+// end
+//    of a shutdown. Who reads it takes a reference from `_text`, which keeps it open.
 // 2. A search holds `_indexMutex` for one pass, a batch for all its documents: they never overlap.
 //    What changes the words of a query between two passes reads the index beside batches.
 // 3. The document store is written before the text index. What a search finds in the index and not
@@ -159,17 +156,15 @@ class TALIndexer {
   std::optional<bool> storeIsEmpty(int64_t* stored, TLErrorOut error);
   // False when the system does not let the index be opened or made: then `_openingError` tells.
   bool openTextStore(int64_t storedDocuments) TL_REQUIRES(_indexMutex);
-  void loadTextStore(TLErrorOut error) TL_REQUIRES(_indexMutex);
-  void createTextStore(int64_t storedDocuments, TLErrorOut error) TL_REQUIRES(_indexMutex);
+  std::unique_ptr<salt::Index> loadTextStore(TLErrorOut error) TL_REQUIRES(_indexMutex);
+  std::unique_ptr<salt::Index> createTextStore(int64_t storedDocuments, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
   void makeQueryObjects();
-  void setTextStore(std::unique_ptr<salt::Index> index) TL_REQUIRES(_indexMutex);
-  void makeVocabulary() TL_REQUIRES(_indexMutex);
-  // Waits for a rebuild that runs.
-  void dropVocabulary() TL_REQUIRES(_indexMutex);
+  // Waits for all who read the index, a count of the vocabulary included.
+  void closeTextStore() TL_REQUIRES(_indexMutex);
   std::shared_ptr<TALTopKVocab> topKVocab();
   // For work on the queue: starts a rebuild of the vocabulary if enough documents have come.
   void checkVocabulary();
-  void close() TL_REQUIRES(_indexMutex);
 
   void _scheduleWork(std::string name, Task task, Completion completionHandler);
   std::optional<TLError> runWork(const Task& task);
@@ -190,10 +185,10 @@ class TALIndexer {
   void mergeDocs(const Items& docs, Batch& batch);
   bool storeDocs(Batch& batch, TLErrorOut error) TL_REQUIRES(_indexMutex);
   bool writeDocs(Batch& batch, TLErrorOut error);
-  bool indexDocs(const std::string& bundleID, Batch& batch, uint64_t batchStart, TLErrorOut error)
-      TL_REQUIRES(_indexMutex);
-  bool _indexDoc(const TLIndexableItem& doc, uint32_t docID, uint64_t* docParsingTime)
-      TL_REQUIRES(_indexMutex);
+  bool indexDocs(const OpenText& text, const std::string& bundleID, Batch& batch,
+                 uint64_t batchStart, TLErrorOut error) TL_REQUIRES(_indexMutex);
+  bool _indexDoc(salt::Index& index, const TLIndexableItem& doc, uint32_t docID,
+                 uint64_t* docParsingTime) TL_REQUIRES(_indexMutex);
   std::optional<TLError> addAndStoreState(const Items& docs,
                                           const std::optional<std::string>& clientState,
                                           const TLString& clientStateName,
@@ -236,15 +231,12 @@ class TALIndexer {
   bool _modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
                          std::vector<saltsearch::Term>& modifiedQueryTerms,
                          const TLParameters& searchParams);
-  bool modifyWithSpelling(const std::vector<saltsearch::Term>& queryTerms,
-                          std::vector<saltsearch::Term>& modifiedQueryTerms)
-      TL_REQUIRES(_textStoreMutex);
-  bool modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms,
-                          std::vector<saltsearch::Term>& modifiedQueryTerms)
-      TL_REQUIRES(_textStoreMutex);
-  bool modifyWithStems(const std::vector<saltsearch::Term>& queryTerms,
-                       std::vector<saltsearch::Term>& modifiedQueryTerms)
-      TL_REQUIRES(_textStoreMutex);
+  bool modifyWithSpelling(const std::vector<saltsearch::Term>& queryTerms, const OpenText& text,
+                          std::vector<saltsearch::Term>& modifiedQueryTerms);
+  bool modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms, const OpenText& text,
+                          std::vector<saltsearch::Term>& modifiedQueryTerms);
+  static bool modifyWithStems(const std::vector<saltsearch::Term>& queryTerms, const OpenText& text,
+                              std::vector<saltsearch::Term>& modifiedQueryTerms);
   static void logRanking(const TLQuery& query, const Found& found);
 
   const std::string _path;
@@ -256,12 +248,7 @@ class TALIndexer {
 
   // Fair: a search that waits for a batch does not wait for those behind it.
   platform::FairMutex _indexMutex;
-  // Held for as long as one reads `_textStore` without `_indexMutex`; taken after it.
-  platform::Mutex _textStoreMutex;
-  std::unique_ptr<salt::Index> _textStore;  // see invariant 1, for this and the next two
-  std::shared_ptr<TALTopKVocab> _topKVocab;
-  std::unique_ptr<TALSpellCorrection> _spellCorrection;
-  TALStemRewrite _stemRewrite TL_GUARDED_BY(_textStoreMutex);
+  OpenTextHolder _text;  // self-synchronised; see invariant 1
   DocDates _docDates TL_GUARDED_BY(_indexMutex);
   std::optional<TLError> _openingError TL_GUARDED_BY(_indexMutex);
   bool _shutdown TL_GUARDED_BY(_indexMutex) = false;

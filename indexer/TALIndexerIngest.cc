@@ -120,7 +120,7 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
   }
   if (clientState) {
     // A client goes on from its state, so that all before it must survive a loss of power.
-    if (_textStore != nullptr && !_textStore->Sync()) {
+    if (const auto text = _text.get(); text != nullptr && !text->index->Sync()) {
       return platform::posixError(EIO, "the text index cannot be written to the disk");
     }
     log().standard("storing client state name: {} (length {})", platform::toUTF8(clientStateName),
@@ -132,7 +132,7 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
 
 // Searches go on meanwhile.
 void TALIndexer::holdBack() {
-  if (_textStore != nullptr) _textStore->WaitWhileTidying();
+  if (const auto text = _text.get()) text->index->WaitWhileTidying();
 }
 
 bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error) {
@@ -142,7 +142,8 @@ bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErro
     log().error("bundleID not set");
     return true;
   }
-  if (_shutdown || _textStore == nullptr || docStore() == nullptr) {
+  const auto text = _text.get();
+  if (_shutdown || text == nullptr || docStore() == nullptr) {
     platform::setError(error, noIndexError());
     return false;
   }
@@ -153,7 +154,7 @@ bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErro
   if (!fetchOldDocs(batch, error)) return false;
   mergeDocs(docs, batch);
   if (!storeDocs(batch, error)) return false;
-  return indexDocs(bundleID, batch, start, error);
+  return indexDocs(*text, bundleID, batch, start, error);
 }
 
 bool TALIndexer::makeDocURLs(const Items& docs, const std::string& bundleID, Batch& batch,
@@ -259,8 +260,8 @@ bool TALIndexer::writeDocs(Batch& batch, TLErrorOut error) {
   return true;
 }
 
-bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t batchStart,
-                           TLErrorOut error) {
+bool TALIndexer::indexDocs(const OpenText& text, const std::string& bundleID, Batch& batch,
+                           uint64_t batchStart, TLErrorOut error) {
   const uint64_t start = platform::monotonicTicks();
   uint64_t textStoreMillis = 0;
   int indexed = 0;
@@ -280,7 +281,7 @@ bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t b
       continue;
     }
     uint64_t docParsingTime = 0;
-    if (!_indexDoc(*merged->second, docID->second, &docParsingTime)) {
+    if (!_indexDoc(*text.index, *merged->second, docID->second, &docParsingTime)) {
       log().error("Failed to index document in salt {}", describe(*merged->second, bundleID, url));
       const TLError failure = _errorWithCode(TALIndexerError::document, "index failed", error);
       log().error(
@@ -289,8 +290,8 @@ bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t b
           platform::printable(failure));
       return false;
     }
-    if (_topKVocab != nullptr && _topKVocab->maxDocID() < docID->second) {
-      _topKVocab->setMaxDocID(docID->second);
+    if (text.vocab != nullptr && text.vocab->maxDocID() < docID->second) {
+      text.vocab->setMaxDocID(docID->second);
     }
     batch.mergedDocs.erase(merged);
     textStoreMillis += docParsingTime;
@@ -302,14 +303,15 @@ bool TALIndexer::indexDocs(const std::string& bundleID, Batch& batch, uint64_t b
   return true;
 }
 
-bool TALIndexer::_indexDoc(const TLIndexableItem& doc, uint32_t docID, uint64_t* docParsingTime) {
+bool TALIndexer::_indexDoc(salt::Index& index, const TLIndexableItem& doc, uint32_t docID,
+                           uint64_t* docParsingTime) {
   zone::Zones zones;
   populateZones(zones, doc, _zoneManager, tk.get());
   const uint64_t start = platform::monotonicTicks();
   for (auto& [zoneID, zone] : zones) {
     if (zone.text.empty() || zone.offsets.empty()) continue;
     // The offsets may be changed by the call; this is their last use.
-    if (!_textStore->AddZone(docID, zoneID, zone.text, zone.offsets, true)) return false;
+    if (!index.AddZone(docID, zoneID, zone.text, zone.offsets, true)) return false;
   }
   *docParsingTime = elapsedMillisSinceMonotonicTime(start);
   return true;
@@ -351,8 +353,9 @@ bool TALIndexer::_deleteItemsByIdentifiers(const Strings& identifiers, const std
     } else {
       MutexLock lock(_indexMutex);
       _docDates.forget(docID);
-      if (docStore()->deleteDocument(docID, &failure) && _textStore != nullptr) {
-        _textStore->DeleteDoc(docID);
+      const auto text = _text.get();
+      if (docStore()->deleteDocument(docID, &failure) && text != nullptr) {
+        text->index->DeleteDoc(docID);
       }
       if (failure) {
         log().error("Failed to delete document with ID {} in docstore: {}", docID,
@@ -388,7 +391,7 @@ void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
 }
 
 bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error) {
-  salt::Index* index = _textStore.get();
+  const auto text = _text.get();
   DocDates* const dates = &_docDates;
   const auto store = docStore();
   return store->enumerateDocIDs(
@@ -398,7 +401,7 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorO
         std::optional<TLError> failure;
         dates->forget(docID);
         if (store->deleteDocument(docID, &failure)) {
-          if (index != nullptr) index->DeleteDoc(docID);
+          if (text != nullptr) text->index->DeleteDoc(docID);
           return;
         }
         log().error("Failed to delete document with doc ID {} in docstore: {}", docID,

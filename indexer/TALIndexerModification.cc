@@ -38,30 +38,30 @@ TALIndexer::Found TALIndexer::searchModified(const TLQuery& query,
   return found;
 }
 
-// The modifiers read the text index beside ingest; the mutex only keeps the index from being
-// closed, and one caller at a time with them.
+// The modifiers read the text index beside ingest.
 bool TALIndexer::_modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
                                    std::vector<saltsearch::Term>& modifiedQueryTerms,
                                    const TLParameters& searchParams) {
-  MutexLock lock(_textStoreMutex);
-  if (_textStore == nullptr) return false;
+  const auto text = _text.get();
+  if (text == nullptr) return false;
   if (searchParams.boolValueForKey("queryModification.enableSpellModification") &&
-      _spellCorrection != nullptr && modifyWithSpelling(queryTerms, modifiedQueryTerms)) {
+      modifyWithSpelling(queryTerms, *text, modifiedQueryTerms)) {
     return true;
   }
   if (searchParams.boolValueForKey("queryModification.enableSynonymModification") &&
-      modifyWithSynonyms(queryTerms, modifiedQueryTerms)) {
+      modifyWithSynonyms(queryTerms, *text, modifiedQueryTerms)) {
     return true;
   }
   return searchParams.boolValueForKey("queryModification.enableStemModification") &&
-         modifyWithStems(queryTerms, modifiedQueryTerms);
+         modifyWithStems(queryTerms, *text, modifiedQueryTerms);
 }
 
 bool TALIndexer::modifyWithSpelling(const std::vector<saltsearch::Term>& queryTerms,
+                                    const OpenText& text,
                                     std::vector<saltsearch::Term>& modifiedQueryTerms) {
   log().standard("Spelling correction started.");
   std::vector<saltsearch::Term> corrected;
-  const float score = _spellCorrection->correctSpelling(queryTerms, corrected, *_textStore);
+  const float score = text.spelling->correctSpelling(queryTerms, corrected, *text.index);
   if (score > 0.0F && !corrected.empty()) {
     modifiedQueryTerms = std::move(corrected);
     log().standard(
@@ -75,10 +75,11 @@ bool TALIndexer::modifyWithSpelling(const std::vector<saltsearch::Term>& queryTe
 }
 
 bool TALIndexer::modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms,
+                                    const OpenText& text,
                                     std::vector<saltsearch::Term>& modifiedQueryTerms) {
   log().standard("Synonyms modification started.");
   std::vector<saltsearch::Term> expanded;
-  const float score = _synonymModel.synonymExpansion(queryTerms, expanded, *_textStore);
+  const float score = _synonymModel.synonymExpansion(queryTerms, expanded, *text.index);
   if (score > 0.0F && !expanded.empty()) {
     modifiedQueryTerms = std::move(expanded);
     log().standard(
@@ -93,10 +94,11 @@ bool TALIndexer::modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTe
 }
 
 bool TALIndexer::modifyWithStems(const std::vector<saltsearch::Term>& queryTerms,
+                                 const OpenText& text,
                                  std::vector<saltsearch::Term>& modifiedQueryTerms) {
   log().standard("Stem rewrite started.");
   std::vector<saltsearch::Term> stemmed;
-  if (_stemRewrite.stemRewrite(queryTerms, stemmed, *_textStore)) {
+  if (TALStemRewrite().stemRewrite(queryTerms, stemmed, *text.index)) {
     modifiedQueryTerms = std::move(stemmed);
     log().standard("Stem rewrite finished with query modified.");
     return true;

@@ -171,7 +171,8 @@ std::vector<saltsearch::Term> TALIndexer::_populateQueryTerms(const std::vector<
 TALIndexer::Found TALIndexer::searchOnce(const TLQuery& query,
                                          std::vector<saltsearch::Term>& saltQueryTerms, size_t most,
                                          TLErrorOut error) {
-  if (_shutdown || _textStore == nullptr) {
+  const auto text = _text.get();
+  if (_shutdown || text == nullptr) {
     platform::setError(error, noIndexError());
     return {};
   }
@@ -183,7 +184,7 @@ TALIndexer::Found TALIndexer::searchOnce(const TLQuery& query,
   options.maxResults = static_cast<size_t>(params.intValueForKey("salt.maxTopK"));
   options.maxSuffixes = static_cast<size_t>(params.intValueForKey("salt.maxTermResults"));
   options.threshold = params.floatValueForKey("salt.scoreThreshold").value_or(0.0F);
-  const auto results = saltsearch::Search(*_textStore, saltQueryTerms, options);
+  const auto results = saltsearch::Search(*text->index, saltQueryTerms, options);
   Signpost::end(signpost, "Search index", "found {} items", results.size());
   log().standard("Got {} results", results.size());
   if (results.empty()) return {};
