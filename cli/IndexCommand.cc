@@ -1,7 +1,10 @@
 #include <fmt/format.h>
 
+#include <algorithm>
+#include <chrono>
 #include <nlohmann/json.hpp>
 
+#include "cli/BatchPace.h"
 #include "cli/Commands.h"
 #include "cli/IndexPipeline.h"
 #include "cli/MailWalker.h"
@@ -41,7 +44,7 @@ class Indexing {
     while (auto batch = pipeline.next()) {
       report(*batch);
       std::optional<TLError> error;
-      if (!send(batch->items, &error)) {
+      if (!sendInPieces(batch->items, &error)) {
         _progress.clear();
         const ExitStatus status = complain(error);
         printSummary();
@@ -79,9 +82,18 @@ class Indexing {
     _cut += batch.cut.size();
   }
 
-  // False only where going on makes no sense.
+  // Both are false only where going on makes no sense.
+  bool sendInPieces(std::span<const client::EncodedItem> items, TLErrorOut error) {
+    while (!items.empty()) {
+      const auto piece = items.first(std::min(_pace.items(), items.size()));
+      const auto start = std::chrono::steady_clock::now();
+      if (!send(piece, error)) return false;
+      _pace.replied(piece.size(), std::chrono::steady_clock::now() - start);
+      items = items.subspan(piece.size());
+    }
+    return true;
+  }
   bool send(std::span<const client::EncodedItem> items, TLErrorOut error) {
-    if (items.empty()) return true;
     std::optional<TLError> failure;
     if (_service.indexItems(items, _options.name, _options.protectionClass, &failure)) {
       _indexed += items.size();
@@ -131,6 +143,7 @@ class Indexing {
   const Options& _options;
   client::SearchServiceProxy _service;
   ProgressBar _progress;
+  BatchPace _pace;
   uint64_t _bytes = 0;
   uint64_t _indexed = 0;
   uint64_t _messageFailures = 0;

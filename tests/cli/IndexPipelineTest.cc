@@ -1,6 +1,7 @@
 #include <fmt/format.h>
 #include <gtest/gtest.h>
 
+#include "cli/BatchPace.h"
 #include "cli/IndexPipeline.h"
 #include "platform/Files.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -63,4 +64,22 @@ TEST(IndexPipeline, CanBeLeftInTheMiddle) {
   ASSERT_TRUE(platform::writeFileAtomically(directory / "box", mboxOf(5000, 10), nullptr));
   cli::IndexPipeline pipeline({directory / "box"});
   EXPECT_TRUE(pipeline.next().has_value());
+}
+
+TEST(BatchPaceTest, FollowsTheQuickRepliesAndForgetsTheLateOnes) {
+  using std::chrono::milliseconds;
+  cli::BatchPace pace;
+  EXPECT_EQ(pace.items(), cli::BatchPace::kFirst);
+  pace.replied(20, milliseconds(20));
+  EXPECT_EQ(pace.items(), 50u);
+  pace.replied(50, milliseconds(10000));  // a merge
+  EXPECT_EQ(pace.items(), 45u);
+  pace.replied(45, milliseconds(22));
+  EXPECT_EQ(pace.items(), 102u);
+  for (int i = 0; i < 20; ++i) pace.replied(100, milliseconds(1000));
+  EXPECT_EQ(pace.items(), 15u);  // the mails are larger now
+  for (int i = 0; i < 100; ++i) pace.replied(10, milliseconds(5000));
+  EXPECT_EQ(pace.items(), cli::BatchPace::kFewest);
+  pace.replied(5, milliseconds(0));
+  EXPECT_EQ(pace.items(), cli::BatchPace::kMost);
 }

@@ -1,0 +1,43 @@
+#pragma once
+
+#include <algorithm>
+#include <chrono>
+#include <cstddef>
+#include <optional>
+
+namespace cli {
+
+// How many items a call brings, so that the daemon has some 50 ms of work with it: a search that
+// comes meanwhile waits for that long.
+//
+// A reply may also be late because the daemon has waited for something else, a merge above all. So
+// the time of an item is taken from the quickest replies: a quicker one counts at once, a slower
+// one raises it by a tenth.
+class BatchPace {
+ public:
+  static constexpr std::chrono::milliseconds kWork{50};
+  static constexpr size_t kFirst = 20;  // before there is a reply
+  static constexpr size_t kFewest = 5;
+  static constexpr size_t kMost = 500;
+
+  [[nodiscard]] size_t items() const {
+    if (!_perItem) return kFirst;
+    return std::clamp(static_cast<size_t>(Seconds(kWork) / *_perItem), kFewest, kMost);
+  }
+
+  void replied(size_t items, std::chrono::nanoseconds took) {
+    if (items == 0) return;
+    const Seconds seen = std::max<Seconds>(Seconds(took) / static_cast<double>(items), kShortest);
+    _perItem = _perItem ? std::min(seen, *_perItem * kRise) : seen;
+  }
+
+ private:
+  using Seconds = std::chrono::duration<double>;
+
+  static constexpr double kRise = 1.1;
+  static constexpr Seconds kShortest{1e-6};
+
+  std::optional<Seconds> _perItem;
+};
+
+}  // namespace cli
