@@ -128,7 +128,12 @@ void LogSync::syncInBackground() {
     };
     while (!due() && _changed.wait_until(_mutex, deadline) != std::cv_status::timeout) {
     }
-    if (!_ending && !log->syncing) syncOnce(log);
+    if (_ending) break;
+    if (log->syncing) {
+      _changed.wait(_mutex);  // somebody else's sync ends with a notification
+    } else {
+      syncOnce(log);
+    }
   }
   _scheduled = false;
 }

@@ -3,10 +3,12 @@
 #include <algorithm>
 #include <atomic>
 #include <condition_variable>
+#include <latch>
 #include <thread>
 
 #include "platform/Mutex.h"
 #include "salt/IndexImpl.h"
+#include "salt/LogSync.h"
 #include "tests/salt/FilesBetween.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -230,4 +232,67 @@ TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   write(1);
   expectWaiting(&disk, [&write] { write(2 << 20); });
   compacting.join();
+}
+
+namespace {
+
+// Where syncs can be held up.
+class SlowSyncs final : public salttest::FilesBetween {
+ public:
+  void holdUp() { _gate = std::make_unique<Gate>(); }
+  void waitForSync() { _gate->reached.wait(); }
+  void goOn() { _gate->open.count_down(); }
+
+ private:
+  struct Gate {
+    std::latch reached{1};
+    std::latch open{1};
+    std::atomic<bool> passed{false};
+  };
+  class File final : public salttest::FileBetween {
+   public:
+    File(SlowSyncs* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
+    leveldb::Status Sync() override {
+      if (!_disk._gate->passed.exchange(true)) {
+        _disk._gate->reached.count_down();
+        _disk._gate->open.wait();
+      }
+      return FileBetween::Sync();
+    }
+
+   private:
+    SlowSyncs& _disk;
+  };
+
+  leveldb::WritableFile* between(const std::string&, leveldb::WritableFile* file) override {
+    return new File(this, file);
+  }
+
+  std::unique_ptr<Gate> _gate;
+};
+
+}  // namespace
+
+// The thread that syncs in the background once spun with the lock held that the other needed.
+TEST(SlowDisk, ASyncEndsWhileMuchMoreIsWritten) {
+  const testsupport::TemporaryDirectory directory;
+  const std::string much(size_t{2} << 20, 'x');
+  for (int round = 0; round < 10; ++round) {
+    SlowSyncs disk;
+    disk.holdUp();
+    salt::LogSync logs(&disk);
+    leveldb::WritableFile* opened = nullptr;
+    const std::string path = directory / ("log" + std::to_string(round));
+    ASSERT_TRUE(leveldb::Env::Default()->NewWritableFile(path, &opened).ok());
+    ASSERT_TRUE(logs.follow(path, std::unique_ptr<leveldb::WritableFile>(opened), &opened).ok());
+    const std::unique_ptr<leveldb::WritableFile> file(opened);
+    ASSERT_TRUE(file->Append("a").ok());
+    std::thread syncing([&file] { EXPECT_TRUE(file->Sync().ok()); });
+    disk.waitForSync();
+    ASSERT_TRUE(file->Append(much).ok());
+    ASSERT_TRUE(file->Flush().ok());
+    disk.goOn();
+    syncing.join();
+    EXPECT_TRUE(file->Sync().ok());
+  }
 }
