@@ -98,7 +98,9 @@ Index* NewIndex(const Index::Options& options) {
 }
 
 Index* LoadIndex(const std::string& path, TLErrorOut error) {
-  return index::load(openDatabase(path, OpenMode::existing), error).release();
+  auto loaded = index::load(openDatabase(path, OpenMode::existing), error);
+  if (loaded != nullptr) loaded->openPostings();
+  return loaded.release();
 }
 
 std::unique_ptr<index> index::load(Database opened, TLErrorOut error) {
@@ -120,6 +122,32 @@ std::unique_ptr<index> index::load(Database opened, TLErrorOut error) {
   platform::MutexLock lock(idx->_metricsMutex);
   idx->metrics.VacuumInProgress = false;
   return idx;
+}
+
+PostingsOwner index::postingsOwner(uint8_t shard) const {
+  platform::MutexLock lock(_metricsMutex);
+  return {metrics.CreationTime, shard};
+}
+
+void index::setPostings(uint8_t shard, std::shared_ptr<const Postings> postings) {
+  platform::MutexLock lock(_metricsMutex);
+  ShardPostings changed = *_postings;
+  if (shard >= changed.size()) changed.resize(shard + size_t{1});
+  changed[shard] = std::move(postings);
+  _postings = std::make_shared<const ShardPostings>(std::move(changed));
+}
+
+void index::openPostings() {
+  uint64_t shards = 0;
+  {
+    platform::MutexLock lock(_metricsMutex);
+    shards = std::min<uint64_t>(metrics.Shards, kMaxShardNumber);
+  }
+  for (uint8_t shard = 1; shard <= shards; ++shard) {
+    if (auto postings = Postings::open(_database.path, postingsOwner(shard))) {
+      setPostings(shard, std::move(postings));
+    }
+  }
 }
 
 bool index::metricsSound() const {
@@ -180,6 +208,7 @@ bool index::Compact() {
   const Activity::Work compaction(_housekeeping);
   const bool done = compactRange(nullptr, nullptr);
   _database.files->waitForDisk();
+  if (done) makeMissingPostings();
   return done;
 }
 
@@ -289,6 +318,7 @@ void IndexView::take(size_t walks) {
   for (auto& iterator : iterators) iterator.reset(idx.db->NewIterator(options));
   metrics = idx.metrics;
   deleted = idx._deleted;
+  postings = idx._postings;
   pageGeneration = idx._suffixesMove ? 0 : idx._pageGeneration;
 }
 

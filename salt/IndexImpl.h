@@ -21,6 +21,7 @@
 #include "salt/DocSet.h"
 #include "salt/Helper.h"
 #include "salt/Index.h"
+#include "salt/Postings.h"
 #include "salt/ScanMemory.h"
 #include "salt/SuffixStarts.h"
 
@@ -117,6 +118,10 @@ class index final : public Index {
 
   [[nodiscard]] Activity& scans() const { return _scans; }
 
+  // Opens the postings that are beside the database, once it is loaded. Without them all answers
+  // are the same.
+  void openPostings() TL_EXCLUDES(_metricsMutex);
+
   // See IndexFiles.
   [[nodiscard]] const std::string& crashNotes() const { return _database.files->crashNotes(); }
 
@@ -174,6 +179,14 @@ class index final : public Index {
   // The body of the merge thread.
   void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex, _paceMutex);
   void mergeInto(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
+  // The merge itself, with the postings of its shard; false when it did not come to the end.
+  // Without `hot` only the postings are made.
+  [[nodiscard]] bool mergePages(uint8_t shard, bool hot) TL_EXCLUDES(_commitMutex, _metricsMutex);
+  // Of an index that was merged without them, or whose files were damaged.
+  void makeMissingPostings() TL_EXCLUDES(_commitMutex, _metricsMutex);
+  void setPostings(uint8_t shard, std::shared_ptr<const Postings> postings)
+      TL_EXCLUDES(_metricsMutex);
+  [[nodiscard]] PostingsOwner postingsOwner(uint8_t shard) const TL_EXCLUDES(_metricsMutex);
   void waitForMore() TL_EXCLUDES(_metricsMutex, _paceMutex);
   // Starts a merge if it is worthwhile and none runs.
   void vacuum();
@@ -229,6 +242,12 @@ class index final : public Index {
   // Replaced as a whole by each deletion, under both mutexes, so that a view keeps the set of its
   // moment. A deletion writes the whole set anyway.
   std::shared_ptr<const DocSet> _deleted TL_GUARDED_BY(_metricsMutex);
+
+  // By shard, null where there are none; replaced as a whole. Those of a shard are taken away
+  // before its pages change.
+  using ShardPostings = std::vector<std::shared_ptr<const Postings>>;
+  std::shared_ptr<const ShardPostings> _postings TL_GUARDED_BY(_metricsMutex) =
+      std::make_shared<const ShardPostings>();
 
   // Counts what changes the pages or hides documents in them: commits of merges and deletions.
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
@@ -304,6 +323,7 @@ class IndexView {
   std::vector<std::unique_ptr<leveldb::Iterator>> iterators;  // none is null
   Index::Metrics metrics;
   std::shared_ptr<const DocSet> deleted;
+  std::shared_ptr<const std::vector<std::shared_ptr<const Postings>>> postings;  // by shard
   uint64_t pageGeneration = 0;  // 0 where it cannot be told
 
  private:

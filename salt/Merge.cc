@@ -16,7 +16,7 @@ size_t commonPrefix(std::string_view left, std::string_view right, size_t from) 
 
 }  // namespace
 
-Merge::Merge(index& owner, uint8_t shard)
+Merge::Merge(index& owner, uint8_t shard, bool hot)
     : _idx(owner),
       _shard(shard),
       _pace(owner.scans()),
@@ -26,12 +26,14 @@ Merge::Merge(index& owner, uint8_t shard)
       _old(_oldView, shard, &_zoneTexts),
       _hot(_hotView, 0),
       _previous(owner, &_zoneTexts),
-      _first(owner, &_zoneTexts) {}
+      _first(owner, &_zoneTexts),
+      _postings(owner.op.MaxShardSuffixes),
+      _withHot(hot) {}
 
 bool Merge::run() {
   const size_t pageSuffixes = _idx.op.MaxPageSuffixes;
   _old.seekToFirst();
-  _hot.seekToFirst();
+  if (_withHot) _hot.seekToFirst();
   while (!_failed && !_interrupted && (_old.valid || _hot.valid)) {
     if (_pending.size() >= 2 * pageSuffixes) {
       flushPage(pageSuffixes);
@@ -87,25 +89,42 @@ void Merge::takeHot() {
 void Merge::take(ShardCursor* cursor, bool relateToPrevious) {
   Suffix& suffix = cursor->suffix;
   _pending.push_back(suffix.meta);
-  if (relateToPrevious && _pending.size() > 1) relate(&suffix);
+  size_t lcp = suffix.meta.lcp;
+  if (relateToPrevious) {
+    lcp = commonWithPrevious(&suffix);
+    if (_pending.size() > 1) relate(&suffix, lcp);
+  }
+  _postings.take(lcp, {suffix.meta.DocID, suffix.meta.ZoneID},
+                 [this](size_t bytes) { return previousText(bytes); });
   if (_pendingTexts.size() < _pending.size()) _pendingTexts.emplace_back();
   _pendingTexts[_pending.size() - 1] = suffix.full ? suffix.knownText() : "";
   _previous = suffix;
   cursor->next();
 }
 
-void Merge::relate(Suffix* suffix) {
-  size_t lcp = 0;
-  for (;;) {
+size_t Merge::commonWithPrevious(Suffix* suffix) {
+  for (size_t lcp = 0;;) {
     lcp = commonPrefix(suffix->knownText(), _previous.knownText(), lcp);
     if (lcp == suffix->size && !suffix->full) {
       suffix->fetch();
     } else if (lcp == _previous.size && !_previous.full) {
       _previous.fetch();
     } else {
-      break;
+      return lcp;
     }
   }
+}
+
+std::string_view Merge::previousText(size_t bytes) {
+  if (_previous.size < bytes) _previous.fetch();
+  return _previous.knownText().substr(0, bytes);
+}
+
+std::string Merge::postings(const PostingsOwner& owner) {
+  return _postings.finish(owner, [this](size_t bytes) { return previousText(bytes); });
+}
+
+void Merge::relate(Suffix* suffix, size_t lcp) {
   if (suffix->size < lcp + 2) suffix->fetch();
   SuffixMeta& meta = _pending.back();
   meta.lcp = static_cast<uint8_t>(lcp);

@@ -8,6 +8,7 @@
 
 #include "salt/IndexImpl.h"
 #include "salt/MergePace.h"
+#include "salt/Postings.h"
 #include "salt/Suffix.h"
 #include "salt/ZoneTexts.h"
 
@@ -22,11 +23,16 @@ namespace salt {
 // an old page is removed before a new one is put that may have its key.
 class Merge {
  public:
-  Merge(index& owner, uint8_t shard);
+  // Without `hot` nothing is merged, and no page changes: the shard is gone through for its
+  // postings.
+  Merge(index& owner, uint8_t shard, bool hot = true);
 
   // To the end, or to the first read or write that fails, or an interruption of the index; what was
   // committed until then stays. False when it did not come to the end.
   [[nodiscard]] bool run();
+
+  // After a run to the end: the bytes of the shard's new postings, empty for none.
+  [[nodiscard]] std::string postings(const PostingsOwner& owner);
 
  private:
   [[nodiscard]] bool oldIsNext();
@@ -36,8 +42,12 @@ class Merge {
   // Appends the cursor's suffix to the pending ones.
   void take(ShardCursor* cursor, bool relateToPrevious);
 
+  // How many bytes the suffix shares with the latest one taken.
+  [[nodiscard]] size_t commonWithPrevious(Suffix* suffix);
   // Sets common prefix and extra bytes of the latest pending entry, which is `suffix`.
-  void relate(Suffix* suffix);
+  void relate(Suffix* suffix, size_t lcp);
+  // The first bytes of the latest one taken, which has that many.
+  [[nodiscard]] std::string_view previousText(size_t bytes);
 
   [[nodiscard]] std::string_view firstText();
 
@@ -61,10 +71,12 @@ class Merge {
   ShardCursor _hot;
   Suffix _previous;  // the latest one taken
   Suffix _first;     // of a page
+  PostingsBuilder _postings;
   std::vector<SuffixMeta> _pending;
   std::vector<std::string> _pendingTexts;  // of each, in full, or empty where it would be a read
   uint64_t _hotMerged = 0;                 // since the latest commit, like _pageDelta
   int64_t _pageDelta = 0;
+  const bool _withHot;
   bool _failed = false;
   bool _interrupted = false;
   bool _tookOld = false;

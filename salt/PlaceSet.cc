@@ -57,6 +57,17 @@ void PlaceSet::add(PlaceSet&& other) {
   _suffixes = suffixes;
 }
 
+void PlaceSet::add(uint32_t docID, uint32_t mask, const std::vector<uint16_t>& zones) {
+  for (; mask != 0; mask &= mask - 1) {
+    const uint16_t zone = zones[static_cast<size_t>(std::countr_zero(mask))];
+    if (const uint32_t bit = bitOf(zone); bit != 0) {
+      _masks[docID] |= bit;
+    } else {
+      _others.push_back({docID, zone});
+    }
+  }
+}
+
 // Number of zones, the zones, then for each document its distance from the one before and its mask.
 std::string PlaceSet::encode() const {
   std::string out;

@@ -31,6 +31,11 @@ class PlaceSet {
   // Both are of different suffixes.
   void add(PlaceSet&& other);
 
+  // Places of a document, in the zones of the bits of `mask`; how many suffixes that are is told
+  // by itself.
+  void add(uint32_t docID, uint32_t mask, const std::vector<uint16_t>& zones);
+  void addSuffixes(uint64_t count) { _suffixes += count; }
+
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
 
   // The places in few bytes, documents in order; nothing when there are more zones than bits.

@@ -160,8 +160,11 @@ class PlacesScan {
     FoundPlaces& found = _found[number];
     PrefixScan scan(_view, _prefix, number);
     for (unsigned shard = _next++; shard <= _last && found.complete; shard = _next++) {
-      found.complete =
-          shard == 0 ? scan.hotPlaces(&found.hot) : scan.pagePlaces(shard, &found.pages);
+      if (shard == 0) {
+        found.complete = scan.hotPlaces(&found.hot);
+      } else if (!addPostings(shard, &found.pages)) {
+        found.complete = scan.pagePlaces(shard, &found.pages);
+      }
     }
     found.counts = scan.counts;
   }
@@ -174,6 +177,12 @@ class PlacesScan {
   }
 
  private:
+  [[nodiscard]] bool addPostings(unsigned shard, PlaceSet* places) const {
+    const auto& postings = *_view.postings;
+    return shard < postings.size() && postings[shard] != nullptr &&
+           postings[shard]->add(_prefix, *_view.deleted, places);
+  }
+
   const IndexView& _view;
   const std::string_view _prefix;
   const unsigned _last;

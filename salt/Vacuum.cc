@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <system_error>
 
+#include "platform/Files.h"
 #include "platform/Memory.h"
 #include "platform/Queue.h"
 #include "salt/IndexImpl.h"
@@ -113,7 +114,7 @@ void index::mergeInto(uint8_t shard) {
   const auto start = Clock::now();
   {
     const Activity::Work merge(_housekeeping);
-    const bool merged = Merge(*this, shard).run();
+    const bool merged = mergePages(shard, true);
     platform::returnFreeMemory();
     if (op.CompactAfterVacuum && !_interrupted) {
       compactRange(nullptr, nullptr);
@@ -134,6 +135,44 @@ void index::mergeInto(uint8_t shard) {
   if (commit(&batch, false, finish)) return;
   platform::MutexLock metricsLock(_metricsMutex);
   finish(metrics);
+}
+
+// Postings must never be those of other pages, whatever is left by a loss of power. So the old ones
+// are gone from the disk before a page changes, and the pages are on it before the new ones are.
+bool index::mergePages(uint8_t shard, bool hot) {
+  setPostings(shard, nullptr);
+  if (!removePostings(_database.path, shard)) return false;
+  Merge merge(*this, shard, hot);
+  if (!merge.run()) return false;
+  const PostingsOwner owner = postingsOwner(shard);
+  const std::string postings = merge.postings(owner);
+  if (postings.empty() || !Sync()) return true;
+  std::optional<TLError> error;
+  if (platform::writeFileAtomically(postingsPath(_database.path, shard), postings, &error)) {
+    setPostings(shard, Postings::open(_database.path, owner));
+  } else {
+    Log.error("Error writing postings: {}", error->message);
+  }
+  return true;
+}
+
+// Counts as a merge meanwhile, so that no other changes the pages.
+void index::makeMissingPostings() {
+  uint64_t shards = 0;
+  std::shared_ptr<const ShardPostings> present;
+  {
+    platform::MutexLock lock(_metricsMutex);
+    if (metrics.VacuumInProgress) return;
+    metrics.VacuumInProgress = true;
+    shards = std::min<uint64_t>(metrics.Shards, kMaxShardNumber);
+    present = _postings;
+  }
+  for (size_t shard = 1; shard <= shards && !_interrupted; ++shard) {
+    if (shard < present->size() && (*present)[shard] != nullptr) continue;
+    if (!mergePages(static_cast<uint8_t>(shard), false)) break;
+  }
+  platform::MutexLock lock(_metricsMutex);
+  metrics.VacuumInProgress = false;
 }
 
 // Each merge rewrites its whole shard, so that while mail pours in fewer and larger ones cost less.

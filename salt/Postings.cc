@@ -1,0 +1,348 @@
+#include "salt/Postings.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/stat.h>
+
+#include <bit>
+#include <cerrno>
+#include <cstring>
+#include <optional>
+
+#include "platform/Files.h"
+#include "platform/Paths.h"
+#include "salt/Coding.h"
+#include "salt/Database.h"
+
+namespace salt {
+
+namespace {
+
+struct Header {
+  char magic[8] = {'T', 'A', 'L', 'P', 'O', 'S', 'T', '1'};
+  int64_t indexCreated = 0;
+  uint64_t fileBytes = 0;
+  uint32_t tableBytes = 0;
+  uint32_t entries = 0;
+  uint32_t shard = 0;
+  uint32_t reserved = 0;
+  uint64_t sum = 0;  // of the header with 0 here, and the table
+};
+static_assert(sizeof(Header) == 48);
+
+constexpr size_t kMaxZones = 32;
+constexpr size_t kSumBytes = 4;  // in front of each list
+constexpr uint32_t kMostTableBytes = uint32_t{1} << 28;
+constexpr uint32_t kMostStep = uint32_t{1} << 30;
+constexpr uint64_t kLeastBudget = 64 * 1024;
+// A suffix takes some eleven bytes of the index, so that this is a twentieth.
+constexpr uint64_t kSuffixesPerByte = 2;
+
+// Against accidents, not against a forger.
+uint64_t sumOf(std::string_view bytes, uint64_t seed = 0) {
+  constexpr uint64_t kFactor = UINT64_C(0x9E3779B97F4A7C15);
+  uint64_t sum = seed ^ (bytes.size() * kFactor);
+  const auto mix = [&sum](uint64_t word) {
+    sum = (sum ^ word) * kFactor;
+    sum ^= sum >> 32;
+  };
+  size_t at = 0;
+  for (uint64_t word = 0; at + sizeof word <= bytes.size(); at += sizeof word) {
+    std::memcpy(&word, bytes.data() + at, sizeof word);
+    mix(word);
+  }
+  for (; at < bytes.size(); ++at) mix(static_cast<uint8_t>(bytes[at]));
+  return sum;
+}
+
+void appendVarint(std::string* out, uint32_t value) {
+  char bytes[kMaxVarint32];
+  out->append(bytes, static_cast<size_t>(putVarint(bytes, value) - bytes));
+}
+
+// Reads bytes that may be anything: what does not fit leaves `good` false and gives 0.
+class Input {
+ public:
+  explicit Input(std::string_view bytes) : _bytes(bytes) {}
+
+  uint32_t varint() {
+    uint32_t value = 0;
+    for (int shift = 0; shift < 32 && !_bytes.empty(); shift += 7) {
+      const auto byte = static_cast<uint8_t>(_bytes.front());
+      _bytes.remove_prefix(1);
+      value |= static_cast<uint32_t>(byte & 0x7F) << shift;
+      if (byte < 0x80) return value;
+    }
+    good = false;
+    return 0;
+  }
+
+  std::string_view bytes(size_t count) {
+    if (count > _bytes.size()) {
+      good = false;
+      return "";
+    }
+    const std::string_view taken = _bytes.substr(0, count);
+    _bytes.remove_prefix(count);
+    return taken;
+  }
+
+  [[nodiscard]] bool empty() const { return _bytes.empty(); }
+
+  bool good = true;
+
+ private:
+  std::string_view _bytes;
+};
+
+bool readAt(int file, uint64_t offset, char* bytes, size_t count) {
+  while (count > 0) {
+    const ssize_t n = pread(file, bytes, count, static_cast<off_t>(offset));
+    if (n < 0 && errno == EINTR) continue;
+    if (n <= 0) return false;
+    bytes += n;
+    offset += static_cast<uint64_t>(n);
+    count -= static_cast<size_t>(n);
+  }
+  return true;
+}
+
+bool syncDirectory(const std::string& directory) {
+  const platform::FileDescriptor file(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return file.get() >= 0 && fsync(file.get()) == 0;
+}
+
+}  // namespace
+
+std::string postingsPath(const std::string& directory, uint8_t shard) {
+  return platform::joinPath(directory, fmt::format("postings-{:03}", shard));
+}
+
+bool removePostings(const std::string& directory, uint8_t shard) {
+  const std::string path = postingsPath(directory, shard);
+  if (unlink(path.c_str()) != 0) {
+    if (errno == ENOENT) return true;
+  } else if (syncDirectory(directory)) {
+    return true;
+  }
+  Log.error("Error removing {}: {}", path, std::strerror(errno));
+  return false;
+}
+
+// --- Reading
+
+std::shared_ptr<const Postings> Postings::open(const std::string& directory,
+                                               const PostingsOwner& owner) {
+  const std::string path = postingsPath(directory, owner.shard);
+  platform::FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  if (file.get() < 0) {
+    if (errno != ENOENT) Log.error("Error opening {}: {}", path, std::strerror(errno));
+    return nullptr;
+  }
+  std::shared_ptr<Postings> postings(new Postings(std::move(file)));
+  if (postings->readTable(owner)) return postings;
+  Log.error("Postings in {} are not used: damaged, or of another index", path);
+  (void)removePostings(directory, owner.shard);
+  return nullptr;
+}
+
+bool Postings::readTable(const PostingsOwner& owner) {
+  Header header;
+  struct stat info {};
+  if (!readAt(_file.get(), 0, reinterpret_cast<char*>(&header), sizeof header) ||
+      fstat(_file.get(), &info) != 0) {
+    return false;
+  }
+  const uint64_t sum = std::exchange(header.sum, 0);
+  if (std::memcmp(header.magic, Header().magic, sizeof header.magic) != 0 ||
+      header.indexCreated != owner.indexCreated || header.shard != owner.shard ||
+      header.fileBytes != static_cast<uint64_t>(info.st_size) ||
+      header.tableBytes > std::min<uint64_t>(kMostTableBytes, header.fileBytes)) {
+    return false;
+  }
+  std::string table(header.tableBytes, '\0');
+  if (!readAt(_file.get(), sizeof header, table.data(), table.size())) return false;
+  const std::string_view head(reinterpret_cast<const char*>(&header), sizeof header);
+  if (sumOf(table, sumOf(head)) != sum) return false;
+
+  Input input(table);
+  const uint32_t zones = input.varint();
+  if (zones > kMaxZones) return false;
+  for (uint32_t i = 0; i < zones; ++i) _zones.push_back(static_cast<uint16_t>(input.varint()));
+  uint64_t offset = sizeof header + table.size();
+  std::string text;
+  for (uint32_t i = 0; i < header.entries && input.good; ++i) {
+    const uint32_t shared = input.varint();
+    text.resize(std::min<size_t>(text.size(), shared));
+    text += input.bytes(input.varint());
+    const uint32_t above = input.varint();
+    const uint32_t bytes = input.varint();
+    if (text.size() > UINT8_MAX || above >= text.size() || bytes < kSumBytes) return false;
+    _entries.push_back({static_cast<uint32_t>(_texts.size()), static_cast<uint8_t>(text.size()),
+                        static_cast<uint8_t>(above), static_cast<uint32_t>(offset), bytes});
+    _texts += text;
+    offset += bytes;
+  }
+  _texts.shrink_to_fit();
+  return input.good && input.empty() && offset == header.fileBytes && offset <= UINT32_MAX;
+}
+
+const Postings::Entry* Postings::find(std::string_view prefix) const {
+  const auto entry = std::lower_bound(
+      _entries.begin(), _entries.end(), prefix,
+      [this](const Entry& left, std::string_view right) { return textOf(left) < right; });
+  const bool found =
+      entry != _entries.end() && textOf(*entry).starts_with(prefix) && prefix.size() > entry->above;
+  return found ? &*entry : nullptr;
+}
+
+// A list: for each document its distance from the one before, times 4; plus 1 where the mask of its
+// zones, else the one before's, and plus 2 where the number of its suffixes, else 1, follows.
+bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* places) const {
+  const Entry* const entry = find(prefix);
+  if (entry == nullptr) return false;
+  std::string bytes(entry->bytes, '\0');
+  uint32_t sum = 0;
+  if (readAt(_file.get(), entry->offset, bytes.data(), bytes.size())) {
+    std::memcpy(&sum, bytes.data(), sizeof sum);
+  }
+  const std::string_view list = std::string_view(bytes).substr(kSumBytes);
+  if (sum != static_cast<uint32_t>(sumOf(list))) {
+    Log.error("Postings cannot be read");
+    return false;
+  }
+  Input input(list);
+  uint64_t suffixes = 0;
+  uint32_t docID = 0;
+  uint32_t mask = 0;
+  const uint32_t allZones =
+      _zones.size() == kMaxZones ? UINT32_MAX : (uint32_t{1} << _zones.size()) - 1;
+  while (!input.empty() && input.good) {
+    const uint32_t step = input.varint();
+    docID += step / 4;
+    if ((step & 1) != 0) mask = input.varint() & allZones;
+    const uint32_t count = (step & 2) != 0 ? input.varint() : 1;
+    if (deleted.contains(docID)) continue;
+    places->add(docID, mask, _zones);
+    suffixes += count;
+  }
+  if (input.good) places->addSuffixes(suffixes);
+  return input.good;
+}
+
+// --- Making
+
+uint32_t PostingsBuilder::bitOf(uint16_t zoneID) {
+  for (size_t i = 0; i < _zones.size(); ++i) {
+    if (_zones[i] == zoneID) return uint32_t{1} << i;
+  }
+  if (_zones.size() == kMaxZones) {
+    _unfit = true;
+    return 0;
+  }
+  _zones.push_back(zoneID);
+  return uint32_t{1} << (_zones.size() - 1);
+}
+
+void PostingsBuilder::count(Node* node, size_t end) {
+  if (node->counts == nullptr) node->counts = std::make_unique<DocPages<Counts>>();
+  for (size_t at = node->begin; at < end; ++at) {
+    Counts& counts = (*node->counts)[_pending[at].DocID];
+    counts.mask |= bitOf(_pending[at].ZoneID);
+    ++counts.suffixes;
+  }
+  node->counted += end - node->begin;
+  node->begin = end;
+}
+
+void PostingsBuilder::fold() {
+  size_t end = _pending.size() - 1;  // a node may begin with the latest
+  for (Node& node : _open) {
+    if (suffixesOf(node) >= _least) continue;
+    end = std::min(end, node.begin);
+    break;
+  }
+  for (Node& node : _open) {
+    if (node.begin < end) count(&node, end);
+    node.begin -= end;
+  }
+  _pending.erase(_pending.begin(), _pending.begin() + static_cast<ptrdiff_t>(end));
+}
+
+void PostingsBuilder::make(Node* node, std::string text, size_t above) {
+  count(node, _pending.size());
+  std::string list(kSumBytes, '\0');
+  uint32_t before = 0;
+  uint32_t mask = 0;
+  node->counts->forEach([&](uint32_t docID, const Counts& counts) {
+    if (counts.suffixes == 0) return;
+    if (docID - before >= kMostStep) _unfit = true;
+    const bool otherMask = counts.mask != mask;
+    const bool several = counts.suffixes != 1;
+    appendVarint(&list, (docID - before) * 4 + (several ? 2 : 0) + (otherMask ? 1 : 0));
+    if (otherMask) appendVarint(&list, counts.mask);
+    if (several) appendVarint(&list, counts.suffixes);
+    before = docID;
+    mask = counts.mask;
+  });
+  const auto sum = static_cast<uint32_t>(sumOf(std::string_view(list).substr(kSumBytes)));
+  std::memcpy(list.data(), &sum, sizeof sum);
+  _madeBytes += list.size() + text.size();
+  _made.push_back({std::move(text), static_cast<uint8_t>(above), node->counted, std::move(list)});
+  if (_madeBytes > 2 * budget()) prune(budget());
+}
+
+uint64_t PostingsBuilder::budget() const {
+  return std::max(kLeastBudget, _taken / kSuffixesPerByte);
+}
+
+void PostingsBuilder::prune(uint64_t mostBytes) {
+  while (_madeBytes > mostBytes) {
+    _least *= 2;
+    std::erase_if(_made, [this](const Made& made) {
+      if (made.suffixes >= _least) return false;
+      _madeBytes -= made.list.size() + made.text.size();
+      return true;
+    });
+  }
+}
+
+std::string PostingsBuilder::file(const PostingsOwner& owner) {
+  prune(budget());
+  if (_made.empty() || _unfit) return "";
+  std::sort(_made.begin(), _made.end(),
+            [](const Made& left, const Made& right) { return left.text < right.text; });
+  std::string table;
+  appendVarint(&table, static_cast<uint32_t>(_zones.size()));
+  for (const uint16_t zone : _zones) appendVarint(&table, zone);
+  std::string_view before;
+  uint64_t lists = 0;
+  for (const Made& made : _made) {
+    const auto shared = static_cast<size_t>(
+        std::mismatch(before.begin(), before.end(), made.text.begin(), made.text.end()).first -
+        before.begin());
+    appendVarint(&table, static_cast<uint32_t>(shared));
+    appendVarint(&table, static_cast<uint32_t>(made.text.size() - shared));
+    table.append(made.text, shared);
+    appendVarint(&table, made.above);
+    appendVarint(&table, static_cast<uint32_t>(made.list.size()));
+    lists += made.list.size();
+    before = made.text;
+  }
+  Header header;
+  header.indexCreated = owner.indexCreated;
+  header.shard = owner.shard;
+  header.tableBytes = static_cast<uint32_t>(table.size());
+  header.entries = static_cast<uint32_t>(_made.size());
+  header.fileBytes = sizeof header + table.size() + lists;
+  const std::string_view head(reinterpret_cast<const char*>(&header), sizeof header);
+  header.sum = sumOf(table, sumOf(head));
+  std::string bytes;
+  bytes.reserve(header.fileBytes);
+  bytes.append(reinterpret_cast<const char*>(&header), sizeof header);
+  bytes += table;
+  for (const Made& made : _made) bytes += made.list;
+  return bytes;
+}
+
+}  // namespace salt

@@ -1,0 +1,220 @@
+#include <fmt/format.h>
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <map>
+#include <random>
+#include <set>
+
+#include "platform/Files.h"
+#include "salt/Postings.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+// Scans by postings beside scans that walk.
+namespace {
+
+namespace fs = std::filesystem;
+using salt::Index;
+
+using Places = std::set<std::pair<uint32_t, uint16_t>>;
+
+struct Answer {
+  Places places;
+  uint64_t suffixes = 0;
+  bool operator==(const Answer&) const = default;
+};
+
+// As ScanPlaces says, which may use postings.
+Answer placesOf(const Index& index, const std::string& prefix) {
+  Answer answer;
+  const auto suffixes =
+      index.ScanPlaces(prefix, UINT64_MAX, [&](const salt::Place* places, size_t count) {
+        for (; count > 0; ++places, --count) answer.places.emplace(places->DocID, places->ZoneID);
+      });
+  answer.suffixes = suffixes.value_or(0);
+  return answer;
+}
+
+// As the pages say.
+Answer walk(const Index& index, const std::string& prefix) {
+  Answer answer;
+  index.ScanPrefix(prefix, [&](const salt::SuffixMeta& meta) {
+    answer.places.emplace(meta.DocID, meta.ZoneID);
+    ++answer.suffixes;
+    return true;
+  });
+  return answer;
+}
+
+class PostingsTest : public testing::Test {
+ protected:
+  static constexpr size_t kPrefixes = 300;
+
+  PostingsTest() {
+    options.MaxHotSuffixes = 400;
+    options.MaxShardSuffixes = 2000;  // entries from 4 suffixes on
+    options.MaxShards = 3;
+    options.MaxPageSuffixes = 10;
+    index = salttest::newIndex(path, options);
+  }
+
+  void addDocs(uint32_t count) {
+    for (; count > 0; --count) {
+      ++lastDoc;
+      std::string text;
+      for (int word = 0; word < 60; ++word) {
+        text += std::string("aab")[random() % 3];
+        for (auto length = random() % 5; length > 0; --length) text += "abc"[random() % 3];
+        text += ' ';
+      }
+      const auto zone = static_cast<uint16_t>(1 + random() % 5 + 100 * (random() % 3));
+      ASSERT_TRUE(salttest::addZone(*index, lastDoc, zone, text, salttest::wordOffsets(text)));
+      for (size_t length = 1; length < 12; ++length) {
+        if (prefixes.size() < kPrefixes) prefixes.insert(text.substr(0, length));
+      }
+    }
+  }
+  void reopen() {
+    index.reset();  // ends a merge
+    index = salttest::loadIndex(path);
+    ASSERT_NE(index, nullptr);
+  }
+  [[nodiscard]] std::vector<fs::path> files() const {
+    std::vector<fs::path> found;
+    for (const auto& entry : fs::directory_iterator(path)) {
+      if (entry.path().filename().string().starts_with("postings-")) found.push_back(entry.path());
+    }
+    std::sort(found.begin(), found.end());
+    return found;
+  }
+  void expectSame() const {
+    for (const std::string& prefix : prefixes) {
+      ASSERT_EQ(placesOf(*index, prefix), walk(*index, prefix)) << prefix;
+    }
+  }
+  // How many pages the scans for the most frequent prefixes read.
+  [[nodiscard]] uint64_t pageReads() const {
+    const uint64_t before = index->GetMetrics().ScanPageReads;
+    for (const char* prefix : {"a", "aa", "b", "ab"}) placesOf(*index, prefix);
+    return index->GetMetrics().ScanPageReads - before;
+  }
+
+  testsupport::TemporaryDirectory directory;
+  const std::string path = directory / "index";
+  Index::Options options;
+  std::unique_ptr<Index> index;
+  std::mt19937 random{11};
+  uint32_t lastDoc = 0;
+  std::set<std::string> prefixes;
+};
+
+}  // namespace
+
+TEST_F(PostingsTest, AnswersAreThoseOfThePagesThroughMergesDeletionsAndReopening) {
+  for (int round = 0; round < 8; ++round) {
+    addDocs(40);
+    index->Vacuum();
+    reopen();
+    expectSame();
+    for (uint32_t docID = 1 + static_cast<uint32_t>(round); docID <= lastDoc; docID += 13) {
+      ASSERT_TRUE(index->DeleteDoc(docID));
+    }
+    expectSame();
+  }
+  EXPECT_EQ(files().size(), 3u);
+  EXPECT_TRUE(index->Validate());
+  EXPECT_EQ(pageReads(), 0u);
+}
+
+TEST_F(PostingsTest, ThereAreNoneWithMoreZonesThanBits) {
+  for (uint16_t zone = 1; zone <= 40; ++zone) {
+    const std::string text = "same same same same same ";
+    ASSERT_TRUE(salttest::addZone(*index, 7, zone, text, salttest::wordOffsets(text)));
+  }
+  addDocs(20);
+  prefixes.insert({"s", "same", "same s", "same same same same same "});
+  index->Vacuum();
+  reopen();
+  EXPECT_TRUE(files().empty());
+  expectSame();
+}
+
+TEST_F(PostingsTest, WhatIsNotAsItShouldBeIsPassedOverAndMadeAnew) {
+  addDocs(100);
+  index->Vacuum();
+  reopen();
+  ASSERT_FALSE(files().empty());
+  const fs::path file = files().front();
+  const std::string good = platform::readFile(file, 1 << 20, nullptr).value();
+  const uint64_t byPostings = pageReads();
+  std::vector<std::string> contents{"", good.substr(0, 20), good.substr(0, good.size() / 2),
+                                    good + "more", std::string(good.size(), '\xFF')};
+  for (const size_t at : {size_t{0}, size_t{9}, size_t{17}, size_t{25}, size_t{33}, size_t{41},
+                          size_t{50}, size_t{70}}) {
+    contents.push_back(good);
+    contents.back()[at] ^= 0x20;
+  }
+  // A list is looked at when it is read; this one is some prefix's.
+  std::string list = good;
+  list[good.size() - 20] ^= 0x20;
+  index.reset();
+  ASSERT_TRUE(platform::writeFileAtomically(file, list, nullptr));
+  index = salttest::loadIndex(path);
+  expectSame();
+  for (const std::string& content : contents) {
+    testsupport::LogCapture log;
+    index.reset();
+    ASSERT_TRUE(platform::writeFileAtomically(file, content, nullptr));
+    index = salttest::loadIndex(path);
+    expectSame();
+    EXPECT_TRUE(log.contains("Postings"));
+  }
+  index.reset();
+  fs::remove(file);
+  fs::create_directory(file);  // cannot be read, removed as a file, or replaced
+  index = salttest::loadIndex(path);
+  EXPECT_GT(pageReads(), byPostings);
+  expectSame();
+  index.reset();
+  fs::remove(file);
+  index = salttest::loadIndex(path);
+  ASSERT_TRUE(index->Compact());
+  EXPECT_EQ(platform::readFile(file, 1 << 20, nullptr), good);
+  EXPECT_EQ(pageReads(), byPostings);
+  expectSame();
+}
+
+TEST_F(PostingsTest, OfAnotherShardOrIndexTheyAreNotUsed) {
+  for (int i = 0; i < 4; ++i) {
+    addDocs(60);
+    index->Vacuum();
+    reopen();
+  }
+  ASSERT_GE(files().size(), 2u);
+  index.reset();
+  fs::copy_file(files()[0], files()[1], fs::copy_options::overwrite_existing);
+  reopen();
+  expectSame();
+  EXPECT_FALSE(fs::exists(salt::postingsPath(path, 2)));
+  index.reset();
+  salttest::editMetrics(path, [](Index::Metrics& metrics) { ++metrics.CreationTime; });
+  reopen();
+  EXPECT_TRUE(files().empty());
+  expectSame();
+}
+
+TEST_F(PostingsTest, AMergeThatCannotWriteThemIsDoneAllTheSame) {
+  testsupport::LogCapture log;
+  fs::create_directory(salt::postingsPath(path, 1) + ".new");
+  addDocs(20);
+  for (int i = 0; i < 2; ++i) {
+    index->Vacuum();
+    reopen();
+  }
+  EXPECT_TRUE(log.contains("Error writing postings"));
+  EXPECT_FALSE(fs::exists(salt::postingsPath(path, 1)));
+  EXPECT_LT(index->GetMetrics().HotSuffixes, options.MaxHotSuffixes);
+  expectSame();
+}
