@@ -91,6 +91,7 @@ void FakeDaemon::serve(const char* member, const std::string& signature, const V
   for (std::string rest = signature; !rest.empty();) {
     texts.push_back(readArgument(arguments, rest, items));
   }
+  Answer answer;
   {
     const platform::MutexLock lock(_mutex);
     _calls.push_back(fmt::format("{}({})", member, fmt::join(texts, ", ")));
@@ -106,10 +107,16 @@ void FakeDaemon::serve(const char* member, const std::string& signature, const V
       }
     }
     for (std::string& item : items) _indexed.push_back(std::move(item));
+    const auto found = _answers.find(member);
+    if (found != _answers.end()) answer = found->second;
   }
-  const auto answer = _answers.find(member);
-  if (answer != _answers.end()) return answer->second(reply);
+  if (answer) return answer(reply);
   reply.send(values);
+}
+
+void FakeDaemon::answer(const std::string& member, Answer answer) {
+  const platform::MutexLock lock(_mutex);
+  _answers[member] = std::move(answer);
 }
 
 void FakeDaemon::failOnce(const std::string& member, TLError error) {
@@ -118,6 +125,7 @@ void FakeDaemon::failOnce(const std::string& member, TLError error) {
 }
 
 void FakeDaemon::refuseItemsWith(const std::string& text, TLError error) {
+  const platform::MutexLock lock(_mutex);
   _refusedText = text;
   _refusal = std::move(error);
 }

@@ -17,7 +17,8 @@ namespace testsupport {
 // Both services of the daemon, in this process, with answers of the test's own. Every call is
 // written down as "Member(argument, ...)": lists as [n bytes, ...] or [text, ...].
 //
-// An answer runs on a thread of the RPC layer; set it before the first call.
+// An answer runs on a thread of the RPC layer. It may be set at any time and counts from the next
+// call.
 class FakeDaemon {
  public:
   using Answer = std::function<void(platform::RPCReply&)>;
@@ -28,7 +29,7 @@ class FakeDaemon {
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
   // Without one, a member answers with what its signature allows and means nothing.
-  void answer(const std::string& member, Answer answer) { _answers[member] = std::move(answer); }
+  void answer(const std::string& member, Answer answer);
   // What the next calls of a member get, one after the other, before `answer` counts.
   void failOnce(const std::string& member, TLError error);
   // Answers with an error to every IndexItems that holds an item whose bytes hold `text`.
@@ -51,13 +52,13 @@ class FakeDaemon {
   TemporaryDirectory _directory;
   platform::RPCInterface _search;
   platform::RPCInterface _debug;
-  std::map<std::string, Answer> _answers;
   mutable platform::Mutex _mutex;
+  std::map<std::string, Answer> _answers TL_GUARDED_BY(_mutex);
   std::map<std::string, std::vector<TLError>> _failures TL_GUARDED_BY(_mutex);
   std::vector<std::string> _calls TL_GUARDED_BY(_mutex);
   std::vector<std::string> _indexed TL_GUARDED_BY(_mutex);
-  std::string _refusedText;
-  TLError _refusal;
+  std::string _refusedText TL_GUARDED_BY(_mutex);
+  TLError _refusal TL_GUARDED_BY(_mutex);
   platform::RunLoop _loop;
   std::vector<std::unique_ptr<platform::RPCListener>> _listeners;
   std::thread _thread;
