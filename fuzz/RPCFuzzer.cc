@@ -1,4 +1,4 @@
-// What a peer sends behind the handshake: the bytes go through the framer and the bus library into
+// What a peer sends after the handshake: the bytes go through the framer and the bus library into
 // handlers that read every kind of argument, in a connection as the daemon serves it.
 #include <fcntl.h>
 #include <sys/socket.h>
@@ -6,9 +6,10 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <future>
+#include <string>
 #include <string_view>
 
+#include "platform/Assert.h"
 #include "platform/RPCConnection.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
@@ -75,23 +76,25 @@ const platform::RPCInterface& interface() {
 
 }  // namespace
 
+// All that a peer sends waits in the socket when the connection, which has no thread of its own
+// here, begins to serve; what it answers stays there unread.
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   setenv("TALLOW_LOG", "fault", 0);
+  static const std::string begin = testsupport::authenticationLines() + "BEGIN\r\n";
+  constexpr size_t kFitsSocket = size_t{64} << 10;
   int ends[2];
-  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return 0;
+  if (size > kFitsSocket || socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return 0;
   fcntl(ends[1], F_SETFL, O_NONBLOCK);
   {
-    std::promise<void> ended;
     platform::RPCServerConnection connection(ends[1], kService, "fuzzer");
     connection.setExportedInterface(&interface());
-    if (connection.start([&ended] { ended.set_value(); })) {
-      const std::string_view bytes(reinterpret_cast<const char*>(data), size);
-      testsupport::sendAll(ends[0], testsupport::authenticationLines() + "BEGIN\r\n");
-      testsupport::sendAll(ends[0], bytes);
+    bool ended = false;
+    if (connection.open([&ended] { ended = true; })) {
+      testsupport::sendAll(ends[0], begin);
+      testsupport::sendAll(ends[0], {reinterpret_cast<const char*>(data), size});
       shutdown(ends[0], SHUT_WR);
-      while (!testsupport::receiveSome(ends[0]).empty()) {
-      }
-      ended.get_future().wait();
+      connection.serve();
+      TL_ASSERT(ended);
     }
   }
   close(ends[0]);

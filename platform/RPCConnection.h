@@ -42,7 +42,7 @@ class RPCOutbox {
 // alone.
 //
 // Made and destroyed on the listener's thread; all fields but the ones named below belong to the
-// connection's thread once `start` has been called.
+// connection's thread once it serves.
 class RPCServerConnection : public RPCConnection {
  public:
   // Takes over `descriptor`.
@@ -56,6 +56,10 @@ class RPCServerConnection : public RPCConnection {
   // Starts the thread; `ended` is called on it as the last thing that it does. False when the
   // system has no thread, descriptors or memory for it.
   [[nodiscard]] bool start(std::function<void()> ended);
+  // The same in two steps, for a caller that serves on its own thread: `serve` returns when the
+  // connection has ended.
+  [[nodiscard]] bool open(std::function<void()> ended);
+  void serve();
 
   // Any thread: the connection ends once no call of it is pending and what is ready has gone out,
   // or after `milliseconds`.
@@ -78,7 +82,6 @@ class RPCServerConnection : public RPCConnection {
   // Makes the reply to a call, null for none; negative where D-Bus cannot carry it.
   using BuildReply = std::function<int(sd_bus_message* call, sd_bus_message** reply)>;
 
-  void serve();
   bool openBus();
   bool exportInterface();
 
