@@ -48,6 +48,30 @@ bool writeAll(int fd, const std::string& bytes) {
 
 }  // namespace
 
+bool readAt(int file, uint64_t offset, char* bytes, size_t count) {
+  while (count > 0) {
+    const ssize_t n = pread(file, bytes, count, static_cast<off_t>(offset));
+    if (n < 0 && errno == EINTR) continue;
+    if (n == 0) errno = 0;
+    if (n <= 0) return false;
+    bytes += n;
+    offset += static_cast<uint64_t>(n);
+    count -= static_cast<size_t>(n);
+  }
+  return true;
+}
+
+bool writeAt(int file, uint64_t offset, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t n = pwrite(file, bytes.data(), bytes.size(), static_cast<off_t>(offset));
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) return false;
+    offset += static_cast<uint64_t>(n);
+    bytes.remove_prefix(static_cast<size_t>(n));
+  }
+  return true;
+}
+
 bool fileExists(const std::string& path) {
   return path.find('\0') == std::string::npos && access(path.c_str(), F_OK) == 0;
 }

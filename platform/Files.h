@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "platform/TLError.h"
@@ -29,6 +30,11 @@ bool removeItem(const std::string& path, TLErrorOut error);
 // At most `maximum` bytes are read; a larger file is an error (EFBIG).
 [[nodiscard]] std::optional<std::string> readFile(const std::string& path, size_t maximum,
                                                   TLErrorOut error);
+
+// Reads or writes all bytes at `offset` of an open file. False, with errno set, when the system
+// does not; the end of the file (then errno is 0) is such a case, too.
+[[nodiscard]] bool readAt(int file, uint64_t offset, char* bytes, size_t count);
+[[nodiscard]] bool writeAt(int file, uint64_t offset, std::string_view bytes);
 
 // Written beside the target, synced, then renamed over it.
 bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error);

@@ -14,7 +14,6 @@ namespace {
 
 constexpr char kOptionsKey[] = "\xFFOPTIONS";
 constexpr char kMetricsKey[] = "\xFFMETRICS";
-constexpr std::chrono::seconds kLongestWait{10};
 
 template <typename Record>
 leveldb::Status putRecord(leveldb::DB* db, const char* key, const Record& record) {
@@ -203,9 +202,9 @@ bool index::Sync() {
 }
 
 bool index::Compact() {
-  waitForMerge();
-  if (_interrupted) return true;
-  const Activity::Work compaction(_housekeeping);
+  _schedule.waitForMerge();
+  if (interrupted()) return true;
+  const Activity::Work compaction(_schedule.housekeeping());
   const bool done = compactRange(nullptr, nullptr);
   _database.files->waitForDisk();
   if (done) makeMissingPostings();
@@ -226,16 +225,11 @@ void index::removeObsoleteFiles() const {
 }
 
 void index::WaitWhileTidying() {
-  _housekeeping.waitForEnd(kLongestWait);
+  _schedule.waitForHousekeeping();
 }
 
 void index::Interrupt() {
-  {
-    platform::MutexLock lock(_paceMutex);
-    _interrupted = true;
-  }
-  _paceChanged.notify_all();
-  _housekeeping.interrupt();
+  _schedule.interrupt();
 }
 
 Index::Metrics index::GetMetrics() const {
@@ -308,7 +302,7 @@ IndexView::~IndexView() {
   if (options.fill_cache || idx._compactionsEnded == _compactionsEnded) return;
   // Not here: it takes as long as writing a memtable, and waits for a compaction that runs.
   (void)idx._tidying.async([&owner = idx] {
-    if (!owner._interrupted) owner.removeObsoleteFiles();
+    if (!owner.interrupted()) owner.removeObsoleteFiles();
   });
 }
 

@@ -5,17 +5,14 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <memory>
 #include <optional>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "platform/CrashNote.h"
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
-#include "salt/Activity.h"
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/DocSet.h"
@@ -23,6 +20,7 @@
 #include "salt/Index.h"
 #include "salt/Postings.h"
 #include "salt/ScanMemory.h"
+#include "salt/Schedule.h"
 #include "salt/SuffixStarts.h"
 
 namespace salt {
@@ -87,7 +85,7 @@ class index final : public Index {
       const std::vector<std::string>& prefixes, size_t limit) const override;
   void WaitWhileTidying() override;
   void Interrupt() override;
-  [[nodiscard]] bool interrupted() const { return _interrupted; }
+  [[nodiscard]] bool interrupted() const { return _schedule.interrupted(); }
 
   // Whether ScanPrefixes leaves out what it need not look for.
   [[nodiscard]] bool knowsStarts() const { return _starts.complete(); }
@@ -116,11 +114,14 @@ class index final : public Index {
   [[nodiscard]] bool commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta)
       TL_EXCLUDES(_commitMutex, _metricsMutex);
 
-  [[nodiscard]] Activity& scans() const { return _scans; }
+  [[nodiscard]] Activity& scans() const { return _schedule.scans(); }
 
   // Opens the postings that are beside the database, once it is loaded. Without them all answers
   // are the same.
   void openPostings() TL_EXCLUDES(_metricsMutex);
+
+  // The directory of the database.
+  [[nodiscard]] const std::string& path() const { return _database.path; }
 
   // See IndexFiles.
   [[nodiscard]] const std::string& crashNotes() const { return _database.files->crashNotes(); }
@@ -175,9 +176,9 @@ class index final : public Index {
   // already, or the mark cannot be written.
   [[nodiscard]] std::optional<uint8_t> beginVacuum() TL_EXCLUDES(_commitMutex, _metricsMutex);
   [[nodiscard]] bool vacuumIsDue() const TL_EXCLUDES(_metricsMutex);
-  void startMerge(uint8_t shard) TL_EXCLUDES(_mergeThreadMutex, _commitMutex);
-  // The body of the merge thread.
-  void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex, _paceMutex);
+  void startMerge(uint8_t shard) TL_EXCLUDES(_commitMutex);
+  // On the merge thread.
+  void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
   void mergeInto(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
   // The merge itself, with the postings of its shard; false when it did not come to the end.
   // Without `hot` only the postings are made.
@@ -187,11 +188,10 @@ class index final : public Index {
   void setPostings(uint8_t shard, std::shared_ptr<const Postings> postings)
       TL_EXCLUDES(_metricsMutex);
   [[nodiscard]] PostingsOwner postingsOwner(uint8_t shard) const TL_EXCLUDES(_metricsMutex);
-  void waitForMore() TL_EXCLUDES(_metricsMutex, _paceMutex);
   // Starts a merge if it is worthwhile and none runs.
   void vacuum();
-  void waitForMerge() TL_EXCLUDES(_paceMutex);
   [[nodiscard]] uint64_t hotSuffixes() const TL_EXCLUDES(_metricsMutex);
+  [[nodiscard]] uint64_t suffixesPerShard() const TL_EXCLUDES(_metricsMutex);
   void compactPart(uint8_t shard);
   // The keys from `begin` to `end`; false without room.
   bool compactRange(const leveldb::Slice* begin, const leveldb::Slice* end);
@@ -251,24 +251,11 @@ class index final : public Index {
 
   // Counts what changes the pages or hides documents in them: commits of merges and deletions.
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
-  mutable ScanMemory _scanMemory;  // synchronised by itself, as is the next
+  mutable ScanMemory _scanMemory;  // synchronised by itself, as are the next
   mutable Helper _scanHelper;
-  mutable Activity _scans{std::chrono::milliseconds(5)};  // one search makes several
+  mutable Schedule _schedule;
 
-  Activity _housekeeping;                      // merges and compactions; synchronised by itself
   std::atomic<uint64_t> _compactionsEnded{0};  // of those on demand
-
-  // The latest merge's. A finished one is joined when the next starts, or at the end. The mutex is
-  // taken with no other held.
-  platform::Mutex _mergeThreadMutex;
-  std::thread _mergeThread TL_GUARDED_BY(_mergeThreadMutex);
-
-  // What a merge that waits for more and those who wait for a merge look at.
-  platform::Mutex _paceMutex;
-  std::condition_variable_any _paceChanged;
-  bool _mergeAtOnce TL_GUARDED_BY(_paceMutex) = false;
-  bool _merging TL_GUARDED_BY(_paceMutex) = false;
-  std::atomic<bool> _interrupted{false};  // set under _paceMutex
 
   mutable SuffixStarts _starts;  // synchronised by itself; its thread reads the index
   // Removes files behind long walks; last, since it uses all the rest.

@@ -7,8 +7,8 @@
 #include <vector>
 
 #include "salt/IndexImpl.h"
-#include "salt/MergePace.h"
 #include "salt/Postings.h"
+#include "salt/Schedule.h"
 #include "salt/Suffix.h"
 #include "salt/ZoneTexts.h"
 

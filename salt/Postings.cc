@@ -95,18 +95,6 @@ class Input {
   std::string_view _bytes;
 };
 
-bool readAt(int file, uint64_t offset, char* bytes, size_t count) {
-  while (count > 0) {
-    const ssize_t n = pread(file, bytes, count, static_cast<off_t>(offset));
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) return false;
-    bytes += n;
-    offset += static_cast<uint64_t>(n);
-    count -= static_cast<size_t>(n);
-  }
-  return true;
-}
-
 bool syncDirectory(const std::string& directory) {
   const platform::FileDescriptor file(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   return file.get() >= 0 && fsync(file.get()) == 0;
@@ -149,7 +137,7 @@ std::shared_ptr<const Postings> Postings::open(const std::string& directory,
 bool Postings::readTable(const PostingsOwner& owner) {
   Header header;
   struct stat info {};
-  if (!readAt(_file.get(), 0, reinterpret_cast<char*>(&header), sizeof header) ||
+  if (!platform::readAt(_file.get(), 0, reinterpret_cast<char*>(&header), sizeof header) ||
       fstat(_file.get(), &info) != 0) {
     return false;
   }
@@ -161,7 +149,7 @@ bool Postings::readTable(const PostingsOwner& owner) {
     return false;
   }
   std::string table(header.tableBytes, '\0');
-  if (!readAt(_file.get(), sizeof header, table.data(), table.size())) return false;
+  if (!platform::readAt(_file.get(), sizeof header, table.data(), table.size())) return false;
   const std::string_view head(reinterpret_cast<const char*>(&header), sizeof header);
   if (sumOf(table, sumOf(head)) != sum) return false;
 
@@ -203,7 +191,7 @@ bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* pla
   if (entry == nullptr) return false;
   std::string bytes(entry->bytes, '\0');
   uint32_t sum = 0;
-  if (readAt(_file.get(), entry->offset, bytes.data(), bytes.size())) {
+  if (platform::readAt(_file.get(), entry->offset, bytes.data(), bytes.size())) {
     std::memcpy(&sum, bytes.data(), sizeof sum);
   }
   const std::string_view list = std::string_view(bytes).substr(kSumBytes);

@@ -116,7 +116,7 @@ void index::learnStarts() const {
 std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::string>& prefixes,
                                                          size_t limit) const {
   const auto start = Clock::now();
-  const Activity::Work running(_scans);
+  const Activity::Work running(_schedule.scans());
   if (!_starts.complete()) learnStarts();
   const IndexView view(*this, true, kWalks);
   const auto cut = [this](const std::string& prefix) {

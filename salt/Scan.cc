@@ -195,7 +195,7 @@ class PlacesScan {
 bool index::ScanPrefix(std::string_view prefix,
                        std::function<bool(const SuffixMeta&)> callback) const {
   const auto start = Clock::now();
-  const Activity::Work running(_scans);
+  const Activity::Work running(_schedule.scans());
   const IndexView view(*this, true);
   PrefixScan scan(view, prefix.substr(0, suffixLength(prefix, op)));
   scan.suffixes(callback);
@@ -207,7 +207,7 @@ std::optional<uint64_t> index::ScanPlaces(
     std::string_view prefix, uint64_t limit,
     const std::function<void(const Place* places, size_t count)>& callback) const {
   const auto start = Clock::now();
-  const Activity::Work running(_scans);
+  const Activity::Work running(_schedule.scans());
   const IndexView view(*this, true, kPageWalks);
   prefix = prefix.substr(0, suffixLength(prefix, op));
   const auto known = _scanMemory.find(prefix, view.pageGeneration);

@@ -63,7 +63,7 @@ void Suffix::fetch() {
   bool readable = true;
   std::string_view text;
   if (_zoneTexts != nullptr) {
-    text = idx.suffixText(meta, _zoneTexts->find(meta.DocID, meta.ZoneID));
+    text = _zoneTexts->find(meta);
     readable = _zoneTexts->good();
   } else {
     text = idx.fullText(meta, options, &_zoneText, &readable);

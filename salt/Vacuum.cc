@@ -1,9 +1,9 @@
 #include <algorithm>
+#include <chrono>
 #include <system_error>
 
 #include "platform/Files.h"
 #include "platform/Memory.h"
-#include "platform/Queue.h"
 #include "salt/IndexImpl.h"
 #include "salt/Merge.h"
 
@@ -14,32 +14,19 @@ namespace {
 
 constexpr uint8_t kHotPart = 0;
 
-// While kPouring suffixes or more come in each interval, a merge waits until the hot part is
-// kWorthwhile times MaxHotSuffixes, unless that is small anyway.
-constexpr uint32_t kWorthwhile = 2;
-constexpr uint32_t kSmallHotPart = 100000;
-constexpr std::chrono::milliseconds kInterval{250};
-constexpr uint64_t kPouring = 10000;  // some 25 mails
-constexpr std::chrono::seconds kLongestWait{5};
-
 }  // namespace
 
 index::~index() {
-  platform::MutexLock lock(_mergeThreadMutex);
-  if (_mergeThread.joinable()) _mergeThread.join();
+  _schedule.join();
 }
 
 void index::Vacuum() {
-  {
-    platform::MutexLock lock(_paceMutex);
-    _mergeAtOnce = true;
-  }
-  _paceChanged.notify_all();
+  _schedule.mergeAtOnce();
   vacuum();
 }
 
 void index::vacuum() {
-  if (_interrupted) return;
+  if (interrupted()) return;
   if (const std::optional<uint8_t> shard = beginVacuum()) startMerge(*shard);
 }
 
@@ -76,17 +63,9 @@ uint8_t index::chooseShard(MetricsBlock& counters) const {
 }
 
 void index::startMerge(uint8_t shard) {
-  platform::MutexLock lock(_mergeThreadMutex);
-  if (_mergeThread.joinable()) _mergeThread.join();
-  const auto setMerging = [this](bool merging) {
-    platform::MutexLock paceLock(_paceMutex);
-    _merging = merging;
-  };
   try {
-    setMerging(true);
-    _mergeThread = std::thread([this, shard] { runMerge(shard); });
+    _schedule.startMerge([this, shard] { runMerge(shard); });
   } catch (const std::system_error&) {
-    setMerging(false);
     platform::MutexLock commitLock(_commitMutex);
     platform::MutexLock metricsLock(_metricsMutex);
     metrics.VacuumInProgress = false;
@@ -95,28 +74,18 @@ void index::startMerge(uint8_t shard) {
 }
 
 void index::runMerge(uint8_t shard) {
-  platform::setThreadName("tallow-merge");
   const platform::CrashNote note(crashNotes());
-  waitForMore();
+  _schedule.waitForMore(op.MaxHotSuffixes, suffixesPerShard(), [this] { return hotSuffixes(); });
   mergeInto(shard);
-  platform::MutexLock lock(_paceMutex);
-  _merging = false;
-  _mergeAtOnce = false;
-  _paceChanged.notify_all();
-}
-
-void index::waitForMerge() {
-  platform::MutexLock lock(_paceMutex);
-  while (_merging && !_interrupted) _paceChanged.wait(_paceMutex);
 }
 
 void index::mergeInto(uint8_t shard) {
   const auto start = Clock::now();
   {
-    const Activity::Work merge(_housekeeping);
+    const Activity::Work merge(_schedule.housekeeping());
     const bool merged = mergePages(shard, true);
     platform::returnFreeMemory();
-    if (op.CompactAfterVacuum && !_interrupted) {
+    if (op.CompactAfterVacuum && !interrupted()) {
       compactRange(nullptr, nullptr);
       _database.files->waitForDisk();
     } else if (merged) {
@@ -167,7 +136,7 @@ void index::makeMissingPostings() {
     shards = std::min<uint64_t>(metrics.Shards, kMaxShardNumber);
     present = _postings;
   }
-  for (size_t shard = 1; shard <= shards && !_interrupted; ++shard) {
+  for (size_t shard = 1; shard <= shards && !interrupted(); ++shard) {
     if (shard < present->size() && (*present)[shard] != nullptr) continue;
     if (!mergePages(static_cast<uint8_t>(shard), false)) break;
   }
@@ -175,27 +144,15 @@ void index::makeMissingPostings() {
   metrics.VacuumInProgress = false;
 }
 
-// Each merge rewrites its whole shard, so that while mail pours in fewer and larger ones cost less.
-void index::waitForMore() {
-  if (op.MaxHotSuffixes < kSmallHotPart) return;
-  const auto pause = [this] {
-    platform::MutexLock lock(_paceMutex);
-    const auto over = [this]() TL_REQUIRES(_paceMutex) { return _mergeAtOnce || _interrupted; };
-    return !_paceChanged.wait_for(_paceMutex, kInterval, over);
-  };
-  const auto deadline = Clock::now() + kLongestWait;
-  uint64_t before = hotSuffixes();
-  while (before < kWorthwhile * uint64_t{op.MaxHotSuffixes} && Clock::now() < deadline) {
-    if (!pause()) return;
-    const uint64_t hot = hotSuffixes();
-    if (hot < before + kPouring) return;
-    before = hot;
-  }
-}
-
 uint64_t index::hotSuffixes() const {
   platform::MutexLock lock(_metricsMutex);
   return metrics.HotSuffixes;
+}
+
+uint64_t index::suffixesPerShard() const {
+  platform::MutexLock lock(_metricsMutex);
+  const uint64_t inShards = metrics.Suffixes - std::min(metrics.HotSuffixes, metrics.Suffixes);
+  return inShards / std::max<uint64_t>(metrics.Shards, 1);
 }
 
 // A merge leaves a mark for each suffix that was hot, and a seek walks over them up to the next
@@ -207,7 +164,7 @@ uint64_t index::hotSuffixes() const {
 // file of the last hot suffixes and the first texts spans all shards, and is merged with all of
 // their pages in the next level.
 void index::compactPart(uint8_t shard) {
-  if (_interrupted) return;
+  if (interrupted()) return;
   const char first = static_cast<char>(shard);
   const char behind = static_cast<char>(shard + 1);
   const leveldb::Slice begin(&first, 1);

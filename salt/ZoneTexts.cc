@@ -1,5 +1,10 @@
 #include "salt/ZoneTexts.h"
 
+#include <fcntl.h>
+
+#include <algorithm>
+
+#include "platform/Files.h"
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
 
@@ -13,48 +18,74 @@ uint64_t idOf(uint32_t docID, uint16_t zoneID) {
 
 }  // namespace
 
-ZoneTexts::ZoneTexts(const index& owner) : _iterator(owner.db->NewIterator(readOptions(false))) {}
-
-std::string_view ZoneTexts::find(uint32_t docID, uint16_t zoneID) {
-  const uint64_t id = idOf(docID, zoneID);
-  if (const auto found = _younger.find(id); found != _younger.end()) return found->second;
-  if (const auto found = _older.find(id); found != _older.end()) {
-    return keep(id, std::move(found->second));
+ZoneTexts::ZoneTexts(const index& owner, uint64_t mostFileBytes)
+    : _idx(owner),
+      _iterator(owner.db->NewIterator(readOptions(false))),
+      _file(open(owner.path().c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, S_IRUSR | S_IWUSR)) {
+  if (_file.get() >= 0) {
+    _mostFileBytes = std::min(mostFileBytes, platform::freeBytes(owner.path()) / 4);
   }
-  return read(docID, zoneID);
 }
 
-std::string_view ZoneTexts::keep(uint64_t id, std::string text) {
-  const size_t bytes = text.size() + kTextOverhead;
-  if (_youngerBytes + bytes > kKeptBytes / 2) {
-    _full = !_older.empty();
-    _older = std::move(_younger);
-    _younger.clear();
-    _youngerBytes = 0;
-  }
-  _youngerBytes += bytes;
-  return _younger.insert_or_assign(id, std::move(text)).first->second;
+std::string_view ZoneTexts::find(const SuffixMeta& meta) {
+  const auto kept = _kept.find(idOf(meta.DocID, meta.ZoneID));
+  if (kept == _kept.end() || !readKept(kept->second, meta)) readStored(meta);
+  return _suffix;
 }
 
-std::string_view ZoneTexts::read(uint32_t docID, uint16_t zoneID) {
-  const TextKey key = index::textKey(docID, zoneID);
+bool ZoneTexts::readKept(const Stretch& stretch, const SuffixMeta& meta) {
+  const uint32_t offset = std::min(meta.Offset, stretch.bytes);
+  _suffix.resize(std::min<size_t>(stretch.bytes - offset, _idx.op.MaxMatchLen));
+  if (!platform::readAt(_file.get(), stretch.begin + offset, _suffix.data(), _suffix.size())) {
+    forget();
+    return false;
+  }
+  _suffix.resize(suffixLength(_suffix, _idx.op));
+  return true;
+}
+
+void ZoneTexts::readStored(const SuffixMeta& meta) {
+  _suffix.clear();
+  const TextKey key = index::textKey(meta.DocID, meta.ZoneID);
   _iterator->Seek(slice(key.view()));
-  if (!_iterator->Valid() || view(_iterator->key()) != key.view()) return "";
-  std::string wanted = _iterator->value().ToString();
-  if (!_full) readOn();
-  return keep(idOf(docID, zoneID), std::move(wanted));
-}
-
-void ZoneTexts::readOn() {
-  size_t bytes = 0;
-  for (_iterator->Next(); _iterator->Valid() && bytes < kReadAheadBytes; _iterator->Next()) {
+  if (!_iterator->Valid() || view(_iterator->key()) != key.view()) return;
+  _suffix = _idx.suffixText(meta, view(_iterator->value()));
+  if (_file.get() < 0) return;
+  addRead(idOf(meta.DocID, meta.ZoneID));
+  for (_iterator->Next(); _iterator->Valid() && _read.size() < kReadAheadBytes; _iterator->Next()) {
     uint32_t docID = 0;
     uint16_t zoneID = 0;
-    if (!parseTextKey(view(_iterator->key()), &docID, &zoneID)) return;
+    if (!parseTextKey(view(_iterator->key()), &docID, &zoneID)) break;
     const uint64_t id = idOf(docID, zoneID);
-    bytes += _iterator->value().size();
-    if (!_younger.contains(id) && !_older.contains(id)) keep(id, _iterator->value().ToString());
+    if (_kept.contains(id)) break;
+    addRead(id);
   }
+  keepRead();
+}
+
+void ZoneTexts::addRead(uint64_t id) {
+  const leveldb::Slice text = _iterator->value();
+  _kept[id] = {_fileBytes + _read.size(), static_cast<uint32_t>(text.size())};
+  _read.append(text.data(), text.size());
+}
+
+void ZoneTexts::keepRead() {
+  if (!platform::writeAt(_file.get(), _fileBytes, _read)) {
+    forget();
+  } else {
+    _fileBytes += _read.size();
+  }
+  _read.clear();
+  if (_fileBytes > _mostFileBytes) {
+    _kept.clear();
+    _fileBytes = 0;
+  }
+}
+
+// A disk that is full or fails: what is in the file is not needed.
+void ZoneTexts::forget() {
+  _kept.clear();
+  _file.reset();
 }
 
 }  // namespace salt

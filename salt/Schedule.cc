@@ -1,0 +1,124 @@
+#include "salt/Schedule.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "platform/Clock.h"
+#include "platform/Queue.h"
+
+namespace salt {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using std::chrono::milliseconds;
+using std::chrono::nanoseconds;
+using std::chrono::seconds;
+
+// What a merge waits for, in multiples of MaxHotSuffixes and as a share of its shard.
+constexpr uint64_t kLeastWorthwhile = 2;
+constexpr uint64_t kMostWorthwhile = 8;
+constexpr uint64_t kShardPart = 2;
+constexpr uint32_t kSmallHotPart = 100000;  // below this there is nothing to gain
+// Mail pours in while so many suffixes come in each interval: some 25 mails.
+constexpr milliseconds kInterval{250};
+constexpr uint64_t kPouring = 10000;
+constexpr seconds kLongestWaitForMore{60};
+
+constexpr seconds kLongestWaitForHousekeeping{10};
+
+constexpr int kWaitOverComputing = 3;
+constexpr milliseconds kMostCredit{100};
+constexpr milliseconds kLeastCredit{2};  // waking up costs, too
+
+}  // namespace
+
+void Schedule::startMerge(std::function<void()> merge) {
+  platform::MutexLock lock(_threadMutex);
+  if (_thread.joinable()) _thread.join();
+  setMerging(true);
+  try {
+    _thread = std::thread([this, merge = std::move(merge)] {
+      platform::setThreadName("tallow-merge");
+      merge();
+      setMerging(false);
+    });
+  } catch (...) {
+    setMerging(false);
+    throw;
+  }
+}
+
+void Schedule::join() {
+  platform::MutexLock lock(_threadMutex);
+  if (_thread.joinable()) _thread.join();
+}
+
+void Schedule::setMerging(bool merging) {
+  platform::MutexLock lock(_mutex);
+  _merging = merging;
+  if (merging) return;
+  _atOnce = false;
+  _changed.notify_all();
+}
+
+void Schedule::waitForMore(uint32_t maxHotSuffixes, uint64_t shardSuffixes,
+                           const std::function<uint64_t()>& hotSuffixes) {
+  if (maxHotSuffixes < kSmallHotPart) return;
+  const uint64_t worthwhile =
+      std::clamp(shardSuffixes / kShardPart, kLeastWorthwhile * maxHotSuffixes,
+                 kMostWorthwhile * maxHotSuffixes);
+  const auto deadline = Clock::now() + kLongestWaitForMore;
+  uint64_t before = hotSuffixes();
+  while (before < worthwhile && Clock::now() < deadline) {
+    if (!pause()) return;
+    const uint64_t hot = hotSuffixes();
+    if (hot < before + kPouring) return;
+    before = hot;
+  }
+}
+
+bool Schedule::pause() {
+  platform::MutexLock lock(_mutex);
+  const auto over = [this]() TL_REQUIRES(_mutex) { return _atOnce || _interrupted; };
+  return !_changed.wait_for(_mutex, kInterval, over);
+}
+
+void Schedule::mergeAtOnce() {
+  platform::MutexLock lock(_mutex);
+  _atOnce = true;
+  _changed.notify_all();
+}
+
+void Schedule::waitForMerge() {
+  platform::MutexLock lock(_mutex);
+  while (_merging && !_interrupted) _changed.wait(_mutex);
+}
+
+void Schedule::waitForHousekeeping() {
+  _housekeeping.waitForEnd(kLongestWaitForHousekeeping);
+}
+
+void Schedule::interrupt() {
+  {
+    platform::MutexLock lock(_mutex);
+    _interrupted = true;
+    _changed.notify_all();
+  }
+  _housekeeping.interrupt();
+}
+
+MergePace::MergePace(Activity& scans) : _scans(scans), _computed(platform::threadProcessorTime()) {}
+
+void MergePace::giveWay() {
+  if (!_scans.any()) return;
+  const nanoseconds computed = platform::threadProcessorTime();
+  _credit += kWaitOverComputing * (computed - std::exchange(_computed, computed));
+  _credit = std::min<nanoseconds>(_credit, kMostCredit);
+  if (_credit < kLeastCredit) return;
+  const auto start = Clock::now();
+  _scans.waitForEnd(_credit);
+  _credit -= Clock::now() - start;
+}
+
+}  // namespace salt

@@ -1,0 +1,71 @@
+#include <gtest/gtest.h>
+
+#include <random>
+
+#include "salt/Coding.h"
+#include "salt/IndexImpl.h"
+#include "salt/ZoneTexts.h"
+#include "tests/salt/SaltSupport.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using salttest::FileSizeLimit;
+
+// Some of the zones are longer than what is read on at a time; every tenth document has none.
+class ZoneTextsTest : public testing::Test {
+ protected:
+  ZoneTextsTest() {
+    for (uint32_t doc = 1; doc <= kDocs; ++doc) {
+      std::string text;
+      const size_t words = doc % 10 == 0 ? 0 : 1 + _random() % (doc % 7 == 0 ? 8000 : 100);
+      for (size_t i = 0; i < words; ++i) text += std::to_string(_random()) + " ";
+      if (words != 0) {
+        EXPECT_TRUE(salttest::addZone(*_index, doc, 3, text));
+      }
+      _texts.push_back(std::move(text));
+    }
+  }
+
+  void expectAllTexts(salt::ZoneTexts* texts) {
+    for (int i = 0; i < 3000; ++i) {
+      salt::SuffixMeta meta{};
+      meta.DocID = 1 + static_cast<uint32_t>(_random() % kDocs);
+      meta.ZoneID = 3;
+      const std::string& text = _texts[meta.DocID - 1];
+      meta.Offset = static_cast<uint32_t>(_random() % (text.size() + 3));
+      EXPECT_EQ(texts->find(meta), index().suffixText(meta, text));
+    }
+    EXPECT_TRUE(texts->good());
+  }
+
+  [[nodiscard]] const salt::index& index() const {
+    return static_cast<const salt::index&>(*_index);
+  }
+
+ private:
+  static constexpr uint32_t kDocs = 200;
+
+  std::mt19937 _random{7};
+  testsupport::TemporaryDirectory _directory;
+  std::unique_ptr<salt::Index> _index = salttest::newIndex(_directory.path() + "/index");
+  std::vector<std::string> _texts;
+};
+
+TEST_F(ZoneTextsTest, GivesTheSameWithAFileOfAnyLength) {
+  for (const uint64_t most : {salt::ZoneTexts::kMostFileBytes, uint64_t{200000}, uint64_t{0}}) {
+    salt::ZoneTexts texts(index(), most);
+    expectAllTexts(&texts);
+  }
+}
+
+TEST_F(ZoneTextsTest, GoesOnWhereTheFileCannotGrow) {
+  salt::ZoneTexts texts(index());
+  {
+    const FileSizeLimit limit(100000);
+    expectAllTexts(&texts);
+  }
+  expectAllTexts(&texts);
+}
+
+}  // namespace
