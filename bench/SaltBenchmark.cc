@@ -188,7 +188,7 @@ void ScanPlaces(benchmark::State& state) {
       state.ResumeTiming();
     }
     results += *data.index->ScanPlaces(
-        prefix, SIZE_MAX, [&places](const salt::Place*, size_t count) { places += count; });
+        prefix, SIZE_MAX, [&places](const auto&, const auto*, size_t count) { places += count; });
   }
   benchmark::DoNotOptimize(places);
   state.SetItemsProcessed(static_cast<int64_t>(results));

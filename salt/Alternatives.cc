@@ -7,6 +7,7 @@
 #include "salt/Candidates.h"
 #include "salt/DocSet.h"
 #include "salt/TermRules.h"
+#include "salt/ZoneMask.h"
 
 namespace saltsearch {
 
@@ -18,28 +19,28 @@ Candidates matchesOf(const salt::Index& index, const Term& term, size_t maxSuffi
                      const salt::DocSet* wanted) {
   const ZoneBits zoneBits(term.zones);
   Candidates found;
-  const auto take = [&](uint32_t docID, uint16_t zoneID) {
-    const uint32_t bit = zoneBits.of(zoneID);
-    if (bit == 0 || (wanted != nullptr && !wanted->contains(docID))) return;
+  const auto take = [&](uint32_t docID, uint32_t bits) {
+    if (bits == 0 || (wanted != nullptr && !wanted->contains(docID))) return;
     if (DocResult* const known = found.find(docID)) {
-      known->zoneMask |= bit;
+      known->zoneMask |= bits;
     } else {
-      found.add({docID, bit, 0, term.tokenScores[0]});
+      found.add({docID, bits, 0, term.tokenScores[0]});
     }
   };
-  const auto suffixes =
-      index.ScanPlaces(term.tokens[0], std::numeric_limits<uint64_t>::max(),
-                       [&take](const salt::Place* places, size_t count) {
-                         for (const salt::Place* place = places; place != places + count; ++place) {
-                           take(place->DocID, place->ZoneID);
-                         }
-                       });
+  const auto suffixes = index.ScanPlaces(
+      term.tokens[0], std::numeric_limits<uint64_t>::max(),
+      [&](const auto& zones, const auto* docs, size_t count) {
+        salt::ZoneMaskMap bits(zones, [&](uint16_t zone) { return zoneBits.of(zone); });
+        for (const salt::DocZones* doc = docs; doc != docs + count; ++doc) {
+          take(doc->DocID, bits.of(doc->zones));
+        }
+      });
   if (suffixes && *suffixes <= maxSuffixes) return found;
   found = Candidates();
   size_t taken = 0;
   index.ScanPrefix(term.tokens[0], [&](const salt::SuffixMeta& meta) {
     if (++taken > maxSuffixes) return false;
-    take(meta.DocID, meta.ZoneID);
+    take(meta.DocID, zoneBits.of(meta.ZoneID));
     return true;
   });
   return found;

@@ -40,6 +40,17 @@ struct Place {
   uint16_t ZoneID = 0;
 };
 
+// All places of a document: bit n for the zone n of some list, which has at most 32.
+struct DocZones {
+  uint32_t DocID = 0;
+  uint32_t zones = 0;
+};
+
+// Takes places, a run of documents at a time, with the list that their zones are of. Both live for
+// the call.
+using PlacesCallback =
+    std::function<void(const std::vector<uint16_t>& zones, const DocZones* docs, size_t count)>;
+
 // Threads: all operations may run on any threads at once. Readers work from a snapshot and block
 // nobody; what is added or deleted while one runs does not change what it sees.
 class Index {
@@ -173,12 +184,11 @@ class Index {
   [[nodiscard]] virtual std::string Dump() const = 0;
 
   // ScanPrefix for those who ask in which zones of which documents there is a match: calls
-  // `callback` with runs of places, in any order, each place once or more; they live for the call.
-  // The result is the number of matching suffixes. Null, and no call, when there might be more than
-  // `limit`: then only ScanPrefix can tell which come first.
-  virtual std::optional<uint64_t> ScanPlaces(
-      std::string_view prefix, uint64_t limit,
-      const std::function<void(const Place* places, size_t count)>& callback) const = 0;
+  // `callback` with runs of places, in any order, each place once or more. The result is the number
+  // of matching suffixes. Null, and no call, when there might be more than `limit`: then only
+  // ScanPrefix can tell which come first.
+  virtual std::optional<uint64_t> ScanPlaces(std::string_view prefix, uint64_t limit,
+                                             const PlacesCallback& callback) const = 0;
 
   // For each prefix the first `limit` suffixes that ScanPrefix would call with: for many prefixes
   // that are alike, most of which nothing begins with, at a fraction of its cost. The first call

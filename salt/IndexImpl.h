@@ -78,9 +78,8 @@ class index final : public Index {
   void ResetScanMetrics() override;
   [[nodiscard]] bool Validate() const override;
   [[nodiscard]] std::string Dump() const override;
-  std::optional<uint64_t> ScanPlaces(
-      std::string_view prefix, uint64_t limit,
-      const std::function<void(const Place* places, size_t count)>& callback) const override;
+  std::optional<uint64_t> ScanPlaces(std::string_view prefix, uint64_t limit,
+                                     const PlacesCallback& callback) const override;
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override;
   void WaitWhileTidying() override;

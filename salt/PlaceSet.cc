@@ -8,28 +8,30 @@ namespace salt {
 
 namespace {
 
-// Gathers places into runs.
+// Gathers documents into runs.
 class Runs {
  public:
-  explicit Runs(const PlaceCallback& callback) : _callback(callback) { _run.reserve(kLength); }
+  Runs(const std::vector<uint16_t>& zones, const PlacesCallback& callback)
+      : _zones(zones), _callback(callback) {
+    _run.reserve(kLength);
+  }
 
-  void add(uint32_t docID, uint32_t mask, const std::vector<uint16_t>& zones) {
-    for (; mask != 0; mask &= mask - 1) {
-      _run.push_back({docID, zones[static_cast<size_t>(std::countr_zero(mask))]});
-      if (_run.size() == kLength) flush();
-    }
+  void add(const DocZones& doc) {
+    _run.push_back(doc);
+    if (_run.size() == kLength) flush();
   }
 
   void flush() {
-    if (!_run.empty()) _callback(_run.data(), _run.size());
+    if (!_run.empty()) _callback(_zones, _run.data(), _run.size());
     _run.clear();
   }
 
  private:
   static constexpr size_t kLength = 512;
 
-  const PlaceCallback& _callback;
-  std::vector<Place> _run;
+  const std::vector<uint16_t>& _zones;
+  const PlacesCallback& _callback;
+  std::vector<DocZones> _run;
 };
 
 void appendVarint(std::string* out, uint32_t value) {
@@ -50,20 +52,27 @@ uint32_t PlaceSet::newBit(uint16_t zoneID) {
 void PlaceSet::add(PlaceSet&& other) {
   if (_suffixes == 0) std::swap(*this, other);
   if (other._suffixes == 0) return;
-  const uint64_t suffixes = _suffixes + other._suffixes;
-  other.deliver([this](const Place* places, size_t count) {
-    for (const Place* place = places; place != places + count; ++place) add(*place);
+  other.deliver([this](const std::vector<uint16_t>& zones, const DocZones* docs, size_t count) {
+    Adder adder(this, zones);
+    for (const DocZones* doc = docs; doc != docs + count; ++doc) adder.add(*doc);
   });
-  _suffixes = suffixes;
+  addSuffixes(other._suffixes);
 }
 
-void PlaceSet::add(uint32_t docID, uint32_t mask, const std::vector<uint16_t>& zones) {
-  for (; mask != 0; mask &= mask - 1) {
-    const uint16_t zone = zones[static_cast<size_t>(std::countr_zero(mask))];
-    if (const uint32_t bit = bitOf(zone); bit != 0) {
-      _masks[docID] |= bit;
+PlaceSet::Adder::Adder(PlaceSet* set, const std::vector<uint16_t>& zones)
+    : _set(*set), _zones(zones) {
+  bool all = true;
+  for (const uint16_t zone : zones) all = set->bitOf(zone) != 0 && all;
+  if (all) _bits.emplace(zones, [set](uint16_t zone) { return set->bitOf(zone); });
+}
+
+void PlaceSet::Adder::addOneByOne(const DocZones& doc) {
+  for (uint32_t mask = doc.zones; mask != 0; mask &= mask - 1) {
+    const uint16_t zone = _zones[static_cast<size_t>(std::countr_zero(mask))];
+    if (const uint32_t bit = _set.bitOf(zone); bit != 0) {
+      _set._masks[doc.DocID] |= bit;
     } else {
-      _others.push_back({docID, zone});
+      _set._others.push_back({doc.DocID, zone});
     }
   }
 }
@@ -84,21 +93,26 @@ std::string PlaceSet::encode() const {
   return out;
 }
 
-void PlaceSet::deliver(const PlaceCallback& callback) const {
-  if (!_others.empty()) callback(_others.data(), _others.size());
-  Runs runs(callback);
-  _masks.forEach([&](uint32_t docID, uint32_t mask) { runs.add(docID, mask, _zones); });
+void PlaceSet::deliver(const PlacesCallback& callback) const {
+  for (const Place& place : _others) {
+    const DocZones doc{place.DocID, 1};
+    callback({place.ZoneID}, &doc, 1);
+  }
+  Runs runs(_zones, callback);
+  _masks.forEach([&](uint32_t docID, uint32_t mask) {
+    if (mask != 0) runs.add({docID, mask});
+  });
   runs.flush();
 }
 
-void PlaceSet::deliver(std::string_view encoded, const PlaceCallback& callback) {
+void PlaceSet::deliver(std::string_view encoded, const PlacesCallback& callback) {
   std::vector<uint16_t> zones(readVarint(encoded));
   for (uint16_t& zone : zones) zone = static_cast<uint16_t>(readVarint(encoded));
-  Runs runs(callback);
+  Runs runs(zones, callback);
   uint32_t docID = 0;
   while (!encoded.empty()) {
     docID += readVarint(encoded);
-    runs.add(docID, readVarint(encoded), zones);
+    runs.add({docID, readVarint(encoded)});
   }
   runs.flush();
 }

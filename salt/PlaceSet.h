@@ -2,17 +2,16 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "salt/DocPages.h"
 #include "salt/Index.h"
+#include "salt/ZoneMask.h"
 
 namespace salt {
-
-// Takes what a scan delivers, a run at a time; the places live for the call.
-using PlaceCallback = std::function<void(const Place* places, size_t count)>;
 
 // The different places among those of many suffixes, and how many suffixes there were. A mail has
 // some ten zones, so that a document's are the bits of a number. One thread.
@@ -31,9 +30,26 @@ class PlaceSet {
   // Both are of different suffixes.
   void add(PlaceSet&& other);
 
-  // Places of a document, in the zones of the bits of `mask`; how many suffixes that are is told
-  // by itself.
-  void add(uint32_t docID, uint32_t mask, const std::vector<uint16_t>& zones);
+  // Adds documents with zones of one list. How many suffixes that are is told by itself.
+  class Adder {
+   public:
+    Adder(PlaceSet* set, const std::vector<uint16_t>& zones);
+
+    void add(const DocZones& doc) {
+      if (_bits) {
+        _set._masks[doc.DocID] |= _bits->of(doc.zones);
+      } else {
+        addOneByOne(doc);
+      }
+    }
+
+   private:
+    void addOneByOne(const DocZones& doc);
+
+    PlaceSet& _set;
+    const std::vector<uint16_t>& _zones;
+    std::optional<ZoneMaskMap> _bits;  // none where the set has no bit for one of them
+  };
   void addSuffixes(uint64_t count) { _suffixes += count; }
 
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
@@ -42,10 +58,10 @@ class PlaceSet {
   [[nodiscard]] std::string encode() const;
 
   // Hands all places over, those of zones without a bit as often as they were added.
-  void deliver(const PlaceCallback& callback) const;
+  void deliver(const PlacesCallback& callback) const;
 
   // The same for the places of an encoded set.
-  static void deliver(std::string_view encoded, const PlaceCallback& callback);
+  static void deliver(std::string_view encoded, const PlacesCallback& callback);
 
  private:
   static constexpr size_t kMaxZones = 32;

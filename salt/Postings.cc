@@ -205,13 +205,14 @@ bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* pla
   uint32_t mask = 0;
   const uint32_t allZones =
       _zones.size() == kMaxZones ? UINT32_MAX : (uint32_t{1} << _zones.size()) - 1;
+  PlaceSet::Adder adder(places, _zones);
   while (!input.empty() && input.good) {
     const uint32_t step = input.varint();
     docID += step / 4;
     if ((step & 1) != 0) mask = input.varint() & allZones;
     const uint32_t count = (step & 2) != 0 ? input.varint() : 1;
     if (deleted.contains(docID)) continue;
-    places->add(docID, mask, _zones);
+    adder.add({docID, mask});
     suffixes += count;
   }
   if (input.good) places->addSuffixes(suffixes);

@@ -203,9 +203,8 @@ bool index::ScanPrefix(std::string_view prefix,
   return true;
 }
 
-std::optional<uint64_t> index::ScanPlaces(
-    std::string_view prefix, uint64_t limit,
-    const std::function<void(const Place* places, size_t count)>& callback) const {
+std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limit,
+                                          const PlacesCallback& callback) const {
   const auto start = Clock::now();
   const Activity::Work running(_schedule.scans());
   const IndexView view(*this, true, kPageWalks);

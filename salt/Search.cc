@@ -7,6 +7,7 @@
 
 #include "salt/Candidates.h"
 #include "salt/TermRules.h"
+#include "salt/ZoneMask.h"
 
 namespace saltsearch {
 
@@ -43,9 +44,16 @@ class TermRun {
     }
   }
 
+  // Neighbouring documents mostly match in the same zones.
   void score() {
-    _candidates.retain([this](DocResult& doc) {
-      doc.score *= factorOf(_term, doc);
+    uint32_t latestMask = 0;
+    double latestFactor = zoneFactor(_term, latestMask);
+    _candidates.retain([&](DocResult& doc) {
+      if (doc.zoneMask != latestMask) {
+        latestMask = doc.zoneMask;
+        latestFactor = zoneFactor(_term, latestMask);
+      }
+      doc.score *= doc.tokenScore == -1.0 ? _term.defaultScore : doc.tokenScore * latestFactor;
       if (_reach < _options.threshold && doc.score < _need) return false;
       doc.tokenScore = -1.0;
       doc.zoneMask = 0;
@@ -73,9 +81,10 @@ class TermRun {
 
   void scan(const salt::Index& index, const std::string& token) {
     const auto suffixes =
-        index.ScanPlaces(token, left(), [this](const salt::Place* places, size_t count) {
-          for (const salt::Place* place = places; place != places + count; ++place) {
-            take(place->DocID, place->ZoneID);
+        index.ScanPlaces(token, left(), [this](const auto& zones, const auto* docs, size_t count) {
+          salt::ZoneMaskMap bits(zones, [this](uint16_t zone) { return _zoneBits.of(zone); });
+          for (const salt::DocZones* doc = docs; doc != docs + count; ++doc) {
+            take(doc->DocID, bits.of(doc->zones));
           }
         });
     if (suffixes) {
@@ -87,7 +96,7 @@ class TermRun {
       ++_suffixes;
       _term.found = true;
       if (_suffixes > _options.maxSuffixes) return false;
-      take(meta.DocID, meta.ZoneID);
+      take(meta.DocID, _zoneBits.of(meta.ZoneID));
       return true;
     });
   }
@@ -97,25 +106,24 @@ class TermRun {
     return _options.maxSuffixes - std::min(_options.maxSuffixes, _suffixes);
   }
 
-  // Once for a place, or again: the second time changes nothing.
-  void take(uint32_t docID, uint16_t zoneID) {
-    const uint32_t bit = _zoneBits.of(zoneID);
-    if (bit == 0) return;
+  // Places of a document, or the same again: the second time changes nothing.
+  void take(uint32_t docID, uint32_t bits) {
+    if (bits == 0) return;
     if (DocResult* const known = _candidates.find(docID)) {
-      match(known, bit);
+      match(known, bits);
     } else if (!_noNewDocs) {
-      _candidates.add({docID, bit, _unmatched, _tokenScore});
+      _candidates.add({docID, bits, _unmatched, _tokenScore});
     }
   }
 
-  void match(DocResult* doc, uint32_t bit) const {
+  void match(DocResult* doc, uint32_t bits) const {
     if (doc->tokenScore == -1.0) {
       doc->tokenScore = _tokenScore;
     } else {
       doc->tokenScore = _term.isMin ? std::min(doc->tokenScore, _tokenScore)
                                     : std::max(doc->tokenScore, _tokenScore);
     }
-    doc->zoneMask |= bit;
+    doc->zoneMask |= bits;
   }
 
   Term& _term;

@@ -60,14 +60,18 @@ ZoneBits::ZoneBits(const std::vector<uint16_t>& zones) {
   }
 }
 
-double factorOf(const Term& term, const DocResult& doc) {
-  if (doc.tokenScore == -1.0) return term.defaultScore;
-  if (term.zones.empty()) return doc.tokenScore;
+double zoneFactor(const Term& term, uint32_t zoneMask) {
+  if (term.zones.empty()) return 1.0;
   double sum = 0;
   for (size_t i = 0; i < term.zones.size(); ++i) {
-    if ((doc.zoneMask >> i & 1) != 0) sum += term.zoneScores[i];
+    if ((zoneMask >> i & 1) != 0) sum += term.zoneScores[i];
   }
-  return doc.tokenScore * std::min(sum, 1.0);
+  return std::min(sum, 1.0);
+}
+
+double factorOf(const Term& term, const DocResult& doc) {
+  if (doc.tokenScore == -1.0) return term.defaultScore;
+  return doc.tokenScore * zoneFactor(term, doc.zoneMask);
 }
 
 }  // namespace saltsearch

@@ -35,6 +35,9 @@ class ZoneBits {
   uint32_t _others = 0;
 };
 
+// The summed weights, at most 1.0, of the term's zones in the mask.
+[[nodiscard]] double zoneFactor(const Term& term, uint32_t zoneMask);
+
 // What the term multiplies the score of a document by, from the document's working fields.
 [[nodiscard]] double factorOf(const Term& term, const DocResult& doc);
 

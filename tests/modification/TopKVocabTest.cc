@@ -47,9 +47,8 @@ class WatchedIndex final : public salt::Index {
   bool ScanPrefix(std::string_view, std::function<bool(const salt::SuffixMeta&)>) const override {
     return true;
   }
-  std::optional<uint64_t> ScanPlaces(
-      std::string_view, uint64_t,
-      const std::function<void(const salt::Place*, size_t)>&) const override {
+  std::optional<uint64_t> ScanPlaces(std::string_view, uint64_t,
+                                     const salt::PlacesCallback&) const override {
     return 0;
   }
   std::vector<std::vector<salt::SuffixMeta>> ScanPrefixes(const std::vector<std::string>&,

@@ -30,8 +30,9 @@ struct Answer {
 Answer placesOf(const Index& index, const std::string& prefix) {
   Answer answer;
   const auto suffixes =
-      index.ScanPlaces(prefix, UINT64_MAX, [&](const salt::Place* places, size_t count) {
-        for (; count > 0; ++places, --count) answer.places.emplace(places->DocID, places->ZoneID);
+      index.ScanPlaces(prefix, UINT64_MAX, [&](const auto& zones, const auto* docs, size_t count) {
+        const auto places = salttest::placesOf(zones, docs, count);
+        answer.places.insert(places.begin(), places.end());
       });
   answer.suffixes = suffixes.value_or(0);
   return answer;

@@ -110,4 +110,15 @@ std::vector<std::string> scan(const salt::Index& index, std::string_view prefix)
   return found;
 }
 
+std::vector<std::pair<uint32_t, uint16_t>> placesOf(const std::vector<uint16_t>& zones,
+                                                    const salt::DocZones* docs, size_t count) {
+  std::vector<std::pair<uint32_t, uint16_t>> places;
+  for (const salt::DocZones* doc = docs; doc != docs + count; ++doc) {
+    for (size_t zone = 0; zone < zones.size(); ++zone) {
+      if ((doc->zones >> zone & 1) != 0) places.emplace_back(doc->DocID, zones[zone]);
+    }
+  }
+  return places;
+}
+
 }  // namespace salttest

@@ -6,6 +6,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "salt/Index.h"
@@ -51,5 +52,9 @@ bool addZone(salt::Index& index, uint32_t docID, uint16_t zoneID, const std::str
 
 // What a scan delivers: "docID,zoneID:offset" in order.
 [[nodiscard]] std::vector<std::string> scan(const salt::Index& index, std::string_view prefix);
+
+// The places of a run, as (docID, zoneID).
+[[nodiscard]] std::vector<std::pair<uint32_t, uint16_t>> placesOf(
+    const std::vector<uint16_t>& zones, const salt::DocZones* docs, size_t count);
 
 }  // namespace salttest

@@ -80,7 +80,7 @@ std::vector<std::string> sortedScan(const Index& index) {
 }
 
 std::optional<uint64_t> countOfPlaces(const Index& index) {
-  return index.ScanPlaces("a", 1000, [](const salt::Place*, size_t) {});
+  return index.ScanPlaces("a", 1000, [](const auto&, const auto*, size_t) {});
 }
 
 std::unique_ptr<salt::index> openOn(SlowDisk* disk, const std::string& path) {
