@@ -12,10 +12,10 @@
 
 namespace salt {
 
-// When the background work of an index runs, and who waits for whom. Scans come first and wait for
-// nothing here; then comes mail; merges and compactions take the time that is left.
+// When the background work of an index runs, and which work waits for which. Scans come first and
+// wait for nothing here; then comes mail; merges and compactions take the time that is left.
 //
-//   who waits                        for what                                    at most
+//   this waits                       for this                                    at most
 //   a merge, before it begins        more mail, while much comes in              60 s
 //   a merge, between two pages       scans that run (MergePace)                  3 times its work
 //   a batch of mail, before it       a merge or a compaction on demand that      10 s

@@ -60,7 +60,7 @@ class ZoneTexts {
   uint64_t _mostFileBytes = 0;
   uint64_t _fileBytes = 0;
   std::unordered_map<uint64_t, Stretch> _kept;
-  std::string _read;    // texts that are to be written behind _fileBytes
+  std::string _read;    // texts that are to be written at _fileBytes
   std::string _suffix;  // of the latest call
 };
 
