@@ -195,8 +195,15 @@ class TALIndexer {
                                           const std::string& bundleID);
   bool _deleteItemsByIdentifiers(const Strings& identifiers, const std::string& bundleID,
                                  TLErrorOut error);
+  // Deletes it from the store. None when that did not happen.
+  [[nodiscard]] std::optional<uint32_t> deleteStored(const TLString& identifier,
+                                                     const std::string& bundleID,
+                                                     std::optional<TLError>* failure)
+      TL_REQUIRES(_indexMutex);
   bool _deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
+  // Hides what was deleted from the store in the text index, and clears the list.
+  void hideDeleted(std::vector<uint32_t>* docIDs);
 
   // What a pass has found: the best items, and how many were ranked.
   struct Found {

@@ -1,4 +1,6 @@
+#include <algorithm>
 #include <cerrno>
+#include <span>
 #include <unordered_map>
 #include <unordered_set>
 #include <utility>
@@ -25,6 +27,10 @@ struct TALIndexer::Batch {
 };
 
 namespace {
+
+// The index writes all that is deleted whenever it hides more. So many are hidden together; as many
+// may stay in the index, and not in the store, if the process is killed in between.
+constexpr size_t kDeletedAtATime = 100;
 
 // The store gives 0 for an unknown document and calls that no error; to delete one is one, under
 // the store's domain and the number that its engine has for "not found".
@@ -339,35 +345,53 @@ bool TALIndexer::_deleteItemsByIdentifiers(const Strings& identifiers, const std
     log().error("bundleID not set");
     return true;
   }
-  for (const TLString& identifier : identifiers) {
-    const auto url = documentURLForIdentifier(identifier, bundleID);
-    const std::string shown = url ? url->absoluteString() : "(null)";
+  const std::span<const TLString> all(identifiers);
+  for (size_t at = 0; at < all.size(); at += kDeletedAtATime) {
+    MutexLock lock(_indexMutex);
+    std::vector<uint32_t> deleted;
     std::optional<TLError> failure;
-    const uint32_t docID = url ? docStore()->documentIDWithURL(*url, &failure) : 0;
-    if (docID == 0 && !failure) {
-      failure = TLError{kDocStoreErrorDomain, kDocumentNotFound, "no document with URL " + shown};
+    for (const TLString& identifier : all.subspan(at, std::min(kDeletedAtATime, all.size() - at))) {
+      if (const auto docID = deleteStored(identifier, bundleID, &failure))
+        deleted.push_back(*docID);
+      if (failure) break;
     }
-    if (failure) {
-      log().error("Failed to fetch document ID in docstore for URL {}: {}", shown,
-                  platform::printable(failure));
-    } else {
-      MutexLock lock(_indexMutex);
-      _docDates.forget(docID);
-      const auto text = _text.get();
-      if (docStore()->deleteDocument(docID, &failure) && text != nullptr) {
-        text->index->DeleteDoc(docID);
-      }
-      if (failure) {
-        log().error("Failed to delete document with ID {} in docstore: {}", docID,
-                    platform::printable(failure));
-      }
-    }
+    hideDeleted(&deleted);
     if (failure) {
       platform::setError(error, *failure);
       return false;
     }
   }
   return true;
+}
+
+std::optional<uint32_t> TALIndexer::deleteStored(const TLString& identifier,
+                                                 const std::string& bundleID,
+                                                 std::optional<TLError>* failure) {
+  const auto url = documentURLForIdentifier(identifier, bundleID);
+  const std::string shown = url ? url->absoluteString() : "(null)";
+  const uint32_t docID = url ? docStore()->documentIDWithURL(*url, failure) : 0;
+  if (docID == 0 && !*failure) {
+    *failure = TLError{kDocStoreErrorDomain, kDocumentNotFound, "no document with URL " + shown};
+  }
+  if (*failure) {
+    log().error("Failed to fetch document ID in docstore for URL {}: {}", shown,
+                platform::printable(*failure));
+    return std::nullopt;
+  }
+  _docDates.forget(docID);
+  const bool deleted = docStore()->deleteDocument(docID, failure);
+  if (*failure) {
+    log().error("Failed to delete document with ID {} in docstore: {}", docID,
+                platform::printable(*failure));
+  }
+  return deleted ? std::optional(docID) : std::nullopt;
+}
+
+// A document that the index still finds, and the store no longer has, is no result.
+void TALIndexer::hideDeleted(std::vector<uint32_t>* docIDs) {
+  const auto text = _text.get();
+  if (text != nullptr && !docIDs->empty()) text->index->DeleteDocs(*docIDs);
+  docIDs->clear();
 }
 
 void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
@@ -391,17 +415,18 @@ void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
 }
 
 bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error) {
-  const auto text = _text.get();
+  std::vector<uint32_t> deleted;
   DocDates* const dates = &_docDates;
   const auto store = docStore();
-  return store->enumerateDocIDs(
+  const bool walked = store->enumerateDocIDs(
       error, [&](int64_t, uint32_t docID, const TLURL&, bool* stop, TLErrorOut handlerError) {
         const auto doc = store->documentWithID(docID, nullptr);
         if (doc == nullptr || doc->domainIdentifier() != domain) return;
         std::optional<TLError> failure;
         dates->forget(docID);
         if (store->deleteDocument(docID, &failure)) {
-          if (text != nullptr) text->index->DeleteDoc(docID);
+          deleted.push_back(docID);
+          if (deleted.size() == kDeletedAtATime) hideDeleted(&deleted);
           return;
         }
         log().error("Failed to delete document with doc ID {} in docstore: {}", docID,
@@ -409,4 +434,6 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorO
         if (failure) platform::setError(handlerError, *failure);
         *stop = true;
       });
+  hideDeleted(&deleted);
+  return walked;
 }

@@ -178,26 +178,25 @@ std::chrono::nanoseconds index::throttle(Clock::duration held, MetricsBlock& cou
   return delay;
 }
 
-bool index::DeleteDoc(uint32_t docID) {
-  if (docID == 0) return refuse("Invalid DocID.");
+bool index::DeleteDocs(const std::vector<uint32_t>& docIDs) {
   platform::MutexLock lock(_writeMutex);
   const auto before = deletedDocs();
-  if (before->contains(docID)) return true;
+  DocSet after = *before;
+  for (const uint32_t docID : docIDs) {
+    if (docID == 0) return refuse("Invalid DocID.");
+    if (!after.contains(docID)) after.insert(docID);
+  }
+  if (after.size() == before->size()) return true;
   std::string bytes;
-  bytes.reserve((before->size() + 1) * sizeof docID);
-  const auto add = [&bytes](uint32_t id) {
-    bytes.append(reinterpret_cast<const char*>(&id), sizeof id);
-  };
-  before->forEach(add);
-  add(docID);
+  bytes.reserve(after.size() * sizeof(uint32_t));
+  after.forEach(
+      [&bytes](uint32_t id) { bytes.append(reinterpret_cast<const char*>(&id), sizeof id); });
   leveldb::WriteBatch batch;
   batch.Put(kDeletedKey, bytes);
   if (const leveldb::Status status = _writer.write(&batch); !status.ok()) {
     Log.error("Error writing to db: {}", status.ToString());
     return false;
   }
-  DocSet after = *before;
-  after.insert(docID);
   platform::MutexLock metricsLock(_metricsMutex);
   _deleted = std::make_shared<const DocSet>(std::move(after));
   ++_pageGeneration;

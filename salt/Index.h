@@ -146,6 +146,8 @@ class Index {
   // Hides a document from all readers for good; its ID cannot be added again. True when it is
   // hidden afterwards. The cost grows with the number of deleted documents.
   virtual bool DeleteDoc(uint32_t docID) = 0;
+  // The same for all of them or, when it fails, none, at the cost of one.
+  virtual bool DeleteDocs(const std::vector<uint32_t>& docIDs) = 0;
 
   // Calls `callback` once for each suffix of a live document that begins with `prefix`, hot ones
   // first, then shard by shard, in suffix order within each. The prefix is cut as a suffix is. The

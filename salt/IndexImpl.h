@@ -66,7 +66,8 @@ class index final : public Index {
   [[nodiscard]] std::string GetSuffixText(const SuffixMeta& meta) const override;
   bool AddZone(uint32_t docID, uint16_t zoneID, std::string_view text,
                std::vector<uint32_t>& offsets, bool merge) override;
-  bool DeleteDoc(uint32_t docID) override;
+  bool DeleteDoc(uint32_t docID) override { return DeleteDocs({docID}); }
+  bool DeleteDocs(const std::vector<uint32_t>& docIDs) override;
   bool ScanPrefix(std::string_view prefix,
                   std::function<bool(const SuffixMeta&)> callback) const override;
   void ForEachZone(std::function<bool(uint32_t docID, uint16_t zoneID, std::string_view text)>

@@ -253,8 +253,15 @@ TEST_F(IndexerTest, DeletedDocumentsStayGoneAcrossARestart) {
 }
 
 TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
-  ASSERT_EQ(add({mail("a", "word"), mail("b", "word")}), std::nullopt);
-  const Outcome error = remove({u"a", u"nobody", u"b"});
+  TALIndexer::Items items{mail("b", "word")};
+  TALIndexer::Strings identifiers;
+  for (int i = 0; i < 150; ++i) {
+    items.push_back(mail(std::to_string(i), "word"));
+    identifiers.push_back(*items.back()->identifier());
+  }
+  ASSERT_EQ(add(items), std::nullopt);
+  identifiers.insert(identifiers.end(), {u"nobody", u"b"});
+  const Outcome error = remove(identifiers);
   ASSERT_TRUE(error);
   EXPECT_EQ(error->domain, "DocStore");
   EXPECT_TRUE(
@@ -265,9 +272,9 @@ TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
 
 TEST_F(IndexerTest, DeletesByDomain) {
   TALIndexer::Items items;
-  for (int i = 0; i < 6; ++i) {
+  for (int i = 0; i < 206; ++i) {
     items.push_back(mail(std::to_string(i), "word"));
-    items.back()->setDomainIdentifier(i % 2 == 0 ? u"even" : u"odd");
+    items.back()->setDomainIdentifier(i % 2 == 0 || i > 5 ? u"even" : u"odd");
   }
   ASSERT_EQ(add(items), std::nullopt);
   EXPECT_EQ(outcomeOf([&](auto done) {

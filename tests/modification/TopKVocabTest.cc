@@ -44,6 +44,7 @@ class WatchedIndex final : public salt::Index {
     return false;
   }
   bool DeleteDoc(uint32_t) override { return false; }
+  bool DeleteDocs(const std::vector<uint32_t>&) override { return false; }
   bool ScanPrefix(std::string_view, std::function<bool(const salt::SuffixMeta&)>) const override {
     return true;
   }

@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <numeric>
 
 #include "salt/Index.h"
 #include "tests/salt/SaltSupport.h"
@@ -182,8 +183,12 @@ TEST(DeleteDoc, HidesForGood) {
   const TemporaryDirectory directory;
   auto index = newIndex(directory / "i");
   for (uint32_t docID = 1; docID <= 200; ++docID) ASSERT_TRUE(addZone(*index, docID, 1, "word"));
-  for (uint32_t docID = 1; docID <= 199; ++docID) ASSERT_TRUE(index->DeleteDoc(docID));
-  ASSERT_TRUE(index->DeleteDoc(100));
+  for (uint32_t docID = 1; docID <= 99; ++docID) ASSERT_TRUE(index->DeleteDoc(docID));
+  ASSERT_TRUE(index->DeleteDoc(50));
+  std::vector<uint32_t> others(101);
+  std::iota(others.begin(), others.end(), 99);
+  ASSERT_TRUE(index->DeleteDocs(others));
+  EXPECT_FALSE(index->DeleteDocs({200, 0}));
   for (int round = 0; round < 2; ++round) {
     EXPECT_THAT(scan(*index, "w"), ElementsAre("200,1:0"));
     EXPECT_EQ(index->GetMetrics().DeletedDocs, 199u);
