@@ -55,6 +55,7 @@ int run(int argc, char** argv) {
   std::vector<std::string> paths{TALLOW_SAMPLE_MAIL};
   std::string stateDirectory;
   std::string queryFile;
+  std::string givenQueries;
   size_t queryCount = 200;
   uint32_t seed = 1;
   size_t mistypedCount = 0;
@@ -70,6 +71,8 @@ int run(int argc, char** argv) {
   app.add_option("--seed", seed, "Of the choice of words (default: 1)");
   app.add_option("--write-queries", queryFile,
                  "Write the queries to this file, one a line, instead of searching");
+  app.add_option("--read-queries", givenQueries,
+                 "Take the queries from this file; with --state, no mail is read then");
   app.add_option("--mistyped", mistypedCount,
                  "Time so many queries of three words more, one of them mistyped");
   app.add_flag("-v,--verbose", verbose, "Print each query with its results and milliseconds");
@@ -80,8 +83,10 @@ int run(int argc, char** argv) {
   if (!indexed) stateDirectory = scratch / "state";
   bench::ItemSpool spool(scratch);
   bench::QuerySource source(seed);
-  spool.fill(paths, [&](const client::EncodedItem& item) { source.see(item); });
-  const std::vector<std::string> queries = source.drawAll(queryCount);
+  const bool needsMail = givenQueries.empty() || !indexed || mistypedCount > 0;
+  if (needsMail) spool.fill(paths, [&](const client::EncodedItem& item) { source.see(item); });
+  const std::vector<std::string> queries =
+      givenQueries.empty() ? source.drawAll(queryCount) : bench::readQueries(givenQueries);
   if (!queryFile.empty()) {
     bench::writeQueries(queries, queryFile);
     return 0;

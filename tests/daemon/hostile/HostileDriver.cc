@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <fstream>
 #include <functional>
+#include <latch>
 #include <optional>
 #include <random>
 #include <stop_token>
@@ -77,8 +78,13 @@ class GoodClient {
         const int64_t found = testsupport::search(service, _indexed + " ", kGoodClass);
         expect(found == _batch, fmt::format("search gives {} for {}", found, _batch), error);
       });
+      if (_rounds == 1) _begun.count_down();
     }
   }
+
+  // Until its first calls on both connections have ended: before that, connections that have never
+  // made a call, and its own are among them, make room for newer ones.
+  void waitUntilBegun() const { _begun.wait(); }
 
   [[nodiscard]] std::string report() const {
     return fmt::format("good_rounds={} answers {} batches {}", _rounds, percentiles(_answers),
@@ -109,6 +115,7 @@ class GoodClient {
   const std::string _directory;
   const int _batch;
   int _rounds = 0;
+  std::latch _begun{1};
   std::string _indexed;
   std::vector<double> _answers, _indexing;
 };
@@ -304,6 +311,7 @@ int runFlood(const Options& options) {
     std::vector<std::jthread> threads;
     const auto start = [&threads](auto body) { threads.emplace_back(body); };
     start([&](const std::stop_token& stop) { good.work(stop); });
+    good.waitUntilBegun();
     start([&](const std::stop_token& stop) { holdSilentOnes(path, 2000, stop); });
     start([&](const std::stop_token& stop) { holdSilentOnes(path, 64, stop); });
     start([&](const std::stop_token& stop) { drip(path, 64, stop); });
