@@ -19,6 +19,13 @@ class DocPages {
     return _pages[page][docID % kPageDocs];
   }
 
+  // The value, without taking memory.
+  [[nodiscard]] T at(uint32_t docID) const {
+    const size_t page = docID / kPageDocs;
+    if (page >= _pages.size() || _pages[page] == nullptr) return T();
+    return _pages[page][docID % kPageDocs];
+  }
+
   // Calls visit(docID, value), in order of docID, for each document on a page that has memory.
   template <typename Visit>
   void forEach(const Visit& visit) const {

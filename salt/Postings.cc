@@ -287,7 +287,7 @@ uint64_t PostingsBuilder::budget() const {
 
 void PostingsBuilder::prune(uint64_t mostBytes) {
   while (_madeBytes > mostBytes) {
-    _least *= 2;
+    _least += std::max<uint64_t>(_least / 8, 1);
     std::erase_if(_made, [this](const Made& made) {
       if (made.suffixes >= _least) return false;
       _madeBytes -= made.list.size() + made.text.size();

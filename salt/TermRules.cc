@@ -1,6 +1,7 @@
 #include "salt/TermRules.h"
 
 #include <algorithm>
+#include <cmath>
 
 #include "salt/Database.h"
 
@@ -69,9 +70,66 @@ double zoneFactor(const Term& term, uint32_t zoneMask) {
   return std::min(sum, 1.0);
 }
 
-double factorOf(const Term& term, const DocResult& doc) {
-  if (doc.tokenScore == -1.0) return term.defaultScore;
-  return doc.tokenScore * zoneFactor(term, doc.zoneMask);
+namespace {
+
+// Whether a document that this token is the first to match stays below the threshold, even if later
+// tokens raise its score.
+bool refusesNewDocs(const Term& term, size_t token, double unmatched, double zoneBound,
+                    double need) {
+  double best = term.tokenScores[token];
+  if (term.isMin || term.zones.size() > 1) {
+    best = *std::max_element(term.tokenScores.begin() + static_cast<ptrdiff_t>(token),
+                             term.tokenScores.end());
+  }
+  return unmatched * best * zoneBound < need;
+}
+
+// Whether scores are products of finite numbers that are not negative: then one factor of 0 makes
+// the product 0.
+bool zeroEndsAll(const std::vector<Term>& terms, double any) {
+  const auto fits = [](double value) { return value >= 0 && std::isfinite(value); };
+  double most = 1;
+  for (const Term& term : terms) {
+    double best = std::max(1.0, term.defaultScore);
+    for (const double score : term.tokenScores) {
+      if (!fits(score)) return false;
+      best = std::max(best, score);
+    }
+    if (!fits(term.defaultScore) ||
+        !std::all_of(term.zoneScores.begin(), term.zoneScores.end(), fits)) {
+      return false;
+    }
+    most *= best;
+  }
+  return std::isfinite(most) && std::isfinite(any);
+}
+
+}  // namespace
+
+Evaluation::Evaluation(const std::vector<Term>& terms, const Options& options)
+    : _terms(terms), _options(options), _steps(terms.size()) {
+  const Bounds bounds = boundsOf(terms);
+  const bool zeroEnds = options.threshold > 0 && zeroEndsAll(terms, bounds.any[0]);
+  double unmatched = 1.0;
+  for (size_t u = 0; u < terms.size(); ++u) {
+    const Term& term = terms[u];
+    Step& step = _steps[u];
+    step.skipped = !wellFormed(term);
+    if (step.skipped) continue;
+    step.required = zeroEnds && term.defaultScore == 0;
+    step.unmatched = unmatched;
+    unmatched *= term.defaultScore;
+    const double reach = unmatched * bounds.matched[u + 1];
+    step.prunes = reach < options.threshold;
+    step.need = options.threshold / bounds.any[u + 1];
+    step.refuses.resize(term.tokens.size());
+    step.admitsNobody = true;
+    for (size_t t = 0; t < term.tokens.size(); ++t) {
+      step.refuses[t] = !(options.threshold <= reach) &&
+                        refusesNewDocs(term, t, step.unmatched, bounds.zone[u], step.need);
+      if (!step.refuses[t]) step.admitsNobody = false;
+    }
+  }
 }
 
 }  // namespace saltsearch
