@@ -1,6 +1,7 @@
 #include "cli/Options.h"
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <array>
 #include <iostream>
 #include <limits>
@@ -100,6 +101,30 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 
+// A word with a minus is no option: behind `search` and the like, the minus of what is none of the
+// short options becomes a character that no command line holds, until all is read.
+constexpr char kMinusOfWord = '\x01';
+
+std::vector<std::string> withMarkedWords(int argc, const char* const* argv) {
+  std::vector<std::string> arguments(argv + 1, argv + argc);
+  bool searches = false;
+  for (std::string& argument : arguments) {
+    if (argument == "--") break;
+    const bool isShort = argument == "-h" || argument == "-v" || argument == "-y";
+    if (searches && argument.size() > 1 && argument[0] == '-' && argument[1] != '-' && !isShort) {
+      argument[0] = kMinusOfWord;
+    }
+    searches = searches || argument == "search" || argument == "explain" || argument == "save";
+  }
+  return arguments;
+}
+
+void restoreWords(std::vector<std::string>& words) {
+  for (std::string& word : words) {
+    if (word.starts_with(kMinusOfWord)) word[0] = '-';
+  }
+}
+
 // What is wrong with options that do not go together, or null.
 const char* misuse(const Options& options) {
   if (options.format == OutputFormat::files && options.command != Command::search) {
@@ -128,7 +153,10 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
   addGlobalOptions(app, options);
   for (const CommandRow& row : kCommands) addCommand(app, row, options);
   try {
-    app.parse(argc, argv);
+    std::vector<std::string> arguments = withMarkedWords(argc, argv);
+    std::reverse(arguments.begin(), arguments.end());
+    app.parse(std::move(arguments));
+    restoreWords(options.arguments);
   } catch (const CLI::ParseError& error) {
     status = app.exit(error) == 0 ? ExitStatus::done : ExitStatus::failure;
     return std::nullopt;

@@ -9,6 +9,7 @@
 
 #include "cli/Highlight.h"
 #include "cli/Identifier.h"
+#include "cli/SearchRun.h"
 
 namespace cli {
 
@@ -18,14 +19,6 @@ using Key = TLAttributeKey;
 
 std::string textOf(const std::optional<TLString>& text) {
   return platform::toUTF8(platform::orEmpty(text));
-}
-
-std::optional<double> dateOf(const TLIndexableItem& item) {
-  for (const Key key : {Key::MAIL_DATE_RECEIVED, Key::CONTENT_CREATION_DATE}) {
-    const auto& attribute = item.attributeForKey(key);
-    if (attribute != nullptr && attribute->hasDoubleValue()) return attribute->doubleValue();
-  }
-  return std::nullopt;
 }
 
 // In the time zone of the user.

@@ -1,3 +1,4 @@
+#include <fmt/format.h>
 #include <unistd.h>
 
 #include <nlohmann/json.hpp>
@@ -6,22 +7,17 @@
 #include "cli/Explanation.h"
 #include "cli/QueryInput.h"
 #include "cli/Results.h"
+#include "cli/SearchRun.h"
 #include "client/SearchServiceProxy.h"
+#include "platform/Clock.h"
 
 namespace cli {
 
 namespace {
 
-// The daemon's answer to a query that makes no terms, such as the first quote mark of a phrase that
-// is being typed: it finds nothing.
-bool asksForNothing(const std::optional<TLError>& error) {
-  constexpr int kNoTerms = 3;
-  return error && error->domain == "TALIndexer" && error->code == kNoTerms;
-}
-
 std::optional<QueryInput> readQuery(const Options& options) {
   std::optional<TLError> error;
-  auto input = queryInput(options, &error);
+  auto input = queryInput(options, platform::secondsSince1970(), &error);
   if (!input) {
     complain(error->message);
   } else {
@@ -33,13 +29,22 @@ std::optional<QueryInput> readQuery(const Options& options) {
 std::optional<ResultItems> search(const Options& options, const QueryInput& input,
                                   TLErrorOut error) {
   client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
-  const int64_t limit = options.limit == 0 ? service.kNoMaximum : options.limit;
-  auto items = service.searchItems(*input.query, 0, options.protectionClass, limit, error);
-  if (items || !asksForNothing(*error)) return items;
-  if (input.words.empty()) {
+  MailFacts facts;
+  const size_t wanted = options.limit == 0 ? SIZE_MAX : static_cast<size_t>(options.limit);
+  auto found = runPlan(input.plan, {options.protectionClass, SortOrder::relevance, wanted, false},
+                       service, facts, error);
+  if (!found) return std::nullopt;
+  if (found->items.empty() && input.words.empty() && termsOf(input.plan).empty()) {
     complain(std::string("nothing in the expression can be looked up; see tallow-query(7)"));
   }
-  return ResultItems();
+  if (facts.unreadable() > 0) {
+    complain(fmt::format("{} messages cannot be read to look for what the index does not hold",
+                         facts.unreadable()));
+  }
+  if (!found->complete && found->items.size() < wanted) {
+    complain(fmt::format("only the first {} that may match were looked at", found->lookedAt));
+  }
+  return std::move(found->items);
 }
 
 ExitStatus statusOf(const ResultItems& items) {
@@ -62,8 +67,8 @@ ExitStatus runSearch(const Options& options) {
     case OutputFormat::text:
       break;
   }
-  const std::string text = platform::toUTF8(platform::orEmpty(input->query->originalQuery()));
-  return print(resultsText(*items, text, Palette(colorAllowed(options.color, STDOUT_FILENO))),
+  return print(resultsText(*items, input->markedWords(),
+                           Palette(colorAllowed(options.color, STDOUT_FILENO))),
                statusOf(*items));
 }
 
@@ -71,7 +76,7 @@ ExitStatus runSearch(const Options& options) {
 ExitStatus runExplain(const Options& options) {
   const auto input = readQuery(options);
   if (!input) return ExitStatus::failure;
-  const std::vector<TALTerm> terms = termsOf(*input->query);
+  const std::vector<TALTerm> terms = termsOf(input->plan);
   std::optional<TLError> error;
   const auto items = search(options, *input, &error);
   const Palette palette(colorAllowed(options.color, STDOUT_FILENO));
