@@ -34,7 +34,7 @@ std::optional<ResultItems> search(const Options& options, const QueryInput& inpu
   auto found = runPlan(input.plan, {options.protectionClass, SortOrder::relevance, wanted, false},
                        service, facts, error);
   if (!found) return std::nullopt;
-  if (found->items.empty() && input.words.empty() && termsOf(input.plan).empty()) {
+  if (found->items.empty() && !options.query.empty() && termsOf(input.plan).empty()) {
     complain(std::string("nothing in the expression can be looked up; see tallow-query(7)"));
   }
   if (facts.unreadable() > 0) {

@@ -86,12 +86,13 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
   const std::vector<std::pair<std::vector<std::string>, TLString>> cases{
       {{"invoice", "li"}, u"invoice li"},
       {{"invoice "}, u"invoice "},
-      {{"--", "-x", "--limit"}, u"-x --limit"},
-      {{"it's", "\"a\\b\"", "\\"}, u"it's \"a\\b\" \\"},
+      {{"--", "--limit"}, u"--limit"},
+      {{"it's", "a\\b", "\\"}, u"it's a\\b \\"},
+      {{"bread or", "not", "f(x)", "- e-mail 10:30"}, u"bread or not f(x) - e-mail 10:30"},
       {{"*", "**a*"}, u"* **a*"},
       {{"*"}, u"*"},
       {{"true"}, u"true"},
-      {{"') || (a == 'b", "&&", "$time.now"}, u"') || (a == 'b && $time.now"},
+      {{"') || a == 'b", "&&", "$time.now"}, u"') || a == 'b && $time.now"},
       {{"京都\t\n"}, u"\u4EAC\u90FD\t\n"},
       {{"caf\xE9"}, u"caf\uFFFD"},
       {{""}, u""},
@@ -108,6 +109,28 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
   }
   EXPECT_EQ(run({"search", "--limit", "0", "--class=work", "x"}), ExitStatus::nothingFound);
   EXPECT_THAT(daemon.calls().back(), testing::EndsWith(", 0, work, 9223372036854775807)"));
+}
+
+// Each alternative is a search of its own; what it leaves out is asked for where it finds
+// something.
+TEST_F(CommandsTest, WhatIsNotOnlyWordsBecomesSearches) {
+  const size_t before = daemon.calls().size();
+  EXPECT_EQ(run({"search", "tea", "-milk", "OR", "from:tom"}), ExitStatus::nothingFound);
+  EXPECT_EQ(daemon.calls().size(), before + 2);
+  EXPECT_EQ(
+      printed(*lastQuery()),
+      "\nAND, \n\tOR, \n\t\tLEAF, STRING_EQUAL, AUTHORS, AUTHOR_EMAIL_ADDRESSES, X_FROM, tom");
+  EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 1000);
+  answerWith({result("file/m/a.eml")});
+  EXPECT_EQ(run({"search", "tea", "-milk", "-sugar", "date:2024"}), ExitStatus::nothingFound);
+  EXPECT_EQ(daemon.calls().size(), before + 5);
+  EXPECT_EQ(run({"search", "tea", "date:2024"}), ExitStatus::done);
+  EXPECT_EQ(run({"search", "tea", "date:2023"}), ExitStatus::nothingFound);
+  EXPECT_EQ(run({"search", "\"open", "is:blue", "date:2024"}), ExitStatus::done);
+  EXPECT_EQ(errors,
+            "tallow: the quote is not closed, so what follows it is taken as words\n"
+            "tallow: \"blue\" is not read, unread, flagged, replied or junk, so \"is:blue\" is "
+            "taken as words\n");
 }
 
 TEST_F(CommandsTest, ExpressionsFiltersAndParameters) {
@@ -188,7 +211,7 @@ TEST_F(CommandsTest, ExplainShowsEachStep) {
   EXPECT_EQ(json["terms"][0]["zones"][0]["name"], "SUBJECT");
   EXPECT_FALSE(json.contains("filterSteps"));
   daemon.failOnce("SearchItemsForQuery", {"TALIndexer", 3, "no terms"});
-  EXPECT_EQ(run({"explain", "--query", "com_quill_mail_read = 1"}), ExitStatus::nothingFound);
+  EXPECT_EQ(run({"explain", "--query", "false"}), ExitStatus::nothingFound);
   EXPECT_THAT(output, HasSubstr("terms\n  (none)\n"));
   EXPECT_THAT(errors, HasSubstr("nothing in the expression can be looked up"));
   // Without the daemon the steps are shown as well.
