@@ -71,7 +71,7 @@ class Run {
       const bool enough = results.items.size() >= _request.wanted && !needsAll();
       const bool last = step == std::end(kCandidateSteps)[-1] || _fixed;
       if (!_truncated || enough || last) {
-        results.complete = !_truncated;
+        results.complete = results.complete && !_truncated;
         results.lookedAt = _lookedAt;
         return results;
       }
@@ -149,7 +149,10 @@ class Run {
   SearchResults check(const std::vector<Candidate>& candidates) {
     SearchResults results;
     for (const Candidate& candidate : candidates) {
-      if (!_request.complete && results.items.size() >= _request.wanted) break;
+      if (!_request.complete && results.items.size() >= _request.wanted) {
+        results.complete = false;
+        break;
+      }
       const bool holds = std::any_of(
           candidate.branches.begin(), candidate.branches.end(), [&](const Branch* branch) {
             return std::all_of(branch->checks.begin(), branch->checks.end(),

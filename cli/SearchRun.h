@@ -10,8 +10,6 @@
 
 namespace cli {
 
-enum class SortOrder { relevance, date };
-
 // What is asked of a search beside its plan.
 struct SearchRequest {
   std::string protectionClass;

@@ -5,6 +5,7 @@
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
+#include "cli/Identifier.h"
 #include "platform/Files.h"
 #include "query/TLQueryAdditions.h"
 #include "records/TLIndexableItem.h"
@@ -101,7 +102,7 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
     std::vector<std::string> arguments{"search"};
     arguments.insert(arguments.end(), words.begin(), words.end());
     EXPECT_EQ(run(arguments), ExitStatus::nothingFound);
-    EXPECT_EQ(errors, "");
+    EXPECT_EQ(errors, "tallow: no match\n");
     const auto sent = lastQuery();
     EXPECT_EQ(sent->originalQuery(), text);
     EXPECT_FALSE(sent->hasRoot() || sent->hasSearchParams());
@@ -143,14 +144,15 @@ TEST_F(CommandsTest, ExpressionsFiltersAndParameters) {
       run({"search", "x", "--filter", "kTLItemAuthors = a || kTLItemAuthors = b", "y",
            "--filter=kTLItemSubject = c", "--param", "salt.maxTopK=5,ranking.freshnessWeight=1"}),
       ExitStatus::nothingFound);
-  EXPECT_EQ(errors, "");
+  EXPECT_EQ(errors, "tallow: no match\n");
   EXPECT_EQ(printed(*lastQuery()),
             "x y\nAND, \n\tOR, \n\t\tLEAF, STRING_EQUAL, AUTHORS, a\n\t\tLEAF, STRING_EQUAL, "
             "AUTHORS, b\n\tLEAF, STRING_EQUAL, SUBJECT, c");
   EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 5);
   EXPECT_EQ(run({"search", "--query", "kTLItemSubject = a) || b", "--class", "c"}),
             ExitStatus::nothingFound);
-  EXPECT_EQ(errors, "tallow: the expression ends before \"|| b\", the rest is ignored\n");
+  EXPECT_EQ(errors,
+            "tallow: the expression ends before \"|| b\", the rest is ignored\ntallow: no match\n");
   EXPECT_EQ(run({"search", "x", "--filter", "none = a"}), ExitStatus::nothingFound);
   EXPECT_THAT(errors, HasSubstr("tallow: there is no attribute none\n"));
 }
@@ -234,8 +236,13 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
   EXPECT_EQ(run({"--format=files", "search", "invo"}), ExitStatus::done);
   EXPECT_EQ(output, "/m/in box:7\n/m/a.eml\nother:1\n");
   EXPECT_EQ(run({"search", "--format", "json", "invo"}), ExitStatus::done);
-  const auto json = nlohmann::json::parse(output);
+  const auto answer = nlohmann::json::parse(output);
+  EXPECT_EQ(answer["schema"], 1);
+  EXPECT_EQ(answer["total"], 3);
+  EXPECT_EQ(answer["complete"], true);
+  const auto& json = answer["results"];
   ASSERT_EQ(json.size(), 3u);
+  EXPECT_EQ(json[1]["time"], "2024-01-08T08:00:00+00:00");
   EXPECT_EQ(json[1]["rank"], 2);
   EXPECT_EQ(json[1]["subject"], "Invoice \x1b[31m\u202E");
   EXPECT_EQ(json[1]["date"], 1704700800.0);
@@ -248,6 +255,38 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
       HasSubstr("   2      1.5000      0.7500     0.5000  2024-01-08 08:00  file/m/a.eml\n"));
   EXPECT_EQ(run({"explain", "--format=json", "invo"}), ExitStatus::done);
   EXPECT_EQ(nlohmann::json::parse(output)["results"][0]["textScore"], 1.5);
+}
+
+TEST_F(CommandsTest, CopiesOfAMessageAreOneResult) {
+  const testsupport::TemporaryDirectory mail;
+  std::vector<std::shared_ptr<TLIndexableItem>> items;
+  for (const auto& [name, id] : {std::pair("a", "<1@x>"), {"b", "<2@x>"}, {"c", "<1@x>"}}) {
+    const std::string path = mail / (std::string(name) + ".eml");
+    platform::writeFileAtomically(path, fmt::format("Message-ID:\n {}\nSubject: s\n\n", id),
+                                  nullptr);
+    items.push_back(result(cli::fileIdentifier(path).c_str()));
+  }
+  answerWith(items);
+  EXPECT_EQ(run({"search", "--count", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, "2\n");
+  EXPECT_EQ(run({"search", "--format=message-ids", "--offset=1", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, "2@x\n");
+  EXPECT_EQ(run({"search", "--format=files", "--print0", "--limit=1", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, mail / "a.eml" + '\0' + mail / "c.eml" + '\0');
+  EXPECT_EQ(run({"search", "x"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("     also file/"));
+  EXPECT_EQ(run({"search", "--format=json", "x", "--offset", "1"}), ExitStatus::done);
+  const auto json = nlohmann::json::parse(output);
+  EXPECT_EQ(json["total"], 2);
+  EXPECT_EQ(json["results"][0]["rank"], 2);
+  EXPECT_EQ(json["results"][0]["messageID"], "2@x");
+  EXPECT_EQ(json["results"][0]["path"], mail / "b.eml");
+  items[1]->addAttributeWithKeyDoubleValue(TLAttributeKey::CONTENT_CREATION_DATE, 1);
+  items[1]->attributeForKey(TLAttributeKey::MAIL_DATE_RECEIVED)->setDoubleValue(1704800000);
+  answerWith(items);
+  EXPECT_EQ(run({"search", "--sort=date", "--format=message-ids", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, "2@x\n1@x\n");
+  EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 1000);
 }
 
 TEST_F(CommandsTest, IndexNamesTheItemsThatTheDaemonRefuses) {

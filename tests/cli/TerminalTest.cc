@@ -82,3 +82,21 @@ TEST(Terminal, ProgressIsOneLineOfTheGivenWidth) {
   EXPECT_EQ(cli::progressText(1, 1 << 30, 1, 100, 200).find("left") == std::string::npos, false);
   EXPECT_EQ(cli::progressText(50, 200, 100, 10, 20).size(), 20u);
 }
+
+TEST(Fitted, CountsColumns) {
+  const struct {
+    const char* text;
+    size_t columns;
+    const char* fitted;
+  } kCases[] = {
+      {"abc", 0, "abc"},
+      {"abc", 3, "abc"},
+      {"abcd", 3, "ab…"},
+      {"京都", 4, "京都"},
+      {"京都旅", 4, "京…"},
+      {"京都旅", 5, "京都…"},
+      {"e\u0301e\u0301", 2, "e\u0301e\u0301"},
+      {"e\u0301e\u0301e", 2, "e\u0301…"},
+  };
+  for (const auto& c : kCases) EXPECT_EQ(cli::fitted(c.text, c.columns), c.fitted) << c.text;
+}
