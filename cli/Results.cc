@@ -2,6 +2,7 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <ctime>
@@ -12,12 +13,16 @@
 #include "cli/Highlight.h"
 #include "cli/Identifier.h"
 #include "cli/SearchRun.h"
+#include "cli/TextMatch.h"
 
 namespace cli {
 
 namespace {
 
 using Key = TLAttributeKey;
+
+// A longer mail is not read to show where the words are.
+constexpr uint64_t kMaxContextBytes = uint64_t{1} << 20;
 
 constexpr double kYear9999 = 253402300799;
 
@@ -164,8 +169,27 @@ Hits joinCopies(const ResultItems& items, MailFacts& facts) {
   return hits;
 }
 
-std::string resultsText(const Page& page, const std::string& query, const Palette& palette,
-                        size_t columns) {
+// The snippet where it shows a word, else the place in the mail that has the most of them. Only as
+// much as the columns show counts, 0 for no limit.
+std::string contextOf(const TLIndexableItem& item, const std::vector<std::string>& words,
+                      size_t columns, MailFacts& facts) {
+  constexpr size_t kMaxCharacters = 200;
+  constexpr size_t kMarks = 4;  // for what is left out at both ends
+  std::string snippet = textOf(item.stringValueForKey(Key::CONTENT_SNIPPET));
+  if (words.empty() || holdsWord(fitted(snippet, columns), words)) return snippet;
+  const std::string identifier = textOf(item.identifier());
+  const auto size = facts.reader().locate(identifier) ? facts.size(identifier) : std::nullopt;
+  if (!size || *size > kMaxContextBytes) return snippet;
+  const auto whole = facts.item(identifier);
+  if (whole == nullptr) return snippet;
+  const size_t characters =
+      columns == 0 ? kMaxCharacters : std::min(kMaxCharacters, columns - kMarks);
+  const std::string passage = passageOf(platform::toUTF8(bodyText(*whole)), words, characters);
+  return passage.empty() ? snippet : passage;
+}
+
+std::string resultsText(const Page& page, const std::string& query, MailFacts& facts,
+                        const Palette& palette, size_t columns) {
   constexpr size_t kIndent = 5;
   const auto words = queryWords(query);
   const size_t width = columns > 2 * kIndent ? columns - kIndent : 0;
@@ -179,7 +203,7 @@ std::string resultsText(const Page& page, const std::string& query, const Palett
   for (const Hit& hit : page.hits) {
     const TLIndexableItem& item = *hit.item;
     const std::string subject = textOf(item.stringValueForKey(Key::SUBJECT));
-    const std::string snippet = textOf(item.stringValueForKey(Key::CONTENT_SNIPPET));
+    const std::string snippet = contextOf(item, words, width, facts);
     constexpr size_t kBeforeAuthors = 18;
     const size_t authors = width > 2 * kBeforeAuthors ? width - kBeforeAuthors : 0;
     out += fmt::format("{}{:3}{}  {}{}{}  {}{}{}\n", palette.rank, rank++, palette.end,

@@ -35,8 +35,8 @@ struct Page {
 };
 
 // The output of a search as one text, clean of control characters. Lines fit into so many columns,
-// 0 for no limit.
-[[nodiscard]] std::string resultsText(const Page& page, const std::string& words,
+// 0 for no limit. Where the snippet holds no word, the mail is read for the place that does.
+[[nodiscard]] std::string resultsText(const Page& page, const std::string& words, MailFacts& facts,
                                       const Palette& palette, size_t columns);
 // An object: "schema" is 1, "total" and "complete" as in the page, "results" a list of objects.
 [[nodiscard]] std::string resultsJSON(const Page& page, MailFacts& facts);

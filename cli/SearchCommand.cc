@@ -87,8 +87,8 @@ std::string outputOf(const Options& options, const QueryInput& input, const Page
     case OutputFormat::text:
       break;
   }
-  return resultsText(page, input.markedWords(), Palette(colorAllowed(options.color, STDOUT_FILENO)),
-                     columnsOf(STDOUT_FILENO));
+  return resultsText(page, input.markedWords(), facts,
+                     Palette(colorAllowed(options.color, STDOUT_FILENO)), columnsOf(STDOUT_FILENO));
 }
 
 }  // namespace

@@ -100,3 +100,20 @@ TEST(Fitted, CountsColumns) {
   };
   for (const auto& c : kCases) EXPECT_EQ(cli::fitted(c.text, c.columns), c.fitted) << c.text;
 }
+
+TEST(Passage, ShowsWhereTheMostWordsAre) {
+  const std::string text =
+      "One invoice came.\n\n" + std::string(100, 'x') +
+      " then the second\n  invoice for   the boat shed came, and was paid late";
+  const auto passage = [&](const char* query, size_t characters) {
+    return cli::passageOf(text, cli::queryWords(query), characters);
+  };
+  EXPECT_EQ(passage("invoice boat", 60), "… the second invoice for the boat shed came, and was …");
+  EXPECT_EQ(passage("invoice", 24), "One invoice came. …");
+  EXPECT_EQ(passage("late", 40), "… was paid late");
+  EXPECT_EQ(passage("zebra", 40), "");
+  EXPECT_EQ(passage("", 40), "");
+  EXPECT_FALSE(passage("xx", 10).empty());
+  EXPECT_TRUE(cli::holdsWord("Café", {"cafe"}));
+  EXPECT_FALSE(cli::holdsWord("Café", {"tea"}));
+}
