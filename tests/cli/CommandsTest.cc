@@ -402,6 +402,7 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
     EXPECT_EQ(run({command}), ExitStatus::unreachable) << command;
   }
   EXPECT_EQ(run({"search", "x"}), ExitStatus::unreachable);
+  EXPECT_THAT(errors, HasSubstr("systemctl --user start tallowsearchd.socket"));
   EXPECT_EQ(run({"delete", "x"}), ExitStatus::unreachable);
   EXPECT_EQ(run({"index", TALLOW_SAMPLE_MAIL}), ExitStatus::unreachable);
 }
