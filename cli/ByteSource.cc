@@ -6,7 +6,9 @@
 #include <unistd.h>
 #include <zlib.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <memory>
 #include <string_view>
 
@@ -67,6 +69,20 @@ class FileSource final : public ByteSource {
     return count;
   }
   uint64_t consumed() const override { return _consumed; }
+
+  // Does not read what it passes over.
+  bool advance(uint64_t count, TLErrorOut error) override {
+    const size_t buffered = static_cast<size_t>(std::min<uint64_t>(count, _end - _begin));
+    skip(buffered);
+    const uint64_t rest = count - buffered;
+    if (rest == 0) return true;
+    if (rest > INT64_MAX || lseek(_descriptor, static_cast<off_t>(rest), SEEK_CUR) < 0) {
+      platform::setError(error, platform::posixError(errno, "cannot read"));
+      return false;
+    }
+    _consumed += rest;
+    return true;
+  }
 
  private:
   const int _descriptor;
@@ -155,6 +171,18 @@ class XzSource final : public ByteSource {
 };
 
 }  // namespace
+
+bool ByteSource::advance(uint64_t count, TLErrorOut error) {
+  const auto buffer = std::make_unique_for_overwrite<char[]>(kBufferBytes);
+  while (count > 0) {
+    const auto bytes =
+        read(buffer.get(), static_cast<size_t>(std::min<uint64_t>(count, kBufferBytes)), error);
+    if (!bytes) return false;
+    if (*bytes == 0) return true;
+    count -= *bytes;
+  }
+  return true;
+}
 
 std::unique_ptr<ByteSource> openByteSource(const std::string& path, TLErrorOut error) {
   // O_NONBLOCK, so that a pipe in the place of a file does not hold us up.

@@ -20,6 +20,9 @@ class ByteSource {
   // error, when the file cannot be read or decompressed any further.
   [[nodiscard]] virtual std::optional<size_t> read(char* buffer, size_t size, TLErrorOut error) = 0;
 
+  // Passes over so many bytes, as far as there are any; false, with an error, as for `read`.
+  [[nodiscard]] virtual bool advance(uint64_t count, TLErrorOut error);
+
   // How much of the file itself has been read.
   [[nodiscard]] virtual uint64_t consumed() const = 0;
 };

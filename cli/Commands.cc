@@ -193,6 +193,11 @@ ExitStatus complain(const std::optional<TLError>& error) {
   const bool unreachable = client::isUnreachable(error);
   complain(unreachable ? error->message
                        : fmt::format("{} ({} {})", error->message, error->domain, error->code));
+  if (unreachable) {
+    complain(
+        std::string("is tallowsearchd running? \"systemctl --user start "
+                    "tallowsearchd.socket\" starts it, --wait 10 waits for it"));
+  }
   return unreachable ? ExitStatus::unreachable : ExitStatus::failure;
 }
 

@@ -95,13 +95,25 @@ std::vector<TALTerm> termsOf(const TLQuery& query) {
   return processor == nullptr ? std::vector<TALTerm>() : processor->termsFromQuery(*resolved);
 }
 
+std::vector<TALTerm> termsOf(const SearchPlan& plan) {
+  std::vector<TALTerm> all;
+  for (const Branch& branch : plan.branches) {
+    std::vector<TALTerm> terms = termsOf(*branch.query);
+    all.insert(all.end(), terms.begin(), terms.end());
+  }
+  return all;
+}
+
 std::string explanationText(const QueryInput& input, const std::vector<TALTerm>& terms,
                             const Palette& palette) {
-  std::string out = stepsText(input.main, "query", palette);
+  const bool typed = !input.typed.plain;
+  std::string out = typed ? section("understood as", input.main.parseTree, palette)
+                          : stepsText(input.main, "query", palette);
   if (input.filter) out += stepsText(*input.filter, "filter", palette);
+  if (!input.plan.asTyped) out += section("plan", planText(input.plan), palette);
   // Between marks, since a blank at the end means that the last word is whole.
   const std::string text = platform::toUTF8(platform::orEmpty(input.query->originalQuery()));
-  out += section("original query", "->" + text + "<-", palette);
+  if (!typed) out += section("original query", "->" + text + "<-", palette);
   std::string lines;
   for (const TALTerm& term : terms) lines += term.description() + '\n';
   return out + section("terms", terms.empty() ? "(none)" : lines, palette);
@@ -113,6 +125,8 @@ nlohmann::json explanationJSON(const QueryInput& input, const std::vector<TALTer
   nlohmann::json json{{"query", input.query->dictionaryRepresentation()},
                       {"steps", stepsJSON(input.main)},
                       {"terms", std::move(list)}};
+  if (!input.typed.plain) json["understoodAs"] = input.main.parseTree;
+  if (!input.plan.asTyped) json["plan"] = planText(input.plan);
   if (input.filter) json["filterSteps"] = stepsJSON(*input.filter);
   return json;
 }

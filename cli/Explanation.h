@@ -13,6 +13,8 @@ namespace cli {
 // The terms that the daemon makes of the query, under its parameters over the defaults. None where
 // there is no tokenizer.
 [[nodiscard]] std::vector<TALTerm> termsOf(const TLQuery& query);
+// The same for the queries of all branches, but for what they leave out.
+[[nodiscard]] std::vector<TALTerm> termsOf(const SearchPlan& plan);
 
 // The output of explain, but for the results: each step from the expression to the terms.
 [[nodiscard]] std::string explanationText(const QueryInput& input,

@@ -63,20 +63,105 @@ std::vector<std::string> queryWords(std::string_view query) {
   return words;
 }
 
+namespace {
+
+std::vector<icu::UnicodeString> foldedWords(const std::vector<std::string>& words) {
+  std::vector<icu::UnicodeString> all;
+  for (const std::string& word : words) all.push_back(fold(platform::fromUTF8(word)));
+  return all;
+}
+
+// The first of the words that a run begins with; the number of words where there is none. Scripts
+// without blanks between words match anywhere in a run.
+size_t matchOf(TLStringView run, const std::vector<icu::UnicodeString>& words) {
+  const icu::UnicodeString bare = fold(run);
+  const auto found = std::find_if(words.begin(), words.end(), [&](const auto& wanted) {
+    if (wanted.isEmpty()) return false;
+    return bare.startsWith(wanted) || (wanted.char32At(0) >= 0x2E80 && bare.indexOf(wanted) >= 0);
+  });
+  return static_cast<size_t>(found - words.begin());
+}
+
+// A place of a word in a text, and which one it is.
+struct Place {
+  size_t at;
+  size_t word;
+};
+
+// The first of the places from which on, in so many characters, there are the most different words.
+// The window slides, with a count of each word in it.
+size_t bestPlace(const std::vector<Place>& places, size_t words, size_t characters) {
+  std::vector<size_t> counts(words);
+  size_t best = 0;
+  size_t most = 0;
+  size_t different = 0;
+  for (size_t first = 0, end = 0; first < places.size(); ++first) {
+    for (; end < places.size() && places[end].at < places[first].at + characters; ++end) {
+      if (counts[places[end].word]++ == 0) ++different;
+    }
+    if (different > most) best = first;
+    most = std::max(most, different);
+    if (--counts[places[first].word] == 0) --different;
+  }
+  return places[best].at;
+}
+
+bool isSpace(char16_t c) {
+  return u_isUWhiteSpace(c) != 0;
+}
+
+// With one blank in place of white space.
+std::string oneLine(TLStringView text) {
+  TLString line;
+  for (const char16_t c : text) {
+    if (!isSpace(c)) line.push_back(c);
+    if (isSpace(c) && !line.empty() && line.back() != u' ') line.push_back(u' ');
+  }
+  while (line.ends_with(u' ')) line.pop_back();
+  return platform::toUTF8(line);
+}
+
+}  // namespace
+
+bool holdsWord(std::string_view text, const std::vector<std::string>& words) {
+  const auto wanted = foldedWords(words);
+  bool found = false;
+  forEachRun(platform::fromUTF8(text), [&](TLStringView run, bool word) {
+    found = found || (word && matchOf(run, wanted) < wanted.size());
+  });
+  return found;
+}
+
+std::string passageOf(std::string_view text, const std::vector<std::string>& words,
+                      size_t characters) {
+  const auto wanted = foldedWords(words);
+  const TLString units = platform::fromUTF8(text);
+  std::vector<Place> places;
+  size_t at = 0;
+  forEachRun(units, [&](TLStringView run, bool word) {
+    const size_t match = word ? matchOf(run, wanted) : wanted.size();
+    if (match < wanted.size()) places.push_back({at, match});
+    at += run.size();
+  });
+  if (places.empty()) return {};
+  const size_t hit = bestPlace(places, wanted.size(), characters / 2);
+  // A quarter goes before it; neither end cuts a word.
+  size_t begin = hit - std::min(hit, characters / 4);
+  size_t end = std::min(units.size(), begin + characters);
+  while (begin > 0 && begin < hit && !isSpace(units[begin - 1])) ++begin;
+  while (end < units.size() && end > hit + 1 && !isSpace(units[end])) --end;
+  if (end == hit + 1) end = std::min(units.size(), hit + characters / 2);
+  return (begin > 0 ? "… " : "") + oneLine(TLStringView(units).substr(begin, end - begin)) +
+         (end < units.size() ? " …" : "");
+}
+
 std::string highlight(std::string_view text, const std::vector<std::string>& words,
                       std::string_view begin, std::string_view end) {
   if (begin.empty() || words.empty()) return std::string(text);
-  std::vector<icu::UnicodeString> folded;
-  for (const std::string& word : words) folded.push_back(fold(platform::fromUTF8(word)));
+  const auto wanted = foldedWords(words);
   std::string out;
   forEachRun(platform::fromUTF8(text), [&](TLStringView run, bool word) {
-    const icu::UnicodeString bare = word ? fold(run) : icu::UnicodeString();
-    // Scripts without blanks between words match anywhere in a run.
-    const bool match = word && std::any_of(folded.begin(), folded.end(), [&](const auto& wanted) {
-                         if (wanted.isEmpty()) return false;
-                         return bare.startsWith(wanted) ||
-                                (wanted.char32At(0) >= 0x2E80 && bare.indexOf(wanted) >= 0);
-                       });
+    const bool match = word && matchOf(run, wanted) < wanted.size();
     if (match) out += begin;
     platform::appendUTF8(run, out);
     if (match) out += end;

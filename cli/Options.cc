@@ -1,6 +1,7 @@
 #include "cli/Options.h"
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <array>
 #include <iostream>
 #include <limits>
@@ -41,8 +42,12 @@ constexpr std::array<CommandRow, 12> kCommands{{
     {Command::validate, "validate", "Check the text index, while no daemon runs", nullptr, false},
 }};
 
-const std::map<std::string, OutputFormat> kFormats{
-    {"text", OutputFormat::text}, {"json", OutputFormat::json}, {"files", OutputFormat::files}};
+const std::map<std::string, OutputFormat> kFormats{{"text", OutputFormat::text},
+                                                   {"json", OutputFormat::json},
+                                                   {"files", OutputFormat::files},
+                                                   {"message-ids", OutputFormat::messageIDs}};
+const std::map<std::string, SortOrder> kSortOrders{{"relevance", SortOrder::relevance},
+                                                   {"date", SortOrder::date}};
 const std::map<std::string, ColorMode> kColors{
     {"auto", ColorMode::automatic}, {"always", ColorMode::always}, {"never", ColorMode::never}};
 
@@ -57,7 +62,8 @@ void addGlobalOptions(CLI::App& app, Options& options) {
       ->type_name("CLASS");
   app.add_option("--name", options.name, "Name of this client (default: tallow)")
       ->type_name("NAME");
-  app.add_option("--format", options.format, "Output: text, json, or for search also files")
+  app.add_option("--format", options.format,
+                 "Output: text, json, or for search also files or message-ids")
       ->transform(CLI::CheckedTransformer(kFormats).description(""))
       ->type_name("FORMAT");
   app.add_option("--limit", options.limit, "Most results of a search, 0 for all (default: 20)")
@@ -88,6 +94,17 @@ void addQueryOptions(CLI::App& sub, Options& options) {
       ->type_name("KEY=VALUE,...");
 }
 
+void addResultOptions(CLI::App& sub, Options& options) {
+  sub.add_option("--sort", options.sort, "Order: relevance, or date for the newest first")
+      ->transform(CLI::CheckedTransformer(kSortOrders).description(""))
+      ->type_name("ORDER");
+  sub.add_option("--offset", options.offset, "Results to pass over")
+      ->check(CLI::Range(int64_t{0}, std::numeric_limits<int64_t>::max() / 2).description(""))
+      ->type_name("N");
+  sub.add_flag("--count", options.count, "Show only how many results there are");
+  sub.add_flag("--print0", options.print0, "Of files and message-ids: NUL in place of line feeds");
+}
+
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   CLI::App* const sub = app.add_subcommand(row.name, row.help);
   sub->fallthrough();
@@ -97,14 +114,42 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
     if (row.command == Command::ping) operands->expected(0, 1);
   }
   if (isSearch(row.command)) addQueryOptions(*sub, options);
+  if (row.command == Command::search) addResultOptions(*sub, options);
   sub->callback([&options, command = row.command] { options.command = command; });
+}
+
+// A word with a minus is no option: behind `search` and the like, the minus of what is none of the
+// short options becomes a character that no command line holds, until all is read.
+constexpr char kMinusOfWord = '\x01';
+
+std::vector<std::string> withMarkedWords(int argc, const char* const* argv) {
+  std::vector<std::string> arguments(argv + 1, argv + argc);
+  bool searches = false;
+  for (std::string& argument : arguments) {
+    if (argument == "--") break;
+    const bool isShort = argument == "-h" || argument == "-v" || argument == "-y";
+    if (searches && argument.size() > 1 && argument[0] == '-' && argument[1] != '-' && !isShort) {
+      argument[0] = kMinusOfWord;
+    }
+    searches = searches || argument == "search" || argument == "explain" || argument == "save";
+  }
+  return arguments;
+}
+
+void restoreWords(std::vector<std::string>& words) {
+  for (std::string& word : words) {
+    if (word.starts_with(kMinusOfWord)) word[0] = '-';
+  }
 }
 
 // What is wrong with options that do not go together, or null.
 const char* misuse(const Options& options) {
-  if (options.format == OutputFormat::files && options.command != Command::search) {
-    return "--format=files is for search only";
+  const bool list =
+      options.format == OutputFormat::files || options.format == OutputFormat::messageIDs;
+  if (list && options.command != Command::search) {
+    return "--format=files and --format=message-ids are for search only";
   }
+  if (options.print0 && !list) return "--print0 goes with --format=files or --format=message-ids";
   if (options.format == OutputFormat::json && options.command == Command::dump) {
     return "a dump is text only";
   }
@@ -128,7 +173,10 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
   addGlobalOptions(app, options);
   for (const CommandRow& row : kCommands) addCommand(app, row, options);
   try {
-    app.parse(argc, argv);
+    std::vector<std::string> arguments = withMarkedWords(argc, argv);
+    std::reverse(arguments.begin(), arguments.end());
+    app.parse(std::move(arguments));
+    restoreWords(options.arguments);
   } catch (const CLI::ParseError& error) {
     status = app.exit(error) == 0 ? ExitStatus::done : ExitStatus::failure;
     return std::nullopt;

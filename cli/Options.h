@@ -33,7 +33,8 @@ enum class Command {
   dump,
   validate
 };
-enum class OutputFormat { text, json, files };
+enum class OutputFormat { text, json, files, messageIDs };
+enum class SortOrder { relevance, date };
 
 struct Options {
   Command command = Command::ping;
@@ -48,7 +49,11 @@ struct Options {
   std::string name = "tallow";
   OutputFormat format = OutputFormat::text;
   ColorMode color = ColorMode::automatic;
-  int64_t limit = 20;      // 0 for all
+  int64_t limit = 20;  // 0 for all
+  int64_t offset = 0;  // results that are passed over
+  SortOrder sort = SortOrder::relevance;
+  bool count = false;      // only the number of results
+  bool print0 = false;     // NUL behind each entry of a list
   double waitSeconds = 0;  // for the daemon to come up
   bool yes = false;
   bool verbose = false;

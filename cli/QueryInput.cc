@@ -138,14 +138,63 @@ bool readParameters(const std::string& text, TLQuery& query, TLErrorOut error) {
   return true;
 }
 
+// What was typed is not only words: there is no expression to show.
+void readTyped(QueryInput& input) {
+  input.query = std::make_shared<TLQuery>();
+  input.query->setRawQuery(platform::fromUTF8(input.words));
+  input.query->setOriginalQuery(TLString());
+  input.main = {input.words, usersyntax::printed(input.typed.root), nullptr, nullptr};
+}
+
+// As one query of the daemon's where that tells all, else as a plan.
+bool makePlan(QueryInput& input, bool typed, TLErrorOut error) {
+  const TLQuery& query = *input.query;
+  if (!typed && !hasCheckedConditions(query.root().get())) {
+    input.plan.branches.push_back({input.query, {}, {}});
+    input.plan.asTyped = true;
+    return true;
+  }
+  auto plan = planSearch(typed ? input.typed.root : usersyntax::Node(),
+                         TLString(platform::orEmpty(query.originalQuery())), query.root().get(),
+                         query.searchParams().get(), error);
+  if (!plan) return false;
+  input.plan = std::move(*plan);
+  input.remarks.insert(input.remarks.end(), input.plan.remarks.begin(), input.plan.remarks.end());
+  return true;
+}
+
 }  // namespace
 
-std::optional<QueryInput> queryInput(const Options& options, TLErrorOut error) {
+std::string QueryInput::markedWords() const {
+  if (typed.plain) return platform::toUTF8(platform::orEmpty(query->originalQuery()));
+  std::string marked;
+  std::vector<const usersyntax::Node*> open{&typed.root};
+  while (!open.empty()) {
+    const usersyntax::Node& node = *open.back();
+    open.pop_back();
+    if (node.kind == usersyntax::Kind::negation) continue;
+    if (node.kind == usersyntax::Kind::text) marked += node.text + ' ';
+    for (auto child = node.children.rbegin(); child != node.children.rend(); ++child) {
+      open.push_back(&*child);
+    }
+  }
+  return marked;
+}
+
+std::optional<QueryInput> queryInput(const Options& options, double now, TLErrorOut error) {
   QueryInput input;
   input.words = joinedWords(options.arguments);
+  if (options.query.empty()) input.typed = usersyntax::parse(input.words, now);
+  input.remarks = input.typed.remarks;
+  const bool typed = !input.typed.plain;
   const std::string expression = options.query.empty() ? disjunctionOf(input.words) : options.query;
-  if (!readMain(expression, input, error) || !readFilters(options.filters, input, error) ||
-      !readParameters(options.parameters, *input.query, error)) {
+  if (typed) {
+    readTyped(input);
+  } else if (!readMain(expression, input, error)) {
+    return std::nullopt;
+  }
+  if (!readFilters(options.filters, input, error) ||
+      !readParameters(options.parameters, *input.query, error) || !makePlan(input, typed, error)) {
     return std::nullopt;
   }
   return input;

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "cli/Options.h"
+#include "cli/SearchPlan.h"
 #include "platform/TLError.h"
 #include "records/TLQuery.h"
 
@@ -25,13 +26,20 @@ struct QueryInput {
   std::shared_ptr<TLQuery> query;
   Understanding main;
   std::optional<Understanding> filter;  // all filters together
+  usersyntax::Query typed;              // what the words are in a person's syntax
+  SearchPlan plan;
   // What the user should know: what of an expression is not read, or not known.
   std::vector<std::string> remarks;
+
+  // The words to mark in results, as one text.
+  [[nodiscard]] std::string markedWords() const;
 };
 
-// Words go the way of the query of a mail client: one disjunction over the attributes that hold
-// text, out of which optimising makes free text again. None, with an error, for expressions or
-// parameters that cannot be read.
-[[nodiscard]] std::optional<QueryInput> queryInput(const Options& options, TLErrorOut error);
+// Nothing but words goes the way of the query of a mail client: one disjunction over the attributes
+// that hold text, out of which optimising makes free text again. All else, and conditions that the
+// daemon does not look up, becomes a plan of several queries and checks. None, with an error, for
+// expressions or parameters that cannot be read. `now` is in seconds since 1970.
+[[nodiscard]] std::optional<QueryInput> queryInput(const Options& options, double now,
+                                                   TLErrorOut error);
 
 }  // namespace cli

@@ -2,9 +2,11 @@
 
 #include <memory>
 #include <nlohmann/json_fwd.hpp>
+#include <span>
 #include <string>
 #include <vector>
 
+#include "cli/MailFacts.h"
 #include "cli/Options.h"
 #include "cli/Terminal.h"
 #include "records/TLIndexableItem.h"
@@ -13,13 +15,36 @@ namespace cli {
 
 using ResultItems = std::vector<std::shared_ptr<TLIndexableItem>>;
 
-// The output of a search as one text, clean of control characters.
-[[nodiscard]] std::string resultsText(const ResultItems& items, const std::string& query,
-                                      const Palette& palette);
-[[nodiscard]] std::string resultsJSON(const ResultItems& items);
-// A path a line, with ":OFFSET" for a message of an mbox file. An identifier of another client
-// stands as it is.
-[[nodiscard]] std::string resultsFiles(const ResultItems& items);
+// A result: the best of the copies of one message, and where the others are.
+struct Hit {
+  std::shared_ptr<TLIndexableItem> item;
+  std::vector<std::shared_ptr<TLIndexableItem>> copies;
+};
+using Hits = std::vector<Hit>;
+
+// Joins the copies of a message in several folders, which have one Message-ID, in the order of the
+// best. Only mails with the same subject and date are looked at.
+[[nodiscard]] Hits joinCopies(const ResultItems& items, MailFacts& facts);
+
+// What is shown: a part of the hits, of which the first has the rank `firstRank`.
+struct Page {
+  std::span<const Hit> hits;
+  size_t firstRank = 1;
+  size_t total = 0;      // of all hits
+  bool complete = true;  // false: there may be more than `total`
+};
+
+// The output of a search as one text, clean of control characters. Lines fit into so many columns,
+// 0 for no limit. Where the snippet holds no word, the mail is read for the place that does.
+[[nodiscard]] std::string resultsText(const Page& page, const std::string& words, MailFacts& facts,
+                                      const Palette& palette, size_t columns);
+// An object: "schema" is 1, "total" and "complete" as in the page, "results" a list of objects.
+[[nodiscard]] std::string resultsJSON(const Page& page, MailFacts& facts);
+// A path an entry, of copies too, with ":OFFSET" for a message of an mbox file. An identifier of
+// another client stands as it is. With `raw`, each ends with NUL and is as it is on the disk.
+[[nodiscard]] std::string resultsFiles(const Page& page, MailFacts& facts, bool raw);
+// A Message-ID an entry; messages without one are left out.
+[[nodiscard]] std::string resultsMessageIDs(const Page& page, MailFacts& facts, bool raw);
 
 // A line, or a row, a result: rank, scores, date, identifier.
 [[nodiscard]] std::string scoresText(const ResultItems& items, const Palette& palette);

@@ -1,27 +1,25 @@
+#include <fmt/format.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <nlohmann/json.hpp>
+#include <span>
 
 #include "cli/Commands.h"
 #include "cli/Explanation.h"
 #include "cli/QueryInput.h"
 #include "cli/Results.h"
+#include "cli/SearchRun.h"
 #include "client/SearchServiceProxy.h"
+#include "platform/Clock.h"
 
 namespace cli {
 
 namespace {
 
-// The daemon's answer to a query that makes no terms, such as the first quote mark of a phrase that
-// is being typed: it finds nothing.
-bool asksForNothing(const std::optional<TLError>& error) {
-  constexpr int kNoTerms = 3;
-  return error && error->domain == "TALIndexer" && error->code == kNoTerms;
-}
-
 std::optional<QueryInput> readQuery(const Options& options) {
   std::optional<TLError> error;
-  auto input = queryInput(options, &error);
+  auto input = queryInput(options, platform::secondsSince1970(), &error);
   if (!input) {
     complain(error->message);
   } else {
@@ -30,20 +28,67 @@ std::optional<QueryInput> readQuery(const Options& options) {
   return input;
 }
 
-std::optional<ResultItems> search(const Options& options, const QueryInput& input,
-                                  TLErrorOut error) {
-  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
-  const int64_t limit = options.limit == 0 ? service.kNoMaximum : options.limit;
-  auto items = service.searchItems(*input.query, 0, options.protectionClass, limit, error);
-  if (items || !asksForNothing(*error)) return items;
-  if (input.words.empty()) {
-    complain(std::string("nothing in the expression can be looked up; see tallow-query(7)"));
+// What has been found, with what is known of it.
+struct Outcome {
+  Hits hits;
+  ResultItems items;
+  bool complete = true;
+};
+
+void remarkOn(const SearchResults& found, size_t wanted, const MailFacts& facts) {
+  if (facts.unreadable() > 0) {
+    complain(fmt::format("{} messages cannot be read to look for what the index does not hold",
+                         facts.unreadable()));
   }
-  return ResultItems();
+  if (!found.complete && found.items.size() < wanted) {
+    complain(fmt::format("only the first {} that may match were looked at", found.lookedAt));
+  }
+}
+
+// Asks for more as long as copies of messages leave fewer results than are wanted.
+std::optional<Outcome> search(const Options& options, const QueryInput& input, MailFacts& facts,
+                              TLErrorOut error) {
+  constexpr size_t kCounted = 1000;
+  // Copies of the last message shown rank right behind it.
+  constexpr size_t kCopies = 30;
+  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
+  const size_t limit = static_cast<size_t>(options.limit);
+  const size_t shown =
+      limit == 0 || options.count ? SIZE_MAX : limit + static_cast<size_t>(options.offset);
+  size_t wanted = shown > SIZE_MAX - kCopies ? SIZE_MAX : shown + kCopies;
+  if (options.format == OutputFormat::json) wanted = std::max(wanted, kCounted);
+  for (;;) {
+    auto found = runPlan(input.plan, {options.protectionClass, options.sort, wanted, options.count},
+                         service, facts, error);
+    if (!found) return std::nullopt;
+    const bool all = found->complete || found->items.size() < wanted;
+    if (all || wanted == SIZE_MAX) remarkOn(*found, wanted, facts);
+    Hits hits = joinCopies(found->items, facts);
+    if (all || hits.size() >= shown || wanted > SIZE_MAX / 4) {
+      return Outcome{std::move(hits), std::move(found->items), found->complete};
+    }
+    wanted *= 4;
+  }
 }
 
 ExitStatus statusOf(const ResultItems& items) {
   return items.empty() ? ExitStatus::nothingFound : ExitStatus::done;
+}
+
+std::string outputOf(const Options& options, const QueryInput& input, const Page& page,
+                     MailFacts& facts) {
+  switch (options.format) {
+    case OutputFormat::json:
+      return resultsJSON(page, facts);
+    case OutputFormat::files:
+      return resultsFiles(page, facts, options.print0);
+    case OutputFormat::messageIDs:
+      return resultsMessageIDs(page, facts, options.print0);
+    case OutputFormat::text:
+      break;
+  }
+  return resultsText(page, input.markedWords(), facts,
+                     Palette(colorAllowed(options.color, STDOUT_FILENO)), columnsOf(STDOUT_FILENO));
 }
 
 }  // namespace
@@ -52,40 +97,53 @@ ExitStatus runSearch(const Options& options) {
   const auto input = readQuery(options);
   if (!input) return ExitStatus::failure;
   std::optional<TLError> error;
-  const auto items = search(options, *input, &error);
-  if (!items) return complain(error);
-  switch (options.format) {
-    case OutputFormat::json:
-      return print(resultsJSON(*items), statusOf(*items));
-    case OutputFormat::files:
-      return print(resultsFiles(*items), statusOf(*items));
-    case OutputFormat::text:
-      break;
+  MailFacts facts;
+  const auto outcome = search(options, *input, facts, &error);
+  if (!outcome) return complain(error);
+  if (outcome->items.empty()) {
+    const bool useless = !options.query.empty() && termsOf(input->plan).empty();
+    complain(std::string(useless ? "nothing in the expression can be looked up; see tallow-query(7)"
+                                 : "no match"));
   }
-  const std::string text = platform::toUTF8(platform::orEmpty(input->query->originalQuery()));
-  return print(resultsText(*items, text, Palette(colorAllowed(options.color, STDOUT_FILENO))),
-               statusOf(*items));
+  if (options.count && options.format != OutputFormat::json) {
+    return print(fmt::format("{}\n", outcome->hits.size()), statusOf(outcome->items));
+  }
+  std::span<const Hit> hits = outcome->hits;
+  hits = hits.subspan(std::min(hits.size(), static_cast<size_t>(options.offset)));
+  const auto limit = static_cast<size_t>(options.limit);
+  if (options.count) hits = {};
+  if (limit != 0) hits = hits.first(std::min(hits.size(), limit));
+  const Page page{hits, static_cast<size_t>(options.offset) + 1, outcome->hits.size(),
+                  outcome->complete};
+  return print(outputOf(options, *input, page, facts), statusOf(outcome->items));
 }
 
 // How the query is understood does not need the daemon, and is shown without it as well.
 ExitStatus runExplain(const Options& options) {
   const auto input = readQuery(options);
   if (!input) return ExitStatus::failure;
-  const std::vector<TALTerm> terms = termsOf(*input->query);
+  const std::vector<TALTerm> terms = termsOf(input->plan);
   std::optional<TLError> error;
-  const auto items = search(options, *input, &error);
+  MailFacts facts;
+  const auto outcome = search(options, *input, facts, &error);
+  if (outcome && outcome->items.empty() && !options.query.empty() && terms.empty()) {
+    complain(std::string("nothing in the expression can be looked up; see tallow-query(7)"));
+  }
+  ResultItems items;
+  if (outcome) items = outcome->items;
+  if (options.limit != 0) items.resize(std::min(items.size(), static_cast<size_t>(options.limit)));
   const Palette palette(colorAllowed(options.color, STDOUT_FILENO));
   std::string output;
   if (options.format == OutputFormat::json) {
     nlohmann::json json = explanationJSON(*input, terms);
-    json["results"] = items ? scoresJSON(*items) : nlohmann::json();
+    json["results"] = outcome ? scoresJSON(items) : nlohmann::json();
     output = jsonText(json);
   } else {
     output = explanationText(*input, terms, palette);
-    if (items) output += scoresText(*items, palette);
+    if (outcome) output += scoresText(items, palette);
   }
-  const ExitStatus written = print(output, items ? statusOf(*items) : ExitStatus::failure);
-  return items ? written : complain(error);
+  const ExitStatus written = print(output, outcome ? statusOf(items) : ExitStatus::failure);
+  return outcome ? written : complain(error);
 }
 
 }  // namespace cli

@@ -1,6 +1,7 @@
 #include "cli/Terminal.h"
 
 #include <fmt/format.h>
+#include <sys/ioctl.h>
 #include <unicode/uchar.h>
 #include <unicode/utf16.h>
 #include <unistd.h>
@@ -21,6 +22,13 @@ bool isControl(UChar32 c) {
 
 bool changesDirection(UChar32 c) {
   return (c >= 0x202A && c <= 0x202E) || (c >= 0x2066 && c <= 0x2069);
+}
+
+size_t widthOf(UChar32 c) {
+  const uint32_t mask = U_GET_GC_MASK(c);
+  if ((mask & (U_GC_MN_MASK | U_GC_ME_MASK | U_GC_CF_MASK)) != 0) return 0;
+  const int32_t width = u_getIntPropertyValue(c, UCHAR_EAST_ASIAN_WIDTH);
+  return width == U_EA_FULLWIDTH || width == U_EA_WIDE ? 2 : 1;
 }
 
 std::string clean(std::string_view text, bool keepLines) {
@@ -68,6 +76,28 @@ std::string escapeJSONForTerminal(std::string_view json) {
   }
   platform::appendUTF8(TLStringView(units).substr(done), out);
   return out;
+}
+
+std::string fitted(std::string_view text, size_t columns) {
+  if (columns == 0) return std::string(text);
+  const TLString units = platform::fromUTF8(text);
+  size_t used = 0;
+  size_t fits = 0;  // where the mark would go
+  for (size_t i = 0; i < units.size();) {
+    UChar32 c;
+    const size_t at = i;
+    U16_NEXT(units.data(), i, units.size(), c);
+    used += widthOf(c);
+    if (used > columns) return platform::toUTF8(TLStringView(units).substr(0, fits)) + "…";
+    if (used < columns) fits = i;
+    if (used == columns && widthOf(c) > 0) fits = at;
+  }
+  return std::string(text);
+}
+
+size_t columnsOf(int descriptor) {
+  winsize size{};
+  return isatty(descriptor) == 1 && ioctl(descriptor, TIOCGWINSZ, &size) == 0 ? size.ws_col : 0;
 }
 
 bool colorAllowed(ColorMode mode, int descriptor) {

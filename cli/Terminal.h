@@ -17,6 +17,13 @@ namespace cli {
 // through written as \u escapes. Invalid UTF-8 becomes U+FFFD.
 [[nodiscard]] std::string escapeJSONForTerminal(std::string_view json);
 
+// The beginning of a clean text that takes at most so many columns, with "…" at its end where
+// something is cut off: wide characters take two, combining ones none. 0 columns are no limit.
+[[nodiscard]] std::string fitted(std::string_view text, size_t columns);
+
+// The columns of a terminal; 0 where the descriptor is none.
+[[nodiscard]] size_t columnsOf(int descriptor);
+
 enum class ColorMode { automatic, always, never };
 
 // Whether to colour what goes to `descriptor`: by the mode, else on a terminal unless NO_COLOR is

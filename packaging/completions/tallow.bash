@@ -5,7 +5,7 @@ _tallow() {
   local commands='index search explain delete reset stats metrics ping vacuum state dump
     validate'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
-    --verbose --query --filter --param --help --version'
+    --verbose --query --filter --param --offset --sort --count --print0 --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
     prev=${COMP_WORDS[COMP_CWORD - 2]}
@@ -14,10 +14,11 @@ _tallow() {
   fi
   COMPREPLY=()
   case $prev in
-    --format) mapfile -t COMPREPLY < <(compgen -W 'text json files' -- "$cur"); return ;;
+    --format) mapfile -t COMPREPLY < <(compgen -W 'text json files message-ids' -- "$cur"); return ;;
     --color) mapfile -t COMPREPLY < <(compgen -W 'auto always never' -- "$cur"); return ;;
+    --sort) mapfile -t COMPREPLY < <(compgen -W 'relevance date' -- "$cur"); return ;;
     --runtime-dir | --state-dir) compopt -o dirnames; return ;;
-    --class | --name | --limit | --wait | --query | --filter | --param) return ;;
+    --class | --name | --limit | --offset | --wait | --query | --filter | --param) return ;;
   esac
   if [[ $cur == -* ]]; then
     mapfile -t COMPREPLY < <(compgen -W "$options" -- "$cur")

@@ -5,6 +5,7 @@
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
+#include "cli/Identifier.h"
 #include "platform/Files.h"
 #include "query/TLQueryAdditions.h"
 #include "records/TLIndexableItem.h"
@@ -86,12 +87,13 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
   const std::vector<std::pair<std::vector<std::string>, TLString>> cases{
       {{"invoice", "li"}, u"invoice li"},
       {{"invoice "}, u"invoice "},
-      {{"--", "-x", "--limit"}, u"-x --limit"},
-      {{"it's", "\"a\\b\"", "\\"}, u"it's \"a\\b\" \\"},
+      {{"--", "--limit"}, u"--limit"},
+      {{"it's", "a\\b", "\\"}, u"it's a\\b \\"},
+      {{"bread or", "not", "f(x)", "- e-mail 10:30"}, u"bread or not f(x) - e-mail 10:30"},
       {{"*", "**a*"}, u"* **a*"},
       {{"*"}, u"*"},
       {{"true"}, u"true"},
-      {{"') || (a == 'b", "&&", "$time.now"}, u"') || (a == 'b && $time.now"},
+      {{"') || a == 'b", "&&", "$time.now"}, u"') || a == 'b && $time.now"},
       {{"京都\t\n"}, u"\u4EAC\u90FD\t\n"},
       {{"caf\xE9"}, u"caf\uFFFD"},
       {{""}, u""},
@@ -100,7 +102,7 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
     std::vector<std::string> arguments{"search"};
     arguments.insert(arguments.end(), words.begin(), words.end());
     EXPECT_EQ(run(arguments), ExitStatus::nothingFound);
-    EXPECT_EQ(errors, "");
+    EXPECT_EQ(errors, "tallow: no match\n");
     const auto sent = lastQuery();
     EXPECT_EQ(sent->originalQuery(), text);
     EXPECT_FALSE(sent->hasRoot() || sent->hasSearchParams());
@@ -108,6 +110,28 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
   }
   EXPECT_EQ(run({"search", "--limit", "0", "--class=work", "x"}), ExitStatus::nothingFound);
   EXPECT_THAT(daemon.calls().back(), testing::EndsWith(", 0, work, 9223372036854775807)"));
+}
+
+// Each alternative is a search of its own; what it leaves out is asked for where it finds
+// something.
+TEST_F(CommandsTest, WhatIsNotOnlyWordsBecomesSearches) {
+  const size_t before = daemon.calls().size();
+  EXPECT_EQ(run({"search", "tea", "-milk", "OR", "from:tom"}), ExitStatus::nothingFound);
+  EXPECT_EQ(daemon.calls().size(), before + 2);
+  EXPECT_EQ(
+      printed(*lastQuery()),
+      "\nAND, \n\tOR, \n\t\tLEAF, STRING_EQUAL, AUTHORS, AUTHOR_EMAIL_ADDRESSES, X_FROM, tom");
+  EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 1000);
+  answerWith({result("file/m/a.eml")});
+  EXPECT_EQ(run({"search", "tea", "-milk", "-sugar", "date:2024"}), ExitStatus::nothingFound);
+  EXPECT_EQ(daemon.calls().size(), before + 5);
+  EXPECT_EQ(run({"search", "tea", "date:2024"}), ExitStatus::done);
+  EXPECT_EQ(run({"search", "tea", "date:2023"}), ExitStatus::nothingFound);
+  EXPECT_EQ(run({"search", "\"open", "is:blue", "date:2024"}), ExitStatus::done);
+  EXPECT_EQ(errors,
+            "tallow: the quote is not closed, so what follows it is taken as words\n"
+            "tallow: \"blue\" is not read, unread, flagged, replied or junk, so \"is:blue\" is "
+            "taken as words\n");
 }
 
 TEST_F(CommandsTest, ExpressionsFiltersAndParameters) {
@@ -120,14 +144,15 @@ TEST_F(CommandsTest, ExpressionsFiltersAndParameters) {
       run({"search", "x", "--filter", "kTLItemAuthors = a || kTLItemAuthors = b", "y",
            "--filter=kTLItemSubject = c", "--param", "salt.maxTopK=5,ranking.freshnessWeight=1"}),
       ExitStatus::nothingFound);
-  EXPECT_EQ(errors, "");
+  EXPECT_EQ(errors, "tallow: no match\n");
   EXPECT_EQ(printed(*lastQuery()),
             "x y\nAND, \n\tOR, \n\t\tLEAF, STRING_EQUAL, AUTHORS, a\n\t\tLEAF, STRING_EQUAL, "
             "AUTHORS, b\n\tLEAF, STRING_EQUAL, SUBJECT, c");
   EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 5);
   EXPECT_EQ(run({"search", "--query", "kTLItemSubject = a) || b", "--class", "c"}),
             ExitStatus::nothingFound);
-  EXPECT_EQ(errors, "tallow: the expression ends before \"|| b\", the rest is ignored\n");
+  EXPECT_EQ(errors,
+            "tallow: the expression ends before \"|| b\", the rest is ignored\ntallow: no match\n");
   EXPECT_EQ(run({"search", "x", "--filter", "none = a"}), ExitStatus::nothingFound);
   EXPECT_THAT(errors, HasSubstr("tallow: there is no attribute none\n"));
 }
@@ -188,7 +213,7 @@ TEST_F(CommandsTest, ExplainShowsEachStep) {
   EXPECT_EQ(json["terms"][0]["zones"][0]["name"], "SUBJECT");
   EXPECT_FALSE(json.contains("filterSteps"));
   daemon.failOnce("SearchItemsForQuery", {"TALIndexer", 3, "no terms"});
-  EXPECT_EQ(run({"explain", "--query", "com_quill_mail_read = 1"}), ExitStatus::nothingFound);
+  EXPECT_EQ(run({"explain", "--query", "false"}), ExitStatus::nothingFound);
   EXPECT_THAT(output, HasSubstr("terms\n  (none)\n"));
   EXPECT_THAT(errors, HasSubstr("nothing in the expression can be looked up"));
   // Without the daemon the steps are shown as well.
@@ -211,8 +236,13 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
   EXPECT_EQ(run({"--format=files", "search", "invo"}), ExitStatus::done);
   EXPECT_EQ(output, "/m/in box:7\n/m/a.eml\nother:1\n");
   EXPECT_EQ(run({"search", "--format", "json", "invo"}), ExitStatus::done);
-  const auto json = nlohmann::json::parse(output);
+  const auto answer = nlohmann::json::parse(output);
+  EXPECT_EQ(answer["schema"], 1);
+  EXPECT_EQ(answer["total"], 3);
+  EXPECT_EQ(answer["complete"], true);
+  const auto& json = answer["results"];
   ASSERT_EQ(json.size(), 3u);
+  EXPECT_EQ(json[1]["time"], "2024-01-08T08:00:00+00:00");
   EXPECT_EQ(json[1]["rank"], 2);
   EXPECT_EQ(json[1]["subject"], "Invoice \x1b[31m\u202E");
   EXPECT_EQ(json[1]["date"], 1704700800.0);
@@ -225,6 +255,38 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
       HasSubstr("   2      1.5000      0.7500     0.5000  2024-01-08 08:00  file/m/a.eml\n"));
   EXPECT_EQ(run({"explain", "--format=json", "invo"}), ExitStatus::done);
   EXPECT_EQ(nlohmann::json::parse(output)["results"][0]["textScore"], 1.5);
+}
+
+TEST_F(CommandsTest, CopiesOfAMessageAreOneResult) {
+  const testsupport::TemporaryDirectory mail;
+  std::vector<std::shared_ptr<TLIndexableItem>> items;
+  for (const auto& [name, id] : {std::pair("a", "<1@x>"), {"b", "<2@x>"}, {"c", "<1@x>"}}) {
+    const std::string path = mail / (std::string(name) + ".eml");
+    platform::writeFileAtomically(path, fmt::format("Message-ID:\n {}\nSubject: s\n\n", id),
+                                  nullptr);
+    items.push_back(result(cli::fileIdentifier(path).c_str()));
+  }
+  answerWith(items);
+  EXPECT_EQ(run({"search", "--count", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, "2\n");
+  EXPECT_EQ(run({"search", "--format=message-ids", "--offset=1", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, "2@x\n");
+  EXPECT_EQ(run({"search", "--format=files", "--print0", "--limit=1", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, mail / "a.eml" + '\0' + mail / "c.eml" + '\0');
+  EXPECT_EQ(run({"search", "x"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("     also file/"));
+  EXPECT_EQ(run({"search", "--format=json", "x", "--offset", "1"}), ExitStatus::done);
+  const auto json = nlohmann::json::parse(output);
+  EXPECT_EQ(json["total"], 2);
+  EXPECT_EQ(json["results"][0]["rank"], 2);
+  EXPECT_EQ(json["results"][0]["messageID"], "2@x");
+  EXPECT_EQ(json["results"][0]["path"], mail / "b.eml");
+  items[1]->addAttributeWithKeyDoubleValue(TLAttributeKey::CONTENT_CREATION_DATE, 1);
+  items[1]->attributeForKey(TLAttributeKey::MAIL_DATE_RECEIVED)->setDoubleValue(1704800000);
+  answerWith(items);
+  EXPECT_EQ(run({"search", "--sort=date", "--format=message-ids", "x"}), ExitStatus::done);
+  EXPECT_EQ(output, "2@x\n1@x\n");
+  EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 1000);
 }
 
 TEST_F(CommandsTest, IndexNamesTheItemsThatTheDaemonRefuses) {
@@ -340,6 +402,7 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
     EXPECT_EQ(run({command}), ExitStatus::unreachable) << command;
   }
   EXPECT_EQ(run({"search", "x"}), ExitStatus::unreachable);
+  EXPECT_THAT(errors, HasSubstr("systemctl --user start tallowsearchd.socket"));
   EXPECT_EQ(run({"delete", "x"}), ExitStatus::unreachable);
   EXPECT_EQ(run({"index", TALLOW_SAMPLE_MAIL}), ExitStatus::unreachable);
 }

@@ -9,7 +9,7 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// What tallow-query(7) promises holds.
+// What tallow-query(7) and tallow-search(7) promise holds.
 namespace {
 
 std::string readAll(const std::string& path) {
@@ -42,9 +42,15 @@ std::vector<Example> examplesOf(const std::string& page) {
   return examples;
 }
 
+class Pages : public testing::TestWithParam<std::pair<const char*, size_t>> {};
+
 }  // namespace
 
-TEST(QueryPage, ItsExamplesFindWhatTheyAreFor) {
+INSTANTIATE_TEST_SUITE_P(Query, Pages,
+                         testing::Values(std::pair(TALLOW_QUERY_PAGE, 10u),
+                                         std::pair(TALLOW_SEARCH_PAGE, 21u)));
+
+TEST_P(Pages, TheirExamplesFindWhatTheyAreFor) {
   const testsupport::TemporaryDirectory directory;
   const testsupport::DaemonProcess daemon(directory.path());
   ASSERT_TRUE(daemon.ready());
@@ -52,8 +58,8 @@ TEST(QueryPage, ItsExamplesFindWhatTheyAreFor) {
       std::string(TALLOW_PROGRAM) + " --runtime-dir " + daemon.runtimeDirectory();
   ASSERT_EQ(std::system((tallow + " index " TALLOW_SAMPLE_MAIL " >" + directory / "out").c_str()),
             0);
-  const std::vector<Example> examples = examplesOf(readAll(TALLOW_QUERY_PAGE));
-  EXPECT_EQ(examples.size(), 10u);
+  const std::vector<Example> examples = examplesOf(readAll(GetParam().first));
+  EXPECT_EQ(examples.size(), GetParam().second);
   for (const auto& [command, found] : examples) {
     ASSERT_TRUE(command.starts_with("tallow search ")) << command;
     const std::string run = tallow + command.substr(6) + " --limit 0 --format=files >" +

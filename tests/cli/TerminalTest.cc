@@ -82,3 +82,38 @@ TEST(Terminal, ProgressIsOneLineOfTheGivenWidth) {
   EXPECT_EQ(cli::progressText(1, 1 << 30, 1, 100, 200).find("left") == std::string::npos, false);
   EXPECT_EQ(cli::progressText(50, 200, 100, 10, 20).size(), 20u);
 }
+
+TEST(Fitted, CountsColumns) {
+  const struct {
+    const char* text;
+    size_t columns;
+    const char* fitted;
+  } kCases[] = {
+      {"abc", 0, "abc"},
+      {"abc", 3, "abc"},
+      {"abcd", 3, "ab…"},
+      {"京都", 4, "京都"},
+      {"京都旅", 4, "京…"},
+      {"京都旅", 5, "京都…"},
+      {"e\u0301e\u0301", 2, "e\u0301e\u0301"},
+      {"e\u0301e\u0301e", 2, "e\u0301…"},
+  };
+  for (const auto& c : kCases) EXPECT_EQ(cli::fitted(c.text, c.columns), c.fitted) << c.text;
+}
+
+TEST(Passage, ShowsWhereTheMostWordsAre) {
+  const std::string text =
+      "One invoice came.\n\n" + std::string(100, 'x') +
+      " then the second\n  invoice for   the boat shed came, and was paid late";
+  const auto passage = [&](const char* query, size_t characters) {
+    return cli::passageOf(text, cli::queryWords(query), characters);
+  };
+  EXPECT_EQ(passage("invoice boat", 60), "… the second invoice for the boat shed came, and was …");
+  EXPECT_EQ(passage("invoice", 24), "One invoice came. …");
+  EXPECT_EQ(passage("late", 40), "… was paid late");
+  EXPECT_EQ(passage("zebra", 40), "");
+  EXPECT_EQ(passage("", 40), "");
+  EXPECT_FALSE(passage("xx", 10).empty());
+  EXPECT_TRUE(cli::holdsWord("Café", {"cafe"}));
+  EXPECT_FALSE(cli::holdsWord("Café", {"tea"}));
+}

@@ -1,0 +1,42 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "cli/Identifier.h"
+#include "platform/TLError.h"
+
+namespace cli {
+
+// Reads single messages again where the index says that they lie. Remembers the directories of
+// Maildirs that it has listed, so that a thousand messages of one folder cost one listing. One
+// thread.
+class MailReader {
+ public:
+  // The place of the message as it is now, with the flags of a Maildir in its name; none for an
+  // identifier of another client, and for a Maildir file that is gone.
+  [[nodiscard]] std::optional<MailLocation> locate(const std::string& identifier);
+
+  // The first bytes of the message, at most `most`, without the From line of an mbox file and its
+  // quoting.
+  [[nodiscard]] std::optional<std::string> read(const std::string& identifier, size_t most,
+                                                TLErrorOut error);
+
+ private:
+  // By name without flags: the path.
+  using Listing = std::map<std::string, std::string, std::less<>>;
+
+  const Listing& listingOf(const std::string& maildir);
+
+  static constexpr size_t kMaxListings = 64;
+  std::map<std::string, Listing> _listings;
+};
+
+// The value of a header field of a message, unfolded and without blanks around it; empty where it
+// has none. The name is in small letters.
+[[nodiscard]] std::string headerValue(std::string_view message, std::string_view name);
+
+}  // namespace cli
