@@ -158,8 +158,9 @@ struct CommandFunction {
   Run run;
 };
 
-constexpr std::array<CommandFunction, 12> kFunctions{{
+constexpr std::array<CommandFunction, 13> kFunctions{{
     {Command::index, runIndex},
+    {Command::sync, runSync},
     {Command::search, runSearch},
     {Command::explain, runExplain},
     {Command::remove, runDelete},

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -15,6 +16,7 @@ inline constexpr size_t kMaximumMessageBytes = size_t{64} << 20;
 // Where a message comes from.
 struct MessageOrigin {
   std::string identifier;
+  std::optional<uint64_t> offset;  // in an mbox file
   std::string folderPath;  // the Maildir folder, the directory of a single file, or the mbox file
   std::string folderName;
 };

@@ -23,9 +23,11 @@ struct CommandRow {
   bool operandsRequired;
 };
 
-constexpr std::array<CommandRow, 12> kCommands{{
+constexpr std::array<CommandRow, 13> kCommands{{
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
+    {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
+     "PATH", false},
     {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
      "WORDS", false},
     {Command::explain, "explain", "Search, and show how the query was understood and the scores",
@@ -88,6 +90,13 @@ void addQueryOptions(CLI::App& sub, Options& options) {
       ->type_name("KEY=VALUE,...");
 }
 
+void addSyncOptions(CLI::App& sub, Options& options) {
+  sub.add_flag("-n,--dry-run", options.dryRun, "Only tell what would be done");
+  sub.add_flag("--prune-missing", options.pruneMissing,
+               "Delete the mail of directories that are not there any more");
+  sub.add_flag("--retry", options.retryFailed, "Try once more what could not be indexed");
+}
+
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   CLI::App* const sub = app.add_subcommand(row.name, row.help);
   sub->fallthrough();
@@ -97,6 +106,7 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
     if (row.command == Command::ping) operands->expected(0, 1);
   }
   if (isSearch(row.command)) addQueryOptions(*sub, options);
+  if (row.command == Command::sync) addSyncOptions(*sub, options);
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 

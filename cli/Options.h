@@ -31,7 +31,8 @@ enum class Command {
   vacuum,
   state,
   dump,
-  validate
+  validate,
+  sync
 };
 enum class OutputFormat { text, json, files };
 
@@ -52,6 +53,11 @@ struct Options {
   double waitSeconds = 0;  // for the daemon to come up
   bool yes = false;
   bool verbose = false;
+
+  // Of sync and watch.
+  bool dryRun = false;
+  bool pruneMissing = false;
+  bool retryFailed = false;
 
   [[nodiscard]] std::chrono::milliseconds patience() const {
     return std::chrono::milliseconds(static_cast<int64_t>(waitSeconds * 1000));
