@@ -436,17 +436,26 @@ void Catalogue::setDeletionSequence(const std::string& identifier, int64_t seque
   sql("INSERT OR REPLACE INTO deletion VALUES (?, ?)").bindText(identifier).bind(sequence).run();
 }
 
-void Catalogue::adopt(const std::vector<std::string>& identifiersInIndex) {
+void Catalogue::adopt(const std::vector<std::string>& identifiersInIndex, int64_t trusted) {
   _database->execute("CREATE TEMP TABLE present (identifier TEXT PRIMARY KEY) WITHOUT ROWID");
   for (const std::string& identifier : identifiersInIndex) {
     sql("INSERT OR IGNORE INTO present VALUES (?)").bindText(identifier).run();
   }
+  // What went out later is there in one version or another.
+  sql("UPDATE message SET replace = 1 WHERE sequence > ? AND sequence < 9223372036854775807")
+      .bind(std::min(trusted, _acknowledged))
+      .run();
+  // From here on an older state of the daemon tells nothing: what it had then and what has gone
+  // since is not known any more.
+  setAcknowledged(highestSequence() + 1);
+  setValue("horizon", std::to_string(_acknowledged));
   sql("UPDATE message SET sequence = 9223372036854775807, "
       "replace = (replace AND identifier IN present) WHERE sequence >= 0 "
       "AND (replace OR identifier NOT IN present)")
       .run();
-  sql("UPDATE message SET sequence = 0 WHERE sequence >= 0 AND NOT replace "
+  sql("UPDATE message SET sequence = ? WHERE sequence >= 0 AND NOT replace "
       "AND identifier IN present")
+      .bind(_acknowledged)
       .run();
   _database->execute("DELETE FROM deletion");
   sql("INSERT INTO deletion SELECT identifier, 9223372036854775807 FROM present "

@@ -17,7 +17,6 @@ namespace mailsync {
 // a larger one is to be sent.
 inline constexpr int64_t kWaiting = std::numeric_limits<int64_t>::max();  // never sent as it is now
 inline constexpr int64_t kFailed = -1;  // not to be sent; `problem` tells why
-inline constexpr int64_t kFound = 0;    // was in the index when the catalogue was made
 
 enum class FileKind : int64_t {
   maildir = 0,  // one message, identified by folder and name without flags
@@ -164,8 +163,9 @@ class Catalogue {
   void setDeletionSequence(const std::string& identifier, int64_t sequence);
 
   // Puts everything to what the index holds: of the messages, those that it has count as found, and
-  // all others wait. What it has and the catalogue does not is to be deleted.
-  void adopt(const std::vector<std::string>& identifiersInIndex);
+  // all others wait; so do those that went out after `trusted`, as the index may have another
+  // version. What it has and the catalogue does not is to be deleted.
+  void adopt(const std::vector<std::string>& identifiersInIndex, int64_t trusted);
 
   [[nodiscard]] std::vector<FolderCount> folderCounts();
   [[nodiscard]] std::vector<Problem> problems(size_t most);

@@ -183,7 +183,8 @@ class Run {
     for (const FolderCount& count : _catalogue->folderCounts()) folders.push_back(count.path);
     const auto present =
         readInventory(_service, _settings.protectionClass, _catalogue->roots(), folders, error);
-    if (present) _catalogue->adopt(*present);
+    const bool ours = _stored && _stored->catalogue == _catalogue->id();
+    if (present) _catalogue->adopt(*present, ours ? _stored->sequence : kWaiting);
     return present.has_value();
   }
 
