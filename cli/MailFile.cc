@@ -61,14 +61,14 @@ MessageOrigin originOfFile(const std::string& path) {
   std::string name = lastComponent(folder);
   // Sub-folders of a Maildir++ begin with a dot.
   if (isMaildirFile(path) && name.size() > 1 && name[0] == '.') name.erase(0, 1);
-  return {fileIdentifier(path), std::nullopt, std::move(folder), std::move(name)};
+  return {fileIdentifier(path), std::move(folder), std::move(name)};
 }
 
 MessageOrigin originOfMbox(const std::string& path) {
   const std::string full = lastComponent(path);
   std::string_view name = full;
   for (const char* suffix : {".gz", ".xz", ".mbox"}) name = withoutSuffix(name, suffix);
-  return {"", std::nullopt, path, std::string(name)};
+  return {"", path, std::string(name)};
 }
 
 // A header field at the start, and a field that every message has among what follows.

@@ -16,9 +16,9 @@ inline constexpr size_t kMaximumMessageBytes = size_t{64} << 20;
 // Where a message comes from.
 struct MessageOrigin {
   std::string identifier;
-  std::optional<uint64_t> offset;  // in an mbox file
   std::string folderPath;  // the Maildir folder, the directory of a single file, or the mbox file
   std::string folderName;
+  std::optional<uint64_t> offset = std::nullopt;  // in an mbox file
 };
 
 // What a reader of mail files reports to. Results are false to stop reading.
