@@ -23,11 +23,13 @@ struct CommandRow {
   bool operandsRequired;
 };
 
-constexpr std::array<CommandRow, 13> kCommands{{
+constexpr std::array<CommandRow, 14> kCommands{{
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
     {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
      "PATH", false},
+    {Command::status, "status", "Show mailboxes and index: what is indexed, waits or has failed",
+     nullptr, false},
     {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
      "WORDS", false},
     {Command::explain, "explain", "Search, and show how the query was understood and the scores",

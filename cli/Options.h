@@ -32,7 +32,8 @@ enum class Command {
   state,
   dump,
   validate,
-  sync
+  sync,
+  status
 };
 enum class OutputFormat { text, json, files };
 

@@ -2,7 +2,7 @@
 
 _tallow() {
   local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='index sync search explain delete reset stats metrics ping vacuum state dump
+  local commands='index sync status search explain delete reset stats metrics ping vacuum state dump
     validate'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
     --verbose --dry-run --prune-missing --retry --query --filter --param --help --version'

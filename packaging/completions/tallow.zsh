@@ -5,6 +5,7 @@ local -a commands options
 commands=(
   'index:index mail'
   'sync:bring the index in step with mailboxes'
+  'status:show mailboxes and index'
   'search:search for messages'
   'explain:search and show how the query is understood'
   'delete:delete messages by identifier'
