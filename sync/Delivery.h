@@ -43,7 +43,7 @@ struct DeliveryCounts {
 // One thread.
 class Delivery {
  public:
-  static constexpr std::chrono::milliseconds kStateInterval{5000};
+  static constexpr std::chrono::milliseconds kStateInterval{2000};
 
   struct Target {
     std::string name;

@@ -2,8 +2,11 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
+#include <csignal>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <random>
@@ -303,6 +306,44 @@ TEST_F(MailSyncTest, ACatalogueThatIsLostOrDamagedSendsNothingAgain) {
   std::ofstream(cataloguePath(), std::ios::binary) << std::string(8192, 'x');
   ASSERT_TRUE(sync()) << platform::printable(error);
   EXPECT_EQ(daemon.received(), 4U);
+}
+
+// A time that is not past tells nothing: the clock may have been set back since.
+TEST_F(MailSyncTest, ATimeInTheFutureIsNotTrusted) {
+  add("a/cur/1", "one");
+  const timespec future{std::time(nullptr) + 3600, 0};
+  const timespec times[2] = {future, future};
+  const auto set = [&] { utimensat(AT_FDCWD, (mail + "/a/cur").c_str(), times, 0); };
+  set();
+  ASSERT_TRUE(sync());
+  add("a/cur/2", "two");
+  set();
+  ASSERT_TRUE(sync());
+  EXPECT_EQ(indexed(), (Lines{"a: one", "a: two"}));
+}
+
+TEST_F(MailSyncTest, AFullDiskUnderTheCatalogueLosesNothing) {
+  add("a/cur/1", "one");
+  ASSERT_TRUE(sync());
+  Lines expected{"a: one"};
+  for (int i = 0; i < 2000; ++i) {
+    add(fmt::format("b/cur/{}", i), fmt::format("s{}", i));
+    expected.insert(fmt::format("b: s{}", i));
+  }
+  // Files of this process cannot grow: for the catalogue, as if the disk were full.
+  std::signal(SIGXFSZ, SIG_IGN);
+  rlimit before{};
+  getrlimit(RLIMIT_FSIZE, &before);
+  for (const rlim_t bytes : {rlim_t{100000}, rlim_t{300000}}) {
+    const rlimit full{bytes, before.rlim_max};
+    setrlimit(RLIMIT_FSIZE, &full);
+    const bool done = sync();
+    setrlimit(RLIMIT_FSIZE, &before);
+    ASSERT_FALSE(done) << bytes;
+    EXPECT_EQ(error->domain, mailsync::kCatalogueDomain);
+  }
+  ASSERT_TRUE(sync()) << platform::printable(error);
+  EXPECT_EQ(indexed(), expected);
 }
 
 // Random histories of a mailbox, of the daemon and of the catalogue. After each sync that succeeds
