@@ -158,8 +158,10 @@ struct CommandFunction {
   Run run;
 };
 
-constexpr std::array<CommandFunction, 12> kFunctions{{
+constexpr std::array<CommandFunction, 14> kFunctions{{
     {Command::index, runIndex},
+    {Command::sync, runSync},
+    {Command::status, runStatus},
     {Command::search, runSearch},
     {Command::explain, runExplain},
     {Command::remove, runDelete},

@@ -14,6 +14,10 @@ namespace cli {
 // Of runCommand, the one that reads mail.
 [[nodiscard]] ExitStatus runIndex(const Options& options);
 
+// Of runCommand, those that keep the index in step with mailboxes.
+[[nodiscard]] ExitStatus runSync(const Options& options);
+[[nodiscard]] ExitStatus runStatus(const Options& options);
+
 // Of runCommand, those that search.
 [[nodiscard]] ExitStatus runSearch(const Options& options);
 [[nodiscard]] ExitStatus runExplain(const Options& options);

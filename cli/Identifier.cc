@@ -14,6 +14,7 @@ namespace {
 constexpr std::string_view kFilePrefix = "file/";
 constexpr std::string_view kMboxPrefix = "mbox/";
 constexpr std::string_view kOffset = "?offset=";
+constexpr std::string_view kMessage = "?message=";
 constexpr std::string_view kFlags = ":2,";
 
 bool isUnreserved(char c) {
@@ -89,20 +90,42 @@ std::string mboxIdentifier(std::string_view path, uint64_t offset) {
                      percentEncodePath(path), kOffset, offset);
 }
 
+std::string mboxIdentifier(std::string_view path, std::string_view message) {
+  return fmt::format("{}{}{}{}", kMboxPrefix.substr(0, kMboxPrefix.size() - 1),
+                     percentEncodePath(path), kMessage, message);
+}
+
+std::string maildirIdentifier(std::string_view path) {
+  const std::string_view folder = directoryOf(directoryOf(path));
+  return fileIdentifier(fmt::format("{}/cur/{}", folder, nameOf(path)));
+}
+
+std::string_view maildirFlags(std::string_view path) {
+  const std::string_view name = withoutFlags(path);
+  return name.size() == path.size() ? std::string_view() : path.substr(name.size() + kFlags.size());
+}
+
 std::optional<MailLocation> parseIdentifier(std::string_view identifier) {
   const bool isFile = identifier.starts_with(kFilePrefix);
   if (!isFile && !identifier.starts_with(kMboxPrefix)) return std::nullopt;
   std::string_view path = identifier.substr(kFilePrefix.size() - 1);
   MailLocation location;
   if (!isFile) {
-    const size_t query = path.rfind(kOffset);
+    const size_t query = path.rfind('?');
     if (query == std::string_view::npos) return std::nullopt;
-    const std::string_view number = path.substr(query + kOffset.size());
-    uint64_t offset = 0;
-    const auto [end, failure] =
-        std::from_chars(number.data(), number.data() + number.size(), offset);
-    if (failure != std::errc() || end != number.data() + number.size()) return std::nullopt;
-    location.offset = offset;
+    const std::string_view place = path.substr(query);
+    if (place.starts_with(kMessage)) {
+      location.message = std::string(place.substr(kMessage.size()));
+    } else if (place.starts_with(kOffset)) {
+      const std::string_view number = place.substr(kOffset.size());
+      uint64_t offset = 0;
+      const auto [end, failure] =
+          std::from_chars(number.data(), number.data() + number.size(), offset);
+      if (failure != std::errc() || end != number.data() + number.size()) return std::nullopt;
+      location.offset = offset;
+    } else {
+      return std::nullopt;
+    }
     path = path.substr(0, query);
   }
   auto decoded = percentDecode(path);

@@ -1,6 +1,9 @@
 #include <fmt/format.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <array>
+#include <cerrno>
 #include <chrono>
 #include <nlohmann/json.hpp>
 
@@ -8,9 +11,11 @@
 #include "cli/Commands.h"
 #include "cli/IndexPipeline.h"
 #include "cli/MailWalker.h"
+#include "cli/MessageParser.h"
 #include "cli/ProgressBar.h"
 #include "cli/Results.h"
 #include "client/SearchServiceProxy.h"
+#include "sync/MessageDigest.h"
 
 namespace cli {
 
@@ -153,9 +158,57 @@ class Indexing {
   uint64_t _ignored = 0;
 };
 
+// The standard input to its end, up to one byte more than a message may have.
+std::optional<std::string> readStandardInput() {
+  std::string text;
+  std::array<char, 65536> buffer;
+  while (text.size() <= kMaximumMessageBytes) {
+    const ssize_t count = read(STDIN_FILENO, buffer.data(), buffer.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return std::nullopt;
+    if (count == 0) break;
+    text.append(buffer.data(), static_cast<size_t>(count));
+  }
+  return text;
+}
+
+// One message from the standard input, for delivery agents. It has no place to be named by, and is
+// named by its content.
+ExitStatus indexStandardInput(const Options& options) {
+  const auto text = readStandardInput();
+  if (!text || text->size() > kMaximumMessageBytes) {
+    complain(text ? fmt::format("the message is longer than {} MiB", kMaximumMessageBytes >> 20)
+                  : std::string("the standard input cannot be read"));
+    return ExitStatus::failure;
+  }
+  std::string_view message = *text;
+  if (message.starts_with("From ")) {
+    message.remove_prefix(std::min(message.find('\n'), message.size() - 1) + 1);
+  }
+  MessageParser parser;
+  auto result =
+      parser.parse(message, {"message/" + mailsync::messageDigest(message), "", ""});
+  if (const auto* bad = std::get_if<UnparsableMessage>(&result)) {
+    complain("the standard input: " + bad->reason);
+    return ExitStatus::failure;
+  }
+  const client::EncodedItem item = client::encode(*std::get<ParsedMessage>(result).item);
+  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
+  std::optional<TLError> error;
+  if (!service.indexItems(std::span(&item, 1), options.name, options.protectionClass, &error)) {
+    return complain(error);
+  }
+  return print(options.format == OutputFormat::json
+                   ? jsonText({{"indexed", 1}, {"identifier", item.identifier}})
+                   : std::string("1 message indexed\n"));
+}
+
 }  // namespace
 
 ExitStatus runIndex(const Options& options) {
+  if (options.arguments.size() == 1 && options.arguments[0] == "-") {
+    return indexStandardInput(options);
+  }
   return Indexing(options).run();
 }
 

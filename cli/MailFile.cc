@@ -126,6 +126,7 @@ class Reader {
     bool afterBlank = true;
     const auto deliver = [&](bool last) {
       origin.identifier = mboxIdentifier(_path, start);
+      origin.offset = start;
       // The empty line in front of the next message is no part of this one.
       if (_message.ends_with("\n\r\n")) {
         _message.resize(_message.size() - 2);

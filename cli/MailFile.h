@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -17,6 +18,7 @@ struct MessageOrigin {
   std::string identifier;
   std::string folderPath;  // the Maildir folder, the directory of a single file, or the mbox file
   std::string folderName;
+  std::optional<uint64_t> offset = std::nullopt;  // in an mbox file
 };
 
 // What a reader of mail files reports to. Results are false to stop reading.

@@ -24,9 +24,13 @@ struct CommandRow {
   bool operandsRequired;
 };
 
-constexpr std::array<CommandRow, 12> kCommands{{
+constexpr std::array<CommandRow, 14> kCommands{{
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
+    {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
+     "PATH", false},
+    {Command::status, "status", "Show mailboxes and index: what is indexed, waits or has failed",
+     nullptr, false},
     {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
      "WORDS", false},
     {Command::explain, "explain", "Search, and show how the query was understood and the scores",
@@ -105,6 +109,13 @@ void addResultOptions(CLI::App& sub, Options& options) {
   sub.add_flag("--print0", options.print0, "Of files and message-ids: NUL in place of line feeds");
 }
 
+void addSyncOptions(CLI::App& sub, Options& options) {
+  sub.add_flag("-n,--dry-run", options.dryRun, "Only tell what would be done");
+  sub.add_flag("--prune-missing", options.pruneMissing,
+               "Delete the mail of directories that are not there any more");
+  sub.add_flag("--retry", options.retryFailed, "Try once more what could not be indexed");
+}
+
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   CLI::App* const sub = app.add_subcommand(row.name, row.help);
   sub->fallthrough();
@@ -115,6 +126,7 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   }
   if (isSearch(row.command)) addQueryOptions(*sub, options);
   if (row.command == Command::search) addResultOptions(*sub, options);
+  if (row.command == Command::sync) addSyncOptions(*sub, options);
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 

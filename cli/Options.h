@@ -31,7 +31,9 @@ enum class Command {
   vacuum,
   state,
   dump,
-  validate
+  validate,
+  sync,
+  status
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };
@@ -57,6 +59,11 @@ struct Options {
   double waitSeconds = 0;  // for the daemon to come up
   bool yes = false;
   bool verbose = false;
+
+  // Of sync and watch.
+  bool dryRun = false;
+  bool pruneMissing = false;
+  bool retryFailed = false;
 
   [[nodiscard]] std::chrono::milliseconds patience() const {
     return std::chrono::milliseconds(static_cast<int64_t>(waitSeconds * 1000));

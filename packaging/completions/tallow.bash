@@ -2,10 +2,11 @@
 
 _tallow() {
   local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='index search explain delete reset stats metrics ping vacuum state dump
+  local commands='index sync status search explain delete reset stats metrics ping vacuum state dump
     validate'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
-    --verbose --query --filter --param --offset --sort --count --print0 --help --version'
+    --verbose --dry-run --prune-missing --retry --query --filter --param --offset --sort --count
+    --print0 --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
     prev=${COMP_WORDS[COMP_CWORD - 2]}
@@ -27,7 +28,7 @@ _tallow() {
   local word
   for word in "${COMP_WORDS[@]:1:COMP_CWORD-1}"; do
     if [[ " $commands " == *" $word "* ]]; then
-      [[ $word == index ]] && compopt -o default
+      [[ $word == index || $word == sync ]] && compopt -o default
       return
     fi
   done

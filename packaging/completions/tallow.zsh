@@ -4,6 +4,8 @@
 local -a commands options
 commands=(
   'index:index mail'
+  'sync:bring the index in step with mailboxes'
+  'status:show mailboxes and index'
   'search:search for messages'
   'explain:search and show how the query is understood'
   'delete:delete messages by identifier'
@@ -34,7 +36,10 @@ options=(
   '--param=[parameters of this search]:KEY=VALUE,...:'
   '(-y --yes)'{-y,--yes}'[do not ask]'
   '(-v --verbose)'{-v,--verbose}'[name what was cut or ignored]'
+  '(-n --dry-run)'{-n,--dry-run}'[only tell what sync would do]'
+  '--prune-missing[delete the mail of directories that are not there]'
+  '--retry[try again what could not be indexed]'
   '(-h --help)'{-h,--help}'[show help]'
   '--version[show the version]'
 )
-_arguments -S $options '1:command:{_describe command commands}' '*:argument:{ [[ $words[(I)index] -gt 0 ]] && _files }'
+_arguments -S $options '1:command:{_describe command commands}' '*:argument:{ [[ $words[(I)(index|sync)] -gt 0 ]] && _files }'

@@ -2,6 +2,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
@@ -405,4 +408,35 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
   EXPECT_THAT(errors, HasSubstr("systemctl --user start tallowsearchd.socket"));
   EXPECT_EQ(run({"delete", "x"}), ExitStatus::unreachable);
   EXPECT_EQ(run({"index", TALLOW_SAMPLE_MAIL}), ExitStatus::unreachable);
+}
+
+// The catalogue's part is shown with and without a daemon that answers.
+TEST_F(CommandsTest, SyncAndStatus) {
+  const testsupport::TemporaryDirectory home;
+  setenv("XDG_STATE_HOME", (home / "state").c_str(), 1);
+  const std::string mail = home / "mail";
+  std::filesystem::create_directories(mail + "/cur");
+  std::ofstream(mail + "/cur/1:2,S") << "Subject: a\n\nb\n";
+  std::ofstream(mail + "/cur/2:2,") << "\n";
+  EXPECT_EQ(run({"status"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("No mailbox is kept in step"));
+  EXPECT_EQ(run({"sync", mail, "-n", "-v"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("send file" + mail + "/cur/1\n"));
+  EXPECT_THAT(daemon.indexedItems(), testing::IsEmpty());
+  // One message has nothing in it: all but that is done.
+  EXPECT_EQ(run({"sync", mail}), ExitStatus::failure);
+  EXPECT_EQ(output, "1 added, 1 failed\n");
+  EXPECT_EQ(daemon.indexedItems().size(), 1U);
+  EXPECT_EQ(run({"status"}), ExitStatus::done);
+  EXPECT_THAT(output, HasSubstr("       1 of        2  " + mail + ", 1 failed\n"));
+  EXPECT_THAT(output, HasSubstr("/cur/2:2,: the message is empty\n"));
+  EXPECT_EQ(run({"status", "--format=json"}), ExitStatus::done);
+  const auto json = nlohmann::json::parse(output);
+  EXPECT_EQ(json["mailboxes"]["folders"][0]["indexed"], 1);
+  EXPECT_EQ(json["mailboxes"]["roots"][0], mail);
+  daemon.stop();
+  EXPECT_EQ(run({"status"}), ExitStatus::unreachable);
+  EXPECT_THAT(output, HasSubstr(mail + ", 1 failed\n"));
+  EXPECT_EQ(run({"sync"}), ExitStatus::unreachable);
+  unsetenv("XDG_STATE_HOME");
 }

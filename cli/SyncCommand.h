@@ -1,0 +1,24 @@
+#pragma once
+
+#include <functional>
+#include <string>
+
+#include "cli/Options.h"
+#include "sync/MailSync.h"
+
+namespace cli {
+
+// What `sync`, `watch` and `status` have in common, from the command line.
+[[nodiscard]] mailsync::SyncSettings syncSettings(const Options& options);
+
+// Those of ~/Maildir, ~/Mail and ~/.mail that are there.
+[[nodiscard]] std::vector<std::string> usualMailboxes();
+
+// True once SIGINT or SIGTERM has come; a second signal ends the process at once. The first call
+// takes over the signals.
+[[nodiscard]] bool interrupted();
+
+// One line, such as "3 added, 1 deleted".
+[[nodiscard]] std::string summaryOf(const mailsync::SyncReport& report, bool dryRun);
+
+}  // namespace cli

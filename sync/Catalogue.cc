@@ -1,0 +1,543 @@
+#include "sync/Catalogue.h"
+
+#include <fmt/format.h>
+#include <glib.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <map>
+#include <random>
+
+#include "platform/Files.h"
+#include "platform/Paths.h"
+
+namespace mailsync {
+
+namespace {
+
+constexpr const char* kSchemaVersion = "1";
+
+constexpr const char* kSchema = R"(
+CREATE TABLE IF NOT EXISTS setting (key TEXT PRIMARY KEY, value BLOB) WITHOUT ROWID;
+CREATE TABLE IF NOT EXISTS root (path BLOB PRIMARY KEY) WITHOUT ROWID;
+CREATE TABLE IF NOT EXISTS directory (
+  id INTEGER PRIMARY KEY, parent INTEGER NOT NULL, path BLOB NOT NULL UNIQUE,
+  inode INTEGER NOT NULL, modified INTEGER NOT NULL, settled INTEGER NOT NULL,
+  plain INTEGER NOT NULL, missing INTEGER NOT NULL);
+CREATE TABLE IF NOT EXISTS file (
+  id INTEGER PRIMARY KEY, directory INTEGER NOT NULL, name BLOB NOT NULL,
+  inode INTEGER NOT NULL, size INTEGER NOT NULL, modified INTEGER NOT NULL, kind INTEGER NOT NULL);
+CREATE UNIQUE INDEX IF NOT EXISTS file_name ON file (directory, name);
+CREATE INDEX IF NOT EXISTS file_inode ON file (inode);
+CREATE INDEX IF NOT EXISTS file_alias ON file (directory) WHERE kind = 4;
+CREATE TABLE IF NOT EXISTS message (
+  id INTEGER PRIMARY KEY, file INTEGER NOT NULL, identifier TEXT NOT NULL UNIQUE,
+  digest TEXT NOT NULL, position INTEGER NOT NULL, flags TEXT NOT NULL,
+  sequence INTEGER NOT NULL, replace INTEGER NOT NULL, problem TEXT);
+CREATE INDEX IF NOT EXISTS message_file ON message (file);
+CREATE INDEX IF NOT EXISTS message_sequence ON message (sequence);
+CREATE TABLE IF NOT EXISTS deletion (identifier TEXT PRIMARY KEY, sequence INTEGER NOT NULL)
+  WITHOUT ROWID;
+CREATE INDEX IF NOT EXISTS deletion_sequence ON deletion (sequence);
+)";
+
+constexpr const char* kDropAll = R"(
+DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS root; DROP TABLE IF EXISTS directory;
+DROP TABLE IF EXISTS file; DROP TABLE IF EXISTS message; DROP TABLE IF EXISTS deletion;
+)";
+
+// How many acknowledged deletions are remembered, for a daemon that is set back.
+constexpr int64_t kKeptDeletions = 100000;
+
+std::string randomName() {
+  std::random_device random;
+  std::string name;
+  for (int i = 0; i < 4; ++i) name += fmt::format("{:08x}", random());
+  return name;
+}
+
+int64_t toNumber(const std::string& text) {
+  return std::strtoll(text.c_str(), nullptr, 10);
+}
+
+DirectoryRow directoryOf(const Statement& row) {
+  return {row.number(0), row.number(1),      row.text(2),        row.number(3),
+          row.number(4), row.number(5) != 0, row.number(6) != 0, row.number(7) != 0};
+}
+
+FileRow fileOf(const Statement& row) {
+  return {row.number(0),
+          row.number(1),
+          row.text(2),
+          row.number(3),
+          row.number(4),
+          row.number(5),
+          static_cast<FileKind>(row.number(6))};
+}
+
+MessageRow messageOf(const Statement& row) {
+  return {row.number(0), row.number(1), row.text(2),   row.text(3),
+          row.number(4), row.text(5),   row.number(6), row.number(7) != 0};
+}
+
+template <typename Make>
+auto all(Statement& statement, const Make& make) {
+  std::vector<decltype(make(statement))> rows;
+  while (statement.step()) rows.push_back(make(statement));
+  statement.reset();
+  return rows;
+}
+
+template <typename Make>
+auto first(Statement& statement, const Make& make) {
+  std::optional<decltype(make(statement))> row;
+  if (statement.step()) row = make(statement);
+  statement.reset();
+  return row;
+}
+
+}  // namespace
+
+std::unique_ptr<Catalogue> Catalogue::open(const std::string& path, TLErrorOut error) {
+  auto database = Database::open(path, error);
+  if (database == nullptr) return nullptr;
+  std::unique_ptr<Catalogue> catalogue(new Catalogue(std::move(database)));
+  if (catalogue->prepare()) return catalogue;
+  platform::setError(error, *catalogue->failure());
+  return nullptr;
+}
+
+bool Catalogue::prepare() {
+  begin();
+  _database->execute(
+      "CREATE TABLE IF NOT EXISTS setting (key TEXT PRIMARY KEY, value BLOB) "
+      "WITHOUT ROWID");
+  const std::string version = value("schema");
+  if (version != kSchemaVersion) {
+    _statements.clear();
+    _database->execute(kDropAll);
+  }
+  _database->execute(kSchema);
+  if (version != kSchemaVersion) {
+    setValue("schema", kSchemaVersion);
+    setValue("id", randomName());
+  }
+  _id = value("id");
+  _acknowledged = toNumber(value("acknowledged"));
+  return commit();
+}
+
+Statement& Catalogue::sql(const char* text) {
+  const auto found = _statements.find(text);
+  if (found != _statements.end()) return found->second;
+  return _statements.emplace(text, _database->prepare(text)).first->second;
+}
+
+int64_t Catalogue::scalar(const char* text) {
+  return first(sql(text), [](const Statement& row) { return row.number(0); }).value_or(0);
+}
+
+bool Catalogue::commit() {
+  if (!failure()) _database->execute("COMMIT");
+  if (failure()) rollback();
+  return !failure();
+}
+
+// --- Settings
+
+void Catalogue::setAcknowledged(int64_t sequence) {
+  _acknowledged = sequence;
+  setValue("acknowledged", std::to_string(sequence));
+}
+
+int64_t Catalogue::highestSequence() {
+  const int64_t messages =
+      scalar("SELECT MAX(sequence) FROM message WHERE sequence < 9223372036854775807");
+  const int64_t deletions =
+      scalar("SELECT MAX(sequence) FROM deletion WHERE sequence < 9223372036854775807");
+  return std::max({_acknowledged, messages, deletions, int64_t{0}});
+}
+
+int64_t Catalogue::horizon() {
+  return toNumber(value("horizon"));
+}
+
+void Catalogue::forgetOldDeletions() {
+  Statement& count = sql("SELECT COUNT(*) FROM deletion WHERE sequence <= ?");
+  count.bind(_acknowledged);
+  const int64_t surplus =
+      first(count, [](const Statement& row) { return row.number(0); }).value_or(0) - kKeptDeletions;
+  if (surplus <= 0) return;
+  Statement& nth = sql("SELECT sequence FROM deletion ORDER BY sequence LIMIT 1 OFFSET ?");
+  nth.bind(surplus);
+  const int64_t until = first(nth, [](const Statement& row) { return row.number(0); }).value_or(0);
+  sql("DELETE FROM deletion WHERE sequence <= ?").bind(until).run();
+  setValue("horizon", std::to_string(until));
+}
+
+std::string Catalogue::value(const char* key) {
+  Statement& statement = sql("SELECT value FROM setting WHERE key = ?");
+  statement.bindText(key);
+  return first(statement, [](const Statement& row) { return row.text(0); }).value_or("");
+}
+
+void Catalogue::setValue(const char* key, const std::string& value) {
+  sql("INSERT OR REPLACE INTO setting VALUES (?, ?)").bindText(key).bindBytes(value).run();
+}
+
+std::vector<std::string> Catalogue::roots() {
+  return all(sql("SELECT path FROM root ORDER BY path"),
+             [](const Statement& row) { return row.text(0); });
+}
+
+void Catalogue::addRoot(const std::string& path) {
+  sql("INSERT OR IGNORE INTO root VALUES (?)").bindBytes(path).run();
+}
+
+void Catalogue::removeRoot(const std::string& path) {
+  sql("DELETE FROM root WHERE path = ?").bindBytes(path).run();
+}
+
+// --- Directories
+
+std::vector<DirectoryRow> Catalogue::directories() {
+  return all(sql("SELECT id, parent, path, inode, modified, settled, plain, missing FROM directory "
+                 "ORDER BY path"),
+             directoryOf);
+}
+
+int64_t Catalogue::addDirectory(const DirectoryRow& row) {
+  sql("INSERT INTO directory (parent, path, inode, modified, settled, plain, missing) "
+      "VALUES (?, ?, ?, ?, ?, ?, ?)")
+      .bind(row.parent)
+      .bindBytes(row.path)
+      .bind(row.inode)
+      .bind(row.modified)
+      .bind(row.settled ? 1 : 0)
+      .bind(row.plain ? 1 : 0)
+      .bind(row.missing ? 1 : 0)
+      .run();
+  return _database->lastInsertedID();
+}
+
+void Catalogue::updateDirectory(const DirectoryRow& row) {
+  sql("UPDATE directory SET parent = ?, inode = ?, modified = ?, settled = ?, plain = ?, "
+      "missing = ? WHERE id = ?")
+      .bind(row.parent)
+      .bind(row.inode)
+      .bind(row.modified)
+      .bind(row.settled ? 1 : 0)
+      .bind(row.plain ? 1 : 0)
+      .bind(row.missing ? 1 : 0)
+      .bind(row.id)
+      .run();
+}
+
+void Catalogue::removeDirectory(int64_t id) {
+  sql("DELETE FROM directory WHERE id = ?").bind(id).run();
+}
+
+bool Catalogue::hasContent(int64_t directory) {
+  Statement& statement =
+      sql("SELECT EXISTS (SELECT 1 FROM file WHERE directory = ?1) OR "
+          "EXISTS (SELECT 1 FROM directory WHERE parent = ?1)");
+  statement.bind(directory);
+  return first(statement, [](const Statement& row) { return row.number(0); }).value_or(0) != 0;
+}
+
+// --- Files
+
+std::vector<FileRow> Catalogue::filesOf(int64_t directory) {
+  Statement& statement =
+      sql("SELECT id, directory, name, inode, size, modified, kind FROM file WHERE directory = ?");
+  statement.bind(directory);
+  return all(statement, fileOf);
+}
+
+std::vector<FileRow> Catalogue::filesWithInode(int64_t inode) {
+  Statement& statement =
+      sql("SELECT id, directory, name, inode, size, modified, kind FROM file WHERE inode = ?");
+  statement.bind(inode);
+  return all(statement, fileOf);
+}
+
+std::vector<FileRow> Catalogue::aliasesIn(int64_t directory) {
+  Statement& statement =
+      sql("SELECT id, directory, name, inode, size, modified, kind FROM file "
+          "WHERE kind = 4 AND directory = ?");
+  statement.bind(directory);
+  return all(statement, fileOf);
+}
+
+std::optional<FileRow> Catalogue::file(int64_t id) {
+  Statement& statement =
+      sql("SELECT id, directory, name, inode, size, modified, kind FROM file WHERE id = ?");
+  statement.bind(id);
+  return first(statement, fileOf);
+}
+
+int64_t Catalogue::addFile(const FileRow& row) {
+  sql("INSERT INTO file (directory, name, inode, size, modified, kind) VALUES (?, ?, ?, ?, ?, ?)")
+      .bind(row.directory)
+      .bindBytes(row.name)
+      .bind(row.inode)
+      .bind(row.size)
+      .bind(row.modified)
+      .bind(static_cast<int64_t>(row.kind))
+      .run();
+  return _database->lastInsertedID();
+}
+
+void Catalogue::updateFile(const FileRow& row) {
+  sql("UPDATE file SET directory = ?, name = ?, inode = ?, size = ?, modified = ?, kind = ? "
+      "WHERE id = ?")
+      .bind(row.directory)
+      .bindBytes(row.name)
+      .bind(row.inode)
+      .bind(row.size)
+      .bind(row.modified)
+      .bind(static_cast<int64_t>(row.kind))
+      .bind(row.id)
+      .run();
+}
+
+void Catalogue::removeFile(int64_t id) {
+  for (const MessageRow& message : messagesOf(id)) removeMessage(message.id);
+  sql("DELETE FROM file WHERE id = ?").bind(id).run();
+}
+
+// --- Messages
+
+std::vector<MessageRow> Catalogue::messagesOf(int64_t file) {
+  Statement& statement =
+      sql("SELECT id, file, identifier, digest, position, flags, sequence, replace FROM message "
+          "WHERE file = ?");
+  statement.bind(file);
+  return all(statement, messageOf);
+}
+
+std::optional<MessageRow> Catalogue::messageWithIdentifier(const std::string& identifier) {
+  Statement& statement =
+      sql("SELECT id, file, identifier, digest, position, flags, sequence, replace FROM message "
+          "WHERE identifier = ?");
+  statement.bindText(identifier);
+  return first(statement, messageOf);
+}
+
+void Catalogue::addMessage(const MessageRow& row) {
+  sql("INSERT INTO message (file, identifier, digest, position, flags, sequence, replace) "
+      "VALUES (?, ?, ?, ?, ?, ?, ?)")
+      .bind(row.file)
+      .bindText(row.identifier)
+      .bindText(row.digest)
+      .bind(row.offset)
+      .bindText(row.flags)
+      .bind(row.sequence)
+      .bind(row.replace ? 1 : 0)
+      .run();
+}
+
+void Catalogue::setPlace(int64_t message, int64_t offset, const std::string& flags) {
+  sql("UPDATE message SET position = ?, flags = ? WHERE id = ?")
+      .bind(offset)
+      .bindText(flags)
+      .bind(message)
+      .run();
+}
+
+void Catalogue::setDigest(int64_t message, const std::string& digest) {
+  sql("UPDATE message SET digest = ? WHERE id = ?").bindText(digest).bind(message).run();
+}
+
+void Catalogue::setStale(int64_t message) {
+  sql("UPDATE message SET replace = (replace OR sequence NOT IN (-1, 9223372036854775807)), "
+      "sequence = 9223372036854775807, problem = NULL WHERE id = ?")
+      .bind(message)
+      .run();
+}
+
+void Catalogue::setFailed(int64_t message, const std::string& problem, bool deleted) {
+  if (!deleted) noteDeletion(message);
+  sql("UPDATE message SET sequence = -1, replace = 0, problem = ? WHERE id = ?")
+      .bindText(problem)
+      .bind(message)
+      .run();
+}
+
+void Catalogue::noteDeletion(int64_t message) {
+  sql("INSERT OR REPLACE INTO deletion SELECT identifier, 9223372036854775807 FROM message "
+      "WHERE id = ? AND (replace OR sequence NOT IN (-1, 9223372036854775807))")
+      .bind(message)
+      .run();
+}
+
+void Catalogue::removeMessage(int64_t id) {
+  noteDeletion(id);
+  sql("DELETE FROM message WHERE id = ?").bind(id).run();
+}
+
+void Catalogue::retryFailed() {
+  sql("UPDATE message SET sequence = 9223372036854775807, problem = NULL WHERE sequence = -1")
+      .run();
+}
+
+// --- What is to be sent
+
+int64_t Catalogue::waitingCount() {
+  Statement& statement = sql("SELECT COUNT(*) FROM message WHERE sequence > ?");
+  statement.bind(_acknowledged);
+  return first(statement, [](const Statement& row) { return row.number(0); }).value_or(0);
+}
+
+std::vector<int64_t> Catalogue::waitingIDs() {
+  Statement& statement = sql("SELECT id FROM message WHERE sequence > ?");
+  statement.bind(_acknowledged);
+  auto ids = all(statement, [](const Statement& row) { return row.number(0); });
+  std::sort(ids.begin(), ids.end());
+  return ids;
+}
+
+std::optional<WaitingMessage> Catalogue::waitingMessage(int64_t id) {
+  Statement& statement = sql(
+      "SELECT m.id, m.file, m.identifier, m.digest, m.position, m.flags, m.sequence, m.replace, "
+      "f.kind, d.path, f.name FROM message m JOIN file f ON f.id = m.file "
+      "JOIN directory d ON d.id = f.directory WHERE m.id = ?");
+  statement.bind(id);
+  return first(statement, [](const Statement& row) {
+    return WaitingMessage{messageOf(row), static_cast<FileKind>(row.number(8)),
+                          platform::joinPath(row.text(9), row.text(10))};
+  });
+}
+
+void Catalogue::setSequence(int64_t message, int64_t sequence) {
+  sql("UPDATE message SET sequence = ?, replace = 0, problem = NULL WHERE id = ?")
+      .bind(sequence)
+      .bind(message)
+      .run();
+}
+
+int64_t Catalogue::waitingDeletionCount() {
+  Statement& statement = sql("SELECT COUNT(*) FROM deletion WHERE sequence > ?");
+  statement.bind(_acknowledged);
+  return first(statement, [](const Statement& row) { return row.number(0); }).value_or(0);
+}
+
+std::vector<std::string> Catalogue::waitingDeletions() {
+  Statement& statement = sql("SELECT identifier FROM deletion WHERE sequence > ?");
+  statement.bind(_acknowledged);
+  return all(statement, [](const Statement& row) { return row.text(0); });
+}
+
+void Catalogue::addDeletion(const std::string& identifier) {
+  setDeletionSequence(identifier, kWaiting);
+}
+
+void Catalogue::setDeletionSequence(const std::string& identifier, int64_t sequence) {
+  sql("INSERT OR REPLACE INTO deletion VALUES (?, ?)").bindText(identifier).bind(sequence).run();
+}
+
+void Catalogue::adopt(const std::vector<std::string>& identifiersInIndex, int64_t trusted) {
+  _database->execute("CREATE TEMP TABLE present (identifier TEXT PRIMARY KEY) WITHOUT ROWID");
+  for (const std::string& identifier : identifiersInIndex) {
+    sql("INSERT OR IGNORE INTO present VALUES (?)").bindText(identifier).run();
+  }
+  // What went out later is there in one version or another.
+  sql("UPDATE message SET replace = 1 WHERE sequence > ? AND sequence < 9223372036854775807")
+      .bind(std::min(trusted, _acknowledged))
+      .run();
+  // From here on an older state of the daemon tells nothing: what it had then and what has gone
+  // since is not known any more.
+  setAcknowledged(highestSequence() + 1);
+  setValue("horizon", std::to_string(_acknowledged));
+  sql("UPDATE message SET sequence = 9223372036854775807, "
+      "replace = (replace AND identifier IN present) WHERE sequence >= 0 "
+      "AND (replace OR identifier NOT IN present)")
+      .run();
+  sql("UPDATE message SET sequence = ? WHERE sequence >= 0 AND NOT replace "
+      "AND identifier IN present")
+      .bind(_acknowledged)
+      .run();
+  _database->execute("DELETE FROM deletion");
+  sql("INSERT INTO deletion SELECT identifier, 9223372036854775807 FROM present "
+      "WHERE identifier NOT IN (SELECT identifier FROM message WHERE sequence >= 0)")
+      .run();
+  _statements.clear();  // of the table that goes
+  _database->execute("DROP TABLE present");
+}
+
+// --- What there is to tell
+
+std::vector<FolderCount> Catalogue::folderCounts() {
+  Statement& statement =
+      sql("SELECT CASE WHEN f.kind = 2 THEN CAST(d.path || '/' || f.name AS BLOB) ELSE d.path END, "
+          "f.kind, COUNT(*), SUM(m.sequence BETWEEN 0 AND ?1), SUM(m.sequence > ?1), "
+          "SUM(m.sequence = -1), MAX(d.missing) FROM message m JOIN file f ON f.id = m.file "
+          "JOIN directory d ON d.id = f.directory GROUP BY 1, 2 ORDER BY 1");
+  statement.bind(_acknowledged);
+  std::map<std::string, FolderCount> folders;
+  while (statement.step()) {
+    std::string path = statement.text(0);
+    if (static_cast<FileKind>(statement.number(1)) == FileKind::maildir) {
+      path.resize(path.rfind('/'));  // the folder of "cur" and "new"
+    }
+    FolderCount& count = folders[path];
+    count.messages += statement.number(2);
+    count.indexed += statement.number(3);
+    count.waiting += statement.number(4);
+    count.failed += statement.number(5);
+    count.missing = count.missing || statement.number(6) != 0;
+  }
+  statement.reset();
+  std::vector<FolderCount> counts;
+  for (auto& [path, count] : folders) {
+    count.path = path;
+    counts.push_back(std::move(count));
+  }
+  return counts;
+}
+
+std::vector<Problem> Catalogue::problems(size_t most) {
+  Statement& statement = sql(
+      "SELECT m.identifier, d.path, f.name, m.problem FROM message m JOIN file f ON f.id = m.file "
+      "JOIN directory d ON d.id = f.directory WHERE m.sequence = -1 ORDER BY m.id LIMIT ?");
+  statement.bind(static_cast<int64_t>(most));
+  return all(statement, [](const Statement& row) {
+    return Problem{row.text(0), platform::joinPath(row.text(1), row.text(2)), row.text(3)};
+  });
+}
+
+std::optional<MessagePlace> Catalogue::find(const std::string& identifier) {
+  Statement& statement =
+      sql("SELECT d.path, f.name, m.position, m.flags, m.sequence FROM message m "
+          "JOIN file f ON f.id = m.file JOIN directory d ON d.id = f.directory "
+          "WHERE m.identifier = ?");
+  statement.bindText(identifier);
+  return first(statement, [this](const Statement& row) {
+    MessagePlace place{platform::joinPath(row.text(0), row.text(1)), std::nullopt, row.text(3),
+                       row.number(4) >= 0 && row.number(4) <= _acknowledged};
+    if (row.number(2) >= 0) place.offset = row.number(2);
+    return place;
+  });
+}
+
+// --- Places
+
+std::string defaultCatalogueDirectory() {
+  const char* const state = std::getenv("XDG_STATE_HOME");
+  if (state != nullptr && state[0] == '/') return platform::joinPath(state, "tallow");
+  const char* const home = std::getenv("HOME");
+  return platform::joinPath(home != nullptr ? home : "/", ".local/state/tallow");
+}
+
+std::string cataloguePath(const std::string& directory, const std::string& runtimeDirectory,
+                          const std::string& protectionClass) {
+  const std::string name = runtimeDirectory + '\0' + protectionClass;
+  char* const sum = g_compute_checksum_for_data(
+      G_CHECKSUM_SHA256, reinterpret_cast<const guchar*>(name.data()), name.size());
+  const std::string path =
+      platform::joinPath(directory, fmt::format("catalogue-{:.16}.sqlite", sum));
+  g_free(sum);
+  return path;
+}
+
+}  // namespace mailsync

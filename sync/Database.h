@@ -1,0 +1,79 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/TLError.h"
+
+struct sqlite3;
+struct sqlite3_stmt;
+
+namespace mailsync {
+
+class Database;
+
+inline constexpr const char* kCatalogueDomain = "com.quill.tallow.catalogue";
+
+// A prepared statement. A use binds its values in order, steps through the rows and ends with
+// `reset`, which `run` does by itself. The database keeps the first failure of a step.
+class Statement {
+ public:
+  Statement() = default;
+  Statement(Database& database, const char* text);
+
+  // Bytes are bound as a blob, so that names need not be UTF-8. They are not copied and must live
+  // until the reset.
+  Statement& bind(int64_t value);
+  Statement& bindText(std::string_view value);
+  Statement& bindBytes(std::string_view value);
+
+  // True at each row.
+  bool step();
+  // Steps to the end and resets. False after a failure.
+  bool run();
+  void reset();
+
+  [[nodiscard]] int64_t number(int column) const;
+  // Text or bytes; empty for NULL.
+  [[nodiscard]] std::string text(int column) const;
+
+ private:
+  struct Finalizer {
+    void operator()(sqlite3_stmt* statement) const;
+  };
+  Database* _database = nullptr;
+  std::unique_ptr<sqlite3_stmt, Finalizer> _statement;
+  int _bound = 0;
+};
+
+// One SQLite database with a write-ahead log. One thread at a time.
+//
+// The first failure stays, so that one look after a group of steps tells whether all went well.
+class Database {
+ public:
+  // Null with an error where the file cannot be opened or made.
+  [[nodiscard]] static std::unique_ptr<Database> open(const std::string& path, TLErrorOut error);
+  ~Database();
+  Database(const Database&) = delete;
+  Database& operator=(const Database&) = delete;
+
+  [[nodiscard]] Statement prepare(const char* text) { return {*this, text}; }
+  bool execute(const char* text);
+
+  [[nodiscard]] const std::optional<TLError>& failure() const { return _failure; }
+  [[nodiscard]] int64_t lastInsertedID() const;
+
+ private:
+  friend class Statement;
+
+  explicit Database(sqlite3* database) : _database(database) {}
+  void noteFailure();
+
+  sqlite3* const _database;
+  std::optional<TLError> _failure;
+};
+
+}  // namespace mailsync

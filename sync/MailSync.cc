@@ -1,0 +1,246 @@
+#include "sync/MailSync.h"
+
+#include <fmt/format.h>
+#include <sqlite3.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <thread>
+
+#include "platform/Clock.h"
+#include "platform/Files.h"
+#include "sync/Inventory.h"
+
+namespace mailsync {
+
+namespace {
+
+constexpr std::chrono::milliseconds kLockStep{50};
+constexpr const char* kLastSync = "lastSync";
+
+std::string pathOf(const SyncSettings& settings) {
+  return cataloguePath(settings.catalogueDirectory, settings.runtimeDirectory,
+                       settings.protectionClass);
+}
+
+// The lock of one catalogue; waits for another process, up to the bound.
+std::unique_ptr<platform::ProcessLock> acquireLock(const SyncSettings& settings,
+                                                   const std::function<bool()>& cancelled,
+                                                   TLErrorOut error) {
+  const std::string path = pathOf(settings) + ".lock";
+  const auto end = std::chrono::steady_clock::now() + settings.lockPatience;
+  while (true) {
+    std::optional<TLError> failure;
+    auto lock = platform::ProcessLock::acquire(path, &failure);
+    if (lock != nullptr) return lock;
+    if (failure->code != EWOULDBLOCK) {
+      platform::setError(error, *failure);
+      return nullptr;
+    }
+    if (std::chrono::steady_clock::now() >= end || cancelled()) {
+      platform::setError(error,
+                         {kBusyDomain, EWOULDBLOCK, "another sync of this class is at work"});
+      return nullptr;
+    }
+    std::this_thread::sleep_for(kLockStep);
+  }
+}
+
+// A file that is no catalogue any more is set aside, and one is made anew.
+std::unique_ptr<Catalogue> openForWriting(const std::string& path, TLErrorOut error) {
+  std::optional<TLError> failure;
+  auto catalogue = Catalogue::open(path, &failure);
+  if (catalogue == nullptr && (failure->code == SQLITE_NOTADB || failure->code == SQLITE_CORRUPT)) {
+    std::rename(path.c_str(), (path + ".damaged").c_str());
+    std::remove((path + "-wal").c_str());
+    std::remove((path + "-shm").c_str());
+    failure.reset();
+    catalogue = Catalogue::open(path, &failure);
+  }
+  if (catalogue == nullptr) platform::setError(error, *failure);
+  return catalogue;
+}
+
+// Absolute and without links; what is not there, as far as that goes.
+std::string canonical(const std::string& path) {
+  std::error_code failure;
+  std::string found = std::filesystem::weakly_canonical(path, failure).string();
+  if (failure) found = std::filesystem::absolute(path, failure).lexically_normal().string();
+  while (found.size() > 1 && found.back() == '/') found.pop_back();
+  return found;
+}
+
+bool isAtOrBelow(const std::string& path, const std::string& place) {
+  return path.starts_with(place) &&
+         (path.size() == place.size() || place == "/" || path[place.size()] == '/');
+}
+
+// Each of the paths once, and none that lies below another.
+std::vector<std::string> outermost(std::vector<std::string> paths) {
+  std::sort(paths.begin(), paths.end());
+  std::vector<std::string> kept;
+  for (std::string& path : paths) {
+    const bool covered = std::any_of(kept.begin(), kept.end(), [&](const std::string& other) {
+      return isAtOrBelow(path, other);
+    });
+    if (!covered) kept.push_back(std::move(path));
+  }
+  return kept;
+}
+
+class Run {
+ public:
+  Run(const SyncSettings& settings, const SyncObserver& observer, SyncReport& report)
+      : _settings(settings),
+        _observer(observer),
+        _report(report),
+        _service(settings.runtimeDirectory, settings.patience) {}
+
+  bool run(const std::vector<std::string>& paths, TLErrorOut error) {
+    const auto lock = acquireLock(_settings, _observer.cancelled, error);
+    if (lock == nullptr) return false;
+    _catalogue = openForWriting(pathOf(_settings), error);
+    if (_catalogue == nullptr) return false;
+    std::optional<TLError> failure;
+    const auto text =
+        _service.fetchLastClientState(_settings.name, _settings.protectionClass, &failure);
+    if (failure) {
+      platform::setError(error, *failure);
+      return false;
+    }
+    if (text) _stored = DeliveredState::parse(*text);
+    return update(paths, error) && (_settings.dryRun || _report.cancelled || deliver(error));
+  }
+
+ private:
+  // The catalogue after this tells what is to be done.
+  bool update(const std::vector<std::string>& paths, TLErrorOut error) {
+    _catalogue->begin();
+    scan(paths);
+    _report.cancelled = _observer.cancelled();
+    if (_report.cancelled || !reconcile(error)) {
+      _catalogue->rollback();
+      return _report.cancelled;
+    }
+    if (_settings.retryFailed) _catalogue->retryFailed();
+    _report.toSend = static_cast<uint64_t>(_catalogue->waitingCount());
+    _report.toDelete = static_cast<uint64_t>(_catalogue->waitingDeletionCount());
+    if (_settings.dryRun) tellPlan();
+    const auto failure = _catalogue->failure();
+    if (_settings.dryRun) {
+      _catalogue->rollback();
+    } else {
+      _catalogue->commit();
+    }
+    const auto& failed = failure ? failure : _catalogue->failure();
+    if (failed) platform::setError(error, *failed);
+    return !failed;
+  }
+
+  void scan(const std::vector<std::string>& paths) {
+    std::vector<std::string> roots = _catalogue->roots();
+    std::vector<std::string> wanted;
+    for (const std::string& path : paths) wanted.push_back(canonical(path));
+    wanted = outermost(std::move(wanted));
+    ScanSettings settings;
+    for (const std::string& path : _settings.excluded) {
+      settings.excluded.push_back(canonical(path));
+    }
+    settings.pruneMissing = _settings.pruneMissing;
+    settings.maximumFileBytes = _settings.maximumFileBytes;
+    settings.complain = _observer.complain;
+    settings.cancelled = _observer.cancelled;
+    MailboxScan scanner(*_catalogue, std::move(settings));
+    for (const std::string& path : paths.empty() ? roots : wanted) {
+      const bool found = scanner.scan(path);
+      if (found) roots.push_back(path);
+      if (!found && _settings.pruneMissing) std::erase(roots, path);
+    }
+    scanner.finish();
+    _report.scan = scanner.counts();
+    for (const std::string& root : _catalogue->roots()) _catalogue->removeRoot(root);
+    for (const std::string& root : outermost(std::move(roots))) _catalogue->addRoot(root);
+  }
+
+  // Brings catalogue and index together. By the daemon's state where that is of this catalogue: a
+  // batch that it has and that was not recorded counts as sent, and what it has lost waits again.
+  // In all other cases the index is asked for what it holds.
+  bool reconcile(TLErrorOut error) {
+    if (_stored && _stored->catalogue == _catalogue->id() &&
+        _stored->sequence <= _catalogue->highestSequence() &&
+        _stored->sequence >= _catalogue->horizon()) {
+      if (_stored->sequence != _catalogue->acknowledged()) {
+        _catalogue->setAcknowledged(_stored->sequence);
+      }
+      return true;
+    }
+    _report.compared = true;
+    std::vector<std::string> folders;
+    for (const DirectoryRow& row : _catalogue->directories()) folders.push_back(row.path);
+    for (const FolderCount& count : _catalogue->folderCounts()) folders.push_back(count.path);
+    const auto present =
+        readInventory(_service, _settings.protectionClass, _catalogue->roots(), folders, error);
+    const bool ours = _stored && _stored->catalogue == _catalogue->id();
+    if (present) _catalogue->adopt(*present, ours ? _stored->sequence : kWaiting);
+    return present.has_value();
+  }
+
+  void tellPlan() {
+    for (const int64_t id : _catalogue->waitingIDs()) {
+      if (const auto waiting = _catalogue->waitingMessage(id)) {
+        _observer.plan("send", waiting->message.identifier);
+      }
+    }
+    for (const std::string& identifier : _catalogue->waitingDeletions()) {
+      _observer.plan("delete", identifier);
+    }
+  }
+
+  bool deliver(TLErrorOut error) {
+    const auto progress = [&](const DeliveryCounts& done) {
+      _observer.progress(_report.toSend, _report.toDelete, done);
+    };
+    if (_report.toSend + _report.toDelete > 0) progress({});
+    Delivery delivery(*_catalogue, _service, {_settings.name, _settings.protectionClass},
+                      {_observer.complain, progress, _observer.cancelled});
+    const bool done = delivery.run(_stored, error);
+    _report.delivery = delivery.counts();
+    _report.cancelled = _observer.cancelled();
+    if (!done || _report.cancelled) return done;
+    _catalogue->begin();
+    _catalogue->setValue(kLastSync,
+                         std::to_string(static_cast<int64_t>(platform::secondsSince1970())));
+    if (_catalogue->commit()) return true;
+    platform::setError(error, *_catalogue->failure());
+    return false;
+  }
+
+  const SyncSettings& _settings;
+  const SyncObserver& _observer;
+  SyncReport& _report;
+  client::SearchServiceProxy _service;
+  std::unique_ptr<Catalogue> _catalogue;
+  std::optional<DeliveredState> _stored;
+};
+
+}  // namespace
+
+bool syncMail(const SyncSettings& settings, const std::vector<std::string>& paths,
+              const SyncObserver& observer, SyncReport& report, TLErrorOut error) {
+  return Run(settings, observer, report).run(paths, error);
+}
+
+std::unique_ptr<Catalogue> openCatalogue(const SyncSettings& settings, TLErrorOut error) {
+  const std::string path = pathOf(settings);
+  return platform::fileExists(path) ? Catalogue::open(path, error) : nullptr;
+}
+
+std::optional<int64_t> lastSync(Catalogue& catalogue) {
+  const std::string text = catalogue.value(kLastSync);
+  return text.empty() ? std::nullopt : std::optional(std::strtoll(text.c_str(), nullptr, 10));
+}
+
+}  // namespace mailsync

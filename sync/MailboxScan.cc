@@ -1,0 +1,546 @@
+#include "sync/MailboxScan.h"
+
+#include <fmt/format.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <ctime>
+#include <utility>
+
+#include "cli/Identifier.h"
+#include "cli/MailFile.h"
+#include "cli/MailWalker.h"
+#include "platform/Files.h"
+#include "platform/Paths.h"
+#include "sync/MessageDigest.h"
+
+namespace mailsync {
+
+namespace {
+
+constexpr int64_t kSecond = 1'000'000'000;
+
+int64_t nanoseconds(const timespec& time) {
+  return static_cast<int64_t>(time.tv_sec) * kSecond + time.tv_nsec;
+}
+
+int64_t currentTime() {
+  timespec now{};
+  clock_gettime(CLOCK_REALTIME, &now);
+  return nanoseconds(now);
+}
+
+bool look(const std::string& path, struct stat& info) {
+  return stat(path.c_str(), &info) == 0;
+}
+
+std::string directoryOf(const std::string& path) {
+  const size_t slash = path.rfind('/');
+  return slash == 0 ? "/" : path.substr(0, slash);
+}
+
+std::string nameOf(const std::string& path) {
+  return path.substr(path.rfind('/') + 1);
+}
+
+bool isBelow(const std::string& path, const std::string& directory) {
+  return path.size() > directory.size() && path.starts_with(directory) &&
+         path[directory.size()] == '/';
+}
+
+bool sameState(const FileRow& a, const FileRow& b) {
+  return a.inode == b.inode && a.size == b.size && a.modified == b.modified;
+}
+
+// "new" before "cur", so that a message that is moved meanwhile is seen in one of them.
+bool visitedBefore(const std::string& a, const std::string& b) {
+  const bool aIsCur = nameOf(a) == "cur";
+  const bool bIsCur = nameOf(b) == "cur";
+  return aIsCur != bIsCur ? bIsCur : a < b;
+}
+
+// What reading a file outside of Maildirs has shown.
+struct FileContent {
+  struct Message {
+    std::string digest;
+    int64_t offset;
+    std::string flags;
+    std::string problem;
+  };
+  FileKind kind = FileKind::other;
+  std::vector<Message> messages;
+  std::optional<std::string> failure;  // of the file as a whole
+  bool complete = true;                // its end was read
+};
+
+FileContent readContent(const std::string& path) {
+  FileContent content;
+  const cli::MailSink sink{
+      [&](std::string_view bytes, const cli::MessageOrigin& origin) {
+        content.kind = origin.offset ? FileKind::mbox : FileKind::single;
+        content.messages.push_back({messageDigest(bytes),
+                                    origin.offset ? static_cast<int64_t>(*origin.offset) : -1,
+                                    origin.offset ? statusFlags(bytes) : "", ""});
+        content.complete = true;
+        return true;
+      },
+      [&](const std::string& where, const std::string& reason) {
+        content.complete = false;
+        if (where == path) {
+          content.failure = reason;
+        } else {
+          const std::string offset = where.substr(std::min(path.size() + 1, where.size()));
+          content.kind = FileKind::mbox;
+          content.messages.push_back({"", std::strtoll(offset.c_str(), nullptr, 10), "", reason});
+        }
+        return true;
+      },
+      [](const std::string&) {}, [](uint64_t) {}};
+  cli::readMailFile(path, false, sink);
+  return content;
+}
+
+}  // namespace
+
+MailboxScan::MailboxScan(Catalogue& catalogue, ScanSettings settings)
+    : _catalogue(catalogue), _settings(std::move(settings)), _now(currentTime()) {
+  for (DirectoryRow& row : catalogue.directories()) {
+    _paths[row.id] = row.path;
+    if (row.parent != 0) _children[row.parent].push_back(row.path);
+    std::string path = row.path;
+    _directories.emplace(std::move(path), std::move(row));
+  }
+}
+
+bool MailboxScan::scan(const std::string& path) {
+  struct stat info {};
+  if (!look(path, info)) {
+    const int code = errno;
+    if (_directories.contains(path)) {
+      noteMissing(path);
+    } else {
+      _settings.complain(path, platform::posixError(code, "cannot open").message);
+      ++_counts.unreadable;
+    }
+    return false;
+  }
+  if (!S_ISDIR(info.st_mode)) {
+    scanFile(path, info);
+    return true;
+  }
+  std::vector<Place> pending{{path, 0, 0}};
+  while (!pending.empty() && !_settings.cancelled()) {
+    const Place place = std::move(pending.back());
+    pending.pop_back();
+    scanDirectory(place, pending);
+  }
+  return true;
+}
+
+// --- Directories
+
+void MailboxScan::scanDirectory(const Place& place, std::vector<Place>& pending) {
+  if (excluded(place.path)) return removeTree(place.path);
+  struct stat info {};
+  const bool there = look(place.path, info);
+  if (!there && errno != ENOENT && errno != ENOTDIR) {
+    _settings.complain(place.path, platform::posixError(errno, "cannot look into").message);
+    ++_counts.unreadable;
+    return;
+  }
+  if (!there || !S_ISDIR(info.st_mode)) return noteMissing(place.path);
+  ++_counts.directories;
+  if (place.depth > cli::kMaximumDirectoryDepth) {
+    _settings.complain(place.path,
+                       fmt::format("more than {} directories deep", cli::kMaximumDirectoryDepth));
+    ++_counts.unreadable;
+    return;
+  }
+  DirectoryRow& row = directoryAt(place.path, place.parent);
+  const bool unchanged = row.settled && !row.missing && row.modified == nanoseconds(info.st_mtim) &&
+                         row.inode == static_cast<int64_t>(info.st_ino);
+  std::vector<std::string> below = _children[row.id];
+  if (unchanged) {
+    if (row.plain) compareFiles(row);
+  } else if (!listDirectory(row, info, below)) {
+    return;
+  }
+  std::sort(below.begin(), below.end(), visitedBefore);
+  below.erase(std::unique(below.begin(), below.end()), below.end());
+  for (auto path = below.rbegin(); path != below.rend(); ++path) {
+    pending.push_back({*path, row.id, place.depth + 1});
+  }
+}
+
+DirectoryRow& MailboxScan::directoryAt(const std::string& path, int64_t parent) {
+  const auto [found, isNew] = _directories.try_emplace(path);
+  DirectoryRow& row = found->second;
+  if (isNew) {
+    row.path = path;
+    row.parent = parent;
+    row.id = _catalogue.addDirectory(row);
+    _paths[row.id] = path;
+  } else if (row.parent != parent && parent != 0) {
+    row.parent = parent;
+    row.settled = false;
+  }
+  return row;
+}
+
+// False where its files cannot be told; then it stays as it was.
+bool MailboxScan::listDirectory(DirectoryRow& row, const struct stat& info,
+                                std::vector<std::string>& below) {
+  std::optional<TLError> error;
+  auto names = platform::listDirectory(row.path, &error);
+  if (!names) {
+    _settings.complain(row.path, error->message);
+    ++_counts.unreadable;
+    return false;
+  }
+  const auto inode = static_cast<int64_t>(info.st_ino);
+  // What is left where a disk was mounted.
+  if (names->empty() && row.inode != inode && _catalogue.hasContent(row.id)) {
+    noteMissing(row.path);
+    return false;
+  }
+  ++_counts.entered;
+  std::map<std::string, FileRow> known;
+  for (FileRow& file : _catalogue.filesOf(row.id)) known.emplace(file.name, file);
+  const bool isMaildir = std::find(names->begin(), names->end(), "cur") != names->end();
+  row.plain = false;
+  for (const std::string& name : *names) {
+    const std::string path = platform::joinPath(row.path, name);
+    struct stat entry {};
+    struct stat target {};
+    // What is gone by now has been moved or deleted meanwhile.
+    if (lstat(path.c_str(), &entry) != 0 || !look(path, target)) continue;
+    if (S_ISDIR(entry.st_mode)) {
+      if (!(isMaildir && name == "tmp")) below.push_back(path);
+    } else if (S_ISREG(target.st_mode)) {
+      row.plain = row.plain || !cli::isMaildirFile(path);
+      const auto found = known.find(name);
+      if (found == known.end()) {
+        FileRow arrived = rowOf(target);
+        arrived.directory = row.id;
+        arrived.name = name;
+        _arrivals.push_back(
+            {row.id, path, std::move(arrived), static_cast<int64_t>(target.st_dev)});
+      } else {
+        compareFile(path, found->second, target);
+        known.erase(found);
+      }
+    }
+  }
+  for (const auto& [name, file] : known) _departures.insert(file.id);
+  row.inode = inode;
+  row.modified = nanoseconds(info.st_mtim);
+  row.settled = row.modified + kTimeStep < _now;
+  row.missing = false;
+  _catalogue.updateDirectory(row);
+  return true;
+}
+
+// The directory and all that the catalogue has below it.
+std::vector<std::string> MailboxScan::treeOf(const std::string& path) const {
+  std::vector<std::string> tree;
+  for (auto at = _directories.lower_bound(path); at != _directories.end(); ++at) {
+    if (at->first == path || isBelow(at->first, path)) {
+      tree.push_back(at->first);
+    } else if (!at->first.starts_with(path)) {
+      break;
+    }
+  }
+  return tree;
+}
+
+void MailboxScan::noteMissing(const std::string& path) {
+  if (_settings.pruneMissing) return removeTree(path);
+  for (const std::string& below : treeOf(path)) {
+    DirectoryRow& row = _directories.at(below);
+    row.missing = true;
+    row.settled = false;
+    _catalogue.updateDirectory(row);
+    _missing.insert(below);
+  }
+}
+
+void MailboxScan::removeTree(const std::string& path) {
+  for (const std::string& below : treeOf(path)) {
+    const int64_t id = _directories.at(below).id;
+    for (const FileRow& file : _catalogue.filesOf(id)) _departures.insert(file.id);
+    _catalogue.removeDirectory(id);
+    _directories.erase(below);
+  }
+}
+
+// A directory that was renamed has nothing left that is its own.
+void MailboxScan::settleMissing() {
+  for (const std::string& path : _missing) {
+    const int64_t id = _directories.at(path).id;
+    if (!_catalogue.hasContent(id)) {
+      _catalogue.removeDirectory(id);
+      continue;
+    }
+    if (_missing.contains(directoryOf(path))) continue;
+    ++_counts.missing;
+    _settings.complain(path,
+                       "is not there; its mail stays in the index (--prune-missing drops it)");
+  }
+}
+
+// --- Files
+
+void MailboxScan::scanFile(const std::string& path, const struct stat& info) {
+  const std::string name = nameOf(path);
+  DirectoryRow& directory = directoryAt(directoryOf(path), 0);
+  for (const FileRow& file : _catalogue.filesOf(directory.id)) {
+    if (file.name == name) return compareFile(path, file, info);
+  }
+  FileRow arrived = rowOf(info);
+  arrived.directory = directory.id;
+  arrived.name = name;
+  _arrivals.push_back({directory.id, path, std::move(arrived), static_cast<int64_t>(info.st_dev)});
+}
+
+void MailboxScan::compareFiles(const DirectoryRow& row) {
+  for (const FileRow& file : _catalogue.filesOf(row.id)) {
+    struct stat info {};
+    const std::string path = platform::joinPath(row.path, file.name);
+    if (look(path, info)) {
+      compareFile(path, file, info);
+    } else if (errno == ENOENT) {
+      _departures.insert(file.id);
+    }
+  }
+}
+
+void MailboxScan::compareFile(const std::string& path, FileRow row, const struct stat& info) {
+  FileRow seen = rowOf(info);
+  if (sameState(seen, row)) return;
+  seen.id = row.id;
+  seen.directory = row.directory;
+  seen.name = row.name;
+  seen.kind = row.kind;
+  if (row.kind == FileKind::alias && seen.inode != row.inode) {
+    _departures.insert(row.id);
+    _arrivals.push_back({seen.directory, path, seen, static_cast<int64_t>(info.st_dev)});
+  } else if (row.kind == FileKind::alias) {
+    _catalogue.updateFile(seen);
+  } else if (row.kind == FileKind::maildir) {
+    checkContent(path, row);
+    _catalogue.updateFile(seen);
+  } else {
+    readPlainFile(path, seen);
+  }
+}
+
+void MailboxScan::finish() {
+  while (!_settings.cancelled() && (!_arrivals.empty() || !_departures.empty())) {
+    // What was an alias goes first, since its name may be wanted.
+    for (auto id = _departures.begin(); id != _departures.end();) {
+      const auto row = _catalogue.file(*id);
+      if (row && row->kind == FileKind::alias) _catalogue.removeFile(*id);
+      id = !row || row->kind == FileKind::alias ? _departures.erase(id) : std::next(id);
+    }
+    for (Arrival& arrival : std::exchange(_arrivals, {})) settle(arrival);
+    for (const int64_t id : std::exchange(_departures, {})) {
+      if (const auto row = _catalogue.file(id)) removeFile(*row);
+    }
+  }
+  settleMissing();
+}
+
+void MailboxScan::settle(Arrival& arrival) {
+  if (cli::isMaildirFile(arrival.path)) {
+    arrival.row.kind = FileKind::maildir;
+    if (settleMaildir(arrival)) return;
+  }
+  if (!settleAlias(arrival)) addFile(arrival);
+}
+
+// True where the message is known by another name.
+bool MailboxScan::settleMaildir(Arrival& arrival) {
+  const auto message = _catalogue.messageWithIdentifier(cli::maildirIdentifier(arrival.path));
+  const auto before = message ? _catalogue.file(message->file) : std::nullopt;
+  if (!before) return false;
+  struct stat info {};
+  if (!_departures.contains(before->id) && look(pathOf(*before), info)) {
+    arrival.row.kind = FileKind::alias;
+    _catalogue.addFile(arrival.row);
+    return true;
+  }
+  _departures.erase(before->id);
+  arrival.row.id = before->id;
+  _catalogue.updateFile(arrival.row);
+  const std::string flags(cli::maildirFlags(arrival.path));
+  if (flags != message->flags) {
+    _catalogue.setPlace(message->id, -1, flags);
+    ++_counts.flagChanges;
+  } else {
+    ++_counts.moves;
+  }
+  if (!sameState(*before, arrival.row)) checkContent(arrival.path, arrival.row);
+  return true;
+}
+
+// True where the same file is known by another path.
+bool MailboxScan::settleAlias(Arrival& arrival) {
+  for (const FileRow& row : _catalogue.filesWithInode(arrival.row.inode)) {
+    if (row.kind == FileKind::alias || _departures.contains(row.id)) continue;
+    struct stat info {};
+    if (look(pathOf(row), info)) {
+      if (static_cast<int64_t>(info.st_ino) != arrival.row.inode ||
+          static_cast<int64_t>(info.st_dev) != arrival.device) {
+        continue;
+      }
+      arrival.row.kind = FileKind::alias;
+      _catalogue.addFile(arrival.row);
+      return true;
+    }
+    // It has been moved here, from a directory that is not there any more.
+    if (errno == ENOENT && sameState(row, arrival.row)) _departures.insert(row.id);
+  }
+  return false;
+}
+
+void MailboxScan::addFile(Arrival& arrival) {
+  const auto size = static_cast<uint64_t>(arrival.row.size);
+  const bool tooLarge = _settings.maximumFileBytes > 0 && size > _settings.maximumFileBytes;
+  if (tooLarge) {
+    _settings.complain(arrival.path, "larger than the limit, left out");
+  } else if (arrival.row.kind == FileKind::maildir) {
+    MessageRow message;
+    message.file = _catalogue.addFile(arrival.row);
+    message.identifier = cli::maildirIdentifier(arrival.path);
+    message.flags = cli::maildirFlags(arrival.path);
+    return _catalogue.addMessage(message);
+  }
+  arrival.row.kind = FileKind::other;
+  arrival.row.id = _catalogue.addFile(arrival.row);
+  if (!tooLarge) readPlainFile(arrival.path, arrival.row);
+}
+
+// Another path to the file, or another file of the message's name, takes its place.
+void MailboxScan::removeFile(const FileRow& row) {
+  std::vector<FileRow> heirs;
+  for (FileRow& other : _catalogue.filesWithInode(row.inode)) {
+    if (other.kind == FileKind::alias) heirs.push_back(std::move(other));
+  }
+  if (row.kind == FileKind::maildir) {
+    const std::string path = pathOf(row);
+    const std::string folder = directoryOf(directoryOf(path));
+    const std::string identifier = cli::maildirIdentifier(path);
+    for (const char* sub : {"/new", "/cur"}) {
+      const auto directory = _directories.find(folder + sub);
+      if (directory == _directories.end()) continue;
+      for (FileRow& other : _catalogue.aliasesIn(directory->second.id)) {
+        if (cli::maildirIdentifier(pathOf(other)) == identifier) heirs.push_back(std::move(other));
+      }
+    }
+  }
+  _catalogue.removeFile(row.id);
+  for (const FileRow& heir : heirs) {
+    struct stat info {};
+    const std::string path = pathOf(heir);
+    if (!_catalogue.file(heir.id)) continue;  // named twice
+    _catalogue.removeFile(heir.id);
+    if (!look(path, info)) continue;
+    FileRow arrived = rowOf(info);
+    arrived.directory = heir.directory;
+    arrived.name = heir.name;
+    _arrivals.push_back(
+        {heir.directory, path, std::move(arrived), static_cast<int64_t>(info.st_dev)});
+  }
+}
+
+// --- Contents
+
+void MailboxScan::readPlainFile(const std::string& path, FileRow& row) {
+  const FileContent content = readContent(path);
+  if (content.failure) {
+    _settings.complain(path, *content.failure);
+    ++_counts.unreadable;
+  }
+  std::map<std::string, MessageRow> known;
+  for (MessageRow& message : _catalogue.messagesOf(row.id)) {
+    std::string identifier = message.identifier;
+    known.emplace(std::move(identifier), std::move(message));
+  }
+  std::map<std::string, int> copies;
+  for (const FileContent::Message& seen : content.messages) {
+    MessageRow message;
+    message.file = row.id;
+    message.digest = seen.digest;
+    message.offset = seen.offset;
+    message.flags = seen.flags;
+    if (content.kind == FileKind::single) {
+      message.identifier = cli::fileIdentifier(path);
+    } else if (!seen.problem.empty()) {
+      message.identifier = cli::mboxIdentifier(path, static_cast<uint64_t>(seen.offset));
+    } else {
+      const int copy = copies[seen.digest]++;
+      message.identifier = cli::mboxIdentifier(
+          path, copy == 0 ? seen.digest : fmt::format("{}.{}", seen.digest, copy));
+    }
+    const auto found = known.find(message.identifier);
+    if (found == known.end()) {
+      _catalogue.addMessage(message);
+    } else {
+      const MessageRow& before = found->second;
+      if (before.flags != message.flags) ++_counts.flagChanges;
+      if (before.flags != message.flags || before.offset != message.offset) {
+        _catalogue.setPlace(before.id, message.offset, message.flags);
+      }
+      if (before.digest != message.digest) {
+        _catalogue.setStale(before.id);
+        _catalogue.setDigest(before.id, message.digest);
+      }
+      known.erase(found);
+    }
+    if (!seen.problem.empty()) {
+      const auto added = _catalogue.messageWithIdentifier(message.identifier);
+      if (added) _catalogue.setFailed(added->id, seen.problem);
+    }
+  }
+  // What lies behind a place that cannot be read is not known to be gone.
+  if (content.complete) {
+    for (const auto& [identifier, message] : known) _catalogue.removeMessage(message.id);
+  }
+  row.kind = !content.complete && content.messages.empty() ? row.kind : content.kind;
+  // A file can change within the same step of time, and its rights without any.
+  if (content.failure || row.modified + kTimeStep >= _now) row.modified = -1;
+  _catalogue.updateFile(row);
+}
+
+// Of a Maildir's file: has the message changed, or may one that failed be tried again?
+void MailboxScan::checkContent(const std::string& path, const FileRow& row) {
+  const FileContent content = readContent(path);
+  for (const MessageRow& message : _catalogue.messagesOf(row.id)) {
+    const std::string digest = content.messages.empty() ? "" : content.messages.front().digest;
+    if (digest == message.digest && message.sequence != kFailed) continue;
+    if (message.digest.empty() && message.sequence == kWaiting) continue;
+    _catalogue.setStale(message.id);
+    _catalogue.setDigest(message.id, digest);
+  }
+}
+
+std::string MailboxScan::pathOf(const FileRow& row) const {
+  const auto directory = _paths.find(row.directory);
+  return platform::joinPath(directory == _paths.end() ? "/" : directory->second, row.name);
+}
+
+bool MailboxScan::excluded(const std::string& path) const {
+  return std::find(_settings.excluded.begin(), _settings.excluded.end(), path) !=
+         _settings.excluded.end();
+}
+
+FileRow MailboxScan::rowOf(const struct stat& info) const {
+  FileRow row;
+  row.inode = static_cast<int64_t>(info.st_ino);
+  row.size = static_cast<int64_t>(info.st_size);
+  row.modified = nanoseconds(info.st_mtim);
+  return row;
+}
+
+}  // namespace mailsync

@@ -1,0 +1,131 @@
+#include "tests/sync/StoringDaemon.h"
+
+#include <gtest/gtest.h>
+
+#include "platform/Text.h"
+#include "records/TLQuery.h"
+
+namespace testsupport {
+
+namespace {
+
+const TLError kUnknownIdentifier{"DocStore", 12, "not found"};
+const TLError kItemRefused{"TALIndexer", 1, "index failed"};
+const TLError kBroken{"Test", 5, "the call failed"};
+
+}  // namespace
+
+StoringDaemon::StoringDaemon() {
+  using platform::RPCArguments;
+  using Reply = std::shared_ptr<platform::RPCReply>;
+  const auto add = [&](const char* member, const char* input, const char* output, auto handler) {
+    _interface.methods.push_back({member, input, output, std::vector<const char*>(), handler});
+  };
+  add("DeleteItemsWithIdentifiers", "asss", "", [this](RPCArguments& arguments, Reply reply) {
+    std::vector<std::string> identifiers;
+    for (const auto text : arguments.readStringArray()) identifiers.emplace_back(text);
+    change(identifiers, {}, std::nullopt, *reply);
+  });
+  add("IndexItemsDeleteItemsWithIdentifiers", "aayasbayss", "",
+      [this](RPCArguments& arguments, Reply reply) {
+        std::vector<std::string> items;
+        for (const auto bytes : arguments.readBytesArray()) items.emplace_back(bytes);
+        std::vector<std::string> identifiers;
+        for (const auto text : arguments.readStringArray()) identifiers.emplace_back(text);
+        const bool given = arguments.readBoolean();
+        std::optional<std::string> state = std::string(arguments.readBytes());
+        if (!given) state.reset();
+        change(identifiers, items, state, *reply);
+      });
+  add("FetchLastClientState", "ss", "bay", [this](RPCArguments&, Reply reply) {
+    const Content now = content();
+    reply->send({now.state.has_value(), platform::RPCBytes{now.state.value_or("")}});
+  });
+  add("SearchItemsForQuery", "aytsx", "aay", [this](RPCArguments& arguments, Reply reply) {
+    search(std::string(arguments.readBytes()), *reply);
+  });
+  _listener =
+      platform::makeRPCListener(_loop, _directory.path(), "com.quill.tallowsearch.SearchService");
+  _listener->setDelegate([this](auto&, platform::RPCConnection& connection) {
+    connection.setExportedInterface(&_interface);
+    return true;
+  });
+  std::optional<TLError> error;
+  EXPECT_TRUE(_listener->resume(&error)) << platform::printable(error);
+  _thread = std::thread([this] { _loop.run(); });
+}
+
+StoringDaemon::~StoringDaemon() {
+  _loop.post([this] { _listener.reset(); });
+  _loop.stop();
+  _thread.join();
+}
+
+void StoringDaemon::change(const std::vector<std::string>& identifiers,
+                           const std::vector<std::string>& items,
+                           const std::optional<std::string>& state, platform::RPCReply& reply) {
+  const platform::MutexLock lock(_mutex);
+  Fault fault = Fault::none;
+  if (_fault != Fault::none && _faultIn-- == 0) fault = std::exchange(_fault, Fault::none);
+  if (fault == Fault::before) return reply.sendError(kBroken);
+  for (const std::string& identifier : identifiers) {
+    if (_content.items.erase(identifier) == 0) return reply.sendError(kUnknownIdentifier);
+  }
+  if (fault == Fault::afterDeletions) return reply.sendError(kBroken);
+  for (const std::string& bytes : items) {
+    auto item = std::make_shared<TLIndexableItem>();
+    EXPECT_TRUE(item->initWithData(bytes));
+    ++_received;
+    const auto& subject = item->stringValueForKey(TLAttributeKey::SUBJECT);
+    if (!_refused.empty() && subject &&
+        platform::toUTF8(*subject).find(_refused) != std::string::npos) {
+      return reply.sendError(kItemRefused);
+    }
+    _content.items[platform::toUTF8(platform::orEmpty(item->identifier()))] = std::move(item);
+  }
+  if (fault == Fault::afterItems) return reply.sendError(kBroken);
+  if (state) _content.state = state;
+  if (fault == Fault::afterState) return reply.sendError(kBroken);
+  reply.send({});
+}
+
+// Of what an inventory asks for: items whose folder's path begins with a text.
+void StoringDaemon::search(const std::string& bytes, platform::RPCReply& reply) {
+  TLQuery query;
+  EXPECT_TRUE(query.initWithData(bytes));
+  const TLString place(platform::orEmpty(query.root()->stringValue()));
+  platform::RPCBytesArray found;
+  for (const auto& [identifier, item] : content().items) {
+    const auto* folders = item->stringValuesForKey(TLAttributeKey::MAILBOX_IDENTIFIERS);
+    if (folders != nullptr && folders->front().starts_with(place)) found.push_back(item->data());
+  }
+  reply.send({found});
+}
+
+StoringDaemon::Content StoringDaemon::content() const {
+  const platform::MutexLock lock(_mutex);
+  return _content;
+}
+
+void StoringDaemon::setContent(Content content) {
+  const platform::MutexLock lock(_mutex);
+  _content = std::move(content);
+}
+
+void StoringDaemon::failAfter(size_t calls, Fault fault) {
+  const platform::MutexLock lock(_mutex);
+  _faultIn = calls;
+  _fault = fault;
+}
+
+void StoringDaemon::refuse(const std::string& subject) {
+  const platform::MutexLock lock(_mutex);
+  _refused = subject;
+}
+
+size_t StoringDaemon::received() const {
+  const platform::MutexLock lock(_mutex);
+  return _received;
+}
+
+}  // namespace testsupport

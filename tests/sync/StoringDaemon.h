@@ -1,0 +1,63 @@
+#pragma once
+
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/Mutex.h"
+#include "platform/RPC.h"
+#include "platform/RunLoop.h"
+#include "records/TLIndexableItem.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace testsupport {
+
+// The search service of the daemon in this process, as far as a sync needs it: it holds items by
+// identifier and a client state, in memory. An unknown identifier ends a list of deletions with an
+// error, as in the daemon.
+class StoringDaemon {
+ public:
+  struct Content {
+    std::map<std::string, std::shared_ptr<TLIndexableItem>> items;
+    std::optional<std::string> state;
+  };
+  // What happens to a call that indexes or deletes: it is carried out this far, and fails.
+  enum class Fault { none, before, afterDeletions, afterItems, afterState };
+
+  StoringDaemon();
+  ~StoringDaemon();
+  StoringDaemon(const StoringDaemon&) = delete;
+  StoringDaemon& operator=(const StoringDaemon&) = delete;
+
+  [[nodiscard]] const std::string& runtimeDirectory() const { return _directory.path(); }
+  [[nodiscard]] Content content() const;
+  void setContent(Content content);
+  // Of the call after the next `calls`.
+  void failAfter(size_t calls, Fault fault);
+  // Items whose subject holds the text stop their batch.
+  void refuse(const std::string& subject);
+  // How many items have come, since the start.
+  [[nodiscard]] size_t received() const;
+
+ private:
+  void change(const std::vector<std::string>& identifiers, const std::vector<std::string>& items,
+              const std::optional<std::string>& state, platform::RPCReply& reply);
+  void search(const std::string& query, platform::RPCReply& reply);
+
+  TemporaryDirectory _directory;
+  platform::RPCInterface _interface;
+  mutable platform::Mutex _mutex;
+  Content _content TL_GUARDED_BY(_mutex);
+  Fault _fault TL_GUARDED_BY(_mutex) = Fault::none;
+  size_t _faultIn TL_GUARDED_BY(_mutex) = 0;
+  std::string _refused TL_GUARDED_BY(_mutex);
+  size_t _received TL_GUARDED_BY(_mutex) = 0;
+  platform::RunLoop _loop;
+  std::unique_ptr<platform::RPCListener> _listener;
+  std::thread _thread;
+};
+
+}  // namespace testsupport
