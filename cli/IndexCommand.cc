@@ -186,8 +186,7 @@ ExitStatus indexStandardInput(const Options& options) {
     message.remove_prefix(std::min(message.find('\n'), message.size() - 1) + 1);
   }
   MessageParser parser;
-  auto result =
-      parser.parse(message, {"message/" + mailsync::messageDigest(message), "", ""});
+  auto result = parser.parse(message, {"message/" + mailsync::messageDigest(message), "", ""});
   if (const auto* bad = std::get_if<UnparsableMessage>(&result)) {
     complain("the standard input: " + bad->reason);
     return ExitStatus::failure;
