@@ -25,6 +25,8 @@ struct MailHead {
 // itself, when it is asked for, and heads are kept. One thread.
 class MailFacts {
  public:
+  explicit MailFacts(MailReader::OffsetOf offsetOf = nullptr) : _reader(std::move(offsetOf)) {}
+
   // None where the message cannot be read; `unreadable` counts these.
   [[nodiscard]] std::optional<MailHead> head(const std::string& identifier);
   [[nodiscard]] std::optional<bool> flag(const std::string& identifier, usersyntax::Flag flag);

@@ -5,6 +5,7 @@
 #include "cli/LineReader.h"
 #include "cli/MailFile.h"
 #include "platform/Files.h"
+#include "sync/MessageDigest.h"
 
 namespace cli {
 
@@ -59,6 +60,11 @@ std::optional<std::string> readMboxMessage(LineReader& lines, size_t most, TLErr
   return message;
 }
 
+// `name` is the digest of the content, with ".N" for a further copy.
+bool isNamedBy(std::string_view message, std::string_view name) {
+  return mailsync::messageDigest(message) == name.substr(0, name.find('.'));
+}
+
 char lowered(char c) {
   return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c;
 }
@@ -89,6 +95,10 @@ const MailReader::Listing& MailReader::listingOf(const std::string& maildir) {
 
 std::optional<MailLocation> MailReader::locate(const std::string& identifier) {
   auto location = parseIdentifier(identifier);
+  if (location && location->message) {
+    if (_offsetOf) location->offset = _offsetOf(identifier);
+    return location->offset ? location : std::nullopt;
+  }
   if (!location || location->offset || !isMaildirFile(location->path)) return location;
   const Listing& listing = listingOf(maildirOf(location->path));
   const auto found = listing.find(nameOf(location->path));
@@ -109,7 +119,13 @@ std::optional<std::string> MailReader::read(const std::string& identifier, size_
   if (location->offset && !source->advance(*location->offset, error)) return std::nullopt;
   LineReader lines(std::move(source));
   std::optional<std::string> message;
-  if (location->offset) {
+  if (location->message) {
+    message = readMboxMessage(lines, kMaximumMessageBytes, error);
+    if (message && !isNamedBy(*message, *location->message)) {
+      platform::setError(error, moved("the mailbox has changed since the last sync"));
+      return std::nullopt;
+    }
+  } else if (location->offset) {
     message = readMboxMessage(lines, most, error);
   } else {
     message.emplace();

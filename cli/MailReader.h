@@ -1,10 +1,12 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "cli/Identifier.h"
 #include "platform/TLError.h"
@@ -16,12 +18,19 @@ namespace cli {
 // thread.
 class MailReader {
  public:
+  // Where a message of an mbox file that is named by its content was seen last; none for one that
+  // nobody knows.
+  using OffsetOf = std::function<std::optional<uint64_t>(const std::string& identifier)>;
+
+  explicit MailReader(OffsetOf offsetOf = nullptr) : _offsetOf(std::move(offsetOf)) {}
+
   // The place of the message as it is now, with the flags of a Maildir in its name; none for an
-  // identifier of another client, and for a Maildir file that is gone.
+  // identifier of another client, for a Maildir file that is gone, and for a message whose offset
+  // is not known.
   [[nodiscard]] std::optional<MailLocation> locate(const std::string& identifier);
 
   // The first bytes of the message, at most `most`, without the From line of an mbox file and its
-  // quoting.
+  // quoting. An error where something else lies there by now.
   [[nodiscard]] std::optional<std::string> read(const std::string& identifier, size_t most,
                                                 TLErrorOut error);
 
@@ -31,6 +40,7 @@ class MailReader {
 
   const Listing& listingOf(const std::string& maildir);
 
+  const OffsetOf _offsetOf;
   static constexpr size_t kMaxListings = 64;
   std::map<std::string, Listing> _listings;
 };

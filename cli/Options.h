@@ -60,7 +60,7 @@ struct Options {
   bool yes = false;
   bool verbose = false;
 
-  // Of sync and watch.
+  // Of sync.
   bool dryRun = false;
   bool pruneMissing = false;
   bool retryFailed = false;

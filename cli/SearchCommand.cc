@@ -2,14 +2,17 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <memory>
 #include <nlohmann/json.hpp>
 #include <span>
+#include <utility>
 
 #include "cli/Commands.h"
 #include "cli/Explanation.h"
 #include "cli/QueryInput.h"
 #include "cli/Results.h"
 #include "cli/SearchRun.h"
+#include "cli/SyncCommand.h"
 #include "client/SearchServiceProxy.h"
 #include "platform/Clock.h"
 
@@ -26,6 +29,24 @@ std::optional<QueryInput> readQuery(const Options& options) {
     for (const std::string& remark : input->remarks) complain(remark);
   }
   return input;
+}
+
+// By the catalogue of `tallow sync`, which is opened when the first such message is met.
+MailReader::OffsetOf offsetsOfSync(const Options& options) {
+  struct Opened {
+    bool tried = false;
+    std::unique_ptr<mailsync::Catalogue> catalogue;
+  };
+  return [opened = std::make_shared<Opened>(), settings = syncSettings(options)](
+             const std::string& identifier) -> std::optional<uint64_t> {
+    if (!std::exchange(opened->tried, true)) {
+      opened->catalogue = mailsync::openCatalogue(settings, nullptr);
+    }
+    if (opened->catalogue == nullptr) return std::nullopt;
+    const auto place = opened->catalogue->find(identifier);
+    if (!place || !place->offset) return std::nullopt;
+    return static_cast<uint64_t>(*place->offset);
+  };
 }
 
 // What has been found, with what is known of it.
@@ -97,7 +118,7 @@ ExitStatus runSearch(const Options& options) {
   const auto input = readQuery(options);
   if (!input) return ExitStatus::failure;
   std::optional<TLError> error;
-  MailFacts facts;
+  MailFacts facts(offsetsOfSync(options));
   const auto outcome = search(options, *input, facts, &error);
   if (!outcome) return complain(error);
   if (outcome->items.empty()) {
@@ -124,7 +145,7 @@ ExitStatus runExplain(const Options& options) {
   if (!input) return ExitStatus::failure;
   const std::vector<TALTerm> terms = termsOf(input->plan);
   std::optional<TLError> error;
-  MailFacts facts;
+  MailFacts facts(offsetsOfSync(options));
   const auto outcome = search(options, *input, facts, &error);
   if (outcome && outcome->items.empty() && !options.query.empty() && terms.empty()) {
     complain(std::string("nothing in the expression can be looked up; see tallow-query(7)"));

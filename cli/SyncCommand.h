@@ -8,7 +8,7 @@
 
 namespace cli {
 
-// What `sync`, `watch` and `status` have in common, from the command line.
+// What `sync`, `status` and searches have in common, from the command line.
 [[nodiscard]] mailsync::SyncSettings syncSettings(const Options& options);
 
 // Those of ~/Maildir, ~/Mail and ~/.mail that are there.

@@ -1,0 +1,55 @@
+#include <gtest/gtest.h>
+
+#include <fstream>
+
+#include "cli/MailReader.h"
+#include "sync/MessageDigest.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+const std::string kFirst = "Subject: one\n\nfirst\n";
+const std::string kSecond = "Subject: two\n\nsecond\n>From here on\n";
+const std::string kFrom = "From mara@example.com Mon Feb  5 09:30:00 2024\n";
+
+class MailReaderTest : public testing::Test {
+ protected:
+  void write(const std::string& content) const { std::ofstream(_path) << content; }
+
+  [[nodiscard]] std::optional<std::string> read(const std::string& identifier, size_t most = 1000) {
+    _error.reset();
+    cli::MailReader reader([this](const std::string&) { return _offset; });
+    return reader.read(identifier, most, &_error);
+  }
+
+  const testsupport::TemporaryDirectory _directory;
+  const std::string _path = _directory.path() + "/archive.mbox";
+  std::optional<uint64_t> _offset;
+  std::optional<TLError> _error;
+};
+
+// The catalogue may be older than the mailbox: another message can begin where this one did.
+TEST_F(MailReaderTest, AMessageNamedByItsContentIsThatMessageOrNone) {
+  const std::string unquoted = "Subject: two\n\nsecond\nFrom here on\n";
+  const std::string name =
+      cli::mboxIdentifier(_path, std::string_view(mailsync::messageDigest(unquoted)));
+  write(kFrom + kFirst + "\n" + kFrom + kSecond);
+  EXPECT_FALSE(read(name)) << "nobody knows where it is";
+
+  _offset = kFrom.size() + kFirst.size() + 1;
+  EXPECT_EQ(read(name), unquoted);
+  EXPECT_EQ(read(name + ".2"), unquoted);
+  EXPECT_EQ(read(name, 7), "Subject");
+
+  _offset = 0;
+  EXPECT_FALSE(read(name));
+  ASSERT_TRUE(_error);
+  EXPECT_EQ(_error->message, "the mailbox has changed since the last sync");
+
+  _offset = 5;  // inside a message
+  EXPECT_FALSE(read(name));
+  _offset = 100000;
+  EXPECT_FALSE(read(name));
+}
+
+}  // namespace
