@@ -128,10 +128,6 @@ class PrefixScan {
 constexpr size_t kPageWalks = 2;
 constexpr unsigned kFewShards = 2;  // are not worth waking a thread
 
-// A scan that read fewer pages is as fast when it is done again: it has found little, or what it
-// found was in postings.
-constexpr uint64_t kRememberedPages = 64;
-
 // What a scan for places has found.
 struct FoundPlaces {
   PlaceSet hot;
@@ -232,8 +228,8 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
   } else {
     found.pages.deliver(callback);
     counts.results += found.pages.suffixes();
-    const bool worthwhile = counts.pageReads >= kRememberedPages;
-    if (worthwhile && found.complete && view.pageGeneration != 0 &&
+    // What comes from postings alone is there as fast the next time.
+    if (counts.pageReads != 0 && found.complete && view.pageGeneration != 0 &&
         !view.metrics.VacuumInProgress) {
       remember(prefix, view, found.pages);
     }
