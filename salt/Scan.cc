@@ -228,9 +228,7 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
   } else {
     found.pages.deliver(callback);
     counts.results += found.pages.suffixes();
-    // What comes from postings alone is there as fast the next time.
-    if (counts.pageReads != 0 && found.complete && view.pageGeneration != 0 &&
-        !view.metrics.VacuumInProgress) {
+    if (found.complete && view.pageGeneration != 0 && !view.metrics.VacuumInProgress) {
       remember(prefix, view, found.pages);
     }
   }
