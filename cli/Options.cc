@@ -8,6 +8,7 @@
 #include <map>
 
 #include "client/Channel.h"
+#include "modification/WeightedDistance.h"
 
 namespace cli {
 
@@ -143,7 +144,7 @@ std::vector<std::string> withMarkedWords(int argc, const char* const* argv) {
     if (searches && argument.size() > 1 && argument[0] == '-' && argument[1] != '-' && !isShort) {
       argument[0] = kMinusOfWord;
     }
-    searches = searches || argument == "search" || argument == "explain" || argument == "save";
+    searches = searches || argument == "search" || argument == "explain";
   }
   return arguments;
 }
@@ -152,6 +153,52 @@ void restoreWords(std::vector<std::string>& words) {
   for (std::string& word : words) {
     if (word.starts_with(kMinusOfWord)) word[0] = '-';
   }
+}
+
+// The command that was meant by a mistyped one, or null.
+const char* nearestCommand(const std::string& word) {
+  constexpr float kMostMistakes = 2;
+  float least = 0.6F;  // two mistakes, at most
+  const char* nearest = nullptr;
+  for (const CommandRow& row : kCommands) {
+    const float distance = weightedDistance(word, row.name, kMostMistakes, 1);
+    if (distance >= least) continue;
+    least = distance;
+    nearest = row.name;
+  }
+  return nearest;
+}
+
+// A word where the command should be; empty when something else is wrong.
+std::string unknownCommand(const CLI::App& app) {
+  if (!app.get_subcommands().empty()) return "";
+  for (const std::string& word : app.remaining()) {
+    if (!word.starts_with('-')) return word;
+  }
+  return "";
+}
+
+void complainOfCommand(const std::string& word) {
+  std::cerr << "tallow: there is no command \"" << cleanForTerminal(word) << '"';
+  if (const char* const meant = nearestCommand(word))
+    std::cerr << "; did you mean " << meant << '?';
+  std::cerr << "\nRun `tallow help` for the list.\n";
+}
+
+// Of the command `help`: the help of the command with that name, or the list of all.
+ExitStatus showHelp(CLI::App& app, const std::string& command) {
+  if (command.empty()) {
+    std::cout << app.help();
+    return ExitStatus::done;
+  }
+  const auto isMeant = [&command](const CLI::App* sub) { return sub->get_name() == command; };
+  const std::vector<CLI::App*> found = app.get_subcommands(isMeant);
+  if (found.empty()) {
+    complainOfCommand(command);
+    return ExitStatus::failure;
+  }
+  std::cout << found.front()->help("tallow");
+  return ExitStatus::done;
 }
 
 // What is wrong with options that do not go together, or null.
@@ -184,13 +231,26 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
   app.failure_message(CLI::FailureMessage::simple);
   addGlobalOptions(app, options);
   for (const CommandRow& row : kCommands) addCommand(app, row, options);
+  std::string helpOn;
+  CLI::App* const help = app.add_subcommand("help", "Show how a command is used");
+  help->add_option("COMMAND", helpOn)->type_name(" ");
   try {
     std::vector<std::string> arguments = withMarkedWords(argc, argv);
     std::reverse(arguments.begin(), arguments.end());
     app.parse(std::move(arguments));
     restoreWords(options.arguments);
   } catch (const CLI::ParseError& error) {
+    const std::string word = unknownCommand(app);
+    if (error.get_exit_code() != 0 && !word.empty()) {
+      complainOfCommand(word);
+      status = ExitStatus::failure;
+      return std::nullopt;
+    }
     status = app.exit(error) == 0 ? ExitStatus::done : ExitStatus::failure;
+    return std::nullopt;
+  }
+  if (help->parsed()) {
+    status = showHelp(app, helpOn);
     return std::nullopt;
   }
   if (const char* const misused = misuse(options)) {

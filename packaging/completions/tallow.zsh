@@ -17,6 +17,7 @@ commands=(
   'state:show the state of a client'
   'dump:print the text index, while no daemon runs'
   'validate:check the text index, while no daemon runs'
+  'help:show how a command is used'
 )
 options=(
   '--runtime-dir=[directory of the sockets]:directory:_files -/'

@@ -397,8 +397,16 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
     EXPECT_FALSE(errors.empty());
     EXPECT_TRUE(output.empty());
   }
+  EXPECT_EQ(run({"serach", "x"}), ExitStatus::failure);
+  EXPECT_THAT(errors, HasSubstr("did you mean search?"));
+  EXPECT_EQ(run({"frobnicate"}), ExitStatus::failure);
+  EXPECT_THAT(errors, Not(HasSubstr("did you mean")));
   EXPECT_EQ(run({"--help"}), ExitStatus::done);
   EXPECT_EQ(run({"--version"}), ExitStatus::done);
+  EXPECT_EQ(run({"search", "--help"}), ExitStatus::done);
+  const std::string help = output;
+  EXPECT_EQ(run({"help", "search"}), ExitStatus::done);
+  EXPECT_EQ(output, help);
   EXPECT_TRUE(daemon.calls().empty());
   daemon.stop();
   for (const char* command : {"ping", "stats", "metrics", "vacuum", "state"}) {
