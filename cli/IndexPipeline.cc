@@ -31,7 +31,7 @@ class IndexPipeline::Reading {
                            }});
   }
 
-  bool flush() { return _pipeline.push(std::exchange(_batch, MailBatch())); }
+  bool flush() { return _pipeline._queue.push(std::exchange(_batch, MailBatch())); }
 
  private:
   bool add(std::string_view bytes, const MessageOrigin& origin) {
@@ -69,11 +69,7 @@ IndexPipeline::IndexPipeline(std::vector<std::string> paths)
     : _paths(std::move(paths)), _thread([this] { run(); }) {}
 
 IndexPipeline::~IndexPipeline() {
-  {
-    const platform::MutexLock lock(_mutex);
-    _cancelled = true;
-  }
-  _changed.notify_all();
+  _queue.cancel();
   _thread.join();
 }
 
@@ -83,35 +79,7 @@ void IndexPipeline::run() {
   bool goOn = true;
   for (const std::string& path : _paths) goOn = goOn && reading.walk(path);
   if (goOn) reading.flush();
-  {
-    const platform::MutexLock lock(_mutex);
-    _ended = true;
-  }
-  _changed.notify_all();
-}
-
-bool IndexPipeline::push(MailBatch batch) {
-  {
-    const platform::MutexLock lock(_mutex);
-    while (_batches.size() >= kQueuedBatches && !_cancelled) _changed.wait(_mutex);
-    if (_cancelled) return false;
-    _batches.push_back(std::move(batch));
-  }
-  _changed.notify_all();
-  return true;
-}
-
-std::optional<MailBatch> IndexPipeline::next() {
-  std::optional<MailBatch> batch;
-  {
-    const platform::MutexLock lock(_mutex);
-    while (_batches.empty() && !_ended) _changed.wait(_mutex);
-    if (_batches.empty()) return std::nullopt;
-    batch = std::move(_batches.front());
-    _batches.pop_front();
-  }
-  _changed.notify_all();
-  return batch;
+  _queue.end();
 }
 
 }  // namespace cli

@@ -1,16 +1,14 @@
 #pragma once
 
-#include <condition_variable>
 #include <cstdint>
-#include <deque>
 #include <optional>
 #include <string>
 #include <thread>
 #include <vector>
 
+#include "cli/BatchQueue.h"
 #include "cli/MailFile.h"
 #include "client/Batches.h"
-#include "platform/Mutex.h"
 
 namespace cli {
 
@@ -36,13 +34,10 @@ inline constexpr size_t kBatchBytes = size_t{4} << 20;
 inline constexpr size_t kBatchItems = 500;
 inline constexpr size_t kBatchReports = 1000;
 
-// How many batches wait at most for whoever sends them, so that reading never runs far ahead.
-inline constexpr size_t kQueuedBatches = 2;
-
 // Reads mail and makes it items on a thread of its own, so that reading and sending overlap.
 //
 // Threads: `next` and the destructor belong to the thread that made the pipeline. The reading
-// thread shares with it only the queue, under `_mutex`, and is joined by the destructor, which
+// thread shares with it only the queue, and is joined by the destructor, which
 // makes it stop at the next message.
 class IndexPipeline {
  public:
@@ -52,21 +47,15 @@ class IndexPipeline {
   IndexPipeline& operator=(const IndexPipeline&) = delete;
 
   // Waits for the next batch; none at the end.
-  [[nodiscard]] std::optional<MailBatch> next();
+  [[nodiscard]] std::optional<MailBatch> next() { return _queue.next(); }
 
  private:
   class Reading;
 
   void run();
-  // False once nobody wants more.
-  bool push(MailBatch batch);
 
   const std::vector<std::string> _paths;
-  platform::Mutex _mutex;
-  std::condition_variable_any _changed;
-  std::deque<MailBatch> _batches TL_GUARDED_BY(_mutex);
-  bool _ended TL_GUARDED_BY(_mutex) = false;
-  bool _cancelled TL_GUARDED_BY(_mutex) = false;
+  BatchQueue<MailBatch> _queue;  // synchronised by itself
   std::thread _thread;
 };
 

@@ -247,33 +247,31 @@ bool Catalogue::hasContent(int64_t directory) {
 
 // --- Files
 
+#define FILE_ROWS "SELECT id, directory, name, inode, size, modified, kind FROM file "
+
 std::vector<FileRow> Catalogue::filesOf(int64_t directory) {
-  Statement& statement =
-      sql("SELECT id, directory, name, inode, size, modified, kind FROM file WHERE directory = ?");
-  statement.bind(directory);
-  return all(statement, fileOf);
+  return files(FILE_ROWS "WHERE directory = ?", directory);
 }
 
 std::vector<FileRow> Catalogue::filesWithInode(int64_t inode) {
-  Statement& statement =
-      sql("SELECT id, directory, name, inode, size, modified, kind FROM file WHERE inode = ?");
-  statement.bind(inode);
-  return all(statement, fileOf);
+  return files(FILE_ROWS "WHERE inode = ?", inode);
 }
 
 std::vector<FileRow> Catalogue::aliasesIn(int64_t directory) {
-  Statement& statement =
-      sql("SELECT id, directory, name, inode, size, modified, kind FROM file "
-          "WHERE kind = 4 AND directory = ?");
-  statement.bind(directory);
-  return all(statement, fileOf);
+  return files(FILE_ROWS "WHERE kind = 4 AND directory = ?", directory);
 }
 
 std::optional<FileRow> Catalogue::file(int64_t id) {
-  Statement& statement =
-      sql("SELECT id, directory, name, inode, size, modified, kind FROM file WHERE id = ?");
-  statement.bind(id);
-  return first(statement, fileOf);
+  const std::vector<FileRow> found = files(FILE_ROWS "WHERE id = ?", id);
+  return found.empty() ? std::nullopt : std::optional(found.front());
+}
+
+#undef FILE_ROWS
+
+std::vector<FileRow> Catalogue::files(const char* text, int64_t value) {
+  Statement& statement = sql(text);
+  statement.bind(value);
+  return all(statement, fileOf);
 }
 
 int64_t Catalogue::addFile(const FileRow& row) {

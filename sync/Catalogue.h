@@ -47,6 +47,11 @@ struct FileRow {
   FileKind kind = FileKind::other;
 };
 
+// Whether a file looks as it did: its content is taken for the same then.
+[[nodiscard]] inline bool sameState(const FileRow& a, const FileRow& b) {
+  return a.inode == b.inode && a.size == b.size && a.modified == b.modified;
+}
+
 struct MessageRow {
   int64_t id = 0;
   int64_t file = 0;
@@ -175,6 +180,9 @@ class Catalogue {
   explicit Catalogue(std::unique_ptr<Database> database) : _database(std::move(database)) {}
   bool prepare();
   void noteDeletion(int64_t message);
+
+  // The rows of a literal with one parameter.
+  std::vector<FileRow> files(const char* text, int64_t value);
 
   // The prepared statement of a literal.
   Statement& sql(const char* text);

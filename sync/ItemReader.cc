@@ -65,7 +65,7 @@ class ItemReader::Reading {
     return goOn;
   }
 
-  bool flush() { return _reader.push(std::exchange(_batch, ReadBatch())); }
+  bool flush() { return _reader._queue.push(std::exchange(_batch, ReadBatch())); }
 
  private:
   static bool isReadable(const std::string& path) { return access(path.c_str(), R_OK) == 0; }
@@ -112,11 +112,7 @@ ItemReader::ItemReader(std::vector<WaitingMessage> messages)
     : _messages(std::move(messages)), _thread([this] { run(); }) {}
 
 ItemReader::~ItemReader() {
-  {
-    const platform::MutexLock lock(_mutex);
-    _cancelled = true;
-  }
-  _changed.notify_all();
+  _queue.cancel();
   _thread.join();
 }
 
@@ -132,35 +128,7 @@ void ItemReader::run() {
     begin = end;
   }
   if (goOn) reading.flush();
-  {
-    const platform::MutexLock lock(_mutex);
-    _ended = true;
-  }
-  _changed.notify_all();
-}
-
-bool ItemReader::push(ReadBatch batch) {
-  {
-    const platform::MutexLock lock(_mutex);
-    while (_batches.size() >= cli::kQueuedBatches && !_cancelled) _changed.wait(_mutex);
-    if (_cancelled) return false;
-    _batches.push_back(std::move(batch));
-  }
-  _changed.notify_all();
-  return true;
-}
-
-std::optional<ReadBatch> ItemReader::next() {
-  std::optional<ReadBatch> batch;
-  {
-    const platform::MutexLock lock(_mutex);
-    while (_batches.empty() && !_ended) _changed.wait(_mutex);
-    if (_batches.empty()) return std::nullopt;
-    batch = std::move(_batches.front());
-    _batches.pop_front();
-  }
-  _changed.notify_all();
-  return batch;
+  _queue.end();
 }
 
 }  // namespace mailsync

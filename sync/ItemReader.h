@@ -1,15 +1,13 @@
 #pragma once
 
-#include <condition_variable>
 #include <cstdint>
-#include <deque>
 #include <optional>
 #include <string>
 #include <thread>
 #include <vector>
 
+#include "cli/BatchQueue.h"
 #include "client/Batches.h"
-#include "platform/Mutex.h"
 #include "sync/Catalogue.h"
 
 namespace mailsync {
@@ -38,7 +36,7 @@ struct ReadBatch {
 // reading and sending overlap. What has gone or changed meanwhile is left out and stays waiting.
 //
 // Threads: `next` and the destructor belong to the thread that made the reader. The reading thread
-// shares with it only the queue, under `_mutex`, and is joined by the destructor, which makes it
+// shares with it only the queue, and is joined by the destructor, which makes it
 // stop at the next message.
 class ItemReader {
  public:
@@ -49,21 +47,15 @@ class ItemReader {
   ItemReader& operator=(const ItemReader&) = delete;
 
   // Waits for the next batch; none at the end.
-  [[nodiscard]] std::optional<ReadBatch> next();
+  [[nodiscard]] std::optional<ReadBatch> next() { return _queue.next(); }
 
  private:
   class Reading;
 
   void run();
-  // False once nobody wants more.
-  bool push(ReadBatch batch);
 
   const std::vector<WaitingMessage> _messages;
-  platform::Mutex _mutex;
-  std::condition_variable_any _changed;
-  std::deque<ReadBatch> _batches TL_GUARDED_BY(_mutex);
-  bool _ended TL_GUARDED_BY(_mutex) = false;
-  bool _cancelled TL_GUARDED_BY(_mutex) = false;
+  cli::BatchQueue<ReadBatch> _queue;  // synchronised by itself
   std::thread _thread;
 };
 

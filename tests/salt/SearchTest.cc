@@ -191,6 +191,17 @@ TEST_F(SearchSmall, ALaterTermThatNothingCanMatchPrunesAllButAtThresholdZero) {
   EXPECT_THAT(search(*index, terms), ElementsAre("3:0", "2:0", "1:0"));
 }
 
+// More than are scanned for ahead of the others.
+TEST_F(SearchSmall, EachOfManyRequiredTermsIsRequired) {
+  std::vector<Term> terms(20, term({"apple"}, {1}));
+  terms.insert(terms.begin(), term({"pear"}, {2}, 0.5));
+  EXPECT_THAT(search(*index, terms, {10, 100, 0.1}), ElementsAre("2:2", "1:2", "3:0.5"));
+  terms.back() = term({"pear"}, {1});
+  EXPECT_THAT(search(*index, terms, {10, 100, 0.1}), ElementsAre("2:2", "1:2"));
+  terms.back() = term({"plum"}, {1});
+  EXPECT_THAT(search(*index, terms, {10, 100, 0.1}), ElementsAre());
+}
+
 TEST_F(SearchSmall, ZonesSelectAndWeigh) {
   const Term apple = term({"apple"}, {1});
   EXPECT_THAT(search(*index, {inZones(apple, {1}, {0.5})}), ElementsAre("2:0.5", "1:0.5"));
