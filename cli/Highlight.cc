@@ -72,7 +72,7 @@ std::vector<icu::UnicodeString> foldedWords(const std::vector<std::string>& word
 }
 
 // The first of the words that a run begins with; the number of words where there is none. Scripts
-// without blanks between words match anywhere in a run.
+// without spaces between words match anywhere in a run.
 size_t matchOf(TLStringView run, const std::vector<icu::UnicodeString>& words) {
   const icu::UnicodeString bare = fold(run);
   const auto found = std::find_if(words.begin(), words.end(), [&](const auto& wanted) {
@@ -110,7 +110,7 @@ bool isSpace(char16_t c) {
   return u_isUWhiteSpace(c) != 0;
 }
 
-// With one blank in place of white space.
+// With runs of white space replaced by one space.
 std::string oneLine(TLStringView text) {
   TLString line;
   for (const char16_t c : text) {

@@ -29,7 +29,7 @@ namespace cli {
 // change: that of "cur".
 [[nodiscard]] std::string maildirIdentifier(std::string_view path);
 
-// The letters behind ":2," in the name of a Maildir file.
+// The letters after ":2," in the name of a Maildir file.
 [[nodiscard]] std::string_view maildirFlags(std::string_view path);
 
 // True for a message file of a Maildir: one in a directory "cur" or "new".

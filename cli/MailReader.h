@@ -45,7 +45,7 @@ class MailReader {
   std::map<std::string, Listing> _listings;
 };
 
-// The value of a header field of a message, unfolded and without blanks around it; empty where it
+// The value of a header field of a message, unfolded and trimmed; empty where it
 // has none. The name is in small letters.
 [[nodiscard]] std::string headerValue(std::string_view message, std::string_view name);
 

@@ -131,8 +131,8 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 
-// A word with a minus is no option: behind `search` and the like, the minus of what is none of the
-// short options becomes a character that no command line holds, until all is read.
+// After `search` and the like, a word that begins with a minus is not an option unless it is one of
+// the short options. Its minus is replaced by a control character while the options are parsed.
 constexpr char kMinusOfWord = '\x01';
 
 std::vector<std::string> withMarkedWords(int argc, const char* const* argv) {

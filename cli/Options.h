@@ -55,7 +55,7 @@ struct Options {
   int64_t offset = 0;  // results that are passed over
   SortOrder sort = SortOrder::relevance;
   bool count = false;      // only the number of results
-  bool print0 = false;     // NUL behind each entry of a list
+  bool print0 = false;     // end each entry of a list with NUL
   double waitSeconds = 0;  // for the daemon to come up
   bool yes = false;
   bool verbose = false;

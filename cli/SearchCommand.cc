@@ -70,7 +70,7 @@ void remarkOn(const SearchResults& found, size_t wanted, const MailFacts& facts)
 std::optional<Outcome> search(const Options& options, const QueryInput& input, MailFacts& facts,
                               TLErrorOut error) {
   constexpr size_t kCounted = 1000;
-  // Copies of the last message shown rank right behind it.
+  // Copies of the last message shown rank directly after it.
   constexpr size_t kCopies = 30;
   client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
   const size_t limit = static_cast<size_t>(options.limit);

@@ -56,7 +56,7 @@ NodePointer leaf(const std::vector<Key>& keys, TLString text) {
 }
 
 // The daemon looks in one zone of a mail or another for one text or another. It cuts the text of a
-// condition into words and drops the blank that makes the last word a whole one, except where the
+// condition into words and drops the space that makes the last word a whole one, except where the
 // attribute holds names as they stand. So a whole word is the text of such an attribute, one that
 // no mail has, and the attributes that are meant come with a text that is only there where the
 // first is.

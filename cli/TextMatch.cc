@@ -18,7 +18,7 @@ using usersyntax::Kind;
 using usersyntax::Node;
 using Key = TLAttributeKey;
 
-// What the index keeps of a text from a word on: up to the first blank from here on, and never more
+// What the index keeps of a text from a word on: up to the first space from here on, and never more
 // than the second.
 constexpr size_t kKeptBytes = 32;
 constexpr size_t kMostKeptBytes = 100;
@@ -143,8 +143,8 @@ bool mayGoOn(const Node& node) {
 
 bool isCutInIndex(const Node& node) {
   const std::string text = indexedWords(node);
-  const size_t blank = text.find(' ', std::min(kKeptBytes, text.size()));
-  return text.size() > kMostKeptBytes || (blank != std::string::npos && blank + 1 < text.size());
+  const size_t space = text.find(' ', std::min(kKeptBytes, text.size()));
+  return text.size() > kMostKeptBytes || (space != std::string::npos && space + 1 < text.size());
 }
 
 std::vector<Node> wordlessNodes(const Node& tree) {

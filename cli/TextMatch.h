@@ -13,7 +13,7 @@ namespace cli {
 // The attributes that a field is looked for in; empty for fields that the index does not hold.
 [[nodiscard]] const std::vector<TLAttributeKey>& zonesOf(usersyntax::Field field);
 
-// The words of a text node, with a blank behind each, and how many there are.
+// The words of a text node, each followed by a space, and how many there are.
 [[nodiscard]] std::string indexedWords(const usersyntax::Node& node);
 [[nodiscard]] size_t wordCount(const usersyntax::Node& node);
 

@@ -85,7 +85,7 @@ class SharedSearch {
     }
   }
 
-  // Who is not in behind the required term never will be.
+  // A document that is no candidate after the required term never becomes one.
   void applyToken() {
     for (auto& [docs, masks] : _byToken) {
       _evaluation.apply(

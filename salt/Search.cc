@@ -87,7 +87,7 @@ class Searching {
            std::none_of(_docs.begin(), _docs.end(), [](const Standing& doc) { return doc.in; });
   }
 
-  // Has the documents on their way that are not yet.
+  // Adds the documents of the matches that were not added before.
   void admit(const TermMatches& matches) {
     matches.forEach([this](uint32_t docID, uint32_t) {
       if (!std::exchange(_admitted[docID], true)) _docs.push_back({docID});

@@ -39,7 +39,7 @@ class ZoneBits {
 // The summed weights, at most 1.0, of the term's zones in the mask.
 [[nodiscard]] double zoneFactor(const Term& term, uint32_t zoneMask);
 
-// A document on its way through the terms of a search.
+// The state of one document during a search.
 struct Standing {
   uint32_t docID = 0;
   bool in = false;   // among the candidates
@@ -47,8 +47,9 @@ struct Standing {
 };
 
 // How a search takes a document through its terms, one after the other: a document becomes a
-// candidate with the first term that matches it, and is one no more when no later term can bring it
-// up to the threshold. No document's way depends on another's. The terms and options outlive it.
+// candidate with the first term that matches it, and is dropped when no later term can raise it to
+// the threshold. The result for one document does not depend on any other. The terms and options
+// outlive it.
 class Evaluation {
  public:
   Evaluation(const std::vector<Term>& terms, const Options& options);
@@ -56,7 +57,7 @@ class Evaluation {
   // A malformed term, which is passed over.
   [[nodiscard]] bool skips(size_t u) const { return _steps[u].skipped; }
 
-  // Whether no document that is no candidate yet becomes one with term u.
+  // Whether term u makes no document a candidate that is not one already.
   [[nodiscard]] bool admitsNobody(size_t u) const { return _steps[u].admitsNobody; }
 
   // Whether a document that term u does not match cannot be in the result: the term is required.

@@ -27,7 +27,7 @@ struct DateRange {
 // first to the end of the second. None also where the second ends before the first begins.
 [[nodiscard]] std::optional<DateRange> rangeNamed(std::string_view text, double now);
 
-// A number with K, M or G behind it, which are powers of 1024; "B" may follow. None for another
+// A number followed by K, M or G, which are powers of 1024; "B" may follow. None for another
 // text, and for more than 2^63.
 [[nodiscard]] std::optional<uint64_t> sizeNamed(std::string_view text);
 

@@ -60,7 +60,7 @@ class Lexer {
     _tokens.push_back(std::move(token));
   }
 
-  // A known name with a colon and something behind it.
+  // A known name, a colon and a value.
   void readField(Token& token) {
     const size_t length = _text.substr(_at, kMaxNameBytes + 1).find(':');
     if (length == std::string_view::npos || !isName(_text.substr(_at, length))) return;

@@ -32,7 +32,7 @@ options=(
   '--offset=[results to pass over]:number:'
   '--sort=[order]:order:(relevance date)'
   '--count[only how many results]'
-  '--print0[NUL behind each entry]'
+  '--print0[end each entry with NUL]'
   '*--filter=[only what it holds for]:expression:'
   '--param=[parameters of this search]:KEY=VALUE,...:'
   '(-y --yes)'{-y,--yes}'[do not ask]'

@@ -223,7 +223,7 @@ TEST_F(MailSyncTest, WhatIsNotThereDeletesNothing) {
   ASSERT_TRUE(sync());
   EXPECT_THAT(complaints, ElementsAre());
   EXPECT_EQ(daemon.received(), 2U);
-  // Under another name nothing stays behind.
+  // Under another name nothing is left over.
   fs::rename(mail + "/b", mail + "/c");
   ASSERT_TRUE(sync());
   EXPECT_THAT(complaints, ElementsAre());
