@@ -169,7 +169,7 @@ void MailboxScan::removeFile(const FileRow& row) {
     const std::string path = pathOf(heir);
     if (!_catalogue.file(heir.id)) continue;  // named twice
     _catalogue.removeFile(heir.id);
-    if (!stat(path.c_str(), &info) == 0) continue;
+    if (stat(path.c_str(), &info) != 0) continue;
     FileRow arrived = rowOf(info);
     arrived.directory = heir.directory;
     arrived.name = heir.name;
