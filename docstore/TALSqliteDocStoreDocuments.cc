@@ -43,6 +43,8 @@ void TALSqliteDocStore::_serializeDoc(const TLIndexableItem& document, Use& stat
 std::shared_ptr<TLIndexableItem> TALSqliteDocStore::_deserializeDocWithStatement(
     const Use& statement) {
   auto item = std::make_shared<TLIndexableItem>();
+  if (item->initWithWrittenData(statement.columnBlob(0))) return item;
+  item = std::make_shared<TLIndexableItem>();
   if (!item->initWithData(statement.columnBlob(0))) log().error("A stored document is damaged");
   return item;
 }

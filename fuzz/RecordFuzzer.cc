@@ -47,6 +47,21 @@ void check(std::string_view bytes) {
   TL_ASSERT(record.data() == data);
 }
 
+// Attributes in wire form are as good as those that were decoded.
+void checkWritten(std::string_view bytes) {
+  TLIndexableItem kept;
+  if (!kept.initWithWrittenData(bytes)) return;
+  TLIndexableItem item;
+  TL_ASSERT(item.initWithData(bytes));
+  const auto key = TLAttributeKey::MAIL_DATE_RECEIVED;
+  const double date = kept.doubleValueForKey(key);
+  TL_ASSERT(date == item.doubleValueForKey(key) || date != date);
+  const std::string forwarded = kept.data();
+  TL_ASSERT(kept.attributesCount() == item.attributesCount() && kept.data() == item.data());
+  TLIndexableItem again;
+  TL_ASSERT(again.initWithData(forwarded) && again.data() == item.data());
+}
+
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
@@ -64,6 +79,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
       break;
     case 3:
       check<TLIndexableItem>(bytes);
+      checkWritten(bytes);
       break;
     case 4:
       check<TLQueryNode>(bytes);

@@ -17,6 +17,7 @@
 #include "platform/Assert.h"
 #include "records/TLAttributeKey.h"
 #include "records/TLCodable.h"
+#include "records/TLRecordList.h"
 
 // What the records do field by field, for the source files of the records only. A record's table
 // lists its fields as TLField objects; TLFieldKind says, per C++ type of a field, how a value of
@@ -99,6 +100,9 @@ template <typename Value>
 struct TLFieldKind {
   static_assert(std::is_arithmetic_v<Value> || std::is_enum_v<Value>);
   static constexpr bool isScalar = true;
+  static constexpr TLWireType wireType = std::is_same_v<Value, float>    ? TLWireType::fixed32
+                                         : std::is_same_v<Value, double> ? TLWireType::fixed64
+                                                                         : TLWireType::varint;
 
   static Value read(TLReader& reader) {
     if constexpr (std::is_same_v<Value, float>) {
@@ -145,6 +149,7 @@ template <>
 struct TLFieldKind<std::optional<TLString>> {
   using Value = std::optional<TLString>;
   static constexpr bool isScalar = false;
+  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return value.has_value(); }
   static bool read(Value& value, TLReader& reader, uint64_t) {
@@ -166,6 +171,7 @@ template <>
 struct TLFieldKind<std::optional<std::string>> {
   using Value = std::optional<std::string>;
   static constexpr bool isScalar = false;
+  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return value.has_value(); }
   static bool read(Value& value, TLReader& reader, uint64_t) {
@@ -189,6 +195,7 @@ template <typename Record>
 struct TLFieldKind<std::shared_ptr<Record>> {
   using Value = std::shared_ptr<Record>;
   static constexpr bool isScalar = false;
+  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return value != nullptr; }
   static bool read(Value& value, TLReader& reader, uint64_t) {
@@ -230,6 +237,8 @@ template <typename Element, typename Elements>
 struct TLListKind {
   using Value = std::vector<Element>;
   static constexpr bool isScalar = false;
+  static constexpr TLWireType wireType =
+      std::is_same_v<Element, int32_t> ? TLWireType::varint : TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return !value.empty(); }
   static bool equal(const Value& a, const Value& b) {
@@ -330,6 +339,32 @@ struct TLFieldKind<std::vector<std::shared_ptr<Record>>>
   static nlohmann::json describeElement(const Element& element) { return One::describe(element); }
 };
 
+// The same, perhaps in wire form.
+template <typename Record>
+struct TLFieldKind<TLRecordList<Record>> {
+  using Value = TLRecordList<Record>;
+  using Kind = TLFieldKind<typename Value::Records>;
+  static constexpr bool isScalar = false;
+  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
+
+  static bool present(const Value& value) { return !value.empty(); }
+  static bool read(Value& value, TLReader& reader, uint64_t wireType);
+  static void write(uint32_t number, const Value& value, TLWriter& writer) {
+    if (!value.isWire()) return Kind::write(number, value.records(), writer);
+    value.forEachWire([&](std::string_view, std::string_view delimited) {
+      writer.writeDelimitedField(number, delimited);
+      return true;
+    });
+  }
+  static bool equal(const Value& a, const Value& b) {
+    return Kind::equal(a.records(), b.records());
+  }
+  static uint64_t hash(const Value& value) { return Kind::hash(value.records()); }
+  static Value deepCopy(const Value& value) { return Kind::deepCopy(value.records()); }
+  static void merge(const Value& from, Value& to) { Kind::merge(from.records(), to.records()); }
+  static nlohmann::json describe(const Value& value) { return Kind::describe(value.records()); }
+};
+
 namespace recordfields {
 
 template <typename Field>
@@ -364,6 +399,36 @@ bool readField(Record& record, const Field& field, TLReader& reader, uint64_t wi
   }
 }
 
+// The class of a sub-record or of those of a list; void for any other value.
+template <typename Value>
+struct SubRecord {
+  using type = void;
+};
+template <typename Record>
+struct SubRecord<std::shared_ptr<Record>> {
+  using type = Record;
+};
+template <typename Record>
+struct SubRecord<std::vector<std::shared_ptr<Record>>> {
+  using type = Record;
+};
+template <typename Record>
+struct SubRecord<TLRecordList<Record>> {
+  using type = Record;
+};
+
+// Steps over a field's value; false when it has not the form that is written.
+template <typename Record, typename Value>
+bool isValueAsWritten(const TLField<Record, Value>&, TLReader& reader, uint64_t wireType) {
+  using Sub = typename SubRecord<Value>::type;
+  if (wireType != static_cast<uint64_t>(TLFieldKind<Value>::wireType)) return false;
+  if constexpr (std::is_void_v<Sub>) {
+    return reader.takeElement() && reader.skipValue(wireType);
+  } else {
+    return reader.withRecord([&] { return Sub::isAsWritten(reader); });
+  }
+}
+
 // Calls `body` with every field, in ascending number.
 template <typename Record, typename Body>
 void forEachField(Body&& body) {
@@ -378,6 +443,16 @@ void setField(Record& record, const Field& field, Value&& value) {
 }
 
 }  // namespace recordfields
+
+template <typename Record>
+bool TLFieldKind<TLRecordList<Record>>::read(Value& value, TLReader& reader, uint64_t wireType) {
+  if (!reader.keepsWire()) return Kind::read(value.records(), reader, wireType);
+  if (wireType != static_cast<uint64_t>(TLWireType::lengthDelimited)) return false;
+  const char* const begin = reader.position();
+  if (!reader.withRecord([&] { return Record::isAsWritten(reader); })) return false;
+  value.addWire({begin, reader.position()});
+  return true;
+}
 
 template <typename Record>
 bool TLRecord<Record>::readFrom(TLReader& reader) {
@@ -398,6 +473,23 @@ bool TLRecord<Record>::readFrom(TLReader& reader) {
     if (!ok) return false;
   }
   return !reader.hasError();
+}
+
+template <typename Record>
+bool TLRecord<Record>::isAsWritten(TLReader& reader) {
+  bool ok = true;
+  while (ok && reader.hasMore()) {
+    const uint64_t tag = reader.readVarint();
+    const bool known = std::apply(
+        [&](const auto&... field) {
+          return ((tag >> 3 == field.number &&
+                   (ok = recordfields::isValueAsWritten(field, reader, tag & 7), true)) ||
+                  ...);
+        },
+        TLRecordTable<Record>::fields);
+    ok = ok && known;
+  }
+  return ok && !reader.hasError();
 }
 
 template <typename Record>

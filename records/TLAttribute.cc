@@ -6,12 +6,13 @@ template <>
 struct TLRecordTable<TLAttribute> {
   static constexpr const char* name = "TLAttribute";
   static constexpr std::tuple fields{
-      TLField{1, "key", &TLAttribute::_key, TLAttribute::kKeyBit},
+      TLField{TLAttribute::kKeyNumber, "key", &TLAttribute::_key, TLAttribute::kKeyBit},
       TLField{2, "customKey", &TLAttribute::_customKey},
       TLField{3, "stringValue", &TLAttribute::_stringValue},
       TLField{4, "intValue", &TLAttribute::_intValue, TLAttribute::kIntValueBit},
       TLField{5, "floatValue", &TLAttribute::_floatValue, TLAttribute::kFloatValueBit},
-      TLField{6, "doubleValue", &TLAttribute::_doubleValue, TLAttribute::kDoubleValueBit},
+      TLField{TLAttribute::kDoubleValueNumber, "doubleValue", &TLAttribute::_doubleValue,
+              TLAttribute::kDoubleValueBit},
       TLField{7, "boolValue", &TLAttribute::_boolValue, TLAttribute::kBoolValueBit},
       TLField{8, "personValue", &TLAttribute::_personValue},
       TLField{9, "bytesValue", &TLAttribute::_bytesValue},

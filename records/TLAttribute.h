@@ -8,6 +8,10 @@
 // One keyed value of an item. A bag, not a union: every value field that is set is written.
 class TLAttribute final : public TLRecord<TLAttribute> {
  public:
+  // On the wire.
+  static constexpr uint32_t kKeyNumber = 1;
+  static constexpr uint32_t kDoubleValueNumber = 6;
+
   TL_RECORD_ENUM(TLAttributeKey, key, Key, 8, TLAttributeKey::UNKNOWN)
   // The attribute's name when the key is CUSTOM.
   TL_RECORD_STRING(customKey, CustomKey)

@@ -54,6 +54,9 @@ template <typename Record>
 class TLRecord : public TLCodable {
  public:
   [[nodiscard]] bool readFrom(TLReader& reader) override;
+  // Steps over a record up to the reader's limit. True when it is nothing but fields of this class
+  // in the form that writeTo gives them, in any order: then readFrom can read it.
+  [[nodiscard]] static bool isAsWritten(TLReader& reader);
   void writeTo(TLWriter& writer) const override;
   [[nodiscard]] bool isEqual(const TLCodable& other) const override;
   [[nodiscard]] size_t hash() const override;

@@ -30,6 +30,21 @@ void append(TLIndexableItem& item, TLAttributeKey key, Setter setter, Value&& va
 
 }  // namespace
 
+bool TLIndexableItem::initWithWrittenData(std::string_view bytes) {
+  TLReader reader(bytes, true);
+  return readFrom(reader);
+}
+
+void TLIndexableItem::setAttributes(std::vector<std::shared_ptr<TLAttribute>> values) {
+  for (const auto& value : values) TL_ASSERT(value != nullptr);
+  _attributes = std::move(values);
+}
+
+void TLIndexableItem::addAttributes(std::shared_ptr<TLAttribute> value) {
+  TL_ASSERT(value != nullptr);
+  _attributes.records().push_back(std::move(value));
+}
+
 void TLIndexableItem::addAttributeWithKeyBoolValue(TLAttributeKey key, bool boolValue) {
   append(*this, key, &TLAttribute::setBoolValue, boolValue);
 }
@@ -83,7 +98,7 @@ void TLIndexableItem::addPersonsWithKey(TLAttributeKey key, const std::vector<TL
 
 const std::shared_ptr<TLAttribute>& TLIndexableItem::attributeForKey(TLAttributeKey key) const {
   static const std::shared_ptr<TLAttribute> none;
-  for (const auto& attribute : _attributes) {
+  for (const auto& attribute : attributes()) {
     if (attribute->key() == key) return attribute;
   }
   return none;
@@ -92,7 +107,7 @@ const std::shared_ptr<TLAttribute>& TLIndexableItem::attributeForKey(TLAttribute
 std::vector<std::shared_ptr<TLAttribute>> TLIndexableItem::attributesForKey(
     TLAttributeKey key) const {
   std::vector<std::shared_ptr<TLAttribute>> result;
-  for (const auto& attribute : _attributes) {
+  for (const auto& attribute : attributes()) {
     if (attribute->key() == key) result.push_back(attribute);
   }
   return result;
@@ -105,6 +120,23 @@ const TLAttribute& attributeOrEmpty(const TLIndexableItem& item, TLAttributeKey 
   static const TLAttribute empty;
   const auto& attribute = item.attributeForKey(key);
   return attribute ? *attribute : empty;
+}
+
+// The key and the double value of an attribute in wire form; the rest is not decoded.
+std::pair<TLAttributeKey, double> keyAndDouble(std::string_view bytes) {
+  auto key = TLAttributeKey::UNKNOWN;
+  double value = 0;
+  for (TLReader reader(bytes); reader.hasMore();) {
+    const uint64_t tag = reader.readVarint();
+    if (tag >> 3 == TLAttribute::kKeyNumber) {
+      key = static_cast<TLAttributeKey>(static_cast<int32_t>(reader.readVarint()));
+    } else if (tag >> 3 == TLAttribute::kDoubleValueNumber) {
+      value = reader.readDouble();
+    } else if (!reader.skipValue(tag & 7)) {
+      break;
+    }
+  }
+  return {key, value};
 }
 
 // An empty list is one that was set where the attribute has no other value.
@@ -131,8 +163,16 @@ float TLIndexableItem::floatValueForKey(TLAttributeKey key) const {
   return attributeOrEmpty(*this, key).floatValue();
 }
 
+// Searches ask for the dates of many items, and for nothing else.
 double TLIndexableItem::doubleValueForKey(TLAttributeKey key) const {
-  return attributeOrEmpty(*this, key).doubleValue();
+  if (!_attributes.isWire()) return attributeOrEmpty(*this, key).doubleValue();
+  double found = 0;
+  _attributes.forEachWire([&](std::string_view bytes, std::string_view) {
+    const auto [itsKey, value] = keyAndDouble(bytes);
+    if (itsKey == key) found = value;
+    return itsKey != key;
+  });
+  return found;
 }
 
 int64_t TLIndexableItem::intValueForKey(TLAttributeKey key) const {

@@ -4,6 +4,7 @@
 #include "records/TLAttribute.h"
 #include "records/TLCard.h"
 #include "records/TLCodable.h"
+#include "records/TLRecordList.h"
 
 // What a client hands over for indexing, what the document store keeps and what a search returns.
 class TLIndexableItem final : public TLRecord<TLIndexableItem> {
@@ -11,8 +12,24 @@ class TLIndexableItem final : public TLRecord<TLIndexableItem> {
   // A fresh item has an empty identifier, which is present and is written.
   TLIndexableItem() { setIdentifier(TLString()); }
 
-  // In insertion order; keys may repeat.
-  TL_RECORD_RECORDS(TLAttribute, attributes, Attributes, attributes, Attributes)
+  // Reads what data() of an item has written, and leaves the attributes in that form until somebody
+  // asks for them. False when the bytes are anything else; the item then holds any part of them.
+  [[nodiscard]] bool initWithWrittenData(std::string_view bytes);
+
+  // In insertion order; keys may repeat. None of them is null.
+  [[nodiscard]] const std::vector<std::shared_ptr<TLAttribute>>& attributes() const {
+    return _attributes.records();
+  }
+  void setAttributes(std::vector<std::shared_ptr<TLAttribute>> values);
+  void clearAttributes() { _attributes = {}; }
+  void addAttributes(std::shared_ptr<TLAttribute> value);
+  [[nodiscard]] size_t attributesCount() const { return attributes().size(); }
+  // Throws std::out_of_range past the end.
+  [[nodiscard]] const std::shared_ptr<TLAttribute>& attributesAtIndex(size_t index) const {
+    return attributes().at(index);
+  }
+  [[nodiscard]] static const std::type_info& attributesType() { return typeid(TLAttribute); }
+
   TL_RECORD_STRING(identifier, Identifier)
   TL_RECORD_STRING(domainIdentifier, DomainIdentifier)
   TL_RECORD_SCALAR(int64_t, expirationDate, ExpirationDate, 1)
@@ -58,6 +75,8 @@ class TLIndexableItem final : public TLRecord<TLIndexableItem> {
 
  private:
   friend struct TLRecordTable<TLIndexableItem>;
+
+  TLRecordList<TLAttribute> _attributes;
 };
 
 extern template class TLRecord<TLIndexableItem>;

@@ -33,13 +33,16 @@ enum class TLWireType : uint8_t {
 // the error flag, which stays; what could not be read reads as 0 or null. One thread.
 class TLReader {
  public:
-  explicit TLReader(std::string_view bytes)
-      : _position(bytes.data()), _limit(bytes.data() + bytes.size()) {}
+  // With `keepsWire`, lists that can be kept in wire form are (see TLRecordList).
+  explicit TLReader(std::string_view bytes, bool keepsWire = false)
+      : _position(bytes.data()), _limit(bytes.data() + bytes.size()), _keepsWire(keepsWire) {}
 
   [[nodiscard]] bool hasError() const { return _error; }
   // True while bytes are left before the limit and nothing has failed.
   [[nodiscard]] bool hasMore() const { return _position < _limit && !_error; }
   [[nodiscard]] size_t remaining() const { return static_cast<size_t>(_limit - _position); }
+  [[nodiscard]] const char* position() const { return _position; }
+  [[nodiscard]] bool keepsWire() const { return _keepsWire; }
   void fail() { _error = true; }
 
   // At most ten bytes, low group first. Ten bytes that all have their top bit set read as 0,
@@ -114,15 +117,21 @@ class TLReader {
     return !_error;
   }
 
-  // A sub-record in place, within the bounds of nesting and number.
-  template <typename Record>
-  [[nodiscard]] bool readRecord(Record& record) {
+  // Runs `body` on a sub-record, within the bounds of length, nesting and number.
+  template <typename Body>
+  [[nodiscard]] bool withRecord(Body&& body) {
     if (_depth == kMaximumRecordDepth) _error = true;
     if (!takeElement()) return false;
     ++_depth;
-    const bool result = withLengthLimit([&] { return record.readFrom(*this); });
+    const bool result = withLengthLimit(body);
     --_depth;
     return result;
+  }
+
+  // A sub-record in place.
+  template <typename Record>
+  [[nodiscard]] bool readRecord(Record& record) {
+    return withRecord([&] { return record.readFrom(*this); });
   }
 
  private:
@@ -152,6 +161,7 @@ class TLReader {
 
   const char* _position;
   const char* _limit;
+  const bool _keepsWire;
   bool _error = false;
   int _depth = 0;
   uint32_t _elements = 0;

@@ -42,6 +42,11 @@ class TLWriter {
   void writeStringField(uint32_t number, TLStringView value) {
     writeDelimited(number, [&] { platform::appendUTF8(value, _bytes); });
   }
+  // A sub-record that is in wire form already, its length first.
+  void writeDelimitedField(uint32_t number, std::string_view delimited) {
+    writeTag(number, TLWireType::lengthDelimited);
+    _bytes.append(delimited);
+  }
   template <typename Record>
   void writeRecordField(uint32_t number, const Record& record) {
     writeDelimited(number, [&] { record.writeTo(*this); });

@@ -5,6 +5,7 @@
 #include <functional>
 #include <limits>
 #include <nlohmann/json.hpp>
+#include <random>
 #include <stdexcept>
 
 #include "records/TLIndexableItem.h"
@@ -236,6 +237,53 @@ TEST(Records, EveryTruncationFailsOrParses) {
   }
   // Nothing, each of the two attributes, and each of the four fields behind them end a record.
   EXPECT_EQ(parsed, 7U);
+}
+
+// Attributes in wire form against those that are decoded at once.
+TEST(Records, WrittenItemsAreForwardedAsTheyAreAndReadWhenAskedFor) {
+  const auto date = TLAttributeKey::MAIL_DATE_RECEIVED;
+  const auto item = richItem();
+  item->setCard(nullptr);
+  item->addAttributeWithKeyDoubleValue(date, 1.5);
+  item->addAttributeWithKeyDoubleValue(date, 2.5);
+  const std::string written = item->data();
+
+  TLIndexableItem kept;
+  ASSERT_TRUE(kept.initWithWrittenData(written));
+  EXPECT_EQ(kept.data(), written);
+  EXPECT_EQ(kept.doubleValueForKey(date), 1.5);
+  EXPECT_EQ(kept.doubleValueForKey(TLAttributeKey::START_DATE), 0);
+  kept.setCard(std::make_shared<TLCard>());
+  EXPECT_EQ(kept.data(), written + "\x2A" + std::string(1, '\0'));
+  kept.setCard(nullptr);
+  TLIndexableItem sharing;
+  kept.copyTo(sharing);
+  EXPECT_EQ(sharing.attributesAtIndex(0), kept.attributesAtIndex(0));
+  EXPECT_TRUE(kept.isEqual(*item));
+  EXPECT_EQ(kept.data(), written);
+  kept.addAttributeWithKeyBoolValue(TLAttributeKey::KIND, true);
+  EXPECT_EQ(kept.attributesCount(), item->attributesCount() + 1);
+
+  std::mt19937 random(7);
+  size_t accepted = 0;
+  for (int round = 0; round < 20000; ++round) {
+    std::string bytes = written.substr(0, random() % 4 == 0 ? random() % written.size() : SIZE_MAX);
+    for (size_t n = random() % 3; n > 0 && !bytes.empty(); --n) {
+      bytes[random() % bytes.size()] = static_cast<char>(random());
+    }
+    TLIndexableItem mutated;
+    if (!mutated.initWithWrittenData(bytes)) continue;
+    ++accepted;
+    TLIndexableItem plain;
+    ASSERT_TRUE(plain.initWithData(bytes));
+    TLIndexableItem received;
+    ASSERT_TRUE(received.initWithData(mutated.data()));
+    ASSERT_EQ(received.data(), plain.data());
+    ASSERT_EQ(mutated.attributesCount(), plain.attributesCount());
+    ASSERT_EQ(mutated.data(), plain.data());
+  }
+  EXPECT_GT(accepted, 1000U);
+  EXPECT_LT(accepted, 19000U);
 }
 
 TEST(Records, NestingIsBounded) {
