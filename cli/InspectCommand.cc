@@ -201,6 +201,11 @@ ExitStatus runPurge(const Options& options) {
   });
   const ExitStatus status = statusOf(inspector.end());
   const auto outcome = nlohmann::ordered_json::parse(text, nullptr, false);
+  if (status == ExitStatus::inUse) {
+    complain(
+        std::string("a purge needs the daemon to be stopped: "
+                    "systemctl --user stop 'tallowsearchd*', and start it afterwards"));
+  }
   if (status != ExitStatus::done || !outcome.is_object()) return status;
   return print(options.format == OutputFormat::json ? outcome.dump(2) + '\n' : purgeText(outcome),
                status);
