@@ -142,19 +142,24 @@ ExitStatus statusOf(int status) {
   return ExitStatus::failure;
 }
 
+std::string sizeText(uint64_t bytes) {
+  constexpr uint64_t kMegabyte = 1000000;
+  if (bytes < kMegabyte) return fmt::format("{} kB", bytes / 1000);
+  return fmt::format("{:.1f} MB", static_cast<double>(bytes) / kMegabyte);
+}
+
 std::string purgeText(const nlohmann::ordered_json& outcome) {
-  constexpr double kMegabyte = 1e6;
   const auto before = outcome.value("bytesBefore", uint64_t{0});
   const auto after = outcome.value("bytesAfter", uint64_t{0});
   const auto documents = outcome.value("documents", uint64_t{0});
-  const double given = static_cast<double>(before - std::min(before, after)) / kMegabyte;
+  const std::string given = sizeText(before - std::min(before, after));
   const char* const messages = documents == 1 ? "deleted message" : "deleted messages";
   if (outcome.value("estimate", false)) {
-    return fmt::format("{} {} would be removed from the disk, and about {:.1f} MB given back\n",
-                       documents, messages, given);
+    return fmt::format("{} {} would be removed from the disk, and about {} given back\n", documents,
+                       messages, given);
   }
-  std::string text = fmt::format("{} {} removed from the disk, {:.1f} MB given back\n", documents,
-                                 messages, given);
+  std::string text =
+      fmt::format("{} {} removed from the disk, {} given back\n", documents, messages, given);
   if (outcome.value("damagedIndexRemoved", false)) {
     text += "the damaged index that had been set aside is removed, too\n";
   }
