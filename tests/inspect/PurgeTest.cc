@@ -251,11 +251,24 @@ TEST_F(PurgeTest, TheDaemonRemovesWhatAKillHasLeft) {
   EXPECT_FALSE(fs::exists(platform::purgeDirectory(state)));
   EXPECT_EQ(purge(), std::nullopt);
   EXPECT_EQ(error->code, EWOULDBLOCK);
-  const std::string client =
-      TALLOW_PROGRAM " --state-dir " + state + " purge 2>" + directory / "err";
-  EXPECT_EQ(WEXITSTATUS(std::system(client.c_str())), 3);
-  EXPECT_THAT(platform::readFile(directory / "err", 4096, nullptr).value_or(""),
-              HasSubstr("systemctl --user stop 'tallowsearchd*'"));
+  const auto client = [this](const std::string& arguments) {
+    const std::string command = TALLOW_PROGRAM " --state-dir " + state + " purge " + arguments +
+                                " >" + directory / "out" + " 2>&1";
+    const int ended = std::system(command.c_str());
+    return std::pair(WEXITSTATUS(ended),
+                     platform::readFile(directory / "out", 4096, nullptr).value_or(""));
+  };
+  const auto [refused, reason] = client("");
+  EXPECT_EQ(refused, 3);
+  EXPECT_THAT(reason, HasSubstr("systemctl --user stop 'tallowsearchd*'"));
+  daemon.signal(SIGTERM);
+  EXPECT_EQ(daemon.wait(), 0);
+  const auto [estimated, estimate] = client("--dry-run --format=json");
+  EXPECT_EQ(estimated, 0) << estimate;
+  EXPECT_THAT(estimate, HasSubstr("\"documents\": 0,"));
+  const auto [done, text] = client("");
+  EXPECT_EQ(done, 0) << text;
+  EXPECT_THAT(text, HasSubstr("0 deleted messages removed from the disk, "));
 }
 
 // A write that fails ends the purge, or the process, and leaves the old class.
