@@ -158,7 +158,7 @@ struct CommandFunction {
   Run run;
 };
 
-constexpr std::array<CommandFunction, 14> kFunctions{{
+constexpr std::array<CommandFunction, 15> kFunctions{{
     {Command::index, runIndex},
     {Command::sync, runSync},
     {Command::status, runStatus},
@@ -173,6 +173,7 @@ constexpr std::array<CommandFunction, 14> kFunctions{{
     {Command::state, runState},
     {Command::dump, runDump},
     {Command::validate, runValidate},
+    {Command::purge, runPurge},
 }};
 
 }  // namespace

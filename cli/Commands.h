@@ -25,6 +25,7 @@ namespace cli {
 // Of runCommand, those that look at an index without the daemon.
 [[nodiscard]] ExitStatus runDump(const Options& options);
 [[nodiscard]] ExitStatus runValidate(const Options& options);
+[[nodiscard]] ExitStatus runPurge(const Options& options);
 
 // Writes the result of a command, or a piece of it; a full disk or a closed pipe is a failure.
 [[nodiscard]] ExitStatus print(std::string_view text, ExitStatus status = ExitStatus::done);

@@ -4,6 +4,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <csignal>
@@ -19,7 +20,7 @@
 #include "platform/Files.h"
 #include "platform/Paths.h"
 
-// Dump and validate. The text index is the daemon's, so a program of its own reads it,
+// Dump, validate and purge. The text index is the daemon's, so a program of its own reads it,
 // tallow-inspect; here it is run, and what it writes is made fit to be shown.
 namespace cli {
 
@@ -141,6 +142,30 @@ ExitStatus statusOf(int status) {
   return ExitStatus::failure;
 }
 
+std::string sizeText(uint64_t bytes) {
+  constexpr uint64_t kMegabyte = 1000000;
+  if (bytes < kMegabyte) return fmt::format("{} kB", bytes / 1000);
+  return fmt::format("{:.1f} MB", static_cast<double>(bytes) / kMegabyte);
+}
+
+std::string purgeText(const nlohmann::ordered_json& outcome) {
+  const auto before = outcome.value("bytesBefore", uint64_t{0});
+  const auto after = outcome.value("bytesAfter", uint64_t{0});
+  const auto documents = outcome.value("documents", uint64_t{0});
+  const std::string given = sizeText(before - std::min(before, after));
+  const char* const messages = documents == 1 ? "deleted message" : "deleted messages";
+  if (outcome.value("estimate", false)) {
+    return fmt::format("{} {} would be removed from the disk, and about {} given back\n", documents,
+                       messages, given);
+  }
+  std::string text =
+      fmt::format("{} {} removed from the disk, {} given back\n", documents, messages, given);
+  if (outcome.value("damagedIndexRemoved", false)) {
+    text += "the damaged index that had been set aside is removed, too\n";
+  }
+  return text;
+}
+
 std::string outcomeText(const nlohmann::ordered_json& outcome) {
   std::string text = outcome.value("valid", false) ? "valid\n" : "not valid\n";
   for (const auto& [key, value] : outcome.items()) {
@@ -167,6 +192,28 @@ ExitStatus runDump(const Options& options) {
   const int status = inspector.end();
   if (!written) return ExitStatus::failure;
   return print(cleanLinesForTerminal(lines), statusOf(status));
+}
+
+ExitStatus runPurge(const Options& options) {
+  Inspector inspector;
+  if (!inspector.start(options.dryRun ? "estimate-purge" : "purge", options)) {
+    return ExitStatus::failure;
+  }
+  std::string text;
+  inspector.read([&text](std::string_view piece) {
+    text += piece;
+    return true;
+  });
+  const ExitStatus status = statusOf(inspector.end());
+  const auto outcome = nlohmann::ordered_json::parse(text, nullptr, false);
+  if (status == ExitStatus::inUse) {
+    complain(
+        std::string("a purge needs the daemon to be stopped: "
+                    "systemctl --user stop 'tallowsearchd*', and start it afterwards"));
+  }
+  if (status != ExitStatus::done || !outcome.is_object()) return status;
+  return print(options.format == OutputFormat::json ? outcome.dump(2) + '\n' : purgeText(outcome),
+               status);
 }
 
 ExitStatus runValidate(const Options& options) {

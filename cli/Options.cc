@@ -25,7 +25,7 @@ struct CommandRow {
   bool operandsRequired;
 };
 
-constexpr std::array<CommandRow, 14> kCommands{{
+constexpr std::array<CommandRow, 15> kCommands{{
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
     {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
@@ -45,6 +45,8 @@ constexpr std::array<CommandRow, 14> kCommands{{
     {Command::state, "state", "Show the state that a client has stored", nullptr, false},
     {Command::dump, "dump", "Print the text index, while no daemon runs", nullptr, false},
     {Command::validate, "validate", "Check the text index, while no daemon runs", nullptr, false},
+    {Command::purge, "purge", "Remove what was deleted from the disk, while no daemon runs",
+     nullptr, false},
 }};
 
 const std::map<std::string, OutputFormat> kFormats{{"text", OutputFormat::text},
@@ -61,7 +63,7 @@ void addGlobalOptions(CLI::App& app, Options& options) {
   app.add_option("--runtime-dir", options.runtimeDirectory, "Directory of the daemon's sockets")
       ->type_name("DIR");
   app.add_option("--state-dir", options.stateDirectory,
-                 "Directory of the daemon's data, for dump and validate")
+                 "Directory of the daemon's data, for dump, validate and purge")
       ->type_name("DIR");
   app.add_option("--class", options.protectionClass, "Protection class (default: default)")
       ->type_name("CLASS");
@@ -128,6 +130,9 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (isSearch(row.command)) addQueryOptions(*sub, options);
   if (row.command == Command::search) addResultOptions(*sub, options);
   if (row.command == Command::sync) addSyncOptions(*sub, options);
+  if (row.command == Command::purge) {
+    sub->add_flag("-n,--dry-run", options.dryRun, "Only tell how much it would give back");
+  }
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 

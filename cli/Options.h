@@ -33,7 +33,8 @@ enum class Command {
   dump,
   validate,
   sync,
-  status
+  status,
+  purge
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };

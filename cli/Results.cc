@@ -131,6 +131,15 @@ std::string entry(const std::string& text, bool raw) {
   return raw ? text + '\0' : cleanForTerminal(text) + '\n';
 }
 
+nlohmann::json replacedJSON(const std::vector<client::ReplacedWord>& words) {
+  nlohmann::json list = nlohmann::json::array();
+  for (const client::ReplacedWord& word : words) {
+    list.push_back(
+        {{"typed", word.typed}, {"replacement", word.replacement}, {"reason", word.reason}});
+  }
+  return list;
+}
+
 std::string score(bool present, double value) {
   return present ? fmt::format("{:.4f}", value) : "-";
 }
@@ -224,6 +233,15 @@ std::string resultsText(const Page& page, const std::string& query, MailFacts& f
   return out;
 }
 
+std::string replacedText(const std::vector<client::ReplacedWord>& words) {
+  std::string text;
+  for (const client::ReplacedWord& word : words) {
+    text += text.empty() ? "showing results for " : ", ";
+    text += word.replacement + (word.reason == "stem" ? "..." : "");
+  }
+  return cleanForTerminal(text);
+}
+
 std::string resultsJSON(const Page& page, MailFacts& facts) {
   nlohmann::json list = nlohmann::json::array();
   for (const Hit& hit : page.hits) {
@@ -232,6 +250,7 @@ std::string resultsJSON(const Page& page, MailFacts& facts) {
   return jsonText({{"schema", 1},
                    {"total", page.total},
                    {"complete", page.complete},
+                   {"changed", replacedJSON(page.replaced)},
                    {"results", std::move(list)}});
 }
 

@@ -9,6 +9,7 @@
 #include "cli/MailFacts.h"
 #include "cli/Options.h"
 #include "cli/Terminal.h"
+#include "client/SearchServiceProxy.h"
 #include "records/TLIndexableItem.h"
 
 namespace cli {
@@ -32,19 +33,25 @@ struct Page {
   size_t firstRank = 1;
   size_t total = 0;      // of all hits
   bool complete = true;  // false: there may be more than `total`
+  std::vector<client::ReplacedWord> replaced;
 };
 
 // The output of a search as one text, clean of control characters. Lines fit into so many columns,
 // 0 for no limit. Where the snippet holds no word, the mail is read for the place that does.
 [[nodiscard]] std::string resultsText(const Page& page, const std::string& words, MailFacts& facts,
                                       const Palette& palette, size_t columns);
-// An object: "schema" is 1, "total" and "complete" as in the page, "results" a list of objects.
+// An object: "schema" is 1, "total" and "complete" as in the page, "changed" a list of the replaced
+// words, "results" a list of objects.
 [[nodiscard]] std::string resultsJSON(const Page& page, MailFacts& facts);
 // A path an entry, of copies too, with ":OFFSET" for a message of an mbox file. An identifier of
 // another client stands as it is. With `raw`, each ends with NUL and is as it is on the disk.
 [[nodiscard]] std::string resultsFiles(const Page& page, MailFacts& facts, bool raw);
 // A Message-ID an entry; messages without one are left out.
 [[nodiscard]] std::string resultsMessageIDs(const Page& page, MailFacts& facts, bool raw);
+
+// What the daemon looked for in place of what was typed, as a line for people: "showing results
+// for invoices". Empty where it replaced nothing.
+[[nodiscard]] std::string replacedText(const std::vector<client::ReplacedWord>& words);
 
 // A line, or a row, a result: rank, scores, date, identifier.
 [[nodiscard]] std::string scoresText(const ResultItems& items, const Palette& palette);

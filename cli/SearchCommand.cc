@@ -54,6 +54,7 @@ struct Outcome {
   Hits hits;
   ResultItems items;
   bool complete = true;
+  std::vector<client::ReplacedWord> replaced;
 };
 
 void remarkOn(const SearchResults& found, size_t wanted, const MailFacts& facts) {
@@ -86,7 +87,8 @@ std::optional<Outcome> search(const Options& options, const QueryInput& input, M
     if (all || wanted == SIZE_MAX) remarkOn(*found, wanted, facts);
     Hits hits = joinCopies(found->items, facts);
     if (all || hits.size() >= shown || wanted > SIZE_MAX / 4) {
-      return Outcome{std::move(hits), std::move(found->items), found->complete};
+      return Outcome{std::move(hits), std::move(found->items), found->complete,
+                     std::move(found->replaced)};
     }
     wanted *= 4;
   }
@@ -126,6 +128,7 @@ ExitStatus runSearch(const Options& options) {
     complain(std::string(useless ? "nothing in the expression can be looked up; see tallow-query(7)"
                                  : "no match"));
   }
+  if (!outcome->replaced.empty()) complain(replacedText(outcome->replaced));
   if (options.count && options.format != OutputFormat::json) {
     return print(fmt::format("{}\n", outcome->hits.size()), statusOf(outcome->items));
   }
@@ -135,7 +138,7 @@ ExitStatus runSearch(const Options& options) {
   if (options.count) hits = {};
   if (limit != 0) hits = hits.first(std::min(hits.size(), limit));
   const Page page{hits, static_cast<size_t>(options.offset) + 1, outcome->hits.size(),
-                  outcome->complete};
+                  outcome->complete, outcome->replaced};
   return print(outputOf(options, *input, page, facts), statusOf(outcome->items));
 }
 

@@ -139,6 +139,7 @@ class BranchBuilder {
 
   Branch build() {
     _branch.query = query(nullptr);
+    _branch.modifiable = _modified;
     for (const NodePointer& condition : _negated) _branch.without.push_back(query(condition));
     return std::move(_branch);
   }

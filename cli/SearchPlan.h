@@ -26,6 +26,7 @@ struct Branch {
   std::shared_ptr<TLQuery> query;
   std::vector<std::shared_ptr<TLQuery>> without;
   std::vector<Check> checks;
+  bool modifiable = true;  // the daemon may replace words that find nothing
 };
 
 // What was typed, as searches of the daemon's and checks of their results. The results of all

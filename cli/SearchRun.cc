@@ -61,6 +61,7 @@ class Run {
   std::optional<SearchResults> run(TLErrorOut error) {
     for (const size_t step : kCandidateSteps) {
       _truncated = false;
+      _replaced.clear();
       _step = step;
       auto candidates = gather(error);
       if (!candidates) return std::nullopt;
@@ -73,6 +74,7 @@ class Run {
       if (!_truncated || enough || last) {
         results.complete = results.complete && !_truncated;
         results.lookedAt = _lookedAt;
+        if (!results.items.empty()) results.replaced = _replaced;
         return results;
       }
     }
@@ -112,10 +114,22 @@ class Run {
     return items;
   }
 
+  // A daemon that cannot tell is no failure of the search.
+  void noteReplacedWords() {
+    auto words = _service.replacedWords(nullptr);
+    if (!words) return;
+    for (auto& word : *words) {
+      if (std::find(_replaced.begin(), _replaced.end(), word) == _replaced.end()) {
+        _replaced.push_back(std::move(word));
+      }
+    }
+  }
+
   // What a branch finds, in the daemon's order.
   std::optional<ResultItems> resultsOf(const Branch& branch, TLErrorOut error) {
     auto items = ask(*branch.query, error);
     if (!items || items->empty()) return items;
+    if (branch.modifiable) noteReplacedWords();
     std::unordered_set<std::string> out;
     for (const auto& query : branch.without) {
       const auto unwanted = ask(*query, error);
@@ -224,6 +238,7 @@ class Run {
   MailFacts& _facts;
   size_t _step = 0;      // candidates that are asked for
   size_t _lookedAt = 0;  // that the daemon gives at most
+  std::vector<client::ReplacedWord> _replaced;
   bool _truncated = false;
   bool _fixed = false;  // asking for more candidates changes nothing
 };

@@ -24,6 +24,8 @@ struct SearchResults {
   bool complete = true;
   // How many candidates were asked for where `complete` is false.
   size_t lookedAt = 0;
+  // The words that the daemon replaced to find these items.
+  std::vector<client::ReplacedWord> replaced;
 };
 
 // Candidates that are asked for, each time that those before were too few.

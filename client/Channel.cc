@@ -159,12 +159,12 @@ void Channel::disconnect() {
   _bus = sd_bus_unref(_bus);
 }
 
-bool Channel::call(const char* member, std::chrono::seconds timeout, const Body& append,
-                   const Body& read, TLErrorOut error) {
+bool Channel::call(const char* interface, const char* member, std::chrono::seconds timeout,
+                   const Body& append, const Body& read, TLErrorOut error) {
   if (!connect(error)) return false;
   sd_bus_message* raw = nullptr;
-  int result = sd_bus_message_new_method_call(_bus, &raw, nullptr, _objectPath.c_str(),
-                                              _serviceName.c_str(), member);
+  int result =
+      sd_bus_message_new_method_call(_bus, &raw, nullptr, _objectPath.c_str(), interface, member);
   const Message request(raw);
   if (result >= 0) result = append(request.get());
   if (result < 0) {

@@ -56,7 +56,12 @@ class Channel {
 
   // Calls `member` and waits for its reply. False with an error when there is none.
   bool call(const char* member, std::chrono::seconds timeout, const Body& append, const Body& read,
-            TLErrorOut error);
+            TLErrorOut error) {
+    return call(_serviceName.c_str(), member, timeout, append, read, error);
+  }
+  // The same of another interface of the service's object.
+  bool call(const char* interface, const char* member, std::chrono::seconds timeout,
+            const Body& append, const Body& read, TLErrorOut error);
 
  private:
   bool connect(TLErrorOut error);

@@ -43,6 +43,18 @@ int readItems(sd_bus_message* reply, SearchServiceProxy::Items& items) {
   return result < 0 ? result : sd_bus_message_exit_container(reply);
 }
 
+int readReplacedWords(sd_bus_message* reply, std::vector<ReplacedWord>& words) {
+  const char* typed = nullptr;
+  const char* replacement = nullptr;
+  const char* reason = nullptr;
+  int result = sd_bus_message_enter_container(reply, 'a', "(sss)");
+  while (result >= 0 &&
+         (result = sd_bus_message_read(reply, "(sss)", &typed, &replacement, &reason)) > 0) {
+    words.push_back({typed, replacement, reason});
+  }
+  return result < 0 ? result : sd_bus_message_exit_container(reply);
+}
+
 int nothing(sd_bus_message*) {
   return 0;
 }
@@ -170,6 +182,16 @@ std::optional<SearchServiceProxy::Items> SearchServiceProxy::searchItems(
     return std::nullopt;
   }
   return items;
+}
+
+std::optional<std::vector<ReplacedWord>> SearchServiceProxy::replacedWords(TLErrorOut error) {
+  std::vector<ReplacedWord> words;
+  const auto read = [&](sd_bus_message* reply) { return readReplacedWords(reply, words); };
+  if (!_channel.call(kSearchExplanationName, "FetchReplacedWords", kShortTimeout, nothing, read,
+                     error)) {
+    return std::nullopt;
+  }
+  return words;
 }
 
 }  // namespace client

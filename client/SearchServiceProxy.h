@@ -16,6 +16,16 @@
 namespace client {
 
 inline constexpr const char* kSearchServiceName = "com.quill.tallowsearch.SearchService";
+inline constexpr const char* kSearchExplanationName = "com.quill.tallowsearch.SearchExplanation";
+
+// A word that a search replaced, since it found too little as typed.
+struct ReplacedWord {
+  std::string typed;
+  std::string replacement;
+  std::string reason;  // "spelling", "synonym" or "stem"; of a stem, any word that begins so counts
+
+  bool operator==(const ReplacedWord&) const = default;
+};
 
 // The search service of the daemon. Each operation waits for its reply and fails with an error of
 // the daemon or of this library (see Channel.h). One thread at a time.
@@ -59,6 +69,10 @@ class SearchServiceProxy {
   [[nodiscard]] std::optional<Items> searchItems(const TLQuery& query, uint64_t options,
                                                  const std::string& protectionClass,
                                                  int64_t maxResults, TLErrorOut error);
+
+  // What the last search of this proxy replaced; none after a failure, as of a daemon that does not
+  // tell, or where the connection is another one than the search had.
+  [[nodiscard]] std::optional<std::vector<ReplacedWord>> replacedWords(TLErrorOut error);
 
  private:
   bool callWithTexts(const char* member, std::span<const std::string> texts,

@@ -100,7 +100,9 @@ void deleteAll(TALSearchService& service, RPCArguments& arguments, const Reply& 
   service.deleteAllItemsFromIndexerNamed(name, protectionClass, replyWithError(reply));
 }
 
-void searchItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void searchItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply,
+                 WordReplacements& replaced) {
+  replaced.clear();
   TLQuery query;
   if (!query.initWithData(arguments.readBytes())) {
     reply->sendFailure(platform::kRPCInvalidArgs, "argument 0 (query): the bytes are no TLQuery");
@@ -109,15 +111,29 @@ void searchItems(TALSearchService& service, RPCArguments& arguments, const Reply
   const uint64_t options = arguments.readUInt64();
   const std::string protectionClass(arguments.readString());
   const int64_t maxResults = arguments.readInt64();
-  service.searchItemsForQuery(query, options, protectionClass, maxResults,
-                              [&reply](const std::optional<TALSearchService::Items>& items,
-                                       const std::optional<TLError>& error) {
-                                if (error) return reply->sendError(*error);
-                                platform::RPCBytesArray encoded;
-                                encoded.reserve(items->size());
-                                for (const auto& item : *items) encoded.push_back(item->data());
-                                reply->send({std::move(encoded)});
-                              });
+  service.searchItemsForQuery(
+      query, options, protectionClass, maxResults,
+      [&reply](const std::optional<TALSearchService::Items>& items,
+               const std::optional<TLError>& error) {
+        if (error) return reply->sendError(*error);
+        platform::RPCBytesArray encoded;
+        encoded.reserve(items->size());
+        for (const auto& item : *items) encoded.push_back(item->data());
+        reply->send({std::move(encoded)});
+      },
+      &replaced);
+}
+
+const char* nameOf(WordReplacement::Reason reason) {
+  switch (reason) {
+    case WordReplacement::Reason::spelling:
+      return "spelling";
+    case WordReplacement::Reason::synonym:
+      return "synonym";
+    case WordReplacement::Reason::stem:
+      break;
+  }
+  return "stem";
 }
 
 void ping(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
@@ -180,7 +196,8 @@ platform::RPCMethod method(TALSearchService& service, const char* member, const 
 
 }  // namespace
 
-RPCInterface makeSearchServiceProtocol(TALSearchService& service) {
+RPCInterface makeSearchServiceProtocol(TALSearchService& service,
+                                       std::shared_ptr<WordReplacements> lastReplaced) {
   return {{
       method(service, "IndexItems", "aayss", "", {"items", "toIndexerNamed", "protectionClass"},
              indexItems),
@@ -196,9 +213,25 @@ RPCInterface makeSearchServiceProtocol(TALSearchService& service) {
              {"domainIdentifiers", "fromIndexerNamed", "protectionClass"}, deleteDomains),
       method(service, "DeleteAllItems", "ss", "", {"fromIndexerNamed", "protectionClass"},
              deleteAll),
-      method(service, "SearchItemsForQuery", "aytsx", "aay",
-             {"query", "options", "protectionClass", "maxResults", "items"}, searchItems),
+      {"SearchItemsForQuery",
+       "aytsx",
+       "aay",
+       {"query", "options", "protectionClass", "maxResults", "items"},
+       [&service, lastReplaced](RPCArguments& arguments, Reply reply) {
+         searchItems(service, arguments, reply, *lastReplaced);
+       }},
   }};
+}
+
+RPCInterface makeSearchExplanationProtocol(std::shared_ptr<const WordReplacements> lastReplaced) {
+  const auto fetch = [lastReplaced](RPCArguments&, Reply reply) {
+    platform::RPCTextRows rows;
+    for (const WordReplacement& word : *lastReplaced) {
+      rows.push_back({word.typed, word.replacement, nameOf(word.reason)});
+    }
+    reply->send({std::move(rows)});
+  };
+  return {{{"FetchReplacedWords", "", "a(sss)", {"replaced"}, fetch}}, kSearchExplanationName};
 }
 
 RPCInterface makeDebugServiceProtocol(TALSearchService& service) {

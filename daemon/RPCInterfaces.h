@@ -4,10 +4,17 @@
 #include "platform/RPC.h"
 
 inline constexpr const char* kSearchServiceName = "com.quill.tallowsearch.SearchService";
+inline constexpr const char* kSearchExplanationName = "com.quill.tallowsearch.SearchExplanation";
 inline constexpr const char* kDebugServiceName = "com.quill.tallow.DebugService";
 
 // The operations of the two services as members of their RPC interfaces. Records are decoded here:
 // bytes that do not parse are refused, with the argument and the index named, and nothing of the
 // call is done. The service must outlive the interfaces.
-[[nodiscard]] platform::RPCInterface makeSearchServiceProtocol(TALSearchService& service);
+//
+// The interfaces of the search service belong to one connection, on whose thread they are used:
+// they share the words that its last search replaced.
+[[nodiscard]] platform::RPCInterface makeSearchServiceProtocol(
+    TALSearchService& service, std::shared_ptr<WordReplacements> lastReplaced);
+[[nodiscard]] platform::RPCInterface makeSearchExplanationProtocol(
+    std::shared_ptr<const WordReplacements> lastReplaced);
 [[nodiscard]] platform::RPCInterface makeDebugServiceProtocol(TALSearchService& service);

@@ -34,7 +34,6 @@ std::unique_ptr<TALDaemon> TALDaemon::init(platform::RunLoop& loop, const std::s
 TALDaemon::TALDaemon(platform::RunLoop& loop, const std::string& path,
                      const std::string& runtimeDirectory)
     : _searchService(std::make_unique<TALSearchService>(std::make_shared<TALIndexerManager>(path))),
-      _searchServiceProtocol(makeSearchServiceProtocol(*_searchService)),
       _debugServiceProtocol(makeDebugServiceProtocol(*_searchService)),
       _searchServiceListener(platform::makeRPCListener(loop, runtimeDirectory, kSearchServiceName)),
       _debugServiceListener(platform::makeRPCListener(loop, runtimeDirectory, kDebugServiceName)) {
@@ -50,11 +49,13 @@ TALDaemon::~TALDaemon() = default;
 bool TALDaemon::listener(platform::RPCListener&, platform::RPCConnection& connection) {
   log().standard("accept new connection: {}", connection.description());
   if (connection.serviceName() == kSearchServiceName) {
-    connection.setExportedInterface(&_searchServiceProtocol);
+    const auto lastReplaced = std::make_shared<WordReplacements>();
+    connection.addExportedInterface(makeSearchServiceProtocol(*_searchService, lastReplaced));
+    connection.addExportedInterface(makeSearchExplanationProtocol(lastReplaced));
     return true;
   }
   if (connection.serviceName() == kDebugServiceName) {
-    connection.setExportedInterface(&_debugServiceProtocol);
+    connection.addExportedInterface(_debugServiceProtocol);
     return true;
   }
   return false;

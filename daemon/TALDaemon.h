@@ -46,7 +46,6 @@ class TALDaemon {
   TALDaemon(platform::RunLoop& loop, const std::string& path, const std::string& runtimeDirectory);
 
   std::unique_ptr<TALSearchService> _searchService;
-  platform::RPCInterface _searchServiceProtocol;
   platform::RPCInterface _debugServiceProtocol;
   std::unique_ptr<platform::RPCListener> _searchServiceListener;
   std::unique_ptr<platform::RPCListener> _debugServiceListener;

@@ -187,7 +187,9 @@ void TALSearchService::fetchLastClientStateFromIndexerNamed(
 
 void TALSearchService::searchItemsForQuery(
     TLQuery& query, uint64_t withOption, const std::string& forProtectionClass, int64_t maxResults,
-    const std::function<void(const std::optional<Items>&, const std::optional<TLError>&)>& reply) {
+    const std::function<void(const std::optional<Items>&, const std::optional<TLError>&)>& reply,
+    WordReplacements* replaced) {
+  if (replaced != nullptr) replaced->clear();
   const uint64_t start = platform::monotonicTicks();
   const std::string description =
       fmt::format("searchItemsForQuery query={}, context={}, protectionClass={}",
@@ -222,7 +224,7 @@ void TALSearchService::searchItemsForQuery(
   }
 
   size_t count = 0;
-  Items items = indexer->search(query, &error, static_cast<uint64_t>(maxResults), &count);
+  Items items = indexer->search(query, &error, static_cast<uint64_t>(maxResults), &count, replaced);
   Signpost::end(signpost, "SearchQuery", "query {} found {} items",
                 platform::redacted(query.rawQuery()), count);
   log().standard("Finished {}, results={}, timeTaken={} ms", description, items.size(),

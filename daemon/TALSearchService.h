@@ -49,11 +49,14 @@ class TALSearchService {
   void deleteAllItemsFromIndexerNamed(const std::string& name, const std::string& protectionClass,
                                       TLErrorReply reply);
   // The items are null only beside an error. The query is changed: it gets its resolved parameters.
-  // `maxResults` is compared as unsigned, so that a negative one truncates nothing.
+  // `maxResults` is compared as unsigned, so that a negative one truncates nothing. `replaced`,
+  // which may be null, receives the words that were changed for these results; it is complete
+  // when the operation returns.
   void searchItemsForQuery(
       TLQuery& query, uint64_t withOption, const std::string& forProtectionClass,
       int64_t maxResults,
-      const std::function<void(const std::optional<Items>&, const std::optional<TLError>&)>& reply);
+      const std::function<void(const std::optional<Items>&, const std::optional<TLError>&)>& reply,
+      WordReplacements* replaced = nullptr);
 
   // The debug service.
   void ping(const std::string& input, const std::function<void(const std::string&)>& reply);

@@ -99,6 +99,8 @@ int main(int argc, char** argv) {
   });
 
   const auto lock = platform::ProcessLock::acquire(platform::processLockPath(), &error);
+  // A purge that was cut short leaves either a copy or what it took out.
+  if (lock != nullptr) platform::removeItem(platform::purgeDirectory(), nullptr);
   TALDaemon* daemon = TALDaemon::sharedInstance();
   if (daemon != nullptr) {
     if (lock == nullptr || !daemon->run(&error)) return fail(error);

@@ -87,7 +87,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   fcntl(ends[1], F_SETFL, O_NONBLOCK);
   {
     platform::RPCServerConnection connection(ends[1], kService, "fuzzer");
-    connection.setExportedInterface(&interface());
+    connection.addExportedInterface(interface());
     bool ended = false;
     if (connection.open([&ended] { ended = true; })) {
       testsupport::sendAll(ends[0], begin);

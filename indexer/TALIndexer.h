@@ -12,6 +12,7 @@
 #include "indexer/DocDates.h"
 #include "indexer/OpenText.h"
 #include "indexer/TALZoneManager.h"
+#include "indexer/WordReplacement.h"
 #include "modification/TALStemRewrite.h"
 #include "modification/TALSynonyms.h"
 #include "platform/Log.h"
@@ -108,8 +109,9 @@ class TALIndexer {
   // changed words, if any can be found.
   //
   // The items are the best `most`; `count`, which may be null, receives how many were ranked.
+  // `replaced`, which may be null, receives the words that were changed for these results.
   [[nodiscard]] Items search(TLQuery& query, TLErrorOut error, size_t most = SIZE_MAX,
-                             size_t* count = nullptr);
+                             size_t* count = nullptr, WordReplacements* replaced = nullptr);
 
   // Every stored document whose subject is one of `subjects`, in the store's order, without scores;
   // none with an error set when the store fails. Reads every document.
@@ -232,12 +234,13 @@ class TALIndexer {
   // The second pass: with changed terms where a modifier finds some, else `firstResults`. Drops
   // them when the second pass fails.
   Found searchModified(const TLQuery& query, const std::vector<saltsearch::Term>& saltQueryTerms,
-                       Found firstResults, size_t most, TLErrorOut error);
+                       Found firstResults, size_t most, TLErrorOut error,
+                       WordReplacements* replaced);
   // Tries one way after the other to change terms that found too little; the first that changes
-  // something ends it. True when `modifiedQueryTerms` is filled.
+  // something ends it. True when `modifiedQueryTerms` and `reason` are filled.
   bool _modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
                          std::vector<saltsearch::Term>& modifiedQueryTerms,
-                         const TLParameters& searchParams);
+                         const TLParameters& searchParams, WordReplacement::Reason& reason);
   bool modifyWithSpelling(const std::vector<saltsearch::Term>& queryTerms, const OpenText& text,
                           std::vector<saltsearch::Term>& modifiedQueryTerms);
   bool modifyWithSynonyms(const std::vector<saltsearch::Term>& queryTerms, const OpenText& text,

@@ -1,9 +1,32 @@
+#include <algorithm>
 #include <optional>
 #include <utility>
 
 #include "indexer/TALIndexer.h"
+#include "modification/TermTokens.h"
 
 using platform::MutexLock;
+
+namespace {
+
+// Modifiers change the first token of a term and leave the number of terms as it is.
+WordReplacements replacedWords(const std::vector<saltsearch::Term>& typed,
+                               const std::vector<saltsearch::Term>& modified,
+                               WordReplacement::Reason reason) {
+  WordReplacements words;
+  for (size_t i = 0; i < std::min(typed.size(), modified.size()); ++i) {
+    if (words.size() == kMaxWordReplacements) break;
+    if (!modification::isSingleWord(typed[i]) || modified[i].tokens.empty()) continue;
+    const std::string& from = typed[i].tokens.front();
+    const std::string& to = modified[i].tokens.front();
+    if (from == to || std::max(from.size(), to.size()) > kMaxReplacedWordSize) continue;
+    words.push_back({std::string(modification::withoutBlank(from)),
+                     std::string(modification::withoutBlank(to)), reason});
+  }
+  return words;
+}
+
+}  // namespace
 
 bool TALIndexer::_notSufficientRetrieval(size_t results, int64_t threshold) {
   return results <= static_cast<uint64_t>(threshold);
@@ -15,10 +38,13 @@ bool TALIndexer::_shouldRunQueryModification(size_t results, int64_t retrievalTh
 
 TALIndexer::Found TALIndexer::searchModified(const TLQuery& query,
                                              const std::vector<saltsearch::Term>& saltQueryTerms,
-                                             Found firstResults, size_t most, TLErrorOut error) {
+                                             Found firstResults, size_t most, TLErrorOut error,
+                                             WordReplacements* replaced) {
   log().standard("Query modification started for query with {} terms", saltQueryTerms.size());
   std::vector<saltsearch::Term> modified;
-  if (!_modifyQueryTerms(saltQueryTerms, modified, *query.searchParams()) || modified.empty()) {
+  auto reason = WordReplacement::Reason::spelling;
+  if (!_modifyQueryTerms(saltQueryTerms, modified, *query.searchParams(), reason) ||
+      modified.empty()) {
     log().standard("Query modification didnt work out. Return original query results.");
     return firstResults;
   }
@@ -35,23 +61,28 @@ TALIndexer::Found TALIndexer::searchModified(const TLQuery& query,
     return {};
   }
   log().standard("Query modification finished. Results retrieved with modified query terms.");
+  if (replaced != nullptr) *replaced = replacedWords(saltQueryTerms, modified, reason);
   return found;
 }
 
 // The modifiers read the text index beside ingest.
 bool TALIndexer::_modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
                                    std::vector<saltsearch::Term>& modifiedQueryTerms,
-                                   const TLParameters& searchParams) {
+                                   const TLParameters& searchParams,
+                                   WordReplacement::Reason& reason) {
   const auto text = _text.get();
   if (text == nullptr) return false;
+  reason = WordReplacement::Reason::spelling;
   if (searchParams.boolValueForKey("queryModification.enableSpellModification") &&
       modifyWithSpelling(queryTerms, *text, modifiedQueryTerms)) {
     return true;
   }
+  reason = WordReplacement::Reason::synonym;
   if (searchParams.boolValueForKey("queryModification.enableSynonymModification") &&
       modifyWithSynonyms(queryTerms, *text, modifiedQueryTerms)) {
     return true;
   }
+  reason = WordReplacement::Reason::stem;
   return searchParams.boolValueForKey("queryModification.enableStemModification") &&
          modifyWithStems(queryTerms, *text, modifiedQueryTerms);
 }

@@ -114,8 +114,10 @@ struct TALIndexer::RankKey {
   float mailDateReceived = 0;  // narrowed: dates within about two minutes tie
 };
 
-TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t most, size_t* count) {
+TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t most, size_t* count,
+                                     WordReplacements* replaced) {
   if (count != nullptr) *count = 0;
+  if (replaced != nullptr) replaced->clear();
   query.setSearchParams(query.hasSearchParams()
                             ? TLParamsManager::resolveOverrides(*query.searchParams(), true)
                             : TLParamsManager::getDefaultSearchParamsWithCaching(true));
@@ -145,7 +147,7 @@ TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t mo
   const int64_t threshold =
       query.searchParams()->intValueForKey("queryModification.sufficentRetrievalThreshold");
   if (_shouldRunQueryModification(found.count, threshold)) {
-    found = searchModified(query, saltQueryTerms, std::move(found), most, error);
+    found = searchModified(query, saltQueryTerms, std::move(found), most, error, replaced);
   }
   if (count != nullptr) *count = found.count;
   return std::move(found.items);

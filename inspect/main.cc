@@ -1,4 +1,6 @@
 #include <fmt/format.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstdio>
@@ -7,19 +9,20 @@
 #include <string>
 #include <string_view>
 
+#include "inspect/Purge.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
 #include "platform/ProcessLock.h"
 #include "salt/Inspection.h"
 #include "salt/Quarantine.h"
 
-// Looks at the text index of one protection class while no daemon runs on it:
+// Looks at the text index of one protection class while no daemon runs on it, or purges the class:
 //
-//   tallow-inspect dump|validate STATE_DIRECTORY CLASS
+//   tallow-inspect dump|validate|estimate-purge|purge STATE_DIRECTORY CLASS
 //
-// Changes nothing. The result goes to the standard output: the dump as it is, control characters of
-// mail included, and the outcome of the validation as JSON; tallow(1), which runs this program,
-// makes both fit for people. What validation finds is logged to the standard error.
+// All but the last change nothing. The result goes to the standard output: the dump as it is,
+// control characters of mail included, and the outcome of the others as JSON; tallow(1), which runs
+// this program, makes both fit for people. What validation finds is logged to the standard error.
 namespace {
 
 enum ExitStatus : int { kDone = 0, kNotValid = 1, kFailure = 2, kInUse = 3 };
@@ -69,16 +72,43 @@ std::unique_ptr<salt::Inspection> capture(const std::string& state,
       platform::textIndexPath(platform::dataRoot(state), protectionClass), error);
 }
 
-bool isInUse(const TLError& error) {
-  return error.domain == kPOSIXErrorDomain && error.code == EWOULDBLOCK;
+int complainOf(const TLError& error) {
+  if (error.domain != kPOSIXErrorDomain || error.code != EWOULDBLOCK)
+    return complain(error.message);
+  return complain(error.message + "; stop it first", kInUse);
+}
+
+// Tells what is being done, where somebody may look.
+void tellStep(const char* step) {
+  static const bool shown = isatty(STDERR_FILENO) == 1;
+  static const char* last = nullptr;
+  if (shown && step != last) fmt::print(stderr, "{} ...\n", step);
+  last = step;
+}
+
+int purge(const std::string& state, const std::string& protectionClass, bool estimate) {
+  constexpr mode_t kPrivateUmask = 0077;  // as the daemon's
+  umask(kPrivateUmask);
+  std::optional<TLError> error;
+  const auto report = estimate ? inspect::estimatePurge(state, protectionClass, &error)
+                               : inspect::purge(state, protectionClass, tellStep, &error);
+  if (!report) return complainOf(*error);
+  const nlohmann::ordered_json outcome{{"estimate", estimate},
+                                       {"documents", report->documents},
+                                       {"bytesBefore", report->bytesBefore},
+                                       {"bytesAfter", report->bytesAfter},
+                                       {"damagedIndexRemoved", !estimate && report->hadSetAside}};
+  return write(outcome.dump() + '\n') && std::fflush(stdout) == 0 ? kDone : kFailure;
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
   const std::string_view command = argc == 4 ? argv[1] : "";
-  if (command != "dump" && command != "validate") {
-    return complain("usage: tallow-inspect dump|validate STATE_DIRECTORY CLASS");
+  const bool purges = command == "purge" || command == "estimate-purge";
+  if (command != "dump" && command != "validate" && !purges) {
+    return complain(
+        "usage: tallow-inspect dump|validate|estimate-purge|purge STATE_DIRECTORY CLASS");
   }
   const std::string state = argv[2];
   const std::string protectionClass = argv[3];
@@ -86,12 +116,10 @@ int main(int argc, char** argv) {
     return complain("a protection class must name one directory");
   }
   platform::raiseDescriptorLimit();
+  if (purges) return purge(state, protectionClass, command != "purge");
   std::optional<TLError> error;
   const auto inspection = capture(state, protectionClass, &error);
-  if (inspection == nullptr) {
-    if (!isInUse(*error)) return complain(error->message);
-    return complain(error->message + "; stop it first", kInUse);
-  }
+  if (inspection == nullptr) return complainOf(*error);
   if (command == "dump") return dump(*inspection);
   const std::string index = platform::textIndexPath(platform::dataRoot(state), protectionClass);
   for (const std::string& aside : salt::indexesSetAside(index)) {

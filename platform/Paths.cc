@@ -51,6 +51,10 @@ std::string dataRoot(const std::string& state) {
   return joinPath(state, "TallowSearch");
 }
 
+std::string purgeDirectory(const std::string& state) {
+  return joinPath(state, "purging");
+}
+
 std::string synonymFilePath() {
   return joinPath(stateDirectory(), "TALLOW/en_synonyms.txt");
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -82,14 +83,17 @@ class RPCArguments {
   size_t _next = 0;
 };
 
-// One value of a reply, by D-Bus type: s, b, ay (Bytes), aay and a{sv} (Dictionary).
+// One value of a reply, by D-Bus type: s, b, ay (Bytes), aay, a{sv} (Dictionary) and a(sss)
+// (TextRows).
 struct RPCBytes {
   std::string bytes;
 };
 using RPCBytesArray = std::vector<std::string>;
 using RPCNumber = std::variant<int64_t, uint64_t, double>;
 using RPCDictionary = std::vector<std::pair<std::string, RPCNumber>>;
-using RPCValue = std::variant<std::string, bool, RPCBytes, RPCBytesArray, RPCDictionary>;
+using RPCTextRows = std::vector<std::array<std::string, 3>>;
+using RPCValue =
+    std::variant<std::string, bool, RPCBytes, RPCBytesArray, RPCDictionary, RPCTextRows>;
 using RPCValues = std::vector<RPCValue>;
 
 // The promise of one reply. Any thread; the first call of either operation counts. A reply that is
@@ -114,23 +118,25 @@ struct RPCMethod {
   RPCHandler handler;
 };
 
-// The list of operations that a connection exports.
+// A list of operations that a connection exports under one interface name.
 struct RPCInterface {
   std::vector<RPCMethod> methods;
+  std::string name = {};  // the name of the service where empty
 };
 
-// What a delegate sees of a new connection before it serves. The interface must outlive the
-// listener.
+// What a delegate sees of a new connection before it serves.
 class RPCConnection {
  public:
   virtual ~RPCConnection() = default;
   [[nodiscard]] virtual const std::string& serviceName() const = 0;
   [[nodiscard]] virtual std::string description() const = 0;
-  virtual void setExportedInterface(const RPCInterface* interface) = 0;
+  // The connection keeps its interfaces for as long as it lives, so that a handler may hold state
+  // of its connection; that is used on the connection's thread only. Names differ.
+  virtual void addExportedInterface(RPCInterface interface) = 0;
 };
 
 // The socket of one service: SERVICE in the runtime directory, mode 0600, or handed over by systemd
-// under that name. Object path and interface name derive from the service name.
+// under that name. The object path derives from the service name.
 class RPCListener {
  public:
   // Decides over a connection whose peer has passed the check of its credentials.

@@ -131,6 +131,11 @@ RPCServerConnection::~RPCServerConnection() {
   if (_thread.joinable()) _thread.join();
 }
 
+void RPCServerConnection::addExportedInterface(RPCInterface interface) {
+  if (interface.name.empty()) interface.name = _serviceName;
+  _interfaces.push_back(std::move(interface));
+}
+
 bool RPCServerConnection::open(std::function<void()> ended) {
   _ended = std::move(ended);
   _loop = std::make_unique<RunLoop>();
@@ -168,7 +173,7 @@ void RPCServerConnection::evict() {
 
 void RPCServerConnection::serve() {
   _outbox->begin();
-  if (openBus() && exportInterface()) {
+  if (openBus() && exportInterfaces()) {
     _loop->run();
   } else {
     log().error("Could not serve connection {}", description());
@@ -218,15 +223,20 @@ bool RPCServerConnection::openBus() {
   return _source != nullptr && _authenticationTimer != nullptr;
 }
 
-bool RPCServerConnection::exportInterface() {
+bool RPCServerConnection::exportInterfaces() {
+  return std::all_of(_interfaces.begin(), _interfaces.end(),
+                     [this](const RPCInterface& interface) { return exportInterface(interface); });
+}
+
+bool RPCServerConnection::exportInterface(const RPCInterface& interface) {
+  std::vector<sd_bus_vtable> vtable;
   sd_bus_vtable start{};
   start.type = _SD_BUS_VTABLE_START;
   start.x.start.element_size = sizeof(sd_bus_vtable);
   start.x.start.features = _SD_BUS_VTABLE_PARAM_NAMES;
   start.x.start.vtable_format_reference = &sd_bus_object_vtable_format;
-  _vtable.push_back(start);
-  _vtableNames.reserve(_interface->methods.size());
-  for (const RPCMethod& method : _interface->methods) {
+  vtable.push_back(start);
+  for (const RPCMethod& method : interface.methods) {
     std::string names;
     for (const char* name : method.argumentNames) names.append(name).push_back('\0');
     _vtableNames.push_back(std::move(names));
@@ -238,14 +248,15 @@ bool RPCServerConnection::exportInterface() {
     entry.x.method.result = method.outputSignature;
     entry.x.method.handler = onMessage;
     entry.x.method.names = _vtableNames.back().c_str();
-    _vtable.push_back(entry);
+    vtable.push_back(entry);
   }
   sd_bus_vtable end{};
   end.type = _SD_BUS_VTABLE_END;
-  _vtable.push_back(end);
+  vtable.push_back(end);
+  _vtables.push_back(std::move(vtable));
   const int result = sd_bus_add_object_vtable(_bus, nullptr, objectPath(_serviceName).c_str(),
-                                              _serviceName.c_str(), _vtable.data(), this);
-  if (result < 0) log().error("Could not export {}: {}", _serviceName, std::strerror(-result));
+                                              interface.name.c_str(), _vtables.back().data(), this);
+  if (result < 0) log().error("Could not export {}: {}", interface.name, std::strerror(-result));
   return result >= 0;
 }
 
@@ -384,13 +395,23 @@ int RPCServerConnection::onMessage(sd_bus_message* message, void* data, sd_bus_e
   return static_cast<RPCServerConnection*>(data)->dispatch(message);
 }
 
-int RPCServerConnection::dispatch(sd_bus_message* message) {
+const RPCMethod* RPCServerConnection::methodOf(sd_bus_message* message) const {
+  const char* const name = sd_bus_message_get_interface(message);
   const char* const member = sd_bus_message_get_member(message);
-  const auto method =
-      std::find_if(_interface->methods.begin(), _interface->methods.end(), [&](const RPCMethod& m) {
-        return member != nullptr && std::string_view(member) == m.member;
-      });
-  if (method == _interface->methods.end()) return 0;
+  if (name == nullptr || member == nullptr) return nullptr;
+  for (const RPCInterface& interface : _interfaces) {
+    if (interface.name != name) continue;
+    for (const RPCMethod& method : interface.methods) {
+      if (std::string_view(member) == method.member) return &method;
+    }
+  }
+  return nullptr;
+}
+
+int RPCServerConnection::dispatch(sd_bus_message* message) {
+  const RPCMethod* const method = methodOf(message);
+  if (method == nullptr) return 0;
+  const char* const member = method->member;
   try {
     auto values = readArguments(message, method->inputSignature);
     if (!values) {

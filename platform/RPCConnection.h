@@ -3,6 +3,7 @@
 #include <systemd/sd-bus.h>
 
 #include <atomic>
+#include <deque>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -51,7 +52,7 @@ class RPCServerConnection : public RPCConnection {
 
   [[nodiscard]] const std::string& serviceName() const override { return _serviceName; }
   [[nodiscard]] std::string description() const override { return _serviceName + " " + _peer; }
-  void setExportedInterface(const RPCInterface* interface) override { _interface = interface; }
+  void addExportedInterface(RPCInterface interface) override;
 
   // Starts the thread; `ended` is called on it as the last thing that it does. False when the
   // system has no thread, descriptors or memory for it.
@@ -83,7 +84,10 @@ class RPCServerConnection : public RPCConnection {
   using BuildReply = std::function<int(sd_bus_message* call, sd_bus_message** reply)>;
 
   bool openBus();
-  bool exportInterface();
+  bool exportInterfaces();
+  bool exportInterface(const RPCInterface& interface);
+  // The operation that a message calls; null for none.
+  [[nodiscard]] const RPCMethod* methodOf(sd_bus_message* message) const;
 
   void onSocket(bool peerGone);
   // Passes on what the peer has sent, as far as calls in flight and room allow.
@@ -113,7 +117,7 @@ class RPCServerConnection : public RPCConnection {
 
   const std::string _serviceName;
   const std::string _peer;
-  const RPCInterface* _interface = nullptr;
+  std::vector<RPCInterface> _interfaces;  // fixed once it serves
   std::function<void()> _ended;
 
   FileDescriptor _socket;
@@ -121,8 +125,8 @@ class RPCServerConnection : public RPCConnection {
   std::unique_ptr<RunLoop> _loop;
   const std::shared_ptr<RPCOutbox> _outbox = std::make_shared<RPCOutbox>();  // self-synchronised
   sd_bus* _bus = nullptr;
-  std::vector<sd_bus_vtable> _vtable;
-  std::vector<std::string> _vtableNames;
+  std::vector<std::vector<sd_bus_vtable>> _vtables;  // the bus points into these and the names
+  std::deque<std::string> _vtableNames;
   std::unique_ptr<RunLoop::Socket> _source;
   std::unique_ptr<RunLoop::Source> _authenticationTimer;
   std::unique_ptr<RunLoop::Source> _progressTimer;

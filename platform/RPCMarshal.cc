@@ -119,6 +119,15 @@ struct Append {
     for (size_t i = 0; i < values.size() && result >= 0; ++i) result = appendEntry(values[i]);
     return result < 0 ? result : sd_bus_message_close_container(message);
   }
+  int operator()(const RPCTextRows& rows) const {
+    int result = sd_bus_message_open_container(message, 'a', "(sss)");
+    for (size_t i = 0; i < rows.size() && result >= 0; ++i) {
+      const auto& row = rows[i];
+      result = sd_bus_message_append(message, "(sss)", carriedText(row[0]).c_str(),
+                                     carriedText(row[1]).c_str(), carriedText(row[2]).c_str());
+    }
+    return result < 0 ? result : sd_bus_message_close_container(message);
+  }
 
  private:
   int appendBytes(const std::string& bytes) const {
@@ -154,6 +163,8 @@ size_t sizeOf(const RPCValues& values) {
       bytes += text->size();
     } else if (const auto* single = std::get_if<RPCBytes>(&value)) {
       bytes += single->bytes.size();
+    } else if (const auto* rows = std::get_if<RPCTextRows>(&value)) {
+      for (const auto& row : *rows) bytes += row[0].size() + row[1].size() + row[2].size();
     }
   }
   return bytes;

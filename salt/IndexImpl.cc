@@ -259,9 +259,8 @@ void index::ResetScanMetrics() {
   metrics.ScanPageReads = 0;
 }
 
-void index::putMetrics(leveldb::WriteBatch* batch) const {
-  const MetricsBlock& block = metrics;
-  batch->Put(kMetricsKey, {reinterpret_cast<const char*>(&block), sizeof block});
+void putMetrics(const Index::MetricsBlock& metrics, leveldb::WriteBatch* batch) {
+  batch->Put(kMetricsKey, {reinterpret_cast<const char*>(&metrics), sizeof metrics});
 }
 
 bool index::write(leveldb::WriteBatch* batch) {

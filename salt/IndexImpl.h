@@ -40,6 +40,9 @@ inline constexpr char kDeletedKey[] =
     "\xFF"
     "DELETED";
 
+// Puts the record of the metrics.
+void putMetrics(const Index::MetricsBlock& metrics, leveldb::WriteBatch* batch);
+
 // 0xFF is the first byte of texts and named keys.
 inline constexpr uint8_t kMaxShardNumber = 0xFE;
 
@@ -164,7 +167,6 @@ class index final : public Index {
   template <typename Change>
   [[nodiscard]] bool commit(leveldb::WriteBatch* batch, bool movesSuffixes, const Change& change)
       TL_REQUIRES(_commitMutex) TL_EXCLUDES(_metricsMutex);
-  void putMetrics(leveldb::WriteBatch* batch) const TL_REQUIRES(_metricsMutex);
   [[nodiscard]] bool write(leveldb::WriteBatch* batch);
   // All but the counts of scans.
   void restore(const MetricsBlock& before) TL_REQUIRES(_metricsMutex);
@@ -269,7 +271,7 @@ bool index::commit(leveldb::WriteBatch* batch, bool movesSuffixes, const Change&
     platform::MutexLock lock(_metricsMutex);
     before = metrics;
     change(static_cast<MetricsBlock&>(metrics));
-    putMetrics(batch);
+    putMetrics(metrics, batch);
     if (movesSuffixes) ++_pageGeneration;
     _suffixesMove = movesSuffixes;
   }

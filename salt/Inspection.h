@@ -2,6 +2,7 @@
 
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -33,6 +34,23 @@ class Inspection {
   // The text of Index::Dump in pieces, once loaded. `sink` returns false to stop. False when it
   // did, or, with a log line, when reading failed.
   [[nodiscard]] bool dump(const std::function<bool(std::string_view)>& sink) const;
+
+  // What deleted documents still take. Reads all texts; null, with a log line, when that fails.
+  struct Deleted {
+    uint64_t documents = 0;
+    uint64_t textBytes = 0;     // of these
+    uint64_t allTextBytes = 0;  // of the index
+  };
+  [[nodiscard]] std::optional<Deleted> deleted() const;
+
+  // Once loaded, writes the index anew to the directory `to`, without any byte of the documents
+  // that are deleted or for which `isKept` is false: same answers, with nothing deleted. What was
+  // at `to` is removed. Calls `progress` after each batch. Gives the number of documents left out;
+  // none, with the error, when it failed: then nothing of use is at `to`. The copy is not synced.
+  [[nodiscard]] std::optional<uint64_t> copyLive(const std::string& to,
+                                                 const std::function<bool(uint32_t docID)>& isKept,
+                                                 const std::function<void()>& progress,
+                                                 TLErrorOut error) const;
 
  private:
   Inspection(std::string path, std::unique_ptr<FrozenFiles> files);

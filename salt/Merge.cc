@@ -5,17 +5,6 @@
 
 namespace salt {
 
-namespace {
-
-// The length of the common prefix of what is known of both, of which `from` bytes are equal.
-size_t commonPrefix(std::string_view left, std::string_view right, size_t from) {
-  const size_t limit = std::min(left.size(), right.size());
-  while (from < limit && left[from] == right[from]) ++from;
-  return from;
-}
-
-}  // namespace
-
 Merge::Merge(index& owner, uint8_t shard, bool hot)
     : _idx(owner),
       _shard(shard),
@@ -91,8 +80,8 @@ void Merge::take(ShardCursor* cursor, bool relateToPrevious) {
   _pending.push_back(suffix.meta);
   size_t lcp = suffix.meta.lcp;
   if (relateToPrevious) {
-    lcp = commonWithPrevious(&suffix);
-    if (_pending.size() > 1) relate(&suffix, lcp);
+    lcp = commonPrefix(&suffix, &_previous);
+    if (_pending.size() > 1) relate(&suffix, lcp, &_pending.back());
   }
   _postings.take(lcp, {suffix.meta.DocID, suffix.meta.ZoneID},
                  [this](size_t bytes) { return previousText(bytes); });
@@ -102,19 +91,6 @@ void Merge::take(ShardCursor* cursor, bool relateToPrevious) {
   cursor->next();
 }
 
-size_t Merge::commonWithPrevious(Suffix* suffix) {
-  for (size_t lcp = 0;;) {
-    lcp = commonPrefix(suffix->knownText(), _previous.knownText(), lcp);
-    if (lcp == suffix->size && !suffix->full) {
-      suffix->fetch();
-    } else if (lcp == _previous.size && !_previous.full) {
-      _previous.fetch();
-    } else {
-      return lcp;
-    }
-  }
-}
-
 std::string_view Merge::previousText(size_t bytes) {
   if (_previous.size < bytes) _previous.fetch();
   return _previous.knownText().substr(0, bytes);
@@ -122,14 +98,6 @@ std::string_view Merge::previousText(size_t bytes) {
 
 std::string Merge::postings(const PostingsOwner& owner) {
   return _postings.finish(owner, [this](size_t bytes) { return previousText(bytes); });
-}
-
-void Merge::relate(Suffix* suffix, size_t lcp) {
-  if (suffix->size < lcp + 2) suffix->fetch();
-  SuffixMeta& meta = _pending.back();
-  meta.lcp = static_cast<uint8_t>(lcp);
-  meta.extra[0] = byteAt(suffix->knownText(), lcp);
-  meta.extra[1] = byteAt(suffix->knownText(), lcp + 1);
 }
 
 std::string_view Merge::firstText() {

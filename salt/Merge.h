@@ -42,10 +42,6 @@ class Merge {
   // Appends the cursor's suffix to the pending ones.
   void take(ShardCursor* cursor, bool relateToPrevious);
 
-  // How many bytes the suffix shares with the latest one taken.
-  [[nodiscard]] size_t commonWithPrevious(Suffix* suffix);
-  // Sets common prefix and extra bytes of the latest pending entry, which is `suffix`.
-  void relate(Suffix* suffix, size_t lcp);
   // The first bytes of the latest one taken, which has that many.
   [[nodiscard]] std::string_view previousText(size_t bytes);
 

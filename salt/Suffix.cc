@@ -87,6 +87,29 @@ int Suffix::compareWithPrefix(std::string_view prefix) {
   }
 }
 
+size_t commonPrefix(Suffix* left, Suffix* right) {
+  for (size_t lcp = 0;;) {
+    const std::string_view l = left->knownText();
+    const std::string_view r = right->knownText();
+    const size_t limit = std::min(l.size(), r.size());
+    while (lcp < limit && l[lcp] == r[lcp]) ++lcp;
+    if (lcp == l.size() && !left->full) {
+      left->fetch();
+    } else if (lcp == r.size() && !right->full) {
+      right->fetch();
+    } else {
+      return lcp;
+    }
+  }
+}
+
+void relate(Suffix* suffix, size_t lcp, SuffixMeta* meta) {
+  if (suffix->size < lcp + 2) suffix->fetch();
+  meta->lcp = static_cast<uint8_t>(lcp);
+  meta->extra[0] = byteAt(suffix->knownText(), lcp);
+  meta->extra[1] = byteAt(suffix->knownText(), lcp + 1);
+}
+
 ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts,
                          size_t walk)
     : idx(view.idx),

@@ -55,6 +55,13 @@ class Suffix {
   std::string _zoneText;                // of the latest fetch; kept for its memory
 };
 
+// How many bytes the texts of both have in common. Fetches where what is known does not tell.
+[[nodiscard]] size_t commonPrefix(Suffix* left, Suffix* right);
+
+// Sets common prefix and extra bytes of `meta`, which is that of `suffix`, for a page in which the
+// suffix follows one that it shares `lcp` bytes with.
+void relate(Suffix* suffix, size_t lcp, SuffixMeta* meta);
+
 // A walk over the suffixes of one shard at a time, in order, with an iterator of a view. One
 // thread. The view outlives it, and so do `zoneTexts`, which walks that complete many suffixes
 // give.

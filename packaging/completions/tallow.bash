@@ -3,7 +3,7 @@
 _tallow() {
   local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
   local commands='index sync status search explain delete reset stats metrics ping vacuum state dump
-    validate help'
+    validate purge help'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
     --verbose --dry-run --prune-missing --retry --query --filter --param --offset --sort --count
     --print0 --help --version'

@@ -17,6 +17,7 @@ commands=(
   'state:show the state of a client'
   'dump:print the text index, while no daemon runs'
   'validate:check the text index, while no daemon runs'
+  'purge:remove what was deleted from the disk, while no daemon runs'
   'help:show how a command is used'
 )
 options=(
@@ -37,7 +38,7 @@ options=(
   '--param=[parameters of this search]:KEY=VALUE,...:'
   '(-y --yes)'{-y,--yes}'[do not ask]'
   '(-v --verbose)'{-v,--verbose}'[name what was cut or ignored]'
-  '(-n --dry-run)'{-n,--dry-run}'[only tell what sync would do]'
+  '(-n --dry-run)'{-n,--dry-run}'[only tell what sync or purge would do]'
   '--prune-missing[delete the mail of directories that are not there]'
   '--retry[try again what could not be indexed]'
   '(-h --help)'{-h,--help}'[show help]'

@@ -2,6 +2,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -51,9 +52,13 @@ class CommandsTest : public testing::Test {
 
   // The query of the last search that reached the daemon.
   [[nodiscard]] std::shared_ptr<TLQuery> lastQuery() const {
-    const std::string call = daemon.calls().back();
     const std::string begin = "SearchItemsForQuery(<";
-    EXPECT_TRUE(call.starts_with(begin));
+    const auto calls = daemon.calls();
+    const auto last = std::find_if(calls.rbegin(), calls.rend(), [&begin](const std::string& one) {
+      return one.starts_with(begin);
+    });
+    EXPECT_NE(last, calls.rend());
+    const std::string call = last == calls.rend() ? begin : *last;
     auto query = std::make_shared<TLQuery>();
     EXPECT_TRUE(query->initWithData(call.substr(begin.size(), call.rfind(">, ") - begin.size())));
     return query;
@@ -129,6 +134,7 @@ TEST_F(CommandsTest, WhatIsNotOnlyWordsBecomesSearches) {
   EXPECT_EQ(run({"search", "tea", "-milk", "-sugar", "date:2024"}), ExitStatus::nothingFound);
   EXPECT_EQ(daemon.calls().size(), before + 5);
   EXPECT_EQ(run({"search", "tea", "date:2024"}), ExitStatus::done);
+  EXPECT_EQ(errors, "");
   EXPECT_EQ(run({"search", "tea", "date:2023"}), ExitStatus::nothingFound);
   EXPECT_EQ(run({"search", "\"open", "is:blue", "date:2024"}), ExitStatus::done);
   EXPECT_EQ(errors,
@@ -251,6 +257,20 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
   EXPECT_EQ(json[1]["date"], 1704700800.0);
   EXPECT_EQ(json[1]["from"][0]["emailAddress"], "billing@example.org");
   EXPECT_EQ(output.find('\x1b'), std::string::npos);
+
+  EXPECT_EQ(answer["changed"], nlohmann::json::array());
+
+  daemon.answer("FetchReplacedWords", [](platform::RPCReply& reply) {
+    reply.send(
+        {platform::RPCTextRows{{"invocie", "inv\x1b", "spelling"}, {"dues", "due", "stem"}}});
+  });
+  EXPECT_EQ(run({"search", "--format", "json", "invocie dues"}), ExitStatus::done);
+  EXPECT_EQ(errors, "tallow: showing results for inv\uFFFD, due...\n");
+  EXPECT_EQ(nlohmann::json::parse(output)["changed"][1],
+            nlohmann::json::parse(R"({"typed": "dues", "replacement": "due", "reason": "stem"})"));
+  daemon.failOnce("FetchReplacedWords", {"X", 1, "an old daemon"});
+  EXPECT_EQ(run({"search", "invo"}), ExitStatus::done);
+  EXPECT_EQ(errors, "");
 
   EXPECT_EQ(run({"explain", "invo"}), ExitStatus::done);
   EXPECT_THAT(

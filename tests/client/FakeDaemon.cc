@@ -45,6 +45,8 @@ FakeDaemon::FakeDaemon() {
   addMethod(_search, "DeleteItemsWithDomainIdentifiers", "asss", "", {});
   addMethod(_search, "DeleteAllItems", "ss", "", {});
   addMethod(_search, "SearchItemsForQuery", "aytsx", "aay", {platform::RPCBytesArray{}});
+  _explanation.name = "com.quill.tallowsearch.SearchExplanation";
+  addMethod(_explanation, "FetchReplacedWords", "", "a(sss)", {platform::RPCTextRows{}});
   addMethod(_debug, "Ping", "s", "s", {std::string("pong")});
   addMethod(_debug, "FetchStatsForIndexer", "ss", "a{sv}", {platform::RPCDictionary{}});
   addMethod(_debug, "FetchStatsForSalt", "ss", "s", {std::string("metrics")});
@@ -52,10 +54,12 @@ FakeDaemon::FakeDaemon() {
   for (auto [name, interface] : {std::pair("com.quill.tallowsearch.SearchService", &_search),
                                  std::pair("com.quill.tallow.DebugService", &_debug)}) {
     auto listener = platform::makeRPCListener(_loop, _directory.path(), name);
-    listener->setDelegate([interface = interface](auto&, platform::RPCConnection& connection) {
-      connection.setExportedInterface(interface);
-      return true;
-    });
+    listener->setDelegate(
+        [this, interface = interface](auto&, platform::RPCConnection& connection) {
+          connection.addExportedInterface(*interface);
+          if (interface == &_search) connection.addExportedInterface(_explanation);
+          return true;
+        });
     std::optional<TLError> error;
     EXPECT_TRUE(listener->resume(&error)) << platform::printable(error);
     _listeners.push_back(std::move(listener));

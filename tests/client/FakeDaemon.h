@@ -51,6 +51,7 @@ class FakeDaemon {
 
   TemporaryDirectory _directory;
   platform::RPCInterface _search;
+  platform::RPCInterface _explanation;
   platform::RPCInterface _debug;
   mutable platform::Mutex _mutex;
   std::map<std::string, Answer> _answers TL_GUARDED_BY(_mutex);

@@ -72,6 +72,7 @@ std::string queryOfDepth(size_t depth) {
 std::set<std::string> members(const std::string& xml, const std::string& interface) {
   std::set<std::string> out;
   const size_t from = xml.find("<interface name=\"" + interface + "\"");
+  if (from == std::string::npos) return out;
   const std::string body = xml.substr(from, xml.find("</interface>", from) - from);
   const std::regex method("<method name=\"(\\w+)\">([\\s\\S]*?)</method>");
   const std::regex argument("<arg ([^>]*)>");
@@ -359,6 +360,10 @@ TEST_F(DaemonProcessTest, TheInterfacesAreThoseOfTheirFiles) {
     ASSERT_TRUE(file) << name;
     const auto expected = members(*file, name);
     EXPECT_GE(expected.size(), 4u);
-    EXPECT_EQ(members(introspect(daemon.socketOf(name), path), name), expected);
+    const std::string served = introspect(daemon.socketOf(name), path);
+    EXPECT_EQ(members(served, name), expected);
+    const auto beside = members(*file, client::kSearchExplanationName);
+    EXPECT_EQ(beside.size(), name == client::kSearchServiceName ? 1u : 0u);
+    EXPECT_EQ(members(served, client::kSearchExplanationName), beside);
   }
 }

@@ -73,10 +73,10 @@ class Client {
   }
 
   // The text of the reply, or the name of the error.
-  std::string echo(const std::string& text) const {
+  std::string echo(const std::string& text, const char* interface = kService) const {
     sd_bus_error error{};
     sd_bus_message* reply = nullptr;
-    sd_bus_call_method(bus, nullptr, kPath, kService, "Echo", &error, &reply, "s", text.c_str());
+    sd_bus_call_method(bus, nullptr, kPath, interface, "Echo", &error, &reply, "s", text.c_str());
     const char* result = error.name;
     if (reply != nullptr) sd_bus_message_read(reply, "s", &result);
     std::string answer = result == nullptr ? "" : result;
@@ -134,7 +134,8 @@ class RPCTest : public testing::Test {
          }});
     listener = platform::makeRPCListener(loop, directory.path(), kService);
     listener->setDelegate([this](platform::RPCListener& l, platform::RPCConnection& connection) {
-      connection.setExportedInterface(&interface);
+      connection.addExportedInterface(interface);
+      for (const auto& other : interfaces) connection.addExportedInterface(other);
       return l.serviceName() == connection.serviceName();
     });
     std::optional<TLError> error;
@@ -169,6 +170,7 @@ class RPCTest : public testing::Test {
   std::promise<std::shared_ptr<platform::RPCReply>> held;
   std::vector<std::shared_ptr<platform::RPCReply>> replies;
   platform::RPCInterface interface;
+  std::vector<platform::RPCInterface> interfaces;  // beside it, set before a client connects
   platform::RunLoop loop;
   std::unique_ptr<platform::RPCListener> listener;
   std::thread thread;
@@ -191,6 +193,34 @@ TEST_F(RPCTest, AnswersAndReportsErrorsByName) {
   EXPECT_STREQ(error.name, platform::kRPCInvalidArgs);
   sd_bus_error_free(&error);
   EXPECT_EQ(client.echo("still here"), "still here");
+}
+
+TEST_F(RPCTest, AMemberIsThatOfItsInterface) {
+  interfaces.push_back(
+      {{{"Echo", "s", "s", {}, [](platform::RPCArguments&, auto reply) { reply->send({"other"}); }},
+        {"Row",
+         "",
+         "a(sss)",
+         {},
+         [](platform::RPCArguments&, auto reply) {
+           reply->send({platform::RPCTextRows{{"a", "b\xFF", std::string("\0", 1)}, {"", "", ""}}});
+         }}},
+       "org.example.Other"});
+  const Client client(path());
+  EXPECT_EQ(client.echo("x"), "x");
+  EXPECT_EQ(client.echo("x", "org.example.Other"), "other");
+  EXPECT_EQ(client.echo("x", "org.example.Third"), SD_BUS_ERROR_UNKNOWN_METHOD);
+  sd_bus_message* reply = nullptr;
+  ASSERT_GE(sd_bus_call_method(client.bus, nullptr, kPath, "org.example.Other", "Row", nullptr,
+                               &reply, ""),
+            0);
+  const char *a = nullptr, *b = nullptr, *c = nullptr;
+  EXPECT_GT(sd_bus_message_enter_container(reply, 'a', "(sss)"), 0);
+  EXPECT_GT(sd_bus_message_read(reply, "(sss)", &a, &b, &c), 0);
+  EXPECT_EQ(fmt::format("{} {} {}", a, b, c), "a b\uFFFD \uFFFD");
+  EXPECT_GT(sd_bus_message_read(reply, "(sss)", &a, &b, &c), 0);
+  EXPECT_EQ(sd_bus_message_read(reply, "(sss)", &a, &b, &c), 0);
+  sd_bus_message_unref(reply);
 }
 
 TEST_F(RPCTest, TheSocketIsPrivateAndALiveOneIsNotReplaced) {

@@ -47,7 +47,7 @@ StoringDaemon::StoringDaemon() {
   _listener =
       platform::makeRPCListener(_loop, _directory.path(), "com.quill.tallowsearch.SearchService");
   _listener->setDelegate([this](auto&, platform::RPCConnection& connection) {
-    connection.setExportedInterface(&_interface);
+    connection.addExportedInterface(_interface);
     return true;
   });
   std::optional<TLError> error;
