@@ -33,7 +33,8 @@ enum class Command {
   dump,
   validate,
   sync,
-  status
+  status,
+  watch
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };
@@ -48,6 +49,7 @@ struct Options {
   std::string runtimeDirectory;
   std::string stateDirectory;  // empty: where the daemon has it by itself
   std::string protectionClass = "default";
+  bool classGiven = false;  // by the user
   std::string name = "tallow";
   OutputFormat format = OutputFormat::text;
   ColorMode color = ColorMode::automatic;
@@ -64,6 +66,9 @@ struct Options {
   bool dryRun = false;
   bool pruneMissing = false;
   bool retryFailed = false;
+
+  // Of watch.
+  bool onBattery = false;  // large backlogs do not wait for power
 
   [[nodiscard]] std::chrono::milliseconds patience() const {
     return std::chrono::milliseconds(static_cast<int64_t>(waitSeconds * 1000));

@@ -202,7 +202,11 @@ class Run {
       const auto root = std::find_if(roots.begin(), roots.end(), [&](const std::string& path) {
         return isAtOrBelow(place, path);
       });
-      if (root != roots.end()) scanner.rescan(place, *root);
+      if (root != roots.end()) {
+        scanner.rescan(place, *root);
+      } else if (scanner.scan(place)) {
+        _catalogue->addRoot(place);
+      }
     }
   }
 

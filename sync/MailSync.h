@@ -69,7 +69,8 @@ bool syncMail(const SyncSettings& settings, const std::vector<std::string>& path
               const SyncObserver& observer, SyncReport& report, TLErrorOut error);
 
 // As above, of single directories at or below roots of the catalogue, and of roots: only these are
-// looked into (see MailboxScan::rescan). Without any, what waits is sent.
+// looked into (see MailboxScan::rescan). A place that is below no root becomes one where it is
+// there. Without any place, what waits is sent.
 bool syncPlaces(const SyncSettings& settings, const std::vector<std::string>& places,
                 const SyncObserver& observer, SyncReport& report, TLErrorOut error);
 
