@@ -121,6 +121,7 @@ std::vector<std::string> MailboxScan::missing() const {
 // --- Directories
 
 void MailboxScan::scanDirectory(const Place& place, std::vector<Place>& pending) {
+  if (!_visited.insert(place.path).second) return;
   if (excluded(place.path)) return removeTree(place.path);
   if (_settings.entering) _settings.entering(place.path);
   struct stat info {};

@@ -117,6 +117,7 @@ class MailboxScan {
   std::map<std::string, DirectoryRow> _directories;  // by path
   std::map<int64_t, std::string> _paths;             // of directories
   std::map<int64_t, std::vector<std::string>> _children;
+  std::set<std::string> _visited;  // directories; each is listed once
   std::vector<Arrival> _arrivals;
   std::unordered_set<int64_t> _departures;         // file IDs
   std::set<std::string, std::greater<>> _missing;  // directories, those below others first
