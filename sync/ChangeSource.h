@@ -16,6 +16,7 @@ struct Change {
   Kind kind = Kind::entry;
   std::string directory;  // as it was given to `watch`
   std::string name;
+  bool isDirectory = false;  // the entry
 };
 
 // Tells of changes in single directories, not in those below them. One thread.

@@ -65,7 +65,7 @@ std::vector<Change> DirectoryWatch::read() {
 
 void DirectoryWatch::take(const inotify_event& event, std::vector<Change>& changes) {
   if ((event.mask & IN_Q_OVERFLOW) != 0) {
-    changes.push_back({Change::Kind::lost, "", ""});
+    changes.push_back({Change::Kind::lost, "", "", false});
     return;
   }
   const auto known = _directories.find(event.wd);
@@ -74,7 +74,8 @@ void DirectoryWatch::take(const inotify_event& event, std::vector<Change>& chang
   const std::string name = event.len > 0 ? event.name : "";
   const bool self = (event.mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_UNMOUNT | IN_IGNORED)) != 0;
   if ((event.mask & IN_IGNORED) != 0) drop(event.wd);
-  changes.push_back({self ? Change::Kind::self : Change::Kind::entry, directory, name});
+  changes.push_back({self ? Change::Kind::self : Change::Kind::entry, directory, name,
+                     (event.mask & IN_ISDIR) != 0});
 }
 
 }  // namespace mailsync

@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <utility>
 
+#include "cli/Identifier.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
 
@@ -21,8 +22,12 @@ std::string above(const std::string& path) {
 }
 
 // Files that mail programs keep beside mail and write at each access, so that looking each time
-// would be for nothing.
-bool isNoMail(const std::string& name) {
+// would be for nothing. Folders and messages may have such names.
+bool isNoMail(const Change& change) {
+  const std::string& name = change.name;
+  if (change.isDirectory || cli::isMaildirFile(platform::joinPath(change.directory, name))) {
+    return false;
+  }
   for (const char* const start : {"dovecot", ".mbsyncstate", ".uidvalidity", ".isyncuidmap"}) {
     if (name.starts_with(start)) return true;
   }
@@ -76,10 +81,11 @@ void MailWatch::take(const Change& change, Time now) {
       change.name == client::kSearchServiceName) {
     _plan.retry(now);
   }
-  const std::string entry = platform::joinPath(change.directory, change.name);
+  const std::string entry =
+      change.name.empty() ? change.directory : platform::joinPath(change.directory, change.name);
   for (const std::string& root : _settings.roots) {
     const bool inside = isAtOrBelow(change.directory, root);
-    if (inside && !isNoMail(change.name)) _plan.changed(change.directory, now);
+    if (inside && !isNoMail(change)) _plan.changed(change.directory, now);
     if (!inside && isAtOrBelow(root, entry)) _plan.changed(root, now);
   }
 }

@@ -86,7 +86,7 @@ class MailWatchTest : public testing::Test {
     watch->turn(now);
   }
   void tell(const std::string& place, const std::string& name) {
-    source->changes.push_back({Change::Kind::entry, place, name});
+    source->changes.push_back({Change::Kind::entry, place, name, false});
     pass(std::chrono::seconds(1));
     pass(std::chrono::seconds(1));
   }
@@ -114,17 +114,26 @@ TEST_F(MailWatchTest, LooksOnlyIntoWhatHasChanged) {
   tell(mail + "/a/new", "1");
   EXPECT_EQ(indexed(), 1U);
   EXPECT_EQ(entered, 1U);
-  // What programs keep beside mail wakes nobody.
-  tell(mail + "/b/new", "dovecot-uidlist.lock");
+  // What programs keep beside mail wakes nobody; a folder of such a name does.
+  makeFolder("dovecot");
+  add("dovecot/new/3.lock");
+  tell(mail, "dovecot-uidlist.lock");
+  EXPECT_EQ(indexed(), 1U);
+  source->changes.push_back({Change::Kind::entry, mail, "dovecot", true});
+  pass(std::chrono::seconds(1));
+  pass(std::chrono::seconds(1));
+  EXPECT_EQ(indexed(), 2U);
+  fs::remove(mail + "/dovecot/new/3.lock");
+  tell(mail + "/dovecot/new", "3.lock");
   EXPECT_EQ(indexed(), 1U);
   // A folder that is new, from the inside out.
   makeFolder("b/c");
   add("b/c/cur/3:2,S");
-  source->changes.push_back({Change::Kind::entry, mail + "/b/c", "cur"});
+  source->changes.push_back({Change::Kind::entry, mail + "/b/c", "cur", true});
   tell(mail + "/b", "c");
   EXPECT_EQ(indexed(), 2U);
   EXPECT_THAT(source->watched, Contains(mail + "/b/c/cur"));
-  source->changes.push_back({Change::Kind::lost, "", ""});
+  source->changes.push_back({Change::Kind::lost, "", "", false});
   pass(std::chrono::seconds(1));
   pass(std::chrono::seconds(1));
   EXPECT_EQ(indexed(), 3U);
