@@ -158,9 +158,10 @@ struct CommandFunction {
   Run run;
 };
 
-constexpr std::array<CommandFunction, 15> kFunctions{{
+constexpr std::array<CommandFunction, 16> kFunctions{{
     {Command::index, runIndex},
     {Command::sync, runSync},
+    {Command::watch, runWatch},
     {Command::status, runStatus},
     {Command::search, runSearch},
     {Command::explain, runExplain},

@@ -16,6 +16,7 @@ namespace cli {
 
 // Of runCommand, those that keep the index in step with mailboxes.
 [[nodiscard]] ExitStatus runSync(const Options& options);
+[[nodiscard]] ExitStatus runWatch(const Options& options);
 [[nodiscard]] ExitStatus runStatus(const Options& options);
 
 // Of runCommand, those that search.

@@ -25,11 +25,12 @@ struct CommandRow {
   bool operandsRequired;
 };
 
-constexpr std::array<CommandRow, 15> kCommands{{
+constexpr std::array<CommandRow, 16> kCommands{{
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
     {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
      "PATH", false},
+    {Command::watch, "watch", "Keep the index in step with mailboxes all the time", "PATH", false},
     {Command::status, "status", "Show mailboxes and index: what is indexed, waits or has failed",
      nullptr, false},
     {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
@@ -132,6 +133,9 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (row.command == Command::sync) addSyncOptions(*sub, options);
   if (row.command == Command::purge) {
     sub->add_flag("-n,--dry-run", options.dryRun, "Only tell how much it would give back");
+  }
+  if (row.command == Command::watch) {
+    sub->add_flag("--on-battery", options.onBattery, "Do not wait for power with much mail");
   }
   sub->callback([&options, command = row.command] { options.command = command; });
 }
@@ -244,6 +248,7 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
     std::reverse(arguments.begin(), arguments.end());
     app.parse(std::move(arguments));
     restoreWords(options.arguments);
+    options.classGiven = app.count("--class") > 0;
   } catch (const CLI::ParseError& error) {
     const std::string word = unknownCommand(app);
     if (error.get_exit_code() != 0 && !word.empty()) {

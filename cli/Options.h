@@ -34,7 +34,8 @@ enum class Command {
   validate,
   sync,
   status,
-  purge
+  purge,
+  watch
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };
@@ -49,6 +50,7 @@ struct Options {
   std::string runtimeDirectory;
   std::string stateDirectory;  // empty: where the daemon has it by itself
   std::string protectionClass = "default";
+  bool classGiven = false;  // by the user
   std::string name = "tallow";
   OutputFormat format = OutputFormat::text;
   ColorMode color = ColorMode::automatic;
@@ -65,6 +67,9 @@ struct Options {
   bool dryRun = false;
   bool pruneMissing = false;
   bool retryFailed = false;
+
+  // Of watch.
+  bool onBattery = false;  // large backlogs do not wait for power
 
   [[nodiscard]] std::chrono::milliseconds patience() const {
     return std::chrono::milliseconds(static_cast<int64_t>(waitSeconds * 1000));

@@ -4,14 +4,11 @@
 
 #include <atomic>
 #include <csignal>
-#include <cstdlib>
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
 #include "cli/ProgressBar.h"
 #include "cli/Results.h"
-#include "platform/Files.h"
-#include "platform/Paths.h"
 
 namespace cli {
 
@@ -58,21 +55,42 @@ nlohmann::json jsonOf(const mailsync::SyncReport& report) {
           {"interrupted", report.cancelled}};
 }
 
-// The paths of the command line, those of the last time, or the usual ones.
-std::vector<std::string> mailboxesOf(const Options& options,
-                                     const mailsync::SyncSettings& settings) {
-  if (!options.arguments.empty()) return options.arguments;
-  const auto catalogue = mailsync::openCatalogue(settings, nullptr);
-  if (catalogue != nullptr && !catalogue->roots().empty()) return {};
-  std::vector<std::string> usual = usualMailboxes();
-  for (const std::string& path : usual) complain("found " + path);
-  return usual;
-}
+// The run of one class.
+struct GroupRun {
+  bool done = false;  // to its end; else the error has been told
+  ExitStatus status = ExitStatus::done;
+  mailsync::SyncReport report;
+  std::string plan;
+};
 
-bool hasMailboxes(const std::vector<std::string>& paths, const mailsync::SyncSettings& settings) {
-  if (!paths.empty()) return true;
-  const auto catalogue = mailsync::openCatalogue(settings, nullptr);
-  return catalogue != nullptr && !catalogue->roots().empty();
+GroupRun syncGroup(const Options& options, const MailboxGroup& group) {
+  GroupRun run;
+  mailsync::SyncReport& report = run.report;
+  SyncProgress progress;
+  const mailsync::SyncObserver observer{
+      [&](const std::string& where, const std::string& reason) {
+        progress.clear();
+        complain(fmt::format("{}: {}", where, reason));
+      },
+      [&](uint64_t messages, uint64_t deletions, const mailsync::DeliveryCounts& done) {
+        progress.update(messages, deletions, done);
+      },
+      interrupted,
+      [&](const char* action, const std::string& message) {
+        if (options.verbose) run.plan += fmt::format("{} {}\n", action, cleanForTerminal(message));
+      }};
+  std::optional<TLError> error;
+  run.done =
+      mailsync::syncMail(syncSettings(options, group), group.roots, observer, report, &error);
+  progress.clear();
+  const bool incomplete = report.cancelled || report.delivery.failed > 0 ||
+                          report.scan.unreadable > 0 || report.scan.missing > 0;
+  if (!run.done) {
+    run.status = complain(error);
+  } else if (incomplete) {
+    run.status = ExitStatus::failure;
+  }
+  return run;
 }
 
 }  // namespace
@@ -90,14 +108,12 @@ mailsync::SyncSettings syncSettings(const Options& options) {
   return settings;
 }
 
-std::vector<std::string> usualMailboxes() {
-  const char* const home = std::getenv("HOME");
-  std::vector<std::string> found;
-  for (const char* name : {"Maildir", "Mail", ".mail"}) {
-    const std::string path = platform::joinPath(home == nullptr ? "/" : home, name);
-    if (platform::fileExists(path)) found.push_back(path);
-  }
-  return found;
+mailsync::SyncSettings syncSettings(const Options& options, const MailboxGroup& group) {
+  mailsync::SyncSettings settings = syncSettings(options);
+  settings.protectionClass = group.protectionClass;
+  settings.excluded = group.excluded;
+  settings.largestMessage = group.largestMail;
+  return settings;
 }
 
 bool interrupted() {
@@ -132,41 +148,27 @@ std::string summaryOf(const mailsync::SyncReport& report, bool dryRun) {
   return report.cancelled ? text + ", interrupted" : text;
 }
 
+// The classes one after the other; a daemon that is not there ends it.
 ExitStatus runSync(const Options& options) {
-  const mailsync::SyncSettings settings = syncSettings(options);
-  const std::vector<std::string> paths = mailboxesOf(options, settings);
-  if (!hasMailboxes(paths, settings)) {
-    complain(std::string("no mailbox is known; name one: tallow sync ~/Mail"));
-    return ExitStatus::failure;
+  const auto groups = mailboxGroups(options);
+  if (!groups || interrupted()) return ExitStatus::failure;
+  ExitStatus status = ExitStatus::done;
+  nlohmann::json json = nlohmann::json::array();
+  std::string text;
+  for (const MailboxGroup& group : *groups) {
+    const GroupRun run = syncGroup(options, group);
+    if (run.status != ExitStatus::done) status = run.status;
+    if (run.done || run.report.toSend + run.report.toDelete > 0) {
+      json.push_back(jsonOf(run.report));
+      json.back()["class"] = group.protectionClass;
+      text += run.plan + (groups->size() > 1 ? group.protectionClass + ": " : "");
+      text += summaryOf(run.report, options.dryRun) + '\n';
+    }
+    if (run.report.cancelled || run.status == ExitStatus::unreachable) break;
   }
-  SyncProgress progress;
-  std::string plan;
-  const mailsync::SyncObserver observer{
-      [&](const std::string& where, const std::string& reason) {
-        progress.clear();
-        complain(fmt::format("{}: {}", where, reason));
-      },
-      [&](uint64_t messages, uint64_t deletions, const mailsync::DeliveryCounts& done) {
-        progress.update(messages, deletions, done);
-      },
-      interrupted,
-      [&](const char* action, const std::string& message) {
-        if (options.verbose) plan += fmt::format("{} {}\n", action, cleanForTerminal(message));
-      }};
-  if (interrupted()) return ExitStatus::failure;
-  mailsync::SyncReport report;
-  std::optional<TLError> error;
-  const bool done = mailsync::syncMail(settings, paths, observer, report, &error);
-  progress.clear();
-  ExitStatus status = done ? ExitStatus::done : complain(error);
-  const bool incomplete = report.cancelled || report.delivery.failed > 0 ||
-                          report.scan.unreadable > 0 || report.scan.missing > 0;
-  if (done && incomplete) status = ExitStatus::failure;
-  if (!done && report.toSend + report.toDelete == 0) return status;
-  return print(options.format == OutputFormat::json
-                   ? jsonText(jsonOf(report))
-                   : plan + summaryOf(report, options.dryRun) + '\n',
-               status);
+  if (text.empty()) return status;
+  if (options.format != OutputFormat::json) return print(text, status);
+  return print(jsonText(groups->size() == 1 ? json[0] : json), status);
 }
 
 }  // namespace cli

@@ -3,6 +3,7 @@
 #include <functional>
 #include <string>
 
+#include "cli/Mailboxes.h"
 #include "cli/Options.h"
 #include "sync/MailSync.h"
 
@@ -11,8 +12,9 @@ namespace cli {
 // What `sync`, `status` and searches have in common, from the command line.
 [[nodiscard]] mailsync::SyncSettings syncSettings(const Options& options);
 
-// Those of ~/Maildir, ~/Mail and ~/.mail that are there.
-[[nodiscard]] std::vector<std::string> usualMailboxes();
+// The same for the mailboxes of one class.
+[[nodiscard]] mailsync::SyncSettings syncSettings(const Options& options,
+                                                  const MailboxGroup& group);
 
 // True once SIGINT or SIGTERM has come; a second signal ends the process at once. The first call
 // takes over the signals.

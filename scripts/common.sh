@@ -9,13 +9,15 @@ export CMAKE_BUILD_PARALLEL_LEVEL=$jobs
 
 say() { printf '\n== %s\n' "$*"; }
 
-# Prints the packages of packages.list that are not installed.
+# Prints the packages of packages.list, with CI=true also those of ci-packages.list, that are not
+# installed.
 missing_packages() {
-  local package
+  local package lists=("$root/scripts/packages.list")
+  [[ ${CI:-} == true ]] && lists+=("$root/scripts/ci-packages.list")
   while read -r package; do
     [[ $(dpkg-query -W -f '${Status}' "$package" 2>/dev/null) == 'install ok installed' ]] ||
       printf '%s\n' "$package"
-  done < <(sed 's/#.*//; s/[[:space:]]//g; /^$/d' "$root/scripts/packages.list")
+  done < <(sed 's/#.*//; s/[[:space:]]//g; /^$/d' "${lists[@]}")
 }
 
 # Installs what is missing; quiet when nothing is.

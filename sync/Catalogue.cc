@@ -387,9 +387,9 @@ int64_t Catalogue::waitingCount() {
   return first(statement, [](const Statement& row) { return row.number(0); }).value_or(0);
 }
 
-std::vector<int64_t> Catalogue::waitingIDs() {
-  Statement& statement = sql("SELECT id FROM message WHERE sequence > ?");
-  statement.bind(_acknowledged);
+std::vector<int64_t> Catalogue::waitingIDs(int64_t first) {
+  Statement& statement = sql("SELECT id FROM message WHERE sequence > ? AND id >= ?");
+  statement.bind(_acknowledged).bind(first);
   auto ids = all(statement, [](const Statement& row) { return row.number(0); });
   std::sort(ids.begin(), ids.end());
   return ids;

@@ -158,7 +158,9 @@ class Catalogue {
 
   [[nodiscard]] int64_t waitingCount();
   // In the order in which they came, so that those of one file mostly stand together.
-  [[nodiscard]] std::vector<int64_t> waitingIDs();
+  [[nodiscard]] std::vector<int64_t> waitingIDs(int64_t first = 0);
+  // The number of the message that came last.
+  [[nodiscard]] int64_t lastMessage() { return scalar("SELECT MAX(id) FROM message"); }
   [[nodiscard]] std::optional<WaitingMessage> waitingMessage(int64_t id);
   void setSequence(int64_t message, int64_t sequence);
 

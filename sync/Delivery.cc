@@ -128,7 +128,7 @@ bool Delivery::deleteSingly(const std::vector<std::string>& identifiers, TLError
 }
 
 bool Delivery::sendMessages(TLErrorOut error) {
-  const std::vector<int64_t> ids = _catalogue.waitingIDs();
+  const std::vector<int64_t> ids = _catalogue.waitingIDs(_target.firstMessage);
   for (size_t begin = 0; begin < ids.size() && !_observer.cancelled();) {
     std::vector<WaitingMessage> messages;
     for (; begin < ids.size() && messages.size() < kMessagesOfAReader; ++begin) {
@@ -136,7 +136,7 @@ bool Delivery::sendMessages(TLErrorOut error) {
         messages.push_back(std::move(*message));
       }
     }
-    ItemReader reader(std::move(messages));
+    ItemReader reader(std::move(messages), _target.largestMessage);
     while (const auto batch = reader.next()) {
       if (_observer.cancelled()) return true;
       if (!sendBatch(*batch, error)) return false;

@@ -48,6 +48,8 @@ class Delivery {
   struct Target {
     std::string name;
     std::string protectionClass;
+    uint64_t largestMessage = 0;  // larger ones fail; 0 for no limit
+    int64_t firstMessage = 0;     // of the catalogue; those before it stay waiting
   };
   struct Observer {
     std::function<void(const std::string& where, const std::string& reason)> complain;
@@ -58,9 +60,10 @@ class Delivery {
   Delivery(Catalogue& catalogue, client::SearchServiceProxy& service, Target target,
            Observer observer);
 
-  // Sends all of it. False with an error when the daemon or the catalogue has failed; what the
-  // daemon has acknowledged stays. Cancelled, it ends after the call in hand, in order.
-  // `storedState` is what the daemon has now; a state is stored only where it would differ.
+  // Sends all of it from `firstMessage` on. False with an error when the daemon or the catalogue
+  // has failed; what the daemon has acknowledged stays. Cancelled, it ends after the call in hand,
+  // in order. `storedState` is what the daemon has now; a state is stored only where it would
+  // differ.
   bool run(const std::optional<DeliveredState>& storedState, TLErrorOut error);
 
   [[nodiscard]] const DeliveryCounts& counts() const { return _counts; }

@@ -73,6 +73,10 @@ class ItemReader::Reading {
   bool add(const WaitingMessage& waiting, std::string_view bytes, const std::string& digest,
            cli::MessageOrigin origin) {
     const std::string where = origin.identifier;
+    const uint64_t largest = _reader._largestMessage;
+    if (largest > 0 && bytes.size() > largest) {
+      return fail(waiting, where, fmt::format("larger than the limit of {} bytes", largest), true);
+    }
     origin.identifier = waiting.message.identifier;
     auto result = _parser.parse(bytes, origin);
     if (const auto* bad = std::get_if<cli::UnparsableMessage>(&result)) {
@@ -108,8 +112,8 @@ class ItemReader::Reading {
   ReadBatch _batch;
 };
 
-ItemReader::ItemReader(std::vector<WaitingMessage> messages)
-    : _messages(std::move(messages)), _thread([this] { run(); }) {}
+ItemReader::ItemReader(std::vector<WaitingMessage> messages, uint64_t largestMessage)
+    : _messages(std::move(messages)), _largestMessage(largestMessage), _thread([this] { run(); }) {}
 
 ItemReader::~ItemReader() {
   _queue.cancel();

@@ -41,7 +41,8 @@ struct ReadBatch {
 class ItemReader {
  public:
   // The messages of one mbox file should stand together: it is read once for each such group.
-  explicit ItemReader(std::vector<WaitingMessage> messages);
+  // Messages of more than `largestMessage` bytes, where that is not 0, are failures.
+  ItemReader(std::vector<WaitingMessage> messages, uint64_t largestMessage);
   ~ItemReader();
   ItemReader(const ItemReader&) = delete;
   ItemReader& operator=(const ItemReader&) = delete;
@@ -55,6 +56,7 @@ class ItemReader {
   void run();
 
   const std::vector<WaitingMessage> _messages;
+  const uint64_t _largestMessage;
   cli::BatchQueue<ReadBatch> _queue;  // synchronised by itself
   std::thread _thread;
 };

@@ -16,6 +16,31 @@
 
 namespace mailsync {
 
+std::string canonicalPath(const std::string& path) {
+  std::error_code failure;
+  std::string found = std::filesystem::weakly_canonical(path, failure).string();
+  if (failure) found = std::filesystem::absolute(path, failure).lexically_normal().string();
+  while (found.size() > 1 && found.back() == '/') found.pop_back();
+  return found;
+}
+
+bool isAtOrBelow(const std::string& path, const std::string& place) {
+  return path.starts_with(place) &&
+         (path.size() == place.size() || place == "/" || path[place.size()] == '/');
+}
+
+std::vector<std::string> outermost(std::vector<std::string> paths) {
+  std::sort(paths.begin(), paths.end());
+  std::vector<std::string> kept;
+  for (std::string& path : paths) {
+    const bool covered = std::any_of(kept.begin(), kept.end(), [&](const std::string& other) {
+      return isAtOrBelow(path, other);
+    });
+    if (!covered) kept.push_back(std::move(path));
+  }
+  return kept;
+}
+
 namespace {
 
 constexpr std::chrono::milliseconds kLockStep{50};
@@ -64,32 +89,12 @@ std::unique_ptr<Catalogue> openForWriting(const std::string& path, TLErrorOut er
   return catalogue;
 }
 
-// Absolute and without links; what is not there, as far as that goes.
-std::string canonical(const std::string& path) {
-  std::error_code failure;
-  std::string found = std::filesystem::weakly_canonical(path, failure).string();
-  if (failure) found = std::filesystem::absolute(path, failure).lexically_normal().string();
-  while (found.size() > 1 && found.back() == '/') found.pop_back();
-  return found;
-}
-
-bool isAtOrBelow(const std::string& path, const std::string& place) {
-  return path.starts_with(place) &&
-         (path.size() == place.size() || place == "/" || path[place.size()] == '/');
-}
-
-// Each of the paths once, and none that lies below another.
-std::vector<std::string> outermost(std::vector<std::string> paths) {
-  std::sort(paths.begin(), paths.end());
-  std::vector<std::string> kept;
-  for (std::string& path : paths) {
-    const bool covered = std::any_of(kept.begin(), kept.end(), [&](const std::string& other) {
-      return isAtOrBelow(path, other);
-    });
-    if (!covered) kept.push_back(std::move(path));
-  }
-  return kept;
-}
+// What a run looks at: `paths` as of syncMail, or single places.
+struct Scope {
+  std::vector<std::string> paths;
+  bool onlyPlaces = false;
+  std::vector<std::string> places = {};
+};
 
 class Run {
  public:
@@ -99,7 +104,7 @@ class Run {
         _report(report),
         _service(settings.runtimeDirectory, settings.patience) {}
 
-  bool run(const std::vector<std::string>& paths, TLErrorOut error) {
+  bool run(const Scope& scope, TLErrorOut error) {
     const auto lock = acquireLock(_settings, _observer.cancelled, error);
     if (lock == nullptr) return false;
     _catalogue = openForWriting(pathOf(_settings), error);
@@ -112,14 +117,15 @@ class Run {
       return false;
     }
     if (text) _stored = DeliveredState::parse(*text);
-    return update(paths, error) && (_settings.dryRun || _report.cancelled || deliver(error));
+    return update(scope, error) && (_settings.dryRun || _report.cancelled || deliver(error));
   }
 
  private:
   // The catalogue after this tells what is to be done.
-  bool update(const std::vector<std::string>& paths, TLErrorOut error) {
+  bool update(const Scope& scope, TLErrorOut error) {
     _catalogue->begin();
-    scan(paths);
+    const int64_t last = _catalogue->lastMessage();
+    scan(scope);
     _report.cancelled = _observer.cancelled();
     if (_report.cancelled || !reconcile(error)) {
       _catalogue->rollback();
@@ -127,6 +133,7 @@ class Run {
     }
     if (_settings.retryFailed) _catalogue->retryFailed();
     _report.toSend = static_cast<uint64_t>(_catalogue->waitingCount());
+    if (_settings.backlogLimit > 0 && _report.toSend > _settings.backlogLimit) hold(last + 1);
     _report.toDelete = static_cast<uint64_t>(_catalogue->waitingDeletionCount());
     if (_settings.dryRun) tellPlan();
     const auto failure = _catalogue->failure();
@@ -140,29 +147,67 @@ class Run {
     return !failed;
   }
 
-  void scan(const std::vector<std::string>& paths) {
-    std::vector<std::string> roots = _catalogue->roots();
-    std::vector<std::string> wanted;
-    for (const std::string& path : paths) wanted.push_back(canonical(path));
-    wanted = outermost(std::move(wanted));
+  // Only messages from `first` on go out.
+  void hold(int64_t first) {
+    const uint64_t recent = _catalogue->waitingIDs(first).size();
+    const uint64_t sent = recent <= _settings.backlogLimit ? recent : 0;
+    _firstMessage = sent > 0 ? first : kWaiting;
+    _report.held = _report.toSend - sent;
+    _report.toSend = sent;
+  }
+
+  void scan(const Scope& scope) {
+    MailboxScan scanner(*_catalogue, scanSettings());
+    if (scope.onlyPlaces) {
+      scanPlaces(scanner, scope.places);
+    } else {
+      scanRoots(scanner, scope.paths);
+    }
+    scanner.finish();
+    _report.scan = scanner.counts();
+    _report.missing = scanner.missing();
+  }
+
+  [[nodiscard]] ScanSettings scanSettings() const {
     ScanSettings settings;
     for (const std::string& path : _settings.excluded) {
-      settings.excluded.push_back(canonical(path));
+      settings.excluded.push_back(canonicalPath(path));
     }
     settings.pruneMissing = _settings.pruneMissing;
-    settings.maximumFileBytes = _settings.maximumFileBytes;
     settings.complain = _observer.complain;
     settings.cancelled = _observer.cancelled;
-    MailboxScan scanner(*_catalogue, std::move(settings));
+    settings.entering = _observer.entering;
+    return settings;
+  }
+
+  void scanRoots(MailboxScan& scanner, const std::vector<std::string>& paths) {
+    std::vector<std::string> roots = _catalogue->roots();
+    std::vector<std::string> wanted;
+    for (const std::string& path : paths) wanted.push_back(canonicalPath(path));
+    wanted = outermost(std::move(wanted));
     for (const std::string& path : paths.empty() ? roots : wanted) {
       const bool found = scanner.scan(path);
       if (found) roots.push_back(path);
       if (!found && _settings.pruneMissing) std::erase(roots, path);
     }
-    scanner.finish();
-    _report.scan = scanner.counts();
     for (const std::string& root : _catalogue->roots()) _catalogue->removeRoot(root);
     for (const std::string& root : outermost(std::move(roots))) _catalogue->addRoot(root);
+  }
+
+  void scanPlaces(MailboxScan& scanner, std::vector<std::string> places) {
+    // A directory that is new is told by the one above it, which comes first in this order.
+    std::sort(places.begin(), places.end());
+    const std::vector<std::string> roots = _catalogue->roots();
+    for (const std::string& place : places) {
+      const auto root = std::find_if(roots.begin(), roots.end(), [&](const std::string& path) {
+        return isAtOrBelow(place, path);
+      });
+      if (root != roots.end()) {
+        scanner.rescan(place, *root);
+      } else if (scanner.scan(place)) {
+        _catalogue->addRoot(place);
+      }
+    }
   }
 
   // Brings catalogue and index together. By the daemon's state where that is of this catalogue: a
@@ -204,8 +249,10 @@ class Run {
       _observer.progress(_report.toSend, _report.toDelete, done);
     };
     if (_report.toSend + _report.toDelete > 0) progress({});
-    Delivery delivery(*_catalogue, _service, {_settings.name, _settings.protectionClass},
-                      {_observer.complain, progress, _observer.cancelled});
+    Delivery delivery(
+        *_catalogue, _service,
+        {_settings.name, _settings.protectionClass, _settings.largestMessage, _firstMessage},
+        {_observer.complain, progress, _observer.cancelled});
     const bool done = delivery.run(_stored, error);
     _report.delivery = delivery.counts();
     _report.cancelled = _observer.cancelled();
@@ -224,13 +271,23 @@ class Run {
   client::SearchServiceProxy _service;
   std::unique_ptr<Catalogue> _catalogue;
   std::optional<DeliveredState> _stored;
+  int64_t _firstMessage = 0;  // that goes out
 };
 
 }  // namespace
 
 bool syncMail(const SyncSettings& settings, const std::vector<std::string>& paths,
               const SyncObserver& observer, SyncReport& report, TLErrorOut error) {
-  return Run(settings, observer, report).run(paths, error);
+  return Run(settings, observer, report).run({paths}, error);
+}
+
+bool syncPlaces(const SyncSettings& settings, const std::vector<std::string>& places,
+                const SyncObserver& observer, SyncReport& report, TLErrorOut error) {
+  return Run(settings, observer, report).run({{}, true, places}, error);
+}
+
+std::string watchLockPath(const SyncSettings& settings) {
+  return pathOf(settings) + ".watch";
 }
 
 std::unique_ptr<Catalogue> openCatalogue(const SyncSettings& settings, TLErrorOut error) {

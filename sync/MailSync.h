@@ -30,7 +30,10 @@ struct SyncSettings {
   std::chrono::milliseconds lockPatience{std::chrono::seconds(30)};  // for another sync
 
   std::vector<std::string> excluded;  // directories
-  uint64_t maximumFileBytes = 0;      // larger files are left out; 0 for no limit
+  uint64_t largestMessage = 0;        // in bytes; larger ones fail; 0 for no limit
+  // Of messages. Where more wait, only those that the run itself has found go out, and these only
+  // where they are not more, too. 0 for no limit.
+  uint64_t backlogLimit = 0;
   bool pruneMissing = false;
   bool retryFailed = false;
   bool dryRun = false;
@@ -44,6 +47,8 @@ struct SyncObserver {
   std::function<bool()> cancelled;
   // With `dryRun`: what would be done with a message, "send" or "delete".
   std::function<void(const char* action, const std::string& message)> plan;
+  // See ScanSettings.
+  std::function<void(const std::string& directory)> entering = {};
 };
 
 struct SyncReport {
@@ -51,7 +56,9 @@ struct SyncReport {
   DeliveryCounts delivery;
   uint64_t toSend = 0;
   uint64_t toDelete = 0;
-  bool compared = false;  // the index was asked for what it holds
+  uint64_t held = 0;                 // messages beyond the limit of the backlog
+  std::vector<std::string> missing;  // directories of the catalogue that are not there
+  bool compared = false;             // the index was asked for what it holds
   bool cancelled = false;
 };
 
@@ -60,6 +67,24 @@ struct SyncReport {
 // the lock has failed; `report` tells in either case what was done.
 bool syncMail(const SyncSettings& settings, const std::vector<std::string>& paths,
               const SyncObserver& observer, SyncReport& report, TLErrorOut error);
+
+// As above, of single directories at or below roots of the catalogue, and of roots: only these are
+// looked into (see MailboxScan::rescan). A place that is below no root becomes one where it is
+// there. Without any place, what waits is sent.
+bool syncPlaces(const SyncSettings& settings, const std::vector<std::string>& places,
+                const SyncObserver& observer, SyncReport& report, TLErrorOut error);
+
+// Absolute and without links; what is not there, as far as that goes.
+[[nodiscard]] std::string canonicalPath(const std::string& path);
+
+[[nodiscard]] bool isAtOrBelow(const std::string& path, const std::string& place);
+
+// Each of the paths once, and none that lies below another.
+[[nodiscard]] std::vector<std::string> outermost(std::vector<std::string> paths);
+
+// What one process at a time may hold that watches the mailboxes of these settings; beside the lock
+// of a run, which it takes for each.
+[[nodiscard]] std::string watchLockPath(const SyncSettings& settings);
 
 // The catalogue of these settings, to read; null without an error where there is none yet.
 [[nodiscard]] std::unique_ptr<Catalogue> openCatalogue(const SyncSettings& settings,

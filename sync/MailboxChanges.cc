@@ -129,11 +129,7 @@ bool MailboxScan::settleAlias(Arrival& arrival) {
 }
 
 void MailboxScan::addFile(Arrival& arrival) {
-  const auto size = static_cast<uint64_t>(arrival.row.size);
-  const bool tooLarge = _settings.maximumFileBytes > 0 && size > _settings.maximumFileBytes;
-  if (tooLarge) {
-    _settings.complain(arrival.path, "larger than the limit, left out");
-  } else if (arrival.row.kind == FileKind::maildir) {
+  if (arrival.row.kind == FileKind::maildir) {
     MessageRow message;
     message.file = _catalogue.addFile(arrival.row);
     message.identifier = cli::maildirIdentifier(arrival.path);
@@ -142,7 +138,7 @@ void MailboxScan::addFile(Arrival& arrival) {
   }
   arrival.row.kind = FileKind::other;
   arrival.row.id = _catalogue.addFile(arrival.row);
-  if (!tooLarge) readPlainFile(arrival.path, arrival.row);
+  readPlainFile(arrival.path, arrival.row);
 }
 
 // Another path to the file, or another file of the message's name, takes its place.

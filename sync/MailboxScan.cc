@@ -83,19 +83,47 @@ bool MailboxScan::scan(const std::string& path) {
     scanFile(path, info);
     return true;
   }
-  std::vector<Place> pending{{path, 0, 0}};
+  scanFrom({path, 0, 0});
+  return true;
+}
+
+void MailboxScan::rescan(const std::string& path, const std::string& root) {
+  std::string known = path;
+  while (known != root && !_directories.contains(known)) known = directoryOf(known);
+  const auto found = _directories.find(known);
+  if (found == _directories.end()) {
+    scan(root);
+    return;
+  }
+  const auto depth = static_cast<size_t>(std::count(known.begin() + root.size(), known.end(), '/'));
+  scanFrom({known, found->second.parent, depth, true});
+}
+
+void MailboxScan::scanFrom(Place start) {
+  std::vector<Place> pending{std::move(start)};
   while (!pending.empty() && !_settings.cancelled()) {
     const Place place = std::move(pending.back());
     pending.pop_back();
     scanDirectory(place, pending);
   }
-  return true;
+}
+
+std::vector<std::string> MailboxScan::missing() const {
+  std::vector<std::string> paths;
+  for (const auto& [path, row] : _directories) {
+    const auto above = _directories.find(directoryOf(path));
+    const bool covered = above != _directories.end() && above->second.missing;
+    if (row.missing && !covered) paths.push_back(path);
+  }
+  return paths;
 }
 
 // --- Directories
 
 void MailboxScan::scanDirectory(const Place& place, std::vector<Place>& pending) {
+  if (!_visited.insert(place.path).second) return;
   if (excluded(place.path)) return removeTree(place.path);
+  if (_settings.entering) _settings.entering(place.path);
   struct stat info {};
   const bool there = look(place.path, info);
   if (!there && errno != ENOENT && errno != ENOTDIR) {
@@ -112,7 +140,8 @@ void MailboxScan::scanDirectory(const Place& place, std::vector<Place>& pending)
     return;
   }
   DirectoryRow& row = directoryAt(place.path, place.parent);
-  const bool unchanged = row.settled && !row.missing && row.modified == nanoseconds(info.st_mtim) &&
+  const bool unchanged = !place.alone && row.settled && !row.missing &&
+                         row.modified == nanoseconds(info.st_mtim) &&
                          row.inode == static_cast<int64_t>(info.st_ino);
   std::vector<std::string> below = _children[row.id];
   if (unchanged) {
@@ -123,8 +152,17 @@ void MailboxScan::scanDirectory(const Place& place, std::vector<Place>& pending)
   std::sort(below.begin(), below.end(), visitedBefore);
   below.erase(std::unique(below.begin(), below.end()), below.end());
   for (auto path = below.rbegin(); path != below.rend(); ++path) {
+    if (place.alone && !isToBeEntered(*path)) continue;
     pending.push_back({*path, row.id, place.depth + 1});
   }
+}
+
+// Of a directory below one that is looked into alone: it is new, or is not what it was.
+bool MailboxScan::isToBeEntered(const std::string& path) const {
+  const auto known = _directories.find(path);
+  struct stat info {};
+  return known == _directories.end() || known->second.missing || !look(path, info) ||
+         known->second.inode != static_cast<int64_t>(info.st_ino);
 }
 
 DirectoryRow& MailboxScan::directoryAt(const std::string& path, int64_t parent) {
@@ -234,6 +272,7 @@ void MailboxScan::settleMissing() {
     const int64_t id = _directories.at(path).id;
     if (!_catalogue.hasContent(id)) {
       _catalogue.removeDirectory(id);
+      _directories.erase(path);
       continue;
     }
     if (_missing.contains(directoryOf(path))) continue;

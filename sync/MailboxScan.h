@@ -31,10 +31,12 @@ struct ScanCounts {
 struct ScanSettings {
   std::vector<std::string> excluded;  // canonical paths of directories
   bool pruneMissing = false;
-  uint64_t maximumFileBytes = 0;  // larger files are left out; 0 for no limit
   // What the user is to hear.
   std::function<void(const std::string& where, const std::string& reason)> complain;
   std::function<bool()> cancelled;
+  // Told of each directory before its time is read, so that a watch that begins here misses
+  // nothing; may be empty.
+  std::function<void(const std::string& directory)> entering = {};
 };
 
 // Compares roots with the catalogue and writes the difference into it: new messages wait, those
@@ -56,7 +58,15 @@ class MailboxScan {
 
   // `path` is absolute; a file or a directory. False where there is nothing, or nothing readable.
   bool scan(const std::string& path);
+
+  // Looks only into the directory `path`, at or below `root`, whatever its time tells, and into
+  // those below it that are new, have gone or have come back. Of one that the catalogue does not
+  // have, the nearest above it is looked into.
+  void rescan(const std::string& path, const std::string& root);
   void finish();
+
+  // Directories that are not there, without those below them; of the whole catalogue.
+  [[nodiscard]] std::vector<std::string> missing() const;
 
   [[nodiscard]] const ScanCounts& counts() const { return _counts; }
 
@@ -72,9 +82,12 @@ class MailboxScan {
     std::string path;
     int64_t parent;
     size_t depth;
+    bool alone = false;  // as of `rescan`
   };
 
+  void scanFrom(Place place);
   void scanDirectory(const Place& place, std::vector<Place>& pending);
+  [[nodiscard]] bool isToBeEntered(const std::string& path) const;
   bool listDirectory(DirectoryRow& row, const struct stat& info, std::vector<std::string>& below);
   void compareFiles(const DirectoryRow& row);
   void compareFile(const std::string& path, FileRow row, const struct stat& info);
@@ -104,6 +117,7 @@ class MailboxScan {
   std::map<std::string, DirectoryRow> _directories;  // by path
   std::map<int64_t, std::string> _paths;             // of directories
   std::map<int64_t, std::vector<std::string>> _children;
+  std::set<std::string> _visited;  // directories; each is listed once
   std::vector<Arrival> _arrivals;
   std::unordered_set<int64_t> _departures;         // file IDs
   std::set<std::string, std::greater<>> _missing;  // directories, those below others first

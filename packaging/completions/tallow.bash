@@ -2,10 +2,10 @@
 
 _tallow() {
   local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='index sync status search explain delete reset stats metrics ping vacuum state dump
+  local commands='index sync watch status search explain delete reset stats metrics ping vacuum state dump
     validate purge help'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
-    --verbose --dry-run --prune-missing --retry --query --filter --param --offset --sort --count
+    --verbose --dry-run --prune-missing --retry --on-battery --query --filter --param --offset --sort --count
     --print0 --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
@@ -28,7 +28,7 @@ _tallow() {
   local word
   for word in "${COMP_WORDS[@]:1:COMP_CWORD-1}"; do
     if [[ " $commands " == *" $word "* ]]; then
-      [[ $word == index || $word == sync ]] && compopt -o default
+      [[ $word == index || $word == sync || $word == watch ]] && compopt -o default
       return
     fi
   done

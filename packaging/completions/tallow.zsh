@@ -5,6 +5,7 @@ local -a commands options
 commands=(
   'index:index mail'
   'sync:bring the index in step with mailboxes'
+  'watch:keep the index in step all the time'
   'status:show mailboxes and index'
   'search:search for messages'
   'explain:search and show how the query is understood'
@@ -41,7 +42,8 @@ options=(
   '(-n --dry-run)'{-n,--dry-run}'[only tell what sync or purge would do]'
   '--prune-missing[delete the mail of directories that are not there]'
   '--retry[try again what could not be indexed]'
+  '--on-battery[do not wait for power with much mail]'
   '(-h --help)'{-h,--help}'[show help]'
   '--version[show the version]'
 )
-_arguments -S $options '1:command:{_describe command commands}' '*:argument:{ [[ $words[(I)(index|sync)] -gt 0 ]] && _files }'
+_arguments -S $options '1:command:{_describe command commands}' '*:argument:{ [[ $words[(I)(index|sync|watch)] -gt 0 ]] && _files }'

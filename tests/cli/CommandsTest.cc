@@ -442,6 +442,7 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
 TEST_F(CommandsTest, SyncAndStatus) {
   const testsupport::TemporaryDirectory home;
   setenv("XDG_STATE_HOME", (home / "state").c_str(), 1);
+  setenv("XDG_CONFIG_HOME", (home / "config").c_str(), 1);
   const std::string mail = home / "mail";
   std::filesystem::create_directories(mail + "/cur");
   std::ofstream(mail + "/cur/1:2,S") << "Subject: a\n\nb\n";
@@ -467,4 +468,35 @@ TEST_F(CommandsTest, SyncAndStatus) {
   EXPECT_THAT(output, HasSubstr(mail + ", 1 failed\n"));
   EXPECT_EQ(run({"sync"}), ExitStatus::unreachable);
   unsetenv("XDG_STATE_HOME");
+  unsetenv("XDG_CONFIG_HOME");
+}
+
+TEST_F(CommandsTest, SyncTakesTheSettings) {
+  const testsupport::TemporaryDirectory home;
+  setenv("XDG_STATE_HOME", (home / "state").c_str(), 1);
+  setenv("XDG_CONFIG_HOME", (home / "config").c_str(), 1);
+  for (const char* folder : {"in", "work", "old"}) {
+    std::filesystem::create_directories(home / "mail/" + folder + "/cur");
+    std::ofstream(home / "mail/" + folder + "/cur/1") << "Subject: " << folder << "\n\nb\n";
+  }
+  std::ofstream(home / "mail/in/cur/2") << "Subject: large\n\n" << std::string(2000, 'x');
+  std::filesystem::create_directories(home / "config/tallow");
+  const auto set = [&](const std::string& text) {
+    std::ofstream(home / "config/tallow/config.toml") << text;
+  };
+  set("roots = ['" + (home / "mail") + "']\nexclude = ['old']\nlargest_mail = 1500\n[class]\n'" +
+      (home / "mail/work") + "' = 'work'\n");
+  EXPECT_EQ(run({"sync"}), ExitStatus::failure);
+  EXPECT_EQ(output, "default: 1 added, 1 failed\nwork: 1 added\n");
+  EXPECT_THAT(errors, HasSubstr("larger than the limit of 1500 bytes"));
+  EXPECT_EQ(run({"sync", "--class=work", "--format=json"}), ExitStatus::done);
+  EXPECT_EQ(nlohmann::json::parse(output)["class"], "work");
+  EXPECT_EQ(run({"sync", home / "mail/work", "--class=default"}), ExitStatus::failure);
+  EXPECT_THAT(errors, HasSubstr("has the class work"));
+  set("\nroot = []");
+  EXPECT_EQ(run({"watch"}), ExitStatus::failure);
+  EXPECT_THAT(errors,
+              HasSubstr("config.toml:2: there is no key \"root\"; did you mean \"roots\"?"));
+  unsetenv("XDG_STATE_HOME");
+  unsetenv("XDG_CONFIG_HOME");
 }

@@ -1,0 +1,101 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <filesystem>
+
+#include "cli/Mailboxes.h"
+#include "cli/Settings.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::Pair;
+
+namespace {
+
+cli::Settings settingsOf(const std::string& text) {
+  auto result = cli::parseSettings(text, "config.toml", "/home/mara");
+  const auto* const wrong = std::get_if<std::string>(&result);
+  EXPECT_EQ(wrong, nullptr) << *wrong;
+  return wrong == nullptr ? std::get<cli::Settings>(result) : cli::Settings();
+}
+
+std::string complaintOf(const std::string& text) {
+  const auto result = cli::parseSettings(text, "config.toml", "/home/mara");
+  const auto* const wrong = std::get_if<std::string>(&result);
+  return wrong == nullptr ? "" : *wrong;
+}
+
+}  // namespace
+
+TEST(Settings, EachKey) {
+  const cli::Settings settings = settingsOf(R"(
+roots = ["~/Mail", "/srv/mail.mbox", "~"]
+exclude = [".Trash", "~/Mail/old", "Lists/noise"]
+largest_mail = "20 MB"
+on_battery = true
+[class]
+"~/Mail/work" = "work"
+)");
+  EXPECT_THAT(settings.roots, ElementsAre("/home/mara/Mail", "/srv/mail.mbox", "/home/mara"));
+  EXPECT_THAT(settings.excluded, ElementsAre("/home/mara/Mail/old"));
+  EXPECT_THAT(settings.excludedNames, ElementsAre(".Trash", "Lists/noise"));
+  EXPECT_THAT(settings.classes, ElementsAre(Pair("/home/mara/Mail/work", "work")));
+  EXPECT_EQ(settings.largestMail, 20'000'000U);
+  EXPECT_TRUE(settings.onBattery);
+  EXPECT_EQ(settingsOf("largest_mail = 5000").largestMail, 5000U);
+  EXPECT_EQ(settingsOf("largest_mail = '500KB'").largestMail, 500'000U);
+  EXPECT_EQ(settingsOf("").largestMail, 0U);
+}
+
+TEST(Settings, WhatIsWrongIsNamedWithFileLineKeyAndWhatIsAllowed) {
+  EXPECT_EQ(complaintOf("\nrots = []"),
+            "config.toml:2: there is no key \"rots\"; did you mean \"roots\"?");
+  EXPECT_EQ(complaintOf("colour = 1"),
+            "config.toml:1: there is no key \"colour\"; the keys are roots, exclude, class, "
+            "largest_mail, on_battery");
+  EXPECT_EQ(complaintOf("# a\n\non_battery = \"yes\""),
+            "config.toml:3: on_battery takes true or false");
+  for (const char* const bad :
+       {"roots = 1", "roots = [1]", "roots = ['Mail']", "roots = [\"/a\\u0000b\"]",
+        "exclude = ['']", "exclude = 'a'", "largest_mail = 10", "largest_mail = -1",
+        "largest_mail = '1 GB'", "largest_mail = '99999999999999999999 KB'",
+        "largest_mail = 99999999999", "on_battery = 1", "class = 1", "class = {'work' = 'a'}",
+        "class = {'/work' = ''}", "class = {'/work' = '../a'}", "class = {'/work' = 1}"}) {
+    EXPECT_THAT(complaintOf(bad), HasSubstr(" takes ")) << bad;
+  }
+  for (const std::string& bad :
+       {std::string("roots = ["), std::string("= 1"), std::string("roots = []\nroots = []"),
+        std::string("roots = ['\xff']"), "roots = " + std::string(100000, '[')}) {
+    EXPECT_THAT(complaintOf(bad), HasSubstr("config.toml:")) << bad.substr(0, 20);
+  }
+}
+
+TEST(Settings, MailboxesByClass) {
+  const testsupport::TemporaryDirectory directory;
+  const std::string mail = directory / "mail";
+  std::filesystem::create_directories(mail);
+  std::filesystem::create_directory_symlink(mail, directory / "link");
+  cli::Settings settings;
+  settings.excludedNames = {".Trash"};
+  settings.classes[directory / "link/work"] = "work";
+  const auto groupsOf = [&](const std::vector<std::string>& paths, bool all) {
+    return std::get<std::vector<cli::MailboxGroup>>(
+        cli::groupMailboxes(settings, paths, "default", all));
+  };
+  auto groups = groupsOf({mail, directory / "link/below"}, true);
+  ASSERT_EQ(groups.size(), 2U);
+  EXPECT_EQ(groups[0].protectionClass, "default");
+  EXPECT_THAT(groups[0].roots, ElementsAre(mail));
+  EXPECT_THAT(groups[0].excluded, ElementsAre(mail + "/.Trash", mail + "/work"));
+  EXPECT_EQ(groups[1].protectionClass, "work");
+  EXPECT_THAT(groups[1].roots, ElementsAre(mail + "/work"));
+  EXPECT_THAT(groups[1].excluded, ElementsAre(mail + "/work/.Trash"));
+  // A path that lies in such a folder has its class.
+  groups = groupsOf({mail + "/work/plans"}, false);
+  ASSERT_EQ(groups.size(), 1U);
+  EXPECT_EQ(groups[0].protectionClass, "work");
+  settings.classes[mail + "/work/plans"] = "default";
+  const auto nested = cli::groupMailboxes(settings, {mail}, "default", true);
+  EXPECT_THAT(std::get<std::string>(nested), HasSubstr("lies in"));
+}

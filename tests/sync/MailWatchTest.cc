@@ -1,0 +1,234 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "sync/DirectoryWatch.h"
+#include "sync/MailWatch.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tests/sync/StoringDaemon.h"
+
+namespace fs = std::filesystem;
+using mailsync::Change;
+using std::chrono::minutes;
+using testing::Contains;
+using testing::ElementsAre;
+using testing::HasSubstr;
+
+namespace {
+
+// Tells what the test says, and remembers what was to be watched.
+class ScriptedSource : public mailsync::ChangeSource {
+ public:
+  Result watch(const std::string& directory) override {
+    if (!fs::is_directory(directory)) return Result::absent;
+    if (refused.contains(directory)) return Result::refused;
+    watched.insert(directory);
+    return Result::watched;
+  }
+  void keepOnly(const std::set<std::string>& directories) override {
+    std::erase_if(watched, [&](const auto& path) { return !directories.contains(path); });
+  }
+  std::vector<Change> read() override { return std::exchange(changes, {}); }
+  [[nodiscard]] int descriptor() const override { return -1; }
+
+  std::set<std::string> watched;
+  std::set<std::string> refused;
+  std::vector<Change> changes;
+};
+
+class MailWatchTest : public testing::Test {
+ protected:
+  MailWatchTest() {
+    makeFolder("a");
+    makeFolder("b");
+  }
+  void makeFolder(const std::string& folder) const {
+    for (const char* sub : {"cur", "new"}) fs::create_directories(mail + '/' + folder + '/' + sub);
+  }
+  void add(const std::string& path) const {
+    std::ofstream(mail + '/' + path) << "Subject: " << path << "\n\nText\n";
+  }
+  void setPower(bool online) const {
+    for (const auto& [supply, attribute, value] :
+         {std::tuple("AC", "type", "Mains"), std::tuple("AC", "online", online ? "1" : "0"),
+          std::tuple("BAT0", "type", "Battery"),
+          std::tuple("BAT0", "status", online ? "Full" : "Unknown")}) {
+      fs::create_directories(directory / "power/" + supply);
+      std::ofstream(directory / "power/" + supply + '/' + attribute) << value << '\n';
+    }
+  }
+  void start(const std::string& root) {
+    mailsync::WatchSettings settings;
+    settings.sync.runtimeDirectory = daemon.runtimeDirectory();
+    settings.sync.protectionClass = "default";
+    settings.sync.name = "tallow";
+    settings.sync.catalogueDirectory = directory / "state";
+    settings.roots = {root};
+    settings.powerDirectory = directory / "power";
+    auto scripted = std::make_unique<ScriptedSource>();
+    source = scripted.get();
+    source->refused = refused;
+    watch = mailsync::MailWatch::start(
+        settings, std::move(scripted),
+        {[this](const std::string& line) { said.push_back(line); },
+         [this](const mailsync::SyncReport& report) { entered = report.scan.entered; },
+         [] { return false; }},
+        now, nullptr);
+    ASSERT_TRUE(watch);
+    watch->turn(now);
+  }
+  // Time passes, in which a round that is due is run.
+  void pass(std::chrono::milliseconds time) {
+    now += time;
+    entered = 0;
+    watch->turn(now);
+  }
+  void tell(const std::string& place, const std::string& name) {
+    source->changes.push_back({Change::Kind::entry, place, name, false});
+    pass(std::chrono::seconds(1));
+    pass(std::chrono::seconds(1));
+  }
+  [[nodiscard]] size_t indexed() const { return daemon.content().items.size(); }
+
+  testsupport::TemporaryDirectory directory;
+  const std::string mail = directory / "mail";
+  testsupport::StoringDaemon daemon;
+  ScriptedSource* source = nullptr;
+  std::set<std::string> refused;
+  std::unique_ptr<mailsync::MailWatch> watch;
+  mailsync::MailWatch::Time now = mailsync::RescanPlan::Clock::now();
+  std::vector<std::string> said;
+  uint64_t entered = 0;  // directories, by the last round
+};
+
+}  // namespace
+
+TEST_F(MailWatchTest, LooksOnlyIntoWhatHasChanged) {
+  start(mail);
+  EXPECT_THAT(source->watched, Contains(mail + "/a/new"));
+  EXPECT_THAT(source->watched, Contains(directory.path()));
+  add("a/new/1");
+  add("b/new/2");
+  tell(mail + "/a/new", "1");
+  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(entered, 1U);
+  // What programs keep beside mail wakes nobody; a folder of such a name does.
+  makeFolder("dovecot");
+  add("dovecot/new/3.lock");
+  tell(mail, "dovecot-uidlist.lock");
+  EXPECT_EQ(indexed(), 1U);
+  source->changes.push_back({Change::Kind::entry, mail, "dovecot", true});
+  pass(std::chrono::seconds(1));
+  pass(std::chrono::seconds(1));
+  EXPECT_EQ(indexed(), 2U);
+  fs::remove(mail + "/dovecot/new/3.lock");
+  tell(mail + "/dovecot/new", "3.lock");
+  EXPECT_EQ(indexed(), 1U);
+  // A folder that is new, from the inside out.
+  makeFolder("b/c");
+  add("b/c/cur/3:2,S");
+  source->changes.push_back({Change::Kind::entry, mail + "/b/c", "cur", true});
+  tell(mail + "/b", "c");
+  EXPECT_EQ(indexed(), 2U);
+  EXPECT_THAT(source->watched, Contains(mail + "/b/c/cur"));
+  source->changes.push_back({Change::Kind::lost, "", "", false});
+  pass(std::chrono::seconds(1));
+  pass(std::chrono::seconds(1));
+  EXPECT_EQ(indexed(), 3U);
+}
+
+TEST_F(MailWatchTest, WhatCannotBeWatchedIsLookedAtFromTimeToTime) {
+  refused = {mail + "/a/new"};
+  start(mail);
+  EXPECT_THAT(said, ElementsAre(HasSubstr("cannot be watched")));
+  add("a/new/1");
+  pass(std::chrono::seconds(60));
+  EXPECT_EQ(indexed(), 0U);
+  pass(minutes(2));
+  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(said.size(), 1U);
+}
+
+TEST_F(MailWatchTest, ARootMayComeAndGo) {
+  const std::string root = directory / "later/mail";
+  start(root);
+  fs::create_directories(directory / "later");
+  tell(directory.path(), "later");
+  EXPECT_THAT(source->watched, Contains(directory / "later"));
+  fs::rename(mail, root);
+  std::ofstream(root + "/a/new/1") << "Subject: one\n\nText\n";
+  tell(directory / "later", "mail");
+  EXPECT_EQ(indexed(), 1U);
+  EXPECT_THAT(source->watched, Contains(root + "/a/new"));
+  fs::rename(root, mail);
+  tell(directory / "later", "mail");
+  EXPECT_EQ(indexed(), 1U);
+  EXPECT_THAT(said, Contains(HasSubstr("is not there")));
+  add("b/new/2");
+  fs::rename(mail, root);
+  pass(minutes(5));
+  EXPECT_EQ(indexed(), 2U);
+}
+
+TEST_F(MailWatchTest, ALargeBacklogWaitsForPowerAndNewMailDoesNot) {
+  setPower(false);
+  EXPECT_TRUE(platform::runsOnBattery(directory / "power"));
+  EXPECT_FALSE(platform::runsOnBattery(directory / "none"));
+  const size_t many = mailsync::MailWatch::kBatteryBacklog + 1;
+  for (size_t i = 0; i < many; ++i) add("a/cur/" + std::to_string(i) + ":2,");
+  start(mail);
+  EXPECT_EQ(indexed(), 0U);
+  EXPECT_THAT(said, ElementsAre(HasSubstr("501 messages wait for power")));
+  add("b/new/1");
+  tell(mail + "/b/new", "1");
+  EXPECT_EQ(indexed(), 1U);
+  pass(minutes(2));
+  EXPECT_EQ(indexed(), 1U);
+  setPower(true);
+  pass(minutes(2));
+  pass(std::chrono::seconds(1));
+  EXPECT_EQ(indexed(), many + 1);
+  EXPECT_EQ(said.size(), 2U);
+}
+
+TEST_F(MailWatchTest, ASecondWatchOfTheClassSaysSo) {
+  start(mail);
+  mailsync::WatchSettings settings;
+  settings.sync.runtimeDirectory = daemon.runtimeDirectory();
+  settings.sync.protectionClass = "default";
+  settings.sync.catalogueDirectory = directory / "state";
+  std::optional<TLError> error;
+  EXPECT_EQ(
+      mailsync::MailWatch::start(settings, std::make_unique<ScriptedSource>(), {}, now, &error),
+      nullptr);
+  EXPECT_EQ(error->domain, mailsync::kBusyDomain);
+}
+
+TEST_F(MailWatchTest, TheKernelTellsOfADirectoryByItsLatestPath) {
+  mailsync::DirectoryWatch kernel;
+  using Result = mailsync::ChangeSource::Result;
+  ASSERT_EQ(kernel.watch(mail + "/a/new"), Result::watched);
+  EXPECT_EQ(kernel.watch(mail + "/none"), Result::absent);
+  const auto told = [&] {
+    std::set<std::string> places;
+    for (const Change& change : kernel.read()) places.insert(change.directory + '/' + change.name);
+    return places;
+  };
+  add("a/new/1");
+  EXPECT_THAT(told(), ElementsAre(mail + "/a/new/1"));
+  fs::rename(mail + "/a", mail + "/\xff");
+  EXPECT_EQ(kernel.watch(mail + "/\xff/new"), Result::watched);
+  fs::remove(mail + "/\xff/new/1");
+  EXPECT_THAT(told(), ElementsAre(mail + "/\xff/new/1"));
+  makeFolder("a");
+  EXPECT_EQ(kernel.watch(mail + "/a/new"), Result::watched);
+  kernel.keepOnly({mail + "/a/new"});
+  (void)kernel.read();
+  add("\xff/new/2");
+  add("a/new/3");
+  EXPECT_THAT(told(), ElementsAre(mail + "/a/new/3"));
+  fs::remove_all(mail + "/a/new");
+  EXPECT_THAT(told(), Contains(mail + "/a/new/"));
+}

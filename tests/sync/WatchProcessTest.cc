@@ -1,0 +1,65 @@
+#include "tests/sync/WatchProcessSupport.h"
+
+namespace fs = std::filesystem;
+using testsupport::WatchProcessTest;
+
+TEST_F(WatchProcessTest, FollowsMailAndFolders) {
+  deliver("a", "1");
+  waitUntilInStep();
+  // Read, flagged, and to another folder.
+  fs::rename(mail + "/a/new/1", mail + "/b/cur/1:2,FS");
+  deliver("a", "2");
+  waitUntilInStep();
+  // A folder with a name of any bytes, made with its mail and renamed.
+  makeFolder("c");
+  deliver("c", "\xfc\xff");
+  fs::rename(mail + "/c", mail + "/\xe9t\xe9");
+  waitUntilInStep();
+  deliver("\xe9t\xe9", "4");
+  waitUntilInStep();
+  fs::remove(mail + "/b/cur/1:2,FS");
+  waitUntilInStep();
+  EXPECT_EQ(indexed().size(), 3U);
+  // One that vanishes and comes back.
+  fs::rename(mail + "/a", directory / "elsewhere");
+  waitUntilSaid("is not there");
+  EXPECT_EQ(indexed().size(), 3U);
+  fs::rename(directory / "elsewhere", mail + "/a");
+  deliver("a", "5");
+  waitUntilInStep();
+  EXPECT_EQ(indexed().size(), 4U);
+  EXPECT_EQ(end(SIGTERM), 0);
+}
+
+TEST_F(WatchProcessTest, FindsWhatTheKernelCouldNotTell) {
+  const auto text = platform::readFile("/proc/sys/fs/inotify/max_queued_events", 100, nullptr);
+  const int queued = std::atoi(text.value_or("0").c_str());
+  if (queued <= 0 || queued > 200000) GTEST_SKIP() << "a queue of " << queued << " events";
+  deliver("a", "1");
+  waitUntilInStep();
+  kill(pid, SIGSTOP);
+  for (int i = 0; i <= queued; ++i) {
+    fs::rename(mail + "/a/new/1", mail + "/a/new/2");
+    fs::rename(mail + "/a/new/2", mail + "/a/new/1");
+  }
+  deliver("b", "3");
+  kill(pid, SIGCONT);
+  waitUntilInStep();
+  EXPECT_EQ(indexed().size(), 2U);
+}
+
+TEST_F(WatchProcessTest, AThousandRenamesWhileTheDaemonRestarts) {
+  constexpr int kMany = 1000;
+  for (int i = 0; i < kMany; ++i) deliver("a", std::to_string(i));
+  waitUntilInStep();
+  daemon->signal(SIGKILL);
+  for (int i = 0; i < kMany; ++i) {
+    const std::string name = std::to_string(i);
+    fs::rename(mail + "/a/new/" + name, mail + "/b/cur/" + name + ":2,S");
+  }
+  waitUntilSaid("tried again");
+  startDaemon();
+  waitUntilInStep();
+  EXPECT_EQ(indexed().size(), static_cast<size_t>(kMany));
+  EXPECT_EQ(end(SIGINT), 0);
+}
