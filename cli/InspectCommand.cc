@@ -7,7 +7,6 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
-#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <functional>
@@ -15,9 +14,9 @@
 
 #include "cli/Commands.h"
 #include "cli/Results.h"
+#include "cli/StateDirectory.h"
 #include "platform/FileDescriptor.h"
 #include "platform/Files.h"
-#include "platform/Paths.h"
 
 // Dump and validate. The text index is the daemon's, so a program of its own reads it,
 // tallow-inspect; here it is run, and what it writes is made fit to be shown.
@@ -27,26 +26,6 @@ namespace {
 
 constexpr const char* kProgram = "tallow-inspect";
 constexpr size_t kPieceBytes = 64 * 1024;
-
-std::string variable(const char* name) {
-  const char* const value = std::getenv(name);
-  return value == nullptr ? "" : value;
-}
-
-// Where the daemon has its data: as it is told; else, when it is the user's own service, where
-// systemd puts its state, of new and of old; else as the system's service.
-std::string defaultStateDirectory() {
-  if (!variable("STATE_DIRECTORY").empty()) return platform::stateDirectory();
-  const auto homes = {std::pair("XDG_STATE_HOME", ".local/state"),
-                      std::pair("XDG_CONFIG_HOME", ".config")};
-  for (const auto& [name, below] : homes) {
-    std::string base = variable(name);
-    if (base.empty()) base = platform::joinPath(variable("HOME"), below);
-    const std::string own = platform::joinPath(base, "tallow");
-    if (platform::fileExists(platform::processLockPath(own))) return own;
-  }
-  return platform::stateDirectory();
-}
 
 // Beside this program, as it is built, or where it is installed.
 std::string programPath() {
@@ -81,8 +60,7 @@ class Inspector {
 
 bool Inspector::start(const char* command, const Options& options) {
   const std::string program = programPath();
-  const std::string state =
-      options.stateDirectory.empty() ? defaultStateDirectory() : options.stateDirectory;
+  const std::string state = stateDirectory(options);
   const std::array<const char*, 5> arguments{program.c_str(), command, state.c_str(),
                                              options.protectionClass.c_str(), nullptr};
   std::array<int, 2> pipe{-1, -1};

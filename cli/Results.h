@@ -46,6 +46,13 @@ struct Page {
 // A Message-ID an entry; messages without one are left out.
 [[nodiscard]] std::string resultsMessageIDs(const Page& page, MailFacts& facts, bool raw);
 
+// Parts of these for other lists: one result as an object of resultsJSON, the date of a result in
+// the time zone of the user, the names of its senders as they are in the mail, and its subject.
+[[nodiscard]] nlohmann::json resultJSON(const Hit& hit, size_t rank, MailFacts& facts);
+[[nodiscard]] std::string dateText(const TLIndexableItem& item);
+[[nodiscard]] std::string authorsText(const TLIndexableItem& item);
+[[nodiscard]] std::string subjectText(const TLIndexableItem& item);
+
 // A line, or a row, a result: rank, scores, date, identifier.
 [[nodiscard]] std::string scoresText(const ResultItems& items, const Palette& palette);
 [[nodiscard]] nlohmann::json scoresJSON(const ResultItems& items);

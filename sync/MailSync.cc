@@ -73,11 +73,6 @@ std::string canonical(const std::string& path) {
   return found;
 }
 
-bool isAtOrBelow(const std::string& path, const std::string& place) {
-  return path.starts_with(place) &&
-         (path.size() == place.size() || place == "/" || path[place.size()] == '/');
-}
-
 // Each of the paths once, and none that lies below another.
 std::vector<std::string> outermost(std::vector<std::string> paths) {
   std::sort(paths.begin(), paths.end());
