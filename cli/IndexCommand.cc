@@ -94,7 +94,7 @@ class Indexing {
 
   // Both are false only where going on makes no sense.
   bool sendInPieces(std::span<const client::EncodedItem> items, TLErrorOut error) {
-    while (!items.empty()) {
+    while (!items.empty() && !interrupted()) {
       const auto piece = items.first(std::min(_pace.items(), items.size()));
       const auto start = std::chrono::steady_clock::now();
       if (!send(piece, error)) return false;

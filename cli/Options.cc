@@ -228,20 +228,33 @@ void complainOfCommand(const std::string& word) {
   std::cerr << "\nRun `tallow help` for the list.\n";
 }
 
-// What is wrong with a command line, and where to look.
-std::string misuseText(const CLI::App* app, const CLI::Error& error) {
+// What is wrong with a command line, in our own words.
+std::string reasonOf(const CLI::App& app, const CLI::Error& error) {
+  const auto is = [code = error.get_exit_code()](CLI::ExitCodes one) {
+    return code == static_cast<int>(one);
+  };
+  const auto commands = app.get_subcommands();
   std::string reason = error.what();
-  const auto commands = app->get_subcommands();
-  std::vector<std::string> left = app->remaining();
-  if (left.empty() && !commands.empty()) left = commands.front()->remaining();
-  const bool extra = error.get_exit_code() == static_cast<int>(CLI::ExitCodes::ExtrasError);
-  if (extra && !left.empty()) {
-    reason = left.front().starts_with('-')
-                 ? "there is no option " + left.front()
-                 : fmt::format("\"{}\" is one argument too many", left.front());
+  if (is(CLI::ExitCodes::ExtrasError)) {
+    std::vector<std::string> left = app.remaining();
+    if (left.empty() && !commands.empty()) left = commands.front()->remaining();
+    if (left.empty()) return reason;
+    return left.front().starts_with('-')
+               ? "there is no option " + left.front()
+               : fmt::format("\"{}\" is one argument too many", left.front());
   }
+  if (is(CLI::ExitCodes::RequiredError) && commands.empty()) return "a command is missing";
+  if (is(CLI::ExitCodes::ArgumentMismatch)) {
+    const std::string name = reason.substr(0, reason.find(':'));
+    return name + (name.starts_with('-') ? " needs a value" : " can be given only once");
+  }
+  return reason;
+}
+
+std::string misuseText(const CLI::App* app, const CLI::Error& error) {
+  const auto commands = app->get_subcommands();
   return fmt::format("tallow: {}\nRun `tallow help{}` for what there is.\n",
-                     cleanForTerminal(reason),
+                     cleanForTerminal(reasonOf(*app, error)),
                      commands.empty() ? "" : ' ' + commands.front()->get_name());
 }
 

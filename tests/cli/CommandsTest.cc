@@ -458,6 +458,9 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
       {{"ping", "--wait=long"}, "\"long\" is not a number from 0 to 3600\n"},
       {{"show", "1", "--attachment=0"}, "\"0\" is not a whole number from 1 on\n"},
       {{"show", "1", "--attachment=1"}, "--attachment N and -o FILE go together\n"},
+      {{"ping", "a", "b"}, "tallow: TEXT can be given only once\n"},
+      {{"search", "x", "--sort"}, "tallow: --sort needs a value\n"},
+      {{}, "tallow: a command is missing\nRun `tallow help` for"},
       {{"search", "x", "--sorted"}, "there is no option --sorted\nRun `tallow help search`"}};
   for (const auto& [arguments, reason] : kReasons) {
     EXPECT_EQ(run(arguments), ExitStatus::failure);

@@ -3,11 +3,13 @@
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 
+#include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <nlohmann/json.hpp>
 
 #include "platform/Files.h"
+#include "tests/client/FakeDaemon.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -199,4 +201,23 @@ TEST_F(EverydayTest, AClassWithoutMailIsNotMade) {
   EXPECT_FALSE(std::filesystem::exists(directory / "state/TallowSearch/work"));
   EXPECT_EQ(run("index " + mail + "/drafts" + state), 0);
   EXPECT_EQ(run("search toast" + state), 0);
+}
+
+// The signal comes while the daemon has the first batch.
+TEST(IndexTest, AnInterruptLeavesASummary) {
+  const testsupport::TemporaryDirectory directory;
+  testsupport::FakeDaemon daemon;
+  const auto read = [&](const char* name) {
+    return platform::readFile(directory / name, 1000, nullptr).value_or("");
+  };
+  daemon.answer("IndexItems", [&](platform::RPCReply& reply) {
+    kill(std::atoi(read("pid").c_str()), SIGINT);
+    reply.send({});
+  });
+  const std::string command =
+      fmt::format("exec sh -c 'echo $$ >{0}/pid; exec " TALLOW_PROGRAM
+                  " --runtime-dir {1} index {2} {2} >{0}/out'",
+                  directory.path(), daemon.runtimeDirectory(), TALLOW_SAMPLE_MAIL);
+  EXPECT_EQ(WEXITSTATUS(std::system(command.c_str())), 2);
+  EXPECT_THAT(read("out"), testing::EndsWith(" messages indexed, interrupted\n"));
 }
