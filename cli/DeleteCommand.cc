@@ -5,12 +5,15 @@
 
 #include "cli/Commands.h"
 #include "cli/ErrorText.h"
+#include "cli/Identifier.h"
 #include "cli/MailFacts.h"
+#include "cli/MailFile.h"
 #include "cli/MailPlaces.h"
 #include "cli/Results.h"
 #include "cli/StateDirectory.h"
 #include "client/SearchServiceProxy.h"
 #include "sync/Inventory.h"
+#include "sync/MessageDigest.h"
 
 namespace cli {
 
@@ -37,10 +40,24 @@ class Deleting {
       Deletion deletion = deleteFolder(spelling);
       if (deletion.error || deletion.messages > 0) return deletion;
     }
-    return deleteFirst(identifiersOf(argument));
+    std::vector<std::string> identifiers = identifiersOf(argument);
+    addNamesByContent(identifiers);
+    return deleteFirst(identifiers);
   }
 
  private:
+  // `sync` names a message of an mbox file by its content, where a user names it by its place.
+  static void addNamesByContent(std::vector<std::string>& identifiers) {
+    MailReader reader;
+    for (size_t i = identifiers.size(); i > 0; --i) {
+      const auto location = parseIdentifier(identifiers[i - 1]);
+      if (!location || !location->offset) continue;
+      const auto message = reader.read(identifiers[i - 1], kMaximumMessageBytes, nullptr);
+      if (!message) continue;
+      identifiers.push_back(mboxIdentifier(location->path, mailsync::messageDigest(*message)));
+    }
+  }
+
   // The first of the identifiers that the index knows.
   Deletion deleteFirst(const std::vector<std::string>& identifiers) {
     Deletion deletion;

@@ -59,7 +59,7 @@ void remarkOn(const SearchResults& found, size_t wanted, const MailFacts& facts)
 // Asks for more as long as copies of messages leave fewer results than are wanted.
 std::optional<Outcome> search(const Options& options, const QueryInput& input, MailFacts& facts,
                               TLErrorOut error) {
-  constexpr size_t kCounted = 1000;  // also where threads are made for a page
+  constexpr size_t kCounted = 1000;  // also what makes threads, unless more are shown
   // Copies of the last message shown rank directly after it.
   constexpr size_t kCopies = 30;
   client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
@@ -68,7 +68,7 @@ std::optional<Outcome> search(const Options& options, const QueryInput& input, M
       limit == 0 || options.count ? SIZE_MAX : limit + static_cast<size_t>(options.offset);
   size_t wanted = shown > SIZE_MAX - kCopies ? SIZE_MAX : shown + kCopies;
   if (options.format == OutputFormat::json) wanted = std::max(wanted, kCounted);
-  if (options.threads) wanted = shown == SIZE_MAX ? kMaxThreadedHits : kCounted;
+  if (options.threads) wanted = std::clamp(shown, kCounted, kMaxThreadedHits);
   for (;;) {
     auto found = runPlan(input.plan, {options.protectionClass, options.sort, wanted, options.count},
                          service, facts, error);

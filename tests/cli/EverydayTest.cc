@@ -156,6 +156,17 @@ TEST_F(EverydayTest, DeletesFoldersAndFiles) {
   EXPECT_EQ(count("folder:" + mail), 0);
 }
 
+// `index` names them by their place, `sync` by their content.
+TEST_F(EverydayTest, DeletesAMessageOfAMailboxByItsPlace) {
+  const std::string message = mail + "/archive.mbox:736";
+  EXPECT_EQ(run("delete " + message), 0);
+  EXPECT_EQ(run("delete " + message), 1);
+  EXPECT_EQ(run("sync " + mail), 0);
+  EXPECT_EQ(run("delete " + message), 0);
+  EXPECT_EQ(output, "deleted " + message + '\n');
+  EXPECT_EQ(run("delete " + message), 1);
+}
+
 TEST_F(EverydayTest, SavedSearches) {
   EXPECT_EQ(run("save"), 1);
   EXPECT_EQ(run("save bills subject:invoice -corrected"), 0);
