@@ -2,6 +2,7 @@
 
 #include <nlohmann/json.hpp>
 #include <set>
+#include <span>
 
 #include "cli/Commands.h"
 #include "cli/ErrorText.h"

@@ -1,7 +1,5 @@
 #include "cli/Examples.h"
 
-#include <array>
-
 namespace cli {
 
 namespace {

@@ -83,6 +83,8 @@ ExitStatus page(std::string_view text) {
   platform::FileDescriptor output(pipe[1]);
   platform::FileDescriptor input(pipe[0]);
   const IgnoredSignals ignored;
+  // A pager that is "less" alone would show escape sequences as text.
+  setenv("LESS", "R", 0);
   pid_t process = -1;
   if (start(command, input.get(), process) != 0) return print(text);
   input.reset();

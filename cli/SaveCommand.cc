@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <nlohmann/json.hpp>
+#include <span>
 
 #include "cli/Commands.h"
 #include "cli/Results.h"
