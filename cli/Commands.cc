@@ -3,11 +3,11 @@
 #include <fmt/format.h>
 #include <unistd.h>
 
-#include <array>
 #include <cstdio>
 #include <iostream>
 #include <nlohmann/json.hpp>
 
+#include "cli/ErrorText.h"
 #include "cli/Results.h"
 #include "client/DebugServiceProxy.h"
 #include "client/SearchServiceProxy.h"
@@ -22,28 +22,6 @@ using Run = ExitStatus (*)(const Options&);
 std::string withLineFeed(std::string text) {
   if (text.empty() || text.back() != '\n') text.push_back('\n');
   return text;
-}
-
-// One call an identifier, so that one that fails does not stop the others.
-ExitStatus runDelete(const Options& options) {
-  client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
-  nlohmann::json list = nlohmann::json::array();
-  std::string text;
-  ExitStatus status = ExitStatus::done;
-  for (const std::string& identifier : options.arguments) {
-    std::optional<TLError> error;
-    const bool deleted = service.deleteItemsWithIdentifiers(std::span(&identifier, 1), options.name,
-                                                            options.protectionClass, &error);
-    if (client::isUnreachable(error)) return complain(error);
-    if (deleted) {
-      text += "deleted " + cleanForTerminal(identifier) + '\n';
-    } else {
-      complain(fmt::format("{}: {}", identifier, error->message));
-      status = ExitStatus::failure;
-    }
-    list.push_back({{"identifier", identifier}, {"deleted", deleted}});
-  }
-  return print(options.format == OutputFormat::json ? jsonText(list) : text, status);
 }
 
 bool confirmed(const Options& options) {
@@ -158,24 +136,18 @@ struct CommandFunction {
   Run run;
 };
 
-constexpr std::array<CommandFunction, 16> kFunctions{{
-    {Command::index, runIndex},
-    {Command::sync, runSync},
-    {Command::watch, runWatch},
-    {Command::status, runStatus},
-    {Command::search, runSearch},
-    {Command::explain, runExplain},
-    {Command::remove, runDelete},
-    {Command::reset, runReset},
-    {Command::stats, runStats},
-    {Command::metrics, runMetrics},
-    {Command::ping, runPing},
-    {Command::vacuum, runVacuum},
-    {Command::state, runState},
-    {Command::dump, runDump},
-    {Command::validate, runValidate},
+constexpr CommandFunction kFunctions[] = {
+    {Command::index, runIndex},     {Command::sync, runSync},
+    {Command::watch, runWatch},     {Command::status, runStatus},
+    {Command::search, runSearch},   {Command::explain, runExplain},
+    {Command::show, runShow},       {Command::address, runAddress},
+    {Command::save, runSave},       {Command::remove, runDelete},
+    {Command::reset, runReset},     {Command::stats, runStats},
+    {Command::metrics, runMetrics}, {Command::ping, runPing},
+    {Command::vacuum, runVacuum},   {Command::state, runState},
+    {Command::dump, runDump},       {Command::validate, runValidate},
     {Command::purge, runPurge},
-}};
+};
 
 }  // namespace
 
@@ -195,8 +167,7 @@ ExitStatus complain(const std::optional<TLError>& error) {
     return ExitStatus::failure;
   }
   const bool unreachable = client::isUnreachable(error);
-  complain(unreachable ? error->message
-                       : fmt::format("{} ({} {})", error->message, error->domain, error->code));
+  complain(plainText(*error));
   if (unreachable) {
     complain(
         std::string("is tallowsearchd running? \"systemctl --user start "

@@ -23,6 +23,12 @@ namespace cli {
 [[nodiscard]] ExitStatus runSearch(const Options& options);
 [[nodiscard]] ExitStatus runExplain(const Options& options);
 
+// Of runCommand, those for single mails, people, and searches that are kept.
+[[nodiscard]] ExitStatus runShow(const Options& options);
+[[nodiscard]] ExitStatus runDelete(const Options& options);
+[[nodiscard]] ExitStatus runAddress(const Options& options);
+[[nodiscard]] ExitStatus runSave(const Options& options);
+
 // Of runCommand, those that look at an index without the daemon.
 [[nodiscard]] ExitStatus runDump(const Options& options);
 [[nodiscard]] ExitStatus runValidate(const Options& options);

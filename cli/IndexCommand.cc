@@ -9,11 +9,13 @@
 
 #include "cli/BatchPace.h"
 #include "cli/Commands.h"
+#include "cli/ErrorText.h"
 #include "cli/IndexPipeline.h"
 #include "cli/MailWalker.h"
 #include "cli/MessageParser.h"
 #include "cli/ProgressBar.h"
 #include "cli/Results.h"
+#include "cli/SyncCommand.h"
 #include "client/SearchServiceProxy.h"
 #include "sync/MessageDigest.h"
 
@@ -46,7 +48,9 @@ class Indexing {
 
   ExitStatus run() {
     IndexPipeline pipeline(_options.arguments);
-    while (auto batch = pipeline.next()) {
+    while (!interrupted()) {
+      auto batch = pipeline.next();
+      if (!batch) break;
       report(*batch);
       std::optional<TLError> error;
       if (!sendInPieces(batch->items, &error)) {
@@ -60,7 +64,8 @@ class Indexing {
     }
     _progress.clear();
     const bool written = printSummary();
-    if (!written || _pathFailures > 0 || _refused > 0) return ExitStatus::failure;
+    const bool failed = _pathFailures + _messageFailures + _refused > 0;
+    if (!written || failed || interrupted()) return ExitStatus::failure;
     return _indexed > 0 ? ExitStatus::done : ExitStatus::nothingFound;
   }
 
@@ -89,7 +94,7 @@ class Indexing {
 
   // Both are false only where going on makes no sense.
   bool sendInPieces(std::span<const client::EncodedItem> items, TLErrorOut error) {
-    while (!items.empty()) {
+    while (!items.empty() && !interrupted()) {
       const auto piece = items.first(std::min(_pace.items(), items.size()));
       const auto start = std::chrono::steady_clock::now();
       if (!send(piece, error)) return false;
@@ -109,7 +114,7 @@ class Indexing {
       return false;
     }
     if (items.size() == 1) {
-      say(fmt::format("{}: {}", items[0].identifier, failure->message));
+      say(fmt::format("{}: {}", items[0].identifier, plainText(*failure)));
       ++_refused;
       return true;
     }
@@ -128,7 +133,8 @@ class Indexing {
                        {"unreadablePaths", _pathFailures},
                        {"refused", _refused},
                        {"cut", _cut},
-                       {"ignoredFiles", _ignored}});
+                       {"ignoredFiles", _ignored},
+                       {"interrupted", interrupted()}});
     } else {
       text = fmt::format("{} messages indexed", _indexed);
       const auto add = [&](uint64_t count, const char* what) {
@@ -139,7 +145,7 @@ class Indexing {
       add(_refused, "refused by the daemon");
       add(_cut, "too long and cut");
       add(_ignored, "other files ignored");
-      text += '\n';
+      text += interrupted() ? ", interrupted\n" : "\n";
     }
     return std::fwrite(text.data(), 1, text.size(), stdout) == text.size() &&
            std::fflush(stdout) == 0;

@@ -60,7 +60,7 @@ class Inspector {
 
 bool Inspector::start(const char* command, const Options& options) {
   const std::string program = programPath();
-  const std::string state = daemonStateDirectory(options);
+  const std::string state = stateDirectory(options);
   const std::array<const char*, 5> arguments{program.c_str(), command, state.c_str(),
                                              options.protectionClass.c_str(), nullptr};
   std::array<int, 2> pipe{-1, -1};

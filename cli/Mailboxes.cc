@@ -10,6 +10,7 @@
 #include "cli/SyncCommand.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
+#include "sync/Inventory.h"
 
 namespace cli {
 

@@ -1,14 +1,11 @@
 #include "cli/MessageParser.h"
 
-#include <gmime/gmime.h>
-
 #include <algorithm>
-#include <mutex>
 #include <optional>
 #include <vector>
 
-#include "cli/FlowedText.h"
 #include "cli/Identifier.h"
+#include "cli/Mime.h"
 #include "cli/TextBudget.h"
 
 namespace cli {
@@ -16,38 +13,6 @@ namespace cli {
 namespace {
 
 using Key = TLAttributeKey;
-
-struct Unref {
-  void operator()(gpointer object) const { g_object_unref(object); }
-};
-template <typename T>
-using Object = std::unique_ptr<T, Unref>;
-
-struct Free {
-  void operator()(gpointer memory) const { g_free(memory); }
-};
-using CString = std::unique_ptr<char, Free>;
-
-std::string_view orEmpty(const char* text) {
-  return text == nullptr ? std::string_view() : text;
-}
-
-bool equalIgnoringCase(std::string_view a, std::string_view b) {
-  return a.size() == b.size() && g_ascii_strncasecmp(a.data(), b.data(), a.size()) == 0;
-}
-
-bool isBlank(TLStringView text) {
-  return text.find_first_not_of(u" \t\r\n\u00A0") == TLStringView::npos;
-}
-
-Object<GMimeMessage> parseMIME(std::string_view bytes) {
-  const Object<GMimeStream> stream(g_mime_stream_mem_new_with_buffer(bytes.data(), bytes.size()));
-  const Object<GMimeParser> parser(g_mime_parser_new_with_stream(stream.get()));
-  g_mime_parser_set_format(parser.get(), GMIME_FORMAT_MESSAGE);
-  // Parts are kept as places in the stream, not copied.
-  g_mime_parser_set_persist_stream(parser.get(), TRUE);
-  return Object<GMimeMessage>(g_mime_parser_construct_message(parser.get(), nullptr));
-}
 
 std::optional<double> secondsOf(GDateTime* date) {
   if (date == nullptr) return std::nullopt;
@@ -75,10 +40,6 @@ struct Leaves {
   std::vector<GMimePart*> html;
   std::vector<GMimeObject*> attachments;
 };
-
-bool isAttached(GMimeObject* object) {
-  return equalIgnoringCase(orEmpty(g_mime_object_get_disposition(object)), "attachment");
-}
 
 void addLeaf(GMimePart* part, Leaves& leaves) {
   GMimeObject* const object = GMIME_OBJECT(part);
@@ -124,22 +85,6 @@ Leaves leavesOf(GMimeMessage* message) {
     }
   }
   return leaves;
-}
-
-TLString textOf(GMimePart* part, TextDecoder& decoder) {
-  GMimeDataWrapper* const content = g_mime_part_get_content(part);
-  if (content == nullptr) return {};
-  const Object<GMimeStream> stream(g_mime_stream_mem_new());
-  g_mime_data_wrapper_write_to_stream(content, stream.get());
-  const GByteArray* bytes = g_mime_stream_mem_get_byte_array(GMIME_STREAM_MEM(stream.get()));
-  const std::string_view view(reinterpret_cast<const char*>(bytes->data),
-                              std::min<size_t>(bytes->len, kMaximumBodyBytes));
-  const auto parameter = [&](const char* name) {
-    return orEmpty(g_mime_object_get_content_type_parameter(GMIME_OBJECT(part), name));
-  };
-  TLString text = decoder.decode(view, parameter("charset"));
-  if (!equalIgnoringCase(parameter("format"), "flowed")) return text;
-  return unflow(text, equalIgnoringCase(parameter("delsp"), "yes"));
 }
 
 // The parts one after the other. Stops once there is more than the index takes.
@@ -299,8 +244,7 @@ class ItemBuilder {
 }  // namespace
 
 MessageParser::MessageParser() {
-  static std::once_flag once;
-  std::call_once(once, g_mime_init);
+  initMIME();
 }
 
 std::variant<ParsedMessage, UnparsableMessage> MessageParser::parse(std::string_view bytes,

@@ -1,12 +1,15 @@
 #include "cli/Options.h"
 
+#include <fmt/format.h>
+
 #include <CLI/CLI.hpp>
 #include <algorithm>
-#include <array>
 #include <iostream>
 #include <limits>
 #include <map>
 
+#include "cli/Arguments.h"
+#include "cli/Examples.h"
 #include "client/Channel.h"
 #include "modification/WeightedDistance.h"
 
@@ -25,7 +28,7 @@ struct CommandRow {
   bool operandsRequired;
 };
 
-constexpr std::array<CommandRow, 16> kCommands{{
+constexpr CommandRow kCommands[] = {
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
     {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
@@ -33,11 +36,12 @@ constexpr std::array<CommandRow, 16> kCommands{{
     {Command::watch, "watch", "Keep the index in step with mailboxes all the time", "PATH", false},
     {Command::status, "status", "Show mailboxes and index: what is indexed, waits or has failed",
      nullptr, false},
-    {Command::search, "search", "Search; the last word matches as a prefix unless a blank follows",
+    {Command::search, "search", "Search; the last word matches as a prefix unless a space follows",
      "WORDS", false},
     {Command::explain, "explain", "Search, and show how the query was understood and the scores",
      "WORDS", false},
-    {Command::remove, "delete", "Delete messages by identifier", "ID", true},
+    {Command::remove, "delete", "Delete messages and folders from the index, not from the disk",
+     "PATH|ID", true},
     {Command::reset, "reset", "Delete everything that is indexed", nullptr, false},
     {Command::stats, "stats", "Show the statistics of store and index", nullptr, false},
     {Command::metrics, "metrics", "Show the metrics of the text index", nullptr, false},
@@ -48,7 +52,12 @@ constexpr std::array<CommandRow, 16> kCommands{{
     {Command::validate, "validate", "Check the text index, while no daemon runs", nullptr, false},
     {Command::purge, "purge", "Remove what was deleted from the disk, while no daemon runs",
      nullptr, false},
-}};
+    {Command::show, "show", "Show a message for reading", "RANK|ID|PATH", true},
+    {Command::address, "address", "Complete names and addresses from the indexed mail", "WORD",
+     true},
+    {Command::save, "save", "Save a search under a name, for search @NAME, or list what is saved",
+     "NAME WORDS", false},
+};
 
 const std::map<std::string, OutputFormat> kFormats{{"text", OutputFormat::text},
                                                    {"json", OutputFormat::json},
@@ -58,6 +67,44 @@ const std::map<std::string, SortOrder> kSortOrders{{"relevance", SortOrder::rele
                                                    {"date", SortOrder::date}};
 const std::map<std::string, ColorMode> kColors{
     {"auto", ColorMode::automatic}, {"always", ColorMode::always}, {"never", ColorMode::never}};
+
+// Takes one of some names; the text becomes the number of its value.
+template <typename Value>
+CLI::Validator oneOf(const std::map<std::string, Value>& values) {
+  return CLI::Validator(
+      [values](std::string& text) -> std::string {
+        const auto found = values.find(text);
+        if (found != values.end()) {
+          text = std::to_string(static_cast<int>(found->second));
+          return {};
+        }
+        std::vector<std::string> names;
+        for (const auto& [name, value] : values) names.push_back(name);
+        return fmt::format("\"{}\" is not one of {}", text, fmt::join(names, ", "));
+      },
+      "");
+}
+
+CLI::Validator wholeNumber(int64_t least) {
+  return CLI::Validator(
+      [least](std::string& text) -> std::string {
+        int64_t number = 0;
+        const bool good = CLI::detail::lexical_cast(text, number) && number >= least &&
+                          number <= std::numeric_limits<int64_t>::max() / 2;
+        return good ? "" : fmt::format("\"{}\" is not a whole number from {} on", text, least);
+      },
+      "");
+}
+
+CLI::Validator seconds(double most) {
+  return CLI::Validator(
+      [most](std::string& text) -> std::string {
+        double number = 0;
+        const bool good = CLI::detail::lexical_cast(text, number) && number >= 0 && number <= most;
+        return good ? "" : fmt::format("\"{}\" is not a number from 0 to {}", text, most);
+      },
+      "");
+}
 
 void addGlobalOptions(CLI::App& app, Options& options) {
   app.set_version_flag("--version", kVersion);
@@ -72,16 +119,16 @@ void addGlobalOptions(CLI::App& app, Options& options) {
       ->type_name("NAME");
   app.add_option("--format", options.format,
                  "Output: text, json, or for search also files or message-ids")
-      ->transform(CLI::CheckedTransformer(kFormats).description(""))
+      ->transform(oneOf(kFormats))
       ->type_name("FORMAT");
   app.add_option("--limit", options.limit, "Most results of a search, 0 for all (default: 20)")
-      ->check(CLI::Range(int64_t{0}, std::numeric_limits<int64_t>::max()).description(""))
+      ->check(wholeNumber(0))
       ->type_name("N");
   app.add_option("--color", options.color, "Colours: auto, always or never")
-      ->transform(CLI::CheckedTransformer(kColors).description(""))
+      ->transform(oneOf(kColors))
       ->type_name("WHEN");
   app.add_option("--wait", options.waitSeconds, "Wait so long for the daemon to come up")
-      ->check(CLI::Range(0.0, 3600.0).description(""))
+      ->check(seconds(3600))
       ->type_name("SECONDS");
   app.add_flag("-y,--yes", options.yes, "Do not ask before a reset");
   app.add_flag("-v,--verbose", options.verbose, "Name what was cut or ignored");
@@ -104,13 +151,24 @@ void addQueryOptions(CLI::App& sub, Options& options) {
 
 void addResultOptions(CLI::App& sub, Options& options) {
   sub.add_option("--sort", options.sort, "Order: relevance, or date for the newest first")
-      ->transform(CLI::CheckedTransformer(kSortOrders).description(""))
+      ->transform(oneOf(kSortOrders))
       ->type_name("ORDER");
   sub.add_option("--offset", options.offset, "Results to pass over")
-      ->check(CLI::Range(int64_t{0}, std::numeric_limits<int64_t>::max() / 2).description(""))
+      ->check(wholeNumber(0))
       ->type_name("N");
   sub.add_flag("--count", options.count, "Show only how many results there are");
+  sub.add_flag("--threads", options.threads, "A line for each conversation, with its results");
   sub.add_flag("--print0", options.print0, "Of files and message-ids: NUL in place of line feeds");
+}
+
+void addShowOptions(CLI::App& sub, Options& options) {
+  sub.add_flag("--raw", options.raw, "The message as it is on the disk");
+  sub.add_option("--attachment", options.attachment, "Save the attachment with this number")
+      ->check(wholeNumber(1))
+      ->type_name("N");
+  sub.add_option("-o,--output", options.output, "Where to, or - for the standard output")
+      ->type_name("FILE");
+  sub.add_flag("--force", options.force, "Replace the file if there is one");
 }
 
 void addSyncOptions(CLI::App& sub, Options& options) {
@@ -127,6 +185,7 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
     CLI::Option* const operands = sub->add_option(row.operands, options.arguments);
     operands->required(row.operandsRequired)->type_name(" ");
     if (row.command == Command::ping) operands->expected(0, 1);
+    if (row.command == Command::show) operands->expected(1);
   }
   if (isSearch(row.command)) addQueryOptions(*sub, options);
   if (row.command == Command::search) addResultOptions(*sub, options);
@@ -137,31 +196,15 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (row.command == Command::watch) {
     sub->add_flag("--on-battery", options.onBattery, "Do not wait for power with much mail");
   }
+  if (row.command == Command::show) addShowOptions(*sub, options);
+  if (row.command == Command::address) {
+    sub->add_flag("--mutt", options.mutt, "Begin with the line that mutt's query_command skips");
+  }
+  if (row.command == Command::save) {
+    sub->add_flag("--delete", options.removeSaved, "Forget the search with this name");
+  }
+  sub->footer(examplesOf(row.command));
   sub->callback([&options, command = row.command] { options.command = command; });
-}
-
-// After `search` and the like, a word that begins with a minus is not an option unless it is one of
-// the short options. Its minus is replaced by a control character while the options are parsed.
-constexpr char kMinusOfWord = '\x01';
-
-std::vector<std::string> withMarkedWords(int argc, const char* const* argv) {
-  std::vector<std::string> arguments(argv + 1, argv + argc);
-  bool searches = false;
-  for (std::string& argument : arguments) {
-    if (argument == "--") break;
-    const bool isShort = argument == "-h" || argument == "-v" || argument == "-y";
-    if (searches && argument.size() > 1 && argument[0] == '-' && argument[1] != '-' && !isShort) {
-      argument[0] = kMinusOfWord;
-    }
-    searches = searches || argument == "search" || argument == "explain";
-  }
-  return arguments;
-}
-
-void restoreWords(std::vector<std::string>& words) {
-  for (std::string& word : words) {
-    if (word.starts_with(kMinusOfWord)) word[0] = '-';
-  }
 }
 
 // The command that was meant by a mistyped one, or null.
@@ -194,6 +237,36 @@ void complainOfCommand(const std::string& word) {
   std::cerr << "\nRun `tallow help` for the list.\n";
 }
 
+// What is wrong with a command line, in our own words.
+std::string reasonOf(const CLI::App& app, const CLI::Error& error) {
+  const auto is = [code = error.get_exit_code()](CLI::ExitCodes one) {
+    return code == static_cast<int>(one);
+  };
+  const auto commands = app.get_subcommands();
+  std::string reason = error.what();
+  if (is(CLI::ExitCodes::ExtrasError)) {
+    std::vector<std::string> left = app.remaining();
+    if (left.empty() && !commands.empty()) left = commands.front()->remaining();
+    if (left.empty()) return reason;
+    return left.front().starts_with('-')
+               ? "there is no option " + left.front()
+               : fmt::format("\"{}\" is one argument too many", left.front());
+  }
+  if (is(CLI::ExitCodes::RequiredError) && commands.empty()) return "a command is missing";
+  if (is(CLI::ExitCodes::ArgumentMismatch)) {
+    const std::string name = reason.substr(0, reason.find(':'));
+    return name + (name.starts_with('-') ? " needs a value" : " can be given only once");
+  }
+  return reason;
+}
+
+std::string misuseText(const CLI::App* app, const CLI::Error& error) {
+  const auto commands = app->get_subcommands();
+  return fmt::format("tallow: {}\nRun `tallow help{}` for what there is.\n",
+                     cleanForTerminal(reasonOf(*app, error)),
+                     commands.empty() ? "" : ' ' + commands.front()->get_name());
+}
+
 // Of the command `help`: the help of the command with that name, or the list of all.
 ExitStatus showHelp(CLI::App& app, const std::string& command) {
   if (command.empty()) {
@@ -210,6 +283,15 @@ ExitStatus showHelp(CLI::App& app, const std::string& command) {
   return ExitStatus::done;
 }
 
+const char* misuseOfShow(const Options& options) {
+  if (options.raw && options.attachment != 0) return "--raw does not go with --attachment";
+  if ((options.attachment != 0) != !options.output.empty()) {
+    return "--attachment N and -o FILE go together";
+  }
+  if (options.force && options.output.empty()) return "--force goes with -o FILE";
+  return nullptr;
+}
+
 // What is wrong with options that do not go together, or null.
 const char* misuse(const Options& options) {
   const bool list =
@@ -221,6 +303,7 @@ const char* misuse(const Options& options) {
   if (options.format == OutputFormat::json && options.command == Command::dump) {
     return "a dump is text only";
   }
+  if (options.command == Command::show) return misuseOfShow(options);
   if (!isSearch(options.command)) return nullptr;
   if (options.arguments.empty() == options.query.empty()) {
     return "a search is for WORDS, or for the expression of --query";
@@ -237,14 +320,15 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
   Options options;
   CLI::App app("Full-text search of personal mail; a client of tallowsearchd.", "tallow");
   app.require_subcommand(1);
-  app.failure_message(CLI::FailureMessage::simple);
+  app.failure_message(misuseText);
   addGlobalOptions(app, options);
   for (const CommandRow& row : kCommands) addCommand(app, row, options);
   std::string helpOn;
   CLI::App* const help = app.add_subcommand("help", "Show how a command is used");
+  help->fallthrough();
   help->add_option("COMMAND", helpOn)->type_name(" ");
   try {
-    std::vector<std::string> arguments = withMarkedWords(argc, argv);
+    std::vector<std::string> arguments = commandFirst(argc, argv, app);
     std::reverse(arguments.begin(), arguments.end());
     app.parse(std::move(arguments));
     restoreWords(options.arguments);

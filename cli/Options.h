@@ -35,7 +35,10 @@ enum class Command {
   sync,
   status,
   purge,
-  watch
+  watch,
+  show,
+  address,
+  save
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };
@@ -62,6 +65,18 @@ struct Options {
   double waitSeconds = 0;  // for the daemon to come up
   bool yes = false;
   bool verbose = false;
+
+  bool threads = false;  // results by conversation
+
+  // Of show.
+  bool raw = false;
+  int64_t attachment = 0;  // by number from 1; 0 for none
+  std::string output;      // the file to save it in, or "-"
+  bool force = false;      // replace the file
+
+  // Of address and save.
+  bool mutt = false;
+  bool removeSaved = false;
 
   // Of sync.
   bool dryRun = false;

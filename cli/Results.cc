@@ -30,28 +30,6 @@ std::string textOf(const std::optional<TLString>& text) {
   return platform::toUTF8(platform::orEmpty(text));
 }
 
-// In the time zone of the user.
-std::string dateText(const TLIndexableItem& item) {
-  const auto date = dateOf(item);
-  if (!date || !(std::fabs(*date) <= kYear9999)) return "----------------";
-  const auto seconds = static_cast<time_t>(*date);
-  tm parts{};
-  if (localtime_r(&seconds, &parts) == nullptr) return "----------------";
-  return fmt::format("{:04}-{:02}-{:02} {:02}:{:02}", parts.tm_year + 1900, parts.tm_mon + 1,
-                     parts.tm_mday, parts.tm_hour, parts.tm_min);
-}
-
-std::string authorsText(const TLIndexableItem& item) {
-  std::string text;
-  const auto* persons = item.personValuesForKey(Key::AUTHORS);
-  if (persons == nullptr) return text;
-  for (const auto& person : *persons) {
-    if (!text.empty()) text += ", ";
-    text += textOf(person->hasName() ? person->name() : person->emailAddress());
-  }
-  return text;
-}
-
 nlohmann::json personsJSON(const TLIndexableItem& item, Key key) {
   nlohmann::json list = nlohmann::json::array();
   const auto* persons = item.personValuesForKey(key);
@@ -102,31 +80,6 @@ std::string placeText(const TLIndexableItem& item, MailFacts& facts) {
                           : location->path;
 }
 
-nlohmann::json resultJSON(const Hit& hit, size_t rank, MailFacts& facts) {
-  const TLIndexableItem& item = *hit.item;
-  const std::string identifier = textOf(item.identifier());
-  nlohmann::json json = cardJSON(item);
-  json["rank"] = rank;
-  json["identifier"] = identifier;
-  json["domainIdentifier"] = textOf(item.domainIdentifier());
-  json["subject"] = textOf(item.stringValueForKey(Key::SUBJECT));
-  json["snippet"] = textOf(item.stringValueForKey(Key::CONTENT_SNIPPET));
-  json["from"] = personsJSON(item, Key::AUTHORS);
-  json["to"] = personsJSON(item, Key::RECIPIENTS);
-  const auto date = dateOf(item);
-  json["date"] = date ? nlohmann::json(*date) : nlohmann::json();
-  json["time"] = timeJSON(item);
-  json["folder"] = folderName(item);
-  json["flags"] = flagsJSON(identifier, facts);
-  const auto location = facts.reader().locate(identifier);
-  json["path"] = location ? nlohmann::json(location->path) : nlohmann::json();
-  const auto head = location ? facts.head(identifier) : std::nullopt;
-  json["messageID"] = head ? nlohmann::json(head->messageID) : nlohmann::json();
-  json["copies"] = nlohmann::json::array();
-  for (const auto& copy : hit.copies) json["copies"].push_back(textOf(copy->identifier()));
-  return json;
-}
-
 std::string entry(const std::string& text, bool raw) {
   return raw ? text + '\0' : cleanForTerminal(text) + '\n';
 }
@@ -145,6 +98,56 @@ std::string score(bool present, double value) {
 }
 
 }  // namespace
+
+std::string dateText(const TLIndexableItem& item) {
+  const auto date = dateOf(item);
+  if (!date || !(std::fabs(*date) <= kYear9999)) return "----------------";
+  const auto seconds = static_cast<time_t>(*date);
+  tm parts{};
+  if (localtime_r(&seconds, &parts) == nullptr) return "----------------";
+  return fmt::format("{:04}-{:02}-{:02} {:02}:{:02}", parts.tm_year + 1900, parts.tm_mon + 1,
+                     parts.tm_mday, parts.tm_hour, parts.tm_min);
+}
+
+std::string authorsText(const TLIndexableItem& item) {
+  std::string text;
+  const auto* persons = item.personValuesForKey(Key::AUTHORS);
+  if (persons == nullptr) return text;
+  for (const auto& person : *persons) {
+    if (!text.empty()) text += ", ";
+    text += textOf(person->hasName() ? person->name() : person->emailAddress());
+  }
+  return text;
+}
+
+std::string subjectText(const TLIndexableItem& item) {
+  return textOf(item.stringValueForKey(Key::SUBJECT));
+}
+
+nlohmann::json resultJSON(const Hit& hit, size_t rank, MailFacts& facts) {
+  const TLIndexableItem& item = *hit.item;
+  const std::string identifier = textOf(item.identifier());
+  nlohmann::json json = cardJSON(item);
+  json["rank"] = rank;
+  json["identifier"] = identifier;
+  json["domainIdentifier"] = textOf(item.domainIdentifier());
+  json["subject"] = subjectText(item);
+  json["snippet"] = textOf(item.stringValueForKey(Key::CONTENT_SNIPPET));
+  json["from"] = personsJSON(item, Key::AUTHORS);
+  json["to"] = personsJSON(item, Key::RECIPIENTS);
+  const auto date = dateOf(item);
+  json["date"] = date ? nlohmann::json(*date) : nlohmann::json();
+  json["time"] = timeJSON(item);
+  json["folder"] = folderName(item);
+  json["flags"] = flagsJSON(identifier, facts);
+  const auto location = facts.reader().locate(identifier);
+  json["path"] = location ? nlohmann::json(location->path) : nlohmann::json();
+  const auto head = location ? facts.head(identifier) : std::nullopt;
+  json["messageID"] = head ? nlohmann::json(head->messageID) : nlohmann::json();
+  json["copies"] = nlohmann::json::array();
+  for (const auto& copy : hit.copies) json["copies"].push_back(textOf(copy->identifier()));
+  return json;
+}
 
 std::string jsonText(const nlohmann::json& json) {
   return escapeJSONForTerminal(json.dump(2, ' ', false, nlohmann::json::error_handler_t::replace)) +
@@ -211,7 +214,7 @@ std::string resultsText(const Page& page, const std::string& query, MailFacts& f
   size_t rank = page.firstRank;
   for (const Hit& hit : page.hits) {
     const TLIndexableItem& item = *hit.item;
-    const std::string subject = textOf(item.stringValueForKey(Key::SUBJECT));
+    const std::string subject = subjectText(item);
     const std::string snippet = contextOf(item, words, width, facts);
     constexpr size_t kBeforeAuthors = 18;
     const size_t authors = width > 2 * kBeforeAuthors ? width - kBeforeAuthors : 0;

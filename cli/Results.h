@@ -52,6 +52,12 @@ struct Page {
 // What the daemon looked for in place of what was typed, as a line for people: "showing results
 // for invoices". Empty where it replaced nothing.
 [[nodiscard]] std::string replacedText(const std::vector<client::ReplacedWord>& words);
+// Parts of these for other lists: one result as an object of resultsJSON, the date of a result in
+// the time zone of the user, the names of its senders as they are in the mail, and its subject.
+[[nodiscard]] nlohmann::json resultJSON(const Hit& hit, size_t rank, MailFacts& facts);
+[[nodiscard]] std::string dateText(const TLIndexableItem& item);
+[[nodiscard]] std::string authorsText(const TLIndexableItem& item);
+[[nodiscard]] std::string subjectText(const TLIndexableItem& item);
 
 // A line, or a row, a result: rank, scores, date, identifier.
 [[nodiscard]] std::string scoresText(const ResultItems& items, const Palette& palette);

@@ -2,17 +2,21 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <memory>
 #include <nlohmann/json.hpp>
+#include <numeric>
 #include <span>
 #include <utility>
 
 #include "cli/Commands.h"
 #include "cli/Explanation.h"
+#include "cli/LastSearch.h"
+#include "cli/MailPlaces.h"
 #include "cli/QueryInput.h"
 #include "cli/Results.h"
+#include "cli/SavedSearches.h"
 #include "cli/SearchRun.h"
-#include "cli/SyncCommand.h"
+#include "cli/StateDirectory.h"
+#include "cli/Threads.h"
 #include "client/SearchServiceProxy.h"
 #include "platform/Clock.h"
 
@@ -20,8 +24,12 @@ namespace cli {
 
 namespace {
 
-std::optional<QueryInput> readQuery(const Options& options) {
+std::optional<QueryInput> readQuery(Options options) {
   std::optional<TLError> error;
+  if (!expandSavedSearches(options.arguments, &error)) {
+    complain(error->message);
+    return std::nullopt;
+  }
   auto input = queryInput(options, platform::secondsSince1970(), &error);
   if (!input) {
     complain(error->message);
@@ -29,24 +37,6 @@ std::optional<QueryInput> readQuery(const Options& options) {
     for (const std::string& remark : input->remarks) complain(remark);
   }
   return input;
-}
-
-// By the catalogue of `tallow sync`, which is opened when the first such message is met.
-MailReader::OffsetOf offsetsOfSync(const Options& options) {
-  struct Opened {
-    bool tried = false;
-    std::unique_ptr<mailsync::Catalogue> catalogue;
-  };
-  return [opened = std::make_shared<Opened>(), settings = syncSettings(options)](
-             const std::string& identifier) -> std::optional<uint64_t> {
-    if (!std::exchange(opened->tried, true)) {
-      opened->catalogue = mailsync::openCatalogue(settings, nullptr);
-    }
-    if (opened->catalogue == nullptr) return std::nullopt;
-    const auto place = opened->catalogue->find(identifier);
-    if (!place || !place->offset) return std::nullopt;
-    return static_cast<uint64_t>(*place->offset);
-  };
 }
 
 // What has been found, with what is known of it.
@@ -70,7 +60,7 @@ void remarkOn(const SearchResults& found, size_t wanted, const MailFacts& facts)
 // Asks for more as long as copies of messages leave fewer results than are wanted.
 std::optional<Outcome> search(const Options& options, const QueryInput& input, MailFacts& facts,
                               TLErrorOut error) {
-  constexpr size_t kCounted = 1000;
+  constexpr size_t kCounted = 1000;  // also what makes threads, unless more are shown
   // Copies of the last message shown rank directly after it.
   constexpr size_t kCopies = 30;
   client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
@@ -79,6 +69,7 @@ std::optional<Outcome> search(const Options& options, const QueryInput& input, M
       limit == 0 || options.count ? SIZE_MAX : limit + static_cast<size_t>(options.offset);
   size_t wanted = shown > SIZE_MAX - kCopies ? SIZE_MAX : shown + kCopies;
   if (options.format == OutputFormat::json) wanted = std::max(wanted, kCounted);
+  if (options.threads) wanted = std::clamp(shown, kCounted, kMaxThreadedHits);
   for (;;) {
     auto found = runPlan(input.plan, {options.protectionClass, options.sort, wanted, options.count},
                          service, facts, error);
@@ -86,12 +77,24 @@ std::optional<Outcome> search(const Options& options, const QueryInput& input, M
     const bool all = found->complete || found->items.size() < wanted;
     if (all || wanted == SIZE_MAX) remarkOn(*found, wanted, facts);
     Hits hits = joinCopies(found->items, facts);
-    if (all || hits.size() >= shown || wanted > SIZE_MAX / 4) {
+    if (all || options.threads || hits.size() >= shown || wanted > SIZE_MAX / 4) {
       return Outcome{std::move(hits), std::move(found->items), found->complete,
                      std::move(found->replaced)};
     }
     wanted *= 4;
   }
+}
+
+// Where ranks are shown, they are known to `tallow show` afterwards.
+void keepRanks(const Options& options, const QueryInput& input, const Hits& hits,
+               const std::vector<size_t>& shown) {
+  const bool ranked = options.format == OutputFormat::text || options.format == OutputFormat::json;
+  if (!ranked || options.count) return;
+  LastSearch search{input.markedWords()};
+  for (const size_t hit : shown) {
+    search.results[hit + 1] = platform::toUTF8(platform::orEmpty(hits[hit].item->identifier()));
+  }
+  keepLastSearch(search);
 }
 
 ExitStatus statusOf(const ResultItems& items) {
@@ -114,6 +117,66 @@ std::string outputOf(const Options& options, const QueryInput& input, const Page
                      Palette(colorAllowed(options.color, STDOUT_FILENO)), columnsOf(STDOUT_FILENO));
 }
 
+ExitStatus printCount(size_t count) {
+  return print(fmt::format("{}\n", count), count > 0 ? ExitStatus::done : ExitStatus::nothingFound);
+}
+
+// The part of a list that the options ask for.
+template <typename T>
+std::span<const T> pageOf(const Options& options, std::span<const T> all) {
+  if (options.count) return {};
+  all = all.subspan(std::min(all.size(), static_cast<size_t>(options.offset)));
+  const auto limit = static_cast<size_t>(options.limit);
+  return limit == 0 ? all : all.first(std::min(all.size(), limit));
+}
+
+ExitStatus showHits(const Options& options, const QueryInput& input, const Outcome& outcome,
+                    MailFacts& facts) {
+  const size_t total = outcome.hits.size();
+  if (options.count && options.format != OutputFormat::json) return printCount(total);
+  const auto hits = pageOf<Hit>(options, outcome.hits);
+  const auto first = static_cast<size_t>(options.offset);
+  std::vector<size_t> shown(hits.size());
+  std::iota(shown.begin(), shown.end(), first);
+  keepRanks(options, input, outcome.hits, shown);
+  return print(
+      outputOf(options, input, {hits, first + 1, total, outcome.complete, outcome.replaced}, facts),
+      statusOf(outcome.items));
+}
+
+ExitStatus showThreads(const Options& options, const QueryInput& input, Outcome& outcome,
+                       MailFacts& facts) {
+  Hits& all = outcome.hits;
+  if (all.size() > kMaxThreadedHits) {
+    all.resize(kMaxThreadedHits);
+    outcome.complete = false;
+  }
+  if (!outcome.complete) {
+    complain(fmt::format("only the first {} results are put into threads", all.size()));
+  }
+  const std::vector<Thread> threads = threadsOf(all, facts);
+  if (options.count && options.format != OutputFormat::json) return printCount(threads.size());
+  const auto shown = pageOf<Thread>(options, threads);
+  const ThreadPage page{all, shown, threads.size(), outcome.complete};
+  std::vector<size_t> ranks;
+  for (const Thread& thread : shown) ranks.insert(ranks.end(), thread.begin(), thread.end());
+  keepRanks(options, input, all, ranks);
+  const ExitStatus status = statusOf(outcome.items);
+  if (options.format == OutputFormat::json) return print(threadsJSON(page, facts), status);
+  if (options.format == OutputFormat::text) {
+    return print(
+        threadsText(page, input.markedWords(), Palette(colorAllowed(options.color, STDOUT_FILENO)),
+                    columnsOf(STDOUT_FILENO)),
+        status);
+  }
+  // As lists of files or Message-IDs, thread by thread.
+  Hits ordered;
+  for (const size_t hit : ranks) ordered.push_back(all[hit]);
+  return print(outputOf(options, input,
+                        {ordered, 1, ordered.size(), outcome.complete, outcome.replaced}, facts),
+               status);
+}
+
 }  // namespace
 
 ExitStatus runSearch(const Options& options) {
@@ -121,7 +184,8 @@ ExitStatus runSearch(const Options& options) {
   if (!input) return ExitStatus::failure;
   std::optional<TLError> error;
   MailFacts facts(offsetsOfSync(options));
-  const auto outcome = search(options, *input, facts, &error);
+  if (isUnknownClass(options)) return complainOfUnknownClass(options);
+  auto outcome = search(options, *input, facts, &error);
   if (!outcome) return complain(error);
   if (outcome->items.empty()) {
     const bool useless = !options.query.empty() && termsOf(input->plan).empty();
@@ -129,17 +193,8 @@ ExitStatus runSearch(const Options& options) {
                                  : "no match"));
   }
   if (!outcome->replaced.empty()) complain(replacedText(outcome->replaced));
-  if (options.count && options.format != OutputFormat::json) {
-    return print(fmt::format("{}\n", outcome->hits.size()), statusOf(outcome->items));
-  }
-  std::span<const Hit> hits = outcome->hits;
-  hits = hits.subspan(std::min(hits.size(), static_cast<size_t>(options.offset)));
-  const auto limit = static_cast<size_t>(options.limit);
-  if (options.count) hits = {};
-  if (limit != 0) hits = hits.first(std::min(hits.size(), limit));
-  const Page page{hits, static_cast<size_t>(options.offset) + 1, outcome->hits.size(),
-                  outcome->complete, outcome->replaced};
-  return print(outputOf(options, *input, page, facts), statusOf(outcome->items));
+  return options.threads ? showThreads(options, *input, *outcome, facts)
+                         : showHits(options, *input, *outcome, facts);
 }
 
 // How the query is understood does not need the daemon, and is shown without it as well.
@@ -149,7 +204,9 @@ ExitStatus runExplain(const Options& options) {
   const std::vector<TALTerm> terms = termsOf(input->plan);
   std::optional<TLError> error;
   MailFacts facts(offsetsOfSync(options));
-  const auto outcome = search(options, *input, facts, &error);
+  const bool unknown = isUnknownClass(options);
+  const auto outcome = unknown ? Outcome() : search(options, *input, facts, &error);
+  if (unknown) (void)complainOfUnknownClass(options);
   if (outcome && outcome->items.empty() && !options.query.empty() && terms.empty()) {
     complain(std::string("nothing in the expression can be looked up; see tallow-query(7)"));
   }

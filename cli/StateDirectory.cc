@@ -1,8 +1,14 @@
 #include "cli/StateDirectory.h"
 
+#include <fmt/format.h>
+#include <sys/stat.h>
+
+#include <cerrno>
 #include <cstdlib>
 #include <filesystem>
 
+#include "cli/Commands.h"
+#include "client/Channel.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
 
@@ -13,19 +19,6 @@ namespace {
 std::string variable(const char* name) {
   const char* const value = std::getenv(name);
   return value == nullptr ? "" : value;
-}
-
-std::string defaultStateDirectory() {
-  if (!variable("STATE_DIRECTORY").empty()) return platform::stateDirectory();
-  const auto homes = {std::pair("XDG_STATE_HOME", ".local/state"),
-                      std::pair("XDG_CONFIG_HOME", ".config")};
-  for (const auto& [name, below] : homes) {
-    std::string base = variable(name);
-    if (base.empty()) base = platform::joinPath(variable("HOME"), below);
-    const std::string own = platform::joinPath(base, "tallow");
-    if (platform::fileExists(platform::processLockPath(own))) return own;
-  }
-  return platform::stateDirectory();
 }
 
 // Files may go while this looks.
@@ -43,13 +36,43 @@ std::optional<uint64_t> bytesIn(const std::filesystem::path& directory) {
 
 }  // namespace
 
-std::string daemonStateDirectory(const Options& options) {
-  return options.stateDirectory.empty() ? defaultStateDirectory() : options.stateDirectory;
+std::string stateDirectory(const Options& options) {
+  if (!options.stateDirectory.empty()) return options.stateDirectory;
+  if (!variable("STATE_DIRECTORY").empty()) return platform::stateDirectory();
+  const auto homes = {std::pair("XDG_STATE_HOME", ".local/state"),
+                      std::pair("XDG_CONFIG_HOME", ".config")};
+  for (const auto& [name, below] : homes) {
+    std::string base = variable(name);
+    if (base.empty()) base = platform::joinPath(variable("HOME"), below);
+    const std::string own = platform::joinPath(base, "tallow");
+    if (platform::fileExists(platform::processLockPath(own))) return own;
+  }
+  return platform::stateDirectory();
+}
+
+bool isUnknownClass(const Options& options) {
+  const bool told = !options.stateDirectory.empty() || !variable("STATE_DIRECTORY").empty();
+  if (!told && options.runtimeDirectory != client::defaultRuntimeDirectory()) return false;
+  if (!platform::namesOneDirectory(options.protectionClass)) return false;
+  const std::string state = stateDirectory(options);
+  if (!platform::fileExists(platform::processLockPath(state))) return false;
+  const std::string directory =
+      platform::joinPath(platform::dataRoot(state), options.protectionClass);
+  struct stat info;
+  return stat(directory.c_str(), &info) != 0 && errno == ENOENT;
+}
+
+ExitStatus complainOfUnknownClass(const Options& options) {
+  complain(
+      options.protectionClass == "default"
+          ? std::string("nothing has been indexed yet; `tallow sync ~/Mail` does that")
+          : fmt::format("nothing has been indexed for class \"{}\" yet", options.protectionClass));
+  return ExitStatus::nothingFound;
 }
 
 std::optional<DiskUse> diskUse(const Options& options) {
   if (!platform::namesOneDirectory(options.protectionClass)) return std::nullopt;
-  const std::string root = platform::dataRoot(daemonStateDirectory(options));
+  const std::string root = platform::dataRoot(stateDirectory(options));
   const std::string index = platform::textIndexPath(root, options.protectionClass);
   const auto indexBytes = bytesIn(index);
   const auto storeBytes = bytesIn(std::filesystem::path(index).parent_path() / "docstore");

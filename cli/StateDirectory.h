@@ -8,10 +8,18 @@
 
 namespace cli {
 
-// Where the daemon has its data: as the command line says, or as the daemon is told; else, when it
-// is the user's own service, where systemd puts its state, of new and of old; else as the system's
+// Where the daemon has its data: as the command line or $STATE_DIRECTORY says; else, when it is the
+// user's own service, where systemd puts its state, of new and of old; else as the system's
 // service.
-[[nodiscard]] std::string daemonStateDirectory(const Options& options);
+[[nodiscard]] std::string stateDirectory(const Options& options);
+
+// Whether the client can see that nothing was ever indexed for the class: a daemon has worked in
+// the state directory, and the class has no directory there. False where the state directory is not
+// known to be that of the daemon, or cannot be read.
+[[nodiscard]] bool isUnknownClass(const Options& options);
+
+// Says so; the status that goes with it.
+[[nodiscard]] ExitStatus complainOfUnknownClass(const Options& options);
 
 // Bytes of the files of one protection class.
 struct DiskUse {

@@ -95,6 +95,17 @@ std::string fitted(std::string_view text, size_t columns) {
   return std::string(text);
 }
 
+size_t columnsTaken(std::string_view text) {
+  const TLString units = platform::fromUTF8(text);
+  size_t columns = 0;
+  for (size_t i = 0; i < units.size();) {
+    UChar32 c;
+    U16_NEXT(units.data(), i, units.size(), c);
+    columns += widthOf(c);
+  }
+  return columns;
+}
+
 size_t columnsOf(int descriptor) {
   winsize size{};
   return isatty(descriptor) == 1 && ioctl(descriptor, TIOCGWINSZ, &size) == 0 ? size.ws_col : 0;

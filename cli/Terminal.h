@@ -21,6 +21,9 @@ namespace cli {
 // something is cut off: wide characters take two, combining ones none. 0 columns are no limit.
 [[nodiscard]] std::string fitted(std::string_view text, size_t columns);
 
+// The columns that a clean text takes.
+[[nodiscard]] size_t columnsTaken(std::string_view text);
+
 // The columns of a terminal; 0 where the descriptor is none.
 [[nodiscard]] size_t columnsOf(int descriptor);
 

@@ -9,14 +9,11 @@
 
 namespace mailsync {
 
-namespace {
-
 bool isAtOrBelow(const std::string& path, const std::string& place) {
   return path.starts_with(place) &&
          (path.size() == place.size() || place == "/" || path[place.size()] == '/');
 }
 
-// Messages whose folder's path begins with `place`.
 std::optional<client::SearchServiceProxy::Items> itemsAt(client::SearchServiceProxy& service,
                                                          const std::string& protectionClass,
                                                          const std::string& place,
@@ -32,8 +29,6 @@ std::optional<client::SearchServiceProxy::Items> itemsAt(client::SearchServicePr
       platform::fromUTF8(fmt::format("salt.maxTopK={}", kInventoryItems))));
   return service.searchItems(query, 0, protectionClass, kInventoryItems, error);
 }
-
-}  // namespace
 
 std::optional<std::vector<std::string>> readInventory(client::SearchServiceProxy& service,
                                                       const std::string& protectionClass,

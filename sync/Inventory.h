@@ -22,4 +22,11 @@ inline constexpr int64_t kInventoryItems = 50000;
     const std::vector<std::string>& roots, const std::vector<std::string>& folders,
     TLErrorOut error);
 
+// Messages whose folder's path begins with `place`, kInventoryItems at most.
+[[nodiscard]] std::optional<client::SearchServiceProxy::Items> itemsAt(
+    client::SearchServiceProxy& service, const std::string& protectionClass,
+    const std::string& place, TLErrorOut error);
+
+[[nodiscard]] bool isAtOrBelow(const std::string& path, const std::string& place);
+
 }  // namespace mailsync

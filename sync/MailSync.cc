@@ -24,11 +24,6 @@ std::string canonicalPath(const std::string& path) {
   return found;
 }
 
-bool isAtOrBelow(const std::string& path, const std::string& place) {
-  return path.starts_with(place) &&
-         (path.size() == place.size() || place == "/" || path[place.size()] == '/');
-}
-
 std::vector<std::string> outermost(std::vector<std::string> paths) {
   std::sort(paths.begin(), paths.end());
   std::vector<std::string> kept;

@@ -77,8 +77,6 @@ bool syncPlaces(const SyncSettings& settings, const std::vector<std::string>& pl
 // Absolute and without links; what is not there, as far as that goes.
 [[nodiscard]] std::string canonicalPath(const std::string& path);
 
-[[nodiscard]] bool isAtOrBelow(const std::string& path, const std::string& place);
-
 // Each of the paths once, and none that lies below another.
 [[nodiscard]] std::vector<std::string> outermost(std::vector<std::string> paths);
 

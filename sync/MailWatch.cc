@@ -9,6 +9,7 @@
 #include "cli/Identifier.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
+#include "sync/Inventory.h"
 
 namespace mailsync {
 

@@ -1,12 +1,17 @@
 # Bash completion of tallow(1).
 
+# The names of saved searches.
+_tallow_saved() {
+  command tallow save 2>/dev/null | cut -d ' ' -f 1
+}
+
 _tallow() {
   local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='index sync watch status search explain delete reset stats metrics ping vacuum state dump
-    validate purge help'
+  local commands='index sync watch status search explain show address save delete reset stats metrics ping
+    vacuum state dump validate purge help'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
     --verbose --dry-run --prune-missing --retry --on-battery --query --filter --param --offset --sort --count
-    --print0 --help --version'
+    --print0 --threads --raw --attachment --output --force --mutt --delete --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
     prev=${COMP_WORDS[COMP_CWORD - 2]}
@@ -19,7 +24,8 @@ _tallow() {
     --color) mapfile -t COMPREPLY < <(compgen -W 'auto always never' -- "$cur"); return ;;
     --sort) mapfile -t COMPREPLY < <(compgen -W 'relevance date' -- "$cur"); return ;;
     --runtime-dir | --state-dir) compopt -o dirnames; return ;;
-    --class | --name | --limit | --offset | --wait | --query | --filter | --param) return ;;
+    -o | --output) compopt -o default; return ;;
+    --class | --name | --limit | --offset | --wait | --attachment | --query | --filter | --param) return ;;
   esac
   if [[ $cur == -* ]]; then
     mapfile -t COMPREPLY < <(compgen -W "$options" -- "$cur")
@@ -28,7 +34,14 @@ _tallow() {
   local word
   for word in "${COMP_WORDS[@]:1:COMP_CWORD-1}"; do
     if [[ " $commands " == *" $word "* ]]; then
-      [[ $word == index || $word == sync || $word == watch ]] && compopt -o default
+      case $word in
+        index | sync | watch | show | delete) compopt -o default ;;
+        search | explain | save)
+          # Bash takes @NAME apart as well, and yet replaces all of it.
+          [[ $prev == @ || $cur == @* ]] &&
+            mapfile -t COMPREPLY < <(compgen -P @ -W "$(_tallow_saved)" -- "${cur#@}")
+          ;;
+      esac
       return
     fi
   done

@@ -9,7 +9,7 @@ commands=(
   'status:show mailboxes and index'
   'search:search for messages'
   'explain:search and show how the query is understood'
-  'delete:delete messages by identifier'
+  'delete:delete messages and folders from the index'
   'reset:delete everything that is indexed'
   'stats:show the statistics of store and index'
   'metrics:show the metrics of the text index'
@@ -19,6 +19,9 @@ commands=(
   'dump:print the text index, while no daemon runs'
   'validate:check the text index, while no daemon runs'
   'purge:remove what was deleted from the disk, while no daemon runs'
+  'show:show a message for reading'
+  'address:complete names and addresses'
+  'save:save a search under a name'
   'help:show how a command is used'
 )
 options=(
@@ -34,6 +37,13 @@ options=(
   '--offset=[results to pass over]:number:'
   '--sort=[order]:order:(relevance date)'
   '--count[only how many results]'
+  '--threads[results by conversation]'
+  '--raw[the message as it is on the disk]'
+  '--attachment=[save this attachment]:number:'
+  '(-o --output)'{-o+,--output=}'[where to]:file:_files'
+  '--force[replace the file]'
+  '--mutt[begin with the line that mutt skips]'
+  '--delete[forget a saved search]'
   '--print0[end each entry with NUL]'
   '*--filter=[only what it holds for]:expression:'
   '--param=[parameters of this search]:KEY=VALUE,...:'
@@ -46,4 +56,4 @@ options=(
   '(-h --help)'{-h,--help}'[show help]'
   '--version[show the version]'
 )
-_arguments -S $options '1:command:{_describe command commands}' '*:argument:{ [[ $words[(I)(index|sync|watch)] -gt 0 ]] && _files }'
+_arguments -S $options '1:command:{_describe command commands}' '*:argument:{ [[ $words[(I)(index|sync|watch|show|delete)] -gt 0 ]] && _files }'

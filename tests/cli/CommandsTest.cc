@@ -28,6 +28,14 @@ namespace {
 
 class CommandsTest : public testing::Test {
  protected:
+  // What the client keeps for its user goes into a directory of the test.
+  CommandsTest() {
+    for (const char* const name : {"XDG_STATE_HOME", "XDG_RUNTIME_DIR", "XDG_CONFIG_HOME"}) {
+      setenv(name, (home / name).c_str(), 1);
+    }
+    setenv("TALLOW_SESSION", "test", 1);
+  }
+
   // Runs the program with the arguments, and keeps its output.
   ExitStatus run(std::vector<std::string> arguments) {
     arguments.insert(arguments.begin(), {"tallow", "--runtime-dir", daemon.runtimeDirectory()});
@@ -83,6 +91,7 @@ class CommandsTest : public testing::Test {
     return item;
   }
 
+  const testsupport::TemporaryDirectory home;
   testsupport::FakeDaemon daemon;
   std::string output;
   std::string errors;
@@ -312,6 +321,22 @@ TEST_F(CommandsTest, CopiesOfAMessageAreOneResult) {
   EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 1000);
 }
 
+// A value before the command that is called like one is not it.
+TEST_F(CommandsTest, OptionsStandBeforeAndAfterTheCommand) {
+  const std::vector<std::vector<std::string>> same{
+      {"search", "--class=index", "--limit", "3", "--offset=1", "tea", "-milk"},
+      {"--class", "index", "--offset", "1", "--limit", "3", "search", "tea", "-milk"},
+      {"--limit=3", "search", "tea", "--class", "index", "-milk", "--offset=1"}};
+  std::vector<std::string> calls;
+  for (const auto& arguments : same) {
+    EXPECT_EQ(run(arguments), ExitStatus::nothingFound);
+    EXPECT_EQ(errors, "tallow: no match\n");
+    calls.push_back(daemon.calls().back());
+  }
+  EXPECT_THAT(calls[0], HasSubstr(", 0, index, "));
+  EXPECT_THAT(calls, testing::Each(calls[0]));
+}
+
 TEST_F(CommandsTest, IndexNamesTheItemsThatTheDaemonRefuses) {
   const testsupport::TemporaryDirectory mail;
   for (const char* name : {"a", "b", "poison", "c"}) {
@@ -321,7 +346,8 @@ TEST_F(CommandsTest, IndexNamesTheItemsThatTheDaemonRefuses) {
   daemon.refuseItemsWith("poison", {"TALIndexer", 1, "index failed"});
   EXPECT_EQ(run({"index", mail.path()}), ExitStatus::failure);
   EXPECT_EQ(output, "3 messages indexed, 1 refused by the daemon\n");
-  EXPECT_THAT(errors, HasSubstr("poison.eml: index failed"));
+  EXPECT_THAT(errors,
+              HasSubstr("poison.eml: the daemon could not put the message into the index\n"));
   EXPECT_EQ(daemon.indexedItems().size(), 3u);
   EXPECT_EQ(daemon.calls().size(), 5u);
 }
@@ -331,7 +357,7 @@ TEST_F(CommandsTest, IndexStopsAtAnErrorThatConcernsAll) {
   platform::writeFileAtomically(mail / "a.eml", "Subject: a\n\n", nullptr);
   daemon.failOnce("IndexItems", {"com.quill.tallow.TALIndexerManager", -2, "Indexer unavailable."});
   EXPECT_EQ(run({"index", mail.path()}), ExitStatus::failure);
-  EXPECT_THAT(errors, HasSubstr("Indexer unavailable."));
+  EXPECT_THAT(errors, HasSubstr("the index of this class cannot be opened now"));
   EXPECT_EQ(run({"index", mail.path()}), ExitStatus::done);
   EXPECT_EQ(run({"index", mail.path(), mail / "none"}), ExitStatus::failure);
   EXPECT_EQ(output, "1 messages indexed, 1 paths not read\n");
@@ -344,9 +370,35 @@ TEST_F(CommandsTest, DeleteGoesOnBehindAFailure) {
   daemon.failOnce("DeleteItemsWithIdentifiers", {"DocStore", 5, "unknown"});
   EXPECT_EQ(run({"delete", "file/a", "file/b"}), ExitStatus::failure);
   EXPECT_EQ(output, "deleted file/b\n");
-  EXPECT_THAT(errors, HasSubstr("tallow: file/a: unknown"));
+  EXPECT_THAT(errors, HasSubstr("tallow: file/a: the daemon's store failed: unknown\n"));
   EXPECT_THAT(daemon.calls(), ElementsAre("DeleteItemsWithIdentifiers([file/a], tallow, default)",
                                           "DeleteItemsWithIdentifiers([file/b], tallow, default)"));
+}
+
+// Folders are asked for, since the daemon deletes only folders that it is told by name.
+TEST_F(CommandsTest, DeleteTakesPathsAndFolders) {
+  const std::string folder = home / "Mail dir";
+  std::filesystem::create_directories(folder + "/cur");
+  const std::string mail = folder + "/cur/1.a:2,S";
+  platform::writeFileAtomically(mail, "Subject: s\n\n", nullptr);
+  daemon.failOnce("DeleteItemsWithIdentifiers", {"DocStore", 12, "no document with URL tlw://x"});
+  EXPECT_EQ(run({"delete", mail}), ExitStatus::nothingFound);
+  EXPECT_EQ(errors, "tallow: " + mail + ": not in the index\n");
+  EXPECT_EQ(run({"delete", mail}), ExitStatus::done);
+  const std::string identifier = cli::fileIdentifier(folder + "/cur/1.a");
+  EXPECT_EQ(daemon.calls().back(),
+            "DeleteItemsWithIdentifiers([" + identifier + "], tallow, default)");
+  std::vector<std::shared_ptr<TLIndexableItem>> items;
+  for (const char* const place : {"", "/.Old", "2", "/.Old"}) {
+    items.push_back(result("file/x"));
+    items.back()->setDomainIdentifier(platform::fromUTF8(cli::percentEncodePath(folder + place)));
+  }
+  answerWith(items);
+  EXPECT_EQ(run({"delete", folder + '/', "--format=json"}), ExitStatus::done);
+  EXPECT_EQ(nlohmann::json::parse(output)[0]["messages"], 3);
+  const std::string encoded = cli::percentEncodePath(folder);
+  EXPECT_EQ(daemon.calls().back(), "DeleteItemsWithDomainIdentifiers([" + encoded + ", " + encoded +
+                                       "/.Old], tallow, default)");
 }
 
 TEST_F(CommandsTest, ResetWithoutATerminalNeedsYes) {
@@ -382,7 +434,7 @@ TEST_F(CommandsTest, Diagnostics) {
   EXPECT_EQ(nlohmann::json::parse(output), nlohmann::json({{"vacuum", true}}));
   daemon.failOnce("ForceVacuumAndCompact", {"TALIndexer", 4, "shutting down"});
   EXPECT_EQ(run({"vacuum"}), ExitStatus::failure);
-  EXPECT_EQ(errors, "tallow: shutting down (TALIndexer 4)\n");
+  EXPECT_EQ(errors, "tallow: the daemon is about to end; try again in a moment\n");
 }
 
 TEST_F(CommandsTest, State) {
@@ -419,6 +471,22 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
   }
   EXPECT_EQ(run({"serach", "x"}), ExitStatus::failure);
   EXPECT_THAT(errors, HasSubstr("did you mean search?"));
+  const std::vector<std::pair<std::vector<std::string>, std::string>> kReasons{
+      {{"--format=xml", "ping"}, "\"xml\" is not one of files, json, message-ids, text\n"},
+      {{"search", "x", "--sort", "size"}, "\"size\" is not one of date, relevance\n"},
+      {{"search", "x", "--limit=2.5"}, "\"2.5\" is not a whole number from 0 on\n"},
+      {{"ping", "--wait=long"}, "\"long\" is not a number from 0 to 3600\n"},
+      {{"show", "1", "--attachment=0"}, "\"0\" is not a whole number from 1 on\n"},
+      {{"show", "1", "--attachment=1"}, "--attachment N and -o FILE go together\n"},
+      {{"ping", "a", "b"}, "tallow: TEXT can be given only once\n"},
+      {{"search", "x", "--sort"}, "tallow: --sort needs a value\n"},
+      {{}, "tallow: a command is missing\nRun `tallow help` for"},
+      {{"search", "x", "--sorted"}, "there is no option --sorted\nRun `tallow help search`"}};
+  for (const auto& [arguments, reason] : kReasons) {
+    EXPECT_EQ(run(arguments), ExitStatus::failure);
+    EXPECT_THAT(errors, HasSubstr(reason));
+    EXPECT_THAT(errors, testing::StartsWith("tallow: "));
+  }
   EXPECT_EQ(run({"frobnicate"}), ExitStatus::failure);
   EXPECT_THAT(errors, Not(HasSubstr("did you mean")));
   EXPECT_EQ(run({"--help"}), ExitStatus::done);
@@ -440,9 +508,6 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
 
 // The catalogue's part is shown with and without a daemon that answers.
 TEST_F(CommandsTest, SyncAndStatus) {
-  const testsupport::TemporaryDirectory home;
-  setenv("XDG_STATE_HOME", (home / "state").c_str(), 1);
-  setenv("XDG_CONFIG_HOME", (home / "config").c_str(), 1);
   const std::string mail = home / "mail";
   std::filesystem::create_directories(mail + "/cur");
   std::ofstream(mail + "/cur/1:2,S") << "Subject: a\n\nb\n";
@@ -467,12 +532,9 @@ TEST_F(CommandsTest, SyncAndStatus) {
   EXPECT_EQ(run({"status"}), ExitStatus::unreachable);
   EXPECT_THAT(output, HasSubstr(mail + ", 1 failed\n"));
   EXPECT_EQ(run({"sync"}), ExitStatus::unreachable);
-  unsetenv("XDG_STATE_HOME");
-  unsetenv("XDG_CONFIG_HOME");
 }
 
 TEST_F(CommandsTest, SyncTakesTheSettings) {
-  const testsupport::TemporaryDirectory home;
   setenv("XDG_STATE_HOME", (home / "state").c_str(), 1);
   setenv("XDG_CONFIG_HOME", (home / "config").c_str(), 1);
   for (const char* folder : {"in", "work", "old"}) {
@@ -497,6 +559,4 @@ TEST_F(CommandsTest, SyncTakesTheSettings) {
   EXPECT_EQ(run({"watch"}), ExitStatus::failure);
   EXPECT_THAT(errors,
               HasSubstr("config.toml:2: there is no key \"root\"; did you mean \"roots\"?"));
-  unsetenv("XDG_STATE_HOME");
-  unsetenv("XDG_CONFIG_HOME");
 }

@@ -1,0 +1,15 @@
+#pragma once
+
+#include <string>
+
+#include "platform/TLError.h"
+
+namespace cli {
+
+// What an error of the daemon or on the way to it means to a person: no URL, domain or number.
+[[nodiscard]] std::string plainText(const TLError& error);
+
+// Whether the daemon says that the index has no such message.
+[[nodiscard]] bool isNotIndexed(const TLError& error);
+
+}  // namespace cli

@@ -1,0 +1,48 @@
+#pragma once
+
+#include <gmime/gmime.h>
+
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "cli/TextDecoder.h"
+#include "platform/Text.h"
+
+// What all that takes mail apart needs of GMime.
+namespace cli {
+
+struct Unref {
+  void operator()(gpointer object) const { g_object_unref(object); }
+};
+template <typename T>
+using Object = std::unique_ptr<T, Unref>;
+
+struct Free {
+  void operator()(gpointer memory) const { g_free(memory); }
+};
+using CString = std::unique_ptr<char, Free>;
+
+// Has to come before anything else of GMime; any thread, any number of times.
+void initMIME();
+
+[[nodiscard]] std::string_view orEmpty(const char* text);
+[[nodiscard]] bool equalIgnoringCase(std::string_view a, std::string_view b);
+// Whether a text has nothing but white space.
+[[nodiscard]] bool isBlank(TLStringView text);
+
+// Null where the bytes are no message. GMime nests parts at most 1024 deep.
+[[nodiscard]] Object<GMimeMessage> parseMIME(std::string_view bytes);
+
+[[nodiscard]] bool isAttached(GMimeObject* object);
+
+// What was written to a stream in memory.
+[[nodiscard]] std::string bytesIn(GMimeStream* memory);
+
+// The content of a part without its transfer encoding.
+[[nodiscard]] std::string contentOf(GMimePart* part);
+
+// The text of a part, of which kMaximumBodyBytes are decoded.
+[[nodiscard]] TLString textOf(GMimePart* part, TextDecoder& decoder);
+
+}  // namespace cli

@@ -1,0 +1,99 @@
+#include "cli/Pager.h"
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <string>
+
+#include "cli/Commands.h"
+#include "platform/FileDescriptor.h"
+
+namespace cli {
+
+namespace {
+
+// How a shell says that there is no such program.
+constexpr int kNotFound = 127;
+
+std::string pagerCommand() {
+  const char* const pager = std::getenv("PAGER");
+  return pager == nullptr ? "less -R" : pager;
+}
+
+// While a pager has the terminal, Ctrl-C and Ctrl-\ are its own: this process outlives them.
+class IgnoredSignals {
+ public:
+  IgnoredSignals()
+      : _interrupt(std::signal(SIGINT, SIG_IGN)), _quit(std::signal(SIGQUIT, SIG_IGN)) {}
+  ~IgnoredSignals() {
+    std::signal(SIGINT, _interrupt);
+    std::signal(SIGQUIT, _quit);
+  }
+  IgnoredSignals(const IgnoredSignals&) = delete;
+  IgnoredSignals& operator=(const IgnoredSignals&) = delete;
+
+ private:
+  void (*const _interrupt)(int);
+  void (*const _quit)(int);
+};
+
+// The pager as a shell starts it, with the signals as a program expects them; 0 or an errno value.
+int start(const std::string& command, int input, pid_t& process) {
+  const std::array<const char*, 4> arguments{"sh", "-c", command.c_str(), nullptr};
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
+  posix_spawnattr_t attributes;
+  posix_spawnattr_init(&attributes);
+  sigset_t signals;
+  sigemptyset(&signals);
+  for (const int signal : {SIGPIPE, SIGINT, SIGQUIT}) sigaddset(&signals, signal);
+  posix_spawnattr_setsigdefault(&attributes, &signals);
+  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
+  const int result = posix_spawn(&process, "/bin/sh", &actions, &attributes,
+                                 const_cast<char* const*>(arguments.data()), environ);
+  posix_spawnattr_destroy(&attributes);
+  posix_spawn_file_actions_destroy(&actions);
+  return result;
+}
+
+// Stops where the reader has gone.
+void writeAll(int output, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t count = ::write(output, text.data(), text.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return;
+    text.remove_prefix(static_cast<size_t>(count));
+  }
+}
+
+}  // namespace
+
+ExitStatus page(std::string_view text) {
+  const std::string command = pagerCommand();
+  if (isatty(STDOUT_FILENO) != 1 || command.empty() || command == "cat") return print(text);
+  std::array<int, 2> pipe{-1, -1};
+  if (pipe2(pipe.data(), O_CLOEXEC) != 0) return print(text);
+  platform::FileDescriptor output(pipe[1]);
+  platform::FileDescriptor input(pipe[0]);
+  const IgnoredSignals ignored;
+  // A pager that is "less" alone would show escape sequences as text.
+  setenv("LESS", "R", 0);
+  pid_t process = -1;
+  if (start(command, input.get(), process) != 0) return print(text);
+  input.reset();
+  writeAll(output.get(), text);
+  output.reset();
+  int status = 0;
+  while (waitpid(process, &status, 0) < 0 && errno == EINTR) {
+  }
+  return WIFEXITED(status) && WEXITSTATUS(status) == kNotFound ? print(text) : ExitStatus::done;
+}
+
+}  // namespace cli

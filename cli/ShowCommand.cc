@@ -1,0 +1,242 @@
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <nlohmann/json.hpp>
+
+#include "cli/Commands.h"
+#include "cli/Highlight.h"
+#include "cli/LastSearch.h"
+#include "cli/MailFile.h"
+#include "cli/MailPlaces.h"
+#include "cli/MailView.h"
+#include "cli/Pager.h"
+#include "cli/Results.h"
+#include "platform/FileDescriptor.h"
+#include "platform/Files.h"
+
+namespace cli {
+
+namespace {
+
+// The longest name of a field, a colon and a space.
+constexpr size_t kFieldColumns = 10;
+
+std::optional<size_t> rankOf(const std::string& argument) {
+  size_t rank = 0;
+  const char* const end = argument.data() + argument.size();
+  const auto [stop, failure] = std::from_chars(argument.data(), end, rank);
+  if (argument.empty() || failure != std::errc() || stop != end) return std::nullopt;
+  return rank;
+}
+
+// A message that was asked for: by its identifier, and the words to mark in it.
+struct Wanted {
+  std::string identifier;
+  std::vector<std::string> words;
+};
+
+// None after a complaint, with the status that goes with it.
+std::optional<Wanted> wantedMessage(const std::string& argument, ExitStatus& status) {
+  const auto search = lastSearch();
+  Wanted wanted;
+  if (search) wanted.words = queryWords(search->words);
+  const auto rank = rankOf(argument);
+  if (!rank) {
+    wanted.identifier = namesPath(argument) ? identifiersOf(argument).front() : argument;
+    return wanted;
+  }
+  status = ExitStatus::failure;
+  if (!search) {
+    complain(std::string("a number is that of a result, and no search of this terminal is known"));
+    return std::nullopt;
+  }
+  const auto found = search->results.find(*rank);
+  if (found == search->results.end()) {
+    complain(fmt::format("the last search of this terminal showed no result {}", *rank));
+    status = ExitStatus::nothingFound;
+    return std::nullopt;
+  }
+  wanted.identifier = found->second;
+  return wanted;
+}
+
+std::optional<std::string> readMessage(const std::string& identifier, MailReader& reader) {
+  if (!parseIdentifier(identifier)) {
+    complain(fmt::format("{}: no message on this disk is named so", identifier));
+    return std::nullopt;
+  }
+  std::optional<TLError> error;
+  auto message = reader.read(identifier, kMaximumMessageBytes, &error);
+  if (!message) complain(fmt::format("{}: {}", identifier, error->message));
+  if (message && message->starts_with("From ") &&
+      isFromLine(message->substr(0, message->find('\n') + 1))) {
+    complain(
+        fmt::format("{}: this is a mailbox; name one of its messages, as `tallow search "
+                    "--format=files` does",
+                    identifier));
+    return std::nullopt;
+  }
+  return message;
+}
+
+std::string sizeText(uint64_t bytes) {
+  if (bytes < 1000) return fmt::format("{} B", bytes);
+  if (bytes < 1000000) return fmt::format("{:.1f} kB", static_cast<double>(bytes) / 1e3);
+  return fmt::format("{:.1f} MB", static_cast<double>(bytes) / 1e6);
+}
+
+// The message as one clean text, with words marked.
+std::string readingText(MailView& view, const std::string& path,
+                        const std::vector<std::string>& words, const Palette& palette) {
+  const auto marked = [&](const std::string& text) {
+    return highlight(cleanLinesForTerminal(text), words, palette.match, palette.end);
+  };
+  std::string out;
+  const auto addField = [&](const std::string& name, const std::string& value) {
+    out += fmt::format("{}{:{}}{}", palette.faint, name + ':', kFieldColumns, palette.end) + value +
+           '\n';
+  };
+  for (const auto& [name, value] : view.fields()) addField(name, marked(cleanForTerminal(value)));
+  addField("File", cleanForTerminal(path));
+  const std::string body = marked(view.text());
+  out += '\n' + (body.empty() ? fmt::format("{}(no text){}", palette.faint, palette.end) : body);
+  if (!out.ends_with('\n')) out += '\n';
+  if (!view.complete()) {
+    out += fmt::format("\n{}The text is longer than is shown; --raw shows all of it.{}\n",
+                       palette.faint, palette.end);
+  }
+  const auto attachments = view.attachments();
+  if (!attachments.empty()) {
+    out += fmt::format("\n{}Attachments, saved by --attachment N -o FILE:{}\n", palette.faint,
+                       palette.end);
+  }
+  size_t number = 0;
+  for (const auto& attachment : attachments) {
+    const std::string name = cleanForTerminal(attachment.name);
+    out += fmt::format("{:3}  {}  {}{}, {}{}\n", ++number, name.empty() ? "(no name)" : name,
+                       palette.faint, cleanForTerminal(attachment.type), sizeText(attachment.bytes),
+                       palette.end);
+  }
+  return out;
+}
+
+std::string readingJSON(MailView& view, const std::string& identifier, const std::string& path) {
+  nlohmann::json fields = nlohmann::json::object();
+  for (const auto& [name, value] : view.fields()) fields[name] = value;
+  nlohmann::json attachments = nlohmann::json::array();
+  for (const auto& [name, type, bytes] : view.attachments()) {
+    attachments.push_back(
+        {{"number", attachments.size() + 1}, {"name", name}, {"type", type}, {"bytes", bytes}});
+  }
+  const std::string text = view.text();
+  return jsonText({{"schema", 1},
+                   {"identifier", identifier},
+                   {"path", path},
+                   {"fields", std::move(fields)},
+                   {"text", text},
+                   {"complete", view.complete()},
+                   {"attachments", std::move(attachments)}});
+}
+
+bool writeAll(int file, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t count = write(file, bytes.data(), bytes.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return false;
+    bytes.remove_prefix(static_cast<size_t>(count));
+  }
+  return true;
+}
+
+// A new file that is not there yet; links are not followed. A part of one does not stay.
+bool writeNewFile(const std::string& path, std::string_view bytes) {
+  constexpr int kNew = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+  const platform::FileDescriptor file(open(path.c_str(), kNew, 0600));
+  if (file.get() < 0) return false;
+  if (writeAll(file.get(), bytes)) return true;
+  const int failure = errno;
+  unlink(path.c_str());
+  errno = failure;
+  return false;
+}
+
+// In place of a file, by one rename. What is no plain file stays.
+bool replaceFile(const std::string& path, std::string_view bytes) {
+  struct stat info;
+  if (lstat(path.c_str(), &info) == 0 && !S_ISREG(info.st_mode)) {
+    errno = S_ISDIR(info.st_mode) ? EISDIR : EEXIST;
+    return false;
+  }
+  std::string temporary = path + ".XXXXXX";
+  const platform::FileDescriptor file(mkostemp(temporary.data(), O_CLOEXEC));
+  if (file.get() < 0) return false;
+  if (writeAll(file.get(), bytes) && rename(temporary.c_str(), path.c_str()) == 0) return true;
+  const int failure = errno;
+  unlink(temporary.c_str());
+  errno = failure;
+  return false;
+}
+
+ExitStatus saveAttachment(const Options& options, const MailView& view) {
+  const size_t count = view.attachments().size();
+  if (options.attachment < 1 || static_cast<uint64_t>(options.attachment) > count) {
+    complain(count == 0 ? std::string("the message has no attachments")
+                        : fmt::format("the message has no attachment {}, only 1 to {}",
+                                      options.attachment, count));
+    return ExitStatus::failure;
+  }
+  const std::string bytes = view.attachment(static_cast<size_t>(options.attachment) - 1);
+  if (options.output == "-") {
+    if (isatty(STDOUT_FILENO) != 1) return print(bytes);
+    complain(std::string("an attachment does not go to a terminal; name a file: -o FILE"));
+    return ExitStatus::failure;
+  }
+  const bool saved =
+      options.force ? replaceFile(options.output, bytes) : writeNewFile(options.output, bytes);
+  if (saved) {
+    return print(
+        fmt::format("saved {} as {}\n", sizeText(bytes.size()), cleanForTerminal(options.output)));
+  }
+  if (errno != EEXIST) {
+    complain(platform::posixError(errno, options.output).message);
+  } else {
+    complain(options.output + (options.force ? " is not a plain file, and stays"
+                                             : " is there already; --force replaces a file"));
+  }
+  return ExitStatus::failure;
+}
+
+}  // namespace
+
+ExitStatus runShow(const Options& options) {
+  ExitStatus status = ExitStatus::failure;
+  const auto wanted = wantedMessage(options.arguments.front(), status);
+  if (!wanted) return status;
+  MailReader reader(offsetsOfSync(options));
+  const auto message = readMessage(wanted->identifier, reader);
+  if (!message) return ExitStatus::failure;
+  if (options.raw) {
+    // Other programs get it as it is.
+    return isatty(STDOUT_FILENO) == 1 ? page(cleanLinesForTerminal(*message)) : print(*message);
+  }
+  const auto view = MailView::parse(*message);
+  if (view == nullptr) {
+    complain(fmt::format("{}: not a mail message; --raw shows it as it is", wanted->identifier));
+    return ExitStatus::failure;
+  }
+  if (options.attachment != 0) return saveAttachment(options, *view);
+  const auto place = reader.locate(wanted->identifier);
+  const std::string path = place ? place->path : "";
+  if (options.format == OutputFormat::json) {
+    return print(readingJSON(*view, wanted->identifier, path));
+  }
+  return page(
+      readingText(*view, path, wanted->words, Palette(colorAllowed(options.color, STDOUT_FILENO))));
+}
+
+}  // namespace cli
