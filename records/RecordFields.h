@@ -100,7 +100,7 @@ template <typename Value>
 struct TLFieldKind {
   static_assert(std::is_arithmetic_v<Value> || std::is_enum_v<Value>);
   static constexpr bool isScalar = true;
-  static constexpr TLWireType wireType = std::is_same_v<Value, float>    ? TLWireType::fixed32
+  static constexpr TLWireType kWireType = std::is_same_v<Value, float>    ? TLWireType::fixed32
                                          : std::is_same_v<Value, double> ? TLWireType::fixed64
                                                                          : TLWireType::varint;
 
@@ -149,7 +149,7 @@ template <>
 struct TLFieldKind<std::optional<TLString>> {
   using Value = std::optional<TLString>;
   static constexpr bool isScalar = false;
-  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
+  static constexpr TLWireType kWireType = TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return value.has_value(); }
   static bool read(Value& value, TLReader& reader, uint64_t) {
@@ -171,7 +171,7 @@ template <>
 struct TLFieldKind<std::optional<std::string>> {
   using Value = std::optional<std::string>;
   static constexpr bool isScalar = false;
-  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
+  static constexpr TLWireType kWireType = TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return value.has_value(); }
   static bool read(Value& value, TLReader& reader, uint64_t) {
@@ -195,7 +195,7 @@ template <typename Record>
 struct TLFieldKind<std::shared_ptr<Record>> {
   using Value = std::shared_ptr<Record>;
   static constexpr bool isScalar = false;
-  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
+  static constexpr TLWireType kWireType = TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return value != nullptr; }
   static bool read(Value& value, TLReader& reader, uint64_t) {
@@ -237,7 +237,7 @@ template <typename Element, typename Elements>
 struct TLListKind {
   using Value = std::vector<Element>;
   static constexpr bool isScalar = false;
-  static constexpr TLWireType wireType =
+  static constexpr TLWireType kWireType =
       std::is_same_v<Element, int32_t> ? TLWireType::varint : TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return !value.empty(); }
@@ -345,7 +345,7 @@ struct TLFieldKind<TLRecordList<Record>> {
   using Value = TLRecordList<Record>;
   using Kind = TLFieldKind<typename Value::Records>;
   static constexpr bool isScalar = false;
-  static constexpr TLWireType wireType = TLWireType::lengthDelimited;
+  static constexpr TLWireType kWireType = TLWireType::lengthDelimited;
 
   static bool present(const Value& value) { return !value.empty(); }
   static bool read(Value& value, TLReader& reader, uint64_t wireType);
@@ -421,7 +421,7 @@ struct SubRecord<TLRecordList<Record>> {
 template <typename Record, typename Value>
 bool isValueAsWritten(const TLField<Record, Value>&, TLReader& reader, uint64_t wireType) {
   using Sub = typename SubRecord<Value>::type;
-  if (wireType != static_cast<uint64_t>(TLFieldKind<Value>::wireType)) return false;
+  if (wireType != static_cast<uint64_t>(TLFieldKind<Value>::kWireType)) return false;
   if constexpr (std::is_void_v<Sub>) {
     return reader.takeElement() && reader.skipValue(wireType);
   } else {
