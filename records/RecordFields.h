@@ -101,8 +101,8 @@ struct TLFieldKind {
   static_assert(std::is_arithmetic_v<Value> || std::is_enum_v<Value>);
   static constexpr bool isScalar = true;
   static constexpr TLWireType kWireType = std::is_same_v<Value, float>    ? TLWireType::fixed32
-                                         : std::is_same_v<Value, double> ? TLWireType::fixed64
-                                                                         : TLWireType::varint;
+                                          : std::is_same_v<Value, double> ? TLWireType::fixed64
+                                                                          : TLWireType::varint;
 
   static Value read(TLReader& reader) {
     if constexpr (std::is_same_v<Value, float>) {
