@@ -119,6 +119,7 @@ leveldb::Status IndexFiles::NewSequentialFile(const std::string& path,
 }
 
 leveldb::Status IndexFiles::NewWritableFile(const std::string& path, leveldb::WritableFile** file) {
+  if (isToBeRemoved(path)) waitForDisk();
   const leveldb::Status status = target()->NewWritableFile(path, file);
   return status.ok() ? wrap(path, file) : status;
 }
@@ -142,11 +143,22 @@ leveldb::Status IndexFiles::wrap(const std::string& path, leveldb::WritableFile*
 
 // leveldb asks again after each compaction for what it finds there and does not need.
 leveldb::Status IndexFiles::RemoveFile(const std::string& path) {
+  {
+    const platform::MutexLock lock(_mutex);
+    _removals.insert(path);
+  }
   inOrder([this, path] {
     (void)target()->RemoveFile(path);
+    const platform::MutexLock lock(_mutex);
+    _removals.erase(_removals.find(path));
     return leveldb::Status();
   });
   return {};
+}
+
+bool IndexFiles::isToBeRemoved(const std::string& path) {
+  const platform::MutexLock lock(_mutex);
+  return _removals.contains(path);
 }
 
 void IndexFiles::waitForDisk() {

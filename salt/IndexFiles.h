@@ -5,6 +5,7 @@
 #include <condition_variable>
 #include <functional>
 #include <memory>
+#include <set>
 #include <string>
 
 #include "platform/Mutex.h"
@@ -46,6 +47,8 @@ class IndexFiles final : public leveldb::EnvWrapper {
   // a read that fails ends everything as any other failure does, and the log stays.
   leveldb::Status NewSequentialFile(const std::string& path,
                                     leveldb::SequentialFile** file) override;
+  // A new file can have the name of one that a killed process has left, whose removal was asked for
+  // when the database was opened: that is waited for, so that it does not take the new file.
   leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override;
   leveldb::Status NewAppendableFile(const std::string& path, leveldb::WritableFile** file) override;
   leveldb::Status RemoveFile(const std::string& path) override;
@@ -65,6 +68,7 @@ class IndexFiles final : public leveldb::EnvWrapper {
 
   // What leveldb gets for a file that it writes; takes it.
   [[nodiscard]] leveldb::Status wrap(const std::string& path, leveldb::WritableFile** file);
+  [[nodiscard]] bool isToBeRemoved(const std::string& path) TL_EXCLUDES(_mutex);
   // Runs the step after all before it, unless one of them has failed.
   void inOrder(Step step);
   // The first failure, which stays.
@@ -77,7 +81,8 @@ class IndexFiles final : public leveldb::EnvWrapper {
   const std::string _crashNotes;
   platform::Mutex _mutex;
   std::condition_variable_any _tableDone;
-  size_t _tables TL_GUARDED_BY(_mutex) = 0;  // that are not on the disk yet
+  std::multiset<std::string> _removals TL_GUARDED_BY(_mutex);  // asked for and not done
+  size_t _tables TL_GUARDED_BY(_mutex) = 0;                    // that are not on the disk yet
   leveldb::Status _failure TL_GUARDED_BY(_mutex);
   LogSync _logs;
   platform::SerialQueue _steps;

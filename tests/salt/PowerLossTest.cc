@@ -170,4 +170,17 @@ TEST(PowerLoss, LeavesTheFirstOperationsWithoutAGap) {
   EXPECT_GT(before, 0u);
 }
 
+// A process that was killed leaves a table that no manifest names, and the number is given again.
+TEST(IndexFilesTest, ARemovalThatWaitsDoesNotTakeANewFileOfTheSameName) {
+  const testsupport::TemporaryDirectory directory;
+  const std::string path = directory / "000053.ldb";
+  salt::IndexFiles files(directory / "", leveldb::Env::Default());
+  for (int i = 0; i < 2000; ++i) ASSERT_TRUE(files.RemoveFile(path).ok());
+  leveldb::WritableFile* file = nullptr;
+  ASSERT_TRUE(files.NewWritableFile(path, &file).ok());
+  const std::unique_ptr<leveldb::WritableFile> table(file);
+  files.waitForDisk();
+  EXPECT_TRUE(files.FileExists(path));
+}
+
 }  // namespace
