@@ -31,7 +31,7 @@ constexpr size_t kMails = 1000;
 constexpr double kHalfLifeSeconds = 180 * 86400.0;
 constexpr double kUndatedWeight = 0.01;
 
-// Somebody who has written or was written to.
+// A sender or a recipient.
 struct Contact {
   std::string address;                       // as in the newest mail
   std::map<std::string, double> names = {};  // with their weight

@@ -33,7 +33,7 @@ class MailView {
   [[nodiscard]] std::vector<std::pair<std::string, std::string>> fields() const;
 
   // The inline text parts in their order, each HTML part as the text that it holds. Of alternatives
-  // the plain text, unless it is blank.
+  // the plain text, unless that is only white space.
   [[nodiscard]] std::string text();
   // False where a part was too long to be decoded to its end.
   [[nodiscard]] bool complete() const { return _complete; }

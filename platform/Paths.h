@@ -18,8 +18,8 @@ namespace platform {
 [[nodiscard]] std::string processLockPath(const std::string& state = stateDirectory());
 
 [[nodiscard]] std::string dataRoot(const std::string& state = stateDirectory());  // TallowSearch
-// What a purge of a class has in hand; whoever holds the process lock may remove it. Not below the
-// data root, where any name can be a class.
+// Where a purge builds a class. The holder of the process lock may remove it. Not below the data
+// root, where any name can be a class.
 [[nodiscard]] std::string purgeDirectory(const std::string& state = stateDirectory());
 [[nodiscard]] std::string synonymFilePath();  // TALLOW/en_synonyms.txt
 [[nodiscard]] std::string defaultsFilePath();

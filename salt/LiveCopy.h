@@ -35,7 +35,7 @@ class LiveCopy {
   }
   void copyHotPart();
   void copyShard(uint8_t shard);
-  // Puts aside the live suffixes of the page that the cursor stands on, and moves behind it.
+  // Appends the live suffixes of the cursor's page to _pending, and moves to the next page.
   void takePage(size_t live);
   void take(Suffix& suffix);
   void flushPage();

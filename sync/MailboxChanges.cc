@@ -223,7 +223,7 @@ void MailboxScan::readPlainFile(const std::string& path, FileRow& row) {
       if (added) _catalogue.setFailed(added->id, seen.problem);
     }
   }
-  // What lies behind a place that cannot be read is not known to be gone.
+  // After a place that cannot be read there may be messages: none of them is taken for gone.
   if (content.complete) {
     for (const auto& [identifier, message] : known) _catalogue.removeMessage(message.id);
   }
