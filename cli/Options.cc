@@ -10,8 +10,8 @@
 
 #include "cli/Arguments.h"
 #include "cli/Examples.h"
+#include "cli/NearestName.h"
 #include "client/Channel.h"
-#include "modification/WeightedDistance.h"
 
 namespace cli {
 
@@ -207,20 +207,6 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 
-// The command that was meant by a mistyped one, or null.
-const char* nearestCommand(const std::string& word) {
-  constexpr float kMostMistakes = 2;
-  float least = 0.6F;  // two mistakes, at most
-  const char* nearest = nullptr;
-  for (const CommandRow& row : kCommands) {
-    const float distance = weightedDistance(word, row.name, kMostMistakes, 1);
-    if (distance >= least) continue;
-    least = distance;
-    nearest = row.name;
-  }
-  return nearest;
-}
-
 // A word where the command should be; empty when something else is wrong.
 std::string unknownCommand(const CLI::App& app) {
   if (!app.get_subcommands().empty()) return "";
@@ -232,7 +218,7 @@ std::string unknownCommand(const CLI::App& app) {
 
 void complainOfCommand(const std::string& word) {
   std::cerr << "tallow: there is no command \"" << cleanForTerminal(word) << '"';
-  if (const char* const meant = nearestCommand(word))
+  if (const char* const meant = nearestName(word, kCommands))
     std::cerr << "; did you mean " << meant << '?';
   std::cerr << "\nRun `tallow help` for the list.\n";
 }

@@ -13,7 +13,7 @@
 #include <optional>
 
 #include "cli/MailFile.h"
-#include "modification/WeightedDistance.h"
+#include "cli/NearestName.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
 
@@ -140,15 +140,7 @@ std::string listOfKeys() {
 }
 
 std::string tellUnknown(std::string_view name) {
-  constexpr float kMostMistakes = 2;
-  float least = 0.6F;  // two mistakes, at most
-  const char* nearest = nullptr;
-  for (const Key& key : kKeys) {
-    const float distance = weightedDistance(name, key.name, kMostMistakes, 1);
-    if (distance >= least) continue;
-    least = distance;
-    nearest = key.name;
-  }
+  const char* const nearest = nearestName(name, kKeys);
   const std::string hint = nearest == nullptr ? "the keys are " + listOfKeys()
                                               : fmt::format("did you mean {}?", quoted(nearest));
   return fmt::format("there is no key {}; {}", quoted(name), hint);
