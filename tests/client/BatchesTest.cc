@@ -22,7 +22,7 @@ std::vector<size_t> counts(const std::vector<std::span<const client::EncodedItem
 
 }  // namespace
 
-// An element takes 4 bytes of length and its bytes, padded to a multiple of 4.
+// An element takes 4 bytes of length plus its bytes, padded to a multiple of 4.
 TEST(Batches, AreAsFullAsTheLimitAllows) {
   using Sizes = std::vector<size_t>;
   const struct {
@@ -48,13 +48,13 @@ TEST(Batches, AreAsFullAsTheLimitAllows) {
     EXPECT_EQ(counts(*pieces), c.counts) << "limit " << c.limit;
     const client::EncodedItem* next = items.data();
     for (const auto piece : *pieces) {
-      EXPECT_EQ(piece.data(), next);  // in order, nothing left out
+      EXPECT_EQ(piece.data(), next);  // in order and complete
       next += piece.size();
     }
   }
 }
 
-TEST(Batches, AnItemThatIsTooLongAloneIsNamed) {
+TEST(Batches, ErrorNamesAnItemThatExceedsTheLimit) {
   const auto items = itemsOfSizes({1, 97, 1});
   std::optional<TLError> error;
   EXPECT_FALSE(client::splitItems(items, &error, 100).has_value());
@@ -65,8 +65,8 @@ TEST(Batches, AnItemThatIsTooLongAloneIsNamed) {
   EXPECT_EQ(client::splitTexts(texts, &error, 16)->size(), 2u);
 }
 
-// A query that the daemon would refuse is not even written.
-TEST(Batches, AQueryKeepsToTheLimitsOfARecord) {
+// A query that the daemon would refuse is not even encoded.
+TEST(Batches, RefusesAQueryBeyondTheRecordLimits) {
   const auto inner = [](std::vector<std::shared_ptr<TLQueryNode>> childs) {
     auto node = std::make_shared<TLQueryNode>();
     node->setMergeOp(TLQueryNodeMergeOp::AND);

@@ -5,10 +5,10 @@
 #include <memory>
 #include <string>
 
-// For tests that come between leveldb and its files.
+// Fault injection between leveldb and its files.
 namespace salttest {
 
-// Hands everything on.
+// Forwards everything.
 class FileBetween : public leveldb::WritableFile {
  public:
   explicit FileBetween(leveldb::WritableFile* file) : _file(file) {}
@@ -22,7 +22,7 @@ class FileBetween : public leveldb::WritableFile {
   const std::unique_ptr<leveldb::WritableFile> _file;
 };
 
-// The real files, of which those that are written are seen first.
+// Forwards to the real files, but lets a test wrap every file that is opened for writing.
 class FilesBetween : public leveldb::EnvWrapper {
  public:
   FilesBetween() : leveldb::EnvWrapper(leveldb::Env::Default()) {}
@@ -36,7 +36,7 @@ class FilesBetween : public leveldb::EnvWrapper {
   }
 
  protected:
-  // What leveldb gets for a file that was opened; takes it.
+  // The wrapper of a file that was opened for writing; takes ownership.
   virtual leveldb::WritableFile* between(const std::string& path, leveldb::WritableFile* file) = 0;
 
  private:

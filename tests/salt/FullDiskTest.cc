@@ -13,7 +13,7 @@
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// A disk that is full at any moment of a merge.
+// A disk that becomes full at any point of a merge.
 namespace {
 
 using salt::Index;
@@ -23,7 +23,8 @@ using salttest::scan;
 using testsupport::LogCapture;
 using testsupport::TemporaryDirectory;
 
-// A disk with so many bytes left. A write that does not fit is cut and fails, as on a real one.
+// Limits the total bytes written. A write that does not fit is truncated and fails, as on a real
+// disk.
 class FullDisk final : public salttest::FilesBetween {
  public:
   void setBytesLeft(int64_t bytes) { _bytesLeft = bytes; }
@@ -63,8 +64,8 @@ void addDocs(Index& index, uint32_t from, uint32_t to) {
   }
 }
 
-// A shard and a hot part, which a merge commits in several batches. Merges start only when asked
-// for.
+// An index with a shard and a hot part whose merge takes several commits. Merges start on request
+// only.
 void makeIndex(const std::string& path) {
   Index::Options options;
   options.MaxHotSuffixes = kMaxHotSuffixes;
@@ -85,7 +86,7 @@ std::vector<std::string> sortedScan(const Index& index) {
   return found;
 }
 
-// The hot keys and the pages in the database.
+// The number of hot keys and of pages in the database.
 std::pair<uint64_t, uint64_t> countKeys(const std::string& path) {
   const salt::Database database = salt::openDatabase(path, salt::OpenMode::existing);
   const std::unique_ptr<leveldb::Iterator> key(database.db->NewIterator({}));
@@ -98,7 +99,7 @@ std::pair<uint64_t, uint64_t> countKeys(const std::string& path) {
 
 }  // namespace
 
-TEST(FullDisk, AMergeThatItCutsShortLosesNothingAndIsMadeUpFor) {
+TEST(FullDisk, AnInterruptedMergeLosesNothingAndIsRepeated) {
   const TemporaryDirectory directory;
   const std::string original = directory / "original";
   makeIndex(original);

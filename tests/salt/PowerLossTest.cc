@@ -11,21 +11,21 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// The power goes while leveldb writes tables and removes what they replace.
+// Power losses while leveldb writes tables and removes what they replace.
 namespace {
 
 using salt::Index;
 using testsupport::TemporaryDirectory;
 
-// Knows how much of each file is sure to be on the disk, and takes pictures of the directory as it
-// would be found if the power went now: each time a file is gone, or a manifest has grown. A
-// manifest reaches the disk sooner than it must, a table not before it is synced. Of each log the
-// synced part is there, all of it, or any part in between, whatever there is of the others.
+// Tracks how much of each file is certainly on disk, and takes snapshots of the directory as a
+// power loss would leave it: whenever a file is removed or a manifest grows. A manifest reaches the
+// disk as early as possible, a table only when it is synced. Of a log the snapshot has the synced
+// part, all of it, or any part in between, independently of other logs.
 class Disk final : public salttest::FilesBetween {
  public:
   struct Picture {
     std::string path;
-    uint32_t acknowledged = 0;  // what the caller has set by then
+    uint32_t acknowledged = 0;  // value set by the test by then
     enum class Logs { whole, synced, cut } logs;
   };
 
@@ -64,7 +64,7 @@ class Disk final : public salttest::FilesBetween {
     }
     leveldb::Status Sync() override {
       if (const leveldb::Status flushed = FileBetween::Flush(); !flushed.ok()) return flushed;
-      std::error_code gone;  // a log may be obsolete by now
+      std::error_code gone;  // an obsolete log may have been removed
       const uint64_t written = std::filesystem::file_size(_path, gone);
       const leveldb::Status status = FileBetween::Sync();
       if (!gone) _disk.synced(_path, written);
@@ -103,7 +103,7 @@ class Disk final : public salttest::FilesBetween {
       const std::filesystem::path file = path;
       const auto copy = std::filesystem::path(picture.path) / file.filename();
       if (file.extension() == ".ldb" && synced != 0) {
-        std::filesystem::create_hard_link(file, copy);  // it does not change any more
+        std::filesystem::create_hard_link(file, copy);  // immutable
         continue;
       }
       std::filesystem::copy_file(file, copy);
@@ -120,12 +120,12 @@ class Disk final : public salttest::FilesBetween {
 
   const std::string _directory;
   platform::Mutex _mutex;
-  std::map<std::string, uint64_t> _synced TL_GUARDED_BY(_mutex);  // bytes of files, by path
+  std::map<std::string, uint64_t> _synced TL_GUARDED_BY(_mutex);  // synced bytes by path
   std::vector<Picture> _pictures TL_GUARDED_BY(_mutex);
   std::mt19937 _random TL_GUARDED_BY(_mutex){7};
 };
 
-constexpr uint32_t kWords = 1000;  // of a document
+constexpr uint32_t kWords = 1000;  // per document
 
 void addDocs(Index& index, Disk& disk, uint32_t count) {
   std::mt19937 random(5);
@@ -170,7 +170,7 @@ TEST(PowerLoss, LeavesTheFirstOperationsWithoutAGap) {
   EXPECT_GT(before, 0u);
 }
 
-// A process that was killed leaves a table that no manifest names, and the number is given again.
+// A killed process leaves a table that no manifest lists, and its number is assigned again.
 TEST(IndexFilesTest, ARemovalThatWaitsDoesNotTakeANewFileOfTheSameName) {
   const testsupport::TemporaryDirectory directory;
   const std::string path = directory / "000053.ldb";

@@ -13,18 +13,18 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// A disk that takes its time.
+// Tests with delayed disk operations.
 namespace {
 
 using salt::Index;
 using salttest::addZone;
 
-// Where files of one kind can be held up: who writes to one waits until they go on.
+// Can block writes to files of one kind until they are released.
 class SlowDisk final : public salttest::FilesBetween {
  public:
   explicit SlowDisk(std::string suffix) : _suffix(std::move(suffix)) {}
 
-  // From the write on that follows so many others; a record of a log is two.
+  // Blocks from the write after so many others; a log record takes two.
   void holdUpAfter(int writes) {
     platform::MutexLock lock(_mutex);
     _heldUp = true;
@@ -35,7 +35,7 @@ class SlowDisk final : public salttest::FilesBetween {
     _heldUp = _waiting = false;
     _changed.notify_all();
   }
-  // Returns when somebody waits.
+  // Returns when a writer is blocked.
   void waitForWriter() {
     platform::MutexLock lock(_mutex);
     while (!_waiting) _changed.wait(_mutex);
@@ -87,8 +87,8 @@ std::unique_ptr<salt::index> openOn(SlowDisk* disk, const std::string& path) {
   return salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, disk));
 }
 
-// Runs `waits` while somebody waits for the disk already. Were it not to wait, `goesOn` would be
-// false; were the end not told, it would take ten seconds.
+// Runs `waits`, which is released from another thread. If it did not wait, `goesOn` would be false;
+// if its end were not notified, it would take ten seconds.
 template <typename Waits>
 void expectWaiting(SlowDisk* disk, const Waits& waits) {
   std::atomic<bool> begins = false;
@@ -106,7 +106,7 @@ void expectWaiting(SlowDisk* disk, const Waits& waits) {
 
 }  // namespace
 
-// Were a scan to wait for the write, this would wait for ever.
+// If scans waited for the write, this test would not end.
 TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   constexpr uint32_t kDocs = 20;
   const testsupport::TemporaryDirectory directory;
@@ -133,7 +133,7 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   const auto all = sortedScan(*index);
   EXPECT_EQ(all.size(), 2 * kDocs);
 
-  disk.holdUpAfter(2);  // the mark of a merge passes, its pages do not
+  disk.holdUpAfter(2);  // lets the record of the merge pass, but not its pages
   index->Vacuum();
   disk.waitForWriter();
   EXPECT_EQ(sortedScan(*index), all);
@@ -146,13 +146,13 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   EXPECT_TRUE(index->Validate());
 }
 
-TEST(SlowDisk, WhoAddsALotHoldsBackDuringACompaction) {
+TEST(SlowDisk, IngestWaitsDuringACompaction) {
   const testsupport::TemporaryDirectory directory;
   ASSERT_NE(salttest::newIndex(directory / "i"), nullptr);
   SlowDisk disk(".ldb");
   const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
-  index->WaitWhileTidying();  // for nothing
+  index->WaitWhileTidying();  // returns at once
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
 
   disk.holdUpAfter(0);
@@ -162,7 +162,7 @@ TEST(SlowDisk, WhoAddsALotHoldsBackDuringACompaction) {
   compacting.join();
 }
 
-TEST(SlowDisk, WhoAddsALotHoldsBackDuringAMerge) {
+TEST(SlowDisk, IngestWaitsDuringAMerge) {
   const testsupport::TemporaryDirectory directory;
   Index::Options options;
   options.MaxHotSuffixes = 4;
@@ -172,15 +172,15 @@ TEST(SlowDisk, WhoAddsALotHoldsBackDuringAMerge) {
   ASSERT_NE(index, nullptr);
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
 
-  disk.holdUpAfter(2);  // the mark of a merge passes, its pages do not
+  disk.holdUpAfter(2);  // lets the record of the merge pass, but not its pages
   index->Vacuum();
   disk.waitForWriter();
   expectWaiting(&disk, [&index] { index->WaitWhileTidying(); });
   EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
 }
 
-// A merge that would go on for long, and an index that nobody needs any more.
-TEST(SlowDisk, AnInterruptionEndsAMergeAndAllWaitingForIt) {
+// A merge that would run for long, in an index that nobody needs any more.
+TEST(SlowDisk, AnInterruptionEndsAMergeAndAllWaits) {
   constexpr uint32_t kDocs = 400;
   const testsupport::TemporaryDirectory directory;
   Index::Options options;
@@ -194,7 +194,7 @@ TEST(SlowDisk, AnInterruptionEndsAMergeAndAllWaitingForIt) {
   for (uint32_t docID = 1; docID <= kDocs; ++docID) {
     ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
   }
-  disk.holdUpAfter(2);  // the mark of the merge and its first pages pass
+  disk.holdUpAfter(2);  // lets the record of the merge and its first pages pass
   index->Vacuum();
   disk.waitForWriter();
   std::thread compacting([&index] { EXPECT_TRUE(index->Compact()); });
@@ -236,7 +236,7 @@ TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
 
 namespace {
 
-// Where syncs can be held up.
+// Can block syncs.
 class SlowSyncs final : public salttest::FilesBetween {
  public:
   void holdUp() { _gate = std::make_unique<Gate>(); }
@@ -273,7 +273,7 @@ class SlowSyncs final : public salttest::FilesBetween {
 
 }  // namespace
 
-// The thread that syncs in the background once spun with the lock held that the other needed.
+// The background sync thread once spun while it held the lock that the other thread needed.
 TEST(SlowDisk, ASyncEndsWhileMuchMoreIsWritten) {
   const testsupport::TemporaryDirectory directory;
   const std::string much(size_t{2} << 20, 'x');

@@ -12,7 +12,7 @@ namespace {
 
 using salttest::FileSizeLimit;
 
-// Some of the zones are longer than what is read on at a time; every tenth document has none.
+// Some zones are longer than one read-ahead; every tenth document has none.
 class ZoneTextsTest : public testing::Test {
  protected:
   ZoneTextsTest() {
@@ -59,7 +59,7 @@ TEST_F(ZoneTextsTest, GivesTheSameWithAFileOfAnyLength) {
   }
 }
 
-TEST_F(ZoneTextsTest, GoesOnWhereTheFileCannotGrow) {
+TEST_F(ZoneTextsTest, WorksWhenTheFileCannotGrow) {
   salt::ZoneTexts texts(index());
   {
     const FileSizeLimit limit(100000);

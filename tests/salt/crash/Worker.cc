@@ -15,10 +15,10 @@ namespace salttest {
 
 namespace {
 
-constexpr uint32_t kReopenings = 200;  // one in so many operations closes and opens the index first
-constexpr uint32_t kShortages = 25;    // the same for a shortage of space
+constexpr uint32_t kReopenings = 200;  // one in this many operations reopens the index first
+constexpr uint32_t kShortages = 25;    // one in this many changes the available space
 
-// While it lives, the file system of `path` has only so many bytes left.
+// During its lifetime the file system of `path` has only this much space left.
 class FullDisk {
  public:
   FullDisk(const std::string& path, uint64_t room) : _ballast(ballastOf(path)) {
@@ -60,7 +60,7 @@ class Worker {
   [[nodiscard]] bool isShort() const { return _shortage.index() != 0; }
   void endShortage() { _shortage.emplace<std::monostate>(); }
 
-  // Without space it may fail, with space never.
+  // May fail without space, but never with it.
   void reopen() {
     _index.reset();
     _index = loadIndex(_task.path);
@@ -70,8 +70,8 @@ class Worker {
     reopen();
   }
 
-  // A file may grow a little more than the log has, enough for some operations or some batches of a
-  // merge; or less, and tables come to their limit, too.
+  // Sets a new limit. A file may grow slightly beyond the log, enough for some operations or some
+  // batches of a merge; or less, so that tables reach the limit too.
   void changeSpace() {
     if (isShort()) return endShortage();
     if (_task.shortage == Shortage::fullDisk) {
@@ -83,8 +83,8 @@ class Worker {
     }
   }
 
-  // Tries until it is clear that the answer has nothing to do with space. What leveldb keeps in
-  // mind of a failure is forgotten when the index is opened again.
+  // Repeats until the answer cannot depend on space. Reopening the index makes leveldb forget an
+  // earlier failure.
   bool answer(const Operation& operation) {
     while (isShort()) {
       if (carryOut(*_index, operation)) return true;
