@@ -169,7 +169,7 @@ RPCServerConnection::Idleness RPCServerConnection::idleness() const {
 
 void RPCServerConnection::evict() {
   _evicted = true;
-  _outbox->post([this] { endBecause("another needs its place"); });
+  _outbox->post([this] { endBecause("evicted for a new connection"); });
 }
 
 void RPCServerConnection::serve() {
@@ -299,7 +299,7 @@ void RPCServerConnection::pump() {
         endMessage();
         break;
       case RPCFramer::Part::unacceptable:
-        return endBecause("it sends what is no message");
+        return endBecause("invalid message");
     }
   }
   if (_ending) return;
@@ -376,7 +376,7 @@ void RPCServerConnection::checkProgress() {
   if (_ending) return;
   const bool stuck = _reading && _framer.inMessage() && _messages == _messagesBefore &&
                      _received - _receivedBefore < kProgressBytes;
-  if (stuck) return endBecause("a message does not go on");
+  if (stuck) return endBecause("a message has stalled");
   _progressTimer.reset();
   watchProgress();
 }

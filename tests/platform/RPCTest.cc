@@ -333,7 +333,7 @@ TEST_F(RPCTest, ConnectionsAreLimitedAndSilentOnesAreEvicted) {
     EXPECT_TRUE(waitForEnd(descriptor));
     close(descriptor);
   }
-  EXPECT_EQ(log.count("not authenticated in time") + log.count("another needs its place"),
+  EXPECT_EQ(log.count("not authenticated in time") + log.count("evicted for a new connection"),
             platform::kMaximumConnections);
   EXPECT_EQ(working.echo("still"), "still");
 }
