@@ -72,6 +72,7 @@ class ItemSpool {
 };
 
 // Indexes the batch for the bench's client. Throws when the daemon refuses it.
-void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch);
+void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch,
+                const std::string& protectionClass = kProtectionClass);
 
 }  // namespace bench

@@ -44,6 +44,10 @@ class DaemonRun {
   // Processor time of all its threads so far. Steadier than the clock on a machine with other work.
   [[nodiscard]] double cpuSeconds() const;
 
+  // How many threads and open descriptors it has now.
+  [[nodiscard]] size_t threads() const { return countEntries("task"); }
+  [[nodiscard]] size_t descriptors() const { return countEntries("fd"); }
+
   // The kernel's number of its thread of this name; none when there is no such thread now.
   [[nodiscard]] std::optional<pid_t> threadNamed(const std::string& name) const;
 
@@ -54,6 +58,8 @@ class DaemonRun {
   void spawn(const std::string& stateDirectory, const std::string& notifyPath,
              const std::string& logPath);
   void awaitReady(int notifySocket) const;
+  // In a directory of /proc/PID.
+  [[nodiscard]] size_t countEntries(const char* directory) const;
   // The exit status, as waitpid gives it.
   int end(int signal);
 
