@@ -33,7 +33,7 @@ std::string errorsOf(const Command& command) {
   return command.output + ".errors";
 }
 
-// What happens to the descriptors of a program between its start and its first instruction.
+// The file descriptors of a program at its start.
 class FileActions {
  public:
   FileActions(const std::string& output, const std::string& errors) {
@@ -52,7 +52,7 @@ class FileActions {
   posix_spawn_file_actions_t _actions;
 };
 
-// Does not copy this process as fork does, so that its size is no part of what is timed.
+// Unlike fork, does not copy this process, so its size does not affect the timing.
 pid_t start(const Command& command) {
   std::vector<std::string> arguments = command.arguments;
   std::vector<std::string> environment = environmentWith(command.variables);
@@ -71,13 +71,13 @@ void untilDone(const Wait& wait) {
   }
 }
 
-// Leaves the process to be waited for again.
+// Waits for the end of the process but does not reap it.
 void awaitEnd(pid_t process) {
   siginfo_t unused{};
   untilDone([&] { return waitid(P_PID, process, &unused, WEXITED | WNOWAIT); });
 }
 
-// Takes the process away. Returns the processor time that it took.
+// Reaps the process and returns the processor time it used.
 double reap(pid_t process, const Command& command) {
   int status = 0;
   rusage usage{};

@@ -13,41 +13,41 @@
 #include "client/Batches.h"
 #include "client/SearchServiceProxy.h"
 
-// Mail on its way to the daemon, for the benchmarks.
+// Mail for the benchmarks, and its transfer to the daemon.
 namespace bench {
 
 inline constexpr const char* kClientName = "bench";
 inline constexpr const char* kProtectionClass = "default";
 
-// The index of the class, below a state directory.
+// The index of the class in a state directory.
 [[nodiscard]] std::string indexPath(const std::string& stateDirectory);
-// Its documents.
+// The document store of the class.
 [[nodiscard]] std::string documentStorePath(const std::string& stateDirectory);
 
-// Encoded items in a file, in batches as the client program makes them, so that parsing mail and
-// indexing it can be timed apart at a bounded cost of memory. One thread; others, and other
-// processes, may open the same file for themselves once it is filled.
+// A file of encoded items, in batches as the client program makes them. It separates the time of
+// parsing from that of indexing, with bounded memory. One thread; once filled, the same file may be
+// opened again by other threads and processes.
 class ItemSpool {
  public:
-  // Makes the file "items" in the directory.
+  // Creates the file "items" in the directory.
   explicit ItemSpool(const ScratchDirectory& scratch);
-  // Opens a file that was filled.
+  // Opens a filled file.
   explicit ItemSpool(const std::string& path);
 
-  // Parses the mail at the paths and stores its items; `visit`, which may be empty, sees each.
-  // Throws when a path cannot be read; messages that are no mail are counted and passed over.
+  // Parses the mail at the paths and stores its items; `visit`, which may be empty, is called with
+  // each. Throws if a path cannot be read; messages that are not mail are counted and skipped.
   void fill(const std::vector<std::string>& paths,
             const std::function<void(const client::EncodedItem&)>& visit = {});
 
-  // Reads the next batch; false, and none, at the end. `rewind` starts over.
+  // Reads the next batch; false, leaving it empty, at the end. `rewind` starts over.
   [[nodiscard]] bool next(std::vector<client::EncodedItem>& batch);
   void rewind();
 
-  // Hands all batches to the daemon, one call each. Throws at the first that it refuses.
+  // Sends all batches to the daemon, one call each. Throws at the first refusal.
   void send(client::SearchServiceProxy& service);
 
   [[nodiscard]] const std::string& path() const { return _path; }
-  // What `fill` has seen.
+  // Counts of `fill`.
   [[nodiscard]] uint64_t items() const { return _items; }
   [[nodiscard]] uint64_t unreadable() const { return _unreadable; }
   [[nodiscard]] uint64_t mailBytes() const { return _mailBytes; }
@@ -61,7 +61,7 @@ class ItemSpool {
   void write(const std::string& bytes);
   void writeCount(uint64_t count);
   std::string read();
-  // None at the end of the file.
+  // Nullopt at the end of the file.
   std::optional<uint64_t> readCount();
 
   const std::string _path;
@@ -71,7 +71,7 @@ class ItemSpool {
   uint64_t _mailBytes = 0;
 };
 
-// Indexes the batch for the bench's client. Throws when the daemon refuses it.
+// Indexes the batch for the benchmark's client. Throws if the daemon refuses it.
 void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch,
                 const std::string& protectionClass = kProtectionClass);
 

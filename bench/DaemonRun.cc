@@ -56,7 +56,7 @@ class Descriptor {
   const int _descriptor;
 };
 
-// Where a daemon sends that it is ready.
+// Binds the socket on which the daemon reports that it is ready.
 void bindTo(const Descriptor& socket, const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -122,7 +122,7 @@ void DaemonRun::spawn(const std::string& stateDirectory, const std::string& noti
   _pid = fork();
   if (_pid < 0) failWithErrno("fork");
   if (_pid > 0) return;
-  // The child: only calls that are safe between fork and exec.
+  // In the child only async-signal-safe calls are allowed.
   prctl(PR_SET_PDEATHSIG, SIGKILL);
   if (getppid() != parent) _exit(127);
   dup2(log.get(), STDERR_FILENO);
@@ -161,7 +161,7 @@ double DaemonRun::cpuSeconds() const {
 std::optional<pid_t> DaemonRun::threadNamed(const std::string& name) const {
   const std::string tasks = "/proc/" + std::to_string(_pid) + "/task";
   for (const auto& task : std::filesystem::directory_iterator(tasks)) {
-    std::ifstream file(task.path() / "comm");  // the thread may be gone by now
+    std::ifstream file(task.path() / "comm");  // the thread may have ended
     std::string found;
     if (std::getline(file, found) && found == name) return std::stoi(task.path().filename());
   }

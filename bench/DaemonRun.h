@@ -8,10 +8,10 @@
 
 #include "bench/MemoryWatch.h"
 
-// What the end-to-end benchmarks share: a daemon of their own, and figures.
+// Runs a daemon for the end-to-end benchmarks and measures it.
 namespace bench {
 
-// A fresh directory that is gone, with all in it, at the end.
+// A new directory, removed with its contents at the end.
 class ScratchDirectory {
  public:
   ScratchDirectory();
@@ -25,13 +25,14 @@ class ScratchDirectory {
   std::string _path;
 };
 
-// One tallowsearchd, taken from the directory of this program, on directories of its own. Its log
-// goes to the file "daemon.log" in the scratch directory.
+// One tallowsearchd from the directory of this program, with its own directories. Its log is the
+// file "daemon.log" in the scratch directory.
 //
-// Threads: one, the maker's. The daemon is killed when the program ends without `stop`.
+// Threads: used by one. The daemon is killed if the object is destroyed without `stop`.
 class DaemonRun {
  public:
-  // Returns once the daemon has said that it is ready; throws std::runtime_error when it does not.
+  // Returns when the daemon has reported that it is ready; throws std::runtime_error if it does
+  // not.
   DaemonRun(const ScratchDirectory& scratch, const std::string& stateDirectory);
   ~DaemonRun();
   DaemonRun(const DaemonRun&) = delete;
@@ -41,17 +42,17 @@ class DaemonRun {
 
   [[nodiscard]] Memory memory() { return _watch->memory(); }
 
-  // Processor time of all its threads so far. Steadier than the clock on a machine with other work.
+  // Processor time of all its threads so far; less noisy than wall time on a busy machine.
   [[nodiscard]] double cpuSeconds() const;
 
   // How many threads and open descriptors it has now.
   [[nodiscard]] size_t threads() const { return countEntries("task"); }
   [[nodiscard]] size_t descriptors() const { return countEntries("fd"); }
 
-  // The kernel's number of its thread of this name; none when there is no such thread now.
+  // The thread ID of its thread with this name; nullopt if there is none now.
   [[nodiscard]] std::optional<pid_t> threadNamed(const std::string& name) const;
 
-  // Asks the daemon to end and waits until it has; throws unless it ended well.
+  // Asks the daemon to end and waits; throws if it fails.
   void stop();
 
  private:
@@ -60,7 +61,7 @@ class DaemonRun {
   void awaitReady(int notifySocket) const;
   // In a directory of /proc/PID.
   [[nodiscard]] size_t countEntries(const char* directory) const;
-  // The exit status, as waitpid gives it.
+  // Returns the status from waitpid.
   int end(int signal);
 
   const std::string _runtimeDirectory;
@@ -68,16 +69,16 @@ class DaemonRun {
   std::optional<MemoryWatch> _watch;
 };
 
-// Sum of what the files at and below `path` take on the disk, in bytes.
+// Total disk space of the files in `path`, in bytes.
 [[nodiscard]] uint64_t bytesOnDisk(const std::string& path);
 
-// Seconds since some moment of the past.
+// Monotonic seconds.
 [[nodiscard]] double secondsNow();
 
 // Processor time of all threads of this process.
 [[nodiscard]] double cpuSecondsNow();
 
-// Calls `run`; an exception becomes a message and the exit status 1.
+// Calls `run`; turns an exception into a message and exit status 1.
 [[nodiscard]] int guarded(const char* program, int (*run)(int, char**), int argc, char** argv);
 
 }  // namespace bench

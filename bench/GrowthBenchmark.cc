@@ -13,22 +13,22 @@
 #include "bench/Percentiles.h"
 #include "bench/Queries.h"
 
-// What a mail and a query cost as the mailbox grows.
+// Measures the cost of a mail and of a query as the mailbox grows.
 namespace {
 
-// One size of the mailbox. The rates are of the last tenth of the mails that led to it.
+// One size of the mailbox. The rates are those of the last tenth of the mails added before it.
 struct Step {
   double mails = 0;
   double secondsPerMail = 0;
   double cpuPerMail = 0;  // of the daemon
-  double median = 0;      // of the queries, seconds
+  double median = 0;      // of the queries, in seconds
   double p95 = 0;
   double maximum = 0;
   double anonymousPeak = 0;  // bytes, since the start
-  double disk = 0;           // bytes, of all that the daemon keeps
+  double disk = 0;           // bytes of all files of the daemon
 };
 
-// The whole growth in one daemon: mail in, then queries, at each step.
+// Grows one mailbox in one daemon: at each step adds mail, then runs queries.
 class Growth {
  public:
   Growth(const bench::ScratchDirectory& scratch, std::string stateDirectory,
@@ -62,7 +62,7 @@ class Growth {
   void stop() { _daemon.stop(); }
 
  private:
-  // Until so many mails have been sent in all.
+  // Until this many mails have been sent in total.
   void send(size_t mails) {
     constexpr size_t kItemsACall = 100;
     while (_sent < mails) {
@@ -98,7 +98,7 @@ class Growth {
   bench::ItemSpool& _spool;
   const std::vector<std::string> _queries;
   std::vector<client::EncodedItem> _batch;
-  size_t _at = 0;  // in the batch
+  size_t _at = 0;  // index in the batch
   size_t _sent = 0;
 };
 
@@ -111,8 +111,7 @@ void print(const Step& step) {
   std::fflush(stdout);
 }
 
-// The e for which a figure grows like mails to the power of e, by least squares over the
-// logarithms.
+// Fits figure ~ mails^e by least squares over the logarithms and returns e.
 double exponent(const std::vector<Step>& steps, double Step::*figure) {
   double n = 0, sumX = 0, sumY = 0, sumXX = 0, sumXY = 0;
   for (const Step& step : steps) {
@@ -136,7 +135,7 @@ void printExponents(const std::vector<Step>& steps) {
       exponent(steps, &Step::anonymousPeak), exponent(steps, &Step::disk));
 }
 
-// Rising sizes, the last at most all mail; without any, a ninth, a third and all.
+// Ascending sizes, at most the number of mails; by default a ninth, a third and all.
 std::vector<size_t> sizesOf(std::vector<size_t> wanted, size_t mails) {
   if (wanted.empty()) wanted = {mails / 9, mails / 3, mails};
   std::erase_if(wanted, [mails](size_t size) { return size < 10 || size > mails; });

@@ -8,8 +8,8 @@
 #include "bench/DaemonRun.h"
 #include "bench/RawBatches.h"
 
-// How fast mail gets into the index through the daemon, held against the bound of its store: bare
-// batches of the same keys and texts, written to the same kind of database in the same run.
+// Measures indexing through the daemon against the bound of its store: raw batches with the same
+// keys and texts, written to the same kind of database in the same run.
 namespace {
 
 double megabytes(uint64_t bytes) {
@@ -41,7 +41,7 @@ int run(int argc, char** argv) {
   bench::DaemonRun daemon(scratch, stateDirectory);
   client::SearchServiceProxy service(daemon.runtimeDirectory());
   std::optional<TLError> error;
-  // Makes the index, which is no part of indexing.
+  // Creates the index, which should not count as indexing.
   const auto none =
       service.fetchLastClientState(bench::kClientName, bench::kProtectionClass, &error);
   if (error) throw std::runtime_error("opening: " + platform::printable(error));

@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::chrono::milliseconds kSampleInterval(20);
 
-// Kilobytes of one line of /proc/PID/status, in bytes.
+// The value of one line of /proc/PID/status, converted from kilobytes to bytes.
 uint64_t statusBytes(const std::string& status, std::string_view field) {
   const size_t at = status.find(field);
   if (at == std::string::npos) return 0;

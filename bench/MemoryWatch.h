@@ -10,19 +10,19 @@
 
 namespace bench {
 
-// Resident memory of a process, in bytes. The kernel counts a thread's pages in bulk, so that each
-// figure may be off by some hundred kilobytes.
+// Resident memory of a process in bytes. The kernel updates its counters in batches, so each value
+// may be off by a few hundred kilobytes.
 struct Memory {
   uint64_t anonymous = 0;      // RssAnon
-  uint64_t anonymousPeak = 0;  // highest RssAnon seen, looked at every 20 ms
-  uint64_t residentPeak = 0;   // VmHWM: mapped files count too
+  uint64_t anonymousPeak = 0;  // highest RssAnon, sampled every 20 ms
+  uint64_t residentPeak = 0;   // VmHWM, which includes mapped files
 };
 
-// Looks at the memory of one process every 20 ms. (What the kernel hands out about a child that has
-// ended is no substitute: it counts in the memory of the parent that it was forked from.)
+// Samples the memory of one process every 20 ms. (The kernel's figures for a child that has ended
+// are unsuitable: they include the memory of the parent before the fork.)
 //
-// Threads: one, the maker's. A sampling thread, joined by `stop`, shares `_memory` only. The
-// process must not be waited for before `stop`: its number could go to another one.
+// Threads: used by one. A sampling thread, joined by `stop`, shares only `_memory`. The process
+// must not be reaped before `stop`, because its PID could be reused.
 class MemoryWatch {
  public:
   explicit MemoryWatch(pid_t process);
@@ -30,7 +30,7 @@ class MemoryWatch {
   MemoryWatch(const MemoryWatch&) = delete;
   MemoryWatch& operator=(const MemoryWatch&) = delete;
 
-  // As of now; after `stop`, or the end of the process, as it was then.
+  // The current value; after `stop` or the end of the process, the last one.
   [[nodiscard]] Memory memory() TL_EXCLUDES(_mutex);
 
   void stop() TL_EXCLUDES(_mutex);

@@ -13,8 +13,8 @@ class Percentiles {
 
   [[nodiscard]] size_t size() const { return _values.size(); }
 
-  // The smallest value that at least the share `part` (0 to 1) of all values does not pass; 0
-  // without any.
+  // The smallest value that is not below at least the share `part` (0 to 1) of all values; 0
+  // without values.
   [[nodiscard]] double at(double part) const {
     if (_values.empty()) return 0;
     std::vector<double> sorted = _values;

@@ -6,7 +6,7 @@
 #include "bench/Percentiles.h"
 #include "client/DebugServiceProxy.h"
 
-// How long a call through the daemon takes that does nothing there.
+// Measures an empty call to the daemon.
 namespace {
 
 constexpr int kWarmUpPings = 100;

@@ -26,7 +26,7 @@ bool isLetter(char16_t unit) {
   return (unit | 0x20) >= u'a' && (unit | 0x20) <= u'z';
 }
 
-// The words of a text that are ASCII letters alone, in order.
+// The words of a text that consist of ASCII letters only, in order.
 std::vector<std::string> lettersOf(TLStringView text) {
   std::vector<std::string> words;
   for (size_t at = 0; at < text.size();) {

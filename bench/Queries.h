@@ -10,32 +10,32 @@
 #include "client/Batches.h"
 #include "client/SearchServiceProxy.h"
 
-// Searches as somebody types them.
+// Searches as users type them.
 namespace bench {
 
-// A query has one to this many words.
+// Upper bound of words in a query.
 inline constexpr size_t kMaximumWords = 3;
 
-// How many results a search asks for: what a list on a screen has use for.
+// Number of results a search asks for: enough for a list on a screen.
 inline constexpr int64_t kMaximumResults = 50;
 
-// Draws queries from mail that it sees once: a sample of fixed size in which each mail has the same
-// chance to be. The same mail and seed give the same queries.
+// Draws queries from a uniform sample, of fixed size, of the mail it is shown once. The same mail
+// and seed give the same queries.
 class QuerySource {
  public:
   explicit QuerySource(uint32_t seed) : _random(seed) {}
 
   void see(const client::EncodedItem& encoded);
 
-  // `words` words of ASCII letters that follow one another in a subject or a body, parted by
-  // blanks, the last cut to its first letters.
+  // `words` consecutive words of ASCII letters from a subject or a body, joined by spaces, the last
+  // one cut to its first letters.
   [[nodiscard]] std::string draw(size_t words);
 
-  // Queries of one, two, three, one ... words.
+  // Queries of one, two, three, one, ... words.
   [[nodiscard]] std::vector<std::string> drawAll(size_t count);
 
-  // Three whole words of which one, of five letters or more, has one letter wrong, missing, doubled
-  // or exchanged with its neighbour; the mistyped word by itself as well.
+  // Three whole words, one of which, with at least five letters, has one letter wrong, missing,
+  // doubled or swapped with its neighbour; and the mistyped word by itself.
   struct Mistyped {
     std::string query;
     std::string word;
@@ -43,10 +43,10 @@ class QuerySource {
   [[nodiscard]] Mistyped drawMistyped();
 
  private:
-  // The remainder is the same everywhere, which distributions of the library are not.
+  // Unlike the distributions of the library, the remainder is the same on every platform.
   size_t below(size_t limit) { return _random() % limit; }
 
-  // Words of ASCII letters that follow one another.
+  // Consecutive words of ASCII letters.
   std::vector<std::string> phrase(size_t words);
   std::string mistype(std::string word);
 
@@ -55,8 +55,8 @@ class QuerySource {
   std::vector<std::array<std::vector<std::string>, 2>> _mails;  // words of subject and body
 };
 
-// A file of queries has one a line. Both throw when it cannot be read or written; one that holds
-// no query cannot be read.
+// A file of queries has one per line. Both functions throw if the file cannot be read or written,
+// or contains no query.
 [[nodiscard]] std::vector<std::string> readQueries(const std::string& path);
 void writeQueries(const std::vector<std::string>& queries, const std::string& path);
 
@@ -67,8 +67,8 @@ struct TimedSearch {
   size_t results;
 };
 
-// One search through the daemon, from the call to the decoded items. Throws when it fails. With
-// `asTyped` words that find nothing are not changed.
+// One search through the daemon, from the call to the decoded items. Throws on failure. With
+// `asTyped` the query is not modified.
 [[nodiscard]] TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& query,
                                       bool asTyped = false,
                                       const std::string& protectionClass = kProtectionClass);

@@ -5,7 +5,7 @@
 #include "platform/Log.h"
 #include "query/TLQueryAdditions.h"
 
-// From the text of a query to its optimised tree. The log is as a program has it.
+// Measures the way from the text of a query to its optimised tree, with logging as in a program.
 namespace {
 
 constexpr const char* kAttributes[] = {"kTLItemSubject", "kTLItemAuthors", "kTLItemTextContent",
@@ -16,14 +16,14 @@ std::string clause(size_t i) {
          std::to_string(i) + "*\"cdw";
 }
 
-// A disjunction of comparisons that all differ.
+// A disjunction of distinct comparisons.
 TLString chain(size_t clauses) {
   std::string text = clause(0);
   for (size_t i = 1; i < clauses; ++i) text += " || " + clause(i);
   return platform::fromUTF8(text);
 }
 
-// Groups of connectives, constants, numbers, times and words in five attributes.
+// Connectives, constants, numbers, times, and words in five attributes, in groups.
 TLString mixture(size_t clauses) {
   std::string text;
   for (size_t i = 0; i < clauses; i += 10) {

@@ -18,7 +18,7 @@ namespace bench {
 
 namespace {
 
-// The text of one zone and where its suffixes begin, as ranges of the arrays of all.
+// The text of one zone and its suffixes, as ranges of the common arrays.
 struct Zone {
   uint32_t docID;
   uint16_t zoneID;
@@ -28,13 +28,13 @@ struct Zone {
   size_t offsetCount = 0;
 };
 
-// What a finished index holds, document by document. Takes 8 bytes a suffix beside all texts.
+// The contents of a finished index, document by document. Takes 8 bytes per suffix besides all
+// texts.
 struct IndexContents {
   salt::Index::OptionsBlock options;
   std::string texts;
   std::vector<Zone> zones;
-  // Document, zone and offset of each suffix, so that the order of the numbers is that of the
-  // zones.
+  // Document, zone and offset of each suffix, packed so that numeric order is the order of zones.
   std::vector<uint64_t> suffixes;
 
   static constexpr unsigned kZoneShift = 18;

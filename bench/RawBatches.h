@@ -11,10 +11,10 @@ struct RawRun {
   double cpuSeconds;  // of all threads of this process
 };
 
-// The bound that the store sets to indexing: writes the texts and suffixes of the index at
-// `indexPath`, which nobody has open, as one bare batch a zone to a new database of the same kind
-// at `path`. Making the keys from the texts is timed too, reading the index is not. Takes 8 bytes a
-// suffix beside all texts. Throws when either database fails.
+// The upper bound that the store sets for indexing: writes the texts and suffixes of the closed
+// index at `indexPath` to a new database of the same kind at `path`, one raw batch per zone. The
+// time includes making the keys from the texts, but not reading the index. Takes 8 bytes per suffix
+// besides all texts. Throws if either database fails.
 [[nodiscard]] RawRun writeRawBatches(const std::string& indexPath, const std::string& path);
 
 }  // namespace bench

@@ -8,7 +8,7 @@
 
 namespace {
 
-// An item as a mail client sends it: a text body of 4 KiB among eight attributes.
+// An item as a mail client sends it, with eight attributes, among them a text body of 4 KiB.
 std::shared_ptr<TLIndexableItem> mailItem() {
   auto item = std::make_shared<TLIndexableItem>();
   item->setIdentifier(u"mbox/home/ann/mail/2023.mbox?offset=123456");
@@ -24,7 +24,7 @@ std::shared_ptr<TLIndexableItem> mailItem() {
   return item;
 }
 
-// The same as the document store keeps it.
+// The same item as the document store keeps it.
 std::shared_ptr<TLIndexableItem> storedItem() {
   auto item = std::make_shared<TLIndexableItem>();
   const auto mail = mailItem();
@@ -53,7 +53,7 @@ void readStoredItem(benchmark::State& state) {
 }
 BENCHMARK(readStoredItem);
 
-// As a search does with its hits: all are alive at once.
+// Like a search with its results: all items exist at once.
 void readStoredItemsInBulk(benchmark::State& state) {
   const std::string bytes = storedItem()->data();
   const auto count = static_cast<size_t>(state.range(0));
@@ -76,7 +76,7 @@ void writeMailItem(benchmark::State& state) {
 }
 BENCHMARK(writeMailItem);
 
-// The last row of the table: the longest walk.
+// The last row of the table: the longest linear search.
 void readParameter(benchmark::State& state) {
   const auto params = TLParamsManager::paramsFromFallback();
   for (auto _ : state) {

@@ -22,7 +22,7 @@ struct Zone {
   std::vector<uint32_t> offsets;
 };
 
-// Words of a vocabulary by a distribution that falls as 1/rank, as in mail.
+// Words with a 1/rank distribution, as in mail.
 class Texts {
  public:
   Texts() {
@@ -70,7 +70,7 @@ std::unique_ptr<salt::Index> newIndex(const ScratchPath& path) {
   return std::unique_ptr<salt::Index>(salt::NewIndex(options));
 }
 
-// Several zones a document, as the indexer adds them: one long text and some short ones.
+// Several zones per document, as the indexer adds them: one long text and some short ones.
 void addDocument(salt::Index& index, uint32_t docID, Zone zone) {
   index.AddZone(docID, kZone, zone.text, zone.offsets, true);
   for (uint16_t zoneID = 1; zoneID < kZone; ++zoneID) {
@@ -94,7 +94,7 @@ void AddZone(benchmark::State& state) {
 }
 BENCHMARK(AddZone)->Iterations(10000)->Unit(benchmark::kMicrosecond);
 
-// The bound that AddZone is held against: bare batches of the same keys and texts.
+// The upper bound for AddZone: raw batches with the same keys and texts.
 void RawBatches(benchmark::State& state) {
   const ScratchPath path("salt-bench-raw");
   salt::Database database = salt::openDatabase(path.string(), salt::OpenMode::create);
@@ -129,7 +129,7 @@ void RawBatches(benchmark::State& state) {
 }
 BENCHMARK(RawBatches)->Iterations(10000)->Unit(benchmark::kMicrosecond);
 
-// An index of 1,500 documents, all hot or all in pages, with the whole database sorted.
+// An index of 1,500 documents, either all hot or all in pages, with the database fully compacted.
 struct Filled {
   ScratchPath path{"salt-bench-read"};
   Texts texts;
@@ -156,7 +156,7 @@ Filled& filled(bool merged) {
   return merged ? pages : hot;
 }
 
-// The arguments: whether the suffixes are in pages, and the rank of the word in the vocabulary.
+// Arguments: whether the suffixes are in pages, and the rank of the word in the vocabulary.
 void ScanPrefix(benchmark::State& state) {
   Filled& data = filled(state.range(0) != 0);
   const std::string prefix = data.texts.word(static_cast<size_t>(state.range(1))) + ' ';
@@ -174,7 +174,7 @@ BENCHMARK(ScanPrefix)
     ->ArgNames({"pages", "rank"})
     ->Unit(benchmark::kMicrosecond);
 
-// What a search asks. The last argument: whether the answer is remembered from the time before.
+// The scan that a search uses. Last argument: whether the result of the previous scan is cached.
 void ScanPlaces(benchmark::State& state) {
   Filled& data = filled(state.range(0) != 0);
   const std::string prefix = data.texts.word(static_cast<size_t>(state.range(1))) + ' ';
@@ -184,7 +184,7 @@ void ScanPlaces(benchmark::State& state) {
   for (auto _ : state) {
     if (state.range(2) == 0) {
       state.PauseTiming();
-      data.index->DeleteDoc(++unused);  // ends what is remembered
+      data.index->DeleteDoc(++unused);  // empties the cache
       state.ResumeTiming();
     }
     results += *data.index->ScanPlaces(
@@ -203,7 +203,7 @@ BENCHMARK(ScanPlaces)
     ->ArgNames({"pages", "rank", "remembered"})
     ->Unit(benchmark::kMicrosecond);
 
-// Moves 460,000 hot suffixes into pages; the argument is how many documents' are there before.
+// Merges 460,000 hot suffixes; the argument is the number of documents merged before.
 void Merge(benchmark::State& state) {
   uint64_t suffixes = 0;
   for (auto _ : state) {
@@ -232,8 +232,8 @@ void Merge(benchmark::State& state) {
 }
 BENCHMARK(Merge)->Arg(0)->Arg(1500)->Iterations(1)->Unit(benchmark::kMillisecond)->UseRealTime();
 
-// Two whole words and the beginning of a third, with a limit that the whole index is above. The
-// last argument: whether one without limit came before, as before a search with changed words.
+// Two whole words and the start of a third, with a limit below the size of the index. Last
+// argument: whether a search without limit ran before, as before one with modified words.
 void Search(benchmark::State& state) {
   Filled& data = filled(state.range(0) != 0);
   const auto term = [](const std::string& token) {
@@ -250,7 +250,7 @@ void Search(benchmark::State& state) {
                                         term(data.texts.word(20).substr(0, 2))};
     benchmark::DoNotOptimize(saltsearch::Search(*data.index, terms, {50, maxSuffixes, 0.01}));
   };
-  data.index->DeleteDoc(2 * Filled::kDocuments);  // ends what is remembered
+  data.index->DeleteDoc(2 * Filled::kDocuments);  // empties the cache
   if (state.range(1) != 0) search(SIZE_MAX);
   for (auto _ : state) search(100000);
 }

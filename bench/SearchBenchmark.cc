@@ -8,7 +8,7 @@
 #include "bench/Percentiles.h"
 #include "bench/Queries.h"
 
-// How long the daemon takes to answer while somebody types.
+// Measures the response time of the daemon while a user types.
 namespace {
 
 std::string figures(const std::string& name, const bench::Percentiles& times) {
@@ -16,14 +16,14 @@ std::string figures(const std::string& name, const bench::Percentiles& times) {
                      times.at(0.5) * 1e3, name, times.at(0.95) * 1e3, name, times.at(1) * 1e3);
 }
 
-// Queries of which the daemon knows one word not at all.
+// Queries with one word that the daemon does not find at all.
 std::vector<std::string> mistypedQueries(client::SearchServiceProxy& service,
                                          bench::QuerySource& source, size_t count) {
   std::vector<std::string> queries;
   for (size_t tries = 100 * count; queries.size() < count; --tries) {
     if (tries == 0) throw std::runtime_error("mistyped words are words of the mail");
     const auto mistyped = source.drawMistyped();
-    // Found in any form, it is no mistake; a single word at the end is a prefix.
+    // A word that is found in any form is no mistake; at the end, a single word is a prefix.
     if (bench::timedSearch(service, mistyped.word, true).results == 0) {
       queries.push_back(mistyped.query);
     }
@@ -34,7 +34,7 @@ std::vector<std::string> mistypedQueries(client::SearchServiceProxy& service,
 struct Timed {
   bench::Percentiles times;
   size_t found = 0;  // queries with results
-  double cpu = 0;    // of the daemon, seconds a query
+  double cpu = 0;    // of the daemon, seconds per query
 };
 
 Timed timeQueries(bench::DaemonRun& daemon, client::SearchServiceProxy& service,
@@ -97,7 +97,7 @@ int run(int argc, char** argv) {
   if (!indexed) spool.send(service);
   static_cast<void>(bench::timedSearch(service, "warm"));  // opens the index
   const std::vector<std::string> mistyped = mistypedQueries(service, source, mistypedCount);
-  // The first has the index learn what later ones need not look for.
+  // The first search makes the index build the Bloom filter that later ones use.
   if (!mistyped.empty()) static_cast<void>(bench::timedSearch(service, mistyped.front()));
   bench::Percentiles all;
   std::array<bench::Percentiles, bench::kMaximumWords> byWords;

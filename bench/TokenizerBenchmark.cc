@@ -27,7 +27,7 @@ TLString repeated(TLStringView unit) {
   return text;
 }
 
-// Bytes per second are those of the text in UTF-8.
+// Bytes per second refer to the UTF-8 text.
 void run(benchmark::State& state, const tokenizer::Tokenizer& tokenizer, TLStringView unit) {
   const TLString text = repeated(unit);
   std::string out;

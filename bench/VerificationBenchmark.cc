@@ -15,8 +15,8 @@
 #include "query/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 
-// How long the daemon takes to say which messages have one of these subjects, through its index and
-// by a walk over all messages, and whether these are all and no others.
+// Measures how long the daemon takes to answer verification queries, through its index and by
+// reading all messages, and checks the answers.
 namespace {
 
 using Identifiers = std::multiset<TLString>;
@@ -25,7 +25,7 @@ constexpr size_t kCounts[] = {5, 50, 1000};
 
 struct Path {
   const char* name;
-  const char16_t* parameters;  // how many results the index may give, else it is not trusted
+  const char16_t* parameters;  // more results than this from the index are not trusted
 };
 constexpr Path kPaths[] = {{"regular", u"salt.maxTopK=100000000"}, {"linear", u"salt.maxTopK=1"}};
 
@@ -45,7 +45,7 @@ class Subjects {
     std::mt19937 random(seed);
     for (size_t i = _order.size(); i > 1; --i) std::swap(_order[i - 1], _order[random() % i]);
   }
-  // `count` different ones, or all, from a place that moves on with `round`.
+  // `count` distinct subjects, or all, from a position that advances with `round`.
   [[nodiscard]] std::vector<TLString> some(size_t count, size_t round) const {
     std::vector<TLString> subjects;
     for (size_t i = 0; i < std::min(count, _order.size()); ++i) {
@@ -89,7 +89,7 @@ Identifiers search(client::SearchServiceProxy& service, const TLQuery& query) {
   return identifiers;
 }
 
-// How often the daemon has walked over all messages.
+// How often the daemon has read all messages.
 size_t walksLoggedIn(const std::string& path) {
   std::ifstream log(path);
   size_t walks = 0;

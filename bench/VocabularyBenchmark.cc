@@ -10,10 +10,10 @@
 #include "bench/Queries.h"
 #include "docstore/TALSqliteDocStore.h"
 
-// What searches cost while the vocabulary is counted beside them.
+// Measures the cost of searches while the vocabulary is being counted.
 namespace {
 
-// What the daemon has said of rebuilds so far.
+// What the daemon has logged about rebuilds so far.
 class DaemonLog {
  public:
   explicit DaemonLog(const std::string& path) : _file(path) {}
@@ -35,7 +35,7 @@ class DaemonLog {
   size_t _done = 0;
 };
 
-// The daemon counts anew when it has no words and another mail comes.
+// Without words, the daemon counts again when another mail arrives.
 void forgetVocabulary(const std::string& stateDirectory) {
   TALSqliteDocStore store(bench::documentStorePath(stateDirectory));
   std::optional<TLError> error;
@@ -43,7 +43,7 @@ void forgetVocabulary(const std::string& stateDirectory) {
   if (error) throw std::runtime_error("document store: " + platform::printable(error));
 }
 
-// Enough mail for a count to be due: copies of the first, under names of their own.
+// Adds enough mail for a count to be due: copies of the first one under new names.
 void addMail(client::SearchServiceProxy& service, bench::ItemSpool& spool, size_t round) {
   constexpr size_t kDue = 51;
   std::vector<client::EncodedItem> first;

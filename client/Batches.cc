@@ -7,7 +7,7 @@ namespace client {
 
 namespace {
 
-// The length in front of each element, and the padding up to the next.
+// The length before each element, and the padding up to the next.
 constexpr size_t kElementOverhead = 4;
 constexpr size_t kAlignment = 4;
 
@@ -31,8 +31,8 @@ const std::string& nameOf(const std::string& text) {
 constexpr size_t kNameLength = 200;
 constexpr int kTooLarge = 1;
 
-// The first limit on records that the query goes beyond, in words; empty for one that keeps to
-// them. Goes through the tree level by level, since one that is too high must not be written.
+// The first limit on records that the query exceeds, in words; empty if it exceeds none. Traverses
+// the tree level by level, because a tree that is too high must not be written.
 std::string brokenLimit(const TLQuery& query) {
   size_t records = query.hasSearchParams() ? 1 + query.searchParams()->keyvaluesCount() : 0;
   std::vector<const TLQueryNode*> level;

@@ -22,8 +22,8 @@ namespace {
 // The daemon's error object as a D-Bus error.
 constexpr const char* kErrorName = "com.quill.tallow.Error";
 
-// How long a wait for the daemon goes without looking again; the directory may not exist yet, and a
-// socket can be there before it listens.
+// Maximum pause between two attempts: the directory may not exist yet, and the socket may exist
+// before the daemon listens.
 constexpr std::chrono::milliseconds kWaitStep(50);
 
 struct MessageUnref {
@@ -36,7 +36,7 @@ std::string objectPathOf(std::string serviceName) {
   return '/' + serviceName;
 }
 
-// A connected descriptor, or a negative errno value.
+// A connected file descriptor, or a negative errno value.
 int connectSocket(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -52,7 +52,7 @@ int connectSocket(const std::string& path) {
   return result;
 }
 
-// As above; looks again whenever the directory changes, until `patience` has run out.
+// Like connectSocket, but tries again whenever the directory changes, for at most `patience`.
 int connectWithin(Patience patience, const std::string& directory, const std::string& path) {
   int descriptor = connectSocket(path);
   if (descriptor >= 0 || patience.count() == 0) return descriptor;
@@ -71,8 +71,8 @@ int connectWithin(Patience patience, const std::string& directory, const std::st
   return descriptor;
 }
 
-// What an error reply says. The daemon's own has message, domain and code in its body; the first of
-// them is also the message of the D-Bus error.
+// The error in an error reply. The daemon's own errors have message, domain and code in the body;
+// the message is also that of the D-Bus error.
 TLError errorOf(sd_bus_message* reply) {
   const sd_bus_error* const error = sd_bus_message_get_error(reply);
   const char* message = nullptr;
@@ -92,8 +92,8 @@ int onReply(sd_bus_message* reply, void* data, sd_bus_error*) {
   return 1;
 }
 
-// Sends the request and serves the connection until its reply is there, which may be one that the
-// library makes at the end of the time or of the connection. Negative when there is none.
+// Sends the request and serves the connection until the reply is there, which may be one that the
+// library creates on a timeout or a disconnect. Negative if there is none.
 int exchange(sd_bus* bus, sd_bus_message* request, std::chrono::microseconds timeout,
              Message& reply) {
   sd_bus_slot* slot = nullptr;
@@ -111,7 +111,7 @@ int exchange(sd_bus* bus, sd_bus_message* request, std::chrono::microseconds tim
 }  // namespace
 
 std::string defaultRuntimeDirectory() {
-  // Root may have a daemon of its own beside the system's.
+  // Root may run a daemon of its own beside the system's.
   const char* const own = std::getenv("XDG_RUNTIME_DIR");
   const char* const given = std::getenv("RUNTIME_DIRECTORY");
   if (geteuid() == 0 && own != nullptr && *own == '/' && (given == nullptr || *given == '\0')) {

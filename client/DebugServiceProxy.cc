@@ -24,7 +24,7 @@ Channel::Body appendTexts(const std::string& first, const std::string& second) {
   };
 }
 
-// A value of one of the number types of D-Bus; any other type is refused.
+// Reads a value of any D-Bus number type; refuses other types.
 int readNumber(sd_bus_message* reply, char type, Statistic& value) {
   union {
     uint8_t y;

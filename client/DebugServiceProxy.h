@@ -13,17 +13,18 @@ namespace client {
 
 inline constexpr const char* kDebugServiceName = "com.quill.tallow.DebugService";
 
-// Whole numbers come as int64_t, also where the daemon sends them unsigned, unless they need more.
+// Whole numbers are int64_t, even if the daemon sends them unsigned, unless they are too large for
+// it.
 using Statistic = std::variant<int64_t, uint64_t, double>;
 using Statistics = std::vector<std::pair<std::string, Statistic>>;
 
-// The diagnostic service of the daemon; threads and errors as in SearchServiceProxy.
+// The daemon's diagnostic service; threads and errors as in SearchServiceProxy.
 class DebugServiceProxy {
  public:
   explicit DebugServiceProxy(const std::string& runtimeDirectory, Patience patience = Patience(0))
       : _channel(runtimeDirectory, kDebugServiceName, patience) {}
 
-  // A text about the daemon that holds `input`.
+  // A text about the daemon that contains `input`.
   [[nodiscard]] std::optional<std::string> ping(const std::string& input, TLErrorOut error);
 
   // In the daemon's order.
@@ -31,7 +32,7 @@ class DebugServiceProxy {
                                                                const std::string& protectionClass,
                                                                TLErrorOut error);
 
-  // The metrics of the text index as lines of text.
+  // The metrics of the text index as text.
   [[nodiscard]] std::optional<std::string> fetchStatsForSalt(const std::string& name,
                                                              const std::string& protectionClass,
                                                              TLErrorOut error);

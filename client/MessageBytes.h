@@ -11,7 +11,8 @@ inline int appendBytes(sd_bus_message* message, std::string_view bytes) {
   return sd_bus_message_append_array(message, 'y', bytes.data(), bytes.size());
 }
 
-// 0 at the end of the array around it. The view lives as long as the message.
+// Reads one byte array; 0 at the end of the enclosing array. The view is valid as long as the
+// message.
 inline int readBytes(sd_bus_message* message, std::string_view& bytes) {
   const void* data = nullptr;
   size_t size = 0;

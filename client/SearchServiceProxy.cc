@@ -113,8 +113,8 @@ bool SearchServiceProxy::indexItems(std::span<const EncodedItem> items,
   if (!itemPieces) return false;
   const auto textPieces = splitTexts(identifiers, error);
   if (!textPieces) return false;
-  // All deletions but the last piece, then all items but the last piece, go ahead by calls of their
-  // own, in the order that one call would keep.
+  // All deletions except the last piece, then all items except the last piece, are sent as separate
+  // calls, in the order of a single call.
   const bool single = itemPieces->size() <= 1;
   const size_t separate =
       single && !textPieces->empty() ? textPieces->size() - 1 : textPieces->size();

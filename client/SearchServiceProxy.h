@@ -18,39 +18,41 @@ namespace client {
 inline constexpr const char* kSearchServiceName = "com.quill.tallowsearch.SearchService";
 inline constexpr const char* kSearchExplanationName = "com.quill.tallowsearch.SearchExplanation";
 
-// A word that a search replaced, since it found too little as typed.
+// A word that a search replaced because it found too little as typed.
 struct ReplacedWord {
   std::string typed;
   std::string replacement;
-  std::string reason;  // "spelling", "synonym" or "stem"; of a stem, any word that begins so counts
+  std::string
+      reason;  // "spelling", "synonym" or "stem"; a stem stands for any word that begins with it
 
   bool operator==(const ReplacedWord&) const = default;
 };
 
-// The search service of the daemon. Each operation waits for its reply and fails with an error of
-// the daemon or of this library (see Channel.h). One thread at a time.
+// The daemon's search service. Each operation waits for its reply and fails with an error of the
+// daemon or of this library (see Channel.h). One thread at a time.
 //
-// A list that is too long for one call goes out in several, in order, and the first failure ends
-// it; what earlier calls did stays done.
+// A list that is too long for one call is sent in several, in order. The first failure ends the
+// operation; earlier calls keep their effect.
 class SearchServiceProxy {
  public:
   explicit SearchServiceProxy(const std::string& runtimeDirectory, Patience patience = Patience(0))
       : _channel(runtimeDirectory, kSearchServiceName, patience) {}
 
-  // `name` names the client in the daemon's log and its state; `protectionClass` chooses the index.
+  // `name` identifies the client in the daemon's log and its client state; `protectionClass`
+  // selects the index.
   bool indexItems(std::span<const EncodedItem> items, const std::string& name,
                   const std::string& protectionClass, TLErrorOut error);
 
   bool deleteItemsWithIdentifiers(std::span<const std::string> identifiers, const std::string& name,
                                   const std::string& protectionClass, TLErrorOut error);
 
-  // Deletes, then indexes, then stores the state, if given. The state goes with the last call, so
-  // it is stored only after all else has succeeded.
+  // Deletes, then indexes, then stores the state, if given. The state is sent with the last call,
+  // so it is stored only after everything else has succeeded.
   bool indexItems(std::span<const EncodedItem> items, std::span<const std::string> identifiers,
                   const std::optional<std::string>& clientState, const std::string& name,
                   const std::string& protectionClass, TLErrorOut error);
 
-  // The state that was stored last; null where there is none and no error.
+  // The last stored state; null without an error if there is none.
   [[nodiscard]] std::optional<std::string> fetchLastClientState(const std::string& name,
                                                                 const std::string& protectionClass,
                                                                 TLErrorOut error);
@@ -65,13 +67,14 @@ class SearchServiceProxy {
   using Items = std::vector<std::shared_ptr<TLIndexableItem>>;
   static constexpr int64_t kNoMaximum = std::numeric_limits<int64_t>::max();
 
-  // Best first; none after a failure, such as a query that is too large for a call (see `encode`).
+  // Best first; nullopt on failure, for example if the query is too large for a call (see
+  // `encode`).
   [[nodiscard]] std::optional<Items> searchItems(const TLQuery& query, uint64_t options,
                                                  const std::string& protectionClass,
                                                  int64_t maxResults, TLErrorOut error);
 
-  // What the last search of this proxy replaced; none after a failure, as of a daemon that does not
-  // tell, or where the connection is another one than the search had.
+  // The words that the last search of this proxy replaced. Nullopt on failure, also if the daemon
+  // does not support it or the connection has changed since the search.
   [[nodiscard]] std::optional<std::vector<ReplacedWord>> replacedWords(TLErrorOut error);
 
  private:

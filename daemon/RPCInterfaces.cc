@@ -9,7 +9,7 @@ using Reply = std::shared_ptr<platform::RPCReply>;
 
 namespace {
 
-// Decodes the items of a call; refuses the call and gives none when one does not parse.
+// Decodes the items of a call; if one is invalid, refuses the call and returns nullopt.
 std::optional<TALSearchService::Items> readItems(RPCArguments& arguments, const Reply& reply) {
   const auto encoded = arguments.readBytesArray();
   TALSearchService::Items items;

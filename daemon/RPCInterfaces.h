@@ -8,11 +8,11 @@ inline constexpr const char* kSearchExplanationName = "com.quill.tallowsearch.Se
 inline constexpr const char* kDebugServiceName = "com.quill.tallow.DebugService";
 
 // The operations of the two services as members of their RPC interfaces. Records are decoded here:
-// bytes that do not parse are refused, with the argument and the index named, and nothing of the
-// call is done. The service must outlive the interfaces.
+// a call with invalid bytes is refused before anything is done, with the argument and the index in
+// the error. The service must outlive the interfaces.
 //
-// The interfaces of the search service belong to one connection, on whose thread they are used:
-// they share the words that its last search replaced.
+// The interfaces of the search service belong to one connection and its thread: they share the
+// words that its last search replaced.
 [[nodiscard]] platform::RPCInterface makeSearchServiceProtocol(
     TALSearchService& service, std::shared_ptr<WordReplacements> lastReplaced);
 [[nodiscard]] platform::RPCInterface makeSearchExplanationProtocol(

@@ -8,16 +8,17 @@
 #include "platform/RPC.h"
 #include "platform/RunLoop.h"
 
-// The one service object of the process and the two listeners that export it.
+// Owns the one service object of the process and the two listeners that export it.
 //
 // Threads: all operations belong to the main thread; requests arrive on the threads of the
 // connections.
 class TALDaemon {
  public:
-  // Makes the daemon once. Null, with a fault in the log, when the data root cannot be created.
+  // The daemon of the process, created at the first call. Null, with a fault in the log, when the
+  // data root cannot be created.
   static TALDaemon* sharedInstance();
 
-  // Null when the data root `path` cannot be created. Sockets lie in `runtimeDirectory`.
+  // Null when the data root `path` cannot be created. Sockets are created in `runtimeDirectory`.
   [[nodiscard]] static std::unique_ptr<TALDaemon> init(platform::RunLoop& loop,
                                                        const std::string& path,
                                                        const std::string& runtimeDirectory);
@@ -27,17 +28,17 @@ class TALDaemon {
   [[nodiscard]] platform::RPCListener& searchServiceListener() { return *_searchServiceListener; }
   [[nodiscard]] platform::RPCListener& debugServiceListener() { return *_debugServiceListener; }
 
-  // Which interface a connection gets is decided by the service name alone.
+  // Exports the interface of a service, chosen by the service name alone, to a new connection.
   [[nodiscard]] bool listener(platform::RPCListener& listener,
                               platform::RPCConnection& shouldAcceptNewConnection);
 
-  // Resumes the listeners; once, later calls do nothing. False when a socket cannot be had.
+  // Starts listening; further calls do nothing. False when a socket is unavailable.
   bool run(TLErrorOut error);
 
   // Shuts every indexer down. Blocks until their queues have drained.
   void shutdown();
 
-  // Lets what is ready go out to the clients, for a bounded time, and ends the connections.
+  // Sends pending replies, for a bounded time, and ends the connections.
   void invalidate();
 
   static const platform::Log& log();

@@ -10,9 +10,9 @@
 namespace {
 
 constexpr int kIndexerUnavailable = -2;
-// More than recovering the two databases of a class writes.
+// More than the recovery of a class's two databases writes.
 constexpr uint64_t kOpeningRoom = 32 * 1024 * 1024;
-constexpr size_t kOpeningDescriptors = 16;  // more than opening the two databases takes at a time
+constexpr size_t kOpeningDescriptors = 16;  // more than opening the two databases needs at a time
 
 bool createClassDirectory(const std::string& root, const std::string& protectionClass,
                           TLErrorOut error) {

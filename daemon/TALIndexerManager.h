@@ -13,20 +13,20 @@
 #include "platform/Queue.h"
 #include "platform/TLError.h"
 
-// The strictest protection class: its data cannot be read while the device is locked.
+// The strictest protection class: its data is unreadable while the device is locked.
 inline constexpr const char* SysFileProtectionComplete = "SysFileProtectionComplete";
 
-// Owns the indexers, one for each data-protection class, made on first use and kept; and refuses
-// one while the device's state does not allow access to the class.
+// Owns the indexers, one for each data-protection class, created at first use and kept. Refuses
+// access to a class that the lock state of the device does not allow.
 //
-// A class is any string that can name one directory: its data lies below the data root under that
+// A class is any string that is a valid directory name; its data lies in the data root under that
 // name.
 //
-// Threads: any. Lookups and creations run one at a time on the manager's queue; a creation opens
-// the class's databases there, and requests for other classes wait behind it.
+// Threads: any. Look-ups and creations run one at a time on the manager's queue. A creation opens
+// the databases of the class there, and requests for other classes wait for it.
 class TALIndexerManager {
  public:
-  // What the manager asks the device.
+  // The lock state of the device.
   struct LockState {
     bool unlockedSinceBoot;
     bool protectedDataAvailable;
@@ -40,10 +40,10 @@ class TALIndexerManager {
 
   [[nodiscard]] std::vector<std::shared_ptr<TALIndexer>> allIndexers();
 
-  // The indexer of the class, or null with an error: indexerUnavailableError, or that of the file
-  // system or of the store, and then nothing is kept and the next request tries again. A class is
-  // not opened on a disk that is nearly full (ENOSPC): recovering its databases takes room, and an
-  // index that cannot be recovered starts empty.
+  // The indexer of the class, or null with an error: indexerUnavailableError, or an error of the
+  // file system or the store. After an error nothing is kept, and the next request tries again. A
+  // class is not opened on a nearly full disk (ENOSPC), because recovering its databases needs
+  // space, and an index that cannot be recovered starts empty.
   [[nodiscard]] std::shared_ptr<TALIndexer> indexerWithProtectionClass(
       const std::string& protectionClass, TLErrorOut error);
 
@@ -60,6 +60,6 @@ class TALIndexerManager {
   const std::string _path;
   const LockStateSource _lockState;
   const FreeBytesSource _freeBytes;
-  std::unordered_map<std::string, std::shared_ptr<TALIndexer>> _indexers;  // of the queue's thread
+  std::unordered_map<std::string, std::shared_ptr<TALIndexer>> _indexers;  // used on the queue only
   platform::SerialQueue _indexersQueue;
 };

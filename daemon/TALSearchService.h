@@ -14,12 +14,13 @@
 
 using TLErrorReply = std::function<void(const std::optional<TLError>&)>;
 
-// The object behind both RPC services. For each request it turns the protection class into an
-// indexer, calls that, and delivers the outcome through the reply. It makes no errors of its own.
+// Implements both RPC services. For each request it finds the indexer of the protection class,
+// calls it, and passes the outcome to the reply. It creates no errors of its own.
 //
-// The name that clients give selects no indexer: it stands in the log, and is the client state's
-// name. A query that only asks whether messages with given subjects are there (an OR of at least
-// five equal comparisons of the subject) is answered by exact comparison.
+// The indexer name that clients pass does not select an indexer: it is logged, and it is the name
+// of the client state. A verification query, which only asks whether messages with given subjects
+// exist (an OR of at least five equality comparisons of the subject), is answered by exact
+// comparison.
 //
 // Threads: every operation runs on the caller's thread, and several may run at once. Item
 // operations return at once and reply from the indexer's queue; searches and statistics reply
@@ -48,10 +49,10 @@ class TALSearchService {
                                         const std::string& protectionClass, TLErrorReply reply);
   void deleteAllItemsFromIndexerNamed(const std::string& name, const std::string& protectionClass,
                                       TLErrorReply reply);
-  // The items are null only beside an error. The query is changed: it gets its resolved parameters.
-  // `maxResults` is compared as unsigned, so that a negative one truncates nothing. `replaced`,
-  // which may be null, receives the words that were changed for these results; it is complete
-  // when the operation returns.
+  // The items are null only together with an error. The resolved parameters are written into the
+  // query. `maxResults` is compared as unsigned, so a negative value truncates nothing. `replaced`,
+  // which may be null, receives the words that were replaced for these results; it is complete when
+  // the operation returns.
   void searchItemsForQuery(
       TLQuery& query, uint64_t withOption, const std::string& forProtectionClass,
       int64_t maxResults,
@@ -69,19 +70,19 @@ class TALSearchService {
   void forceVacuumAndCompactForProtectionClass(const std::string& protectionClass,
                                                TLErrorReply reply);
 
-  // Shuts every indexer down in turn, and waits for each.
+  // Shuts down the indexers one after another and waits for each.
   void shutdown();
 
-  // "<empty>" for an empty text, so that no log line shows an empty field.
+  // "<empty>" for an empty text, so that log lines have no empty fields.
   [[nodiscard]] static std::string cleanName(const std::string& name);
   [[nodiscard]] static std::string cleanProtectionClass(const std::string& protectionClass);
   [[nodiscard]] static std::string _searchDescriptionWithOptions(uint64_t options,
                                                                  int64_t maxResults);
 
   [[nodiscard]] static bool isMailVerificationQuery(const TLQuery* query);
-  // The subjects of a verification query's text, in order.
+  // The subjects in the text of a verification query, in order.
   [[nodiscard]] static Strings subjectsFromRawQuery(TLStringView rawQuery);
-  // Undoes the escapes one kind after the other, each over the result of the one before.
+  // Undoes the escapes, one kind after another, each on the result of the previous step.
   [[nodiscard]] static TLString _stringFromEscapedString(TLString text);
 
   static const platform::Log& log();
@@ -89,7 +90,7 @@ class TALSearchService {
  private:
   // Null without an error after `shutdown`.
   std::shared_ptr<TALIndexer> indexerFor(const std::string& protectionClass, TLErrorOut error);
-  // The shape that the four item operations share.
+  // The common part of the four item operations.
   void runItemOperation(const std::string& description, const std::string& protectionClass,
                         TLErrorReply reply,
                         const std::function<void(TALIndexer&, TALIndexer::Completion)>& operation);

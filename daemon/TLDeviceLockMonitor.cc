@@ -6,7 +6,7 @@ namespace {
 
 constexpr const char* kNotification = "com.quill.mobile.lockstated.lock_status";
 
-// What a lock state means, by its number.
+// The meaning of a lock state, by its number.
 struct StateRow {
   const char* word;
   bool available;  // protected data can be read; the device has been unlocked
@@ -35,7 +35,7 @@ TLDeviceLockMonitor::TLDeviceLockMonitor(DeviceVault& vault)
     : _vault(vault),
       _deviceUnlockedSinceBoot(vault.DVLDeviceUnlockedSinceBoot() != 0),
       _dispatchQueue("com.quill.tallow.deviceLockMonitor") {
-  // Before the state is read, so that no change in between is lost.
+  // Before reading the state, so that no change in between is lost.
   _deviceLockSetupNotification();
   const uint32_t state = _vault.DVLGetDeviceLockState(0);
   if (state >= kStates.size()) {

@@ -17,10 +17,10 @@ class TLDeviceLockObserver {
   virtual void protectedDataDidBecomeUnavailable() = 0;
 };
 
-// Knows whether the device has been unlocked at least once since boot, and whether protected data
-// can be read now.
+// Tracks whether the device has been unlocked at least once since boot, and whether protected data
+// is readable now.
 //
-// Threads: the two facts are read from any thread, without a lock, and may lag by one notification.
+// Threads: both values may be read on any thread without a lock, and may lag by one notification.
 // They are written on the monitor's own queue. The observer is called there, or on the queue given
 // with it.
 class TLDeviceLockMonitor {
@@ -33,11 +33,11 @@ class TLDeviceLockMonitor {
   TLDeviceLockMonitor(const TLDeviceLockMonitor&) = delete;
   TLDeviceLockMonitor& operator=(const TLDeviceLockMonitor&) = delete;
 
-  // Turns true once and stays.
+  // Becomes true once and stays true.
   [[nodiscard]] bool deviceUnlockedSinceBoot() const { return _deviceUnlockedSinceBoot; }
   [[nodiscard]] bool protectedDataAvailable() const { return _protectedDataAvailable; }
 
-  // Both are held weakly. Not from the monitor's queue.
+  // Both arguments are held weakly. Not from the monitor's queue.
   void setDelegate(const std::shared_ptr<TLDeviceLockObserver>& delegate,
                    const std::shared_ptr<platform::SerialQueue>& delegateQueue);
 
@@ -54,7 +54,7 @@ class TLDeviceLockMonitor {
   int32_t _lockStateNotifyToken = -1;
   std::atomic<bool> _deviceUnlockedSinceBoot;
   std::atomic<bool> _protectedDataAvailable{false};
-  // What setDelegate sets; shared with calls on the delegate's queue, which may outlive the
+  // The arguments of setDelegate, shared with calls on the delegate's queue, which may outlive the
   // monitor.
   struct Delegate {
     platform::Mutex mutex;
@@ -74,6 +74,6 @@ class TLDeviceLockMonitor {
   platform::SerialQueue _dispatchQueue;  // last, so that it ends before what its items use
 };
 
-// The facts of the shared monitor; the first call makes it.
+// The values of the shared monitor, which the first call creates.
 [[nodiscard]] bool TLDeviceUnlockedSinceBoot();
 [[nodiscard]] bool TLProtectedDataAvailable();

@@ -60,7 +60,7 @@ TALSearchService::Strings TALSearchService::subjectsFromRawQuery(TLStringView ra
     if (pieces[i].find(kClause) == TLStringView::npos) continue;
     TLString subject = replaceAll(pieces[i], kClauseStart, u"");
     if (i + 1 == pieces.size()) {
-      // The last piece still ends in the closing quote.
+      // The last piece still has the closing quote.
       if (subject.size() < 2) continue;
       subject.pop_back();
     }

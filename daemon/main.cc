@@ -50,8 +50,8 @@ constexpr const char* kUsage =
     "SIGTERM, SIGINT or SIGHUP. Data is kept in $STATE_DIRECTORY, sockets are in\n"
     "$RUNTIME_DIRECTORY; see tallowsearchd(8) for where they are unless set.\n";
 
-// The status to end with: 2 for anything that is not understood, so that a mistyped option never
-// leaves a daemon running.
+// The exit status: 2 for unknown arguments, so that a mistyped option never leaves a daemon
+// running.
 int answerCommandLine(int argc, char** argv) {
   const std::string_view argument = argv[1];
   if (argc == 2 && argument == "--help") {
@@ -74,7 +74,7 @@ int main(int argc, char** argv) {
   umask(kPrivateUmask);
   platform::CrashNote::begin();
   platform::limitMemoryArenas();
-  platform::raiseDescriptorLimit();  // each class may hold a thousand table files open
+  platform::raiseDescriptorLimit();  // each class may have a thousand table files open
   // Before any thread starts, so that all threads inherit it.
   for (const int signal : kEndingSignals) platform::takeSignalFromProcess(signal);
   platform::takeSignalFromProcess(kCaptureSignal);
@@ -99,7 +99,7 @@ int main(int argc, char** argv) {
   });
 
   const auto lock = platform::ProcessLock::acquire(platform::processLockPath(), &error);
-  // A purge that was cut short leaves either a copy or what it took out.
+  // An interrupted purge leaves either its copy or the directory that it replaced.
   if (lock != nullptr) platform::removeItem(platform::purgeDirectory(), nullptr);
   TALDaemon* daemon = TALDaemon::sharedInstance();
   if (daemon != nullptr) {

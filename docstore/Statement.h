@@ -7,17 +7,17 @@
 
 #include "docstore/TALSqliteDocStore.h"
 
-// What the sources of TALSqliteDocStore share on top of sqlite3.h.
+// Helpers for the sources of TALSqliteDocStore, on top of sqlite3.h.
 
 namespace docstore {
 
-// How many URLs one execution of the look-up by URL takes.
+// Number of URLs in one execution of the look-up by URL.
 inline constexpr int kURLsPerStatement = 64;
 
 }  // namespace docstore
 
-// One use of a prepared statement, from its binds to its reset. Bound text and blobs are not copied
-// and must outlive the steps. A failed bind makes every step fail.
+// One execution of a prepared statement, from its binds to its reset. Bound text and blobs are not
+// copied and must outlive the steps. After a failed bind every step fails.
 class TALSqliteDocStore::Use {
  public:
   explicit Use(sqlite3_stmt* statement) : _statement(statement) {}
@@ -50,13 +50,13 @@ class TALSqliteDocStore::Use {
   [[nodiscard]] int64_t columnInt(int column) const {
     return sqlite3_column_int64(_statement, column);
   }
-  // The bytes of a text column, empty for NULL.
+  // The bytes of a text column; empty for NULL.
   [[nodiscard]] std::string columnText(int column) const {
     const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(_statement, column));
     const int length = sqlite3_column_bytes(_statement, column);
     return text != nullptr ? std::string(text, static_cast<size_t>(length)) : std::string();
   }
-  // The bytes of a blob column in place, until the next step; empty for NULL.
+  // The bytes of a blob column, valid until the next step; empty for NULL.
   [[nodiscard]] std::string_view columnBlob(int column) const {
     const auto* blob = static_cast<const char*>(sqlite3_column_blob(_statement, column));
     const int length = sqlite3_column_bytes(_statement, column);

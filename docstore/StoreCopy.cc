@@ -29,7 +29,7 @@ Connection open(const std::string& path, TLErrorOut error) {
   return nullptr;
 }
 
-// Runs one statement, with one value if `bind` is given, and hands each row to `row`.
+// Runs one statement, with a value bound by `bind` if given, and passes each row to `row`.
 bool run(sqlite3* database, const char* query, const std::function<int(sqlite3_stmt*)>& bind,
          const std::function<void(sqlite3_stmt*)>& row, TLErrorOut error) {
   sqlite3_stmt* made = nullptr;
@@ -65,7 +65,7 @@ std::unique_ptr<StoreCopy> StoreCopy::make(const std::string& from, const std::s
   }
   Connection copy = open(to, error);
   if (copy == nullptr) return nullptr;
-  // Nobody sees the copy before it is whole, so a journal would only repeat what is overwritten.
+  // Nobody uses the copy before it is complete, so it needs no journal.
   if (!run(copy.get(), "PRAGMA journal_mode=OFF;", error) ||
       !run(copy.get(), "PRAGMA secure_delete=ON;", error)) {
     return nullptr;
@@ -105,12 +105,12 @@ bool StoreCopy::setVocabulary(std::string_view vocabulary, TLErrorOut error) {
   return run(_database, "REPLACE INTO topkvocab (id, vocab) VALUES(1, ?);", bind, nullptr, error);
 }
 
-// The header of SQLite's file format: the size of a page at 16, the number of free ones at 36, both
-// big-endian.
+// In the header of SQLite's file format the page size is at 16 and the number of free pages at 36,
+// both big-endian.
 uint64_t unusedStoreBytes(const std::string& path) {
   constexpr size_t kPageSizeAt = 16;
   constexpr size_t kFreePagesAt = 36;
-  constexpr uint64_t kLargestPage = 65536;  // written as 1
+  constexpr uint64_t kLargestPage = 65536;  // stored as 1
   std::array<char, kFreePagesAt + 4> header{};
   const platform::FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   if (file.get() < 0 || !platform::readAt(file.get(), 0, header.data(), header.size())) return 0;

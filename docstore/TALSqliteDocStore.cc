@@ -91,7 +91,7 @@ bool TALSqliteDocStore::_openConnection(TLErrorOut error) {
     _database = nullptr;
     return false;
   }
-  // The statements of a reset take a double-quoted text for a literal.
+  // The SQL of a reset uses double-quoted string literals.
   sqlite3_db_config(_database, SQLITE_DBCONFIG_DQS_DML, 1, nullptr);
   const int wal = sqlite3_exec(_database, "pragma journal_mode=wal;", nullptr, nullptr, nullptr);
   if (wal != SQLITE_OK) log().error("Failed to set journal mode WAL with error code {}", wal);
@@ -178,7 +178,7 @@ void TALSqliteDocStore::_buildStatementMap() {
   add(_loadTopKVocabStmt, "SELECT vocab from topkvocab WHERE id = 1;");
 }
 
-// All statements or none.
+// Prepares all statements or none.
 bool TALSqliteDocStore::_initStatementsWithError(TLErrorOut error) {
   for (auto& [slot, query] : _statementMap) {
     *slot = _prepare(query, error, "statement for query");
@@ -300,7 +300,7 @@ std::optional<std::string> TALSqliteDocStore::_metadataValueForKey(const std::st
   return std::nullopt;
 }
 
-// The value is bound as text, whatever its bytes: that is its storage class on disk.
+// The value is bound as text whatever its bytes, because text is its storage class on disk.
 bool TALSqliteDocStore::_setMetadataValue(const std::string& value, const std::string& forKey,
                                           TLErrorOut error) {
   log().debug("setMetadataValue for key {}", forKey);
@@ -313,7 +313,7 @@ bool TALSqliteDocStore::_setMetadataValue(const std::string& value, const std::s
   return false;
 }
 
-// --- Upkeep
+// --- Maintenance
 
 bool TALSqliteDocStore::vacuumWithError(TLErrorOut error) {
   const platform::MutexLock lock(_mutex);

@@ -14,15 +14,15 @@
 struct sqlite3;
 struct sqlite3_stmt;
 
-// The document store in one SQLite database, in WAL mode.
+// The document store in one SQLite database in WAL mode.
 //
-// Persisted: table `docstore` with an ID, a unique URL and the retained copy of the item in wire
-// form (identifier, domainIdentifier, expirationDate and the retained attributes; the column `html`
-// is never written); table `metadata` with byte values by key, "version" among them; table
-// `topkvocab` with at most one row.
+// Tables: `docstore` with an ID, a unique URL and the retained copy of the item in wire form
+// (identifier, domainIdentifier, expirationDate and the retained attributes; the column `html` is
+// never written); `metadata` with byte values by key, among them "version"; `topkvocab` with at
+// most one row.
 //
 // Threads: one mutex guards the connection and its prepared statements, and every operation holds
-// it from its first bind to its last reset; enumerateDocIDs holds it page by page and never while
+// it from its first bind to its last reset. enumerateDocIDs holds it page by page, and never while
 // the handler runs.
 class TALSqliteDocStore final : public TALDocStore {
  public:
@@ -83,18 +83,18 @@ class TALSqliteDocStore final : public TALDocStore {
   bool _createTables(const std::string& version, TLErrorOut error) TL_REQUIRES(_mutex);
   bool _dropDocuments(const std::optional<std::string>& stored, const std::string& version,
                       TLErrorOut error) TL_REQUIRES(_mutex);
-  // The result of SQLite; the connection stays after a failure.
+  // Returns the result of SQLite; after a failure the connection stays.
   int _closeConnection() TL_REQUIRES(_mutex);
   void _buildStatementMap() TL_REQUIRES(_mutex);
   bool _initStatementsWithError(TLErrorOut error) TL_REQUIRES(_mutex);
   void _finalizeStatements() TL_REQUIRES(_mutex);
-  // True when the statements are there to be used; prepares them where a vacuum could not.
+  // True if the statements are usable; prepares them if a vacuum could not.
   bool _ready(TLErrorOut error) TL_REQUIRES(_mutex);
   // Null after a failure, which is logged as "Unable to prepare WHAT QUERY: ERROR".
   Statement _prepare(const std::string& query, TLErrorOut error, const char* what = "statement")
       TL_REQUIRES(_mutex);
 
-  // Both write the error through the pointer unless it is null, and return it for the log.
+  // Both store the error through the pointer unless it is null, and return it for the log.
   TLError _lastSqliteErrorWithError(TLErrorOut error) TL_REQUIRES(_mutex);
   static TLError _errorWithCode(int code, TLErrorOut error);
 
@@ -109,11 +109,11 @@ class TALSqliteDocStore final : public TALDocStore {
   bool _setMetadataValue(const std::string& value, const std::string& forKey, TLErrorOut error)
       TL_REQUIRES(_mutex);
 
-  // Documents.
-  // Binds the retained copy of the item; `buffer` holds its bytes and must live until the step.
+  // Documents. Binds the retained copy of the item; `buffer` holds its bytes and must live until
+  // the step.
   void _serializeDoc(const TLIndexableItem& document, Use& statement, int docIndex,
                      std::string& buffer) const;
-  // The item in column 0 of the row that the statement stands on.
+  // The item in column 0 of the statement's current row.
   static std::shared_ptr<TLIndexableItem> _deserializeDocWithStatement(const Use& statement);
   bool _documentsWithIDs(const uint32_t* docIDs, size_t count, ItemsByID& itemMap, TLErrorOut error)
       TL_REQUIRES(_mutex);
@@ -122,10 +122,10 @@ class TALSqliteDocStore final : public TALDocStore {
   // The new document's ID, or 0.
   uint32_t _storeOrUpdateDocumentAtURL(const TLIndexableItem& document, const TLURL& atURL,
                                        TLErrorOut error) TL_REQUIRES(_mutex);
-  // The ID that it was given, or 0.
+  // The given ID, or 0.
   uint32_t _storeOrUpdateDocumentAtDocID(const TLIndexableItem& document, uint32_t atDocID,
                                          TLErrorOut error) TL_REQUIRES(_mutex);
-  // Rows of the page below the cursor, 0 for a buffer size below 1, -1 after a failure.
+  // The number of rows in the page below the cursor; 0 for a buffer size below 1, -1 on failure.
   int _listDocIDsWithBuffer(std::vector<uint32_t>& docIDs, std::vector<std::string>& docURLs,
                             int bufferSize, uint32_t cursor, TLErrorOut error) TL_REQUIRES(_mutex);
   int64_t _countWithError(TLErrorOut error, Statement TALSqliteDocStore::*statement);
@@ -153,6 +153,6 @@ class TALSqliteDocStore final : public TALDocStore {
   Statement _rollbackStmt TL_GUARDED_BY(_mutex);
   Statement _storeTopKVocabStmt TL_GUARDED_BY(_mutex);
   Statement _loadTopKVocabStmt TL_GUARDED_BY(_mutex);
-  // Where each of the statements above lies, and its text.
+  // The statements above with their SQL text.
   std::vector<std::pair<Statement*, std::string>> _statementMap TL_GUARDED_BY(_mutex);
 };

@@ -11,13 +11,13 @@
 
 namespace {
 
-// The URLs of one execution of the look-up by URL are of at most this length in all.
+// Upper bound of the total length of the URLs in one execution of the look-up by URL.
 constexpr size_t kBatchLength = 100000;
 
-// IDs stand in the text of the statement, where no limit on parameters applies.
+// IDs are part of the SQL text, so the limit on parameters does not apply.
 constexpr size_t kIDsPerStatement = 10000;
 
-// Rows of one page of an enumeration.
+// Number of rows in one page of an enumeration.
 constexpr int kPageSize = 1024;
 
 constexpr int kDocumentIDMismatch = 4;
@@ -33,7 +33,7 @@ void TALSqliteDocStore::_serializeDoc(const TLIndexableItem& document, Use& stat
   retained.setDomainIdentifier(document.domainIdentifier());
   if (document.hasExpirationDate()) retained.setExpirationDate(document.expirationDate());
   for (const auto& attribute : document.attributes()) {
-    // Shared, not copied: the retained item only lives to be written.
+    // Shared, not copied: the retained item exists only to be written.
     if (_retainedAttributes.contains(attribute->key())) retained.addAttributes(attribute);
   }
   buffer = retained.data();

@@ -4,8 +4,8 @@
 #include "indexer/TALHTMLParsing.h"
 #include "platform/Assert.h"
 
-// The first byte picks the encoding, the rest is the document. Text is never longer than its bytes,
-// and whether attributes are wanted makes no difference to it.
+// The first byte selects the encoding, the rest is the document. The text must not be longer than
+// its bytes, and must be the same whether attributes are requested or not.
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   constexpr uint64_t kEncodings[] = {platform::kEncodingUTF8, 5, 8, 21, 10};
   if (size == 0) return 0;

@@ -1,5 +1,6 @@
-// Any bytes as a query. What parses can be written and parses to the same again; the tree that is
-// built travels, and optimising it takes nothing but free text and constants.
+// Parses any bytes as a query. A parsed query must print as text that parses to the same tree; the
+// tree built from it must survive the wire, and optimising it may remove only free text and
+// constants.
 
 #include <cstddef>
 #include <cstdint>

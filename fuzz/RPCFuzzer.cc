@@ -1,5 +1,5 @@
-// What a peer sends after the handshake: the bytes go through the framer and the bus library into
-// handlers that read every kind of argument, in a connection as the daemon serves it.
+// Any bytes from a peer after the handshake: they go through the framer and the bus library into
+// handlers that read every kind of argument, on a connection as in the daemon.
 #include <fcntl.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -20,9 +20,9 @@ namespace {
 using platform::RPCArguments;
 using platform::RPCReply;
 
-constexpr const char* kService = "f.f";  // short, so that an input hits it
+constexpr const char* kService = "f.f";  // short, so that random input can match it
 
-// Reads one argument after the other, and decodes records, as the handlers of the daemon do.
+// Reads all arguments and decodes records, like the handlers of the daemon.
 void handle(const char* signature, RPCArguments& arguments,
             const std::shared_ptr<RPCReply>& reply) {
   size_t sum = 0;
@@ -76,8 +76,8 @@ const platform::RPCInterface& interface() {
 
 }  // namespace
 
-// All that a peer sends waits in the socket when the connection, which has no thread of its own
-// here, begins to serve; what it answers stays there unread.
+// The input waits in the socket when the connection, which runs on this thread, begins to serve;
+// its replies are not read.
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   setenv("TALLOW_LOG", "fault", 0);
   static const std::string begin = testsupport::authenticationLines() + "BEGIN\r\n";

@@ -1,5 +1,5 @@
-// Reads any record from any bytes: the first byte chooses the class, the rest is its wire form.
-// What reads well must survive being written, read again, copied and compared.
+// Decodes any record from any bytes: the first byte selects the class, the rest is its wire form. A
+// record that decodes must survive being written, read again, copied and compared.
 
 #include <cstddef>
 #include <cstdint>
@@ -12,7 +12,7 @@
 
 namespace {
 
-// A parameter without a key reads, but must not be written.
+// A parameter without a key can be read, but must not be written.
 void complete(TLParameters& params) {
   for (const auto& keyvalue : params.keyvalues()) {
     if (!keyvalue->hasKey()) keyvalue->setKey(u"key");
@@ -36,7 +36,7 @@ void check(std::string_view bytes) {
   const auto copy = record.copyWithZone();
   TL_ASSERT(copy->data() == data);
   TL_ASSERT(again.hash() == record.hash() && copy->hash() == record.hash());
-  // Only a NaN, which the dictionary shows as null, keeps a record from equalling its copy.
+  // A record equals its copy unless it contains NaN, which the dictionary shows as null.
   const std::string text = record.dictionaryRepresentation().dump();
   const bool equal = copy->isEqual(record);
   TL_ASSERT(equal || text.find("null") != std::string::npos);
@@ -47,7 +47,7 @@ void check(std::string_view bytes) {
   TL_ASSERT(record.data() == data);
 }
 
-// Attributes in wire form are as good as those that were decoded.
+// Attributes in wire form must behave like decoded ones.
 void checkWritten(std::string_view bytes) {
   TLIndexableItem kept;
   if (!kept.initWithWrittenData(bytes)) return;

@@ -10,8 +10,8 @@
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
 
-// Any text and any numbers: the cut of suffixes against a loop that follows the rule byte by byte,
-// keys and pages there and back, and the walk of a page against the texts it was made from.
+// Any text and any numbers. Checks suffixLength against a loop that applies the rule byte by byte,
+// the round trip of keys and pages, and a page's suffixes against the texts they were made from.
 namespace {
 
 std::string slowCut(std::string_view text, const salt::Index::OptionsBlock& op) {
@@ -28,7 +28,7 @@ struct Entry {
   salt::SuffixMeta meta;
 };
 
-// Sorted suffixes of the text, numbers taken from its bytes.
+// Sorted suffixes of the text, with numbers taken from its bytes.
 std::vector<Entry> entriesOf(std::string_view text, const salt::Index::OptionsBlock& op) {
   std::vector<Entry> entries;
   for (size_t i = 0; i < text.size() && entries.size() < op.MaxPageSuffixes; ++i) {
@@ -98,7 +98,7 @@ void walkPage(const salt::index& idx, const std::vector<Entry>& entries) {
   }
 }
 
-// An empty index that lends its options; its directory stands for the run.
+// An empty index whose options are used; its directory is kept for the whole run.
 const salt::index& sharedIndex() {
   static const std::unique_ptr<salt::Index> shared = [] {
     std::string path = std::filesystem::temp_directory_path() / "salt-fuzz-XXXXXX";

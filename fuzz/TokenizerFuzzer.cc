@@ -21,9 +21,9 @@ void checkForm(const std::string& text, const std::vector<uint32_t>& offsets) {
 
 }  // namespace
 
-// The first byte tells whether the rest is UTF-8 or UTF-16 in memory order. The fast tokenizer
-// against the one that takes the Unicode rules for all text, and both against the contract of the
-// text form.
+// The first byte selects UTF-8 or UTF-16 (native byte order) for the rest. Compares the fast
+// tokenizer with the one that applies the Unicode rules to all text, and checks both against the
+// contract of the text form.
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static const auto fast = tokenizer::NewFastLexemonTokenizer("en_US");
   static const auto chain = tokenizer::NewLexemonTokenizer("en_US");

@@ -1,5 +1,5 @@
-// Any bytes as what a person has typed. Whatever they are, there is a tree of bounded depth, every
-// word of a plain query is in it, and it can be printed.
+// Parses any bytes as a typed search. The result must be a tree of bounded depth that can be
+// printed, and must contain every word of a plain query.
 
 #include <cstddef>
 #include <cstdint>

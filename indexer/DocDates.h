@@ -4,14 +4,14 @@
 #include <optional>
 #include <unordered_map>
 
-// The dates of documents, as far as they are known: what the order of results depends on beside the
-// text's score. With them most of what a search finds is ranked without being read.
+// A cache of document dates. Besides the text score, the order of results depends on dates, so most
+// of what a search finds can be ranked without reading it from the store.
 //
-// Whoever stores or deletes a document says so here; what is known is always true. Some 40 bytes a
-// document. The owner's lock guards it.
+// Every store or deletion of a document must be reported here, so a cached date is always correct.
+// About 40 bytes a document. Guarded by the owner's lock.
 class DocDates {
  public:
-  // Seconds since 1970; none when it is not known.
+  // Seconds since 1970; nullopt when unknown.
   [[nodiscard]] std::optional<double> find(uint32_t docID) const {
     const auto found = _dates.find(docID);
     if (found == _dates.end()) return std::nullopt;

@@ -9,12 +9,12 @@
 #include "platform/Mutex.h"
 #include "salt/Index.h"
 
-// An open text index and what reads it: they come and go together. Any number of threads may use
-// it at once.
+// An open text index with the objects that read it; opened and closed together. Any number of
+// threads may use it at once.
 struct OpenText {
   explicit OpenText(std::unique_ptr<salt::Index> opened) : index(std::move(opened)) {}
   ~OpenText() {
-    if (vocab != nullptr) vocab->shutdown();  // others may still hold it
+    if (vocab != nullptr) vocab->shutdown();  // others may still hold a reference
   }
   OpenText(const OpenText&) = delete;
   OpenText& operator=(const OpenText&) = delete;
@@ -24,17 +24,17 @@ struct OpenText {
   std::unique_ptr<TALSpellCorrection> spelling;
 };
 
-// Hands out the open text index of a class. Any thread.
+// Holds the open text index of a class and gives out references to it. Any thread.
 class OpenTextHolder {
  public:
-  // Null while there is none. It stays open as long as the result lives, so that who asks must not
-  // be one whom `close` is waiting for by other means.
+  // A reference to the open index; null if none is open. The index stays open while the reference
+  // exists. A thread that `close` waits for in another way must not hold one.
   [[nodiscard]] std::shared_ptr<OpenText> get() const TL_EXCLUDES(_mutex) {
     platform::MutexLock lock(_mutex);
     return _text;
   }
 
-  // Only while there is none.
+  // Call it only while no index is open.
   void open(std::unique_ptr<OpenText> text) TL_EXCLUDES(_mutex) {
     std::promise<void> gone;
     platform::MutexLock lock(_mutex);
@@ -46,8 +46,8 @@ class OpenTextHolder {
              }};
   }
 
-  // Hands out no more, and returns once all who use it have let go and it is closed: the same
-  // directory can be opened again. Does nothing while there is none.
+  // Stops giving out references, and returns once all of them have been released and the index is
+  // closed: the same directory can then be opened again. Does nothing if no index is open.
   void close() TL_EXCLUDES(_mutex) {
     std::future<void> gone;
     std::shared_ptr<OpenText> text;

@@ -9,9 +9,9 @@
 
 namespace {
 
-constexpr size_t kSnippetUnits = 300;  // no unit is read once the output holds as many
+constexpr size_t kSnippetUnits = 300;  // reading stops once the output has this many
 constexpr char16_t kLineBreakSign = u'\u2008';
-// How far around the cut a character of many units is looked for.
+// How far around the cut to look for a character of many units.
 constexpr size_t kLongestCharacter = 64;
 
 bool isLineBreak(char16_t unit) {
@@ -24,7 +24,7 @@ bool isSkippedAtStart(char16_t unit) {
   return isLineBreak(unit) || isBlank(unit) || unit == u'\uFFFC';
 }
 
-// The start of the composed character that holds body[at], and its length in units.
+// The start of the composed character that contains body[at], and its length in units.
 struct Character {
   size_t start;
   size_t length;

@@ -13,7 +13,7 @@ using Mode = TALDateFormatter::Mode;
 
 constexpr double kMillisInSecond = 1000;
 
-// Longer texts are no dates; the bound keeps ICU's 32-bit lengths out of reach.
+// A longer text is not a date; the bound also suits ICU's 32-bit lengths.
 constexpr size_t kLongestDate = 256;
 
 constexpr std::array kDateTimeStyles = {
@@ -74,7 +74,7 @@ UDateFormat* openFormat(const char16_t* pattern, Mode mode) {
   return format;
 }
 
-// The quoted text that a pattern ends with.
+// The quoted text at the end of a pattern.
 TLStringView literalEnding(TLStringView pattern) {
   if (!pattern.ends_with(u'\'')) return {};
   pattern.remove_suffix(1);
@@ -91,7 +91,7 @@ TALDateFormatter::~TALDateFormatter() = default;
 
 std::optional<double> TALDateFormatter::dateFromString(TLStringView text) const {
   if (text.empty() || text.size() > kLongestDate) return std::nullopt;
-  // ICU takes a text that ends before its pattern's last literal, however strict.
+  // Even when strict, ICU accepts a text that ends before the last literal of its pattern.
   if (!text.ends_with(_ending)) return std::nullopt;
   const auto length = static_cast<int32_t>(text.size());
   platform::MutexLock lock(_mutex);

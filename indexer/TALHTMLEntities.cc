@@ -22,7 +22,7 @@ constexpr std::array<std::string_view, 96> kLatin1Names = {
 };
 constexpr uint16_t kFirstLatin1 = 160;
 
-// The other names, with their codes in kOtherCodes at the same place.
+// All other names; kOtherCodes has their codes in the same order.
 constexpr std::array<std::string_view, 152> kOtherNames = {
     "OElig",   "oelig",   "Scaron", "scaron",   "Yuml",    "fnof",  "circ",   "tilde",   "Alpha",
     "Beta",    "Gamma",   "Delta",  "Epsilon",  "Zeta",    "Eta",   "Theta",  "Iota",    "Kappa",

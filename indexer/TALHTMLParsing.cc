@@ -14,10 +14,10 @@ constexpr uint64_t kLeastTitleLimit = 512;
 constexpr int kBlankPasses = 10;
 constexpr const char* kTitleKey = "SysTitleDocumentAttribute";
 
-// Number of bytes behind a lead byte, by its high nibble; 0 for what is no lead byte.
+// The number of bytes after a lead byte, by its high nibble; 0 for other bytes.
 constexpr std::array<uint8_t, 16> kFollowing = {0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 1, 1, 2, 3};
 
-// Each two blanks become one.
+// Replaces each two spaces by one.
 bool halveBlanks(std::string& text) {
   std::string out;
   out.reserve(text.size());
@@ -30,7 +30,7 @@ bool halveBlanks(std::string& text) {
   return changed;
 }
 
-// On purpose made from the text of the body: the title itself only tells that there is one.
+// Taken from the start of the body on purpose: the title element itself is used only as a flag.
 std::string titleFromBody(TLStringView body) {
   while (!body.empty() && u_isUWhiteSpace(body.front())) body.remove_prefix(1);
   while (!body.empty() && u_isUWhiteSpace(body.back())) body.remove_suffix(1);
@@ -92,7 +92,7 @@ void TALHTMLParsing::appendText(std::string_view text) {
   if (!_charset) {
     appendUTF8(text);
   } else {
-    // Text that is not valid in its encoding is left out.
+    // Text that is invalid in its encoding is skipped.
     static_cast<void>(_charset->decode(text, uniChars));
   }
 }
@@ -138,7 +138,7 @@ std::optional<TLString> TALPlainTextFromHTMLData(std::optional<std::string_view>
   if (!data || data->empty()) return std::nullopt;
   TALHTMLParsing parsing(encoding);
   parsing.indexingLimit = limit;
-  // Attributes of tags matter to those of the document only, not to the text.
+  // Meta tags affect the document's attributes only, not its text.
   TALHTMLScanBuffer(*data, TALHTMLStartTag, TALHTMLEndTag,
                     attributes == nullptr ? nullptr : TALHTMLAttribute, parsing);
   if (attributes != nullptr && hasTitleText(parsing)) {

@@ -11,13 +11,13 @@
 #include "platform/Charset.h"
 #include "platform/Text.h"
 
-// The text of an HTML document, null when there is none: markup dropped, entities decoded, a line
-// feed for tags that begin or end a block. Any bytes give some result, in time linear in their
-// number. `limit`, in UTF-16 units, is tested before a run of text is added, so the last run may
-// pass it. `encoding` is one of platform/Charset.h. Any thread.
+// The text of an HTML document, nullopt if it has none: markup is removed, entities are decoded,
+// and tags that begin or end a block become line feeds. Accepts any bytes, in time linear in their
+// number. `limit`, in UTF-16 units, is checked before a run of text is added, so the last run may
+// exceed it. `encoding` is one of platform/Charset.h. Any thread.
 //
-// `attributes`, null where they are not wanted, gets what the meta tags of the head say, if the
-// document has a title, and none otherwise. Texts are strings, dates seconds since 1970, keywords
+// `attributes`, unless null, receives the contents of the meta tags in the head if the document has
+// a title, and is emptied otherwise. Texts are strings, dates are seconds since 1970, keywords are
 // an array of strings.
 [[nodiscard]] std::optional<TLString> TALPlainTextFromHTMLData(
     std::optional<std::string_view> data, uint64_t limit, std::optional<nlohmann::json>* attributes,
@@ -27,23 +27,23 @@
 struct TALHTMLParsing {
   explicit TALHTMLParsing(uint64_t encoding);
 
-  // A fresh one with the encodings and the limit of this one.
+  // A new state with the encodings and the limit of this one.
   [[nodiscard]] TALHTMLParsing fresh() const;
 
   // Appends text in the source encoding. UTF-8 is decoded leniently: continuation bytes are not
-  // checked, stray ones are skipped, and a sequence that would pass the end ends the text.
+  // checked, stray ones are skipped, and a sequence that is cut off ends the text.
   void appendText(std::string_view text);
-  // A line feed at the start of the whole text is dropped here, as above.
+  // Drops a line feed at the start of the whole text, as appendText does.
   void appendUnichars(TLStringView units);
   void appendNewline() { appendUnichars(u"\n"); }
 
-  // False in the head, in scripts and in styles.
+  // False in the head, scripts and styles.
   [[nodiscard]] bool takesText() const { return !inHead && !inScript && !inStyle; }
 
   TLString uniChars;  // the text so far; its capacity doubles from 4096
   std::array<char, 8> newLineBuffer{};
   uint64_t newLineLength = 0;
-  nlohmann::json attributes;  // null while there are none
+  nlohmann::json attributes;  // null if empty
   std::optional<TLString> metaName;
   std::optional<TLString> metaHttpEquiv;
   std::optional<TLString> metaContent;

@@ -16,7 +16,7 @@ constexpr std::string_view kCDATA = "<![CDATA[";
 constexpr std::string_view kCDATAEnd = "]]>";
 constexpr std::string_view kCommentEnd = "-->";
 
-// A cursor over the bytes. Each step moves it on, none moves it back.
+// A cursor over the bytes that only moves forward.
 class Scanner {
  public:
   Scanner(std::string_view bytes, TALHTMLTagCallback startTag, TALHTMLTagCallback endTag,
@@ -49,7 +49,7 @@ class Scanner {
     while (!atEnd() && isWhiteSpace(current())) ++_at;
   }
 
-  // To the first byte that stops, or the end.
+  // Advances to the first byte that stops, or to the end.
   template <typename Stops>
   std::string_view takeUntil(Stops stops) {
     const size_t start = _at;
@@ -90,11 +90,11 @@ class Scanner {
     const std::string_view rest = _bytes.substr(start);
     if (rest.substr(0, kCDATA.size()) == kCDATA &&
         rest.size() >= kCDATA.size() + kCDATAEnd.size()) {
-      // The ">" of the terminator stays and becomes text.
+      // The ">" of the terminator is kept and becomes text.
       const size_t end = _bytes.find(kCDATAEnd, start + kCDATA.size());
       _at = end == std::string_view::npos ? _bytes.size() : end + kCDATAEnd.size() - 1;
     } else if (rest.substr(0, 4) == "<!--") {
-      // The dashes that open a comment may close it, too: "<!-->" is an empty one.
+      // The dashes that open a comment may also close it: "<!-->" is an empty one.
       const size_t end = _bytes.find(kCommentEnd, start + 2);
       _at = end == std::string_view::npos ? _bytes.size() : end + kCommentEnd.size();
     } else {
@@ -103,7 +103,7 @@ class Scanner {
     }
   }
 
-  // From the name of a tag on. What turns out to be none is text.
+  // Scans a tag from its name on. If it is no tag after all, it becomes text.
   void scanTag(size_t start, TALHTMLTagCallback callback) {
     takeUntil([](char c) { return c == '>' || isWhiteSpace(c); });
     while (!atEnd() && current() != '/' && current() != '>') scanAttribute();
@@ -130,7 +130,7 @@ class Scanner {
     if (_attribute != nullptr) _attribute(name, value, _parsing);
   }
 
-  // A ">" ends a value even in quotes.
+  // A ">" ends a value even inside quotes.
   std::string_view scanValue() {
     if (atEnd()) return {};
     const char quote = current();
@@ -154,8 +154,8 @@ class Scanner {
 constexpr size_t kMaximumDigits = 15;
 constexpr long kMaximumCode = 0xFFFF;
 
-// The code of "#65" or "#x41" without its "#", 0 for none. The number ends at the first byte that
-// is no digit.
+// The code of "#65" or "#x41", given without its "#"; 0 for none. The number ends at the first
+// non-digit.
 long numericCode(std::string_view number) {
   int base = 10;
   if (!number.empty() && htmltext::lower(number.front()) == 'x') {

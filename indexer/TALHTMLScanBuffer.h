@@ -4,23 +4,23 @@
 
 #include "indexer/TALHTMLParsing.h"
 
-// A whole tag, with "<" and ">".
+// `tag` is the whole tag, including "<" and ">".
 using TALHTMLTagCallback = void (*)(std::string_view tag, TALHTMLParsing& parsing);
 using TALHTMLAttributeCallback = void (*)(std::string_view name, std::string_view value,
                                           TALHTMLParsing& parsing);
 
-// Scans `bytes` once, from the first to the last, and appends the text to `parsing`. Callbacks may
-// be null. The views that they get are parts of `bytes`.
+// Scans `bytes` once from start to end and appends the text to `parsing`. Callbacks may be null;
+// the views passed to them point into `bytes`.
 void TALHTMLScanBuffer(std::string_view bytes, TALHTMLTagCallback startTag,
                        TALHTMLTagCallback endTag, TALHTMLAttributeCallback attribute,
                        TALHTMLParsing& parsing);
 
-// The callbacks that make a document's text, title and attributes. Names of tags are compared in
-// any case and by their beginning only.
+// The callbacks that build a document's text, title and attributes. Tag names are compared
+// case-insensitively and by their beginning only.
 void TALHTMLStartTag(std::string_view tag, TALHTMLParsing& parsing);
 void TALHTMLEndTag(std::string_view tag, TALHTMLParsing& parsing);
 void TALHTMLAttribute(std::string_view name, std::string_view value, TALHTMLParsing& parsing);
 
-// Appends what an entity stands for, from its "&" to its ";" if it has one. Nothing for one that is
-// unknown. An empty one is a programming error.
+// Appends the character of an entity, given from its "&" up to its ";" if it has one. Ignores
+// unknown entities. An empty entity is a programming error.
 void TALHTMLDecodeEntity(std::string_view entity, TALHTMLParsing& parsing);

@@ -11,7 +11,7 @@ namespace {
 using htmltext::beginsWith;
 using nlohmann::json;
 
-// Each makes the value of an attribute from the content of a meta tag; null for none.
+// Builds the value of an attribute from the content of a meta tag; null for none.
 using MakeValue = json (*)(const std::string& content);
 
 json textValue(const std::string& content) {
@@ -91,7 +91,8 @@ void setNamedAttribute(const std::string& name, const std::string& content, json
   }
 }
 
-// Takes over the character set of "text/html; charset=NAME". The text is decoded as before.
+// Sets the character set from "text/html; charset=NAME". It does not affect how the text is
+// decoded.
 void setCharset(const std::string& content, TALHTMLParsing& parsing) {
   constexpr std::string_view kCharset = "charset";
   const size_t found = htmltext::find(content, kCharset);
@@ -146,7 +147,7 @@ void startTagInHead(std::string_view tag, TALHTMLParsing& parsing) {
   }
 }
 
-// The value in its encoding; none where it is not valid in that.
+// The value decoded from its encoding; nullopt if it is invalid.
 std::optional<TLString> decodedValue(std::string_view value, uint64_t encoding) {
   if (encoding == platform::kEncodingUTF8) {
     if (!platform::isValidUTF8(value)) return std::nullopt;

@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <string_view>
 
-// Bytes as HTML compares them: letters of ASCII in any case, white space of ASCII only.
+// HTML comparison of bytes: ASCII letters case-insensitively, ASCII white space only.
 namespace htmltext {
 
 inline constexpr std::string_view kWhiteSpace = " \t\n\v\f\r";
@@ -26,7 +26,7 @@ inline constexpr std::string_view kWhiteSpace = " \t\n\v\f\r";
   return bytes.size() == lowered.size() && beginsWith(bytes, lowered);
 }
 
-// Position of `lowered`, which is not empty, or npos.
+// The position of `lowered`, which must not be empty, or npos.
 [[nodiscard]] inline size_t find(std::string_view bytes, std::string_view lowered) {
   const auto at = std::search(bytes.begin(), bytes.end(), lowered.begin(), lowered.end(),
                               [](char a, char b) { return lower(a) == b; });

@@ -82,12 +82,12 @@ std::shared_ptr<TALDocStore> TALIndexer::docStore() const {
 }
 
 void TALIndexer::closeTextStore() {
-  _docDates.forgetAll();  // another index, other numbers
+  _docDates.forgetAll();  // a new index has new DocIDs
   _text.close();
 }
 
-// Each step makes only what is missing, so that after a reset the zone manager, tokenizer, synonyms
-// and query processor stay.
+// Creates only what is missing, so that zone manager, tokenizer, synonyms and query processor
+// survive a reset.
 void TALIndexer::_init() {
   const uint64_t start = platform::monotonicTicks();
   makeQueryObjects();
@@ -105,7 +105,7 @@ void TALIndexer::_init() {
     int64_t stored = 0;
     const std::optional<bool> empty = storeIsEmpty(&stored, &error);
     if (!empty) {
-      // What cannot be read may be there: neither index nor store is touched.
+      // Data that cannot be read may still be there, so neither index nor store is touched.
       log().error("Could not get docstore count: {}", platform::printable(error));
       _openingError = error;
       return;
@@ -129,8 +129,8 @@ void TALIndexer::_init() {
   log().standard("Finished initing indexer in time: {} ms", elapsedMillisSinceMonotonicTime(start));
 }
 
-// The store first: an index of an empty store is made anew, whatever happens in between, while with
-// a full store and its client states no client would send again.
+// Empties the store first: an index with an empty store is recreated whatever happens in between.
+// With a full store and its client states no client would send its mail again.
 bool TALIndexer::setTextStoreAside(TLErrorOut error) {
   const auto store = docStore();
   if (store != nullptr && !store->resetWithError(error)) return false;
@@ -141,7 +141,7 @@ bool TALIndexer::setTextStoreAside(TLErrorOut error) {
   return true;
 }
 
-// The count of a store that cannot be read is 0, too; a walk tells.
+// The count is also 0 if the store cannot be read; only an enumeration can tell.
 std::optional<bool> TALIndexer::storeIsEmpty(int64_t* stored, TLErrorOut error) {
   const auto store = docStore();
   std::optional<TLError> failure;
@@ -229,8 +229,7 @@ std::unique_ptr<salt::Index> TALIndexer::loadTextStore(TLErrorOut error) {
   return index;
 }
 
-// A text index made from nothing empties the document store, so that the two never differ in what
-// they know of.
+// A newly created text index empties the document store, so that both hold the same documents.
 std::unique_ptr<salt::Index> TALIndexer::createTextStore(int64_t storedDocuments,
                                                          TLErrorOut error) {
   log().standard("Could not find path, creating new textstore at path {}", _path);
@@ -318,7 +317,7 @@ void TALIndexer::resetWithCompletionHandler(Completion completionHandler) {
 bool TALIndexer::_resetWithError(TLErrorOut error) {
   const auto store = docStore();
   if (!_resetSALT(error)) return false;
-  // It holds mail, too.
+  // An index that was set aside contains mail too.
   for (const std::string& aside : salt::indexesSetAside(_path)) {
     if (!platform::removeItem(aside, error)) return false;
   }

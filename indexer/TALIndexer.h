@@ -28,117 +28,119 @@
 
 inline constexpr const char* kTALIndexerErrorDomain = "TALIndexer";
 
-// Codes of the errors of the class.
+// Error codes of this class.
 enum class TALIndexerError {
   document = 1,          // "document has no identifier", "index failed"
-  query = 3,             // the query gave no terms
+  query = 3,             // the query yielded no terms
   shuttingDown = 4,      // "shutting down"
   validationFailed = 5,  // "index validation failed"
 };
 
-// The heart of one protection class: one text index, one document store, and all work that changes
-// them.
+// Indexes and searches the documents of one protection class: owns its text index and its document
+// store, and performs all work that changes them.
 //
-// Threads. The destructor waits for what is queued, so it must not run on the queue. Adds, deletes,
-// reset and vacuum run one after the other on the indexer's own queue; the operations that start
-// them return at once, from any thread, and completions run on the queue. Searches, statistics and
-// the client state run on the caller's thread.
+// Threads. Adds, deletes, reset and vacuum run one after another on the indexer's own queue; the
+// functions that start them return at once, may be called on any thread, and call their completion
+// on the queue. Searches, statistics and the client state run on the caller's thread. The
+// destructor waits for queued work, so it must not run on the queue.
 //
 // Invariants.
 // 1. The text index is opened and closed with `_indexMutex` held, by work on `_queue` and at the
-// end
-//    of a shutdown. Who reads it takes a reference from `_text`, which keeps it open.
-// 2. A search holds `_indexMutex` for one pass, a batch for all its documents: they never overlap.
-//    What changes the words of a query between two passes reads the index beside batches.
-// 3. The document store is written before the text index. What a search finds in the index and not
-// in the
-//    store is left out.
-// 4. After `shutdown` no work runs: what is queued, or comes later, completes with "shutting down".
+//    end of a shutdown. A reader takes a reference from `_text`, which keeps the index open.
+// 2. A search holds `_indexMutex` for one pass, and a batch for all its documents, so they never
+//    overlap. Query modification between two passes reads the index concurrently with batches.
+// 3. The document store is written before the text index. A result that is not in the store is
+//    dropped.
+// 4. After `shutdown` no work runs: work that is queued or submitted later completes with
+//    "shutting down".
 class TALIndexer {
  public:
   using Items = std::vector<std::shared_ptr<TLIndexableItem>>;
   using Strings = std::vector<TLString>;
   using Completion = std::function<void(const std::optional<TLError>&)>;
 
-  // Opens, or makes, the text index in the directory `path`, and reads the synonyms. The store is
-  // open. Never fails: problems are logged, and an indexer without index or tokenizer reports them
-  // with each call. See `openingError`.
+  // Opens or creates the text index in the directory `path`, and reads the synonyms. The store must
+  // be open. Never fails: problems are logged, and an indexer without an index or tokenizer reports
+  // this at each call. See `openingError`.
   TALIndexer(std::string path, const std::string& protectionClass,
              std::shared_ptr<TALDocStore> docStore, std::string synonymFilePath);
   ~TALIndexer();
   TALIndexer(const TALIndexer&) = delete;
   TALIndexer& operator=(const TALIndexer&) = delete;
 
-  // Ingest. A document can be found once the completion has been called without error. A batch that
-  // fails in the text index stays stored; its rest is found once it is sent again.
+  // Adds documents. They can be found once the completion is called without an error. If the text
+  // index fails during a batch, the batch is stored, and the documents from the failure on can be
+  // found only after they are sent again.
   void addDocs(Items docs, std::string bundleID, Completion completionHandler);
-  // Deletes first, then adds, then stores the state; each only when all before it has succeeded.
+  // Deletes first, then adds, then stores the client state; each step only if all before it
+  // succeeded.
   void addDocs(Items docs, Strings deleteItemsByIdentifiers, std::optional<std::string> clientState,
                TLString clientStateName, std::string bundleID, Completion completionHandler);
-  // An identifier that is not known ends the list with an error; earlier deletions stand.
+  // An unknown identifier ends the operation with an error; earlier deletions remain.
   void deleteItemsByIdentifiers(Strings identifiers, std::string bundleID,
                                 Completion completionHandler);
   void deleteItemsByDomainIdentifiers(Strings domainIdentifiers, Completion completionHandler);
 
-  // Forgets all documents and all client states.
+  // Removes all documents and all client states.
   void resetWithCompletionHandler(Completion completionHandler);
   void saltVacuumAndCompactWithCompletionHandler(Completion completionHandler);
 
-  // Counts the frequent words anew, in the background. The handler runs on the vocabulary's queue
-  // and must not wait for the indexer; without vocabulary it is not called.
+  // Rebuilds the vocabulary in the background. The handler runs on the vocabulary's queue and must
+  // not wait for the indexer; without a vocabulary it is not called.
   void forceRebuildTopKVocabWithCompletionHandler(Completion completionHandler);
-  // The frequent words, most frequent first; null without vocabulary.
+  // The vocabulary, most frequent word first; null if there is none.
   [[nodiscard]] std::shared_ptr<const TALTopKVocab::Words> topKVocabulary();
-  // The same, read from the store again.
+  // The vocabulary, reloaded from the store.
   std::shared_ptr<const TALTopKVocab::Words> loadTopKVocabFromDocStore(TLErrorOut error);
 
-  // The bytes stored under a client's name, none when there are none. Synchronous.
+  // Passes the bytes stored under a client's name to the handler, nullopt if there are none.
+  // Synchronous.
   void fetchLastClientStateforName(
       const TLString& name,
       const std::function<void(const std::optional<std::string>&, const std::optional<TLError>&)>&
           completionHandler);
 
-  // 18 figures by their statistics keys; null without index or store. Reads all stored text.
+  // 18 statistics by key; null without index or store. Reads all stored text.
   [[nodiscard]] nlohmann::json docStats();
-  // The metrics of the text index for people; empty without index. Reads all stored text.
+  // The metrics of the text index as text; empty without an index. Reads all stored text.
   [[nodiscard]] std::string saltMetrics();
 
   // Ranked items, at most "salt.maxTopK", each with its card. Writes the resolved parameters into
-  // the query. With a failure the result is empty and the error set. Where the words as typed find
-  // no more than "queryModification.sufficentRetrievalThreshold" items, the results are those of
-  // changed words, if any can be found.
+  // the query. On failure the result is empty and the error is set. If the words as typed find no
+  // more than "queryModification.sufficentRetrievalThreshold" items, the query is modified, and the
+  // results are those of the modified words, if any.
   //
-  // The items are the best `most`; `count`, which may be null, receives how many were ranked.
-  // `replaced`, which may be null, receives the words that were changed for these results.
+  // Returns the best `most` items. `count` and `replaced` may be null: they receive how many items
+  // were ranked, and the words that were replaced for these results.
   [[nodiscard]] Items search(TLQuery& query, TLErrorOut error, size_t most = SIZE_MAX,
                              size_t* count = nullptr, WordReplacements* replaced = nullptr);
 
-  // Every stored document whose subject is one of `subjects`, in the store's order, without scores;
-  // none with an error set when the store fails. Reads every document.
+  // Every stored document whose subject is one of `subjects`, in the store's order and without
+  // scores; nullopt with an error when the store fails. Reads every document.
   [[nodiscard]] std::optional<Items> iterateAllDocsToFindMatchingSubjects(const Strings& subjects,
                                                                           TLErrorOut error);
 
-  // Refuses further work, waits for what runs, closes index and store. Not from the indexer's
+  // Refuses further work, waits for running work, closes index and store. Not from the indexer's
   // queue.
   void shutdown();
 
-  // Why there is no text index, none where there is one. What is on the disk is as it was: it is
-  // tried again with the next add, or by an indexer made anew.
+  // Why there is no open text index; nullopt if there is one. The files are unchanged: the next
+  // add, or a new indexer, tries again.
   [[nodiscard]] std::optional<TLError> openingError();
 
   [[nodiscard]] const std::string& path() const { return _path; }
   [[nodiscard]] std::shared_ptr<TALDocStore> docStore() const;
 
-  // The key of a document in the store; none for an empty identifier or one that makes no valid
-  // URL.
+  // The key of a document in the store; nullopt for an empty identifier or one that does not form a
+  // valid URL.
   [[nodiscard]] static std::optional<TLURL> documentURLForIdentifier(
       const std::optional<TLString>& identifier, const std::string& bundleID);
 
-  // True when there are at most that many results; a threshold below 0 counts as huge.
+  // True when there are at most `threshold` results; a negative threshold counts as huge.
   [[nodiscard]] static bool _notSufficientRetrieval(size_t results, int64_t threshold);
   [[nodiscard]] static bool _shouldRunQueryModification(size_t results, int64_t retrievalThreshold);
 
-  // -1, 0 or 1; 1 also when either is not a number.
+  // -1, 0 or 1; also 1 if either is NaN.
   [[nodiscard]] static int _floatCompare(float a, float b);
   // 0 for a document up to a day old, falling to -1 at about 366 days. Seconds since 1970.
   [[nodiscard]] static double _computeFreshnessPenalty(double documentTime, double queryTime);
@@ -148,24 +150,24 @@ class TALIndexer {
  private:
   using Task = std::function<std::optional<TLError>()>;
 
-  // The maps of one batch.
+  // The working data of one batch.
   struct Batch;
 
   void _init() TL_REQUIRES(_indexMutex);
-  // Has the class start empty, since its index is damaged.
+  // Makes the class start empty because its index is damaged.
   bool setTextStoreAside(TLErrorOut error) TL_REQUIRES(_indexMutex);
-  // Whether the store has no documents; none, with an error, where it cannot be read.
+  // Whether the store has no documents; nullopt with an error if it cannot be read.
   std::optional<bool> storeIsEmpty(int64_t* stored, TLErrorOut error);
-  // False when the system does not let the index be opened or made: then `_openingError` tells.
+  // False if the system refuses to open or create the index; `_openingError` then has the reason.
   bool openTextStore(int64_t storedDocuments) TL_REQUIRES(_indexMutex);
   std::unique_ptr<salt::Index> loadTextStore(TLErrorOut error) TL_REQUIRES(_indexMutex);
   std::unique_ptr<salt::Index> createTextStore(int64_t storedDocuments, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
   void makeQueryObjects();
-  // Waits for all who read the index, a count of the vocabulary included.
+  // Waits for all readers of the index, including a count of the vocabulary.
   void closeTextStore() TL_REQUIRES(_indexMutex);
   std::shared_ptr<TALTopKVocab> topKVocab();
-  // For work on the queue: starts a rebuild of the vocabulary if enough documents have come.
+  // Starts a rebuild of the vocabulary if enough documents were added. On `_queue`.
   void checkVocabulary();
 
   void _scheduleWork(std::string name, Task task, Completion completionHandler);
@@ -175,10 +177,10 @@ class TALIndexer {
   // The key of a client's state in the store's metadata.
   static std::string clientStateKey(const TLString& name);
   static TLError _errorWithCode(TALIndexerError code, const char* message, TLErrorOut error);
-  // The error of a call that needs the index where there is none.
+  // The error of a call that needs the index when there is none.
   [[nodiscard]] TLError noIndexError() const TL_REQUIRES(_indexMutex);
 
-  // Waits while the text index wants nothing added. On `_queue`.
+  // Backpressure: waits while the text index is busy with a merge or compaction. On `_queue`.
   void holdBack() TL_EXCLUDES(_indexMutex);
   bool _addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
@@ -197,29 +199,29 @@ class TALIndexer {
                                           const std::string& bundleID);
   bool _deleteItemsByIdentifiers(const Strings& identifiers, const std::string& bundleID,
                                  TLErrorOut error);
-  // Deletes it from the store. None when that did not happen.
+  // Deletes the document from the store. Nullopt when it was not deleted.
   [[nodiscard]] std::optional<uint32_t> deleteStored(const TLString& identifier,
                                                      const std::string& bundleID,
                                                      std::optional<TLError>* failure)
       TL_REQUIRES(_indexMutex);
   bool _deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
-  // Hides what was deleted from the store in the text index, and clears the list.
+  // Hides documents that were deleted from the store in the text index, and clears the list.
   void hideDeleted(std::vector<uint32_t>* docIDs);
 
-  // What a pass has found: the best items, and how many were ranked.
+  // The result of a pass: the best items, and the number of items ranked.
   struct Found {
     Items items;
     size_t count = 0;
   };
-  // What one pass ranks by.
+  // The inputs of ranking in one pass.
   struct RankParams;
   struct RankKey;
 
   Found searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms, size_t most,
                    TLErrorOut error) TL_REQUIRES(_indexMutex);
-  // One for each result, in their order, with an item only where its date was not known or all are
-  // wanted. Results that the store has no document for are left out.
+  // One key for each result, in the same order, with an item only if its date was unknown or all
+  // items are wanted. Results without a document in the store are dropped.
   std::vector<RankKey> rankKeys(const std::vector<saltsearch::DocResult>& results,
                                 const RankParams& params, size_t most, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
@@ -231,13 +233,13 @@ class TALIndexer {
   static void _fillScores(TLIndexableItem& item, const saltsearch::DocResult& indexerResult,
                           const RankParams& params);
   static float _lightWeightScoring(const TLIndexableItem& item, const RankParams& params);
-  // The second pass: with changed terms where a modifier finds some, else `firstResults`. Drops
-  // them when the second pass fails.
+  // The second pass: searches with modified terms if a modifier finds some, otherwise returns
+  // `firstResults`. Drops these if the second pass fails.
   Found searchModified(const TLQuery& query, const std::vector<saltsearch::Term>& saltQueryTerms,
                        Found firstResults, size_t most, TLErrorOut error,
                        WordReplacements* replaced);
-  // Tries one way after the other to change terms that found too little; the first that changes
-  // something ends it. True when `modifiedQueryTerms` and `reason` are filled.
+  // Tries the modifiers in turn on terms that found too little; the first that changes a term wins.
+  // True when `modifiedQueryTerms` and `reason` are set.
   bool _modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
                          std::vector<saltsearch::Term>& modifiedQueryTerms,
                          const TLParameters& searchParams, WordReplacement::Reason& reason);
@@ -251,21 +253,21 @@ class TALIndexer {
 
   const std::string _path;
   const std::string _synonymFilePath;
-  TALZoneManager _zoneManager;                         // self-synchronised
+  TALZoneManager _zoneManager;                         // thread-safe
   TALSynonyms _synonymModel;                           // loaded at construction, then read only
   std::unique_ptr<tokenizer::Tokenizer> tk;            // fixed after construction
   std::unique_ptr<TALQueryProcessor> _queryProcessor;  // fixed after construction
 
-  // Fair: a search that waits for a batch does not wait for those behind it.
+  // Fair, so that a search waits for the current batch only, not for those that follow.
   platform::FairMutex _indexMutex;
-  OpenTextHolder _text;  // self-synchronised; see invariant 1
+  OpenTextHolder _text;  // thread-safe; see invariant 1
   DocDates _docDates TL_GUARDED_BY(_indexMutex);
   std::optional<TLError> _openingError TL_GUARDED_BY(_indexMutex);
   bool _shutdown TL_GUARDED_BY(_indexMutex) = false;
   mutable platform::Mutex _docStoreMutex;
   std::shared_ptr<TALDocStore> _docStore TL_GUARDED_BY(_docStoreMutex);
 
-  // Validation at load is switched off; `_validated` falls to false only through one.
+  // Validation at load is switched off; only a failed validation clears `_validated`.
   const bool _shouldRunValidation = false;
   std::atomic<bool> _validated{true};
 

@@ -17,27 +17,28 @@ using platform::MutexLock;
 using platform::Signpost;
 
 struct TALIndexer::Batch {
-  std::vector<TLURL> docURLs;  // one per input item, same order
+  std::vector<TLURL> docURLs;  // one per input item, in the same order
   std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>>
-      oldDocs;  // what the store knows already
+      oldDocs;  // versions already in the store
   std::unordered_map<TLURL, uint32_t> oldDocIDs;
-  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>> mergedDocs;  // the final form
-  std::unordered_set<TLURL> urlsToIndex;  // whose text must go into the text index
+  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>> mergedDocs;  // as they will be stored
+  std::unordered_set<TLURL> urlsToIndex;  // documents whose text must be indexed
   std::unordered_map<TLURL, uint32_t> newDocIDs;
 };
 
 namespace {
 
-// The index writes all that is deleted whenever it hides more. So many are hidden together; as many
-// may stay in the index, and not in the store, if the process is killed in between.
+// The index rewrites the whole set of deleted documents at each deletion, so this many are deleted
+// together. If the process is killed in between, as many may remain in the index without being in
+// the store.
 constexpr size_t kDeletedAtATime = 100;
 
-// The store gives 0 for an unknown document and calls that no error; to delete one is one, under
-// the store's domain and the number that its engine has for "not found".
+// For an unknown document the store returns 0 without an error, but deleting it is an error, with
+// the store's domain and the engine's code for "not found".
 constexpr int kDocumentNotFound = 12;
 constexpr const char* kDocStoreErrorDomain = "DocStore";
 
-// Gives one item its plain text and its snippet. Touches nothing else.
+// Sets the plain text and the snippet of one item, and touches nothing else.
 void prepareText(TLIndexableItem& item) {
   std::optional<TLString> body;
   const auto& html = item.attributeForKey(TLAttributeKey::HTML_CONTENT_DATA);
@@ -51,7 +52,7 @@ void prepareText(TLIndexableItem& item) {
   }
 }
 
-// What the log says of a document: identifier, bundle, redacted subject, URL.
+// How log lines describe a document: identifier, bundle, redacted subject, URL.
 std::string describe(const TLIndexableItem& doc, const std::string& bundleID,
                      const std::optional<TLURL>& url) {
   return fmt::format("(identifier: {}, bundleID: {}, subject: {}, docURL: {})",
@@ -125,7 +126,7 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
     if (error) return error;
   }
   if (clientState) {
-    // A client goes on from its state, so that all before it must survive a loss of power.
+    // A client continues from its state, so everything before it must survive a power loss.
     if (const auto text = _text.get(); text != nullptr && !text->index->Sync()) {
       return platform::posixError(EIO, "the text index cannot be written to the disk");
     }
@@ -136,7 +137,7 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
   return error;
 }
 
-// Searches go on meanwhile.
+// Holds no lock, so searches go on meanwhile.
 void TALIndexer::holdBack() {
   if (const auto text = _text.get()) text->index->WaitWhileTidying();
 }
@@ -240,7 +241,7 @@ bool TALIndexer::writeDocs(Batch& batch, TLErrorOut error) {
     auto& docs = batch.oldDocs.contains(url) ? docsToUpdate : docsToInsert;
     docs.emplace_back(url, batch.mergedDocs[url]);
   }
-  // A failed commit is reported by the error alone.
+  // A failed commit is reported through the error only.
   std::optional<TLError> failure;
   const bool updated =
       docsToUpdate.empty() ||
@@ -316,7 +317,7 @@ bool TALIndexer::_indexDoc(salt::Index& index, const TLIndexableItem& doc, uint3
   const uint64_t start = platform::monotonicTicks();
   for (auto& [zoneID, zone] : zones) {
     if (zone.text.empty() || zone.offsets.empty()) continue;
-    // The offsets may be changed by the call; this is their last use.
+    // AddZone may change the offsets; this is their last use.
     if (!index.AddZone(docID, zoneID, zone.text, zone.offsets, true)) return false;
   }
   *docParsingTime = elapsedMillisSinceMonotonicTime(start);
@@ -387,7 +388,7 @@ std::optional<uint32_t> TALIndexer::deleteStored(const TLString& identifier,
   return deleted ? std::optional(docID) : std::nullopt;
 }
 
-// A document that the index still finds, and the store no longer has, is no result.
+// A document that is still in the index but no longer in the store is not a result.
 void TALIndexer::hideDeleted(std::vector<uint32_t>* docIDs) {
   const auto text = _text.get();
   if (text != nullptr && !docIDs->empty()) text->index->DeleteDocs(*docIDs);

@@ -9,7 +9,7 @@ using platform::MutexLock;
 
 namespace {
 
-// Modifiers change the first token of a term and leave the number of terms as it is.
+// Modifiers change the first tokens of terms and keep the number of terms.
 WordReplacements replacedWords(const std::vector<saltsearch::Term>& typed,
                                const std::vector<saltsearch::Term>& modified,
                                WordReplacement::Reason reason) {
@@ -65,7 +65,7 @@ TALIndexer::Found TALIndexer::searchModified(const TLQuery& query,
   return found;
 }
 
-// The modifiers read the text index beside ingest.
+// The modifiers read the text index concurrently with ingest.
 bool TALIndexer::_modifyQueryTerms(const std::vector<saltsearch::Term>& queryTerms,
                                    std::vector<saltsearch::Term>& modifiedQueryTerms,
                                    const TLParameters& searchParams,

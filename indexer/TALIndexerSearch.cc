@@ -16,7 +16,7 @@ using platform::Signpost;
 namespace {
 
 constexpr double kSecondsPerDay = 86400.0;
-// log2 of the age in days, plus 1, at which the freshness penalty is at its end.
+// log2(age in days) + 1 at which the freshness penalty reaches its limit.
 constexpr double kFreshnessSpan = 7.52;
 
 const platform::Log& rankingLog() {
@@ -34,7 +34,7 @@ std::string _stringFromTLPersons(const std::vector<std::shared_ptr<TLPerson>>* p
   return text;
 }
 
-// How many of the best the ranking log shows, 0 when it is off.
+// How many top items to log, 0 when logging of the ranking is off.
 size_t itemsToLog(const TLParameters& params) {
   if (!rankingLog().enabled(platform::LogLevel::info)) return 0;
   return static_cast<size_t>(
@@ -75,8 +75,8 @@ struct TALIndexer::RankParams {
         textScoreWeight(params.floatValueForKey("ranking.textScoreWeight").value_or(0.0F)),
         freshnessWeight(params.floatValueForKey("ranking.freshnessWeight").value_or(0.0F)) {}
 
-  // The text product is rounded to float, the sum made in double, and rounded to float again: the
-  // order is part of the result.
+  // The text score is rounded to float, the sum is computed in double and rounded to float again:
+  // this sequence is part of the result.
   [[nodiscard]] float lightScore(float textScore, double freshness) const {
     const float text = textScoreWeight * textScore;
     return static_cast<float>(freshness * static_cast<double>(freshnessWeight) +
@@ -88,9 +88,9 @@ struct TALIndexer::RankParams {
   float freshnessWeight;
 };
 
-// One result and what its place depends on. The item is there once it is needed.
+// One result and what its rank depends on. The item is set once it is needed.
 struct TALIndexer::RankKey {
-  // Those of which neither comes before the other are told apart by their identifiers.
+  // By scores and date only; ranksBefore decides ties by identifier.
   static bool scoresBefore(const RankKey& a, const RankKey& b) {
     if (const int order = _floatCompare(b.lightScore, a.lightScore)) return order < 0;
     return _floatCompare(b.mailDateReceived, a.mailDateReceived) < 0;
@@ -111,7 +111,7 @@ struct TALIndexer::RankKey {
   const saltsearch::DocResult* result = nullptr;
   std::shared_ptr<TLIndexableItem> item = nullptr;
   float lightScore = 0;
-  float mailDateReceived = 0;  // narrowed: dates within about two minutes tie
+  float mailDateReceived = 0;  // narrowed to float: dates within about two minutes tie
 };
 
 TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t most, size_t* count,
@@ -225,8 +225,8 @@ std::vector<TALIndexer::RankKey> TALIndexer::rankKeys(
   return keys;
 }
 
-// Reads the items of `keys`. A key without one loses its result. False, with the error, when the
-// store has failed.
+// Reads the items of `keys`. Sets the result of a key to null if its document is not in the store.
+// False, with the error, if the store failed.
 bool TALIndexer::retrieveItems(const std::vector<RankKey*>& keys, const RankParams& params,
                                TLErrorOut error) {
   std::vector<uint32_t> ids;
@@ -260,7 +260,7 @@ bool TALIndexer::retrieveItems(const std::vector<RankKey*>& keys, const RankPara
   return true;
 }
 
-// Only what may be among the best `most` is read: these, and what ties with the last of them.
+// Reads only the items that may be among the best `most`: these and the ones tied with the last.
 TALIndexer::Found TALIndexer::bestItems(std::vector<RankKey>& keys, const RankParams& params,
                                         size_t most, TLErrorOut error) {
   std::stable_sort(keys.begin(), keys.end(), RankKey::scoresBefore);

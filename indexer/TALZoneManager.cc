@@ -10,7 +10,7 @@ namespace {
 
 struct ZoneRow {
   TLAttributeKey key;
-  std::string_view parameter;  // of the score, empty for none
+  std::string_view parameter;  // with the score; empty for none
 };
 
 using enum TLAttributeKey;
@@ -43,7 +43,7 @@ std::vector<TLAttributeKey> zoneKeys() {
   return keys;
 }
 
-// The keys that a document has attributes for.
+// The keys for which a document has attributes.
 struct AttributeKeys {
   explicit AttributeKeys(const TLIndexableItem& item) {
     for (const auto& attribute : item.attributes()) {

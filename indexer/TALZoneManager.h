@@ -12,40 +12,39 @@
 #include "records/TLIndexableItem.h"
 #include "records/TLParameters.h"
 
-// Knows which attributes are zones, scored fields of the text index, what each is worth, and how a
-// new version of a document is folded into the old one. A zone's ID is the number of its attribute
-// key.
+// Knows which attributes are zones (scored fields of the text index) and their scores, and merges a
+// new version of a document into the old one. A zone's ID is the number of its attribute key.
 //
-// Threads: any. Scores are a setting of the manager: each search sets all of them at its start, in
-// one step, and they stay until the next one does. Of two searches at once the last to start
-// decides for both.
+// Threads: any. Scores belong to the manager: each search sets all of them atomically at its start,
+// and they stay until the next search. Of two concurrent searches, the last to start decides for
+// both.
 class TALZoneManager {
  public:
-  // Scores start as the default parameters have them.
+  // Scores start at the default parameters.
   TALZoneManager();
 
   void setupAttributeScoresWithSearchParams(const TLParameters& params);
 
-  // Null for keys of 0 and below, and for CUSTOM without a zone of its own. Whether the attribute
-  // is indexable makes no difference.
+  // Nullopt for keys of 0 and below, and for CUSTOM without its own zone. Does not depend on
+  // whether the attribute is indexable.
   [[nodiscard]] std::optional<int32_t> zoneIDForAttributeKey(
       int32_t key, const std::optional<TLString>& withCustomKey) const;
 
-  // Null for no zone, and for a zone without score.
+  // Nullopt without a zone, and for a zone without a score.
   [[nodiscard]] std::optional<float> scoreForZoneID(std::optional<int32_t> zoneID) const;
 
-  // A null score takes the zone's score away; for no zone nothing happens.
+  // Nullopt as the score removes the zone's score; nullopt as the zone does nothing.
   void overrideScoreForZoneID(std::optional<int32_t> zoneID, std::optional<float> score);
 
-  // A new item with the attributes of the new version, and behind them those of the old one whose
-  // keys the new one does not have. Attributes are shared with both. The flag tells whether the new
-  // version brings an indexable attribute, so that the text has to be indexed again. A missing old
-  // version has no attributes.
+  // A new item with the attributes of the new version, followed by those attributes of the old
+  // version whose keys the new one lacks. Attributes are shared with both. The flag tells whether
+  // the new version has an indexable attribute, so that the text must be indexed again. A missing
+  // old version has no attributes.
   [[nodiscard]] std::shared_ptr<TLIndexableItem> mergeNewDoc(const TLIndexableItem& newDoc,
                                                              const TLIndexableItem* oldDoc,
                                                              bool* shouldIndexNewDoc) const;
 
-  // The attributes that make up a document's searchable text, in order.
+  // The attributes that form a document's searchable text, in order.
   [[nodiscard]] const std::vector<TLAttributeKey>& indexableEnumKeyAttribs() const {
     return _indexableEnumKeyAttribs;
   }
@@ -55,7 +54,7 @@ class TALZoneManager {
                       const std::optional<TLString>& withCustomKey) TL_REQUIRES(_mutex);
   void store(std::optional<int32_t> zoneID, std::optional<float> score) TL_REQUIRES(_mutex);
 
-  // Fixed at creation.
+  // Fixed after construction.
   const std::map<TLString, int32_t> _customAttrZoneID;
   const std::shared_ptr<const TLParameters> _searchParams;
   const std::vector<TLAttributeKey> _indexableEnumKeyAttribs;

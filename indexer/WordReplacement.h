@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-// A word of a query that found too little, and what the search looked for in its place.
+// A query word with too few results and what the search used in its place.
 struct WordReplacement {
   enum class Reason { spelling, synonym, stem };
 
@@ -14,6 +14,6 @@ struct WordReplacement {
 };
 using WordReplacements = std::vector<WordReplacement>;
 
-// A list holds no more words, and no longer ones, in bytes; others are left out of it.
+// Upper bounds of the words in a list, and of their lengths in bytes; other words are left out.
 inline constexpr size_t kMaxWordReplacements = 64;
 inline constexpr size_t kMaxReplacedWordSize = 256;

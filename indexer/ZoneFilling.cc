@@ -6,14 +6,14 @@
 
 namespace {
 
-// Which value of an attribute goes into its zone.
+// The value of an attribute that goes into its zone.
 enum class Source { string, strings, html, persons };
 
 struct Row {
   TLAttributeKey key;
   Source source;
   bool tokenize;
-  TLAttributeKey emailZone = TLAttributeKey::UNKNOWN;  // for persons: where their addresses go
+  TLAttributeKey emailZone = TLAttributeKey::UNKNOWN;  // for persons: the zone of their addresses
 };
 
 using enum TLAttributeKey;

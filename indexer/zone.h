@@ -10,34 +10,34 @@
 #include "platform/Text.h"
 #include "tokenizer/Tokenizer.h"
 
-// The texts of one document on their way into the text index. One thread.
+// The texts of one document before they are added to the text index. One thread.
 namespace zone {
 
 // The text of one zone: UTF-8, values separated by one NUL.
 class Zone {
  public:
-  // The cleaned words of the text.
+  // Adds the cleaned words of the text.
   void AddText(TLStringView value, const tokenizer::Tokenizer& tokenizer);
 
-  // Text that is cleaned already: a match may start at the beginning and behind each blank.
+  // Adds text that is cleaned already: a match may begin at its start and after each space.
   void AddTokenizedText(std::string_view value);
 
-  // A value to be matched whole, or by its beginning.
+  // Adds a value that matches only as a whole or by its beginning.
   void AddTextAsIs(std::string_view value);
 
   std::string text;
-  // Byte positions in `text` at which a match may start, ascending.
+  // Byte positions in `text` at which a match may begin, ascending.
   std::vector<uint32_t> offsets;
 
  private:
-  // Separates the next value, and gives its position.
+  // Separates the next value from the previous one, and returns its position.
   size_t beginValue();
 };
 
-// The zones of one document by zone ID, in no order.
+// The zones of one document by ZoneID, in no particular order.
 class Zones {
  public:
-  // Made empty when it is not there. References stay good while others are added.
+  // Creates an empty zone if it is absent. References stay valid when others are added.
   [[nodiscard]] Zone& GetZone(uint16_t zoneID) { return _zones[zoneID]; }
 
   [[nodiscard]] size_t size() const { return _zones.size(); }

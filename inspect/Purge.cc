@@ -30,7 +30,7 @@ using platform::joinPath;
 
 constexpr const char* kStoreDirectory = "docstore";
 constexpr const char* kStoreFile = "docstore.db";
-// Of the copy, for logs and tables that are there twice while they are compacted.
+// Extra space for the copy: during its compaction logs and tables exist twice.
 constexpr uint64_t kSlackBytes = 32 * 1024 * 1024;
 
 bool fail(int code, const std::string& message, TLErrorOut error) {
@@ -59,7 +59,7 @@ bool syncItem(const std::string& path, TLErrorOut error) {
   return (file.get() >= 0 && fsync(file.get()) == 0) || failSystem(path, error);
 }
 
-// All below the directory, and then itself.
+// Syncs everything in the directory, then the directory itself.
 bool syncTree(const std::string& path, TLErrorOut error) {
   std::error_code failure;
   for (fs::recursive_directory_iterator it(path, failure), end; !failure && it != end;
@@ -70,7 +70,7 @@ bool syncTree(const std::string& path, TLErrorOut error) {
   return syncItem(path, error);
 }
 
-// Where the parts of a class lie.
+// The paths of a class's parts.
 struct ClassPaths {
   explicit ClassPaths(std::string path)
       : directory(std::move(path)),
@@ -93,7 +93,7 @@ class Purge {
         _progress(std::move(progress)) {}
 
   std::optional<PurgeReport> run(TLErrorOut error) {
-    // Taking the lock makes its file, which a daemon has made wherever there is something to purge.
+    // Acquiring the lock would create its file, which exists wherever a daemon has run.
     if (!platform::fileExists(platform::processLockPath(_state))) {
       errno = ENOENT;
       failSystem(platform::processLockPath(_state), error);
@@ -107,7 +107,8 @@ class Purge {
     report.bytesBefore = sizeOfFiles(_old.directory);
     report.hadSetAside = !salt::indexesSetAside(_old.index).empty();
     if (!build(report, error) || !exchange(error)) {
-      // Of the two directories the old one is not removed before the exchange is on the disk.
+      // After the exchange the work directory holds the old class; it must stay until the exchange
+      // is on disk.
       if (!_exchanged) platform::removeItem(_besides, nullptr);
       return std::nullopt;
     }
@@ -139,7 +140,7 @@ class Purge {
     _progress(what);
   }
 
-  // What is not the daemon's own in the class would be lost or stay where it is.
+  // Files in the class that are not the daemon's own would be lost or left behind.
   bool mayReplace(TLErrorOut error) {
     struct stat state {};
     if (stat(_state.c_str(), &state) != 0) return failSystem(_state, error);
@@ -228,8 +229,8 @@ class Purge {
     return check(*store, error);
   }
 
-  // Compacts the copy, which makes its postings, and reads all of it. Without room to compact it is
-  // as good and not as fast.
+  // Compacts the copy, which also builds its posting lists, and reads all of it. Without space to
+  // compact, the copy is correct but slower.
   bool check(StoreCopy& store, TLErrorOut error) {
     step("sorting the text index");
     const std::unique_ptr<salt::Index> index(salt::LoadIndex(_new.index, error));
@@ -244,7 +245,7 @@ class Purge {
     return index->Sync() || fail(EIO, _new.index + ": the copy cannot be synced", error);
   }
 
-  // Takes out the words that no document has any more.
+  // Removes words that no document contains any more.
   static bool purgeVocabulary(const salt::Index& index, StoreCopy& store, TLErrorOut error) {
     const auto stored = store.vocabulary(error);
     if (!stored) return !*error;
@@ -258,7 +259,7 @@ class Purge {
         if (!found[i].empty()) kept.push_back((*words)[i]);
       }
     }
-    // What does not parse the daemon counts anew.
+    // If it is invalid, the daemon counts the vocabulary again.
     const auto docID = whole ? topkvocab::unarchiveDocID((*entries)[1]) : std::nullopt;
     const auto date = whole ? topkvocab::unarchiveDate((*entries)[2]) : std::nullopt;
     return store.setVocabulary(topkvocab::archive(kept, docID.value_or(0), date.value_or(0)),

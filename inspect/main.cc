@@ -16,13 +16,13 @@
 #include "salt/Inspection.h"
 #include "salt/Quarantine.h"
 
-// Looks at the text index of one protection class while no daemon runs on it, or purges the class:
+// Inspects the text index of one protection class while no daemon uses it, or purges the class:
 //
 //   tallow-inspect dump|validate|estimate-purge|purge STATE_DIRECTORY CLASS
 //
-// All but the last change nothing. The result goes to the standard output: the dump as it is,
-// control characters of mail included, and the outcome of the others as JSON; tallow(1), which runs
-// this program, makes both fit for people. What validation finds is logged to the standard error.
+// Only purge changes anything. The result goes to standard output: the dump as it is, including
+// control characters from mail, and the other results as JSON; tallow(1), which runs this program,
+// formats both for people. Validation logs its findings to standard error.
 namespace {
 
 enum ExitStatus : int { kDone = 0, kNotValid = 1, kFailure = 2, kInUse = 3 };
@@ -42,7 +42,7 @@ int dump(salt::Inspection& inspection) {
   return std::fflush(stdout) == 0 && whole ? kDone : kFailure;
 }
 
-// A corrupt page ends the process by an assertion.
+// A corrupt page ends the process with an assertion.
 int validate(salt::Inspection& inspection) {
   const salt::Index* const index = inspection.load();
   const bool valid = index != nullptr && index->Validate();
@@ -62,8 +62,8 @@ int validate(salt::Inspection& inspection) {
   return valid ? kDone : kNotValid;
 }
 
-// The files as they are while no daemon can start. It may as soon as they are taken hold of: to
-// hold the lock for the whole look would keep the service down.
+// Captures the files while no daemon can start. The lock is released right afterwards, because
+// holding it longer would keep the service down.
 std::unique_ptr<salt::Inspection> capture(const std::string& state,
                                           const std::string& protectionClass, TLErrorOut error) {
   const auto lock = platform::ProcessLock::acquireShared(platform::processLockPath(state), error);
@@ -78,7 +78,7 @@ int complainOf(const TLError& error) {
   return complain(error.message + "; stop it first", kInUse);
 }
 
-// Tells what is being done, where somebody may look.
+// Reports the current step if standard error is a terminal.
 void tellStep(const char* step) {
   static const bool shown = isatty(STDERR_FILENO) == 1;
   static const char* last = nullptr;
@@ -87,7 +87,7 @@ void tellStep(const char* step) {
 }
 
 int purge(const std::string& state, const std::string& protectionClass, bool estimate) {
-  constexpr mode_t kPrivateUmask = 0077;  // as the daemon's
+  constexpr mode_t kPrivateUmask = 0077;  // same as the daemon's
   umask(kPrivateUmask);
   std::optional<TLError> error;
   const auto report = estimate ? inspect::estimatePurge(state, protectionClass, &error)

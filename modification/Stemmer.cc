@@ -6,7 +6,7 @@
 
 namespace {
 
-// A suffix of two letters or more, and what takes its place.
+// A suffix of at least two letters, and its replacement.
 struct Rule {
   std::string_view suffix;
   std::string_view replacement;
@@ -17,8 +17,8 @@ struct Rule {
   }
 };
 
-// The rules of a step. Of several that fit, the longest counts. They stand sorted by group, longest
-// first within it, so that a word looks at the few that share its last letter but one.
+// The rules of a step. The longest match applies. They are sorted by group, longest first within
+// it, so that a word is compared only with the few rules that share its last letter but one.
 template <size_t N>
 class Rules {
  public:
@@ -40,7 +40,7 @@ class Rules {
 
  private:
   std::array<Rule, N> _rules{};
-  std::array<uint8_t, 27> _begin{};  // of each letter's rules, and the end
+  std::array<uint8_t, 27> _begin{};  // of each group, and the end
 };
 
 constexpr Rules kStep2({
@@ -75,7 +75,7 @@ std::string_view stemOf(const stemmer& s) {
   return {s.word, static_cast<size_t>(s.stemEnd + 1)};
 }
 
-// Whether the byte is a consonant, told whether the one before it is; the first has none before.
+// Whether the byte is a consonant, given whether the previous one is; false before the first.
 bool isConsonant(char letter, bool afterConsonant) {
   switch (letter) {
     case 'a':
@@ -91,7 +91,7 @@ bool isConsonant(char letter, bool afterConsonant) {
   }
 }
 
-// A run of y alternates, so that what the first of them is decides for all.
+// A run of y alternates, so its first letter decides for all.
 bool isConsonantAt(std::string_view text, size_t index) {
   size_t first = index;
   while (first > 0 && text[first] == 'y') --first;
@@ -137,20 +137,20 @@ bool endsShort(std::string_view text) {
          std::string_view("wxy").find(text.back()) == std::string_view::npos;
 }
 
-// Sets the stem's end where the word has the suffix.
+// Sets the end of the stem if the word has the suffix.
 bool endsWith(stemmer* s, std::string_view suffix) {
   if (!wordOf(*s).ends_with(suffix)) return false;
   s->stemEnd = s->end - static_cast<int32_t>(suffix.size());
   return true;
 }
 
-// Puts the replacement, which is no longer than it, in the place of the suffix found last.
+// Replaces the last suffix found; the replacement is no longer than the suffix.
 void replaceSuffix(stemmer* s, std::string_view replacement) {
   std::copy(replacement.begin(), replacement.end(), s->word + s->stemEnd + 1);
   s->end = s->stemEnd + static_cast<int32_t>(replacement.size());
 }
 
-// Null where no rule fits; otherwise the stem's end is set.
+// The rule that applies, with the end of the stem set; null if none does.
 template <size_t N>
 const Rule* findRule(stemmer* s, const Rules<N>& rules) {
   if (s->end < 1) return nullptr;
@@ -171,7 +171,7 @@ void step1a(stemmer* s) {
   }
 }
 
-// Behind a removed ed or ing, what makes a word of the rest again: conflat(e), tann(ed), fil(e).
+// After removing ed or ing, restores the end of the word: conflat(e), tann(ed), fil(e).
 void restoreEnding(stemmer* s) {
   const std::string_view word = wordOf(*s);
   if (word.ends_with("at") || word.ends_with("bl") || word.ends_with("iz")) {
@@ -197,14 +197,14 @@ void step1c(stemmer* s) {
   if (endsWith(s, "y") && holdsVowel(stemOf(*s))) replaceSuffix(s, "i");
 }
 
-// Steps 2 and 3: double suffixes to single ones, and some single ones off.
+// Steps 2 and 3: reduce double suffixes to single ones, and remove some single ones.
 template <size_t N>
 void shorten(stemmer* s, const Rules<N>& rules) {
   const Rule* rule = findRule(s, rules);
   if (rule != nullptr && measure(stemOf(*s)) > 0) replaceSuffix(s, rule->replacement);
 }
 
-// Single suffixes off, where enough of a word is left.
+// Removes single suffixes where enough of the word is left.
 void step4(stemmer* s) {
   const Rule* rule = findRule(s, kStep4);
   if (rule == nullptr) return;
@@ -213,7 +213,7 @@ void step4(stemmer* s) {
   if (measure(rest) > 1) replaceSuffix(s, "");
 }
 
-// A last e, and one of two last l.
+// Removes a final e, and one of two final l.
 void step5(stemmer* s) {
   if (endsWith(s, "e")) {
     const std::string_view rest = stemOf(*s);

@@ -9,24 +9,24 @@
 
 namespace {
 
-// Bytes of a token, a trailing blank included, that is worth correcting.
+// Bounds in bytes of tokens to correct, including a trailing space.
 constexpr size_t kShortestToken = 2;
 constexpr size_t kLongestToken = 21;
-// Letters of the shortest word from which one may be deleted.
+// Minimum number of letters of a word for the deletion of one.
 constexpr size_t kShortestForDeletion = 4;
 
-// A candidate that this few suffixes show in none of the term's zones counts as not in the index.
+// A candidate counts as absent if none of its first suffixes, this many, is in a zone of the term.
 constexpr size_t kProbeSuffixes = 5;
 constexpr saltsearch::Options kScoring{1, 1000000, 0.02};
 
-// Of vocabulary words.
+// Bounds in bytes of vocabulary words to compare.
 constexpr size_t kShortestEntry = 3;
 constexpr size_t kLongestEntry = 20;
 constexpr float kMaxDistance = 4.0F;
 constexpr float kMaxWeightedDistance = 1.2F;
 constexpr float kLeastScore = 0.9F;
 
-// Scores of an edit at the first position, between, and at the last.
+// Scores of an edit at the first, a middle and the last position.
 struct EditScores {
   float first;
   float middle;
@@ -56,7 +56,7 @@ std::string_view withoutTrailingBlank(std::string_view token) {
   return token;
 }
 
-// 1 less the distance by the longer word's length; none for words too far apart.
+// 1 minus the distance divided by the longer word's length; nullopt for words too far apart.
 std::optional<float> closeness(std::string_view word, std::string_view entry) {
   const float d = weightedDistance(word, entry, kMaxDistance, kMaxWeightedDistance);
   const auto longer = static_cast<float>(std::max(word.size(), entry.size()));
@@ -117,7 +117,7 @@ float TALSpellCorrection::correctSpelling(const std::vector<saltsearch::Term>& t
   log().standard("Found {} candidates in lexicon.", candidates.size());
 
   score(terms, target, withTextStore, &candidates);
-  // Of equal ones the first generated.
+  // The first generated wins a tie.
   const auto best = std::max_element(
       candidates.begin(), candidates.end(),
       [](const auto& a, const auto& b) { return a._scoreOverall < b._scoreOverall; });
@@ -138,7 +138,7 @@ float TALSpellCorrection::correctSpelling(const std::vector<saltsearch::Term>& t
   return best->_scoreOverall;
 }
 
-// The whole query, with the other terms, judges each candidate.
+// Scores each candidate by a search with the whole query.
 void TALSpellCorrection::score(const std::vector<saltsearch::Term>& terms, size_t target,
                                const salt::Index& textStore,
                                std::vector<TALCorrectionCandidate>* candidates) {
@@ -224,7 +224,7 @@ std::vector<TALCorrectionCandidate> TALSpellCorrection::editOneCandidates(
   return candidates;
 }
 
-// The array is never changed, so a rebuild that ends meanwhile does no harm.
+// The array is immutable, so a rebuild that ends meanwhile does no harm.
 std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidatesFromTopKVocab(
     std::string_view word, bool) const {
   std::vector<TALCorrectionCandidate> candidates;

@@ -12,19 +12,19 @@
 #include "salt/Index.h"
 #include "salt/Search.h"
 
-// A word that might have been meant.
+// A possible correction of a word.
 struct TALCorrectionCandidate {
   float _scoreError = 0;       // closeness to the typed word, higher is closer
   float _scoreTopicality = 0;  // best document score of the corrected query
   float _scoreOverall = 0;     // their sum
-  std::string _token;          // with a trailing blank when the term has one
+  std::string _token;          // with a trailing space if the term has one
 };
 
-// Replaces the one word of a query that matches nothing by a near one that the index holds: by a
-// word at one edit from it, or else by one of the most frequent words.
+// Spelling correction: replaces the one word of a query that matches nothing by a similar word in
+// the index, at an edit distance of one or else among the most frequent words.
 //
-// A token with a trailing blank is a whole word, one without is a prefix; candidates are the same.
-// Threads: any number may correct at once, each in an index of its own, which outlives the call.
+// A token with a trailing space is a whole word, one without is a prefix; candidates take the same
+// form. Threads: any number of corrections may run at once. The index must outlive the call.
 class TALSpellCorrection {
  public:
   static constexpr int64_t kCandidateBudget = 1000;
@@ -34,9 +34,9 @@ class TALSpellCorrection {
                               int64_t candidateBudget = kCandidateBudget,
                               int64_t inLexiconCandidateBudget = kInLexiconCandidateBudget);
 
-  // `terms` as a search has left them, `found` set. Above 0: `correctedTerms` is `terms` with
-  // another first token, of score 1, in one term, and the result is how good it is; else -1, and
-  // `correctedTerms` is what it was.
+  // `terms` must come from a search, which sets `found`. On success, `correctedTerms` is `terms`
+  // with the first token of one term replaced, at score 1, and the result, above 0, rates the
+  // correction. Otherwise the result is -1 and `correctedTerms` is unchanged.
   [[nodiscard]] float correctSpelling(const std::vector<saltsearch::Term>& terms,
                                       std::vector<saltsearch::Term>& correctedTerms,
                                       const salt::Index& withTextStore) const;
@@ -44,26 +44,27 @@ class TALSpellCorrection {
   // "a" to "z".
   [[nodiscard]] static const std::array<std::string, 26>& kLettersEn();
 
-  // The words at one edit from `word`, which is ASCII: by the position of the edit, at each a swap,
-  // a deletion, replacements and insertions; then appended letters. Words of one letter have none.
+  // The words at an edit distance of one from `word`, which must be ASCII. For each position: a
+  // swap, a deletion, replacements and insertions; then appended letters. Words of one letter have
+  // none.
   [[nodiscard]] std::vector<TALCorrectionCandidate> editOneCandidates(std::string_view word) const;
 
-  // Whether a term must stay as it is.
+  // Whether a term must not be corrected.
   [[nodiscard]] static bool _doNotCorrect(const saltsearch::Term& term);
 
-  // The candidates for the first token of `term`: those at one edit that the index holds, else
-  // those of the vocabulary.
+  // The candidates for the first token of `term`: those at edit distance one that the index
+  // contains, or else those of the vocabulary.
   [[nodiscard]] std::vector<TALCorrectionCandidate> _getCandidates(
       std::string_view word, saltsearch::Term term, const salt::Index& textStore) const;
-  // `isPrefix` makes no difference.
+  // `isPrefix` is ignored.
   [[nodiscard]] std::vector<TALCorrectionCandidate> _getCandidatesFromTopKVocab(
       std::string_view word, bool isPrefix) const;
 
   static const platform::Log& log();
 
  private:
-  // The candidates of which the index holds a document, in order, up to the budget; their tokens
-  // get the blank back.
+  // Keeps the candidates with a document in the index, in order and up to the budget, and restores
+  // the trailing space of their tokens.
   std::vector<TALCorrectionCandidate> _foundInIndex(std::vector<TALCorrectionCandidate> candidates,
                                                     bool wholeWord, const saltsearch::Term& term,
                                                     const salt::Index& textStore) const;

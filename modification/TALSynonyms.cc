@@ -16,14 +16,14 @@
 
 namespace {
 
-// A word with any of these is left out.
+// A word with any of these characters is skipped.
 constexpr TLStringView kUnacceptableCharSet = u"!~`@#$%^&*-+();:=_{}[],.<>?\\/|\"'0123456789";
 static_assert(kUnacceptableCharSet.size() == 42);
 
-// What ends a line.
+// Characters that end a line.
 constexpr TLStringView kNewlines = u"\n\v\f\r\u0085\u2028\u2029";
 
-// How a candidate synonym is weighed.
+// For the search that scores a synonym.
 constexpr saltsearch::Options kScoring{.maxResults = 5, .maxSuffixes = 1000000, .threshold = 0.02};
 
 TLStringView trimmed(TLStringView text) {
@@ -32,7 +32,7 @@ TLStringView trimmed(TLStringView text) {
   return text;
 }
 
-// Lowercase, without white space around it; empty for one that is rejected.
+// Lowercases and trims; empty for a rejected word.
 std::string _cleanWord(TLStringView word, TLStringView unacceptableCharSet) {
   if (word.find_first_of(unacceptableCharSet) != TLStringView::npos) return {};
   word = trimmed(word);
@@ -41,7 +41,7 @@ std::string _cleanWord(TLStringView word, TLStringView unacceptableCharSet) {
   return platform::toUTF8({lower.getBuffer(), static_cast<size_t>(lower.length())});
 }
 
-// Calls `take` with each piece of `text` between the characters of `separators`, until it returns
+// Splits `text` at the characters of `separators` and calls `take` with each piece until it returns
 // false.
 template <typename Take>
 void forEachPiece(TLStringView text, TLStringView separators, const Take& take) {
@@ -141,7 +141,7 @@ float TALSynonyms::synonymExpansion(const std::vector<saltsearch::Term>& terms,
                    redacted(word));
     return kNoExpansion;
   }
-  // The one word of a person's that the log shows: it stands in no document.
+  // Not redacted, because the word occurs in no document.
   log().standard("No match token <{}> is considered for synonym expansion.", word);
   const auto* known = synonyms(word);
   if (known == nullptr) {

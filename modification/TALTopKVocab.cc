@@ -16,10 +16,10 @@ constexpr const char* kQueueName = "com.quill.tallow.indexer.topkvocab.topkvocab
 constexpr const char* kErrorDomain = "TALTopKVocab";
 constexpr int kDamagedArchive = 1;
 
-// When a rebuild is due, by documents that came since the last.
-constexpr int64_t kLeastDocs = 51;     // whatever else holds
-constexpr int64_t kEnoughDocs = 2001;  // on their own
-constexpr float kGrowth = 0.5F;        // of the documents there were before
+// Thresholds of a rebuild, in documents added since the last one.
+constexpr int64_t kLeastDocs = 51;     // required in any case
+constexpr int64_t kEnoughDocs = 2001;  // sufficient in any case
+constexpr float kGrowth = 0.5F;        // as a share of the documents before
 constexpr float kOldSeconds = 432000;  // 5 days
 
 TLError damaged(const char* what) {
@@ -196,7 +196,7 @@ void TALTopKVocab::_rebuildTopKVocabWithCompletionHandler(Completion handler) {
   });
 }
 
-// The figures change before the work, so that a rebuild that is given up counts as done.
+// Updates the state first, so that a cancelled rebuild counts as done.
 std::optional<TLError> TALTopKVocab::rebuild(bool routine) {
   log().standard("Starting to rebuild topK vocab from SALT.");
   _lastTopKRebuildDocID = _maxDocID.load();

@@ -7,17 +7,17 @@
 
 #include "salt/Search.h"
 
-// What those who change the words of a query share. A change concerns the first token of a term and
-// its score, and nothing else of it. A token with a blank at its end stands for a whole word, one
-// without for a prefix.
+// Shared by everything that modifies the words of a query. A modification changes only the first
+// token of a term and its score. A token with a trailing space is a whole word, one without is a
+// prefix.
 namespace modification {
 
-// A term for one word of a query, with a token to change.
+// Whether the term stands for one word of a query and has a token to change.
 [[nodiscard]] inline bool isSingleWord(const saltsearch::Term& term) {
   return term.isUnigram && !term.tokens.empty() && !term.tokenScores.empty();
 }
 
-// The token, less one blank at its end.
+// The token without its trailing space, if any.
 [[nodiscard]] inline std::string_view withoutBlank(std::string_view token) {
   if (token.ends_with(' ')) token.remove_suffix(1);
   return token;
@@ -29,7 +29,7 @@ inline void setFirstToken(saltsearch::Term& term, std::string token) {
   term.tokenScores.front() = 1.0;
 }
 
-// Whether any document matches the term. Looks at one suffix a token.
+// Whether any document matches the term. Reads one suffix per token.
 [[nodiscard]] inline bool occurs(saltsearch::Term term, const salt::Index& textStore) {
   constexpr saltsearch::Options kOneMatch{.maxResults = 1, .maxSuffixes = 1, .threshold = 0};
   std::vector<saltsearch::Term> alone{std::move(term)};

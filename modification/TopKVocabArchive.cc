@@ -8,13 +8,13 @@ namespace topkvocab {
 
 namespace {
 
-// The kind of an item, in the upper three bits of its first byte.
+// The major type of an item, in the upper three bits of its first byte.
 enum class Major : uint8_t { number = 0, bytes = 2, text = 3, array = 4, simple = 7 };
 
-// What the lower five bits say: up to this, the argument itself, above it, its size.
+// The lower five bits hold the argument itself up to this value, otherwise its size.
 constexpr uint8_t kLargestInline = 23;
 constexpr uint8_t kOneByte = 24;
-constexpr uint8_t kEightBytes = 27;  // in an item of kind `simple`: a double
+constexpr uint8_t kEightBytes = 27;  // for `simple`: a double
 
 void putHead(std::string& out, Major major, uint64_t argument) {
   const auto kind = static_cast<uint8_t>(static_cast<unsigned>(major) << 5);
@@ -35,14 +35,15 @@ void putString(std::string& out, Major major, std::string_view bytes) {
   out += bytes;
 }
 
-// Takes items from the front of what is left.
+// Consumes items from the front of the bytes.
 class Reader {
  public:
   explicit Reader(std::string_view bytes) : _rest(bytes) {}
 
   [[nodiscard]] bool atEnd() const { return _rest.empty(); }
 
-  // The argument of an item of this kind; none, and nothing taken that counts, for any other.
+  // The argument of an item of this type; nullopt for any other, after which the reader is
+  // unusable.
   std::optional<uint64_t> head(Major major) {
     if (_rest.empty()) return std::nullopt;
     const auto first = static_cast<uint8_t>(_rest.front());
@@ -67,11 +68,11 @@ class Reader {
     return bytes;
   }
 
-  // An array of strings that ends where the bytes do.
+  // An array of strings that extends to the end of the bytes.
   template <typename String>
   std::optional<std::vector<String>> strings(Major major) {
     const auto count = head(Major::array);
-    if (!count || *count > _rest.size()) return std::nullopt;  // each takes a byte at least
+    if (!count || *count > _rest.size()) return std::nullopt;  // each takes at least one byte
     std::vector<String> result;
     for (uint64_t i = 0; i < *count; ++i) {
       const auto bytes = string(major);

@@ -16,12 +16,12 @@ size_t commonSuffix(std::string_view a, std::string_view b) {
                              a.rbegin());
 }
 
-// The table of distances between the two words without what they begin and end with in common, row
-// by row. Rows are the shorter word's letters, columns the longer one's.
+// The distance table between two words without their common prefix and suffix, filled row by row.
+// Rows are letters of the shorter word, columns of the longer.
 class BandedTable {
  public:
   // `typedIsLonger` tells which of the two is the typed word; `atStart` and `atEnd` whether nothing
-  // was taken off there. Both words have letters left. `band` is at least the difference of
+  // was stripped there. Both words have letters left. `band` is at least the difference of the
   // lengths.
   BandedTable(std::string_view shorter, std::string_view longer, bool typedIsLonger, bool atStart,
               bool atEnd, size_t band)
@@ -93,7 +93,7 @@ class BandedTable {
     return _typedIsLonger ? cInsStart : cDelStart;
   }
 
-  // Of another letter, a letter too many and a letter too few.
+  // The cheapest of a replacement, an extra letter and a missing letter.
   [[nodiscard]] float cheapest(float diag, float left, float up, bool atStart, bool atEnd,
                                bool matched) const {
     const float sub = atStart ? cSubStart : atEnd ? cSubEnd : cSubMid;
@@ -123,11 +123,11 @@ class BandedTable {
   const bool _wordStart;
   const bool _wordEnd;
   const size_t _slack;  // rows before the band leaves the first column
-  size_t _start = 0;    // of the band in the row
+  size_t _start = 0;    // start of the band in the row
   size_t _end;
-  float _border = 0;                  // left of the row's first cell
-  std::vector<float> _row;            // the row before, then this one
-  std::vector<float> _rowBeforeLast;  // moved right by one cell
+  float _border = 0;                  // value left of the row's first cell
+  std::vector<float> _row;            // the previous row, overwritten by the current one
+  std::vector<float> _rowBeforeLast;  // shifted right by one cell
 };
 
 }  // namespace

@@ -27,8 +27,8 @@ std::unique_ptr<icu::GregorianCalendar> newCalendar(const icu::Locale& locale) {
   return U_SUCCESS(status) ? std::move(calendar) : nullptr;
 }
 
-// The calling thread's calendar, in this zone; null where ICU has none. Making one costs more than
-// all that is done with it.
+// The calling thread's calendar for this zone; null if ICU has none. Cached, because creating one
+// costs more than using it.
 icu::GregorianCalendar* calendarIn(Zone zone) {
   thread_local const auto calendar = newCalendar(icu::Locale::getRoot());
   if (calendar != nullptr) {

@@ -9,7 +9,7 @@ namespace platform {
 
 namespace {
 
-// ICU counts bytes in 32 bits; no encoding takes more than 8 for a unit.
+// ICU counts bytes in 32 bits; no encoding takes more than 8 per unit.
 constexpr size_t kMaximumEncoded = size_t{1} << 27;
 
 struct Encoding {
@@ -68,7 +68,7 @@ const Encoding* findEncoding(uint64_t number) {
   return found == kEncodings.end() ? nullptr : &*found;
 }
 
-// ICU's own name for an IANA name or alias, null for none.
+// ICU's own name of an IANA name or alias; null for none.
 const char* converterName(const char* name) {
   UErrorCode status = U_ZERO_ERROR;
   const char* canonical = ucnv_getCanonicalName(name, "IANA", &status);

@@ -12,29 +12,28 @@ struct UConverter;
 
 namespace platform {
 
-// Encodings go by two numbers, those that texts are tagged with and those of the converter. 0
-// stands for none in both.
+// Encodings have two numbers: the one that texts are tagged with and the one of the converter. 0
+// means none in both.
 inline constexpr uint64_t kEncodingUTF8 = 4;
 
 [[nodiscard]] uint32_t converterNumberForEncoding(uint64_t encoding);
 
-// The encoding that an IANA character set name or alias in any case stands for; none for a name
-// that is not known.
+// The encoding of an IANA character set name or alias, ignoring case; nullopt for an unknown name.
 [[nodiscard]] std::optional<uint64_t> encodingForIANAName(std::string_view name);
 
-// Converts between an encoding and UTF-16, each call a text of its own. One thread at a time.
+// Converts between an encoding and UTF-16, one complete text per call. One thread at a time.
 class Charset {
  public:
-  // Of an encoding that is not known each conversion fails.
+  // With an unknown encoding every conversion fails.
   explicit Charset(uint64_t encoding);
   ~Charset();
   Charset(const Charset&) = delete;
   Charset& operator=(const Charset&) = delete;
 
-  // Appends to `out`. False, and nothing appended, for bytes that are not valid in the encoding.
+  // Appends to `out`. False, appending nothing, for bytes that are invalid in the encoding.
   [[nodiscard]] bool decode(std::string_view bytes, TLString& out) const;
 
-  // None for text that the encoding cannot hold.
+  // Nullopt for text that the encoding cannot represent.
   [[nodiscard]] std::optional<std::string> encode(TLStringView text) const;
 
  private:

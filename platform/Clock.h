@@ -14,10 +14,10 @@ struct TickRatio {
 };
 [[nodiscard]] TickRatio tickRatio();
 
-// Ticks to whole milliseconds, rounded down; 0 when the denominator is 0.
+// Converts ticks to whole milliseconds, rounded down; 0 when the denominator is 0.
 [[nodiscard]] uint64_t millisFromTicks(uint64_t ticks, TickRatio ratio);
 
-// What the calling thread has computed so far.
+// The processor time used by the calling thread so far.
 [[nodiscard]] std::chrono::nanoseconds threadProcessorTime();
 
 // Wall clock, seconds since 1970-01-01 00:00:00 UTC.

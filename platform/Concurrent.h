@@ -11,8 +11,9 @@
 
 namespace platform {
 
-// Runs body(0) to body(count - 1) on this thread and on one for each further processor, as far as
-// the system has them to give, in no order, and returns when all have ended. `body` must not throw.
+// Runs body(0) to body(count - 1), in no particular order, on the calling thread and on one more
+// thread per further processor, as far as the system has threads; returns when all calls have
+// ended. `body` must not throw.
 template <typename Body>
 void concurrentApply(size_t count, const Body& body) {
   std::atomic<size_t> next{0};
@@ -30,7 +31,7 @@ void concurrentApply(size_t count, const Body& body) {
       });
     }
   } catch (const std::system_error&) {
-    // Those that are there do it.
+    // Continue with the threads that exist.
   }
   work();
   for (std::thread& helper : helpers) helper.join();

@@ -24,7 +24,7 @@ thread_local const char* currentPath = nullptr;
 
 std::array<struct sigaction, kFatalSignals.size()> previousActions;
 
-// One line, the seconds since 1970. Only calls that are safe in a signal handler.
+// Writes one line, the seconds since 1970, with async-signal-safe calls only.
 void leaveNote(const char* path) {
   std::array<char, kMaxDigits + 1> line{};
   const auto [end, failure] =
@@ -32,13 +32,13 @@ void leaveNote(const char* path) {
   *end = '\n';
   const int file = open(path, O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0600);
   if (file < 0) return;
-  // Nothing can be done here about a note that does not go in.
+  // A failed write cannot be handled here.
   [[maybe_unused]] const ssize_t written =
       write(file, line.begin(), static_cast<size_t>(end + 1 - line.begin()));
   close(file);
 }
 
-// The signal comes again when this returns, at the latest, and meets what stood here before.
+// After the return the signal is raised again, at the latest, and reaches its previous handler.
 void handleFatalSignal(int signal) {
   for (size_t i = 0; i < kFatalSignals.size(); ++i) {
     if (kFatalSignals[i] == signal) sigaction(signal, &previousActions[i], nullptr);

@@ -6,13 +6,13 @@
 
 namespace platform {
 
-// A file in which a fatal signal (SIGABRT, SIGBUS, SIGFPE, SIGILL or SIGSEGV) notes that it came
-// while a thread worked on certain data. A process that is killed, or whose machine loses power,
-// leaves no note: that says nothing of the data.
+// Records in a file that a fatal signal (SIGABRT, SIGBUS, SIGFPE, SIGILL or SIGSEGV) arrived while
+// a thread was working on certain data. Being killed or losing power leaves no note, since that
+// says nothing about the data.
 //
-// While an object of this class lives, its thread works on the data of the file `path`. Objects of
-// one thread nest; the innermost counts. The bytes of `path` outlive the object, which keeps a
-// pointer only. Costs two stores to memory of the thread.
+// While an object exists, its thread works on the data that the file `path` stands for. Objects of
+// a thread nest; the innermost counts. The object keeps only a pointer, so the bytes of `path` must
+// outlive it. Costs two stores to thread-local memory.
 class CrashNote {
  public:
   explicit CrashNote(const std::string& path);
@@ -20,12 +20,12 @@ class CrashNote {
   CrashNote(const CrashNote&) = delete;
   CrashNote& operator=(const CrashNote&) = delete;
 
-  // From here on fatal signals leave notes, and then do what they did before. Once a process,
-  // before other threads start.
+  // Makes fatal signals leave notes before they have their previous effect. Call it once per
+  // process, before other threads start.
   static void begin();
 
-  // When the notes in the file were made, in seconds since 1970, the oldest first; none where there
-  // is no such file, and at most as many as fit 64 KiB.
+  // The times of the notes in the file, in seconds since 1970, oldest first; empty when there is no
+  // file. Reads at most 64 KiB.
   [[nodiscard]] static std::vector<int64_t> times(const std::string& path);
 
  private:

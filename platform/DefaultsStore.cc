@@ -13,10 +13,10 @@ namespace platform {
 
 namespace {
 
-// A hand-edited settings file is far below this; a larger one is refused as unreadable.
+// A hand-edited settings file is far smaller; a larger one is treated as unreadable.
 constexpr size_t kMaximumFileSize = size_t{1} << 20;
 
-// The leading decimal number of a text, blanks before it skipped; 0 where there is none.
+// The leading decimal number of a text, after any white space; 0 if there is none.
 template <typename Number>
 Number leadingNumber(std::string_view text) {
   const size_t start = text.find_first_not_of(" \t\n\r");

@@ -11,10 +11,10 @@
 
 namespace platform {
 
-// A value of the store, read as whatever the reader needs. Numbers convert into each other, with
-// integers cut towards zero and clamped; truth values are 1 and 0; a text gives its leading decimal
-// number, and is true when it starts with Y, T or a digit other than 0, in either case. Anything
-// else gives 0, false or no text.
+// A stored value with conversions. Numbers convert into each other; integers are truncated towards
+// zero and clamped. Booleans are 1 and 0. A text converts to its leading decimal number, and to
+// true if it starts with Y, T or a digit other than 0, ignoring case. Any other conversion gives 0,
+// false or no text.
 class DefaultsValue {
  public:
   explicit DefaultsValue(nlohmann::json value) : _value(std::move(value)) {}
@@ -29,24 +29,23 @@ class DefaultsValue {
   nlohmann::json _value;
 };
 
-// The user's stored settings: one JSON file with one flat object, read at the first use and written
-// as a whole, atomically, at each change. A missing file is an empty store. A file that cannot be
-// read or is no JSON object is logged, reads as empty and is never overwritten. Any thread.
+// The user's stored settings: a JSON file with one flat object, read at first use and rewritten as
+// a whole, atomically, at each change. A missing file is an empty store. A file that cannot be read
+// or does not hold a JSON object is logged, reads as empty and is never overwritten. Any thread.
 class DefaultsStore {
  public:
   explicit DefaultsStore(std::string path) : _path(std::move(path)) {}
   DefaultsStore(const DefaultsStore&) = delete;
   DefaultsStore& operator=(const DefaultsStore&) = delete;
 
-  // The store of the process, at defaultsFilePath().
+  // The process-wide store, at defaultsFilePath().
   static DefaultsStore& standard();
 
   // Sorted.
   [[nodiscard]] std::vector<std::string> keys();
   [[nodiscard]] std::optional<DefaultsValue> valueForKey(std::string_view key);
 
-  // False, with an error in the log, when the file could not be written; the value is not kept
-  // then.
+  // False, with a log line and the value not kept, when the file cannot be written.
   bool setString(std::string_view key, std::string_view value);
   bool setInteger(std::string_view key, int64_t value);
   bool setFloat(std::string_view key, float value);

@@ -23,7 +23,7 @@ namespace {
 
 constexpr uint32_t kUnlocked = 0;
 constexpr uint32_t kLocked = 1;
-constexpr size_t kLongestStatus = 64;  // bytes; more is garbled
+constexpr size_t kLongestStatus = 64;  // bytes; a longer file is invalid
 
 struct Status {
   uint32_t state;
@@ -44,7 +44,7 @@ Status readStatus(const std::string& path) {
   return {static_cast<uint32_t>(std::stoul(state)), unlocked == "1"};
 }
 
-// One registration at a time: the monitor is the only user.
+// Only one registration at a time, because the lock monitor is the only user.
 class FileDeviceVault : public DeviceVault {
  public:
   explicit FileDeviceVault(std::string path) : _path(std::move(path)) {}
@@ -87,7 +87,7 @@ class FileDeviceVault : public DeviceVault {
                                  IN_MOVE_SELF | IN_ONLYDIR) >= 0;
   }
 
-  // The directory may be replaced by another of its name. While there is none, this looks for it
+  // The directory may be replaced by another of the same name. While it is missing, polls for it
   // once a second.
   void watch(int inotify, int end, SerialQueue& queue, const std::function<void()>& handler) const {
     setThreadName("tallow.vault");
@@ -107,7 +107,7 @@ class FileDeviceVault : public DeviceVault {
 
   struct Changes {
     bool ofStatus = false;
-    bool ofDirectory = false;  // it is no longer the one that the path names
+    bool ofDirectory = false;  // the path no longer names this directory
   };
 
   [[nodiscard]] Changes readChanges(int inotify) const {

@@ -33,13 +33,13 @@ class DeviceVault {
 
 namespace platform {
 
-// The vault of the process.
+// The process-wide vault.
 [[nodiscard]] DeviceVault& deviceVault();
 
 // A vault over a text file that holds the lock state and 0 or 1 for unlocked-since-boot, separated
-// by spaces. Without the file the device counts as unlocked; a garbled one counts as locked and not
-// yet unlocked. Its directory is watched with inotify, also after another has taken its
-// place, on a thread that the vault owns and joins.
+// by spaces. Without the file the device counts as unlocked; an invalid file counts as locked and
+// not yet unlocked. The vault owns and joins a thread that watches the directory with inotify, also
+// after the directory has been replaced.
 [[nodiscard]] std::unique_ptr<DeviceVault> makeFileDeviceVault(std::string path);
 
 }  // namespace platform

@@ -6,7 +6,7 @@
 
 namespace platform {
 
-// Owns a descriptor, or none (negative).
+// Owns a file descriptor, or none if negative.
 class FileDescriptor {
  public:
   explicit FileDescriptor(int descriptor = -1) : _descriptor(descriptor) {}

@@ -8,48 +8,48 @@
 
 #include "platform/TLError.h"
 
-// File access that reports by error object. Paths are bytes; a path that holds a NUL is refused by
-// each operation with EINVAL rather than cut.
+// File access with error objects. Paths are bytes; every operation refuses a path containing NUL
+// with EINVAL instead of truncating it.
 namespace platform {
 
 [[nodiscard]] bool fileExists(const std::string& path);
 
-// Creates `path` and what is missing above it, mode 0700. A directory that exists is no error. With
-// a protection class, the last directory carries it in the extended attribute
-// user.tallow.protection, where the file system has such attributes.
+// Creates `path` and its missing parents with mode 0700. An existing directory is no error. The
+// protection class, if given, is stored in the extended attribute user.tallow.protection of the
+// last directory, where the file system supports it.
 bool createDirectories(const std::string& path, TLErrorOut error,
                        const std::optional<std::string>& protectionClass = std::nullopt);
 
-// Names of the entries, without "." and "..", in no order.
+// Names of the entries without "." and "..", in no particular order.
 [[nodiscard]] std::optional<std::vector<std::string>> listDirectory(const std::string& path,
                                                                     TLErrorOut error);
 
-// Removes a file, or a directory with all below it. Symbolic links are removed, not followed.
+// Removes a file, or a directory recursively. Symbolic links are removed, not followed.
 bool removeItem(const std::string& path, TLErrorOut error);
 
 // At most `maximum` bytes are read; a larger file is an error (EFBIG).
 [[nodiscard]] std::optional<std::string> readFile(const std::string& path, size_t maximum,
                                                   TLErrorOut error);
 
-// Reads or writes all bytes at `offset` of an open file. False, with errno set, when the system
-// does not; the end of the file (then errno is 0) is such a case, too.
+// Reads or writes all bytes at `offset` of an open file. False, with errno set, on failure; also at
+// the end of the file, with errno 0.
 [[nodiscard]] bool readAt(int file, uint64_t offset, char* bytes, size_t count);
 [[nodiscard]] bool writeAt(int file, uint64_t offset, std::string_view bytes);
 
-// Written beside the target, synced, then renamed over it.
+// Writes a temporary file beside the target, syncs it and renames it over the target.
 bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error);
 
-// How many bytes this process could still write on the file system of `path`; as many as a number
-// can hold where that cannot be told.
+// The bytes that this process can still write to the file system of `path`; the largest number when
+// unknown.
 [[nodiscard]] uint64_t freeBytes(const std::string& path);
 
-// As many open files as the system lets this process have.
+// Raises the limit of open files as far as the system allows.
 void raiseDescriptorLimit();
 
-// How many more files this process can open. Reads a directory of /proc.
+// The number of files that this process can still open. Reads a directory in /proc.
 [[nodiscard]] size_t freeDescriptors();
 
-// Of these, how many databases leave for connections: a quarter of all, 256 at most.
+// The number of descriptors that databases leave for connections: a quarter of all, at most 256.
 [[nodiscard]] size_t descriptorReserve();
 
 }  // namespace platform

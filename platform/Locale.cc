@@ -11,7 +11,7 @@ namespace {
 
 using LocaleFunction = int32_t (*)(const char*, char*, int32_t, UErrorCode*);
 
-// Empty where ICU refuses the name.
+// Empty if ICU rejects the name.
 std::string ask(LocaleFunction function, const std::string& name) {
   std::array<char, ULOC_FULLNAME_CAPACITY> buffer;
   UErrorCode status = U_ZERO_ERROR;

@@ -12,15 +12,15 @@ struct Locale {
   bool operator==(const Locale&) const = default;
 };
 
-// None for a name that ICU finds no language in, or that holds a NUL.
+// Nullopt for a name in which ICU finds no language, or that contains NUL.
 [[nodiscard]] std::optional<Locale> localeFromName(const std::string& name);
 
-// The locale that a POSIX name such as "de_DE.UTF-8@euro" stands for, without character set and
-// modifier. None for "C" and "POSIX" as well.
+// The locale of a POSIX name such as "de_DE.UTF-8@euro", ignoring character set and modifier.
+// Nullopt for "C" and "POSIX" as well.
 [[nodiscard]] std::optional<Locale> localeFromPOSIXName(const std::string& name);
 
 // The locale of the first of LC_ALL, LC_CTYPE and LANG that is set and not empty. Reads the
-// environment at each call; nothing may change that at the same time.
+// environment at each call; nothing may change it meanwhile.
 [[nodiscard]] std::optional<Locale> currentLocale();
 
 }  // namespace platform

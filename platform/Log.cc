@@ -39,7 +39,7 @@ const LevelRow& row(LogLevel level) {
 struct SinkHolder {
   Mutex mutex;
   LogSink sink TL_GUARDED_BY(mutex);
-  std::atomic<bool> present{false};  // lets the common case pass without the mutex
+  std::atomic<bool> present{false};  // spares the mutex in the common case
 };
 
 SinkHolder& holder() {
@@ -47,7 +47,7 @@ SinkHolder& holder() {
   return *instance;
 }
 
-// systemd tells in JOURNAL_STREAM which device and inode its stream has.
+// systemd puts the device and inode of its stream into JOURNAL_STREAM.
 bool standardErrorIsJournal() {
   const char* stream = std::getenv("JOURNAL_STREAM");
   struct stat info;
@@ -67,9 +67,9 @@ void writeToJournal(std::string_view subsystem, std::string_view category, LogLe
   sd_journal_sendv(parts.data(), static_cast<int>(parts.size()));
 }
 
-// The kernel sends SIGPIPE to the thread that writes, which only the main thread's loop would hear.
-// It goes to the process instead, so that a log that nobody reads ends the daemon in order,
-// whichever thread meets it first.
+// The kernel sends SIGPIPE to the writing thread, but only the main thread's loop handles it. So it
+// is redirected to the process: if nobody reads the log, the daemon ends in order, whichever thread
+// was writing.
 void writeLine(std::string_view line) {
   while (!line.empty()) {
     const ssize_t written = write(STDERR_FILENO, line.data(), line.size());
@@ -84,7 +84,7 @@ void writeLine(std::string_view line) {
   }
 }
 
-// One message is one line: line ends and other control characters inside it come out as spaces.
+// One message is one line: line breaks and other control characters become spaces.
 void writeToStandardError(std::string_view subsystem, std::string_view category, LogLevel level,
                           std::string_view message) {
   std::string line = fmt::format("{:<7} {}:{} ", row(level).name, subsystem, category);

@@ -9,17 +9,17 @@
 
 namespace platform {
 
-// `standard` is the level that the environment variable and the output call "default".
+// The environment variable and the output call `standard` "default".
 enum class LogLevel { debug, info, standard, error, fault };
 
 [[nodiscard]] const char* logLevelName(LogLevel level);
 
 inline constexpr const char* kSubsystem = "com.quill.tallow";
 
-// What a private value of a log line is replaced by.
+// Replaces a private value in a log line.
 inline constexpr const char* kPrivate = "<private>";
 
-// One message as a sink sees it. The views live for the call.
+// A message as passed to a sink. The views are valid during the call only.
 struct LogRecord {
   std::string_view subsystem;
   std::string_view category;
@@ -29,23 +29,23 @@ struct LogRecord {
 
 using LogSink = std::function<void(const LogRecord&)>;
 
-// Replaces where messages go, for all handles of the process and all levels; an empty sink brings
-// back the journal or the standard error. Calls of a sink never overlap, and none runs after the
-// call that replaces it has returned. Any thread.
+// Sets the destination of messages for all handles and levels of the process; an empty sink
+// restores the journal or standard error. Calls of a sink never overlap, and the old sink is not
+// called after this function has returned. Any thread.
 void setLogSink(LogSink sink);
 
-// The threshold of TALLOW_LOG (debug, info, default, error or fault), read once; where that is not
-// set, the one of this process.
+// The threshold from TALLOW_LOG (debug, info, default, error or fault), read once; if not set, that
+// of the process.
 [[nodiscard]] LogLevel logThreshold();
 
-// The process's own threshold, `standard` unless it is set before the first message.
+// The process's own threshold. Set it before the first message; default is `standard`.
 void setProcessLogThreshold(LogLevel level);
 
-// One handle per subsystem and category, made once and kept, usually by a function-local static.
-// Any thread. The arguments of a message below the threshold are not formatted.
+// A log handle, one per subsystem and category, usually a function-local static. Any thread. The
+// arguments of a message below the threshold are not formatted.
 class Log {
  public:
-  // Both must outlive the handle, usually string literals.
+  // Both strings must outlive the handle; usually string literals.
   constexpr Log(const char* subsystem, const char* category)
       : _subsystem(subsystem), _category(category) {}
 
@@ -76,7 +76,7 @@ class Log {
     write(LogLevel::fault, format, std::forward<Args>(args)...);
   }
 
-  // Writes a finished message, whatever the threshold.
+  // Writes a formatted message regardless of the threshold.
   void emit(LogLevel level, std::string_view message) const;
 
  private:
@@ -84,7 +84,7 @@ class Log {
   const char* _category;
 };
 
-// The text that a boolean has in log lines.
+// How log lines show a boolean.
 [[nodiscard]] inline const char* yesNo(bool value) {
   return value ? "YES" : "NO";
 }

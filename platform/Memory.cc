@@ -6,7 +6,7 @@ namespace platform {
 
 namespace {
 
-// Ingest, search and merge mostly have one each; leveldb's thread shares.
+// Usually one each for ingest, search and merge; leveldb's thread shares one.
 constexpr int kMostArenas = 3;
 
 }  // namespace

@@ -2,10 +2,11 @@
 
 namespace platform {
 
-// Few memory arenas: each keeps what its threads had at their highest. Before any thread starts.
+// Limits the number of malloc arenas, because each keeps the peak memory of its threads. Call it
+// before any thread starts.
 void limitMemoryArenas();
 
-// Gives freed memory back to the system, after work that took much of it for a while. Any thread.
+// Returns freed memory to the system, after work that used much of it temporarily. Any thread.
 void returnFreeMemory();
 
 }  // namespace platform

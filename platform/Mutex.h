@@ -2,7 +2,7 @@
 
 #include <mutex>
 
-// Names of clang's thread-safety analysis; they vanish under other compilers.
+// Macros for clang's thread-safety analysis; empty for other compilers.
 #if defined(__clang__)
 #define TL_THREAD_ANNOTATION(x) __attribute__((x))
 #else
@@ -21,7 +21,7 @@
 
 namespace platform {
 
-// std::mutex that the analysis knows. Works with std::condition_variable_any.
+// A std::mutex known to the analysis. Works with std::condition_variable_any.
 class TL_CAPABILITY("mutex") Mutex {
  public:
   void lock() TL_ACQUIRE() { _mutex.lock(); }
@@ -31,8 +31,8 @@ class TL_CAPABILITY("mutex") Mutex {
   std::mutex _mutex;
 };
 
-// A mutex that whoever waits gets before the one who gives it back and wants it again at once: of a
-// std::mutex that one is mostly the next owner, too.
+// A fair mutex: a waiting thread gets it before the thread that has just released it and locks it
+// again, which would usually win with std::mutex.
 class TL_CAPABILITY("mutex") FairMutex {
  public:
   void lock() TL_ACQUIRE() {
@@ -42,7 +42,7 @@ class TL_CAPABILITY("mutex") FairMutex {
   void unlock() TL_RELEASE() { _mutex.unlock(); }
 
  private:
-  std::mutex _turn;  // of the next owner
+  std::mutex _turn;  // held by the thread next in line
   std::mutex _mutex;
 };
 

@@ -13,14 +13,14 @@ std::string_view variable(const char* name) {
   return value == nullptr ? "" : value;
 }
 
-// Empty unless it names an absolute path: one relative to wherever the program was started is not
-// what anybody means.
+// Empty unless the variable holds an absolute path; one relative to the working directory is
+// certainly a mistake.
 std::string_view directoryVariable(const char* name) {
   const std::string_view value = variable(name);
   return value.starts_with('/') ? value : "";
 }
 
-// `given` is the variable of systemd, `base` the directory of the user's own, empty for none.
+// `given` is the variable set by systemd; `base` is the user's own directory, empty for none.
 std::string chooseDirectory(const char* given, const std::string& base, const char* system) {
   if (const std::string_view list = variable(given); !list.empty()) {
     return std::string(list.substr(0, list.find(':')));

@@ -9,7 +9,7 @@ namespace platform {
 
 namespace {
 
-constexpr size_t kAttributeBytes = 4096;  // as the kernel writes at most
+constexpr size_t kAttributeBytes = 4096;  // the most that the kernel writes
 
 std::string attributeOf(const std::string& supply, const char* name) {
   std::string text = readFile(joinPath(supply, name), kAttributeBytes, nullptr).value_or("");

@@ -6,10 +6,10 @@ namespace platform {
 
 inline constexpr const char* kPowerSupplyDirectory = "/sys/class/power_supply";
 
-// Whether this device runs on its battery, by the kernel's list of power supplies in `directory`: a
-// supply of another kind that is online says no; else a battery that discharges says yes, and so
-// does any battery beside a supply that is not online. Batteries of mice and the like do not count.
-// No without a list.
+// Whether this device runs on battery, according to the kernel's list of power supplies in
+// `directory`. False if another kind of supply is online; otherwise true if a battery discharges,
+// or if there is a battery and a supply that is not online. Batteries of peripherals such as mice
+// are ignored. False without a list.
 [[nodiscard]] bool runsOnBattery(const std::string& directory = kPowerSupplyDirectory);
 
 }  // namespace platform

@@ -13,7 +13,7 @@ namespace platform {
 namespace {
 
 constexpr size_t kLongestThreadName = 15;
-constexpr int kBackgroundNiceness = 10;  // a weight of 110 where ordinary threads have 1024
+constexpr int kBackgroundNiceness = 10;  // a weight of 110; normal threads have 1024
 
 }  // namespace
 
@@ -22,7 +22,7 @@ void setThreadName(const std::string& name) {
   pthread_setname_np(pthread_self(), name.c_str() + cut);
 }
 
-// Linux has a niceness for each thread.
+// On Linux niceness applies to a single thread.
 void lowerThreadPriority() {
   setpriority(PRIO_PROCESS, static_cast<id_t>(gettid()), kBackgroundNiceness);
 }
@@ -47,7 +47,7 @@ bool SerialQueue::start() {
 }
 
 bool SerialQueue::startThread() {
-  // One that has ended has given the mutex back for good.
+  // A thread that has ended no longer takes the mutex, so joining it here cannot deadlock.
   if (_thread.joinable()) _thread.join();
   try {
     _thread = std::thread([this] { run(); });
@@ -91,7 +91,7 @@ void SerialQueue::endItem() {
     MutexLock lock(_mutex);
     _busy = false;
   }
-  // Also with nothing queued: the thread counts its idle time from here.
+  // Needed even with an empty queue: the thread measures its idle time from here.
   _changed.notify_all();
 }
 
@@ -130,7 +130,7 @@ void SerialQueue::run() {
   }
   while (Item item = nextItem()) {
     item();
-    item = nullptr;  // what it holds goes before the queue counts as idle
+    item = nullptr;  // release its captures before the queue counts as idle
     endItem();
   }
 }

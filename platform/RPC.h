@@ -17,44 +17,43 @@
 // Local RPC: named services, each a Unix stream socket on which both sides speak D-Bus peer to
 // peer.
 //
-// Threads: a listener belongs to the run loop that it is given. Each accepted connection has a
-// thread and an event loop of its own; the handlers of its methods run there, one at a time, in
-// order of arrival. Connections never wait for each other. A reply may be sent from any thread, at
-// any time, also after the connection has gone.
+// Threads: a listener belongs to the run loop that it is given. Each accepted connection has its
+// own thread and event loop, which runs the handlers of its methods one at a time, in order of
+// arrival. Connections never wait for each other. A reply may be sent from any thread at any time,
+// even after the connection has ended.
 namespace platform {
 
-// The error name of an error object; its body is message, domain and code.
+// The D-Bus error name for error objects; the body has message, domain and code.
 inline constexpr const char* kRPCErrorName = "com.quill.tallow.Error";
 inline constexpr const char* kRPCInvalidArgs = "org.freedesktop.DBus.Error.InvalidArgs";
 
-// Bounds. Each peer beyond one of them is closed and logged.
+// Limits. A peer that exceeds one of them is disconnected, with a log line.
 //
-// Where all connections are taken, the one that has been idle longest with no call in flight makes
-// room for a new one.
+// When all connections are taken, the one that has been idle longest without a call in flight is
+// closed to make room.
 inline constexpr size_t kMaximumConnections = 64;
 inline constexpr uint64_t kAuthenticationMilliseconds = 5000;
 inline constexpr uint64_t kMaximumQueuedMessages = 256;
 inline constexpr size_t kMaximumQueuedBytes = size_t{256} << 20;
-// Calls of one connection whose reply is outstanding; while there are as many, no more of it are
-// read.
+// Calls of a connection whose reply is outstanding; at this number it stops reading.
 inline constexpr size_t kMaximumPendingCalls = 4;
-inline constexpr size_t kMaximumMessageBytes = size_t{128} << 20;  // as the protocol has it
-inline constexpr size_t kMaximumArrayElements = 262144;            // of an argument
-// Bytes of the requests of all connections that are being received or whose reply is outstanding.
-// One that is larger waits until there is no other. Small ones may take as much again, so that
-// searches do not wait for large batches.
+inline constexpr size_t kMaximumMessageBytes = size_t{128} << 20;  // the protocol's limit
+inline constexpr size_t kMaximumArrayElements = 262144;            // per argument
+// Total size of the requests, over all connections, that are being received or whose reply is
+// outstanding. A larger request waits until there is no other. Small ones may use as much again, so
+// that searches do not wait for large batches.
 inline constexpr size_t kMaximumWaitingBytes = size_t{64} << 20;
 inline constexpr size_t kSmallMessageBytes = size_t{64} << 10;
-// A message that has begun must go on by so much in each interval.
+// Minimum progress, in each interval, of a message that has begun.
 inline constexpr uint64_t kProgressMilliseconds = 5000;
 inline constexpr size_t kProgressBytes = size_t{64} << 10;
 
-// The arguments of a call, which have been decoded in full before its handler runs; read in the
-// order of the signature. The bytes live as long as the handler runs. Asking for another type than
-// the signature has is a programming error.
+// The arguments of a call, decoded completely before its handler runs and read in the order of the
+// signature. The bytes are valid while the handler runs. Reading another type than the signature
+// has is a programming error.
 class RPCArguments {
  public:
-  // By type: s and ay, b, x, t, as and aay.
+  // By D-Bus type: s and ay, b, x, t, as and aay.
   using Value =
       std::variant<std::string_view, bool, int64_t, uint64_t, std::vector<std::string_view>>;
 
@@ -83,7 +82,7 @@ class RPCArguments {
   size_t _next = 0;
 };
 
-// One value of a reply, by D-Bus type: s, b, ay (Bytes), aay, a{sv} (Dictionary) and a(sss)
+// A value of a reply, by D-Bus type: s, b, ay (Bytes), aay, a{sv} (Dictionary) and a(sss)
 // (TextRows).
 struct RPCBytes {
   std::string bytes;
@@ -96,20 +95,20 @@ using RPCValue =
     std::variant<std::string, bool, RPCBytes, RPCBytesArray, RPCDictionary, RPCTextRows>;
 using RPCValues = std::vector<RPCValue>;
 
-// The promise of one reply. Any thread; the first call of either operation counts. A reply that is
-// dropped without one ends in no answer.
+// The obligation to reply once. Any thread; only the first call counts. If it is destroyed without
+// a call, no reply is sent.
 class RPCReply {
  public:
   virtual ~RPCReply() = default;
   virtual void send(RPCValues values) = 0;
   virtual void sendError(const TLError& error) = 0;
-  // An error of the protocol, such as kRPCInvalidArgs.
+  // A protocol error, such as kRPCInvalidArgs.
   virtual void sendFailure(const char* name, std::string message) = 0;
 };
 
 using RPCHandler = std::function<void(RPCArguments&, std::shared_ptr<RPCReply>)>;
 
-// One operation. The names of the arguments, inputs first, stand in the introspection.
+// One operation. The argument names, inputs first, appear in the introspection data.
 struct RPCMethod {
   const char* member;
   const char* inputSignature;
@@ -118,38 +117,38 @@ struct RPCMethod {
   RPCHandler handler;
 };
 
-// A list of operations that a connection exports under one interface name.
+// The operations that a connection exports under one interface name.
 struct RPCInterface {
   std::vector<RPCMethod> methods;
-  std::string name = {};  // the name of the service where empty
+  std::string name = {};  // if empty, the name of the service
 };
 
-// What a delegate sees of a new connection before it serves.
+// A new connection as its delegate sees it, before it serves.
 class RPCConnection {
  public:
   virtual ~RPCConnection() = default;
   [[nodiscard]] virtual const std::string& serviceName() const = 0;
   [[nodiscard]] virtual std::string description() const = 0;
-  // The connection keeps its interfaces for as long as it lives, so that a handler may hold state
-  // of its connection; that is used on the connection's thread only. Names differ.
+  // The connection keeps its interfaces as long as it exists, so a handler may hold state of its
+  // connection, to be used on the connection's thread only. Names must be distinct.
   virtual void addExportedInterface(RPCInterface interface) = 0;
 };
 
-// The socket of one service: SERVICE in the runtime directory, mode 0600, or handed over by systemd
-// under that name. The object path derives from the service name.
+// The socket of one service: SERVICE in the runtime directory with mode 0600, or the one that
+// systemd passes under that name. The object path is derived from the service name.
 class RPCListener {
  public:
-  // Decides over a connection whose peer has passed the check of its credentials.
+  // Accepts or refuses a connection whose peer has passed the credentials check.
   using Delegate = std::function<bool(RPCListener&, RPCConnection&)>;
 
   virtual ~RPCListener() = default;
   [[nodiscard]] virtual const std::string& serviceName() const = 0;
   virtual void setDelegate(Delegate delegate) = 0;
-  // Listens from now on. False when the socket cannot be had, for instance since a living process
+  // Starts listening. False when the socket is unavailable, for example because another process
   // serves it.
   virtual bool resume(TLErrorOut error) = 0;
-  // Ends listening, lets every connection send what is ready, for at most `milliseconds`, and joins
-  // their threads. Also done, with 0, at destruction.
+  // Stops listening, lets every connection send pending replies for at most `milliseconds`, and
+  // joins their threads. The destructor does the same with 0.
   virtual void invalidate(uint64_t milliseconds) = 0;
 };
 

@@ -64,11 +64,11 @@ void RPCOutbox::close() {
   _thread = {};
 }
 
-// Knows its call by number only: the messages of the bus library are not for several threads, so
-// the connection keeps them and frees what is left when it ends.
+// Refers to its call by number: bus messages must stay on one thread, so the connection owns them
+// and frees the rest at its end.
 //
-// Holds the bytes of its request in the budget: whoever works on a request has its reply, also when
-// the connection has gone.
+// Holds the budget of its request, because the code that works on a request holds the reply, even
+// after the connection has ended.
 class RPCServerReply : public RPCReply {
  public:
   RPCServerReply(RPCServerConnection& connection, uint64_t call, size_t requestBytes)
@@ -107,14 +107,15 @@ class RPCServerReply : public RPCReply {
  private:
   void finish(RPCServerConnection::BuildReply build, size_t bytes) {
     if (_finished.exchange(true)) return;
-    // A handler that answers before it returns need not wake the loop that it runs on.
+    // A handler that replies before it returns runs on the loop's thread, so the loop need not be
+    // woken.
     if (_outbox->isCurrent()) return _connection.endCall(_call, build, bytes);
     _outbox->post([&connection = _connection, call = _call, build = std::move(build), bytes] {
       connection.endCall(call, build, bytes);
     });
   }
 
-  RPCServerConnection& _connection;  // touched only where the outbox says that it lives
+  RPCServerConnection& _connection;  // used only if the outbox says that it still exists
   const std::shared_ptr<RPCOutbox> _outbox;
   const uint64_t _call;
   const size_t _requestBytes;
@@ -269,8 +270,7 @@ void RPCServerConnection::onSocket(bool peerGone) {
 }
 
 void RPCServerConnection::pump() {
-  constexpr uint64_t kMessagesAtATime =
-      16;  // then replies and the rest of the loop have their turn
+  constexpr uint64_t kMessagesAtATime = 16;  // then replies and other events have their turn
   const uint64_t last = _messages + kMessagesAtATime;
   if (_awaitsRoom && !admit()) return;
   while (!_ending) {
@@ -333,7 +333,7 @@ bool RPCServerConnection::admit() {
   return true;
 }
 
-// The bus takes all that it is given, so that a full inlet is empty once it has worked.
+// The bus consumes all its input, so the inlet, when full, is empty after processing.
 void RPCServerConnection::feed(std::string_view bytes) {
   while (!bytes.empty() && !_ending) {
     const ssize_t size = send(_inlet.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
@@ -356,7 +356,8 @@ void RPCServerConnection::processBus() {
 void RPCServerConnection::endMessage() {
   ++_messages;
   processBus();
-  // What the bus has not handed over is no call of the interface.
+  // A message that the bus did not dispatch was no call of an interface; its budget is still held
+  // here.
   RPCRequestBudget::shared().give(std::exchange(_messageBytes, 0));
 }
 
@@ -368,7 +369,7 @@ void RPCServerConnection::watchProgress() {
       _loop->addTimer(kProgressMilliseconds, [this] { _loop->post([this] { checkProgress(); }); });
 }
 
-// What waits in the socket counts: this thread may have been busy with a call.
+// First reads what is waiting in the socket: this thread may have been busy with a call.
 void RPCServerConnection::checkProgress() {
   if (_ending) return;
   if (_reading) pump();
@@ -448,7 +449,7 @@ void RPCServerConnection::endCall(uint64_t number, const BuildReply& build, size
   const auto entry = _calls.find(number);
   if (entry == _calls.end()) return;
   sd_bus_message* const call = entry->second;
-  // First, so that a peer that has its answer finds the connection idle.
+  // Before sending, so that a peer that has received its reply finds the connection idle.
   _calls.erase(entry);
   _idleSince = monotonicTicks();
   _inFlight = _calls.size();
@@ -494,8 +495,8 @@ void RPCServerConnection::endBecause(const char* reason) {
   end();
 }
 
-// The bus leaves the loop first: one that is attached when the loop ends blocks until its queue is
-// empty, however long the peer does not read.
+// Detaches the bus before stopping the loop: an attached bus would block until its queue is empty,
+// even if the peer never reads.
 void RPCServerConnection::end() {
   _ending = true;
   sd_bus_detach_event(_bus);
@@ -516,7 +517,7 @@ void RPCServerConnection::endIfIdle() {
     end();
     return;
   }
-  // What waits in the queue goes out as the peer reads. The timer posts rather than calls, as a
+  // The queue drains as the peer reads. The timer posts instead of calling directly, because a
   // source must not be replaced while its handler runs.
   _idleTimer =
       _loop->addTimer(kLookAgainMilliseconds, [this] { _loop->post([this] { endIfIdle(); }); });

@@ -18,15 +18,15 @@
 
 namespace platform {
 
-// The posts of a connection's loop, shared with the replies that outlive the connection.
+// Posts items to a connection's loop; shared with replies, which may outlive the connection.
 class RPCOutbox {
  public:
-  // Runs `item` on the connection's thread; false once the connection has ended.
+  // Runs `item` on the connection's thread; false if the connection has ended.
   bool post(std::function<void()> item);
-  // True on the connection's thread, while the connection serves.
+  // True on the connection's thread while the connection serves.
   bool isCurrent();
   void open(RunLoop* loop);
-  // Called on the connection's thread, first and last.
+  // Called on the connection's thread, when it begins and when it ends.
   void begin();
   void close();
 
@@ -36,17 +36,17 @@ class RPCOutbox {
   std::thread::id _thread TL_GUARDED_BY(_mutex);
 };
 
-// One accepted connection: the bus object and the thread that serves it.
+// One accepted connection: its bus object and the thread that serves it.
 //
-// What the peer sends is read here and passed on to the bus one message at a time, once there is
-// room for it. So no request is held twice, and not to read from a peer leaves replies and its end
-// alone.
+// The connection reads from the peer itself and passes one message at a time on to the bus, once
+// the budget has room for it. So no request is held in memory twice, and while reading is paused,
+// replies and the end of the connection still work.
 //
-// Made and destroyed on the listener's thread; all fields but the ones named below belong to the
-// connection's thread once it serves.
+// Created and destroyed on the listener's thread; while it serves, all fields except those marked
+// below belong to the connection's thread.
 class RPCServerConnection : public RPCConnection {
  public:
-  // Takes over `descriptor`.
+  // Takes ownership of `descriptor`.
   RPCServerConnection(int descriptor, std::string serviceName, std::string peer);
   ~RPCServerConnection() override;
 
@@ -54,50 +54,50 @@ class RPCServerConnection : public RPCConnection {
   [[nodiscard]] std::string description() const override { return _serviceName + " " + _peer; }
   void addExportedInterface(RPCInterface interface) override;
 
-  // Starts the thread; `ended` is called on it as the last thing that it does. False when the
-  // system has no thread, descriptors or memory for it.
+  // Starts the thread; its last action is to call `ended`. False when the system lacks a thread,
+  // descriptors or memory.
   [[nodiscard]] bool start(std::function<void()> ended);
-  // The same in two steps, for a caller that serves on its own thread: `serve` returns when the
+  // start() in two steps, for a caller that serves on its own thread: `serve` returns when the
   // connection has ended.
   [[nodiscard]] bool open(std::function<void()> ended);
   void serve();
 
-  // Any thread: the connection ends once no call of it is pending and what is ready has gone out,
-  // or after `milliseconds`.
+  // Any thread: ends the connection when no call is pending and all replies have been sent, or
+  // after `milliseconds`.
   void finish(uint64_t milliseconds);
 
-  // Whether, and for how long, it does nothing. Any thread.
+  // Whether the connection is idle, and since when. Any thread.
   struct Idleness {
-    bool calling = false;  // a call is in flight, or it has been told to go
-    bool called = false;   // it has ever made one
-    uint64_t since = 0;    // the monotonic clock, in nanoseconds
+    bool calling = false;  // a call is in flight, or the connection is closing
+    bool called = false;   // it has made at least one call
+    uint64_t since = 0;    // nanoseconds of the monotonic clock
   };
   [[nodiscard]] Idleness idleness() const;
-  // Any thread: ends it, to make room for another.
+  // Any thread: closes the connection to make room for another.
   void evict();
   [[nodiscard]] bool evicted() const { return _evicted; }
 
  private:
   friend class RPCServerReply;
 
-  // Makes the reply to a call, null for none; negative where D-Bus cannot carry it.
+  // Builds the reply to a call; null for none; negative if D-Bus cannot carry it.
   using BuildReply = std::function<int(sd_bus_message* call, sd_bus_message** reply)>;
 
   bool openBus();
   bool exportInterfaces();
   bool exportInterface(const RPCInterface& interface);
-  // The operation that a message calls; null for none.
+  // The method that a message calls; null if unknown.
   [[nodiscard]] const RPCMethod* methodOf(sd_bus_message* message) const;
 
   void onSocket(bool peerGone);
-  // Passes on what the peer has sent, as far as calls in flight and room allow.
+  // Reads from the peer and passes messages on, as far as calls in flight and the budget allow.
   void pump();
   // False when there is nothing to read now.
   bool readSome();
-  // Passes the header on once there is room for its message.
+  // Passes the header to the bus if the budget has room for its message.
   bool admit();
   void feed(std::string_view bytes);
-  // Has the bus do what it can; a message has reached it in full.
+  // Lets the bus process its input.
   void processBus();
   void endMessage();
   void watchProgress();
@@ -117,13 +117,13 @@ class RPCServerConnection : public RPCConnection {
 
   const std::string _serviceName;
   const std::string _peer;
-  std::vector<RPCInterface> _interfaces;  // fixed once it serves
+  std::vector<RPCInterface> _interfaces;  // fixed while serving
   std::function<void()> _ended;
 
   FileDescriptor _socket;
-  FileDescriptor _inlet;  // the bus reads what is written here
+  FileDescriptor _inlet;  // what is written here, the bus reads
   std::unique_ptr<RunLoop> _loop;
-  const std::shared_ptr<RPCOutbox> _outbox = std::make_shared<RPCOutbox>();  // self-synchronised
+  const std::shared_ptr<RPCOutbox> _outbox = std::make_shared<RPCOutbox>();  // thread-safe
   sd_bus* _bus = nullptr;
   std::vector<std::vector<sd_bus_vtable>> _vtables;  // the bus points into these and the names
   std::deque<std::string> _vtableNames;
@@ -134,24 +134,25 @@ class RPCServerConnection : public RPCConnection {
   std::unique_ptr<RunLoop::Source> _idleTimer;
 
   RPCFramer _framer;
-  std::string _buffer;       // what was read
-  std::string_view _unread;  // of it, what was not passed on
+  std::string _buffer;       // bytes read from the peer
+  std::string_view _unread;  // the part of _buffer not yet passed on
   bool _reading = true;
-  bool _awaitsRoom = false;      // the message whose header is complete
-  size_t _messageBytes = 0;      // of the budget, for the message that is being received
+  bool _awaitsRoom = false;      // a complete header is waiting for the budget
+  size_t _messageBytes = 0;      // budget held for the message being received
   uint64_t _received = 0;        // bytes
-  uint64_t _messages = 0;        // received in full
-  uint64_t _receivedBefore = 0;  // at the last look at the progress, as is the next
+  uint64_t _messages = 0;        // received completely
+  uint64_t _receivedBefore = 0;  // at the last progress check, like the next
   uint64_t _messagesBefore = 0;
 
-  // Whose reply is outstanding: a message that stands for the call, with its cookie and no content.
+  // Calls whose reply is outstanding: by number, a stub message with the cookie of the call and no
+  // content.
   std::unordered_map<uint64_t, sd_bus_message*> _calls;
   uint64_t _nextCall = 0;
-  size_t _queuedBytes = 0;  // of the replies in the bus's write queue, an upper bound
+  size_t _queuedBytes = 0;  // replies in the bus's write queue, an upper bound
   bool _finishing = false;
   bool _ending = false;
 
-  std::atomic<size_t> _inFlight{0};  // the size of _calls; any thread reads these four
+  std::atomic<size_t> _inFlight{0};  // the size of _calls; these four are read by any thread
   std::atomic<bool> _called{false};
   std::atomic<uint64_t> _idleSince;
   std::atomic<bool> _evicted{false};

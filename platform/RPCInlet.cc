@@ -48,7 +48,7 @@ RPCFramer::Piece RPCFramer::next(std::string_view bytes) {
   return {Part::ends, size};
 }
 
-// The handshake is a NUL, then lines that end in CR LF; after BEGIN messages follow.
+// The handshake is a NUL byte and lines that end in CR LF; messages follow after BEGIN.
 RPCFramer::Piece RPCFramer::nextOfAuthentication(std::string_view bytes) {
   for (size_t i = 0; i < bytes.size(); ++i) {
     if (++_authenticationBytes > kMaximumAuthenticationBytes) return {Part::unacceptable, i};
@@ -62,8 +62,8 @@ RPCFramer::Piece RPCFramer::nextOfAuthentication(std::string_view bytes) {
   return {Part::more, bytes.size()};
 }
 
-// Fixed part: byte order, type, flags, version, length of the body, serial, length of the fields;
-// the fields are padded to eight bytes.
+// The fixed part has byte order, type, flags, version, body length, serial and length of the
+// fields; the fields are padded to eight bytes.
 bool RPCFramer::readHeader() {
   if (_header[0] != 'l' && _header[0] != 'B') return false;
   const auto number = [this](size_t at) {
@@ -79,7 +79,7 @@ bool RPCFramer::readHeader() {
   if (size > kMaximumMessageBytes) return false;
   _messageBytes = size;
   _left = size - kHeaderBytes;
-  return _left != 0;  // no message is without fields
+  return _left != 0;  // every message has fields
 }
 
 }  // namespace platform

@@ -13,15 +13,15 @@
 
 namespace platform {
 
-// The bytes that requests hold, over all connections of the process. Any thread.
+// Limits the bytes held by requests over all connections of the process. Any thread.
 class RPCRequestBudget {
  public:
   using Resume = std::function<void()>;
 
   static RPCRequestBudget& shared();
 
-  // Takes `bytes` for a message. False when it has to wait: `resume` is called once, on any thread,
-  // when there may be room.
+  // Reserves `bytes` for a message. False when it must wait: `resume` is then called once, on any
+  // thread, when there may be room.
   [[nodiscard]] bool take(size_t bytes, Resume resume) TL_EXCLUDES(_mutex);
   void give(size_t bytes) TL_EXCLUDES(_mutex);
 
@@ -31,33 +31,33 @@ class RPCRequestBudget {
   std::vector<Resume> _waiting TL_GUARDED_BY(_mutex);
 };
 
-// Finds the messages in what a peer sends, before the bus library sees them: how large each one is
-// is known from its header. First come the lines of the authentication, up to BEGIN.
+// Splits what a peer sends into messages, before the bus library sees them; the size of each is
+// known from its header. The authentication lines, up to BEGIN, come first.
 //
-// No input or output; one thread.
+// Does no I/O; one thread.
 class RPCFramer {
  public:
   enum class Part {
-    header,       // these bytes belong to a header that is not complete; it is kept here
-    begins,       // with them the header is complete; see `header` and `messageBytes`
-    more,         // they belong to a message, or to the authentication, that goes on
-    ends,         // they are the last of a message, or of the authentication
-    unacceptable  // this is no message that a peer may send
+    header,       // bytes of an incomplete header, which is kept here
+    begins,       // the header is now complete; see `header` and `messageBytes`
+    more,         // bytes of an unfinished message or authentication
+    ends,         // the last bytes of a message or of the authentication
+    unacceptable  // not a message that a peer may send
   };
   struct Piece {
     Part part;
-    size_t size;  // how many of the given bytes belong to it
+    size_t size;  // how many of the given bytes this piece has
   };
 
-  // The next piece at the beginning of `bytes`, which is not empty.
+  // The next piece of `bytes`, which must not be empty.
   [[nodiscard]] Piece next(std::string_view bytes);
 
   [[nodiscard]] bool authenticating() const { return _authenticating; }
   // A message has begun and not ended.
   [[nodiscard]] bool inMessage() const { return _headerSize != 0; }
-  // The size of the message whose header is complete, with its header.
+  // The size, including the header, of the message whose header is complete.
   [[nodiscard]] size_t messageBytes() const { return _messageBytes; }
-  // The header of that message, which is passed on once there is room for all of it.
+  // The header of that message, to be passed on once there is room for the whole message.
   [[nodiscard]] std::string_view header() const { return {_header.data(), _headerSize}; }
 
  private:
@@ -69,11 +69,11 @@ class RPCFramer {
 
   bool _authenticating = true;
   size_t _authenticationBytes = 0;
-  std::string _line;  // the end of what was authenticated with, as long as it may be BEGIN
+  std::string _line;  // the current line of the authentication, as long as it may still be BEGIN
   std::array<char, kHeaderBytes> _header{};
   size_t _headerSize = 0;
   size_t _messageBytes = 0;
-  size_t _left = 0;  // of the message after its header
+  size_t _left = 0;  // bytes of the message still to come
 };
 
 }  // namespace platform

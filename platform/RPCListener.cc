@@ -21,7 +21,7 @@ namespace platform {
 namespace {
 
 constexpr int kBacklog = 64;
-// Between two looks at a peer that cannot even be refused.
+// Pause before retrying to accept a peer that cannot even be refused.
 constexpr useconds_t kNoDescriptorsMicroseconds = 10000;
 
 const Log& log() {
@@ -29,14 +29,14 @@ const Log& log() {
   return handle;
 }
 
-// The connections of the process, over all listeners, in the order of their coming. Any thread;
-// those in it are alive.
+// All connections of the process, over all listeners, oldest first. Any thread; every entry is
+// alive.
 class ConnectionTable {
  public:
-  // False when all places are taken by connections that have calls in flight.
+  // False when all places are taken by connections with calls in flight.
   bool enter(RPCServerConnection* connection) TL_EXCLUDES(_mutex) {
     MutexLock lock(_mutex);
-    // Those that were told to go are still there for a moment.
+    // Evicted connections remain for a moment.
     if (_connections.size() >= 2 * kMaximumConnections) return false;
     const auto staying = std::count_if(_connections.begin(), _connections.end(),
                                        [](const auto* one) { return !one->evicted(); });
@@ -51,8 +51,8 @@ class ConnectionTable {
   }
 
  private:
-  // Those that have never made a call go first, so that many that come and say nothing push nobody
-  // else out.
+  // Evicts connections that have never made a call first, so that many silent peers cannot push out
+  // a working one.
   bool evictOne() TL_REQUIRES(_mutex) {
     RPCServerConnection* chosen = nullptr;
     RPCServerConnection::Idleness least;
@@ -78,7 +78,7 @@ ConnectionTable& connectionTable() {
   return *instance;
 }
 
-// The socket that systemd handed over under `name`, -1 for none.
+// The socket that systemd passed under `name`, -1 for none.
 int activatedSocket(const std::string& name) {
   char** names = nullptr;
   const int count = sd_listen_fds_with_names(0, &names);
@@ -177,7 +177,8 @@ class SocketListener : public RPCListener {
     if (descriptor >= 0) {
       serve(descriptor);
     } else if (errno == EMFILE || errno == ENFILE) {
-      // Out of descriptors: the spare one lets the peer be refused rather than wait for ever.
+      // Out of descriptors: closes the spare one to accept and refuse the peer, which would
+      // otherwise wait forever.
       log().error("Refusing connection on {}: out of file descriptors", _serviceName);
       if (_spare < 0) usleep(kNoDescriptorsMicroseconds);
       close(_spare);
@@ -228,12 +229,12 @@ class SocketListener : public RPCListener {
   const std::string _directory;
   const std::string _serviceName;
   Delegate _delegate;
-  std::string _path;  // of the socket made here, empty for one handed over
+  std::string _path;  // of the socket created here; empty for one passed by systemd
   int _descriptor = -1;
   int _spare = -1;
   std::unique_ptr<RunLoop::Source> _source;
   std::list<std::unique_ptr<RPCServerConnection>> _connections;
-  // Read and written on the loop's thread only; what was posted there may run after this has gone.
+  // Accessed on the loop's thread only; posted items may run after this object is gone.
   const std::shared_ptr<bool> _alive = std::make_shared<bool>(true);
 };
 

@@ -11,7 +11,7 @@ namespace platform {
 
 namespace {
 
-// Reads one value of the call after the other. Anything that a client sends may end a read early.
+// Reads the values of a call one after another. Hostile input may end any read early.
 class ArgumentReader {
  public:
   explicit ArgumentReader(sd_bus_message* message) : _message(message) {}
@@ -31,7 +31,7 @@ class ArgumentReader {
  private:
   using Value = RPCArguments::Value;
 
-  // Of those that interfaces use.
+  // The first complete type of a signature, among those that interfaces use.
   static std::string_view firstType(std::string_view signature) {
     return signature.substr(0, signature.find_first_not_of('a') + 1);
   }
@@ -88,7 +88,7 @@ class ArgumentReader {
   sd_bus_message* _message;
 };
 
-// D-Bus carries no NUL and nothing that is not UTF-8 in a text.
+// D-Bus strings contain no NUL and only valid UTF-8.
 std::string carriedText(const std::string& text) {
   std::string carried = toUTF8(fromUTF8(text));
   for (size_t at = 0; (at = carried.find('\0', at)) != std::string::npos;) {
@@ -97,7 +97,7 @@ std::string carriedText(const std::string& text) {
   return carried;
 }
 
-// Appends one value; the result is negative where D-Bus cannot carry it.
+// Appends one value; the result is negative if D-Bus cannot carry it.
 struct Append {
   sd_bus_message* message;
 

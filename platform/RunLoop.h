@@ -11,15 +11,14 @@ struct sd_event;
 
 namespace platform {
 
-// Blocks `signal` in the calling thread and in all threads that it starts from now on, so that the
-// signal is an event of a run loop's source only and never ends the process. Called first thing in
-// `main`.
+// Blocks `signal` in the calling thread and all threads that it starts later, so that only a run
+// loop's source receives it and it never ends the process. Call it first in `main`.
 void takeSignalFromProcess(int signal);
 
 // An event loop over file descriptors, signals and posted items.
 //
-// Threads: `post` and `stop` may be called from any thread; all else, and every handler, belongs to
-// the thread that calls `run`. Sources live as long as their handle.
+// Threads: `post` and `stop` may be called from any thread; everything else, including every
+// handler, belongs to the thread that calls `run`. A source is active as long as its handle exists.
 class RunLoop {
  public:
   class Source {
@@ -28,7 +27,7 @@ class RunLoop {
   };
   class Socket : public Source {
    public:
-    // While not reading, only the end of the peer is told.
+    // While reading is off, the handler is called only when the peer has gone.
     virtual void setReading(bool reading) = 0;
   };
 
@@ -37,19 +36,19 @@ class RunLoop {
   RunLoop(const RunLoop&) = delete;
   RunLoop& operator=(const RunLoop&) = delete;
 
-  // False when the system had no descriptors or memory for it; nothing else may be called then.
+  // False when the system lacked descriptors or memory; then no other function may be called.
   [[nodiscard]] bool good() const;
 
-  // Sources are null when the system has no descriptors or memory for them.
+  // Sources are null when the system lacks descriptors or memory.
 
-  // Calls `handler` with the number each time the signal arrives; needs takeSignalFromProcess.
+  // Calls `handler` with the signal number at each arrival; requires takeSignalFromProcess.
   [[nodiscard]] std::unique_ptr<Source> addSignal(int signal, std::function<void(int)> handler);
 
-  // Calls `handler` while `descriptor` can be read.
+  // Calls `handler` while `descriptor` is readable.
   [[nodiscard]] std::unique_ptr<Source> addReadable(int descriptor, std::function<void()> handler);
 
-  // Calls `handler` while `descriptor`, a connected socket, can be read, and once its peer has gone
-  // for good.
+  // Calls `handler` while `descriptor`, a connected socket, is readable, and when its peer has
+  // closed the connection.
   [[nodiscard]] std::unique_ptr<Socket> addSocket(int descriptor,
                                                   std::function<void(bool peerGone)> handler);
 
@@ -57,10 +56,10 @@ class RunLoop {
   [[nodiscard]] std::unique_ptr<Source> addTimer(uint64_t milliseconds,
                                                  std::function<void()> handler);
 
-  // Runs `item` on the loop's thread, after what was posted before.
+  // Runs `item` on the loop's thread, after earlier posts.
   void post(std::function<void()> item);
 
-  // Serves events until `stop`. Items posted before the stop have run when it returns.
+  // Serves events until `stop`. Runs all items posted before the stop, then returns.
   void run();
   void stop();
 

@@ -5,7 +5,7 @@
 
 #include "platform/Mutex.h"
 
-// The semaphores count attached tracers; the kernel raises and lowers them.
+// The kernel counts attached tracers in these semaphores.
 #define _SDT_HAS_SEMAPHORES 1
 #include <sys/sdt.h>
 

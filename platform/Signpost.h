@@ -20,12 +20,12 @@ struct SignpostEvent {
 
 using SignpostSink = std::function<void(const SignpostEvent&)>;
 
-// Tests see the events through a sink; an empty one removes it. Calls of a sink never overlap.
+// Passes the events to a test; an empty sink removes it. Calls of a sink never overlap.
 void setSignpostSink(SignpostSink sink);
 
-// Handle "com.quill.tallow.signposts", "PointsOfInterest". Events are the static trace points
-// tallow:begin and tallow:end with (name, identifier, message), for perf and bpftrace. While no
-// tracer is attached and no sink set, nothing is formatted and nothing sent. Any thread.
+// Trace points of the handle "com.quill.tallow.signposts", "PointsOfInterest": the static probes
+// tallow:begin and tallow:end with (name, identifier, message), for perf and bpftrace. Without a
+// tracer or sink nothing is formatted or sent. Any thread.
 class Signpost {
  public:
   // An identifier derived from the address of an object.
@@ -44,7 +44,7 @@ class Signpost {
     send(SignpostPhase::end, identifier, name, format, std::forward<Args>(args)...);
   }
 
-  // True while a tracer or a sink listens.
+  // True if a tracer or a sink is attached.
   [[nodiscard]] static bool enabled(SignpostPhase phase);
 
  private:

@@ -23,8 +23,8 @@ const Log& log() {
   return handle;
 }
 
-// One registered block. A capture that waits for its queue holds it; a cancellation waits for such
-// a capture, since the queue goes with whoever cancels.
+// One registered block. A capture holds it while it waits for its queue. A cancellation waits for
+// such a capture, because the caller may destroy the queue afterwards.
 struct Registration {
   Registration(SerialQueue& on, std::string name, std::function<nlohmann::json()> make)
       : queue(on), title(std::move(name)), block(std::move(make)) {}
@@ -37,7 +37,7 @@ struct Registration {
   int capturing TL_GUARDED_BY(mutex) = 0;
   bool cancelled TL_GUARDED_BY(mutex) = false;
 
-  // False once it is cancelled.
+  // False after cancellation.
   bool begin() {
     MutexLock lock(mutex);
     if (!cancelled) ++capturing;

@@ -5,9 +5,8 @@
 #include <optional>
 #include <string>
 
-// An error object: a small value that names who failed (`domain`), how (`code`) and says so in
-// words. An operation that can fail takes an `std::optional<TLError>*` out-argument, null where the
-// caller does not care, and sets it only on failure.
+// An error value: who failed (`domain`), how (`code`), and a message. An operation that can fail
+// has an `std::optional<TLError>*` out-parameter, which may be null and is set only on failure.
 struct TLError {
   std::string domain;
   int code = 0;
@@ -18,7 +17,7 @@ struct TLError {
 
 using TLErrorOut = std::optional<TLError>*;
 
-// The domain of errors that the operating system reports; the code is errno.
+// The domain of operating system errors; the code is errno.
 inline constexpr const char* kPOSIXErrorDomain = "POSIX";
 
 namespace platform {
@@ -26,10 +25,10 @@ namespace platform {
 // Stores `error` through `out` unless that is null.
 void setError(TLErrorOut out, TLError error);
 
-// An error of the POSIX domain for an errno value, its message prefixed by `what`.
+// An error of the POSIX domain for an errno value; `what` is prefixed to its message.
 [[nodiscard]] TLError posixError(int errnoValue, const std::string& what);
 
-// For log lines: "DOMAIN CODE: MESSAGE", "(null)" for none.
+// For log lines: "DOMAIN CODE: MESSAGE", or "(null)".
 [[nodiscard]] std::string printable(const std::optional<TLError>& error);
 
 }  // namespace platform

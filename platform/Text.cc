@@ -13,10 +13,10 @@ namespace {
 
 constexpr UChar32 kReplacement = 0xFFFD;
 
-// ICU takes 32-bit lengths; longer texts are converted in pieces that end on a character.
+// ICU takes 32-bit lengths; longer texts are converted in pieces that end at a character boundary.
 constexpr size_t kPiece = size_t{1} << 28;
 
-// At most three steps back from the cut, to the lead byte of the character that it would split.
+// Moves the cut back by at most three bytes, to the lead byte of the character that it would split.
 size_t pieceLength(std::string_view bytes) {
   size_t n = std::min(bytes.size(), kPiece);
   if (n < bytes.size()) {

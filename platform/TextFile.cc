@@ -13,7 +13,7 @@ namespace platform {
 
 namespace {
 
-// Of 100. Below it the statistics guess at random bytes.
+// Out of 100. Below this, the statistics match random bytes.
 constexpr int32_t kLeastConfidence = 20;
 
 TLString decode(std::string_view bytes, const char* encoding) {
@@ -21,7 +21,7 @@ TLString decode(std::string_view bytes, const char* encoding) {
   return {text.getBuffer(), static_cast<size_t>(text.length())};
 }
 
-// ICU's name of the likeliest encoding; empty where none is likely.
+// ICU's name of the most likely encoding; empty if none is likely.
 std::string likeliestEncoding(std::string_view bytes) {
   UErrorCode status = U_ZERO_ERROR;
   const std::unique_ptr<UCharsetDetector, decltype(&ucsdet_close)> detector(ucsdet_open(&status),

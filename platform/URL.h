@@ -4,10 +4,10 @@
 #include <optional>
 #include <string>
 
-// A URL that has passed a strict parse by RFC 3986, kept as its absolute string. Immutable.
+// An absolute URL that has passed strict parsing by RFC 3986. Immutable.
 class TLURL {
  public:
-  // None for a text that is no valid URI with a scheme; nothing is escaped or mended.
+  // Nullopt if the text is not a valid URI with a scheme; nothing is escaped or repaired.
   [[nodiscard]] static std::optional<TLURL> parse(std::string text);
 
   [[nodiscard]] const std::string& absoluteString() const { return _text; }

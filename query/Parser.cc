@@ -9,7 +9,7 @@ namespace sq {
 
 namespace {
 
-// Characters of the POSIX locale: no byte from 0x80 on belongs to a class.
+// Character classes of the POSIX locale: bytes from 0x80 on belong to none.
 constexpr bool isBlank(char c) {
   return c == ' ' || (c >= '\t' && c <= '\r');
 }
@@ -35,7 +35,7 @@ struct Spelling {
   Token token;
 };
 
-// In the order in which they are tried; the first that the text begins with is taken.
+// Tried in this order; the first that the text begins with applies.
 constexpr std::array<Spelling, 11> kOperators{{{")", kTokenClose},
                                                {"(", kTokenOpen},
                                                {"||", kTokenOr},
@@ -57,7 +57,7 @@ constexpr std::array<Spelling, 9> kTimeFunctions{{{"time.now", kTokenTimeNow},
                                                   {"time.last_week", kTokenTimeLastWeek},
                                                   {"time.iso", kTokenTimeIso}}};
 
-// Compares up to the first difference, so that the NUL at the end of the text stops it.
+// Stops at the first difference, so the NUL at the end of the text stops it.
 bool beginsWith(const char* at, std::string_view prefix) {
   for (const char c : prefix) {
     if (*at++ != c) return false;
@@ -65,22 +65,22 @@ bool beginsWith(const char* at, std::string_view prefix) {
   return true;
 }
 
-// Cuts the input into tokens. The text of a token stays until another token sets it; only strings
-// and time functions do, also those that turn out to be errors.
+// Splits the input into tokens. The text of a token remains until another token sets it; only
+// strings and time functions do, even invalid ones.
 class Scanner {
  public:
   explicit Scanner(const char* input) : _begin(input), _at(input), _tokenAt(input) {}
 
   Token next();
 
-  // Reads the next token and goes back in front of it unless it is of this kind.
+  // Skips the next token if it is of this kind.
   void skip(Token kind) {
     const char* const before = _at;
     if (next() != kind) _at = before;
   }
 
   [[nodiscard]] const std::string& text() const { return _text; }
-  // Where the last token begins.
+  // The start of the last token.
   [[nodiscard]] size_t position() const { return static_cast<size_t>(_tokenAt - _begin); }
 
  private:
@@ -123,7 +123,7 @@ Token Scanner::word() {
   return kTokenString;
 }
 
-// Without its closing quote, the literal is an error that the next call meets again.
+// A literal without its closing quote is an error, repeated by the next call.
 Token Scanner::literal() {
   const char quote = *_at;
   const char* at = _at + 1;
@@ -172,7 +172,7 @@ constexpr char lowered(char c) {
   return c >= 'A' && c <= 'Z' ? static_cast<char>(c | 0x20) : c;
 }
 
-// "true" or "false" for a text that is one of them in any case, else empty.
+// "true" or "false" if the text is one of them in any case, otherwise empty.
 std::string_view constantNamed(std::string_view text) {
   for (const std::string_view name : {"true", "false"}) {
     if (std::equal(text.begin(), text.end(), name.begin(), name.end(),
@@ -190,7 +190,7 @@ Tree joined(int32_t type, Tree left, Tree right) {
   return result;
 }
 
-// Descends with a stack of its own, so that no input is too deep.
+// A recursive-descent parser with its own stack, so no input is nested too deeply.
 class Parser {
  public:
   explicit Parser(const char* input) : _scanner(input) {}
@@ -199,17 +199,17 @@ class Parser {
   [[nodiscard]] size_t position() const { return _scanner.position(); }
 
  private:
-  // An expression that waits for the one inside it: the content of its parentheses, or what stands
-  // right of its connective.
+  // An expression that waits for an inner one: the content of its parentheses, or the right side of
+  // its connective.
   struct Waiting {
     Token token;
     Tree left;
   };
 
-  // An expression from its first token to the one behind its operand. False after a failure; `out`
-  // is null where an expression has begun inside that must be read first.
+  // Reads an expression from its first token to the one after its operand. False on failure; `out`
+  // is null if an inner expression must be read first.
   bool readOperand(Tree& out);
-  // The rest of a comparison with this attribute; null after a failure.
+  // The rest of a comparison with this attribute; null on failure.
   Tree readComparison(Tree attribute);
 
   Scanner _scanner;
@@ -228,8 +228,8 @@ Tree Parser::readComparison(Tree attribute) {
   return result;
 }
 
-// The first token is not looked at unless it is a parenthesis: an expression that begins with
-// something else has the text of the string before it as its attribute.
+// Only a parenthesis counts as first token: an expression that begins with something else has the
+// text of the string before it as its attribute.
 bool Parser::readOperand(Tree& out) {
   if (_scanner.next() == kTokenOpen) {
     _waiting.push_back({kTokenOpen, nullptr});
@@ -251,8 +251,8 @@ bool Parser::parse(Tree& out) {
     Tree current;
     bool good = readOperand(current);
     if (current == nullptr) continue;
-    // The operand may end its expression, and that those around it. A token that ends one is
-    // dropped, whatever it is.
+    // The operand may end its expression, and that may end the enclosing ones. The token that ends
+    // an expression is dropped, whatever it is.
     for (;;) {
       const Token token = good ? _scanner.next() : kTokenError;
       if (isConnective(token)) {
@@ -274,7 +274,7 @@ bool Parser::parse(Tree& out) {
   }
 }
 
-// The spelling of an operator or, without its "$", of a time function.
+// The spelling of an operator or, without "$", of a time function.
 std::string_view spellingOf(int32_t token) {
   for (const Spelling& one : kOperators) {
     if (one.token == token) return one.text;
@@ -333,7 +333,7 @@ bool isTimeOperator(int32_t token) {
 }
 
 std::string expressionText(const node& tree) {
-  // What is still to be written, the next on top: a tree or, without one, a fixed text.
+  // A piece of output on the stack: a tree or, without one, a fixed text.
   struct Piece {
     const node* tree;
     std::string_view text;
@@ -354,7 +354,7 @@ std::string expressionText(const node& tree) {
       appendLeaf(*piece.tree, out);
     } else {
       const node& whole = *piece.tree;
-      // A chain of one connective to the right is how it is read without parentheses.
+      // A chain of one connective nested to the right needs no parentheses.
       push(*whole.right, isConnective(whole.right->type) && whole.right->type != whole.type);
       pieces.push_back({nullptr, " "});
       pieces.push_back({nullptr, spellingOf(whole.type)});

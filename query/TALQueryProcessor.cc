@@ -9,15 +9,15 @@
 
 namespace {
 
-constexpr double kDefaultZoneScore = 0.0;  // of a zone that has no score
+constexpr double kDefaultZoneScore = 0.0;  // for a zone without a score
 
-// Score of a hit, and of a document without one, by kind of term.
+// Scores of a matching and of a non-matching document, by kind of term.
 struct TermWorth {
   double score;
   double noMatch;
 };
 constexpr TermWorth kPhrase{5.0, 1.0};    // a pure bonus
-constexpr TermWorth kWordPair{2.0, 0.8};  // missing it is a small penalty
+constexpr TermWorth kWordPair{2.0, 0.8};  // no match costs a small penalty
 constexpr TermWorth kWord{1.0, 0.0};      // required
 constexpr TermWorth kEqual{1.0, 0.0};     // required
 constexpr TermWorth kNotEqual{0.0, 1.0};  // forbidden
@@ -142,8 +142,7 @@ TALQueryProcessor::TokenList TALQueryProcessor::wordTokens(const TLString& word,
   return list;
 }
 
-// The tree is walked with a stack of its own, in the order of the leaves: AND nodes unfold in
-// place.
+// Traverses the tree with its own stack, in leaf order: AND nodes are flattened.
 void TALQueryProcessor::_processQueryNode(const TLQueryNode* root,
                                           std::vector<TALTerm>& terms) const {
   if (root == nullptr) {
@@ -188,7 +187,8 @@ void TALQueryProcessor::_stringRestrictTermsFromLeafNode(const TLQueryNode& node
     const TLAttributeKey key = keyAt(node, i);
     Zones zones;
     if (equal) {
-      // All searchable zones are named, so that a match elsewhere counts as one, at no weight.
+      // Lists all searchable zones, so that a match in another zone counts as a match, but with
+      // weight 0.
       for (const TLAttributeKey entry : _zoneManager.indexableEnumKeyAttribs()) {
         _assignWeightsWithKey(entry, entry == key ? 1.0 : 0.0, zones);
       }

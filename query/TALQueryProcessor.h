@@ -12,28 +12,28 @@
 #include "records/TLQuery.h"
 #include "tokenizer/Tokenizer.h"
 
-// Turns a query into the flat list of scored terms that the text index evaluates; the shape of
-// ranking is decided here.
+// Turns a query into the flat list of scored terms that the text index evaluates; this determines
+// the ranking.
 //
-// A document's text score is the product over all terms: a matched document gets the token score
-// times the weights of the zones, any other `scoreNoMatch`. A whole phrase is worth more than a
-// pair of neighbouring words, a pair more than words far apart; every word is required, and
-// conditions on attributes are hard restrictions.
+// The text score of a document is the product over all terms: a document that matches a term gets
+// the token score times the weights of the zones, any other gets `scoreNoMatch`. A match of the
+// whole phrase scores more than a pair of neighbouring words, and a pair more than separate words.
+// Every word is required, and conditions on attributes are strict filters.
 //
-// Threads: holds no state of a query and may be called from any thread, at once. Zone weights are
-// those that the zone manager has at the time.
+// Threads: has no per-query state; any number of threads may call it at once. Zone weights are the
+// current ones of the zone manager.
 class TALQueryProcessor {
  public:
-  // Null, with a line in the log, when there is no tokenizer for the best locale. The zone manager
-  // and the synonyms, which may be null, must outlive the processor.
+  // Null, with a log line, if there is no tokenizer for the best locale. The zone manager and the
+  // synonyms (which may be null) must outlive the processor.
   [[nodiscard]] static std::unique_ptr<TALQueryProcessor> initWithZoneManager(
       const TALZoneManager& zoneManager, const TALSynonyms* synonymModel);
 
   // The terms of the free text (`originalQuery`), then those of the condition tree (`root`). Empty
-  // for a query that asks for nothing.
+  // for an empty query.
   [[nodiscard]] std::vector<TALTerm> termsFromQuery(const TLQuery& query) const;
 
-  // The attribute keys that free text is searched in, in order.
+  // The attribute keys that a search for free text looks in, in order.
   [[nodiscard]] static const std::array<TLAttributeKey, 14>& queryTermEnumKeyAttribs();
 
   static const platform::Log& log();
@@ -54,8 +54,8 @@ class TALQueryProcessor {
 
   [[nodiscard]] std::vector<TALTerm> _processQueryString(TLStringView queryString,
                                                          const TLParameters* searchParams) const;
-  // The word itself and, where the parameters ask for them, its synonyms and its stem, which always
-  // is a prefix, each at less worth.
+  // The word itself and, if the parameters request them, its synonyms and its stem (always a
+  // prefix), each with a lower score.
   [[nodiscard]] TokenList wordTokens(const TLString& word, bool wholeWord,
                                      const TLParameters* searchParams) const;
   void _processQueryNode(const TLQueryNode* node, std::vector<TALTerm>& terms) const;

@@ -7,12 +7,11 @@
 
 #include "platform/Text.h"
 
-// A group of alternative tokens with scores: what a query processor makes and the text index
-// evaluates. A token with a blank at the end stands for a whole word, one without for a prefix.
-// Immutable.
+// A group of alternative tokens with scores, created by the query processor and evaluated by the
+// text index. A token with a trailing space is a whole word, one without is a prefix. Immutable.
 class TALTerm {
  public:
-  // As many token scores as tokens, as many zone scores as zone IDs.
+  // There must be one token score per token, and one zone score per zone ID.
   TALTerm(std::vector<TLString> tokens, std::vector<double> tokenScores, double scoreNoMatch,
           std::vector<int32_t> zoneIDs, std::vector<double> zoneScores, bool isUnigram)
       : _tokens(std::move(tokens)),
@@ -22,18 +21,19 @@ class TALTerm {
         _zoneScores(std::move(zoneScores)),
         _isUnigram(isUnigram) {}
 
-  // A hit on any of them satisfies the term.
+  // A match of any of them matches the term.
   [[nodiscard]] const std::vector<TLString>& tokens() const { return _tokens; }
   [[nodiscard]] const std::vector<double>& tokenScores() const { return _tokenScores; }
-  // The score of a document that no token matches: 0 makes the term required, 1 a pure bonus.
+  // The score of a document that no token matches: 0 makes the term required, 1 makes it a pure
+  // bonus.
   [[nodiscard]] double scoreNoMatch() const { return _scoreNoMatch; }
-  // Zones to look in.
+  // The zones to search.
   [[nodiscard]] const std::vector<int32_t>& zoneIDs() const { return _zoneIDs; }
   [[nodiscard]] const std::vector<double>& zoneScores() const { return _zoneScores; }
-  // True for a single query word: only such terms are rewritten when a search finds too little.
+  // True for a single query word: only such terms are modified when a search finds too little.
   [[nodiscard]] bool isUnigram() const { return _isUnigram; }
 
-  // For people: ["a b " 2] nomatch:0.8 zones:{13:0.9,...} unigram.
+  // For people to read: ["a b " 2] nomatch:0.8 zones:{13:0.9,...} unigram.
   [[nodiscard]] std::string description() const;
 
  private:

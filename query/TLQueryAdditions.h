@@ -11,89 +11,90 @@
 #include "query/Parser.h"
 #include "records/TLQuery.h"
 
-// From the text of a query (see Parser.h) to the record that a search takes: attribute names and
-// time functions become keys and times, free text leaves the tree, and only conditions stay in it.
+// Converts the text of a query (see Parser.h) into the record that a search takes: attribute names
+// and time functions become keys and times, free text is moved out of the tree, and only conditions
+// remain in it.
 //
-// There are no error objects. A text that is no query gives a record without `root` and with an
-// empty `originalQuery`, and a line in the log; a time that cannot be formed is the reference date,
-// 2001-01-01 00:00:00 UTC, from which times in a tree are counted in seconds; a name that is not
-// known becomes the key UNKNOWN. No query and no value reaches the log in clear.
+// There are no error objects. An invalid text gives a record without `root` and with an empty
+// `originalQuery`, and a log line. An invalid time becomes the reference date, 2001-01-01 00:00:00
+// UTC, from which times in a tree are counted in seconds. An unknown name becomes the key UNKNOWN.
+// Queries and values are never logged in clear.
 //
-// No instances. Threads: any, each with queries and trees of its own.
+// No instances. Threads: any, each with its own queries and trees.
 class TLQueryAdditions {
  public:
   TLQueryAdditions() = delete;
 
   using Node = std::shared_ptr<TLQueryNode>;
-  // Free text that was taken out of a tree, in order.
+  // Free text removed from a tree, in order.
   using Parts = std::vector<TLString>;
-  // The open AND and OR nodes of a tree that is being built; the last takes new children.
+  // The open AND and OR nodes of a tree under construction; the last receives new children.
   using Stack = std::vector<Node>;
 
-  // How many nodes lie at most above each other in a tree: as many as a query can carry.
+  // Upper bound of the height of a tree: as much as a query can carry.
   static constexpr size_t kMaximumTreeHeight = kMaximumRecordDepth;
 
-  // Sets rawQuery and originalQuery to the text, and no root.
+  // Sets rawQuery and originalQuery to the text; no root.
   [[nodiscard]] static std::shared_ptr<TLQuery> initWithQueryString(const TLString& string);
 
-  // Reads the text as a query. With `optimize`, free text goes to originalQuery, its parts joined
-  // by blanks; without, originalQuery is empty and the tree as it was built.
+  // Parses the text as a query. With `optimize`, free text goes to originalQuery, its parts joined
+  // by spaces; without, originalQuery is empty and the tree is left as built.
   [[nodiscard]] static std::shared_ptr<TLQuery> initWithBeaconQueryString(const TLString& string,
                                                                           bool optimize);
 
-  // Reads the filters, joined by " && ", into the query's root, which replaces what was there. With
-  // `optimize`, free text among them is lost. An empty list leaves the query as it is.
+  // Parses the filters, joined by " && ", into the query's root, replacing it. With `optimize`,
+  // free text in them is lost. An empty list leaves the query unchanged.
   static void addFiltersToQuery(TLQuery& query, const std::vector<TLString>& filters,
                                 bool optimize);
 
-  // What `optimize` asks of the two operations above, for a query that they have built without: who
-  // wants to see a tree before it is optimised calls these afterwards.
+  // The two optimisations as separate steps, for callers that want to see the tree before it is
+  // optimised.
   static void optimizeQuery(TLQuery& query);
   static void optimizeFiltersOfQuery(TLQuery& query);
 
-  // The tree of a text before optimisation, an AND node; null, with a fault in the log, for a text
-  // that does not parse or is nested deeper than kMaximumTreeHeight.
+  // The tree of a text before optimisation, an AND node; null, with a fault in the log, if the text
+  // does not parse or nests deeper than kMaximumTreeHeight.
   [[nodiscard]] static Node _parse(const TLString& string);
 
-  // Adds one parse node to the last element of the stack, which must be AND or OR: with an error in
-  // the log, nothing is added otherwise. AND in AND and OR in OR become one node. False, with a
-  // part of it added, for a tree that would be too high.
+  // Adds one parse node to the last element of the stack, which must be AND or OR; otherwise logs
+  // an error and adds nothing. AND in AND and OR in OR become one node. False, with part of the
+  // node added, if the tree would be too high.
   static bool _build(const sq::node* node, Stack& stack);
 
-  // UNKNOWN, with an error in the log, for a name that is not in the vocabulary.
+  // UNKNOWN, with an error in the log, for an unknown name.
   [[nodiscard]] static TLAttributeKey _lookupAttribute(std::string_view name);
 
-  // STRING_EQUAL for a token that is no comparison.
+  // STRING_EQUAL for a token that is not a comparison.
   [[nodiscard]] static TLQueryNodeOp _lookupOperator(int32_t token);
 
-  // Seconds since the reference date, of a time function at this moment.
+  // The value of a time function at the current time, in seconds since the reference date.
   [[nodiscard]] static double _evalTimeExpression(int32_t token, std::string_view deltaString);
 
-  // One asterisk less at the front and one at the back. A single character stays as it is.
+  // Removes one asterisk at the front and one at the back. A single character is unchanged.
   [[nodiscard]] static TLString removeWildCard(const TLString& string);
 
-  // Rewrites a tree, at most kMaximumTreeHeight high, in place, and returns the node that takes its
-  // place, null where nothing is left. Words that are looked for in any attribute, or in five or
-  // more by one OR, go to `originalQueryParts`; constants are worked in; what stands twice below
-  // one node stands once. An OR of nothing but false disappears as well.
+  // Rewrites a tree, at most kMaximumTreeHeight high, in place, and returns the node that replaces
+  // it, null if nothing is left. Words searched for in any attribute, or in five or more attributes
+  // by one OR, are moved to `originalQueryParts`; constants are folded; duplicates below one node
+  // are removed. An OR of nothing but false disappears as well.
   [[nodiscard]] static Node optimizeQuery(const Node& node, Parts& originalQueryParts);
 
-  // One line a node, each behind a line feed, indented by a tab a level: names of the ops and keys,
-  // values, strings redacted unless `inClear`. Empty for no tree.
+  // One line per node, each after a line feed and indented by one tab per level: names of ops and
+  // keys, values, strings redacted unless `inClear`. Empty without a tree.
   [[nodiscard]] static std::string _stringifyQueryTree(const TLQueryNode* node, size_t indent,
                                                        bool inClear = false);
 
-  // Writes that text to the log, where info is logged.
+  // Logs that text at level info.
   static void _printQueryTree(const TLQueryNode* node);
 
   static const platform::Log& log();
 };
 
-// The time function at another moment, in seconds since 1970-01-01 00:00:00 UTC.
+// The value of a time function at a given time, in seconds since 1970-01-01 00:00:00 UTC.
 [[nodiscard]] double evalTimeExpressionAt(int32_t token, std::string_view deltaString, double now);
 
-// Reads digits at their places, YYYY-MM-DDThh:mm:ss+hh:mm or parts of that from the left; a blank
-// or "Z" may stand for the "T", "Z" for the offset. Nothing is checked: what is no digit counts as
-// 0. Without zone the time is local. Seconds since the reference date; false for a time that the
-// calendar does not hold.
+// Reads digits by position: YYYY-MM-DDThh:mm:ss+hh:mm or a leading part of it; a space or "Z" may
+// replace the "T", "Z" may replace the offset. Nothing is validated: a non-digit counts as 0.
+// Without a zone the time is local. Seconds since the reference date; false if the calendar cannot
+// represent it.
 [[nodiscard]] bool evalTimeISO8601(std::string_view text, double* time);

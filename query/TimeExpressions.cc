@@ -22,8 +22,8 @@ bool isBlank(char c) {
   return c == ' ' || (c >= '\t' && c <= '\r');
 }
 
-// The decimal number that a text begins with, behind blanks; 0 where there is none, infinite where
-// it is too large.
+// The decimal number at the start of a text, after white space; 0 if there is none, infinite if it
+// is too large.
 double leadingNumber(std::string_view text) {
   while (!text.empty() && isBlank(text.front())) text.remove_prefix(1);
   const bool negative = text.starts_with('-');
@@ -33,7 +33,7 @@ double leadingNumber(std::string_view text) {
   const auto result =
       std::from_chars(text.data(), text.data() + text.size(), value, std::chars_format::fixed);
   if (result.ec == std::errc::result_out_of_range) {
-    // Too small is out of range as well, and then only zeros stand before the point.
+    // A number that is too small is out of range as well; it has only zeros before the point.
     const size_t first = text.find_first_not_of('0');
     value =
         first < text.size() && isDigit(text[first]) ? std::numeric_limits<double>::infinity() : 0;
@@ -41,7 +41,7 @@ double leadingNumber(std::string_view text) {
   return negative ? -value : value;
 }
 
-// Cut, and to the range of a field.
+// Truncated and clamped to the range of a field.
 int32_t asField(double value) {
   constexpr double kLowest = std::numeric_limits<int32_t>::min();
   constexpr double kHighest = std::numeric_limits<int32_t>::max();
@@ -56,8 +56,8 @@ bool needsWeekday(int32_t token) {
   return token == sq::kTokenTimeThisWeek || token == sq::kTokenTimeLastWeek;
 }
 
-// Moves the fields of a moment to the start of what the function names. The delta counts in the
-// result's unit of seconds; 0 where it has gone into a field.
+// Moves the fields of a time to the start of the period that the function names. Returns the
+// seconds per unit of the delta; 0 if the delta is already in a field.
 double moveToStart(int32_t token, double delta, int32_t weekday, CalendarFields& fields) {
   fields.hour = fields.minute = fields.second = 0;
   switch (token) {
@@ -83,7 +83,7 @@ double moveToStart(int32_t token, double delta, int32_t weekday, CalendarFields&
   }
 }
 
-// Reads a text from the left, by places. Behind its end there are bytes that are no digits.
+// Reads a text by position. After its end it yields bytes that are not digits.
 class PlacesReader {
  public:
   explicit PlacesReader(std::string_view text) : _text(text) {}
@@ -98,7 +98,7 @@ class PlacesReader {
     if (found) ++_position;
     return found;
   }
-  // So many bytes as a number, in which those that are no digits count as 0.
+  // A number of so many bytes; non-digits count as 0.
   int32_t number(int digits) {
     int32_t value = 0;
     for (int i = 0; i < digits; ++i) {
@@ -116,7 +116,7 @@ class PlacesReader {
   size_t _position = 0;
 };
 
-// A byte that is no colon is passed over, and what would stand behind a colon is 0.
+// A byte that is not a colon is skipped, and what would follow a colon is 0.
 void readTimeOfDay(PlacesReader& reader, CalendarFields& fields) {
   fields.hour = reader.number(2);
   if (reader.take() != ':') return;
@@ -124,9 +124,9 @@ void readTimeOfDay(PlacesReader& reader, CalendarFields& fields) {
   if (reader.take() == ':') fields.second = reader.number(2);
 }
 
-// The seconds to add to a time of the zone that is found. Without a colon between hour and minute
-// of the day the sign has been passed over with that byte; an offset without sign counts as one to
-// the east.
+// The seconds to add to a time in `zone`, which is set. If there was no colon between hour and
+// minute of the day, the sign has been skipped with that byte; an offset without a sign counts as
+// east.
 double readOffset(PlacesReader& reader, Zone& zone) {
   if (reader.takeIf('Z')) zone = Zone::utc;
   const bool west = reader.isAt('-');

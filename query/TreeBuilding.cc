@@ -27,7 +27,7 @@ bool isOpen(const Node& node) {
   return node->mergeOp() == AND || node->mergeOp() == OR;
 }
 
-// Attributes whose values are numbers. REPLIED_TO lies among them by number and holds none.
+// Attributes with numeric values. REPLIED_TO is in the same range of numbers but has none.
 bool comparesNumbers(TLAttributeKey key) {
   using enum TLAttributeKey;
   return key == READ || key == FLAGGED || key == FLAG_COLOR || key == PRIORITY;
@@ -46,8 +46,8 @@ Node constantLeaf(bool value) {
   return leaf;
 }
 
-// The empty text is 0, and a number that is out of range the nearest that is not. False for a text
-// that is not a number as a whole.
+// An empty text is 0; a number out of range is clamped. False if the text as a whole is not a
+// number.
 bool readInteger(const std::string& text, int64_t* number) {
   char* end = nullptr;
   *number = std::strtoll(text.c_str(), &end, 10);
@@ -73,7 +73,7 @@ Node comparisonLeaf(const sq::node& comparison) {
   return leaf;
 }
 
-// The leaf of a parse node that is no connective; null for one that adds nothing.
+// The leaf for a parse node that is not a connective; null if it adds nothing.
 Node leafOf(const sq::node& node) {
   switch (node.type) {
     case sq::kTokenString:
@@ -109,18 +109,18 @@ TLAttributeKey TLQueryAdditions::_lookupAttribute(std::string_view name) {
   return key.value_or(TLAttributeKey::UNKNOWN);
 }
 
-// Walks the parse tree with a list of its own, since a chain of connectives is as deep as it is
-// long; only the tree that is built has a height to keep to.
+// Traverses the parse tree with its own stack, because a chain of connectives is as deep as it is
+// long; only the resulting tree is bounded in height.
 bool TLQueryAdditions::_build(const sq::node* node, Stack& stack) {
   if (stack.empty() || !isOpen(stack.back())) {
     log().error("Stack is empty or contains non AND or OR TLNodeQuery: {}",
                 stack.empty() ? "(null)" : _stringifyQueryTree(stack.back().get(), 0));
     return true;
   }
-  // What is still to be built, the next on top.
+  // Work that remains, the next step on top.
   struct Step {
     const sq::node* node;
-    bool pops;  // the connective of this node is complete
+    bool pops;  // the node of this connective is complete
   };
   std::vector<Step> steps{{node, false}};
   while (!steps.empty()) {

@@ -12,18 +12,18 @@ using Node = TLQueryAdditions::Node;
 using Parts = TLQueryAdditions::Parts;
 using enum TLQueryNodeMergeOp;
 
-// One string sought in this many attributes is free text.
+// A string searched for in this many attributes is free text.
 constexpr size_t kFewestAttributes = 5;
 
-// A subtree with its hash, which is made once, from the hashes below.
+// A subtree with its hash, computed once from the hashes of its children.
 struct Subtree {
   Node node;
   size_t hash = 0;
 };
 
-// Subtrees that all differ, in the order in which they came, with a hash table of their places by
-// linear probing. It has two blocks of memory, whatever its length; in a set with a node for each
-// subtree, building a long chain of comparisons spent nearly half of its time.
+// Distinct subtrees in order of arrival, with a hash table of their indexes (linear probing). Uses
+// two allocations whatever its size; with a node-based set, building a long chain of comparisons
+// took nearly twice as long.
 class DistinctSubtrees {
  public:
   explicit DistinctSubtrees(size_t most) : _places(std::bit_ceil(2 * most + 1)) {
@@ -44,11 +44,11 @@ class DistinctSubtrees {
   }
 
  private:
-  // Hashes of like subtrees have like lower bits.
+  // Similar subtrees have hashes with similar lower bits.
   static size_t spread(size_t hash) { return (hash * 0x9E3779B97F4A7C15) >> 32; }
 
   std::vector<Subtree> _subtrees;
-  std::vector<uint32_t> _places;  // in _subtrees, from 1; 0 where there is none
+  std::vector<uint32_t> _places;  // index in _subtrees plus 1; 0 for a free slot
 };
 
 bool isConstant(const TLQueryNode& node) {
@@ -62,7 +62,7 @@ bool isSoughtAnywhere(const TLQueryNode& leaf) {
   });
 }
 
-// Children that are no leaves do not count against it.
+// Children that are not leaves are ignored.
 bool isOneStringInManyAttributes(const TLQueryNode& node) {
   if (node.mergeOp() != OR || node.childsCount() < kFewestAttributes) return false;
   const auto& wanted = node.childs().front()->stringValue();
@@ -84,7 +84,7 @@ class Optimizer {
  public:
   explicit Optimizer(Parts& parts) : _parts(parts) {}
 
-  // The subtree that takes the node's place; none where it disappears.
+  // The subtree that replaces the node; empty if the node disappears.
   Subtree optimize(const Node& node, size_t height) {
     TL_ASSERT(height <= TLQueryAdditions::kMaximumTreeHeight);
     switch (node->mergeOp()) {
@@ -112,7 +112,7 @@ class Optimizer {
       addPart(TLQueryAdditions::removeWildCard(*node->childs().front()->stringValue()), _parts);
       return {};
     }
-    // The constant that decides: false an AND, true an OR.
+    // The constant that decides the result: false for AND, true for OR.
     const bool deciding = node->mergeOp() == OR;
     DistinctSubtrees kept(node->childsCount());
     for (const Node& child : node->childs()) {

@@ -29,7 +29,7 @@ void append(const TLQueryNode& node, size_t indent, bool inClear, std::string& o
   }
 }
 
-// `height` is that of the node from the root, which bounds the recursion.
+// `height` is the distance of the node from the root, which bounds the recursion.
 void appendTree(const TLQueryNode& node, size_t indent, size_t height, bool inClear,
                 std::string& out) {
   TL_ASSERT(height <= TLQueryAdditions::kMaximumTreeHeight);

@@ -10,18 +10,18 @@
 #include "platform/Assert.h"
 #include "platform/Text.h"
 
-// The families of accessors of the records, one macro a family. Only the record headers use this;
-// each macro declares a field `_name` and leaves the class in its public section.
+// Macros for the accessors of record fields, one per family. For record headers only: each macro
+// declares a field `_name` and leaves the class in its public section.
 
-// A number or truth value with a presence bit. The getter returns the field whatever the bit says;
-// setHas... changes only the bit.
+// A number or boolean with a presence bit. The getter ignores the bit; setHas... changes only the
+// bit.
 #define TL_RECORD_SCALAR(type, name, Name, bit) \
   [[nodiscard]] type name() const {             \
     return _##name;                             \
   }                                             \
   TL_RECORD_PRESENCE(type, name, Name, bit, type{})
 
-// An enumeration, kept as it came from the wire, also outside the named values. The getter returns
+// An enumeration, kept as it came from the wire even outside the named values. The getter returns
 // `fallback` while the bit is clear.
 #define TL_RECORD_ENUM(type, name, Name, bit, fallback) \
   [[nodiscard]] type name() const {                     \
@@ -69,9 +69,9 @@
 #define TL_RECORD_BYTES(name, Name) TL_RECORD_OBJECT(std::optional<std::string>, name, Name)
 #define TL_RECORD_RECORD(type, name, Name) TL_RECORD_OBJECT(std::shared_ptr<type>, name, Name)
 
-// A repeated field. An absent list and an empty one are the same. `single` names one element;
-// ...AtIndex throws std::out_of_range past the end. `type` is the class of an element, `element`
-// what holds it.
+// A repeated field. An absent list equals an empty one. `single` names one element; ...AtIndex
+// throws std::out_of_range past the end. `type` is the class of an element, `element` the type that
+// holds it.
 #define TL_RECORD_REPEATED(type, element, name, Name, single, Single)           \
   [[nodiscard]] const std::vector<element>& name() const {                      \
     return _##name;                                                             \
@@ -102,7 +102,7 @@
                                                                                 \
  public:
 
-// A list of sub-records holds no null; adding one is a programming error.
+// A list of sub-records contains no null; adding one is a programming error.
 #define TL_RECORD_RECORDS(type, name, Name, single, Single) \
   TL_RECORD_REPEATED(type, std::shared_ptr<type>, name, Name, single, Single)
 #define TL_RECORD_STRINGS(name, Name) TL_RECORD_REPEATED(TLString, TLString, name, Name, name, Name)

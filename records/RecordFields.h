@@ -19,18 +19,18 @@
 #include "records/TLCodable.h"
 #include "records/TLRecordList.h"
 
-// What the records do field by field, for the source files of the records only. A record's table
-// lists its fields as TLField objects; TLFieldKind says, per C++ type of a field, how a value of
-// that type is read, written, compared, hashed, copied, merged and described. The member functions
-// of TLRecord at the end walk the table; the compiler unrolls them.
+// Field-by-field operations of the records; for the source files of records only. A record's table
+// lists its fields as TLField objects. TLFieldKind defines, per C++ type of a field, how a value is
+// read, written, compared, hashed, copied, merged and described. The member functions of TLRecord
+// at the end iterate over the table; the compiler unrolls the loops.
 
 struct TLRecordAccess {
   static uint8_t has(const TLCodable& record) { return record._has; }
   static void setHas(TLCodable& record, uint8_t bit) { record._has |= bit; }
 };
 
-// One field: its number on the wire, its name in dictionaries, where it lies, and the presence bit
-// of a scalar.
+// One field: its number on the wire, its name in dictionaries, its member, and the presence bit of
+// a scalar.
 template <typename Record, typename Value>
 struct TLField {
   uint32_t number;
@@ -45,7 +45,7 @@ TLField(uint32_t, const char*, Value Record::*, uint8_t) -> TLField<Record, Valu
 
 namespace recordfields {
 
-// Bounds the nesting of a walk: one guard per sub-record that the walk is inside of.
+// Bounds the recursion depth: one guard exists for each sub-record entered.
 class NestingGuard {
  public:
   NestingGuard() {
@@ -62,12 +62,12 @@ class NestingGuard {
 
 inline constexpr uint64_t kHashFactor = 2654435761;
 
-// A whole number modulo 2 to the 64th.
+// A whole number modulo 2^64.
 inline uint64_t wrap(double value) {
   return static_cast<uint64_t>(std::fmod(value, 0x1p64));
 }
 
-// A number and its negation hash alike. Infinities and NaN contribute nothing.
+// A number and its negation have the same hash. Infinities and NaN contribute nothing.
 inline uint64_t hashOf(double value) {
   const double magnitude = std::fabs(value);
   if (!std::isfinite(magnitude)) return 0;
@@ -78,7 +78,7 @@ inline uint64_t hashOf(double value) {
   return fraction < 0 ? whole - part : whole + part;
 }
 
-// Of a list, so that the order counts.
+// The hash of a list depends on the order.
 inline uint64_t combine(uint64_t seed, uint64_t hash) {
   return seed * 31 + hash + 0x9E3779B97F4A7C15ULL;
 }
@@ -95,7 +95,7 @@ inline std::string nameOf(TLQueryNodeMergeOp mergeOp) {
 
 }  // namespace recordfields
 
-// Scalars: numbers, truth values and enumerations. Present by their bit.
+// Scalars: numbers, booleans and enumerations. Present by their bit.
 template <typename Value>
 struct TLFieldKind {
   static_assert(std::is_arithmetic_v<Value> || std::is_enum_v<Value>);
@@ -190,7 +190,7 @@ struct TLFieldKind<std::optional<std::string>> {
   }
 };
 
-// A sub-record. It is in its place before it is read, so a failed read leaves it half read.
+// A sub-record. It is stored before it is read, so a failed read leaves it partly read.
 template <typename Record>
 struct TLFieldKind<std::shared_ptr<Record>> {
   using Value = std::shared_ptr<Record>;
@@ -208,7 +208,7 @@ struct TLFieldKind<std::shared_ptr<Record>> {
   }
   static bool equal(const Value& a, const Value& b) {
     const recordfields::NestingGuard guard;
-    // Also of a record with itself: one that holds NaN equals nothing.
+    // Compares even a record with itself: one that contains NaN equals nothing.
     return a != nullptr && b != nullptr ? a->isEqual(*b) : a == b;
   }
   static uint64_t hash(const Value& value) {
@@ -232,7 +232,7 @@ struct TLFieldKind<std::shared_ptr<Record>> {
   }
 };
 
-// What the lists have in common. `Elements` says how one element is treated.
+// Common code of lists. `Elements` defines how an element is handled.
 template <typename Element, typename Elements>
 struct TLListKind {
   using Value = std::vector<Element>;
@@ -257,7 +257,7 @@ struct TLListKind {
     for (const Element& element : value) copy.push_back(Elements::copyElement(element));
     return copy;
   }
-  // `from` and `to` may be one list.
+  // `from` and `to` may be the same list.
   static void merge(const Value& from, Value& to) {
     const size_t count = from.size();
     to.reserve(to.size() + count);
@@ -273,7 +273,7 @@ struct TLListKind {
   }
 };
 
-// Repeated text, one occurrence an element.
+// Repeated text, one wire field per element.
 template <>
 struct TLFieldKind<std::vector<TLString>>
     : TLListKind<TLString, TLFieldKind<std::vector<TLString>>> {
@@ -293,7 +293,7 @@ struct TLFieldKind<std::vector<TLString>>
   }
 };
 
-// Numbers of an enumeration, written one occurrence an element and read also when packed.
+// Numbers of an enumeration, written as one wire field per element; packed ones can be read too.
 template <>
 struct TLFieldKind<std::vector<int32_t>> : TLListKind<int32_t, TLFieldKind<std::vector<int32_t>>> {
   static bool read(Value& value, TLReader& reader, uint64_t wireType) {
@@ -318,7 +318,7 @@ struct TLFieldKind<std::vector<int32_t>> : TLListKind<int32_t, TLFieldKind<std::
   }
 };
 
-// Repeated sub-records, one occurrence an element.
+// Repeated sub-records, one wire field per element.
 template <typename Record>
 struct TLFieldKind<std::vector<std::shared_ptr<Record>>>
     : TLListKind<std::shared_ptr<Record>, TLFieldKind<std::vector<std::shared_ptr<Record>>>> {
@@ -326,7 +326,7 @@ struct TLFieldKind<std::vector<std::shared_ptr<Record>>>
   using One = TLFieldKind<Element>;
 
   static bool read(std::vector<Element>& value, TLReader& reader, uint64_t wireType) {
-    // Items have a handful of attributes: skip the first steps of growth.
+    // Items have a handful of attributes: skips the first growth steps.
     if (value.capacity() == 0) value.reserve(4);
     return One::read(value.emplace_back(), reader, wireType);
   }
@@ -339,7 +339,7 @@ struct TLFieldKind<std::vector<std::shared_ptr<Record>>>
   static nlohmann::json describeElement(const Element& element) { return One::describe(element); }
 };
 
-// The same, perhaps in wire form.
+// Repeated sub-records that may still be in wire form.
 template <typename Record>
 struct TLFieldKind<TLRecordList<Record>> {
   using Value = TLRecordList<Record>;
@@ -387,7 +387,8 @@ bool isPresent(const Record& record, const Field& field) {
   }
 }
 
-// False when the read of the whole record ends here. A scalar is present before its value is read.
+// False when the read of the whole record ends here. A scalar is marked as present before its value
+// is read.
 template <typename Record, typename Field>
 bool readField(Record& record, const Field& field, TLReader& reader, uint64_t wireType) {
   if constexpr (KindOf<Field>::isScalar) {
@@ -399,7 +400,7 @@ bool readField(Record& record, const Field& field, TLReader& reader, uint64_t wi
   }
 }
 
-// The class of a sub-record or of those of a list; void for any other value.
+// The class of a sub-record or of the elements of a list; void for other values.
 template <typename Value>
 struct SubRecord {
   using type = void;
@@ -417,7 +418,7 @@ struct SubRecord<TLRecordList<Record>> {
   using type = Record;
 };
 
-// Steps over a field's value; false when it has not the form that is written.
+// Skips a field's value; false if it is not in the form that writeTo produces.
 template <typename Record, typename Value>
 bool isValueAsWritten(const TLField<Record, Value>&, TLReader& reader, uint64_t wireType) {
   using Sub = typename SubRecord<Value>::type;
@@ -435,7 +436,7 @@ void forEachField(Body&& body) {
   std::apply([&](const auto&... field) { (body(field), ...); }, TLRecordTable<Record>::fields);
 }
 
-// Sets the target's field to `value`; the presence bit goes with a scalar.
+// Sets the target's field to `value`, with the presence bit of a scalar.
 template <typename Record, typename Field, typename Value>
 void setField(Record& record, const Field& field, Value&& value) {
   record.*field.member = std::forward<Value>(value);

@@ -5,7 +5,7 @@
 #include "records/TLCodable.h"
 #include "records/TLPerson.h"
 
-// One keyed value of an item. A bag, not a union: every value field that is set is written.
+// One keyed value of an item. Not a union: every value field that is set is written.
 class TLAttribute final : public TLRecord<TLAttribute> {
  public:
   // On the wire.
@@ -18,7 +18,7 @@ class TLAttribute final : public TLRecord<TLAttribute> {
   TL_RECORD_STRING(stringValue, StringValue)
   TL_RECORD_SCALAR(int64_t, intValue, IntValue, 2)
   TL_RECORD_SCALAR(float, floatValue, FloatValue, 4)
-  // Dates are held here.
+  // Dates are stored here.
   TL_RECORD_SCALAR(double, doubleValue, DoubleValue, 1)
   TL_RECORD_SCALAR(bool, boolValue, BoolValue, 16)
   TL_RECORD_RECORD(TLPerson, personValue, PersonValue)

@@ -6,8 +6,8 @@
 #include <string>
 #include <string_view>
 
-// Keys of attributes, query nodes and zones: one number space, stored in indexes, so the numbers
-// never change. X(name, number), by ascending number.
+// Keys of attributes, query nodes and zones in one number space. They are stored in indexes, so the
+// numbers never change. X(name, number), in ascending number.
 #define TL_ATTRIBUTE_KEYS(X)                         \
   X(UNKNOWN, 0)                                      \
   X(CUSTOM, 1)                                       \
@@ -75,7 +75,7 @@
   X(CONTENT_SNIPPET, 172)                            \
   X(RELATED_UNIQUE_IDENTIFIER, 180)
 
-// How a leaf compares its attribute with its value. 6 to 9 are free.
+// How a leaf compares its attribute with its value. 6 to 9 are unused.
 #define TL_QUERY_NODE_OPS(X)                \
   X(STRING_EQUAL, 1)                        \
   X(STRING_EQUAL_WORD_BREAK, 2)             \
@@ -95,7 +95,7 @@
   X(BOOL_EQUAL, 20)                         \
   X(BOOL_CONSTANT, 21)
 
-// What a query node is.
+// The kind of a query node.
 #define TL_QUERY_NODE_MERGE_OPS(X) X(LEAF, 0) X(AND, 1) X(OR, 2)
 
 #define TL_ENUMERATOR(name, number) name = number,
@@ -104,7 +104,7 @@ enum class TLQueryNodeOp : int32_t { TL_QUERY_NODE_OPS(TL_ENUMERATOR) };
 enum class TLQueryNodeMergeOp : int32_t { TL_QUERY_NODE_MERGE_OPS(TL_ENUMERATOR) };
 #undef TL_ENUMERATOR
 
-// A named value of one of the enumerations above.
+// A named value of one of the above enumerations.
 template <typename Enum>
 struct TLEnumName {
   Enum value;
@@ -137,7 +137,7 @@ struct TLEnumNames<TLQueryNodeMergeOp> {
 [[nodiscard]] std::string TLQueryNodeOpAsString(TLQueryNodeOp op);
 [[nodiscard]] std::string TLQueryNodeMergeOpAsString(TLQueryNodeMergeOp mergeOp);
 
-// The value of a name; for an unknown one UNKNOWN, STRING_EQUAL and LEAF.
+// The value with the given name; UNKNOWN, STRING_EQUAL or LEAF for an unknown name.
 [[nodiscard]] TLAttributeKey TLStringAsAttributeKey(std::string_view name);
 [[nodiscard]] TLQueryNodeOp TLStringAsQueryNodeOp(std::string_view name);
 [[nodiscard]] TLQueryNodeMergeOp TLStringAsQueryNodeMergeOp(std::string_view name);
@@ -148,7 +148,7 @@ struct TLAttributeName {
   TLAttributeKey key;
 };
 
-// The whole vocabulary of attribute names, sorted by name.
+// All attribute names, sorted by name.
 inline constexpr std::array<TLAttributeName, 17> kTLAttributeNames{{
     {"*", TLAttributeKey::ANY_METADATA},
     {"**", TLAttributeKey::ANY},
@@ -170,5 +170,5 @@ inline constexpr std::array<TLAttributeName, 17> kTLAttributeNames{{
     {"kTLItemTextContent", TLAttributeKey::TEXT_CONTENT},
 }};
 
-// The key of a name of the query language; none for a name that is not in the vocabulary.
+// The key of an attribute name of the query language; nullopt for an unknown name.
 [[nodiscard]] std::optional<TLAttributeKey> TLAttributeKeyForQueryName(std::string_view name);

@@ -3,7 +3,7 @@
 #include "records/RecordAccessors.h"
 #include "records/TLCodable.h"
 
-// The sheet of ranking scores that a search hangs on an item.
+// The ranking scores that a search attaches to an item.
 class TLCard final : public TLRecord<TLCard> {
  public:
   TL_RECORD_SCALAR(float, textScore, TextScore, 16)

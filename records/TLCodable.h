@@ -10,7 +10,7 @@
 #include "records/TLReader.h"
 #include "records/TLWriter.h"
 
-// Common base of the records that travel over the RPC and lie in the document store, in Protocol
+// Common base of the records that are sent over RPC and kept in the document store, in Protocol
 // Buffers wire format. A record is a plain value without a lock: one thread owns it at a time.
 // Records are not copied by assignment; see copyTo and copyWithZone of TLRecord.
 class TLCodable {
@@ -19,23 +19,24 @@ class TLCodable {
   TLCodable(const TLCodable&) = delete;
   TLCodable& operator=(const TLCodable&) = delete;
 
-  // The record in wire form, fields in ascending number. A record with nothing set has no bytes.
+  // The record in wire form, fields in ascending number. An empty record has no bytes.
   [[nodiscard]] std::string data() const;
 
-  // Reads `bytes` into this record. False after bad input; the record then holds what was read up
-  // to the fault. Unknown fields are dropped.
+  // Reads `bytes` into this record. False for invalid input; the record then holds what was read
+  // before the fault. Unknown fields are dropped.
   [[nodiscard]] bool initWithData(std::string_view bytes);
 
   [[nodiscard]] virtual bool readFrom(TLReader& reader) = 0;
   virtual void writeTo(TLWriter& writer) const = 0;
 
-  // Same class, same presence, same values; floating point by ==. Equal records hash alike.
+  // Same class, same presence, same values; floating point is compared with ==. Equal records have
+  // equal hashes.
   [[nodiscard]] virtual bool isEqual(const TLCodable& other) const = 0;
   [[nodiscard]] virtual size_t hash() const = 0;
 
-  // One entry per present field, for logs and diagnostics. Holds personal text in clear.
+  // One entry per present field, for logs and diagnostics. Contains personal text in clear.
   [[nodiscard]] virtual nlohmann::json dictionaryRepresentation() const = 0;
-  // Class, address and that dictionary.
+  // Class, address and the dictionary.
   [[nodiscard]] virtual std::string description() const = 0;
 
  protected:
@@ -48,14 +49,14 @@ class TLCodable {
   friend struct TLRecordAccess;
 };
 
-// The operations that every record class derives from the table of its fields, which stands in the
-// class's source file as a specialisation of TLRecordTable.
+// Implements the operations of a record class from the table of its fields, a specialisation of
+// TLRecordTable in the class's source file.
 template <typename Record>
 class TLRecord : public TLCodable {
  public:
   [[nodiscard]] bool readFrom(TLReader& reader) override;
-  // Steps over a record up to the reader's limit. True when it is nothing but fields of this class
-  // in the form that writeTo gives them, in any order: then readFrom can read it.
+  // Skips a record up to the reader's limit. True if it consists only of fields of this class in
+  // the form that writeTo produces, in any order: then readFrom can read it.
   [[nodiscard]] static bool isAsWritten(TLReader& reader);
   void writeTo(TLWriter& writer) const override;
   [[nodiscard]] bool isEqual(const TLCodable& other) const override;
@@ -63,15 +64,15 @@ class TLRecord : public TLCodable {
   [[nodiscard]] nlohmann::json dictionaryRepresentation() const override;
   [[nodiscard]] std::string description() const override;
 
-  // Writes what is set here into `other`: strings and bytes are copied, sub-records and list
-  // elements shared; a list that is not empty replaces the target's.
+  // Copies the present fields into `other`: strings and bytes are copied, sub-records and list
+  // elements shared; a non-empty list replaces the target's.
   void copyTo(Record& other) const;
 
-  // A new record that shares nothing with this one.
+  // A deep copy.
   [[nodiscard]] std::shared_ptr<Record> copyWithZone() const;
 
-  // What `other` has set overwrites this record. A sub-record is merged into the one that is here,
-  // or taken over by reference where there is none; lists are appended to, elements shared.
+  // Present fields of `other` overwrite those of this record. A sub-record is merged into an
+  // existing one, or else shared; lists are appended to, sharing the elements.
   void mergeFrom(const Record& other);
 
  private:
@@ -79,6 +80,6 @@ class TLRecord : public TLCodable {
   [[nodiscard]] Record& self() { return static_cast<Record&>(*this); }
 };
 
-// Per record class: its name, and the tuple `fields` of the fields by ascending number.
+// Per record class: its name, and the tuple `fields` of its fields in ascending number.
 template <typename Record>
 struct TLRecordTable;

@@ -1,10 +1,9 @@
 #pragma once
 
-// Keys of the debug service's statistics, for the daemon and its clients: constants whose text is
-// their own name. Values are whole numbers; the three that end in TimeSecs are seconds as double.
+// Keys of the debug service's statistics, for the daemon and its clients: constants whose text
+// equals their name. Values are whole numbers; the three ending in TimeSecs are seconds as double.
 
-// What every answer holds, in the order of the groups: both stores, the index, its scans, its
-// writes.
+// Keys in every answer, in the order of the groups: both stores, the index, its scans, its writes.
 #define TL_DEBUG_SERVICE_KEYS(X)                   \
   X(TLDebugServiceDocStoreNumOfItems)              \
   X(TLDebugServiceTextStoreNumOfItems)             \
@@ -25,7 +24,7 @@
   X(TLDebugServiceSaltVacuumNumOfPhases)           \
   X(TLDebugServiceSaltVacuumTimeSecs)
 
-// Known to clients; no answer holds them.
+// Known to clients, but in no answer.
 #define TL_DEBUG_SERVICE_UNUSED_KEYS(X)      \
   X(TLDebugServiceSaltTotalBytesByPages)     \
   X(TLDebugServiceSaltPageBytesInUse)        \

@@ -115,14 +115,14 @@ std::vector<std::shared_ptr<TLAttribute>> TLIndexableItem::attributesForKey(
 
 namespace {
 
-// What a key that the item lacks reads as: an attribute with nothing set.
+// Returned for a missing key: an attribute with nothing set.
 const TLAttribute& attributeOrEmpty(const TLIndexableItem& item, TLAttributeKey key) {
   static const TLAttribute empty;
   const auto& attribute = item.attributeForKey(key);
   return attribute ? *attribute : empty;
 }
 
-// The key and the double value of an attribute in wire form; the rest is not decoded.
+// The key and the double value of an attribute in wire form, without decoding the rest.
 std::pair<TLAttributeKey, double> keyAndDouble(std::string_view bytes) {
   auto key = TLAttributeKey::UNKNOWN;
   double value = 0;
@@ -139,7 +139,7 @@ std::pair<TLAttributeKey, double> keyAndDouble(std::string_view bytes) {
   return {key, value};
 }
 
-// An empty list is one that was set where the attribute has no other value.
+// An attribute with no other value counts as an empty list.
 template <typename Element>
 const std::vector<Element>* listOf(const TLAttribute* attribute,
                                    const std::vector<Element>& (TLAttribute::*list)() const) {
@@ -163,7 +163,7 @@ float TLIndexableItem::floatValueForKey(TLAttributeKey key) const {
   return attributeOrEmpty(*this, key).floatValue();
 }
 
-// Searches ask for the dates of many items, and for nothing else.
+// Optimised because searches read the dates of many items, and nothing else.
 double TLIndexableItem::doubleValueForKey(TLAttributeKey key) const {
   if (!_attributes.isWire()) return attributeOrEmpty(*this, key).doubleValue();
   double found = 0;

@@ -6,17 +6,18 @@
 #include "records/TLCodable.h"
 #include "records/TLRecordList.h"
 
-// What a client hands over for indexing, what the document store keeps and what a search returns.
+// What a client submits for indexing, what the document store keeps, and what a search returns.
 class TLIndexableItem final : public TLRecord<TLIndexableItem> {
  public:
-  // A fresh item has an empty identifier, which is present and is written.
+  // A new item has an empty identifier, which counts as present and is written.
   TLIndexableItem() { setIdentifier(TLString()); }
 
-  // Reads what data() of an item has written, and leaves the attributes in that form until somebody
-  // asks for them. False when the bytes are anything else; the item then holds any part of them.
+  // Reads bytes written by data() of an item, and leaves the attributes in wire form until they are
+  // first used. False if the bytes are anything else; the contents of the item are then
+  // unspecified.
   [[nodiscard]] bool initWithWrittenData(std::string_view bytes);
 
-  // In insertion order; keys may repeat. None of them is null.
+  // In insertion order; keys may repeat. None is null.
   [[nodiscard]] const std::vector<std::shared_ptr<TLAttribute>>& attributes() const {
     return _attributes.records();
   }
@@ -36,7 +37,7 @@ class TLIndexableItem final : public TLRecord<TLIndexableItem> {
   // Absent until a search scores the item.
   TL_RECORD_RECORD(TLCard, card, Card)
 
-  // Each appends one new attribute with the key and the value; a null value appends nothing.
+  // Each appends one new attribute with this key and value; a null value appends nothing.
   void addAttributeWithKeyBoolValue(TLAttributeKey key, bool boolValue);
   void addAttributeWithKeyFloatValue(TLAttributeKey key, float floatValue);
   void addAttributeWithKeyDoubleValue(TLAttributeKey key, double doubleValue);
@@ -49,18 +50,18 @@ class TLIndexableItem final : public TLRecord<TLIndexableItem> {
   void addAttributeWithKeyPersonValues(
       TLAttributeKey key, std::optional<std::vector<std::shared_ptr<TLPerson>>> personValues);
 
-  // One person per address under one attribute, which is appended even without any address.
+  // One person per address in a single attribute, which is appended even without addresses.
   void addPersonsWithKey(TLAttributeKey key, const std::vector<TLString>& emails);
 
-  // The first attribute with the key, by a walk of the list, or null. The reference lives until the
+  // The first attribute with the key, by linear search, or null. The reference is valid until the
   // list changes.
   [[nodiscard]] const std::shared_ptr<TLAttribute>& attributeForKey(TLAttributeKey key) const;
   [[nodiscard]] std::vector<std::shared_ptr<TLAttribute>> attributesForKey(
       TLAttributeKey key) const;
 
-  // Fields of the first attribute with the key, whatever its presence bits say; later attributes
-  // with the key never show. Without one: false, 0 or null. References and pointers live until the
-  // item changes.
+  // Values of the first attribute with the key, regardless of its presence bits; later attributes
+  // with the key are ignored. Without one: false, 0 or null. References and pointers are valid
+  // until the item changes.
   [[nodiscard]] bool boolValueForKey(TLAttributeKey key) const;
   [[nodiscard]] float floatValueForKey(TLAttributeKey key) const;
   [[nodiscard]] double doubleValueForKey(TLAttributeKey key) const;
@@ -68,7 +69,7 @@ class TLIndexableItem final : public TLRecord<TLIndexableItem> {
   [[nodiscard]] const std::optional<std::string>& bytesValueForKey(TLAttributeKey key) const;
   [[nodiscard]] const std::shared_ptr<TLPerson>& personValueForKey(TLAttributeKey key) const;
   [[nodiscard]] const std::optional<TLString>& stringValueForKey(TLAttributeKey key) const;
-  // Null also where the attribute has another value and no list.
+  // Also null if the attribute has another value and no list.
   [[nodiscard]] const std::vector<std::shared_ptr<TLPerson>>* personValuesForKey(
       TLAttributeKey key) const;
   [[nodiscard]] const std::vector<TLString>* stringValuesForKey(TLAttributeKey key) const;

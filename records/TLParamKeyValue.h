@@ -3,7 +3,7 @@
 #include "records/RecordAccessors.h"
 #include "records/TLCodable.h"
 
-// One named parameter. In practice one of the values is set, but like an attribute it is a bag.
+// One named parameter. Normally only one of the values is set, but all may be, as in an attribute.
 class TLParamKeyValue final : public TLRecord<TLParamKeyValue> {
  public:
   // Required when writing, not when reading.
@@ -11,7 +11,7 @@ class TLParamKeyValue final : public TLRecord<TLParamKeyValue> {
   TL_RECORD_STRING(stringValue, StringValue)
   TL_RECORD_SCALAR(int64_t, intValue, IntValue, 2)
   TL_RECORD_SCALAR(float, floatValue, FloatValue, 4)
-  // Part of the format, used by no parameter.
+  // Part of the format; no parameter uses it.
   TL_RECORD_SCALAR(double, doubleValue, DoubleValue, 1)
   TL_RECORD_SCALAR(bool, boolValue, BoolValue, 8)
 

@@ -22,7 +22,7 @@ bool equalsASCII(TLStringView text, std::string_view ascii) {
          });
 }
 
-// A key that is read with the wrong type, or is in no table.
+// Logs a read of a key with the wrong type, or of a key that is in no table.
 bool badAccess(std::string_view key, TLParamType type, const char* typeName) {
   if (TLParamsManager::isValidParamTypeWithKey(key, type)) return false;
   TLParameters::log().error("Param: <{}> is not expected to be of {} type. Bad Access!", key,

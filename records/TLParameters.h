@@ -8,31 +8,30 @@
 #include "records/TLCodable.h"
 #include "records/TLParamKeyValue.h"
 
-// A list of parameters: a query's overrides, or the complete set that a search reads. A complete
-// set may be shared between searches; it is not changed then, and reads from several threads are
-// safe.
+// A list of parameters: the overrides of a query, or the complete set that a search reads. A
+// complete set may be shared between searches; it is then not changed and may be read on several
+// threads.
 class TLParameters final : public TLRecord<TLParameters> {
  public:
   TL_RECORD_RECORDS(TLParamKeyValue, keyvalues, Keyvalues, keyvalue, Keyvalue)
 
-  // Keys of parameters are ASCII and given as such; they are compared with the records' keys
-  // without conversion.
+  // Parameter keys are ASCII, so they are compared with the keys of records without conversion.
 
   // The first record with the key, in list order, or null.
   [[nodiscard]] std::shared_ptr<TLParamKeyValue> parameterKeyValueForKey(
       std::string_view key) const;
 
-  // The built-in default of the key, or null. The given parameters play no part.
+  // The built-in default of the key, or null. Ignores the given parameters.
   [[nodiscard]] static std::shared_ptr<TLParamKeyValue> fallbackKeyValueForKey(
       std::string_view key, const std::shared_ptr<TLParameters>& fallbackParameters);
 
-  // The own record, else the default, else null.
+  // The own record, or else the default, or else null.
   [[nodiscard]] std::shared_ptr<TLParamKeyValue> kvForKey(
       std::string_view key, const std::shared_ptr<TLParameters>& fallbackParameters) const;
 
-  // Typed reads. The key must be in the table of defaults with the type that is read, and the
-  // record must have the value of that type; otherwise an error is logged and the result is null, 0
-  // or false. A record of the wrong kind hides the default.
+  // Typed reads. The key must be in the table of defaults with this type, and the record must have
+  // a value of this type; otherwise an error is logged and the result is null, 0 or false. A record
+  // of the wrong type hides the default.
   [[nodiscard]] std::optional<TLString> stringValueForKey(
       std::string_view key,
       const std::shared_ptr<TLParameters>& fallbackParameters = nullptr) const;

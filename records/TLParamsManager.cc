@@ -23,7 +23,7 @@ constexpr std::array<SearchParameterMetadata, 30> kDefaults{
     row("ranking.freshnessWeight", 0.0F),
     row("ranking.textScoreWeight", 1.0F),
     row("ranking.rankingLogsItemCap", 10),
-    // A million, but as the bit pattern of a float: the limit in effect is 1232348160.
+    // One million, but as the bit pattern of a float: the effective limit is 1232348160.
     row("salt.maxTermResults", std::bit_cast<int32_t>(1000000.0F)),
     row("salt.maxTopK", 1000),
     row("salt.scoreThreshold", 0.02F),
@@ -53,7 +53,7 @@ const SearchParameterMetadata* rowForKey(std::string_view key) {
   return found == dict.end() ? nullptr : &found->second;
 }
 
-// A record with the row's key and the default that `value` holds.
+// A record with the row's key and the default in `value`.
 std::shared_ptr<TLParamKeyValue> record(std::string_view key,
                                         const decltype(SearchParameterMetadata::value)& value) {
   const TLString name = platform::fromUTF8(key);
@@ -76,7 +76,7 @@ int32_t clampToInt32(int64_t value) {
                                                   std::numeric_limits<int32_t>::max()));
 }
 
-// A record with the stored value, converted to the row's type.
+// A record with the stored value converted to the row's type.
 std::shared_ptr<TLParamKeyValue> record(const SearchParameterMetadata& row,
                                         const platform::DefaultsValue& stored) {
   const TLString name = platform::fromUTF8(row.key);
@@ -97,7 +97,7 @@ std::shared_ptr<TLParamKeyValue> record(const SearchParameterMetadata& row,
   return nullptr;
 }
 
-// A new record with the key and a value that `setter` takes; null for a null key.
+// A new record with the key and the value set by `setter`; null for a null key.
 template <typename Setter, typename Value>
 std::shared_ptr<TLParamKeyValue> make(std::optional<TLString> key, Setter setter, Value&& value) {
   if (!key) {
@@ -123,15 +123,15 @@ std::optional<int32_t> leadingInteger(std::string_view text) {
   return value;
 }
 
-// Of a decimal number whose size no double can hold: whether it is too small rather than too large.
+// For a decimal number outside the range of a double: whether it is too small rather than too
+// large.
 bool underflows(std::string_view number) {
   const size_t exponent = number.find_first_of("eE");
   if (exponent != std::string_view::npos) return number.substr(exponent + 1).starts_with('-');
   return number.substr(0, number.find('.')).find_first_not_of("-0") == std::string_view::npos;
 }
 
-// Names of infinities and NaN are no decimal numbers; nor is what is too large for a float. What is
-// too small for one is 0.
+// Rejects infinities, NaN and numbers too large for a float. A number too small for one is 0.
 std::optional<float> leadingFloat(std::string_view text) {
   if (text.starts_with('+') && !text.starts_with("+-")) text.remove_prefix(1);
   const size_t first = text.find_first_of("0123456789");
@@ -150,7 +150,7 @@ std::optional<float> leadingFloat(std::string_view text) {
   return std::isfinite(narrow) ? std::optional(narrow) : std::nullopt;
 }
 
-// The record of one override; a value that does not read as the row's type gives the default.
+// The record of one override; if its value cannot be converted to the row's type, the default.
 std::shared_ptr<TLParamKeyValue> recordFromText(const SearchParameterMetadata& row,
                                                 TLStringView pair, TLStringView value) {
   const TLString name = platform::fromUTF8(row.key);

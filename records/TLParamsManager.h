@@ -19,7 +19,7 @@
 // Types of parameters, by number.
 enum class TLParamType : int32_t { string = 0, integer = 1, floating = 2, boolean = 3 };
 
-// One row of the table of defaults. The alternatives of the value stand in the order of the types.
+// One row of the table of defaults. The alternatives of the value are in the order of the types.
 struct SearchParameterMetadata {
   std::string_view key;
   std::variant<const char*, int32_t, float, bool> value;
@@ -29,13 +29,13 @@ struct SearchParameterMetadata {
   }
 };
 
-// The named parameters of a search and where their values come from: the table of defaults, over it
-// the user defaults store, over both the overrides of a query. No instances. Any thread.
+// Resolves the named parameters of a search from three sources: the table of defaults, overridden
+// by the user defaults store, overridden by the query. No instances. Any thread.
 class TLParamsManager {
  public:
   TLParamsManager() = delete;
 
-  // The rows of the table of defaults by key.
+  // The table of defaults, by key.
   [[nodiscard]] static const std::unordered_map<std::string_view, SearchParameterMetadata>&
   getDefaultParamDict();
 
@@ -43,11 +43,11 @@ class TLParamsManager {
   [[nodiscard]] static bool isValidParamTypeWithKey(std::string_view key, TLParamType paramType);
   [[nodiscard]] static std::unordered_set<std::string_view> defaultParamsSet();
 
-  // A new set with the table's defaults, in the order of the table.
+  // A new set with the defaults, in the order of the table.
   [[nodiscard]] static std::shared_ptr<TLParameters> paramsFromFallback();
 
-  // The defaults as resolved against the user defaults store. With caching the set is made once for
-  // the process and never refreshed; it is shared between all callers and must not be changed.
+  // The defaults as overridden by the user defaults store. With caching the set is created once per
+  // process and never refreshed; all callers share it and must not change it.
   [[nodiscard]] static std::shared_ptr<TLParameters> getDefaultSearchParamsWithCaching(
       bool caching);
 
@@ -55,29 +55,28 @@ class TLParamsManager {
   [[nodiscard]] static std::shared_ptr<TLParameters> loadSearchParamsFromUserDefaults(
       platform::DefaultsStore& store = platform::DefaultsStore::standard());
 
-  // Writes the table's default under each key that the store lacks. A failed write is logged by the
-  // store.
+  // Writes the default of each key that the store lacks. The store logs failed writes.
   static void saveSearchParamsToUserDefaults(
       platform::DefaultsStore& store = platform::DefaultsStore::standard());
 
-  // Override text: "key=value" pairs separated by ",", no blanks trimmed, no quoting. Null when a
-  // part is no such pair; a pair with an unknown key is dropped; a value that does not read as the
-  // parameter's type gives the table's default.
+  // Parses override text: "key=value" pairs separated by ",", without trimming or quoting. Null if
+  // a part is not a pair. A pair with an unknown key is dropped; a value that cannot be converted
+  // to the parameter's type is replaced by the default.
   [[nodiscard]] static std::shared_ptr<TLParameters> paramsFromString(TLStringView text);
 
   [[nodiscard]] static std::unordered_set<TLString> paramKeySet(const TLParameters& params);
 
-  // A copy of the first override with the key of the default, else a copy of the default.
+  // A copy of the first override with the key of the default, or else of the default.
   [[nodiscard]] static std::shared_ptr<TLParamKeyValue> resolveParamWithDefaultKV(
       const TLParamKeyValue& defaultKV, const std::unordered_set<TLString>& overrideParamSet,
       const TLParameters& overrideParams);
 
-  // A new complete set: the defaults with the overrides in their place. Overrides with keys outside
-  // the table are dropped.
+  // A new complete set: the defaults, replaced by the overrides. Overrides with unknown keys are
+  // dropped.
   [[nodiscard]] static std::shared_ptr<TLParameters> resolveOverrides(const TLParameters& overrides,
                                                                       bool withEnableParamCaching);
 
-  // One record each; null, with an error in the log, for a null key.
+  // A single record; null, with an error in the log, for a null key.
   [[nodiscard]] static std::shared_ptr<TLParamKeyValue> tlParamKeyValueWithKeyStringValue(
       std::optional<TLString> key, std::optional<TLString> stringValue);
   [[nodiscard]] static std::shared_ptr<TLParamKeyValue> tlParamKeyValueWithKeyIntValue(

@@ -3,7 +3,7 @@
 #include "records/RecordAccessors.h"
 #include "records/TLCodable.h"
 
-// A name and mail address pair.
+// A name and a mail address.
 class TLPerson final : public TLRecord<TLPerson> {
  public:
   TL_RECORD_STRING(name, Name)

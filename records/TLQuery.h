@@ -5,13 +5,13 @@
 #include "records/TLParameters.h"
 #include "records/TLQueryNode.h"
 
-// What a client hands to a search. A search replaces searchParams by the resolved set, so a query
-// is not shared between two searches that run at once.
+// A search request from a client. A search replaces searchParams by the resolved set, so concurrent
+// searches must not share a query.
 class TLQuery final : public TLRecord<TLQuery> {
  public:
-  // The tree of conditions; absent where there is none.
+  // The condition tree; absent if there is none.
   TL_RECORD_RECORD(TLQueryNode, root, Root)
-  // Carried for the client: language, country and tokenizedQuery are not read by the daemon.
+  // For the client only: the daemon does not read language, country and tokenizedQuery.
   TL_RECORD_STRING(language, Language)
   TL_RECORD_STRING(country, Country)
   // The query as the client typed it.

@@ -24,8 +24,8 @@ struct TLRecordTable<TLQueryNode> {
 
 template class TLRecord<TLQueryNode>;
 
-// Children that nobody else holds hand on their own children before they go, so that no destructor
-// runs inside another's.
+// Children without another owner give up their own children first, so that no destructor runs
+// inside another's.
 TLQueryNode::~TLQueryNode() {
   std::vector<std::shared_ptr<TLQueryNode>> open = std::move(_childs);
   while (!open.empty()) {

@@ -4,20 +4,20 @@
 #include "records/TLAttributeKey.h"
 #include "records/TLCodable.h"
 
-// One node of a query's tree of attribute conditions. A leaf has keys, an op and the value that the
-// op compares with; an AND or OR node has only children.
+// One node of a query's condition tree. A leaf has keys, an op and the value to compare with; an
+// AND or OR node has only children.
 //
-// A tree is at most kMaximumRecordDepth levels of children deep, one less below a query. A deeper
-// one can be built and destroyed, but to write, compare, hash, copy or describe it is a programming
-// error.
+// A tree has at most kMaximumRecordDepth levels of children, one less inside a query. A deeper one
+// can be built and destroyed, but writing, comparing, hashing, copying or describing it is a
+// programming error.
 class TLQueryNode final : public TLRecord<TLQueryNode> {
  public:
   TLQueryNode() = default;
-  // Takes the tree apart in a loop, whatever its depth.
+  // Destroys the tree in a loop, whatever its depth.
   ~TLQueryNode() override;
 
-  // The keys as numbers of TLAttributeKey, also outside its named values. The pointer lives until
-  // the next change.
+  // The keys as numbers of TLAttributeKey, which may be outside its named values. The pointer is
+  // valid until the next change.
   [[nodiscard]] const int32_t* keys() const { return _keys.data(); }
   [[nodiscard]] size_t keysCount() const { return _keys.size(); }
   void clearKeys() { _keys.clear(); }
@@ -32,7 +32,7 @@ class TLQueryNode final : public TLRecord<TLQueryNode> {
   TL_RECORD_STRING(stringValue, StringValue)
   TL_RECORD_SCALAR(int64_t, intValue, IntValue, 2)
   TL_RECORD_SCALAR(float, floatValue, FloatValue, 4)
-  // Seconds since 2001-01-01 00:00:00 UTC for a leaf that compares a time.
+  // For a leaf that compares a time: seconds since 2001-01-01 00:00:00 UTC.
   TL_RECORD_SCALAR(double, doubleValue, DoubleValue, 1)
   TL_RECORD_SCALAR(bool, boolValue, BoolValue, 32)
   TL_RECORD_ENUM(TLQueryNodeOp, op, Op, 16, TLQueryNodeOp::STRING_EQUAL)

@@ -27,7 +27,7 @@ bool TLReader::skipValue(uint64_t wireType) {
   }
 }
 
-// Groups inside the group are counted rather than recursed into.
+// Counts nested groups instead of recursing into them.
 bool TLReader::skipGroup() {
   for (uint64_t open = 1; open > 0;) {
     const uint64_t wireType = readVarint() & 7;

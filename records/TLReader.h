@@ -9,17 +9,17 @@
 
 #include "platform/Text.h"
 
-// How many sub-records may lie inside each other. A record nested deeper makes the read fail, and
-// every walk over a tree of records (write, compare, hash, copy, describe) asserts the same bound,
-// so that no input and no tree built by hand can exhaust the stack.
+// Maximum nesting of sub-records. Reading a deeper record fails, and every recursive operation
+// (write, compare, hash, copy, describe) asserts the same bound, so neither input nor a tree built
+// by hand can exhaust the stack.
 inline constexpr int kMaximumRecordDepth = 256;
 
-// How many sub-records and texts of lists one read may make. Two bytes on the wire can ask for a
-// record of some 300 bytes; past this limit, far beyond any real item, the read fails rather than
-// eat the memory of the device.
+// Maximum number of sub-records and list texts in one read. Two bytes on the wire can request a
+// record of about 300 bytes; above this limit, far beyond any real item, the read fails instead of
+// exhausting the memory of the device.
 inline constexpr uint32_t kMaximumRecordElements = uint32_t{1} << 18;
 
-// Wire types, the low three bits of a tag.
+// Wire types: the low three bits of a tag.
 enum class TLWireType : uint8_t {
   varint = 0,
   fixed64 = 1,
@@ -29,24 +29,24 @@ enum class TLWireType : uint8_t {
   fixed32 = 5,
 };
 
-// Reads the Protocol Buffers wire format in place from bytes that outlive it. Every failure raises
-// the error flag, which stays; what could not be read reads as 0 or null. One thread.
+// Reads the Protocol Buffers wire format in place; the bytes must outlive the reader. Every failure
+// sets the error flag permanently; what cannot be read is 0 or null. One thread.
 class TLReader {
  public:
-  // With `keepsWire`, lists that can be kept in wire form are (see TLRecordList).
+  // With `keepsWire`, lists that support it stay in wire form (see TLRecordList).
   explicit TLReader(std::string_view bytes, bool keepsWire = false)
       : _position(bytes.data()), _limit(bytes.data() + bytes.size()), _keepsWire(keepsWire) {}
 
   [[nodiscard]] bool hasError() const { return _error; }
-  // True while bytes are left before the limit and nothing has failed.
+  // True while bytes remain before the limit and nothing has failed.
   [[nodiscard]] bool hasMore() const { return _position < _limit && !_error; }
   [[nodiscard]] size_t remaining() const { return static_cast<size_t>(_limit - _position); }
   [[nodiscard]] const char* position() const { return _position; }
   [[nodiscard]] bool keepsWire() const { return _keepsWire; }
   void fail() { _error = true; }
 
-  // At most ten bytes, low group first. Ten bytes that all have their top bit set read as 0,
-  // without an error, and the next read starts behind them.
+  // At most ten bytes, low group first. Ten bytes that all have their top bit set yield 0 without
+  // an error, and the next read starts after them.
   uint64_t readVarint() {
     if (_position < _limit && static_cast<uint8_t>(*_position) < 0x80) {
       return static_cast<uint8_t>(*_position++);
@@ -67,7 +67,7 @@ class TLReader {
   float readFloat() { return readFixed<float>(); }
   double readDouble() { return readFixed<double>(); }
 
-  // A length and as many bytes; the view lives as long as the input. None when they are not there.
+  // A length-delimited value; the view is valid as long as the input. Nullopt if it is cut off.
   std::optional<std::string_view> readView() {
     const uint64_t length = readVarint();
     if (_error || length > remaining()) {
@@ -79,7 +79,7 @@ class TLReader {
     return view;
   }
 
-  // Invalid UTF-8 reads as U+FFFD.
+  // Invalid UTF-8 becomes U+FFFD.
   std::optional<TLString> readString() {
     const auto view = readView();
     return view ? std::optional(platform::fromUTF8(*view)) : std::nullopt;
@@ -90,12 +90,12 @@ class TLReader {
     return view ? std::optional(std::string(*view)) : std::nullopt;
   }
 
-  // Steps over the value behind a tag of this wire type; a group is skipped up to the end tag that
-  // closes it. False for a wire type that does not exist or a value that is cut short.
+  // Skips the value after a tag of this wire type; a group is skipped up to its end tag. False for
+  // an unknown wire type or a value that is cut off.
   [[nodiscard]] bool skipValue(uint64_t wireType);
 
-  // Reads a length and runs `body` with that length as the limit, then restores the limit, leaving
-  // the position where `body` stopped. False when the length does not fit or `body` says so.
+  // Reads a length, runs `body` with the limit set to it, then restores the limit and leaves the
+  // position where `body` stopped. False if the length does not fit or `body` returns false.
   template <typename Body>
   [[nodiscard]] bool withLengthLimit(Body&& body) {
     const uint64_t length = readVarint();
@@ -110,14 +110,14 @@ class TLReader {
     return result;
   }
 
-  // Counts one element against the bound; false, with the error flag, when it is used up.
+  // Counts one element; false, with the error flag set, if the limit is exceeded.
   [[nodiscard]] bool takeElement() {
     if (_elements == kMaximumRecordElements) _error = true;
     ++_elements;
     return !_error;
   }
 
-  // Runs `body` on a sub-record, within the bounds of length, nesting and number.
+  // Runs `body` on a sub-record, within the limits of length, nesting and number.
   template <typename Body>
   [[nodiscard]] bool withRecord(Body&& body) {
     if (_depth == kMaximumRecordDepth) _error = true;
@@ -128,7 +128,7 @@ class TLReader {
     return result;
   }
 
-  // A sub-record in place.
+  // Reads a sub-record in place.
   template <typename Record>
   [[nodiscard]] bool readRecord(Record& record) {
     return withRecord([&] { return record.readFrom(*this); });

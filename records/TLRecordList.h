@@ -9,10 +9,9 @@
 #include "platform/Assert.h"
 #include "records/TLReader.h"
 
-// A list of sub-records that may still be as it was on the wire: its records are made when somebody
-// first asks for them. Most items that a search returns go from the document store to the client
-// without a look at their attributes. A copy shares the records. One thread, also for what is
-// const.
+// A list of sub-records that may still be in wire form: its records are decoded at first use. Most
+// items that a search returns pass from the document store to the client without anybody reading
+// their attributes. A copy shares the records. One thread, even for const functions.
 template <typename Record>
 class TLRecordList {
  public:
@@ -40,14 +39,14 @@ class TLRecordList {
     return _records;
   }
 
-  // Adds a record in wire form, its length first, to a list of nothing else.
+  // Appends a record in wire form, length first; the list must contain nothing else.
   void addWire(std::string_view delimited) {
     TL_ASSERT(_records.empty());
     _wire += delimited;
   }
 
   // Calls visit(bytes, delimited) for each record in wire form, without and with its length, until
-  // it returns false. None once the records were asked for.
+  // it returns false. Nullopt if the records are already decoded.
   template <typename Visit>
   void forEachWire(const Visit& visit) const {
     for (TLReader reader(_wire); reader.hasMore();) {
@@ -62,11 +61,11 @@ class TLRecordList {
   void readWire() const {
     forEachWire([this](std::string_view bytes, std::string_view) {
       _records.push_back(std::make_shared<Record>());
-      return _records.back()->initWithData(bytes);  // true: isAsWritten has said so
+      return _records.back()->initWithData(bytes);  // succeeds, because isAsWritten has checked it
     });
     _wire.clear();
   }
 
   mutable Records _records;
-  mutable std::string _wire;  // records that nobody has asked for yet; then _records is empty
+  mutable std::string _wire;  // records not yet decoded; then _records is empty
 };

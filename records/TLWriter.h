@@ -10,7 +10,7 @@
 #include "platform/Text.h"
 #include "records/TLReader.h"
 
-// Appends the Protocol Buffers wire format to a buffer of its own. Cannot fail. One thread.
+// Appends the Protocol Buffers wire format to its own buffer. Cannot fail. One thread.
 class TLWriter {
  public:
   [[nodiscard]] const std::string& bytes() const { return _bytes; }
@@ -42,7 +42,7 @@ class TLWriter {
   void writeStringField(uint32_t number, TLStringView value) {
     writeDelimited(number, [&] { platform::appendUTF8(value, _bytes); });
   }
-  // A sub-record that is in wire form already, its length first.
+  // A sub-record already in wire form, length first.
   void writeDelimitedField(uint32_t number, std::string_view delimited) {
     writeTag(number, TLWireType::lengthDelimited);
     _bytes.append(delimited);
@@ -64,8 +64,8 @@ class TLWriter {
     _bytes.append(raw, sizeof raw);
   }
 
-  // `body` appends the value behind one byte left for its length; only a value of 128 bytes or more
-  // is moved to make room for a longer length.
+  // `body` appends the value after one byte reserved for its length; only a value of 128 bytes or
+  // more must be moved to make room for a longer length.
   template <typename Body>
   void writeDelimited(uint32_t number, Body&& body) {
     writeTag(number, TLWireType::lengthDelimited);

@@ -8,13 +8,13 @@
 
 namespace salt {
 
-// How much work of one kind goes on at a moment, for other work that gives way to it. Any thread.
+// Counts running operations of one kind, so that other work can give way to them. Any thread.
 class Activity {
  public:
-  // Pieces of work that follow one another within `gap` count as one.
+  // Operations that follow one another within `gap` count as one.
   explicit Activity(std::chrono::nanoseconds gap = {}) : _gap(gap) {}
 
-  // As long as one lives, work goes on.
+  // Marks an operation as running for the lifetime of this object.
   class Work {
    public:
     explicit Work(Activity& activity) : _activity(activity) { activity.begin(); }
@@ -26,13 +26,13 @@ class Activity {
     Activity& _activity;
   };
 
-  // Cheap enough to ask all the time.
+  // Cheap: one relaxed load.
   [[nodiscard]] bool any() const { return _running.load(std::memory_order_relaxed) != 0; }
 
-  // Waits until no work has gone on for the length of the gap; no longer than `most`, and not after
-  // an interruption.
+  // Waits until nothing has run for the length of the gap; at most `most`, and not after an
+  // interruption.
   void waitForEnd(std::chrono::nanoseconds most) TL_EXCLUDES(_mutex);
-  // Ends all waiting, for good.
+  // Ends all waits, now and in future.
   void interrupt() TL_EXCLUDES(_mutex);
 
  private:

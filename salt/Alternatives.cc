@@ -12,12 +12,12 @@ namespace saltsearch {
 
 namespace {
 
-// Documents of all tokens that are on their way at once: bounds the memory to some 12 MB, and what
-// the largest token takes.
+// Bounds the candidate documents held at a time, over all tokens: about 12 MB, plus what the token
+// with the most documents needs.
 constexpr size_t kMostStandings = 500000;
 
-// Takes the documents of many tokens through the terms together, so that each other term is scanned
-// for once.
+// Evaluates the candidate documents of many tokens together, so that each of the other terms is
+// scanned only once.
 class SharedSearch {
  public:
   SharedSearch(const salt::Index& index, const Evaluation& evaluation, std::vector<Term> terms,
@@ -50,7 +50,7 @@ class SharedSearch {
   }
 
  private:
-  // The documents that one of the tokens matches, with the zone mask of each.
+  // The documents that one token matches, with the zone mask of each.
   struct Matches {
     std::vector<Standing> docs;
     std::vector<uint32_t> masks;
@@ -111,7 +111,7 @@ bool oneTokenEach(const std::vector<Term>& terms) {
   });
 }
 
-// One search a token.
+// Runs a separate search for each token.
 std::vector<std::optional<double>> bestBySearch(const salt::Index& index, std::vector<Term> terms,
                                                 size_t position,
                                                 const std::vector<std::string>& tokens,
@@ -155,7 +155,7 @@ std::vector<std::optional<double>> BestScores(const salt::Index& index,
                                               const Options& options) {
   std::vector<Term> changed = terms;
   changed[position].tokenScores[0] = 1.0;
-  // Else documents that the token is not in could be the best.
+  // If the term is not required, a document without the token could have the best score.
   const bool required = terms[position].defaultScore == 0 && options.threshold > 0;
   if (!required || !oneTokenEach(terms)) {
     return bestBySearch(index, std::move(changed), position, tokens, options);

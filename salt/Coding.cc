@@ -23,7 +23,7 @@ size_t readPageSize(std::string_view& s, const Index::OptionsBlock& op) {
   return size;
 }
 
-// The same as readVarint where the longest varint is known to fit.
+// readVarint without the bounds check: the caller knows that the longest varint fits.
 const char* getVarint(const char* in, uint32_t* value) {
   uint32_t byte = static_cast<uint8_t>(*in++);
   *value = byte & 0x7F;
@@ -35,8 +35,8 @@ const char* getVarint(const char* in, uint32_t* value) {
   return in;
 }
 
-// Reads `count` varints from the front and hands each to store(index, value). The bounds are
-// checked once for all where that is enough.
+// Reads `count` varints from the front and passes each to store(index, value). Checks the bounds
+// once for all of them where possible.
 template <typename Store>
 void readColumn(std::string_view& s, size_t count, const Store& store) {
   if (s.size() < count * kMaxVarint32) {
@@ -52,7 +52,7 @@ void readColumn(std::string_view& s, size_t count, const Store& store) {
   s.remove_prefix(static_cast<size_t>(in - s.data()));
 }
 
-// Position of `byte` in [from, limit) of `text`, or `limit`.
+// The position of `byte` in [from, limit) of `text`, or `limit`.
 size_t findByte(std::string_view text, char byte, size_t from, size_t limit) {
   const void* found = std::memchr(text.data() + from, byte, limit - from);
   if (found == nullptr) return limit;

@@ -8,15 +8,15 @@
 #include "platform/Assert.h"
 #include "salt/Index.h"
 
-// The bytes of keys and values; FORMAT.md shows them. Readers take their input from the front of a
-// view; input that runs out or does not fit is a corrupt database and ends the process.
+// Encoding of keys and values; FORMAT.md shows the bytes. Readers consume the front of a view.
+// Input that is too short or invalid means a corrupt database and ends the process.
 namespace salt {
 
-// Most bytes of a varint of 32 and of 16 bits.
+// Upper bound in bytes of a varint of 32 and of 16 bits.
 inline constexpr size_t kMaxVarint32 = 5;
 inline constexpr size_t kMaxVarint16 = 3;
 
-// Writes little-endian base 128 at `out`; the result is the end.
+// Writes little-endian base 128 at `out` and returns the end.
 inline char* putVarint(char* out, uint32_t value) {
   for (; value >= 0x80; value >>= 7) *out++ = static_cast<char>(value | 0x80);
   *out++ = static_cast<char>(value);
@@ -35,25 +35,25 @@ inline uint32_t readVarint(std::string_view& s) {
   }
 }
 
-// The byte, or 0 past the end, as `extra` has it.
+// The byte at a position, or 0 after the end, as stored in `extra`.
 inline uint8_t byteAt(std::string_view text, size_t at) {
   return at < text.size() ? static_cast<uint8_t>(text[at]) : 0;
 }
 
-// How many bytes of `text` are the text of a suffix that begins there: up to the first NUL, to the
-// first blank (kept) at or past MinMatchLen, and to MaxMatchLen.
+// The length of the suffix text at the front of `text`: up to the first NUL, up to and including
+// the first space at or after MinMatchLen, and at most MaxMatchLen.
 [[nodiscard]] size_t suffixLength(std::string_view text, const Index::OptionsBlock& op);
 
-// Replaces `key` by shard number and text, and, unless meta.DocID is 0, NUL and the varints of
-// ZoneID, Offset and DocID. `text` is cut already.
+// Sets `key` to shard number and text and, unless meta.DocID is 0, NUL and the varints of ZoneID,
+// Offset and DocID. `text` must be truncated already.
 void suffixKey(uint8_t shard, std::string_view text, const SuffixMeta& meta, std::string* key);
 
-// The value of a page of `count` suffixes, in columns; replaces `value`.
+// Encodes a page of `count` suffixes in columns; replaces `value`.
 void pageToValue(const SuffixMeta* metas, size_t count, std::string* value);
 void valueToPage(std::string_view value, const Index::OptionsBlock& op,
                  std::vector<SuffixMeta>* metas);
 
-// Where the page's suffixes stand; the columns behind are not read.
+// Decodes the places of a page; the remaining columns are not read.
 void readPlaces(std::string_view value, const Index::OptionsBlock& op, std::vector<Place>* places);
 
 // Key of a zone's text: 0xFF, decimal DocID, ",", decimal ZoneID.

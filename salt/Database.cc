@@ -15,13 +15,13 @@ namespace salt {
 namespace {
 
 constexpr size_t kWriteBufferBytes =
-    6 * 1024 * 1024;  // memtable and log size at which it is sorted
+    6 * 1024 * 1024;  // size of memtable and log at which leveldb flushes
 constexpr size_t kBlockCacheBytes = 1024 * 1024;
 constexpr size_t kBlockBytes = 32 * 1024;
 constexpr size_t kFileBytes = 4 * 1024 * 1024;
 constexpr size_t kLogLineBytes = 100;
-constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one takes at a time
-// In a memtable a batch takes up to three times as much.
+constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one compaction needs at a time
+// A batch takes up to three times its size in a memtable.
 constexpr size_t kBatchesBesideCompaction = kWriteBufferBytes / 4;
 constexpr std::chrono::seconds kLongestWait{1};  // with locks held that searches need
 
@@ -33,10 +33,10 @@ leveldb::Status open(const leveldb::Options& options, const std::string& path,
   return status;
 }
 
-// A database whose last process died can have a log that ends within a record. Reusing such a log
-// appends behind the torn record, where the next recovery does not look: batches acknowledged
-// after the reopening would be gone. So a first open recovers into a table and a fresh log, and
-// only then are logs reused.
+// The log of a process that died can end with a torn record. If leveldb reused that log, it would
+// append after the torn record, where the next recovery does not look: batches acknowledged after
+// reopening would be lost. So the first open recovers into a table and a new log, and only the
+// second one reuses logs.
 leveldb::Status openExisting(leveldb::Options options, const std::string& path,
                              std::unique_ptr<leveldb::DB>* db) {
   options.reuse_logs = false;
@@ -86,7 +86,7 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch) {
   return write(batch, false);
 }
 
-// A batch of nothing: leveldb takes no batch at all for the wish to write its memtable.
+// An empty batch, because leveldb takes a null batch as the request to flush the memtable.
 leveldb::Status BatchWriter::sync() {
   leveldb::WriteBatch empty;
   return write(&empty, true);
@@ -109,8 +109,8 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch, bool sync) {
   return status;
 }
 
-// leveldb hands on the text of an errno and not its number. All of its input and output errors are
-// the system's, but for files that are not there, which it tells apart.
+// leveldb passes on the text of an errno but not its number. All of its I/O errors come from the
+// system, except for missing files, which it reports separately.
 std::optional<TLError> systemError(const leveldb::Status& status) {
   if (!status.IsIOError()) return std::nullopt;
   const std::string text = status.ToString();

@@ -21,14 +21,14 @@ namespace salt {
 
 inline constexpr platform::Log Log{platform::kSubsystem, "SALT"};
 
-// Passes what leveldb says of itself to the log, at debug level, cut to 99 bytes a line.
+// Forwards leveldb's messages to the log at debug level, truncated to 99 bytes a line.
 class LeveldbLogger final : public leveldb::Logger {
  public:
   void Logv(const char* format, va_list arguments) override;
 };
 
-// An open database with what it needs to live; goes down in the order database, cache, logger,
-// order, files.
+// An open database with everything it depends on; destroyed in the order database, cache, logger,
+// comparator, environment.
 struct Database {
   std::string path;
   std::unique_ptr<IndexFiles> files;
@@ -39,42 +39,43 @@ struct Database {
   leveldb::Status status;           // of opening
 };
 
-// What the system lacks when it is the reason of a failure: descriptors, memory, space, a readable
-// disk. None for a database that is not there, or is damaged.
+// The system failure behind a status: too few descriptors, memory, space, an unreadable disk.
+// Nullopt for a database that is absent or damaged.
 [[nodiscard]] std::optional<TLError> systemError(const leveldb::Status& status);
 
 enum class OpenMode { create, existing };
 
-// `create` removes what is at `path` first. A failure is logged. `files` outlives the database.
+// `create` removes what is at `path` first. Failures are logged. `files` must outlive the database.
 [[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode,
                                     leveldb::Env* files = leveldb::Env::Default());
 
-// The only way batches are written and keys compacted. Any thread.
+// All writes and compactions go through here. Any thread.
 //
-// A write that fails (a full disk, say) can leave half a record in the log, and recovery does not
-// look behind it: the next write starts a new log first, so that what it acknowledges survives.
+// A failed write (a full disk, for example) can leave a torn record in the write-ahead log, and
+// recovery ignores everything after a torn record. So the next write starts a new log first, and
+// what it acknowledges survives.
 //
-// leveldb 1.23 ends the process when it fails to write a memtable during a compaction on demand. So
-// none begins on a disk that is nearly full or beside another, and writes that would fill the
-// memtable meanwhile wait, a second at most: who adds a lot has waited before, holding no lock (see
+// leveldb 1.23 ends the process when it fails to flush a memtable during a compaction on demand. So
+// no such compaction starts on a nearly full disk or beside another one, and writes that would fill
+// the memtable meanwhile wait up to a second. Bulk ingest has already waited, holding no lock (see
 // WaitWhileTidying).
 class BatchWriter {
  public:
-  // Of the open database, which outlives this.
+  // The open database must outlive this object.
   explicit BatchWriter(const Database& database) : _database(database) {}
 
-  // On the disk within a second or so.
+  // The batch reaches the disk within about a second.
   [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch) TL_EXCLUDES(_mutex);
 
-  // Returns once all that was written is on the disk.
+  // Returns once everything written is on disk.
   [[nodiscard]] leveldb::Status sync() TL_EXCLUDES(_mutex);
 
-  // The keys from `begin` to `end`; null stands for the first and the last. Does nothing and gives
-  // false, with a log line, where fewer than 128 MiB are free.
+  // Compacts the keys from `begin` to `end`; null means the first and the last key. Does nothing
+  // and returns false, with a log line, with less than 128 MiB free.
   bool compact(const leveldb::Slice* begin, const leveldb::Slice* end) TL_EXCLUDES(_mutex);
 
  private:
-  // False when it took too long.
+  // False on timeout.
   [[nodiscard]] bool waitForCompaction(size_t bytes) TL_REQUIRES(_mutex);
   [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch, bool sync) TL_EXCLUDES(_mutex);
 
@@ -82,11 +83,12 @@ class BatchWriter {
   platform::Mutex _mutex;
   std::condition_variable_any _compacted;
   bool _compacts TL_GUARDED_BY(_mutex) = false;
-  size_t _room TL_GUARDED_BY(_mutex) = 0;  // for batches, until it has
+  size_t _room TL_GUARDED_BY(_mutex) =
+      0;  // bytes that batches may still write during the compaction
   bool _logTorn TL_GUARDED_BY(_mutex) = false;
 };
 
-// With `fillCache` false the reads do not displace the block cache.
+// With `fillCache` false the reads bypass the block cache.
 inline leveldb::ReadOptions readOptions(bool fillCache) {
   leveldb::ReadOptions options;
   options.verify_checksums = false;

@@ -7,8 +7,8 @@
 
 namespace salt {
 
-// A value for each document number, T() at first. Made for very many look-ups in no order: the
-// memory is taken by the page, for documents that are asked for and their neighbours. One thread.
+// Maps document numbers to values, initially T(). Built for very many random look-ups: memory is
+// allocated in pages, only for documents accessed and their neighbours. One thread.
 template <typename T>
 class DocPages {
  public:
@@ -19,14 +19,14 @@ class DocPages {
     return _pages[page][docID % kPageDocs];
   }
 
-  // The value, without taking memory.
+  // The value, without allocating.
   [[nodiscard]] T at(uint32_t docID) const {
     const size_t page = docID / kPageDocs;
     if (page >= _pages.size() || _pages[page] == nullptr) return T();
     return _pages[page][docID % kPageDocs];
   }
 
-  // Calls visit(docID, value), in order of docID, for each document on a page that has memory.
+  // Calls visit(docID, value) in DocID order for each document of an allocated page.
   template <typename Visit>
   void forEach(const Visit& visit) const {
     for (size_t page = 0; page < _pages.size(); ++page) {

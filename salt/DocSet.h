@@ -6,8 +6,8 @@
 
 namespace salt {
 
-// Document numbers in a hash table in one array, with linear probing. 0 marks a free slot and
-// cannot be in it. One thread writes, or any number read.
+// A set of document numbers: an open-addressing hash table with linear probing. 0 marks a free slot
+// and cannot be a member. One writer, or any number of readers.
 class DocSet {
  public:
   [[nodiscard]] size_t size() const { return _size; }
@@ -16,7 +16,7 @@ class DocSet {
     return _size != 0 && _slots[slotOf(docID)] == docID;
   }
 
-  // Adds a number that is not 0 and not in the set.
+  // `docID` must not be 0 nor in the set.
   void insert(uint32_t docID) {
     if ((_size + 1) * 3 > _slots.size() * 2) grow();
     _slots[slotOf(docID)] = docID;
@@ -33,7 +33,7 @@ class DocSet {
  private:
   static constexpr unsigned kMinBits = 6;
 
-  // The slot that holds docID, or the free one where it would go.
+  // The slot that holds docID, or the free slot where it belongs.
   [[nodiscard]] size_t slotOf(uint32_t docID) const {
     const size_t mask = _slots.size() - 1;
     size_t slot = (docID * UINT64_C(0x9E3779B97F4A7C15)) >> (64 - _bits);

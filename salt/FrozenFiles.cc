@@ -16,14 +16,14 @@ namespace salt {
 
 namespace {
 
-// Of a log or a manifest. leveldb begins a new log at some 6 MiB; a larger one is no log of ours.
+// For a log or a manifest. leveldb starts a new log at about 6 MiB; a larger file is not ours.
 constexpr size_t kMaxCopiedBytes = 256 * 1024 * 1024;
 
 bool isNumber(std::string_view text) {
   return !text.empty() && text.find_first_not_of("0123456789") == std::string_view::npos;
 }
 
-// leveldb's names; files of others are not looked at.
+// Names that leveldb gives; all other files are ignored.
 bool isTable(std::string_view name) {
   return (name.ends_with(".ldb") || name.ends_with(".sst")) &&
          isNumber(name.substr(0, name.size() - 4));
@@ -40,7 +40,7 @@ leveldb::Status refused(const std::string& path) {
   return leveldb::Status::IOError(path, "frozen");
 }
 
-// Part of a table; the descriptor is another's.
+// Reads from a descriptor that it does not own.
 class TableReader final : public leveldb::RandomAccessFile {
  public:
   TableReader(std::string path, int descriptor) : _path(std::move(path)), _descriptor(descriptor) {}
@@ -92,7 +92,7 @@ bool FrozenFiles::addTable(const std::string& path, TLErrorOut error) {
     platform::setError(error, platform::posixError(errno, path));
     return false;
   }
-  if (!S_ISREG(info.st_mode)) return true;  // and so none of leveldb's
+  if (!S_ISREG(info.st_mode)) return true;  // not one of leveldb's
   table.size = static_cast<uint64_t>(info.st_size);
   _tables.emplace(path, std::move(table));
   return true;
@@ -139,7 +139,7 @@ leveldb::Status FrozenFiles::GetChildren(const std::string& directory,
   return status;
 }
 
-// A table that is removed is only one that is not used any more; it stays.
+// leveldb removes a captured table when it no longer needs it; the file stays.
 leveldb::Status FrozenFiles::RemoveFile(const std::string& path) {
   return table(path) != nullptr ? leveldb::Status::OK() : target()->RemoveFile(path);
 }

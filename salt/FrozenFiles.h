@@ -13,14 +13,14 @@
 
 namespace salt {
 
-// The files of one database directory as they were at one moment. Tables, which never change, are
-// read through descriptors that are held open; the small rest is copied to memory, where all that
-// is written goes too. Any thread may read; only the one that captured makes files, as opening
-// does. Compactions, which leveldb starts on a thread of its own, would fill the memory with
-// tables: they fail, and reading goes on.
+// A snapshot of the files of one database directory. Tables, which never change, are read through
+// file descriptors held open; the small remaining files are copied to memory, and all writes go to
+// memory too. Any thread may read. Only the thread that captured the snapshot may create files, as
+// opening a database does. On leveldb's background thread file creation fails, because compactions
+// would fill the memory with tables; reading still works.
 class FrozenFiles final : public leveldb::EnvWrapper {
  public:
-  // Null with an error when the directory or one of the database's files cannot be read.
+  // Null with an error when the directory or one of the database files cannot be read.
   [[nodiscard]] static std::unique_ptr<FrozenFiles> capture(const std::string& directory,
                                                             TLErrorOut error);
 
@@ -42,14 +42,15 @@ class FrozenFiles final : public leveldb::EnvWrapper {
 
   explicit FrozenFiles(std::unique_ptr<leveldb::Env> memory);
 
-  // A database that makes a file of the name of a table gets what it wrote.
+  // Null when the path is no captured table, or when the database has since written a file of the
+  // same name, which takes precedence.
   [[nodiscard]] const Table* table(const std::string& path);
   [[nodiscard]] bool addTable(const std::string& path, TLErrorOut error);
   [[nodiscard]] bool mayWrite() const { return std::this_thread::get_id() == _opener; }
   [[nodiscard]] bool addCopy(const std::string& path, TLErrorOut error);
 
   const std::unique_ptr<leveldb::Env> _memory;
-  std::map<std::string, Table> _tables;  // by path; fixed once captured
+  std::map<std::string, Table> _tables;  // by path; fixed after capture
   const std::thread::id _opener = std::this_thread::get_id();
 };
 

@@ -9,13 +9,13 @@
 
 namespace salt {
 
-// A thread that takes over half of a short job, if it gets to it in time: waking a thread can take
-// longer than the job, and nobody waits for one that has not begun. Any thread.
+// A second thread for short jobs. It takes half of a job if it wakes up in time: waking a thread
+// can take longer than the job, and nobody waits for a half that has not begun. Any thread.
 class Helper {
  public:
-  // Runs half(0) here and half(1) on the helper's thread, at the same time. half(1) is left out
-  // when half(0) has ended before it began, or no thread can be had, so each half does what the
-  // other has not done yet.
+  // Runs half(0) on the calling thread and half(1) concurrently on the helper thread. half(1) is
+  // skipped if half(0) ends before it begins, or if no thread is available, so each half must
+  // process whatever the other has not.
   void share(const std::function<void(size_t half)>& half) {
     const auto job = std::make_shared<Job>();
     const bool begun = _thread.async([job, &half] {

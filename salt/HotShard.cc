@@ -5,12 +5,12 @@
 
 #include "salt/IndexImpl.h"
 
-// The writing half of the index: zones into the hot part, and the set of deleted documents.
+// Writes to the index: adds zones to the hot part, and updates the set of deleted documents.
 namespace salt {
 
 namespace {
 
-// A batch that has grown past this gives its memory back.
+// A batch that has grown larger is freed instead of reused.
 constexpr size_t kMaxKeptBatchBytes = 4 * 1024 * 1024;
 
 double seconds(std::chrono::nanoseconds duration) {
@@ -39,7 +39,7 @@ bool index::AddZone(uint32_t docID, uint16_t zoneID, std::string_view text,
   return true;
 }
 
-// The zone is stored by now, whatever becomes of the merge; the next zone asks for one again.
+// The zone is already stored when starting the merge fails; the next zone tries again.
 void index::vacuumAfterAdding() {
   try {
     vacuum();
@@ -81,15 +81,15 @@ std::optional<index::Aftermath> index::storeZone(Clock::time_point start, uint32
   return commitZone(start, locked, docID, zoneID, offsets.size());
 }
 
-// False without a read where the answer is known: no document above MaxDocID has text. This spares
-// new documents, nearly all there are, a look-up that misses through every level of the database.
+// Answers without a read where it can: no document above MaxDocID has text. Nearly all documents
+// are new, and a look-up of theirs would miss in every level of the database.
 bool index::mayBeStored(uint32_t docID, uint16_t zoneID) const {
   if (docID == _newestDoc) return holds(_newestZones, zoneID);
   platform::MutexLock lock(_metricsMutex);
   return docID <= metrics.MaxDocID;
 }
 
-// A NUL goes between the older text and the newer, so that no suffix runs from one into the other.
+// Puts a NUL between the old and the new text, so that no suffix runs across.
 index::Stored index::appendToStored(const TextKey& key, std::string_view text,
                                     std::vector<uint32_t>& offsets, bool merge,
                                     std::string* stored) {
@@ -164,13 +164,13 @@ std::optional<index::Aftermath> index::commitZone(Clock::time_point start, Clock
   return aftermath;
 }
 
-// No delay below twice MaxHotSuffixes, from there whole multiples of the time the write lock was
-// held.
+// No delay below twice MaxHotSuffixes; from there on whole multiples of the time that the write
+// lock was held.
 std::chrono::nanoseconds index::throttle(Clock::duration held, MetricsBlock& counters) const {
   const auto hot = static_cast<double>(counters.HotSuffixes);
   const double most = op.MaxHotSuffixes;
   if (!(hot > most * 1.1)) return std::chrono::nanoseconds(0);
-  // Without a limit every suffix counts as one time over.
+  // A limit of 0 counts as 1.
   const auto times = static_cast<uint64_t>(hot / std::max(most, 1.0) - 1.0);
   const std::chrono::nanoseconds delay(static_cast<uint64_t>(held.count()) * times *
                                        op.ThrottleFactor);

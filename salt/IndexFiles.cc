@@ -27,16 +27,16 @@ bool isManifest(std::string_view path) {
 
 }  // namespace
 
-// A table is complete when it is synced: what comes then is the closing.
+// leveldb syncs a table when it is complete and then closes it.
 class IndexFiles::Table final : public leveldb::WritableFile {
  public:
   Table(IndexFiles* files, leveldb::WritableFile* file) : _files(*files), _file(file) {}
 
   leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
-  // leveldb asks for it behind each block, and nobody reads a table before it is complete.
+  // leveldb flushes after each block, but nobody reads a table before it is complete.
   leveldb::Status Flush() override { return {}; }
 
-  // All can be read from here on.
+  // From here on everything can be read.
   leveldb::Status Sync() override {
     _complete = true;
     return _file->Flush();
@@ -50,7 +50,7 @@ class IndexFiles::Table final : public leveldb::WritableFile {
 
  private:
   IndexFiles& _files;
-  std::unique_ptr<leveldb::WritableFile> _file;  // null once it is closed
+  std::unique_ptr<leveldb::WritableFile> _file;  // null after closing
   bool _complete = false;
 };
 
@@ -78,7 +78,7 @@ class IndexFiles::Manifest final : public leveldb::WritableFile {
   }
 
   IndexFiles& _files;
-  const std::shared_ptr<leveldb::WritableFile> _file;  // steps keep it
+  const std::shared_ptr<leveldb::WritableFile> _file;  // shared with the queued steps
 };
 
 class IndexFiles::RecoveredLog final : public leveldb::SequentialFile {
@@ -141,7 +141,8 @@ leveldb::Status IndexFiles::wrap(const std::string& path, leveldb::WritableFile*
   return {};
 }
 
-// leveldb asks again after each compaction for what it finds there and does not need.
+// A failed removal is ignored: after each compaction leveldb removes again whatever it finds and
+// does not need.
 leveldb::Status IndexFiles::RemoveFile(const std::string& path) {
   {
     const platform::MutexLock lock(_mutex);
@@ -177,7 +178,8 @@ leveldb::Status IndexFiles::UnlockFile(leveldb::FileLock* lock) {
 }
 
 void IndexFiles::Schedule(void (*work)(void*), void* argument) {
-  // leveldb holds its mutex here, and the work takes it: it must not run on this thread.
+  // leveldb calls this with its mutex held, and the work takes that mutex, so it must not run on
+  // this thread.
   TL_ASSERT(_work.async([this, work, argument] {
     const platform::CrashNote note(_crashNotes);
     work(argument);

@@ -37,7 +37,7 @@ index::index(Database opened)
       _batch(std::in_place),
       _deleted(std::make_shared<const DocSet>()) {}
 
-// Damage ends the process, but not what a read of sound data may meet.
+// Damaged records end the process; failures of the system to read them do not.
 bool index::readRecords(TLErrorOut error) {
   const auto read = [this, error](const char* key, std::string* bytes) {
     leveldb::Status status = db->Get(leveldb::ReadOptions(), key, bytes);
@@ -217,8 +217,8 @@ bool index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
   return true;
 }
 
-// leveldb does so whenever it has written its memtable. That is all there is to compact behind the
-// last key.
+// leveldb removes obsolete files after each flush of the memtable. A compaction of the range after
+// the last key does nothing else.
 void index::removeObsoleteFiles() const {
   const leveldb::Slice behind("\xFF\xFF", 2);
   (void)_writer.compact(&behind, &behind);
@@ -294,12 +294,12 @@ IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
   }
 }
 
-// A compaction on demand may be the last work for a long time, and removes nothing that a walk
-// reads when it ends. Scans are too short to matter.
+// A compaction on demand, which may be the last work for a long time, does not remove files that an
+// open iterator reads. Scans are too short to matter.
 IndexView::~IndexView() {
   iterators.clear();
   if (options.fill_cache || idx._compactionsEnded == _compactionsEnded) return;
-  // Not here: it takes as long as writing a memtable, and waits for a compaction that runs.
+  // Not on this thread: it takes as long as a memtable flush, and waits for a running compaction.
   (void)idx._tidying.async([&owner = idx] {
     if (!owner.interrupted()) owner.removeObsoleteFiles();
   });

@@ -28,7 +28,7 @@ namespace salt {
 class IndexView;
 class PlaceSet;
 
-// What a scan adds to the metrics.
+// The counts that one scan adds to the metrics.
 struct ScanCounts {
   uint64_t results = 0;
   uint64_t fetches = 0;
@@ -40,29 +40,30 @@ inline constexpr char kDeletedKey[] =
     "\xFF"
     "DELETED";
 
-// Puts the record of the metrics.
+// Adds the metrics record to the batch.
 void putMetrics(const Index::MetricsBlock& metrics, leveldb::WriteBatch* batch);
 
-// 0xFF is the first byte of texts and named keys.
+// 0xFF is the first byte of stored texts and named keys.
 inline constexpr uint8_t kMaxShardNumber = 0xFE;
 
-// The index over a leveldb database. Three locks, taken in this order: the write mutex makes whole
-// calls of AddZone and DeleteDoc follow one another; the commit mutex the writes of batches with
-// metrics, which can wait long for leveldb; the metrics mutex, never held for long, guards the
-// metrics and the taking of a view, so that no scan waits for a write.
+// The index over a leveldb database.
 //
-// What holds at all times: the metrics in the database are those of the same batch as the keys that
-// they count, and those in memory are changed under the commit mutex, but for the counts of scans.
-// A reader's walk and its copy of the metrics are of the same moment, save those of a scan that
-// begins while a batch is written: there the metrics may count what its walk does not see yet. What
-// is deleted later stays visible to a reader.
+// Threads. Three locks, taken in this order: the write mutex serialises AddZone and DeleteDocs; the
+// commit mutex serialises the writes of batches with metrics, which may wait a long time for
+// leveldb; the metrics mutex, held only briefly, guards the metrics and the creation of a view, so
+// that no scan waits for a write.
+//
+// Invariants. The stored metrics always belong to the same batch as the keys they count. Metrics in
+// memory change under the commit mutex, except for the scan counts. A view's iterators and its copy
+// of the metrics are of the same moment, unless the view is taken during a write: then the metrics
+// may already count what the iterators do not see yet. A view does not see later deletions.
 class index final : public Index {
  public:
   explicit index(Database opened);
-  // An index over a database that exists; null, with a log line, when there is none or it is not
-  // sound; the error as of LoadIndex.
+  // Opens the index in an existing database; null, with a log line, when there is none or it is
+  // unsound; sets the error as LoadIndex does.
   [[nodiscard]] static std::unique_ptr<index> load(Database opened, TLErrorOut error = nullptr);
-  // Waits for a merge that runs.
+  // Waits for the running merge.
   ~index() override;
 
   [[nodiscard]] const Options& GetOptions() const override { return op; }
@@ -90,11 +91,11 @@ class index final : public Index {
   void Interrupt() override;
   [[nodiscard]] bool interrupted() const { return _schedule.interrupted(); }
 
-  // Whether ScanPrefixes leaves out what it need not look for.
+  // Whether the Bloom filter of ScanPrefixes is complete.
   [[nodiscard]] bool knowsStarts() const { return _starts.complete(); }
 
-  // The text of Dump, in pieces of some 64 KiB. `sink` returns false to stop. False when it did,
-  // or, with a log line, when reading failed.
+  // The text of Dump in pieces of about 64 KiB. `sink` returns false to stop. False when it did or,
+  // with a log line, when reading failed.
   [[nodiscard]] bool dumpTo(const std::function<bool(std::string_view)>& sink) const;
 
   static TextKey textKey(uint32_t docID, uint16_t zoneID) {
@@ -102,28 +103,26 @@ class index final : public Index {
     return {shard, docID, zoneID};
   }
 
-  // The cut text of a suffix, empty when its zone is not there, or cannot be read, which `readable`
-  // tells, or is too short. It points into `zoneText`, which takes the text of the whole zone.
+  // The truncated text of a suffix; empty when its zone is absent, too short or unreadable
+  // (`readable` is then false). Points into `zoneText`, which receives the text of the zone.
   [[nodiscard]] std::string_view fullText(const SuffixMeta& meta,
                                           const leveldb::ReadOptions& options,
                                           std::string* zoneText, bool* readable) const;
-  // The same, of a zone's text at hand.
+  // The truncated text of a suffix within the given zone text.
   [[nodiscard]] std::string_view suffixText(const SuffixMeta& meta,
                                             std::string_view zoneText) const;
 
-  // One commit of a merge, whole or not at all: writes the batch, with the metrics that it leads
-  // to, and clears it. `pageDelta` is pages written less pages removed. False when it failed, which
-  // is logged.
+  // Commits one batch of a merge atomically, together with the resulting metrics, and clears it.
+  // `pageDelta` is pages written minus pages removed. False, with a log line, on failure.
   [[nodiscard]] bool commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta)
       TL_EXCLUDES(_commitMutex, _metricsMutex);
 
   [[nodiscard]] Activity& scans() const { return _schedule.scans(); }
 
-  // Opens the postings that are beside the database, once it is loaded. Without them all answers
-  // are the same.
+  // Opens the posting list files beside the database after loading. They change the speed of
+  // answers only.
   void openPostings() TL_EXCLUDES(_metricsMutex);
 
-  // The directory of the database.
   [[nodiscard]] const std::string& path() const { return _database.path; }
 
   // See IndexFiles.
@@ -132,7 +131,7 @@ class index final : public Index {
  private:
   using Clock = std::chrono::steady_clock;
 
-  // What AddZone has left to do once the locks are released.
+  // What AddZone still has to do after it has released the locks.
   struct Aftermath {
     bool vacuumDue = false;
     std::chrono::nanoseconds delay{0};
@@ -155,57 +154,56 @@ class index final : public Index {
                                                     Clock::time_point locked, uint32_t docID,
                                                     uint16_t zoneID, size_t suffixes)
       TL_REQUIRES(_writeMutex) TL_EXCLUDES(_commitMutex);
-  // The delay that the counters ask for, which is counted.
+  // The throttling delay, which is also added to the counters.
   [[nodiscard]] std::chrono::nanoseconds throttle(Clock::duration held,
                                                   MetricsBlock& counters) const;
 
   [[nodiscard]] std::shared_ptr<const DocSet> deletedDocs() const TL_EXCLUDES(_metricsMutex);
 
-  // Writes the batch together with the metrics as change(metrics) leaves them, and clears it. After
-  // a failure, which is logged, the metrics are what they were. `movesSuffixes` tells of a batch
-  // after which pages hold what they did not.
+  // Writes the batch together with the metrics after change(metrics), and clears it. A failure is
+  // logged and leaves the metrics unchanged. `movesSuffixes` marks a batch that changes pages.
   template <typename Change>
   [[nodiscard]] bool commit(leveldb::WriteBatch* batch, bool movesSuffixes, const Change& change)
       TL_REQUIRES(_commitMutex) TL_EXCLUDES(_metricsMutex);
   [[nodiscard]] bool write(leveldb::WriteBatch* batch);
-  // All but the counts of scans.
+  // Restores everything except the scan counts.
   void restore(const MetricsBlock& before) TL_REQUIRES(_metricsMutex);
 
   void vacuumAfterAdding();
-  // The shard that the next merge goes into; a new one is counted.
+  // Chooses the shard of the next merge; counts it if it is new.
   [[nodiscard]] uint8_t chooseShard(MetricsBlock& counters) const;
-  // Marks a merge as running and chooses its shard; none when it is not worthwhile, one runs
-  // already, or the mark cannot be written.
+  // Records a merge as running and chooses its shard; nullopt when a merge is not due, is already
+  // running, or cannot be recorded.
   [[nodiscard]] std::optional<uint8_t> beginVacuum() TL_EXCLUDES(_commitMutex, _metricsMutex);
   [[nodiscard]] bool vacuumIsDue() const TL_EXCLUDES(_metricsMutex);
   void startMerge(uint8_t shard) TL_EXCLUDES(_commitMutex);
-  // On the merge thread.
+  // Runs on the merge thread.
   void runMerge(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
   void mergeInto(uint8_t shard) TL_EXCLUDES(_commitMutex, _metricsMutex);
-  // The merge itself, with the postings of its shard; false when it did not come to the end.
-  // Without `hot` only the postings are made.
+  // Merges the hot part into the shard and rebuilds the shard's posting lists; false when it did
+  // not finish. Without `hot` it only builds the posting lists.
   [[nodiscard]] bool mergePages(uint8_t shard, bool hot) TL_EXCLUDES(_commitMutex, _metricsMutex);
-  // Of an index that was merged without them, or whose files were damaged.
+  // Builds posting lists for the shards that have none: never built, or removed as damaged.
   void makeMissingPostings() TL_EXCLUDES(_commitMutex, _metricsMutex);
   void setPostings(uint8_t shard, std::shared_ptr<const Postings> postings)
       TL_EXCLUDES(_metricsMutex);
   [[nodiscard]] PostingsOwner postingsOwner(uint8_t shard) const TL_EXCLUDES(_metricsMutex);
-  // Starts a merge if it is worthwhile and none runs.
+  // Starts a merge if one is due and none is running.
   void vacuum();
   [[nodiscard]] uint64_t hotSuffixes() const TL_EXCLUDES(_metricsMutex);
   [[nodiscard]] uint64_t suffixesPerShard() const TL_EXCLUDES(_metricsMutex);
   void compactPart(uint8_t shard);
-  // The keys from `begin` to `end`; false without room.
+  // Compacts the keys from `begin` to `end`; false when the disk has too little free space.
   bool compactRange(const leveldb::Slice* begin, const leveldb::Slice* end);
   void removeObsoleteFiles() const;
 
-  // Reads options, metrics and the deleted documents; false, with an error, when the system does
-  // not let it. Metrics that are not there stay as they are.
+  // Reads options, metrics and deleted documents. False, with an error, when the system fails to
+  // read. A missing metrics record leaves the metrics unchanged.
   [[nodiscard]] bool readRecords(TLErrorOut error) TL_EXCLUDES(_metricsMutex);
-  // False, with a log line, when the loaded counters cannot be those of a sound index.
+  // False, with a log line, when the loaded counters are inconsistent.
   [[nodiscard]] bool metricsSound() const TL_EXCLUDES(_metricsMutex);
 
-  // Has SuffixStarts walk over what was there before it.
+  // Starts the build of the Bloom filter from the stored texts.
   void learnStarts() const;
   void remember(std::string_view prefix, const IndexView& view, const PlaceSet& pages) const;
   void countScan(Clock::time_point start, const ScanCounts& counts) const
@@ -220,47 +218,48 @@ class index final : public Index {
   mutable BatchWriter _writer;
 
  public:
-  // Fixed from the construction on.
+  // Fixed after construction.
   leveldb::DB* const db;
   Options op;
 
  private:
   mutable platform::Mutex _metricsMutex;
   mutable Metrics metrics TL_GUARDED_BY(_metricsMutex);
-  // A batch is being written that moves suffixes from the hot part into pages.
+  // A batch that moves suffixes from the hot part into pages is being written.
   bool _suffixesMove TL_GUARDED_BY(_metricsMutex) = false;
 
-  // Fair, so that a merge, which comes more seldom, gets its turn.
+  // Fair, so that the merge gets its turn between the writes of ingest.
   mutable platform::FairMutex _commitMutex TL_ACQUIRED_BEFORE(_metricsMutex);
 
   platform::Mutex _writeMutex TL_ACQUIRED_BEFORE(_commitMutex);
-  // Kept for their memory.
+  // Reused to avoid allocation.
   std::optional<leveldb::WriteBatch> _batch TL_GUARDED_BY(_writeMutex);
   std::string _key TL_GUARDED_BY(_writeMutex);
-  // The zones of the document that was above all others when it came, 0 for none.
+  // The newest document and its zones; 0 before the first. Tells without a read what is stored.
   uint32_t _newestDoc TL_GUARDED_BY(_writeMutex) = 0;
   std::vector<uint16_t> _newestZones TL_GUARDED_BY(_writeMutex);
 
-  // Replaced as a whole by each deletion, under both mutexes, so that a view keeps the set of its
-  // moment. A deletion writes the whole set anyway.
+  // Replaced as a whole by each deletion, under both mutexes, so that a view keeps the set it was
+  // taken with. A deletion writes the whole set anyway.
   std::shared_ptr<const DocSet> _deleted TL_GUARDED_BY(_metricsMutex);
 
-  // By shard, null where there are none; replaced as a whole. Those of a shard are taken away
-  // before its pages change.
+  // By shard, null where there are none; replaced as a whole. The posting lists of a shard are
+  // dropped before its pages change.
   using ShardPostings = std::vector<std::shared_ptr<const Postings>>;
   std::shared_ptr<const ShardPostings> _postings TL_GUARDED_BY(_metricsMutex) =
       std::make_shared<const ShardPostings>();
 
-  // Counts what changes the pages or hides documents in them: commits of merges and deletions.
+  // Incremented by every change to pages or to the documents visible in them: merge commits and
+  // deletions.
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
-  mutable ScanMemory _scanMemory;  // synchronised by itself, as are the next
+  mutable ScanMemory _scanMemory;  // thread-safe, as are the next two
   mutable Helper _scanHelper;
   mutable Schedule _schedule;
 
-  std::atomic<uint64_t> _compactionsEnded{0};  // of those on demand
+  std::atomic<uint64_t> _compactionsEnded{0};  // on demand
 
-  mutable SuffixStarts _starts;  // synchronised by itself; its thread reads the index
-  // Removes files behind long walks; last, since it uses all the rest.
+  mutable SuffixStarts _starts;  // thread-safe; its thread reads the index
+  // Removes the files that long reads kept alive; last, because it uses everything above.
   mutable platform::SerialQueue _tidying{"tallow-tidy", platform::QueuePriority::low};
 };
 
@@ -282,29 +281,29 @@ bool index::commit(leveldb::WriteBatch* batch, bool movesSuffixes, const Change&
   return written;
 }
 
-// What every reader works from: one walk over the database or several, the metrics and the set of
-// deleted documents, all of the same moment. One thread, save that each walk may be another's; the
-// index outlives it.
+// The snapshot that every reader works on: one or more iterators, the metrics and the set of
+// deleted documents, all of the same moment. Used by one thread, except that each iterator may be
+// used by another. The index outlives it.
 //
-// The iterator holds the keys of its moment by itself. A leveldb snapshot would, too, but while one
-// lives, a compaction keeps a removed key together with the mark that removes it, and may put the
-// two into neighbouring files of a level; a later compaction of the first file alone then drops the
-// mark (leveldb 1.23 looks for such neighbours in the upper level only), and the removed key is
-// back. Single reads go to the newest state: a stored text only ever grows behind a NUL, so that a
-// suffix reads the same.
+// The iterator alone holds the keys of its moment. A leveldb snapshot would do so too, but while a
+// snapshot exists, a compaction keeps a removed key together with its tombstone and may split the
+// two into neighbouring files of a level. A later compaction of the first file alone then drops the
+// tombstone (leveldb 1.23 looks for such neighbours in the upper level only), and the removed key
+// comes back. Single reads use the newest state; this is safe because a stored text only grows,
+// after a NUL, so every suffix reads the same.
 class IndexView {
  public:
-  // For scans, which fill the block cache: there are `walks` iterators, for as many threads, or one
-  // while suffixes move, since another could be of the moment behind the batch.
-  // With `fillCache` false the reads do not displace the block cache, and the view is of a moment
-  // between batches, for which it waits.
+  // Scans fill the block cache and may have several iterators, one per thread. There is only one
+  // while suffixes move, because a second could be created after the batch and see another state.
+  // With `fillCache` false the reads bypass the block cache, and the constructor waits for a moment
+  // between batches.
   IndexView(const index& owner, bool fillCache, size_t walks = 1);
-  // Files that only a long walk has kept go with it.
+  // Schedules the removal of files that only this view kept alive.
   ~IndexView();
   IndexView(const IndexView&) = delete;
   IndexView& operator=(const IndexView&) = delete;
 
-  // The last shard number to visit; the hot part is 0.
+  // The last shard to visit; the hot part is shard 0.
   [[nodiscard]] uint8_t lastShard() const;
 
   const index& idx;
@@ -313,12 +312,12 @@ class IndexView {
   Index::Metrics metrics;
   std::shared_ptr<const DocSet> deleted;
   std::shared_ptr<const std::vector<std::shared_ptr<const Postings>>> postings;  // by shard
-  uint64_t pageGeneration = 0;  // 0 where it cannot be told
+  uint64_t pageGeneration = 0;                                                   // 0 when unknown
 
  private:
   void take(size_t walks);
 
-  uint64_t _compactionsEnded;  // before; scans do not ask
+  uint64_t _compactionsEnded;  // when the view was taken; unused by scans
   const platform::CrashNote _note;
 };
 

@@ -9,9 +9,9 @@
 
 namespace salt {
 
-// leveldb's bytewise order under its name, so that either opens the other's databases. A quarter of
-// the work on the index is comparing keys, and neighbours share long prefixes: here eight bytes are
-// compared at a time, without a further call.
+// leveldb's bytewise order under the same name, so that either can open the other's databases. A
+// quarter of the work on the index is comparing keys, and neighbouring keys share long prefixes:
+// this compares eight bytes at a time, without a further call.
 class KeyOrder final : public leveldb::Comparator {
  public:
   int Compare(const leveldb::Slice& left, const leveldb::Slice& right) const override {
@@ -38,7 +38,7 @@ class KeyOrder final : public leveldb::Comparator {
   void FindShortSuccessor(std::string* key) const override { _bytewise->FindShortSuccessor(key); }
 
  private:
-  // Of eight bytes, the first counting most.
+  // Eight bytes as a big-endian number.
   static uint64_t word(const char* bytes) {
     uint64_t value = 0;
     std::memcpy(&value, bytes, sizeof value);

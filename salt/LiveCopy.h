@@ -14,19 +14,19 @@
 
 namespace salt {
 
-// A database with the live documents of an index, written in the order of its keys: hot suffixes,
-// pages, texts, records. Each suffix stays in its shard, so that scans give the same in the same
-// order. A page without suffixes of other documents is copied as it is; what others leave is joined
-// to pages that are at least half full, two neighbours taken together.
+// Writes a database with the live documents of an index, in key order: hot suffixes, pages, texts,
+// records. Each suffix stays in its shard, so scans return the same in the same order. A page
+// without suffixes of dead documents is copied unchanged; the remains of other pages are joined
+// into pages that are at least half full, taking two neighbours together.
 //
-// The set of deleted documents is empty in the copy. MaxDocID stays, so that no number is given
-// twice. One thread; the index outlives it and is not changed.
+// The copy has an empty set of deleted documents. MaxDocID is kept, so that no DocID is reused. One
+// thread; the index outlives it and is not changed.
 class LiveCopy {
  public:
   LiveCopy(const index& from, const std::function<bool(uint32_t docID)>& isKept,
            const std::function<void()>& progress);
 
-  // Once. See Inspection::copyLive.
+  // Call it once. See Inspection::copyLive.
   [[nodiscard]] std::optional<uint64_t> write(const std::string& path, TLErrorOut error);
 
  private:
@@ -35,13 +35,14 @@ class LiveCopy {
   }
   void copyHotPart();
   void copyShard(uint8_t shard);
-  // Appends the live suffixes of the cursor's page to _pending, and moves to the next page.
+  // Takes the next `live` suffixes of the cursor, all of its page, and appends those of live
+  // documents to _pending.
   void takePage(size_t live);
   void take(Suffix& suffix);
   void flushPage();
   void putPage(leveldb::Slice key, leveldb::Slice value, size_t suffixes);
   void copyTextsAndRecords();
-  // What is in the batch goes out when it is large enough, or `all`.
+  // Writes the batch if it is large enough, or if `all` is set.
   void commit(bool all);
   [[nodiscard]] leveldb::Iterator& iterator() const { return *_view.iterators.front(); }
 
@@ -51,16 +52,16 @@ class LiveCopy {
   const IndexView _view;
   ZoneTexts _zoneTexts;
   ShardCursor _cursor;
-  Suffix _previous;                  // the latest in _pending
-  std::vector<SuffixMeta> _pending;  // of a page that is begun
+  Suffix _previous;                  // the last one in _pending
+  std::vector<SuffixMeta> _pending;  // of the page under construction
   std::string _key;                  // of that page
   std::string _value;
   std::optional<BatchWriter> _writer;
   leveldb::WriteBatch _batch;
-  leveldb::Status _status;  // of the first write that failed
+  leveldb::Status _status;  // the first failed write
   Index::MetricsBlock _metrics;
   uint64_t _shardSuffixes = 0;
-  uint64_t _left = 0;  // documents left out
+  uint64_t _left = 0;  // number of documents left out
 };
 
 }  // namespace salt

@@ -10,7 +10,7 @@ namespace {
 using Clock = std::chrono::steady_clock;
 
 constexpr uint64_t kMaxUnsynced = 1024 * 1024;  // bytes; more are synced at once
-constexpr std::chrono::seconds kMaxAge{1};      // of a byte that is not on the disk
+constexpr std::chrono::seconds kMaxAge{1};      // of an unsynced byte
 
 }  // namespace
 
@@ -47,7 +47,7 @@ class LogSync::File final : public leveldb::WritableFile {
   LogSync& _owner;
   const std::unique_ptr<leveldb::WritableFile> _file;
   const std::shared_ptr<Log> _log;
-  std::shared_ptr<Log> _previous;  // until it is known to be on the disk
+  std::shared_ptr<Log> _previous;  // until it is known to be on disk
   uint64_t _unflushed = 0;
 };
 
@@ -110,7 +110,7 @@ void LogSync::wrote(const std::shared_ptr<Log>& log, uint64_t bytes) {
   platform::MutexLock lock(_mutex);
   log->written += bytes;
   if (!_scheduled) {
-    // Where no thread can be had the next write tries again.
+    // If no thread is available, the next write tries again.
     _scheduled = _queue.async([this] { syncInBackground(); });
   } else if (log->written - log->synced >= kMaxUnsynced) {
     _changed.notify_all();
@@ -130,7 +130,7 @@ void LogSync::syncInBackground() {
     }
     if (_ending) break;
     if (log->syncing) {
-      _changed.wait(_mutex);  // somebody else's sync ends with a notification
+      _changed.wait(_mutex);  // the sync of another thread ends with a notification
     } else {
       syncOnce(log);
     }

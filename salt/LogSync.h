@@ -11,36 +11,37 @@
 
 namespace salt {
 
-// Brings write-ahead logs to the disk in their order.
+// Brings write-ahead logs to disk in their order.
 //
-// leveldb never syncs a log by itself, and begins a new one whenever a memtable is full. What holds
-// here: nothing is written into a log before the log in front of it is on the disk in full. So at
-// most one log is not, and whatever a loss of power leaves of it, the operations found are the
-// first ones, without a gap.
+// leveldb itself never syncs a log, and starts a new one whenever a memtable is full. The invariant
+// here: nothing is written to a log before the previous log is on disk in full. So at most one log
+// is incomplete, and whatever a power loss leaves of it, the operations recovered are the first
+// ones, without a gap.
 //
-// So that nobody waits long for that, and little is lost when mail stops coming, a log is synced in
-// the background, once a megabyte of it is not on the disk or a second after the first byte that is
-// not.
+// A log is synced in the background once a megabyte of it is unsynced, or a second after its first
+// unsynced byte. So writers do not wait long at a change of logs, and little is lost when mail
+// stops coming.
 //
-// Any thread. After a failed sync every write fails: what the system has dropped of a file does not
-// come back by trying again.
+// Any thread. After a failed sync every write fails: data that the kernel dropped does not come
+// back by trying again.
 class LogSync {
  public:
-  // Opens logs a second time with `files`, which outlives this.
+  // Opens a second handle to each log through `files`, which must outlive this object.
   explicit LogSync(leveldb::Env* files);
-  // Syncs what is written.
+  // Syncs what has been written.
   ~LogSync();
   LogSync(const LogSync&) = delete;
   LogSync& operator=(const LogSync&) = delete;
 
-  // The log `file` at `path`, which leveldb has just opened and writes from now on; takes it.
+  // Takes over the log `file` at `path`, just opened by leveldb, and returns the one to write to.
   [[nodiscard]] leveldb::Status follow(const std::string& path,
                                        std::unique_ptr<leveldb::WritableFile> file,
                                        leveldb::WritableFile** log) TL_EXCLUDES(_mutex);
 
  private:
   class File;
-  // A log as far as syncing goes. The handle is its own, so that a sync runs beside writes.
+  // The sync state of a log. It has its own handle, so that a sync can run concurrently with
+  // writes.
   struct Log {
     std::unique_ptr<leveldb::WritableFile> handle;
     uint64_t written = 0;
@@ -48,11 +49,11 @@ class LogSync {
     bool syncing = false;
   };
 
-  // Waits until all that was written to the log when this was called is on the disk.
+  // Waits until everything written to the log before this call is on disk.
   [[nodiscard]] leveldb::Status settle(const std::shared_ptr<Log>& log) TL_EXCLUDES(_mutex);
   void wrote(const std::shared_ptr<Log>& log, uint64_t bytes) TL_EXCLUDES(_mutex);
   void syncOnce(const std::shared_ptr<Log>& log) TL_REQUIRES(_mutex);
-  // On the queue, until all is on the disk.
+  // Runs on the queue until everything is on disk.
   void syncInBackground() TL_EXCLUDES(_mutex);
 
   leveldb::Env* const _files;

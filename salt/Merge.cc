@@ -41,7 +41,7 @@ bool Merge::run() {
 bool Merge::oldIsNext() {
   if (!_old.valid || !_hot.valid) return _old.valid;
   Suffix& old = _old.suffix;
-  const std::string_view hot = _hot.suffix.knownText();  // all of it
+  const std::string_view hot = _hot.suffix.knownText();  // always the full text
   for (size_t equal = 0;;) {
     const std::string_view known = old.knownText();
     const size_t shorter = std::min(known.size(), hot.size());
@@ -62,7 +62,7 @@ void Merge::takeOld() {
     _oldValue = view(_old.iterator->value());
     --_pageDelta;
   }
-  // Behind its old neighbour a suffix relates as before.
+  // After the same suffix as before, its common prefix and extra bytes stay valid.
   take(&_old, _lastFromHot || pageBegins);
   _lastFromHot = false;
   _tookOld = true;
@@ -122,8 +122,8 @@ void Merge::flushPage(size_t count) {
   std::rotate(_pendingTexts.begin(), _pendingTexts.begin() + taken, _pendingTexts.end());
 }
 
-// The first page since an old one began is to take its place, and mostly has its key; if its value,
-// too, then there is nothing to write.
+// The first new page written after an old one begins replaces it, mostly with the same key. If the
+// value is the same too, there is nothing to write.
 void Merge::putPage() {
   const bool replaces = !_oldKey.empty();
   if (replaces && _oldKey != _key) _batch.Delete(_oldKey);
@@ -131,7 +131,7 @@ void Merge::putPage() {
   _oldKey.clear();
 }
 
-// A rest too long for one page becomes two of about the same size.
+// A remainder too long for one page becomes two of about the same size.
 void Merge::commit(bool final) {
   if (!_old.iterator->status().ok() || !_hot.iterator->status().ok()) _failed = true;
   if (_failed) return;

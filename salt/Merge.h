@@ -14,24 +14,24 @@
 
 namespace salt {
 
-// Merges the hot part, as it is when the merge is made, into one shard: two sorted walks become one
-// run of new pages. One thread; the index outlives it.
+// Merges the hot part, as of construction, into one shard: two sorted inputs become one sorted run
+// of new pages. One thread; the index outlives it.
 //
-// What holds over a crash: a batch is written only when every suffix taken so far is in a page of
-// it or of one before, and every old page that it removes has been taken in full. So each suffix is
-// at any moment either hot or in one page, and the metrics of the same batch say so. Within a batch
-// an old page is removed before a new one is put that may have its key.
+// Crash safety: a batch is written only when every suffix taken so far is in a page of this batch
+// or an earlier one, and every old page that it removes has been taken completely. So each suffix
+// is always either hot or in exactly one page, as the metrics of the same batch say. Within a batch
+// an old page is deleted before a new one is put, which may have the same key.
 class Merge {
  public:
-  // Without `hot` nothing is merged, and no page changes: the shard is gone through for its
-  // postings.
+  // Without `hot` nothing is merged and no page changes; the shard is only read for its posting
+  // lists.
   Merge(index& owner, uint8_t shard, bool hot = true);
 
-  // To the end, or to the first read or write that fails, or an interruption of the index; what was
-  // committed until then stays. False when it did not come to the end.
+  // Runs to the end, or to the first failed read or write or an interruption of the index; what was
+  // committed before stays. False when it did not reach the end.
   [[nodiscard]] bool run();
 
-  // After a run to the end: the bytes of the shard's new postings, empty for none.
+  // The bytes of the shard's new posting list file, empty for none. Call it after a complete run.
   [[nodiscard]] std::string postings(const PostingsOwner& owner);
 
  private:
@@ -42,18 +42,19 @@ class Merge {
   // Appends the cursor's suffix to the pending ones.
   void take(ShardCursor* cursor, bool relateToPrevious);
 
-  // The first bytes of the latest one taken, which has that many.
+  // The first bytes of the text of the last suffix taken, which must be long enough.
   [[nodiscard]] std::string_view previousText(size_t bytes);
 
   [[nodiscard]] std::string_view firstText();
 
-  // Puts the first `count` pending suffixes into a page.
+  // Writes the first `count` pending suffixes as a page.
   void flushPage(size_t count);
 
-  // Writes the page of _key and _value, and removes the old page that it replaces.
+  // Adds the page of _key and _value to the batch, and the deletion of the old page that it
+  // replaces.
   void putPage();
 
-  // Puts all that is pending into pages, and writes the batch if it is large enough or the last.
+  // Writes all pending suffixes as pages, and the batch if it is large enough or `final` is set.
   void commit(bool final);
 
   index& _idx;
@@ -65,12 +66,12 @@ class Merge {
   leveldb::WriteBatch _batch;
   ShardCursor _old;
   ShardCursor _hot;
-  Suffix _previous;  // the latest one taken
-  Suffix _first;     // of a page
+  Suffix _previous;  // the last suffix taken
+  Suffix _first;     // the first suffix of a page
   PostingsBuilder _postings;
   std::vector<SuffixMeta> _pending;
-  std::vector<std::string> _pendingTexts;  // of each, in full, or empty where it would be a read
-  uint64_t _hotMerged = 0;                 // since the latest commit, like _pageDelta
+  std::vector<std::string> _pendingTexts;  // full text of each, or empty where that needs a read
+  uint64_t _hotMerged = 0;                 // since the last commit, like _pageDelta
   int64_t _pageDelta = 0;
   const bool _withHot;
   bool _failed = false;
@@ -79,7 +80,7 @@ class Merge {
   bool _lastFromHot = false;
   std::string _key;
   std::string _value;
-  std::string _oldKey;  // of the old page begun since the latest flush, or empty
+  std::string _oldKey;  // of the old page begun since the last flush, or empty
   std::string _oldValue;
 };
 

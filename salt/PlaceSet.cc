@@ -8,7 +8,7 @@ namespace salt {
 
 namespace {
 
-// Gathers documents into runs.
+// Delivers documents in batches.
 class Runs {
  public:
   Runs(const std::vector<uint16_t>& zones, const PlacesCallback& callback)
@@ -77,7 +77,7 @@ void PlaceSet::Adder::addOneByOne(const DocZones& doc) {
   }
 }
 
-// Number of zones, the zones, then for each document its distance from the one before and its mask.
+// Number of zones, the zones, then for each document the delta of its DocID and its mask.
 std::string PlaceSet::encode() const {
   std::string out;
   if (!_others.empty()) return out;

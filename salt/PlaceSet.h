@@ -13,8 +13,8 @@
 
 namespace salt {
 
-// The different places among those of many suffixes, and how many suffixes there were. A mail has
-// some ten zones, so that a document's are the bits of a number. One thread.
+// The distinct places of many suffixes, and the number of suffixes. A mail has about ten zones, so
+// the zones of a document are stored as the bits of one number. One thread.
 class PlaceSet {
  public:
   void add(const Place& place) {
@@ -27,10 +27,11 @@ class PlaceSet {
     }
   }
 
-  // Both are of different suffixes.
+  // The two sets must not count the same suffix.
   void add(PlaceSet&& other);
 
-  // Adds documents with zones of one list. How many suffixes that are is told by itself.
+  // Adds documents whose zone bits index one list. Their suffixes are counted separately, by
+  // addSuffixes.
   class Adder {
    public:
     Adder(PlaceSet* set, const std::vector<uint16_t>& zones);
@@ -48,19 +49,20 @@ class PlaceSet {
 
     PlaceSet& _set;
     const std::vector<uint16_t>& _zones;
-    std::optional<ZoneMaskMap> _bits;  // none where the set has no bit for one of them
+    std::optional<ZoneMaskMap> _bits;  // nullopt when the set has no bit left for one of them
   };
   void addSuffixes(uint64_t count) { _suffixes += count; }
 
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
 
-  // The places in few bytes, documents in order; nothing when there are more zones than bits.
+  // The places in compact form, documents in ascending order; empty when there are more zones than
+  // bits.
   [[nodiscard]] std::string encode() const;
 
-  // Hands all places over, those of zones without a bit as often as they were added.
+  // Delivers all places; those in zones without a bit as often as they were added.
   void deliver(const PlacesCallback& callback) const;
 
-  // The same for the places of an encoded set.
+  // Delivers the places of an encoded set.
   static void deliver(std::string_view encoded, const PlacesCallback& callback);
 
  private:
@@ -70,7 +72,7 @@ class PlaceSet {
     const uint32_t bit = zoneID < _bits.size() ? _bits[zoneID] : 0;
     return bit != 0 ? bit : newBit(zoneID);
   }
-  // 0 when there is none left.
+  // Assigns a bit to the zone; 0 when none is left.
   uint32_t newBit(uint16_t zoneID);
 
   uint64_t _suffixes = 0;

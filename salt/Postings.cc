@@ -26,19 +26,19 @@ struct Header {
   uint32_t entries = 0;
   uint32_t shard = 0;
   uint32_t reserved = 0;
-  uint64_t sum = 0;  // of the header with 0 here, and the table
+  uint64_t sum = 0;  // of the header with 0 in this field, and the table
 };
 static_assert(sizeof(Header) == 48);
 
 constexpr size_t kMaxZones = 32;
-constexpr size_t kSumBytes = 4;  // in front of each list
+constexpr size_t kSumBytes = 4;  // before each list
 constexpr uint32_t kMostTableBytes = uint32_t{1} << 28;
 constexpr uint32_t kMostStep = uint32_t{1} << 30;
 constexpr uint64_t kLeastBudget = 64 * 1024;
-// A suffix takes some eleven bytes of the index, so that this is a twentieth.
+// A suffix takes about eleven bytes of the index, so this limits posting lists to a twentieth.
 constexpr uint64_t kSuffixesPerByte = 2;
 
-// Against accidents, not against a forger.
+// Detects accidental damage, not forgery.
 uint64_t sumOf(std::string_view bytes, uint64_t seed = 0) {
   constexpr uint64_t kFactor = UINT64_C(0x9E3779B97F4A7C15);
   uint64_t sum = seed ^ (bytes.size() * kFactor);
@@ -60,7 +60,7 @@ void appendVarint(std::string* out, uint32_t value) {
   out->append(bytes, static_cast<size_t>(putVarint(bytes, value) - bytes));
 }
 
-// Reads bytes that may be anything: what does not fit leaves `good` false and gives 0.
+// Reads untrusted bytes: invalid input clears `good` and yields 0.
 class Input {
  public:
   explicit Input(std::string_view bytes) : _bytes(bytes) {}
@@ -184,8 +184,8 @@ const Postings::Entry* Postings::find(std::string_view prefix) const {
   return found ? &*entry : nullptr;
 }
 
-// A list: for each document its distance from the one before, times 4; plus 1 where the mask of its
-// zones, else the one before's, and plus 2 where the number of its suffixes, else 1, follows.
+// A list has for each document: its DocID delta times 4, plus 1 if its zone mask follows (else it
+// has the mask of the previous one), plus 2 if its number of suffixes follows (else 1).
 bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* places) const {
   const Entry* const entry = find(prefix);
   if (entry == nullptr) return false;
@@ -219,7 +219,7 @@ bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* pla
   return input.good;
 }
 
-// --- Making
+// --- Building
 
 uint32_t PostingsBuilder::bitOf(uint16_t zoneID) {
   for (size_t i = 0; i < _zones.size(); ++i) {
@@ -245,7 +245,7 @@ void PostingsBuilder::count(Node* node, size_t end) {
 }
 
 void PostingsBuilder::fold() {
-  size_t end = _pending.size() - 1;  // a node may begin with the latest
+  size_t end = _pending.size() - 1;  // a node may begin with the last suffix
   for (Node& node : _open) {
     if (suffixesOf(node) >= _least) continue;
     end = std::min(end, node.begin);

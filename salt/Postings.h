@@ -14,15 +14,16 @@
 #include "salt/DocSet.h"
 #include "salt/PlaceSet.h"
 
-// For the prefixes that many suffixes of a shard begin with: the documents, with zones and numbers
-// of suffixes. A scan for such a prefix reads this instead of the pages. Derived from the pages and
-// never needed: without it, or where it cannot be read, the pages are walked.
+// Posting lists for the prefixes that many suffixes of a shard begin with: the documents, with
+// their zones and number of suffixes. A scan for such a prefix reads the list instead of the pages.
+// Posting lists are derived from the pages and optional: when a list is absent or unreadable, the
+// scan reads the pages.
 //
-// Suffixes in order make a tree of the prefixes that they share. An entry is a node of this tree:
-// all prefixes of its text that are longer than the text of the node above have the same suffixes.
+// Sorted suffixes form a tree of shared prefixes. An entry is a node of this tree: all prefixes of
+// its text that are longer than the text of the parent node have the same suffixes.
 namespace salt {
 
-// What a file of postings belongs to; one of anything else is not read.
+// Identifies the shard that a posting list file belongs to; a file of any other is not read.
 struct PostingsOwner {
   int64_t indexCreated = 0;  // Metrics::CreationTime
   uint8_t shard = 0;
@@ -30,67 +31,68 @@ struct PostingsOwner {
   bool operator==(const PostingsOwner&) const = default;
 };
 
-// Where the postings of a shard are, in the directory of the index. FORMAT.md has the bytes.
+// The path of a shard's posting list file in the index directory. FORMAT.md has the bytes.
 [[nodiscard]] std::string postingsPath(const std::string& directory, uint8_t shard);
 
-// Removes the file and waits until that is on the disk, so that what comes after cannot be there
-// with it. False when that failed: then the pages must not change.
+// Removes the file and syncs the directory, so that no later change can reach the disk with the
+// file still there. On failure, false, the pages must not change.
 [[nodiscard]] bool removePostings(const std::string& directory, uint8_t shard);
 
-// The postings of one shard, as they are in a file. Never changes; any thread.
+// The posting lists of one shard, read from its file. Immutable; any thread.
 class Postings {
  public:
-  // Null when there is none. One that is damaged, or not this owner's, is removed, with a log line.
+  // Null when there is no file. A damaged file, or one of another owner, is removed with a log
+  // line.
   [[nodiscard]] static std::shared_ptr<const Postings> open(const std::string& directory,
                                                             const PostingsOwner& owner);
 
-  // Adds the places of all suffixes that begin with `prefix`, but those of documents in `deleted`.
-  // False when they are not here, or cannot be read, which is logged: then nothing is added.
+  // Adds the places of all suffixes that begin with `prefix`, except those of documents in
+  // `deleted`. False, adding nothing, when there is no list or, with a log line, it cannot be read.
   [[nodiscard]] bool add(std::string_view prefix, const DocSet& deleted, PlaceSet* places) const;
 
  private:
   struct Entry {
-    uint32_t text;    // where it begins in _texts
+    uint32_t text;    // offset in _texts
     uint8_t length;   // of the text
-    uint8_t above;    // length of the text of the node above
+    uint8_t above;    // text length of the parent node
     uint32_t offset;  // of the list in the file
     uint32_t bytes;   // of the list
   };
 
   explicit Postings(platform::FileDescriptor file) : _file(std::move(file)) {}
 
-  // Reads all but the lists; false when they are not as they should be.
+  // Reads everything except the lists; false when the file is invalid.
   [[nodiscard]] bool readTable(const PostingsOwner& owner);
   [[nodiscard]] std::string_view textOf(const Entry& entry) const {
     return std::string_view(_texts).substr(entry.text, entry.length);
   }
-  // Null where the prefix has none.
+  // Null when the prefix has no entry.
   [[nodiscard]] const Entry* find(std::string_view prefix) const;
 
   const platform::FileDescriptor _file;
   std::string _texts;
-  std::vector<uint16_t> _zones;  // by bit of a mask
-  std::vector<Entry> _entries;   // in the order of their texts
+  std::vector<uint16_t> _zones;  // by bit of a zone mask
+  std::vector<Entry> _entries;   // in text order
 };
 
-// Makes a file of postings from the suffixes of a shard, in their order. One thread.
+// Builds the posting list file of a shard from its suffixes in order. One thread.
 //
-// The nodes that the latest suffix is in are open, from the root inwards (the stack of the LCP
-// intervals of Abouelhoda, Kurtz and Ohlebusch, 2004). A node ends with the first suffix that
-// shares less than its text.
+// The nodes that contain the last suffix are open, from the root inwards (the stack of LCP
+// intervals of Abouelhoda, Kurtz and Ohlebusch, 2004). A node ends at the first suffix that shares
+// less than the node's text.
 //
-// Memory: the places of the latest 260,000 suffixes, the documents of open nodes with more than
-// those, and twice the size of the result.
+// Memory: the places of the last 260,000 suffixes, the documents of open nodes with more suffixes
+// than that, and twice the size of the result.
 class PostingsBuilder {
  public:
-  // `fullShard` is MaxShardSuffixes. An entry has a 500th of that, 2,000 of a million: fewer
-  // suffixes are walked as fast.
+  // `fullShard` is MaxShardSuffixes. Only prefixes with at least a 500th of that many suffixes,
+  // 2,000 of a million, get an entry: scanning fewer from the pages is as fast.
   explicit PostingsBuilder(uint64_t fullShard)
       : _least(std::max<uint64_t>(kLeast, fullShard / 500)),
         _mostPending(std::clamp<uint64_t>(fullShard / 4, 64, uint64_t{1} << 18)) {}
 
-  // Takes the next suffix, which shares `lcp` bytes with the one before. Where that ends a node
-  // with many suffixes, `textBefore(n)` gives the first n bytes of the suffix before.
+  // Takes the next suffix, which shares `lcp` bytes with the previous one. Where that ends a node
+  // with many suffixes, `textBefore(n)` is asked for the first n bytes of the previous suffix.
   template <typename Text>
   void take(size_t lcp, const Place& place, const Text& textBefore) {
     close(lcp, textBefore);
@@ -99,7 +101,7 @@ class PostingsBuilder {
     if (_pending.size() >= _mostPending) fold();
   }
 
-  // The bytes of the file, behind the last suffix; empty without entries.
+  // The bytes of the file after the last suffix; empty when there is no entry.
   template <typename Text>
   [[nodiscard]] std::string finish(const PostingsOwner& owner, const Text& textBefore) {
     close(0, textBefore);
@@ -114,8 +116,8 @@ class PostingsBuilder {
     uint32_t suffixes = 0;
   };
   struct Node {
-    size_t depth = 0;      // length of the text that its suffixes share
-    size_t begin = 0;      // of those of its suffixes in _pending that are not in `counts`
+    size_t depth = 0;      // length of the text shared by its suffixes
+    size_t begin = 0;      // index in _pending of its first suffix not yet in `counts`
     uint64_t counted = 0;  // suffixes in `counts`
     std::unique_ptr<DocPages<Counts>> counts;
   };
@@ -126,10 +128,11 @@ class PostingsBuilder {
     std::string list;
   };
 
-  // Ends the nodes with longer texts than `lcp`, and opens one of that length if there is none.
+  // Ends the nodes whose texts are longer than `lcp`, and opens one of that length if there is
+  // none.
   template <typename Text>
   void close(size_t lcp, const Text& textBefore) {
-    // It begins with the suffix before, or with all of the last node that ends.
+    // A new node begins with the previous suffix, or with all suffixes of the last node ended.
     Node next;
     next.begin = _pending.empty() ? 0 : _pending.size() - 1;
     while (!_open.empty() && _open.back().depth > lcp) {
@@ -148,13 +151,14 @@ class PostingsBuilder {
     return node.counted + _pending.size() - node.begin;
   }
   void make(Node* node, std::string text, size_t above);
-  // Has the node's suffixes in _pending before `end` in its counts.
+  // Adds the node's suffixes in _pending before `end` to its counts.
   void count(Node* node, size_t end);
-  // Has the large open nodes count what is pending, and drops what no other needs.
+  // Adds the pending suffixes to the counts of the large open nodes, and drops those that no other
+  // node needs.
   void fold();
   [[nodiscard]] uint32_t bitOf(uint16_t zoneID);
 
-  // Leaves out the entries with the fewest suffixes until the lists take `mostBytes` at most.
+  // Drops the entries with the fewest suffixes until the lists take at most `mostBytes`.
   void prune(uint64_t mostBytes);
   [[nodiscard]] uint64_t budget() const;
   [[nodiscard]] std::string file(const PostingsOwner& owner);
@@ -167,7 +171,7 @@ class PostingsBuilder {
   std::vector<Made> _made;
   uint64_t _madeBytes = 0;
   std::vector<uint16_t> _zones;  // by bit
-  bool _unfit = false;           // for the format: more than 32 zones, or huge document numbers
+  bool _unfit = false;  // the format cannot hold it: more than 32 zones, or DocIDs too far apart
 };
 
 }  // namespace salt

@@ -8,35 +8,35 @@
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
 
-// Looks for many prefixes at once.
+// Probes for many prefixes at once.
 namespace salt {
 
 namespace {
 
-// As for a scan for places.
+// The threads of a probe, as for ScanPlaces.
 constexpr size_t kWalks = 2;
-constexpr unsigned kFewShards = 2;  // are not worth waking a thread
+constexpr unsigned kFewShards = 2;  // not worth waking a thread
 
-// A suffix that begins with the prefix of that number.
+// A suffix that begins with the prefix of this index.
 struct Find {
   size_t prefix;
   SuffixMeta meta;
 };
 
-// Goes through a shard from prefix to prefix in their order. Between what one prefix found and the
-// next thing in the shard there is nothing: prefixes that fall in there need no look, which most of
-// a word's neighbours do.
+// Goes through a shard in the order of the prefixes. There is nothing in the shard between the last
+// match of one prefix and the next suffix, so prefixes that fall in between need no look. Most
+// neighbours of a word do.
 class PrefixProbe {
  public:
-  // The prefixes are cut, in order and all different. `walk` is the number of the view's iterator.
+  // The prefixes are truncated, sorted and distinct. `walk` is the index of the view's iterator.
   PrefixProbe(const IndexView& view, const std::vector<std::string_view>& prefixes, size_t limit,
               size_t walk)
       : _view(view), _prefixes(prefixes), _limit(limit), _cursor(view, 0, nullptr, walk) {}
 
-  // Adds the first `limit` finds of each prefix, by prefix. False when a read failed.
+  // Appends the first `limit` suffixes of each prefix. False, with a log line, when a read failed.
   bool visit(unsigned shard, std::vector<Find>* found) {
     _cursor.moveTo(static_cast<uint8_t>(shard));
-    bool passed = false;  // the cursor stands behind matches of the prefix before
+    bool passed = false;  // the cursor stands after matches of the previous prefix
     for (size_t i = 0; i < _prefixes.size(); ++i) {
       if (i == 0 || (passed && _prefixes[i].starts_with(_prefixes[i - 1]))) {
         _cursor.seek(_prefixes[i]);
@@ -55,8 +55,8 @@ class PrefixProbe {
   ScanCounts counts;
 
  private:
-  // From a place that is not behind the first suffix wanted: a step to the next page costs much
-  // less than a seek.
+  // Moves on from a position at or before the first match: stepping to the next page is much
+  // cheaper than a seek.
   void moveOnTo(std::string_view prefix) {
     const auto before = [&] {
       return _cursor.valid && _cursor.suffix.compareWithPrefix(prefix) < 0;
@@ -68,7 +68,7 @@ class PrefixProbe {
     }
   }
 
-  // Takes matches up to the limit; true when the cursor has moved.
+  // Collects matches up to the limit; true when the cursor has moved.
   bool collect(size_t prefix, std::vector<Find>* found) {
     bool moved = false;
     for (size_t taken = 0; taken < _limit && matches(_prefixes[prefix]); _cursor.next()) {
@@ -90,7 +90,7 @@ class PrefixProbe {
   ShardCursor _cursor;
 };
 
-// The first finds of all shards, of `prefixes` prefixes.
+// Merges the results of all shards, in shard order, for `prefixes` prefixes.
 std::vector<std::vector<SuffixMeta>> firstOfEach(const std::vector<std::vector<Find>>& byShard,
                                                  size_t prefixes, size_t limit) {
   std::vector<std::vector<SuffixMeta>> first(prefixes);

@@ -31,7 +31,7 @@ bool hasCrashedTwice(const std::string& path) {
 }
 
 std::vector<std::string> indexesSetAside(const std::string& path) {
-  const size_t slash = path.rfind('/') + 1;  // 0 where there is none
+  const size_t slash = path.rfind('/') + 1;  // 0 without a slash
   const std::string directory = slash == 0 ? "." : path.substr(0, slash);
   const std::string begin = path.substr(slash) + ".damaged-";
   std::vector<std::string> found;
@@ -45,7 +45,7 @@ std::vector<std::string> indexesSetAside(const std::string& path) {
 std::optional<std::string> setAside(const std::string& path, TLErrorOut error) {
   std::string aside =
       fmt::format("{}.damaged-{:%Y%m%dT%H%M%SZ}", path, fmt::gmtime(std::time(nullptr)));
-  // Where the process ended after the renaming the last time, only the notes are left to remove.
+  // If the process ended right after the rename last time, only the notes are left to remove.
   if (platform::fileExists(path)) {
     for (const std::string& earlier : indexesSetAside(path)) platform::removeItem(earlier, nullptr);
     if (std::rename(path.c_str(), aside.c_str()) != 0) {

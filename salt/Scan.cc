@@ -7,25 +7,25 @@
 #include "salt/PlaceSet.h"
 #include "salt/Suffix.h"
 
-// The reading half of the index.
+// Prefix scans and iteration over stored texts.
 namespace salt {
 
 namespace {
 
-// One walk through shards for one prefix, cut already.
+// Scans the hot part and the shards for one prefix, which is truncated already.
 class PrefixScan {
  public:
   PrefixScan(const IndexView& view, std::string_view prefix, size_t walk = 0)
       : _view(view), _prefix(prefix), _cursor(view, 0, nullptr, walk) {}
 
-  // Calls `callback` for each suffix, until it returns false or a read fails.
+  // Calls `callback` for each suffix until it returns false or a read fails.
   void suffixes(const std::function<bool(const SuffixMeta&)>& callback) {
     for (unsigned shard = 0; shard <= _view.lastShard(); ++shard) {
       if (!visitShard(shard, [&] { return visitSuffixes(callback); })) return;
     }
   }
 
-  // Both are false when a read has failed, which ends the scan.
+  // False when a read has failed, which ends the scan.
   bool hotPlaces(PlaceSet* places) {
     return visitShard(0, [&] { return visitHotPlaces(places); });
   }
@@ -36,8 +36,8 @@ class PrefixScan {
   ScanCounts counts;
 
  private:
-  // Calls visit() with the cursor on the first suffix from the prefix on. False when that returns
-  // false or a read fails.
+  // Calls visit() with the cursor at the first suffix not less than the prefix. False when that
+  // returns false or a read fails.
   template <typename Visit>
   bool visitShard(unsigned shard, const Visit& visit) {
     _cursor.moveTo(static_cast<uint8_t>(shard));
@@ -66,9 +66,9 @@ class PrefixScan {
     return true;
   }
 
-  // Within a page a suffix matches as long as it shares the whole prefix with the one before. When
-  // the next page begins with a match, all of this one are matches, and most of its columns need no
-  // look.
+  // Within a page a suffix matches as long as it shares the whole prefix with the previous one. If
+  // the next page begins with a match, the rest of this page matches, and most of its columns need
+  // not be read.
   bool visitPagePlaces(PlaceSet* places) {
     if (!matches()) return true;
     bool more = addMatches(_cursor.pos, places) && nextPageMatches();
@@ -87,8 +87,8 @@ class PrefixScan {
     return true;
   }
 
-  // Adds the cursor's suffixes from `first`, which matches, to the last that does. True when that
-  // is the last of the page.
+  // Adds the cursor's suffixes from `first`, a match, to the last match. True when that is the last
+  // suffix of the page.
   bool addMatches(size_t first, PlaceSet* places) {
     const std::vector<SuffixMeta>& metas = _cursor.metas;
     size_t at = first;
@@ -106,7 +106,7 @@ class PrefixScan {
 
   bool matches() { return _cursor.valid && _cursor.suffix.compareWithPrefix(_prefix) == 0; }
 
-  // Steps the iterator, and the iterator alone.
+  // Moves the iterator only; the cursor's suffix stays.
   bool nextPageMatches() {
     leveldb::Iterator& iterator = *_cursor.iterator;
     iterator.Next();
@@ -123,12 +123,12 @@ class PrefixScan {
   std::string _page;
 };
 
-// Walks through the pages of a scan at a time: a device has more processors, but while it searches
-// it indexes, too, and shows what it has found.
+// Threads of one scan through the pages. A device has more processors, but during a search it also
+// indexes, and displays what was found.
 constexpr size_t kPageWalks = 2;
-constexpr unsigned kFewShards = 2;  // are not worth waking a thread
+constexpr unsigned kFewShards = 2;  // not worth waking a thread
 
-// What a scan for places has found.
+// The result of a scan for places.
 struct FoundPlaces {
   PlaceSet hot;
   PlaceSet pages;
@@ -145,8 +145,8 @@ struct FoundPlaces {
   }
 };
 
-// The walks of one scan through the shards, the hot part first. Each takes one shard after the
-// other of those that none has taken yet.
+// The parallel parts of one scan, hot part first. Each part takes the next shard that none has
+// taken.
 class PlacesScan {
  public:
   PlacesScan(const IndexView& view, std::string_view prefix, bool withPages)
@@ -154,7 +154,7 @@ class PlacesScan {
 
   [[nodiscard]] unsigned shards() const { return _last + 1; }
 
-  // On a thread of its own, each.
+  // Each part runs on a thread of its own.
   void walk(size_t number) {
     const platform::CrashNote note(_view.idx.crashNotes());
     FoundPlaces& found = _found[number];

@@ -11,11 +11,12 @@
 
 namespace salt {
 
-// What scans have found in the pages, by prefix. While somebody types, the words before the last
-// are scanned for again with each letter, and so are single letters and the most common words by
-// everybody. Pages change with merges only, which give them another generation.
+// An LRU cache of what scans found in the pages, by prefix. While a user types, the words before
+// the last are scanned again with each letter, and single letters and the most common words are
+// scanned by everybody. Each change to the pages or to the deleted documents starts a new
+// generation.
 //
-// Memory: kMostBytes; what was not asked for the longest goes first. Any thread.
+// Memory: kMostBytes. Any thread.
 class ScanMemory {
  public:
   struct Found {
@@ -23,11 +24,11 @@ class ScanMemory {
     std::string places;     // see PlaceSet::encode
   };
 
-  // Null when it is not known for this generation.
+  // Null when the prefix is not cached for this generation.
   [[nodiscard]] std::shared_ptr<const Found> find(std::string_view prefix, uint64_t generation)
       TL_EXCLUDES(_mutex);
 
-  // Nothing of an older generation than the latest is kept.
+  // Ignored unless `generation` is the latest.
   void keep(std::string_view prefix, uint64_t generation, std::shared_ptr<const Found> found)
       TL_EXCLUDES(_mutex);
 
@@ -41,15 +42,15 @@ class ScanMemory {
   using Entries = std::list<Entry>;
 
   static constexpr size_t kMostBytes = 16 * 1024 * 1024;
-  static constexpr size_t kOverhead = 256;  // list, table and allocator, roughly
+  static constexpr size_t kOverhead = 256;  // approximate: list, table and allocator
 
-  // False when the generation is gone already.
+  // Drops all entries if the generation is newer; false if it is older.
   bool enter(uint64_t generation) TL_REQUIRES(_mutex);
 
   platform::Mutex _mutex;
   uint64_t _generation TL_GUARDED_BY(_mutex) = 0;
   size_t _bytes TL_GUARDED_BY(_mutex) = 0;
-  Entries _entries TL_GUARDED_BY(_mutex);  // asked for last first
+  Entries _entries TL_GUARDED_BY(_mutex);  // most recently used first
   std::unordered_map<std::string_view, Entries::iterator> _byPrefix TL_GUARDED_BY(_mutex);
 };
 

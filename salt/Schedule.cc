@@ -15,12 +15,13 @@ using std::chrono::milliseconds;
 using std::chrono::nanoseconds;
 using std::chrono::seconds;
 
-// What a merge waits for, in multiples of MaxHotSuffixes and as a share of its shard.
+// The size that the hot part should reach before a merge: a share of its shard, within multiples of
+// MaxHotSuffixes.
 constexpr uint64_t kLeastWorthwhile = 2;
 constexpr uint64_t kMostWorthwhile = 8;
 constexpr uint64_t kShardPart = 2;
-constexpr uint32_t kSmallHotPart = 100000;  // below this there is nothing to gain
-// Mail pours in while so many suffixes come in each interval: some 25 mails.
+constexpr uint32_t kSmallHotPart = 100000;  // below this waiting gains nothing
+// Mail pours in while each interval brings at least this many suffixes, those of about 25 mails.
 constexpr milliseconds kInterval{250};
 constexpr uint64_t kPouring = 10000;
 constexpr seconds kLongestWaitForMore{60};
@@ -29,7 +30,7 @@ constexpr seconds kLongestWaitForHousekeeping{10};
 
 constexpr int kWaitOverComputing = 3;
 constexpr milliseconds kMostCredit{100};
-constexpr milliseconds kLeastCredit{2};  // waking up costs, too
+constexpr milliseconds kLeastCredit{2};  // waking up has a cost too
 
 }  // namespace
 

@@ -15,13 +15,11 @@ namespace saltsearch {
 
 namespace {
 
-// How many required terms are scanned for ahead of the others, which bounds the memory for their
-// matches.
+// Bounds the memory for matches: how many required terms are scanned before the others.
 constexpr size_t kMaxTermsAhead = 8;
 
-// One search. Where terms are required they are scanned for first: only documents that all of them
-// match can be in the result, so that the others, which are mostly many more, are passed over by
-// whatever comes after.
+// One search. Required terms are scanned first: only documents that match all of them can be
+// results, so the scans of the other terms skip all other documents, usually the great majority.
 class Searching {
  public:
   Searching(const salt::Index& index, std::vector<Term>& terms, const Options& options)
@@ -80,14 +78,14 @@ class Searching {
     _matches[u].reset();
   }
 
-  // Whether no document is left, and this term adds none.
+  // Whether no candidate is left and this term adds none.
   [[nodiscard]] bool nothingCanChange(size_t u) const {
     if (_selective && _docs.empty()) return true;
     return _evaluation.admitsNobody(u) &&
            std::none_of(_docs.begin(), _docs.end(), [](const Standing& doc) { return doc.in; });
   }
 
-  // Adds the documents of the matches that were not added before.
+  // Adds the documents of the matches that are not yet in _docs.
   void admit(const TermMatches& matches) {
     matches.forEach([this](uint32_t docID, uint32_t) {
       if (!std::exchange(_admitted[docID], true)) _docs.push_back({docID});
@@ -98,10 +96,10 @@ class Searching {
   std::vector<Term>& _terms;
   const Options& _options;
   const Evaluation _evaluation;
-  std::vector<std::optional<TermMatches>> _matches;  // of terms that are not evaluated yet
+  std::vector<std::optional<TermMatches>> _matches;  // of terms not yet evaluated
   std::vector<Standing> _docs;
-  salt::DocPages<bool> _admitted;  // those in _docs
-  bool _selective = false;         // no other document can be in the result
+  salt::DocPages<bool> _admitted;  // documents in _docs
+  bool _selective = false;         // only admitted documents can be results
 };
 
 bool ranksAbove(const DocResult& left, const DocResult& right) {
@@ -112,7 +110,7 @@ std::vector<DocResult> topDocs(const std::vector<Standing>& docs, const Searchin
                                size_t maxResults) {
   std::vector<DocResult> heap;
   if (maxResults == 0) return heap;
-  // The larger documents first: of equal scores those that come later are not taken.
+  // Largest DocID first, so that ties are decided by the order of arrival.
   for (auto standing = docs.rbegin(); standing != docs.rend(); ++standing) {
     if (!searching.accepts(*standing)) continue;
     DocResult doc;

@@ -11,13 +11,13 @@
 
 #include "salt/Index.h"
 
-// Options, metrics and suffix records as bytes and as text.
+// Options, metrics and suffix metadata as bytes and as text.
 namespace salt {
 
 using OptionsBlock = Index::OptionsBlock;
 using MetricsBlock = Index::MetricsBlock;
 
-// The blocks go to the stream as they stand in memory.
+// The blocks are written as they are in memory.
 static_assert(std::endian::native == std::endian::little);
 static_assert(sizeof(OptionsBlock) == 40 && offsetof(OptionsBlock, MaxZoneSize) == 4 &&
               offsetof(OptionsBlock, CompactAfterVacuum) == 24 &&
@@ -32,7 +32,7 @@ void writeBlock(std::ostream& stream, const Block& block) {
   stream.write(reinterpret_cast<const char*>(&block), sizeof block);
 }
 
-// Reads a block whose bytes at `flags` are booleans: any value but 0 is true.
+// Reads a block. The bytes at `flags` are booleans: any value but 0 is true.
 template <typename Block, size_t count>
 bool readBlock(std::istream& stream, const size_t (&flags)[count], Block* block) {
   char bytes[sizeof(Block)];
@@ -44,7 +44,7 @@ bool readBlock(std::istream& stream, const size_t (&flags)[count], Block* block)
   return true;
 }
 
-// Reads `size` bytes in pieces, so that a corrupt length costs no more memory than there is input.
+// Reads `size` bytes in pieces, so that a corrupt length takes no more memory than there is input.
 bool readText(std::istream& stream, uint64_t size, std::string* text) {
   char piece[4096];
   while (size > 0) {

@@ -9,8 +9,9 @@
 
 namespace salt {
 
-// The few texts that a walk completes are scattered: their blocks would displace those of the walk,
-// which the next token, often a longer or shorter form of this one, goes through again.
+// Reads bypass the block cache: the few texts that a scan completes are scattered, and their blocks
+// would evict those of the scan, which the next token, often a longer or shorter form of this one,
+// needs again.
 Suffix::Suffix(const index& owner, ZoneTexts* zoneTexts)
     : idx(owner),
       options(readOptions(false)),
@@ -69,7 +70,7 @@ void Suffix::fetch() {
     text = idx.fullText(meta, options, &_zoneText, &readable);
   }
   full = true;
-  if (!readable) return;  // by the system: what is known has to do
+  if (!readable) return;  // by a failure of the system: make do with the known part
   TL_ASSERT(text.size() >= size);
   std::memcpy(_text.get() + size, text.data() + size, text.size() - size);
   size = text.size();
@@ -145,7 +146,7 @@ void ShardCursor::seek(std::string_view prefix) {
     load();
     return;
   }
-  // The wanted suffix may lie inside the page before the one found.
+  // The wanted suffix may be inside the page before the one found.
   if (iterator->Valid()) {
     iterator->Prev();
   } else {

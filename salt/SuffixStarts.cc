@@ -28,7 +28,7 @@ void SuffixStarts::beginWith(Walk walk) {
   try {
     _thread = std::thread(body);
   } catch (const std::system_error&) {
-    // Until then a look at the index tells.
+    // Until a later call succeeds, every prefix may be present.
   }
 }
 

@@ -14,36 +14,39 @@
 
 namespace salt {
 
-// With which bytes suffixes begin, as bits in a table of hashes (a Bloom filter with one function):
-// tells of most prefixes that nothing begins with them, without a look at the index. Bits are never
-// taken back, for merges change no suffix, and a deleted one costs a look in vain.
+// A Bloom filter with one hash function over the first bytes of all suffixes: for most prefixes
+// that no suffix begins with, it says so without a look at the index. Bits are never cleared:
+// merges change no suffix, and a deleted suffix costs only an unnecessary look.
 //
-// What is added to the index is entered as it comes; what was there before, once somebody asks, by
-// a walk over the stored texts on a thread of its own. Until that has ended, everything may be
-// there. It enters all places of a text, since which of them begin suffixes only the pages know.
-// Among a hundred thousand mails some ten percent of the bits are set.
+// Suffixes added to the index are entered as they come. Those that were there before are entered by
+// a scan over the stored texts on a thread of its own, which the first query starts; until it ends,
+// every prefix may be present. The scan enters every position of a text, because only the pages
+// know which positions begin a suffix. With a hundred thousand mails about ten percent of the bits
+// are set.
 //
-// Any thread. Whoever adds calls `add` before the suffix can be read.
+// Any thread. `add` must be called before the suffix becomes readable.
 class SuffixStarts {
  public:
-  // Calls its argument for each stored text until that returns false; true when all were read.
+  // Calls its argument for each stored text until that returns false; returns true when all were
+  // read.
   using Walk = std::function<bool(const std::function<bool(std::string_view text)>&)>;
 
   SuffixStarts() : _bits(static_cast<uint64_t*>(std::calloc(kBits / 64, sizeof(uint64_t)))) {
     if (_bits == nullptr) throw std::bad_alloc();
   }
-  // Ends a walk that runs.
+  // Stops the scan if it is running.
   ~SuffixStarts();
   SuffixStarts(const SuffixStarts&) = delete;
   SuffixStarts& operator=(const SuffixStarts&) = delete;
 
-  // There was nothing before.
+  // The index was empty when opened.
   void beginEmpty() { _complete = true; }
-  // Starts the walk, once; later where the system has no thread to give now.
+  // Starts the scan unless it has started; a later call tries again if the system could not create
+  // a thread.
   void beginWith(Walk walk) TL_EXCLUDES(_mutex);
   [[nodiscard]] bool complete() const { return _complete; }
 
-  // A suffix begins where `text` does; it may end sooner.
+  // A suffix begins with `text`; it may end sooner.
   void add(std::string_view text) {
     if (text.size() < kBytes) return;
     const uint64_t hash = hashOf(text.data());
@@ -63,7 +66,7 @@ class SuffixStarts {
   }
 
  private:
-  static constexpr size_t kBytes = 5;  // of a suffix; fewer tell too little, more fill the table
+  static constexpr size_t kBytes = 5;  // of a suffix; fewer are too unspecific, more fill the table
   static constexpr unsigned kLogBits = 24;
   static constexpr size_t kBits = size_t{1} << kLogBits;  // 2 MiB
 
@@ -76,12 +79,12 @@ class SuffixStarts {
   struct Free {
     void operator()(uint64_t* bits) const { std::free(bits); }
   };
-  // Pages of it come into being with their first bit: of an index that nobody uses there are none.
+  // The kernel allocates its pages at the first bit, so an unused index costs no memory.
   const std::unique_ptr<uint64_t, Free> _bits;
   std::atomic<bool> _complete{false};
   std::atomic<bool> _ending{false};
   platform::Mutex _mutex;
-  std::thread _thread TL_GUARDED_BY(_mutex);  // of the walk
+  std::thread _thread TL_GUARDED_BY(_mutex);  // runs the scan
 };
 
 }  // namespace salt

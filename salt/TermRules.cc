@@ -55,7 +55,7 @@ ZoneBits::ZoneBits(const std::vector<uint16_t>& zones) {
   if (zones.empty()) _others = 1;
   for (size_t i = 0; i < zones.size(); ++i) {
     const uint32_t bit = uint32_t{1} << i;
-    if (zones[i] == 0) _others = bit;  // the last entry of this kind stands for all not listed
+    if (zones[i] == 0) _others = bit;  // the last such entry stands for all zones not listed
     if (zones[i] >= _bits.size()) _bits.resize(zones[i] + size_t{1});
     if (_bits[zones[i]] == 0) _bits[zones[i]] = bit;
   }
@@ -72,8 +72,8 @@ double zoneFactor(const Term& term, uint32_t zoneMask) {
 
 namespace {
 
-// Whether a document that this token is the first to match stays below the threshold, even if later
-// tokens raise its score.
+// Whether a document that this token is the first to match stays below the threshold, even if a
+// later token of the term raises its score.
 bool refusesNewDocs(const Term& term, size_t token, double unmatched, double zoneBound,
                     double need) {
   double best = term.tokenScores[token];
@@ -84,8 +84,7 @@ bool refusesNewDocs(const Term& term, size_t token, double unmatched, double zon
   return unmatched * best * zoneBound < need;
 }
 
-// Whether scores are products of finite numbers that are not negative: then one factor of 0 makes
-// the product 0.
+// Whether all scores are finite and not negative: then a factor of 0 makes a product 0.
 bool zeroEndsAll(const std::vector<Term>& terms, double any) {
   const auto fits = [](double value) { return value >= 0 && std::isfinite(value); };
   double most = 1;

@@ -6,22 +6,22 @@
 
 #include "salt/Search.h"
 
-// What the fields of terms mean to the score of a document: for all who evaluate queries.
+// How the fields of terms determine a document's score, shared by all evaluators of queries.
 namespace saltsearch {
 
-// False, with a log line, for a term that is passed over.
+// False, with a log line, for a term that is skipped.
 [[nodiscard]] bool wellFormed(const Term& term);
 
-// What the terms from one on can still multiply a document's score by, computed from the last term
-// back. It is what lets a search drop documents early.
+// Upper bounds of what the terms from one on can multiply a score by, computed from the last term
+// backwards. They let a search drop documents early.
 struct Bounds {
-  std::vector<double> zone;     // of one term: sum of its zone weights, at most 1
-  std::vector<double> matched;  // highest product if at least one of the terms really matches
+  std::vector<double> zone;     // for one term: sum of its zone weights, at most 1
+  std::vector<double> matched;  // highest product when at least one of the terms matches
   std::vector<double> any;      // highest product
 };
 [[nodiscard]] Bounds boundsOf(const std::vector<Term>& terms);
 
-// The bit in a zone mask that a match in a zone sets, 0 when it does not count.
+// Maps a zone to its bit in a zone mask, 0 when a match there does not count.
 class ZoneBits {
  public:
   explicit ZoneBits(const std::vector<uint16_t>& zones);
@@ -36,34 +36,33 @@ class ZoneBits {
   uint32_t _others = 0;
 };
 
-// The summed weights, at most 1.0, of the term's zones in the mask.
+// The summed weights of the term's zones in the mask, at most 1.0.
 [[nodiscard]] double zoneFactor(const Term& term, uint32_t zoneMask);
 
 // The state of one document during a search.
 struct Standing {
   uint32_t docID = 0;
-  bool in = false;   // among the candidates
-  double score = 0;  // so far, while it is in
+  bool in = false;   // is a candidate
+  double score = 0;  // so far, while it is a candidate
 };
 
-// How a search takes a document through its terms, one after the other: a document becomes a
-// candidate with the first term that matches it, and is dropped when no later term can raise it to
-// the threshold. The result for one document does not depend on any other. The terms and options
-// outlive it.
+// Takes documents through the terms one after another. A document becomes a candidate with the
+// first term that matches it, and is dropped when no later term can raise it to the threshold.
+// Results for one document do not depend on any other. The terms and options outlive it.
 class Evaluation {
  public:
   Evaluation(const std::vector<Term>& terms, const Options& options);
 
-  // A malformed term, which is passed over.
+  // Whether term u is malformed and skipped.
   [[nodiscard]] bool skips(size_t u) const { return _steps[u].skipped; }
 
-  // Whether term u makes no document a candidate that is not one already.
+  // Whether term u cannot make any document a candidate.
   [[nodiscard]] bool admitsNobody(size_t u) const { return _steps[u].admitsNobody; }
 
-  // Whether a document that term u does not match cannot be in the result: the term is required.
+  // Whether term u is required: a document that it does not match cannot be a result.
   [[nodiscard]] bool demandsMatch(size_t u) const { return _steps[u].required; }
 
-  // Takes documents through term u. maskOf(token, i) is the zone mask of the token's match in
+  // Applies term u to the documents. maskOf(token, i) is the zone mask of the token's match in
   // docs[i], 0 for none.
   template <typename MaskOf>
   void apply(size_t u, const MaskOf& maskOf, std::vector<Standing>& docs) const {
@@ -99,9 +98,10 @@ class Evaluation {
     bool required = false;
     bool prunes = false;
     bool admitsNobody = false;
-    std::vector<bool> refuses;  // by token: a document that it is the first to match stays out
-    double unmatched = 1;       // score, so far, of documents that no term has matched
-    double need = 0;            // running score below which no later term brings a document up
+    std::vector<bool>
+        refuses;           // by token: a document that it matches first cannot reach the threshold
+    double unmatched = 1;  // score so far of a document that no term has matched
+    double need = 0;       // a lower score cannot reach the threshold with the later terms
   };
 
   static void take(const Step& step, const Term& term, size_t token, uint32_t mask,

@@ -11,9 +11,9 @@ namespace {
 
 constexpr size_t kLeastCandidates = 100;  // keeps the summary meaningful for a small k
 
-// Tokens with their weights, in a hash table with linear probing. A slot has the upper half of the
-// hash beside the place of its token, so that a look-up of another token mostly ends within the
-// slots, which stay in the processor's cache.
+// Tokens with weights in a hash table with linear probing. A slot holds the upper half of the hash
+// beside the index of its entry, so a look-up of an absent token mostly ends within the slots,
+// which stay in the processor's cache.
 class TokenWeights {
  public:
   struct Entry {
@@ -27,7 +27,7 @@ class TokenWeights {
   [[nodiscard]] size_t size() const { return _entries.size(); }
   [[nodiscard]] std::vector<Entry>& entries() { return _entries; }
 
-  // Adds to the weight of a token that is there. False when it is not.
+  // Adds to the weight of a present token; false when it is absent.
   bool add(std::string_view token, double weight) {
     Slot* const slot = slotOf(token, hashOf(token));
     if (slot->place == 0) return false;
@@ -45,8 +45,8 @@ class TokenWeights {
     _entries[slot->place - 1].weight += weight;
   }
 
-  // Takes the weight of the token at place `kept` from all, and drops what is not above it; of
-  // those equal to it, as many stay as it takes to keep `kept`.
+  // Subtracts the weight of the token at rank `kept` from all, and drops what is then not above 0;
+  // of those at 0, as many stay as it takes to keep `kept`.
   void cut(size_t kept) {
     _weights.clear();
     for (const Entry& entry : _entries) _weights.push_back(entry.weight);
@@ -69,13 +69,13 @@ class TokenWeights {
  private:
   struct Slot {
     uint32_t tag = 0;
-    uint32_t place = 0;  // in _entries, from 1; 0 for a free slot
+    uint32_t place = 0;  // index in _entries plus 1; 0 for a free slot
   };
 
   static size_t hashOf(std::string_view token) { return std::hash<std::string_view>()(token); }
   static uint32_t upper(size_t hash) { return static_cast<uint32_t>(hash >> 32); }
 
-  // The slot that has the token, or the free one where it would go.
+  // The slot that holds the token, or the free slot where it belongs.
   Slot* slotOf(std::string_view token, size_t hash) {
     const size_t mask = _slots.size() - 1;
     for (size_t at = hash & mask;; at = (at + 1) & mask) {
@@ -87,10 +87,10 @@ class TokenWeights {
 
   std::vector<Slot> _slots;
   std::vector<Entry> _entries;
-  std::vector<double> _weights;  // kept for its memory
+  std::vector<double> _weights;  // reused to avoid allocation
 };
 
-// One pass: hands each token of each zone to `visit` together with its weight.
+// One pass: calls `visit` with each token of each zone and its weight.
 template <typename Visit>
 void forEachToken(const salt::Index& index, const ZoneScore& zoneScore,
                   const TokenStarts& tokenizer, const std::function<bool()>& goOn,

@@ -7,7 +7,8 @@
 #include "salt/IndexImpl.h"
 #include "salt/Merge.h"
 
-// Moving the hot part into shards: when, where to, and on which thread.
+// Decides when to merge the hot part, and into which shard; runs the merge and the compactions
+// after it.
 namespace salt {
 
 namespace {
@@ -49,7 +50,7 @@ bool index::vacuumIsDue() const {
   return !metrics.VacuumInProgress && metrics.HotSuffixes >= op.MaxHotSuffixes / 2;
 }
 
-// The newest until it is full, then a new one; when all are there, they take turns.
+// The newest shard until it is full, then a new one; once all MaxShards exist, in turn.
 uint8_t index::chooseShard(MetricsBlock& counters) const {
   if (counters.Shards == 0 || counters.LastShardSuffixes >= op.MaxShardSuffixes) {
     if (counters.Shards >= std::min<uint64_t>(op.MaxShards, kMaxShardNumber)) {
@@ -106,8 +107,9 @@ void index::mergeInto(uint8_t shard) {
   finish(metrics);
 }
 
-// Postings must never be those of other pages, whatever is left by a loss of power. So the old ones
-// are gone from the disk before a page changes, and the pages are on it before the new ones are.
+// Posting lists must never be found with other pages than their own, even after a power loss. So
+// the old file is gone from disk before a page changes, and the pages are on disk before the new
+// file is.
 bool index::mergePages(uint8_t shard, bool hot) {
   setPostings(shard, nullptr);
   if (!removePostings(_database.path, shard)) return false;
@@ -125,7 +127,7 @@ bool index::mergePages(uint8_t shard, bool hot) {
   return true;
 }
 
-// Counts as a merge meanwhile, so that no other changes the pages.
+// Sets VacuumInProgress meanwhile, so that no merge changes the pages.
 void index::makeMissingPostings() {
   uint64_t shards = 0;
   std::shared_ptr<const ShardPostings> present;
@@ -155,14 +157,14 @@ uint64_t index::suffixesPerShard() const {
   return inShards / std::max<uint64_t>(metrics.Shards, 1);
 }
 
-// A merge leaves a mark for each suffix that was hot, and a seek walks over them up to the next
-// suffix that lives. leveldb drops marks as they move down, but not above the few hot suffixes that
-// it once got into a level deep down, and those stay there. With nothing hot left, the marks and
-// what they remove come to nothing; while much is added there would always be something.
+// A merge leaves a tombstone for each suffix that was hot, and a seek iterates over them up to the
+// next live suffix. leveldb drops tombstones as they move down, but not those above the few hot
+// suffixes that once reached a deep level, and they stay there. With nothing hot left, compacting
+// the part drops all tombstones and what they delete; during ingest something would always be left.
 //
-// Nor may new pages stay where mail passes on its way down. leveldb cuts its files by size alone: a
-// file of the last hot suffixes and the first texts spans all shards, and is merged with all of
-// their pages in the next level.
+// New pages must not stay in levels that ingest passes through either. leveldb splits its files by
+// size alone: a file with the last hot suffixes and the first texts spans all shards, and is then
+// merged with all of their pages in the next level.
 void index::compactPart(uint8_t shard) {
   if (interrupted()) return;
   const char first = static_cast<char>(shard);

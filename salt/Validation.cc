@@ -7,7 +7,7 @@
 #include "salt/Suffix.h"
 #include "salt/ZoneTexts.h"
 
-// Walks of the whole index: one that checks what a merge promises, one that prints.
+// Full reads of the index: one checks the invariants of a merge, one prints.
 namespace salt {
 
 namespace {
@@ -15,8 +15,8 @@ namespace {
 constexpr size_t kDumpedTextBytes = 16;
 constexpr size_t kDumpPieceBytes = 64 * 1024;
 
-// What is wrong with `text` and its place after `previous`, or null. A suffix that its page derives
-// from the one before must also have the right common prefix and extra bytes.
+// The fault in `text` or in its order after `previous`, or null. A suffix that its page derives
+// from the previous one must also have the right common prefix and extra bytes.
 const char* fault(std::string_view previous, const SuffixMeta& previousMeta, std::string_view text,
                   const SuffixMeta& meta, bool derived) {
   const int order = text.compare(previous);
@@ -37,14 +37,14 @@ const char* fault(std::string_view previous, const SuffixMeta& previousMeta, std
   return nullptr;
 }
 
-// False, with a log line, when a walk ended for an error.
+// False, with a log line, when the iteration ended with an error.
 bool readInFull(const ShardCursor& cursor) {
   const leveldb::Status status = cursor.iterator->status();
   if (!status.ok()) Log.error("Error scanning index: {}", status.ToString());
   return status.ok();
 }
 
-// Counts the suffixes of the cursor's shard into `total`; false, with a log line, at a fault.
+// Adds the number of suffixes in the cursor's shard to `total`; false, with a log line, at a fault.
 bool shardSound(ShardCursor* cursor, uint64_t* total) {
   std::string previous;
   SuffixMeta previousMeta;

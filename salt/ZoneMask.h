@@ -6,11 +6,11 @@
 
 namespace salt {
 
-// Turns masks of the zones of one list into masks of something else. Neighbouring documents mostly
-// match in the same zones, so that the latest answer is kept. One thread.
+// Translates zone masks over one list into other masks. Neighbouring documents mostly match in the
+// same zones, so the last result is cached. One thread.
 class ZoneMaskMap {
  public:
-  // bitOf(zone) is what a zone stands for: a bit, several or none.
+  // bitOf(zone) is the mask that stands for a zone: one bit, several or none.
   template <typename BitOf>
   ZoneMaskMap(const std::vector<uint16_t>& zones, const BitOf& bitOf) {
     for (const uint16_t zone : zones) _bits.push_back(bitOf(zone));

@@ -82,7 +82,7 @@ void ZoneTexts::keepRead() {
   }
 }
 
-// A disk that is full or fails: what is in the file is not needed.
+// When the disk is full or fails, the texts in the file are not needed: the database has them.
 void ZoneTexts::forget() {
   _kept.clear();
   _file.reset();

@@ -17,30 +17,30 @@ namespace salt {
 
 class index;
 
-// The texts of suffixes, for walks that complete very many of them. The suffixes of a shard come
-// from few documents, again and again, and to read one from the database is to decompress the whole
-// zone. So each text that was read once is kept, as it is, in a file without a name beside the
-// database; the system has it in memory as far as there is memory to spare. Documents of
-// neighbouring numbers mostly share a shard: a read from the database goes on for a stretch.
+// A cache of zone texts for operations that complete very many suffixes. The suffixes of a shard
+// come from few documents, again and again, and reading one from the database decompresses the
+// whole zone. So each text read is kept uncompressed in an unnamed temporary file beside the
+// database, which the kernel caches as far as memory allows. Documents with neighbouring numbers
+// mostly share a shard, so a read from the database reads ahead.
 //
-// Disk: a quarter of what is free and kMostFileBytes at most; then the file begins anew. Memory:
-// some 60 bytes for each zone in the file. Where there can be no file, or it fails, each text is
-// read from the database. One thread. The index outlives it.
+// Disk: a quarter of the free space, at most kMostFileBytes; then the file starts over. Memory:
+// about 60 bytes for each cached zone. When the file cannot be created or used, each text is read
+// from the database. One thread. The index outlives it.
 class ZoneTexts {
  public:
   static constexpr uint64_t kMostFileBytes = uint64_t{1} << 30;
 
   explicit ZoneTexts(const index& owner, uint64_t mostFileBytes = kMostFileBytes);
 
-  // The cut text of a suffix, empty when there is none. Lives until the next call.
+  // The truncated text of a suffix, empty when absent. Valid until the next call.
   [[nodiscard]] std::string_view find(const SuffixMeta& meta);
 
-  // False once a read from the database has failed, which looks like a text that is not there.
+  // False after a failed read from the database, for which find() returns an empty text.
   [[nodiscard]] bool good() const { return _iterator->status().ok(); }
 
  private:
   struct Stretch {
-    uint64_t begin;  // in the file
+    uint64_t begin;  // offset in the file
     uint32_t bytes;
   };
 
@@ -49,7 +49,7 @@ class ZoneTexts {
   // False when the file cannot be read.
   [[nodiscard]] bool readKept(const Stretch& stretch, const SuffixMeta& meta);
   void readStored(const SuffixMeta& meta);
-  // Adds the zone that the iterator stands on to what keepRead writes.
+  // Adds the zone at the iterator to the texts that keepRead writes.
   void addRead(uint64_t id);
   void keepRead();
   void forget();
@@ -60,8 +60,8 @@ class ZoneTexts {
   uint64_t _mostFileBytes = 0;
   uint64_t _fileBytes = 0;
   std::unordered_map<uint64_t, Stretch> _kept;
-  std::string _read;    // texts that are to be written at _fileBytes
-  std::string _suffix;  // of the latest call
+  std::string _read;    // texts to be written at _fileBytes
+  std::string _suffix;  // of the last call
 };
 
 }  // namespace salt

@@ -4,7 +4,8 @@
 
 namespace {
 
-// Written with blanks between the words, or cut by a dictionary of ICU (ja, km, lo, my, th, zh).
+// Languages written with spaces between words, or split by an ICU dictionary (ja, km, lo, my, th,
+// zh).
 constexpr std::array kLanguages = {
     "af", "ar", "az", "be", "bg", "bn", "bs", "ca", "cs", "cy", "da", "de", "el", "en",
     "eo", "es", "et", "eu", "fa", "fi", "fr", "ga", "gl", "gu", "he", "hi", "hr", "hu",

@@ -8,7 +8,7 @@
 
 namespace {
 
-// Lower case may be longer; by how much, ICU tells at the first try.
+// Lower case may be longer; ICU returns the required length at the first attempt.
 TLString lowered(TLStringView text) {
   const auto length = static_cast<int32_t>(text.size());
   TLString out(text.size(), u'\0');

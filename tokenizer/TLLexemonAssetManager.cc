@@ -11,7 +11,7 @@ constexpr platform::Log kLog(platform::kSubsystem, "TLLexemonAssetManager");
 constexpr const char* kDefaultLocale = "en_US";
 constexpr const char* kDefaultLanguage = "en";
 
-// Now plus the timeout, at the latest the end of the clock.
+// The current time plus the timeout, clamped to the end of the clock.
 std::chrono::steady_clock::time_point deadlineAfter(uint64_t nanoseconds) {
   using Clock = std::chrono::steady_clock;
   const auto now = Clock::now();

@@ -8,8 +8,8 @@
 #include "platform/Locale.h"
 #include "tokenizer/LexemonAssets.h"
 
-// Decides whether a language can be served, and remembers the answers: a language moves once from
-// unknown to supported or unsupported, and stays there for the life of the manager. Timeouts are in
+// Decides whether a language is supported and caches the answers: a language changes once from
+// unknown to supported or unsupported, for the lifetime of the manager. Timeouts are in
 // nanoseconds.
 //
 // Threads: no lock; one thread at a time.
@@ -18,11 +18,11 @@ class TLLexemonAssetManager {
   // `assets` must outlive the manager.
   explicit TLLexemonAssetManager(LexemonAssets& assets);
 
-  // The shared manager, over the service of the system.
+  // The shared manager, over the system's service.
   [[nodiscard]] static TLLexemonAssetManager& getObject();
 
-  // Registers the data of a language that is not embedded with the library. A timeout of 0 leaves
-  // missing data to a fetch in the background, which serves the next process.
+  // Registers data of a language that is not embedded with the library. With a timeout of 0,
+  // missing data is downloaded in the background for the next process.
   [[nodiscard]] bool isLanguageSupported(const std::string& language, uint64_t downloadTimeout);
 
   [[nodiscard]] std::optional<std::string> assetPathForLanguage(const std::string& language);
@@ -35,18 +35,18 @@ class TLLexemonAssetManager {
   std::set<std::string> _unsupportedLang;
 };
 
-// Identifier and language code of the platform's locale, "en_US" and "en" without one. Read once;
+// Identifier and language code of the platform's locale; "en_US" and "en" without one. Read once;
 // any thread.
 [[nodiscard]] const std::string& userLocale();
 [[nodiscard]] const std::string& userLanguage();
 
-// The locale to make tokenizers for: userLocale where its language is supported, else "en_US".
-// Decided once; any thread.
+// The locale for tokenizers: userLocale if its language is supported, otherwise "en_US". Decided
+// once; any thread.
 [[nodiscard]] const std::string& bestLexemonLocale();
 
 namespace tokenizer {
 
-// The rules behind the three functions above.
+// The functions above for a given locale and manager.
 [[nodiscard]] std::string userLocaleFrom(const std::optional<platform::Locale>& locale);
 [[nodiscard]] std::string userLanguageFrom(const std::optional<platform::Locale>& locale);
 [[nodiscard]] std::string bestLexemonLocaleFrom(const std::string& userLocale,

@@ -29,7 +29,7 @@ void appendWord(TLStringView word, std::string& out, std::vector<uint32_t>& offs
   out.push_back(' ');
 }
 
-// The library's objects of one locale. The constructor throws where the library refuses it.
+// The library's objects for one locale. The constructor throws if the library rejects it.
 struct Library {
   explicit Library(const std::string& name)
       : factory(std::make_unique<DefaultAnalyzerFactory>(

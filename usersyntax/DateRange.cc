@@ -86,7 +86,7 @@ std::optional<DateRange> dayBack(std::string_view text, const CalendarFields& to
       return daysFrom(today.year, today.month, today.day - *count * kDaysPerWeek, 1);
     case 'm':
     case 'y': {
-      // A day that the month lacks is its last one.
+      // If the month has no such day, its last day.
       const int32_t index = today.year * 12 + today.month - 1 - months;
       if (index < 12) return std::nullopt;
       const int32_t year = index / 12;

@@ -19,7 +19,7 @@ bool isBlank(char c) {
   return c == ' ' || (c >= '\t' && c <= '\r');
 }
 
-// Letters of any script: no ASCII byte but a letter.
+// Letters of any script; of ASCII, only letters.
 bool isName(std::string_view text) {
   return !text.empty() && std::all_of(text.begin(), text.end(), [](char c) {
     return static_cast<unsigned char>(c) >= 0x80 || (c >= 'a' && c <= 'z') ||
@@ -60,7 +60,7 @@ class Lexer {
     _tokens.push_back(std::move(token));
   }
 
-  // A known name, a colon and a value.
+  // Reads a known name, a colon and a value.
   void readField(Token& token) {
     const size_t length = _text.substr(_at, kMaxNameBytes + 1).find(':');
     if (length == std::string_view::npos || !isName(_text.substr(_at, length))) return;
@@ -115,7 +115,7 @@ class Lexer {
     _at = end + 1;
   }
 
-  // Up to a space, or the parenthesis that closes the group around it.
+  // Reads up to a space, or to the parenthesis that closes the enclosing group.
   void readWord(Token& token) {
     const size_t begin = _at;
     size_t inner = 0;
@@ -153,7 +153,7 @@ void makeWord(Token& token) {
   token.connective = Connective::none;
 }
 
-// Makes words of the parentheses without partner, around nothing, and too deep.
+// Turns parentheses that are unmatched, empty or nested too deeply into words.
 void balance(std::vector<Token>& tokens, std::vector<std::string>& remarks) {
   std::vector<size_t> open;
   const auto refuse = [&](size_t i, const char* why) {
@@ -189,7 +189,7 @@ bool endsOperand(const Token& token) {
   return token.type == Type::word || token.type == Type::phrase || token.type == Type::close;
 }
 
-// Makes words of the connectives without operands.
+// Turns connectives without operands into words.
 void checkConnectives(std::vector<Token>& tokens, std::vector<std::string>& remarks) {
   const auto refuse = [&](Token& token) {
     remarks.push_back(

@@ -11,7 +11,7 @@ namespace usersyntax {
 
 namespace {
 
-// The first row of each value has its English name. Names are as `folded` makes them.
+// The first row of each value has its English name. Names are in the form that `folded` produces.
 struct FieldName {
   std::string_view name;
   Field field;
@@ -37,7 +37,7 @@ constexpr FieldName kFields[] = {
     {"after", Field::after},
     {"larger", Field::larger},
     {"smaller", Field::smaller},
-    // Other words for them.
+    // Synonyms.
     {"author", Field::from},
     {"in", Field::folder},
     {"file", Field::attachment},
@@ -63,7 +63,7 @@ constexpr FieldName kFields[] = {
     {"grosser", Field::larger},
     {"groesser", Field::larger},
     {"kleiner", Field::smaller},
-    // French, and Spanish where the word is the same
+    // French, and Spanish if the word is the same
     {"de", Field::from},
     {"a", Field::to},
     {"copie", Field::cc},

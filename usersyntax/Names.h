@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-// The names of fields, their values and connectives, in several languages.
+// Names of fields, values and connectives in several languages.
 namespace usersyntax {
 
 enum class Field {
@@ -13,7 +13,7 @@ enum class Field {
   to,
   cc,
   bcc,
-  with,  // any of the four before
+  with,  // any of the four above
   subject,
   body,
   attachment,
@@ -21,7 +21,7 @@ enum class Field {
   list,
   id,
   type,
-  // Those below do not hold text.
+  // The following do not contain text.
   is,
   has,
   date,
@@ -35,18 +35,18 @@ enum class Flag { read, unread, flagged, replied, junk, hasAttachment };
 
 enum class Connective { none, conjunction, disjunction, negation };
 
-// The name may be in any case, with or without accents.
+// Ignores case and accents.
 [[nodiscard]] std::optional<Field> fieldNamed(std::string_view name);
-// Of is: and has:.
+// For is: and has:.
 [[nodiscard]] std::optional<Flag> flagNamed(Field field, std::string_view name);
-// In capitals only: small letters make a word of the text.
+// In capitals only; in small letters it is an ordinary word.
 [[nodiscard]] Connective connectiveNamed(std::string_view word);
 
-// The English names, as they are printed.
+// The English name, as printed.
 [[nodiscard]] std::string_view nameOf(Field field);
 [[nodiscard]] std::string_view nameOf(Flag flag);
 
-// Case and accents taken off, for comparing names.
+// Removes case and accents, for comparing names.
 [[nodiscard]] std::string folded(std::string_view text);
 
 }  // namespace usersyntax

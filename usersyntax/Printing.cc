@@ -26,7 +26,7 @@ std::string leafText(const Node& node) {
   }
 }
 
-// At most 3 * kMaxDepth calls deep.
+// Recursion depth at most 3 * kMaxDepth.
 void append(const Node& node, std::string& out) {
   const char* const name = node.kind == Kind::conjunction   ? "(and"
                            : node.kind == Kind::disjunction ? "(or"

@@ -27,7 +27,7 @@ Node negationOf(Node operand) {
   return node;
 }
 
-// A field whose value says more than a text; none where the value cannot be read.
+// The node of a field with a value other than text; nullopt if the value is invalid.
 std::optional<Node> valueNode(Field field, const std::string& text, double now) {
   Node node;
   const auto withDates = [&](std::optional<DateRange> dates) -> std::optional<Node> {
@@ -81,15 +81,15 @@ const char* allowedValues(Field field) {
   }
 }
 
-// A group that is open, and what has been read of it.
+// An open group and what has been read of it.
 struct Frame {
-  std::vector<Node> alternatives;  // complete ones
-  std::vector<Node> sequence;      // of the alternative at hand
-  Field field = Field::any;        // of the words inside: from:(a OR b)
-  bool negated = false;            // the group as a whole
+  std::vector<Node> alternatives;  // complete alternatives
+  std::vector<Node> sequence;      // the current alternative
+  Field field = Field::any;        // for the words inside: from:(a OR b)
+  bool negated = false;            // applies to the whole group
 };
 
-// Builds the tree in a loop, with a frame for each open group.
+// Builds the tree in a loop, with one frame for each open group.
 class Builder {
  public:
   Builder(std::string_view text, double now, Query& query)
@@ -173,7 +173,7 @@ class Builder {
     return node;
   }
 
-  // Whether it ends where the text ends: it is still being typed.
+  // Whether the token ends where the text ends: it is still being typed.
   [[nodiscard]] bool isLast(const Token& token) const {
     return token.source.data() + token.source.size() == _text.data() + _text.size();
   }
@@ -182,7 +182,7 @@ class Builder {
   const double _now;
   Query& _query;
   std::vector<Frame> _frames;
-  bool _negated = false;  // by a NOT before the next operand
+  bool _negated = false;  // a NOT applies to the next operand
 };
 
 }  // namespace

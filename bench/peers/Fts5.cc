@@ -24,7 +24,7 @@ void appendPersons(const TLIndexableItem& item, TLAttributeKey key, std::string&
   }
 }
 
-// The text that the daemon indexes, markup dropped as it does.
+// The text that the daemon indexes, with markup removed in the same way.
 std::string bodyOf(const TLIndexableItem& item) {
   const auto& html = item.bytesValueForKey(TLAttributeKey::HTML_CONTENT_DATA);
   if (!html) {
@@ -49,7 +49,7 @@ std::array<std::string, 4> columnsOf(const TLIndexableItem& item) {
   return columns;
 }
 
-// Quoted, a word is no operator.
+// Quotes each word, so that none is an operator.
 std::string matchFor(const std::string& query) {
   std::string match;
   for (const std::string& word : bench::wordsOfQuery(query)) {
@@ -65,7 +65,7 @@ Fts5Database::Fts5Database(const std::string& path) {
   const int code = sqlite3_open(path.c_str(), &database);
   _database.reset(database);
   check(code, SQLITE_OK);
-  // No more is synced than the daemon syncs.
+  // Syncs no more than the daemon does.
   execute("PRAGMA journal_mode=WAL; PRAGMA synchronous=OFF;");
   execute(
       "CREATE VIRTUAL TABLE IF NOT EXISTS mail USING fts5(subject, sender, recipients, body, "

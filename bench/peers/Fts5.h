@@ -9,23 +9,23 @@
 
 namespace peers {
 
-// Mail in a full-text table of SQLite: what an application does that has no search daemon. One
-// thread. Every operation throws when SQLite reports an error.
+// Mail in a full-text table of SQLite, as in an application without a search daemon. One thread.
+// Every operation throws when SQLite reports an error.
 class Fts5Database {
  public:
-  // Opens the database at `path`, or makes it.
+  // Opens or creates the database at `path`.
   explicit Fts5Database(const std::string& path);
 
-  // Adds all items of the spool, a transaction for each of its batches.
+  // Adds all items of the spool, one transaction per batch.
   void index(bench::ItemSpool& spool);
 
   // Merges all segments of the index into one.
   void optimize();
 
-  // Brings everything into the database file.
+  // Writes everything into the database file.
   void checkpoint();
 
-  // Fetches subject and sender of the best mails that have all words, the last one as a prefix.
+  // Fetches subject and sender of the best mails that contain all words, the last one as a prefix.
   // Returns their number.
   [[nodiscard]] size_t search(const std::string& query);
 

@@ -2,7 +2,7 @@
 
 #include "bench/peers/Fts5.h"
 
-// Indexing by Fts5Database as a process of its own, so that its memory can be told apart.
+// Indexes with Fts5Database in its own process, to measure its memory separately.
 namespace {
 
 int run(int argc, char** argv) {

@@ -9,13 +9,13 @@
 
 #include "bench/DaemonRun.h"
 
-// Makes a larger Maildir out of one, for measuring at sizes that nobody has at hand: mails that
-// differ in the Message-ID and in one word, so that no indexer takes one for another.
+// Multiplies a Maildir to measure sizes that are not at hand: the copies differ in the Message-ID
+// and in one word, so no indexer takes them for duplicates.
 namespace {
 
 namespace fs = std::filesystem;
 
-// The header field of that name, from the name on; npos when the header has none.
+// Position of the header field with this name; npos if there is none.
 size_t findField(std::string_view mail, std::string_view name) {
   for (size_t line = 0; line < mail.size() && mail[line] != '\n' && mail[line] != '\r';) {
     const std::string_view start = mail.substr(line, name.size());
@@ -29,12 +29,13 @@ size_t findField(std::string_view mail, std::string_view name) {
   return std::string_view::npos;
 }
 
-// Changes the Message-ID, where there is one, and appends a line with the word.
+// Changes the Message-ID, if there is one, and appends a line with the word.
 std::string changed(std::string mail, size_t copy, const std::string& word) {
   constexpr std::string_view kField = "message-id:";
   if (const size_t field = findField(mail, kField); field != std::string_view::npos) {
     const size_t id = mail.find_first_not_of("< \t\r\n", field + kField.size());
-    const bool empty = id == std::string::npos || mail[id - 1] == '\n';  // the next field
+    const bool empty =
+        id == std::string::npos || mail[id - 1] == '\n';  // next to the following field
     if (!empty) mail.insert(id, "copy" + std::to_string(copy) + '.');
   }
   if (!mail.ends_with('\n')) mail += '\n';
@@ -45,7 +46,7 @@ class Multiplier {
  public:
   explicit Multiplier(size_t times) : _times(times) {}
 
-  // Takes the mails in the order of their names, so that the same Maildir gives the same copies.
+  // Processes mails in order of their names, so the same Maildir always gives the same copies.
   void multiply(const fs::path& source, const fs::path& target) {
     std::vector<fs::path> mails;
     for (const auto& entry : fs::directory_iterator(source)) {
@@ -58,7 +59,7 @@ class Multiplier {
       if (!file) throw std::runtime_error(path.string() + ": cannot be read");
       const std::string name = path.filename();
       write(target / name, mail);
-      // The number stands in front, so that the copies of one mail are not neighbours.
+      // The number comes first, so the copies of one mail are not neighbours.
       for (size_t copy = 1; copy < _times; ++copy) {
         write(target / ("copy" + std::to_string(copy) + '.' + name), changed(mail, copy, word()));
       }
@@ -79,7 +80,7 @@ class Multiplier {
   }
 
   const size_t _times;
-  std::mt19937 _random;  // with the seed of the standard
+  std::mt19937 _random;  // with the default seed
 };
 
 int run(int argc, char** argv) {

@@ -18,7 +18,7 @@ namespace {
 
 using Arguments = std::vector<std::string>;
 
-// A mail indexer whose index and search are commands.
+// A mail indexer with commands for indexing and searching.
 struct Tool {
   std::string directory;  // of its database
   bench::Variables variables;
@@ -28,15 +28,15 @@ struct Tool {
   std::vector<int> searchStatuses;  // found or nothing found
 };
 
-// The words but the last one, quoted, so that none is an operator, and a blank behind each.
+// All words but the last, quoted so that none is an operator, each followed by a space.
 std::string quotedWords(const std::vector<std::string>& words) {
   std::string text;
   for (size_t i = 0; i + 1 < words.size(); ++i) text += '"' + words[i] + "\" ";
   return text;
 }
 
-// The last word as a prefix for notmuch, which takes these words for operators in any case, star or
-// not, unless the search is for the body alone.
+// The last word as a prefix for notmuch, which takes these words for operators in any case, with or
+// without star, unless the search is restricted to the body.
 std::string notmuchPrefix(const std::string& word) {
   static const std::array<std::string, 4> operators{"and", "or", "not", "xor"};
   std::string lower = word;
@@ -45,13 +45,13 @@ std::string notmuchPrefix(const std::string& word) {
   return (isOperator ? "body:" : "") + word + '*';
 }
 
-// Every search prints one line a result.
+// Every search prints one line per result.
 class ToolRun {
  public:
   ToolRun(Tool tool, const Workload& work, std::string output)
       : _tool(std::move(tool)), _work(work), _output(std::move(output)) {}
 
-  // The figures of indexing alone.
+  // The figures of indexing only.
   [[nodiscard]] Figures index() const {
     Figures figures;
     if (!_tool.prepare.empty()) run(_tool.prepare, {0}, false);
@@ -89,7 +89,7 @@ class ToolRun {
     return {seconds, static_cast<size_t>(results)};
   }
 
-  // What a search for nothing takes, in turns with the queries: starting the program and opening
+  // Measures, in turns with the queries, a search without results: starting the program and opening
   // its index.
   void takeStartOff(Figures& figures) const {
     figures.startSeconds = _starts.at(0.5);
@@ -117,7 +117,7 @@ Tool mu(const Workload& work, const bench::ScratchDirectory& scratch) {
           {"mu", "init", home, "--maildir=" + work.maildir},
           {"mu", "index", home, "--quiet"},
           search,
-          {0, 2, 4}};  // nothing found is 2 or 4, by version
+          {0, 2, 4}};  // nothing found is 2 or 4, depending on the version
 }
 
 }  // namespace

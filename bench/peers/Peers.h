@@ -9,36 +9,36 @@
 #include "bench/Percentiles.h"
 #include "bench/Queries.h"
 
-// What is measured beside each other, and how. Each `measure...` below works in a scratch directory
-// of its own, which is gone when it returns, and throws when something fails.
+// Measures several indexers under the same conditions. Each `measure...` function works in its own
+// scratch directory, which it removes, and throws on failure.
 namespace peers {
 
-// The same for all.
+// Common to all.
 struct Workload {
   std::string maildir;    // an absolute path
   std::string spoolPath;  // its mails as encoded items
   uint64_t mails;
-  // No query stands twice in these, so that each is new to whoever is asked it first.
+  // All queries in these lists are distinct, so each is new to the program that gets it first.
   std::vector<std::string> warmUp;       // not timed
   std::vector<std::string> queries;      // timed twice
-  std::vector<std::string> duringMerge;  // timed once, of this daemon
+  std::vector<std::string> duringMerge;  // timed once, for this daemon only
 };
 
 inline constexpr double kUnknown = std::numeric_limits<double>::quiet_NaN();
 
-// What some searches took.
+// The times of several searches.
 class SearchTimes {
  public:
   void add(const bench::TimedSearch& timed);
 
-  // From now on each search took so much less.
+  // Subtracts this time from each search from now on.
   void takeOff(double seconds) { _takenOff = seconds; }
 
-  // In seconds; NaN without any search.
+  // In seconds; NaN without searches.
   [[nodiscard]] double at(double part) const;
 
   [[nodiscard]] uint64_t queries() const { return _queries; }
-  [[nodiscard]] uint64_t results() const { return _results; }  // of all together
+  [[nodiscard]] uint64_t results() const { return _results; }  // total over all searches
 
  private:
   bench::Percentiles _seconds;
@@ -47,59 +47,58 @@ class SearchTimes {
   double _takenOff = 0;
 };
 
-// What is measured of each. Whatever is not known, or depends on that, is NaN.
+// The figures of one system. Unknown ones, and those that depend on them, are NaN.
 struct Figures {
   double mailsPerSecond = kUnknown;
-  double cpuSeconds = kUnknown;  // of all processes that indexed
+  double cpuSeconds = kUnknown;  // of all processes that took part in indexing
   double diskBytes = kUnknown;
   double residentPeak = kUnknown;  // of the indexing process, in bytes
-  double startSeconds = 0;         // taken off each query
-  SearchTimes first;               // each query when it is asked for the first time
-  SearchTimes again;               // and for the second
+  double startSeconds = 0;         // subtracted from each query
+  SearchTimes first;               // first run of each query
+  SearchTimes again;               // second run
 };
 
 using Search = std::function<bench::TimedSearch(const std::string& query)>;
 
-// Warms up, then runs the queries twice and enters what that took into the figures.
+// Warms up, then runs the queries twice and adds the times to the figures.
 void timeQueries(const Workload& work, const Search& search, Figures& figures);
 
-// Queries that began and ended while one and the same merge ran.
+// Queries that began and ended during the same merge.
 struct DuringMerge {
   SearchTimes times;
   uint64_t merges = 0;    // that ran during those queries
   uint64_t mailsFed = 0;  // indexed meanwhile
 };
 
-// This daemon.
+// The figures of this daemon.
 struct TallowFigures : Figures {
   double settleSeconds = 0;  // from the last mail until all merges have ended
   uint64_t settleMerges = 0;
-  double anonymousPeak = kUnknown;  // RssAnon, in bytes, of the daemon at any time
-  DuringMerge duringMerge;          // no mail comes in
-  DuringMerge duringIngest;         // another client indexes mail, too
+  double anonymousPeak = kUnknown;  // peak RssAnon of the daemon, in bytes
+  DuringMerge duringMerge;          // without incoming mail
+  DuringMerge duringIngest;         // while another client indexes mail
 };
 [[nodiscard]] TallowFigures measureTallow(const Workload& work);
 
-// As above, but for indexing alone: there are no searches in the figures.
+// Indexing only: the figures contain no searches.
 [[nodiscard]] Figures indexByTallow(const Workload& work);
 
-// This daemon without the parsing of mail, and the same keys as raw batches. What is not known is
-// NaN.
+// This daemon without parsing mail, and raw batches with the same keys. Unknown values are NaN.
 struct EncodedFigures {
   double seconds = kUnknown;
   double cpuSeconds = kUnknown;
   double anonymousPeak = kUnknown;
-  double suffixes = kUnknown;  // this and the following only `withRaw`
+  double suffixes = kUnknown;  // this and the following only with `withRaw`
   double rawSeconds = kUnknown;
   double rawDiskBytes = kUnknown;
 };
 [[nodiscard]] EncodedFigures measureEncoded(const Workload& work, bool withRaw);
 
 [[nodiscard]] Figures measureMu(const Workload& work);
-[[nodiscard]] Figures indexByMu(const Workload& work);  // alone, as above
+[[nodiscard]] Figures indexByMu(const Workload& work);  // indexing only
 [[nodiscard]] Figures measureNotmuch(const Workload& work);
 
-// With `optimize`, all segments of the full-text index are merged into one before searching.
+// With `optimize`, merges all segments of the full-text index into one before searching.
 [[nodiscard]] Figures measureFts5(const Workload& work, bool optimize);
 
 }  // namespace peers

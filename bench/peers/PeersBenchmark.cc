@@ -13,14 +13,14 @@
 #include "bench/Corpus.h"
 #include "bench/peers/Peers.h"
 
-// This daemon beside other indexers of mail: the same mail, the same queries, one run.
+// Compares this daemon with other mail indexers: the same mail and the same queries in one run.
 namespace {
 
 using peers::Figures;
 using peers::SearchTimes;
 using peers::Workload;
 
-// In the order in which they are measured.
+// In the order of measurement.
 const std::vector<std::string> kSystems{"tallow", "tallow_rpc", "raw", "mu", "notmuch", "fts5"};
 
 struct Options {
@@ -38,7 +38,7 @@ struct Options {
   }
 };
 
-// Gives queries out, none twice. Whether a letter is a capital makes no difference to a search.
+// Hands out queries, never the same twice. Searches ignore case.
 class NewQueries {
  public:
   explicit NewQueries(bench::QuerySource& source) : _source(source) {}
@@ -51,7 +51,7 @@ class NewQueries {
     return queries;
   }
 
-  // Of one, two, three, one ... words; fewer when the mail has no others.
+  // Queries of one, two, three, one, ... words; fewer if the mail has no others.
   [[nodiscard]] std::vector<std::string> draw(size_t count) {
     constexpr int kMostTries = 10000;  // for one
     std::vector<std::string> queries;
@@ -81,7 +81,7 @@ double megabytes(double bytes) {
   return bytes / 1e6;
 }
 
-// Each line as soon as there is one: the whole takes its time.
+// Prints each line as soon as it is complete, because the whole run takes long.
 void printLine(const std::string& line) {
   fmt::print("{}\n", line);
   std::fflush(stdout);
@@ -141,7 +141,7 @@ void printRaw(const Workload& work, const peers::EncodedFigures& encoded) {
                         megabytes(encoded.rawDiskBytes)));
 }
 
-// Raw batches take their keys from an index, so that one is made for them in any case.
+// Raw batches take their keys from an index, so one is created in any case.
 peers::EncodedFigures measureEncoded(const Workload& work, const Options& options) {
   if (!options.has("tallow_rpc") && !options.has("raw")) return {};
   const peers::EncodedFigures encoded = peers::measureEncoded(work, options.has("raw"));
@@ -169,7 +169,7 @@ Figures measureTool(const Tool& tool, const Workload& work) {
   return figures;
 }
 
-// What is asked for before hours of work rather than after.
+// Checks the programs before hours of work, not after.
 void findTools(std::vector<Tool>& tools, const Options& options,
                const bench::ScratchDirectory& scratch) {
   for (Tool& tool : tools) {
@@ -213,9 +213,9 @@ Figures measureFts5(const Workload& work, const Options& options) {
   return fts5;
 }
 
-// How many times as fast as mu. The machine's speed may drift between one measurement and another;
-// with more turns than the one that is measured already both index the mail anew, one right after
-// the other, and the times of all turns are taken together.
+// How many times as fast as mu. The speed of the machine may drift between measurements. With more
+// than one turn, both index the mail again, one right after the other, and the times of all turns
+// are added up.
 double rateBesideMu(const Workload& work, const Figures& tallow, const Figures& mu, size_t turns) {
   double ours = 1 / tallow.mailsPerSecond;
   double theirs = 1 / mu.mailsPerSecond;

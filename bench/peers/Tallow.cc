@@ -38,12 +38,12 @@ Merges mergesOf(client::DebugServiceProxy& service) {
           text->find("(IN PROGRESS)", at) != std::string::npos};
 }
 
-// Tells one merge from another, and costs nothing. None while there is no merge.
+// Identifies a merge at no cost. Nullopt while there is no merge.
 std::optional<pid_t> mergeThread(const bench::DaemonRun& daemon) {
   return daemon.threadNamed("tallow-merge");
 }
 
-// Merges and compacts the index until there is nothing more to merge.
+// Merges and compacts the index until nothing is left to merge.
 void settle(client::DebugServiceProxy& service) {
   constexpr std::chrono::milliseconds kPoll(100);
   constexpr int kMostRounds = 100;  // each moves at least a quarter of a million suffixes
@@ -60,10 +60,10 @@ void settle(client::DebugServiceProxy& service) {
   throw std::runtime_error("the merges do not come to an end");
 }
 
-// Indexes the mail of the spool under new identifiers, again and again, to make the daemon merge.
+// Indexes the spool's mail repeatedly under new identifiers, to make the daemon merge.
 //
-// Threads: one, the maker's. The feeding thread, which `start` makes and `stop` joins, has all but
-// `_stopping` for itself while it runs.
+// Threads: used by one. The feeding thread, which `start` creates and `stop` joins, owns everything
+// but `_stopping` while it runs.
 class Feeder {
  public:
   Feeder(const bench::DaemonRun& daemon, const std::string& spoolPath)
@@ -72,22 +72,22 @@ class Feeder {
   Feeder(const Feeder&) = delete;
   Feeder& operator=(const Feeder&) = delete;
 
-  // True once a merge runs; false when all mail was sent without.
+  // True once a merge is running; false if all mail was sent without one.
   [[nodiscard]] bool startMerge() {
     const size_t first = _round;
     while (!mergeThread(_daemon)) {
-      if (_round > first + 1) return false;  // the first may have been begun already
+      if (_round > first + 1) return false;  // the first round may already have been started
       sendBatch(SIZE_MAX);
     }
     return true;
   }
 
-  // Goes on in a thread, in small calls, as mail comes in.
+  // Continues on a thread, in small calls like incoming mail.
   void start() {
     _thread = std::thread([this] { feed(); });
   }
 
-  // Returns how many mails were sent since the latest stop; throws what the thread has met.
+  // Returns the number of mails sent since the last stop; rethrows the exception of the thread.
   uint64_t stop() {
     end();
     _stopping = false;
@@ -144,7 +144,7 @@ class Feeder {
   std::thread _thread;
 };
 
-// Makes the index, which is no part of indexing.
+// Creates the index, which should not count as indexing.
 void openIndex(client::SearchServiceProxy& service) {
   std::optional<TLError> error;
   const auto none =
@@ -166,9 +166,9 @@ void indexByClient(const Workload& work, bench::DaemonRun& daemon, const std::st
   figures.residentPeak = static_cast<double>(daemon.memory().residentPeak);
 }
 
-// Asks one query after another while merges run, with mail coming in as well or with none. Between
-// merges, mail comes in until there is the next one, and nothing is asked. A query that a merge
-// does not outlast does not count.
+// Runs queries one after another while merges run, with or without mail coming in. Between merges,
+// mail comes in until the next one starts, and no query runs. A query that outlasts its merge does
+// not count.
 void timeDuringMerge(std::span<const std::string> queries, bool feeding, Feeder& feeder,
                      const bench::DaemonRun& daemon, const Search& search, DuringMerge& figures) {
   std::optional<pid_t> latest;

@@ -20,14 +20,14 @@ constexpr char16_t kFullwidthColon = 0xFF1A;
 
 constexpr int32_t kMaximumMarks = 30;
 
-// A piece ends at the first boundary of normalization behind the first bound, in the worst case at
-// the second. No code point grows to more than 18 units.
+// A piece ends at the first normalization boundary after the first bound, at worst at the second
+// bound. No code point grows to more than 18 units.
 constexpr int32_t kPieceUnits = 256;
 constexpr int32_t kMaximumPieceUnits = 512;
 constexpr int32_t kMaximumGrowth = 18;
 
-// Iterators keep caches that grow with the longest text between two boundaries; behind such a text
-// they are not kept.
+// Iterators have caches that grow with the longest text between two boundaries; after a longer text
+// they are discarded.
 constexpr size_t kMaximumKeptText = size_t{1} << 16;
 
 struct BreakIteratorCloser {
@@ -102,7 +102,7 @@ UChar32 FoldedText::next() {
   return c;
 }
 
-// Moves _position and _wordEnd to the next word of the iterator that counts.
+// Moves _position and _wordEnd to the next significant word of the iterator.
 bool FoldedText::enterNextWord() {
   for (;;) {
     const int32_t start = _wordEnd;
@@ -132,7 +132,7 @@ bool FoldedText::isDigitAt(int32_t index) const {
   return index >= 0 && static_cast<size_t>(index) < _text.size() && u_isdigit(_text[index]);
 }
 
-// Times stay whole: the boundaries around a colon between two digits do not count.
+// Keeps times together: the boundaries around a colon between two digits are ignored.
 bool FoldedText::colonJoinsAt(int32_t index) const {
   return isJoiningColon(index - 1) || isJoiningColon(index);
 }

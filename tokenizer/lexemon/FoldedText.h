@@ -12,9 +12,9 @@ namespace lexemon {
 
 struct Workspace;
 
-// A break iterator and buffers, borrowed from the calling thread for as long as the lease lives: a
-// thread keeps one set, for the locale it used last, so that none is opened per text. Two leases
-// alive on one thread get a set each. Throws std::runtime_error where ICU has no iterator for the
+// A break iterator and buffers, borrowed from the calling thread for the lifetime of the lease. A
+// thread caches one set, for its last locale, so that no iterator is opened per text. Two leases
+// alive on one thread get separate sets. Throws std::runtime_error if ICU has no iterator for the
 // locale.
 class WorkspaceLease {
  public:
@@ -29,12 +29,12 @@ class WorkspaceLease {
   std::unique_ptr<Workspace> _workspace;
 };
 
-// The code points of a text after NFKC case folding, word by word of the ICU break iterator (UAX 29
-// with dictionaries for scripts without blanks). Words without letter, digit or ideograph are left
-// out. Folding goes in pieces of bounded length, so memory does not grow with the text.
+// The code points of a text after NFKC case folding, word by word of the ICU break iterator (UAX
+// 29, with dictionaries for scripts without spaces). Words without a letter, digit or ideograph are
+// skipped. Text is folded in pieces of bounded length, so memory does not grow with the text.
 //
-// A run of combining marks counts up to its 30th (the bound of the stream-safe text format, UAX
-// 15): the rest is dropped, as putting n marks in canonical order takes n * n steps.
+// Of a run of combining marks only the first 30 count (the bound of the stream-safe text format,
+// UAX 15), because sorting n marks into canonical order takes n * n steps.
 class FoldedText {
  public:
   static constexpr UChar32 kBreak = -1;  // between two words
@@ -43,13 +43,13 @@ class FoldedText {
   // Both arguments must outlive the object.
   FoldedText(TLStringView text, Workspace& workspace);
 
-  // The next code point (a lone surrogate stands for itself), kBreak, or kEnd for good.
+  // The next code point (a lone surrogate is returned as it is), kBreak, or, permanently, kEnd.
   [[nodiscard]] UChar32 next();
 
-  // Brings back the code point that `next` gave last.
+  // Puts back the code point last returned by `next`.
   void unread() { _foldedPosition = _previousPosition; }
 
-  // True once after each stretch that was left out.
+  // True once after each skipped stretch.
   [[nodiscard]] bool takeSkipped() { return std::exchange(_skipped, false); }
 
  private:
@@ -62,7 +62,7 @@ class FoldedText {
 
   const TLStringView _text;
   Workspace& _workspace;
-  int32_t _position = 0;  // first unit of the word that is not folded yet
+  int32_t _position = 0;  // first unit of the word that is not yet folded
   int32_t _wordEnd = 0;
   int32_t _marks = 0;  // length of the current run of combining marks
   int32_t _foldedPosition = 0;

@@ -32,7 +32,7 @@ namespace analysis {
 
 namespace {
 
-// The whole text where ICU holds it as one chunk of UTF-16, as it does for utext_openUChars.
+// The whole text, if ICU holds it as one chunk of UTF-16, as it does for utext_openUChars.
 TLStringView chunkOf(UText* text) {
   const int64_t length = utext_nativeLength(text);
   utext_setNativeIndex(text, 0);

@@ -14,11 +14,11 @@
 #include "platform/Text.h"
 #include "tokenizer/lexemon/WordScanner.h"
 
-// The linguistic library that the tokenizers call, built on ICU. WordScanner says what it takes for
-// a word and how it cleans one.
+// The linguistic library under the tokenizers, built on ICU. WordScanner defines what a word is and
+// how it is cleaned.
 //
-// Threads: an analyzer factory, its analyzers and the registration service may be used from many
-// threads at once; chains, streams and attributes belong to one thread at a time.
+// Threads: an analyzer factory, its analyzers and the registration service may be used by many
+// threads at once; chains, streams and attributes by one thread at a time.
 namespace lexemon {
 
 // One token of a chain, owned by the chain.
@@ -27,7 +27,7 @@ class Token {
   Token(bool significant, TLString cleanValue)
       : _significant(significant), _cleanValue(std::move(cleanValue)) {}
 
-  // Null behind the last.
+  // Null after the last.
   [[nodiscard]] const Token* getNext() const { return _next; }
   // False for a token that stands for text without words; its clean value is empty.
   [[nodiscard]] bool isSignificant() const { return _significant; }
@@ -59,7 +59,7 @@ class TokenChain {
   std::deque<Token> _tokens;
 };
 
-// A walk from a first token up to, but not including, an end token.
+// Iterates from a first token up to, but not including, an end token.
 class TokenIterator {
  public:
   TokenIterator(const Token* first, const Token* end) : _token(first), _end(end) {}
@@ -81,7 +81,7 @@ namespace util {
 
 class ULocale {
  public:
-  // Throws std::invalid_argument for a name that has no language.
+  // Throws std::invalid_argument for a name without a language.
   ULocale(const std::string& name, const std::string& country, const std::string& variant,
           const std::string& keywords);
 
@@ -108,7 +108,7 @@ class TokenStream;
 
 namespace tokenattributes {
 
-// The current term of a stream; its buffer is used again from term to term.
+// The current term of a stream; its buffer is reused.
 class CharTermAttribute {
  public:
   [[nodiscard]] const TLString& term() const { return _term; }
@@ -137,29 +137,30 @@ class AttributeSource {
 
 }  // namespace util
 
-// The terms of a text. Needs a term attribute. Not reset, ended or closed, it has no terms.
+// The terms of a text. Requires a term attribute. Before reset, and after end or close, it has no
+// terms.
 class TokenStream : public util::AttributeSource {
  public:
   // Both must outlive the stream.
   TokenStream(UText* text, const std::string& locale);
 
   void reset();
-  // Moves to the next term; false behind the last. Throws std::runtime_error where ICU fails.
+  // Moves to the next term; false after the last. Throws std::runtime_error if ICU fails.
   [[nodiscard]] bool increment();
   void end() { _scanner.reset(); }
   void close() { _scanner.reset(); }
 
  private:
-  const TLString _copy;  // of a text that is not in memory as one piece
+  const TLString _copy;  // for a text that is not in memory as one piece
   const TLStringView _text;
   const std::string& _locale;
   std::optional<WordScanner> _scanner;
 };
 
-// Cuts texts by the rules of one locale.
+// Splits texts by the rules of one locale.
 class Analyzer {
  public:
-  // Throws std::runtime_error where ICU has no rules.
+  // Throws std::runtime_error if ICU has no rules.
   explicit Analyzer(std::string locale);
 
   [[nodiscard]] std::unique_ptr<TokenChain> tokenize(TLStringView text) const;
@@ -173,13 +174,13 @@ class DefaultAnalyzerFactory {
  public:
   using Options = std::bitset<12>;
 
-  // The one cleaning that there is goes by this set.
+  // The only set of options that is implemented.
   static constexpr unsigned long kOptions = 2058;
 
   // Throws std::invalid_argument for any other set.
   explicit DefaultAnalyzerFactory(Options options);
 
-  // Made at the first call, kept by the factory. Throws as Analyzer does.
+  // Created at the first call and owned by the factory. Throws as Analyzer does.
   [[nodiscard]] const Analyzer& analyzer(const lexemon::util::ULocale& locale);
 
  private:
@@ -191,7 +192,7 @@ class DefaultAnalyzerFactory {
 
 namespace resources {
 
-// ICU comes with all of its data, so a registered path is only kept.
+// ICU contains all of its data, so a registered path is merely stored.
 class DataRegistrationService {
  public:
   static void registerDataPathForLanguage(const std::string& language, const std::string& path);

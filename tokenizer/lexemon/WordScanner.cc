@@ -14,8 +14,8 @@ namespace lexemon {
 
 namespace {
 
-// A stretch of mixed text takes in ASCII shorter than this, as the iterator costs time to set up,
-// and ends at the first blank past the bound.
+// A stretch of mixed text includes shorter runs of ASCII, because the iterator takes time to set
+// up, and ends at the first white space after the bound.
 constexpr size_t kShortASCII = 32;
 constexpr size_t kLongStretch = 4096;
 
@@ -49,8 +49,7 @@ bool isASCIIBlank(char16_t c) {
   return c == u' ' || (c >= u'\t' && c <= u'\r');
 }
 
-// Of a word in the making: `joint` is its length where the last apostrophe was dropped. A word that
-// ends in a joint and an s is a possessive.
+// Removes a possessive s: `joint` is the length of the word where its last apostrophe was dropped.
 void dropPossessive(TLString& word, size_t joint) {
   if (joint > 0 && word.size() == joint + 1 && word.back() == u's') word.pop_back();
 }
@@ -80,7 +79,7 @@ bool losesAccents(UChar32 c) {
   return script == USCRIPT_LATIN || script == USCRIPT_GREEK || script == USCRIPT_CYRILLIC;
 }
 
-// The letter without its accents. A canonical decomposition of these scripts is one base letter and
+// The letter without accents. In these scripts a canonical decomposition is one base letter plus
 // marks.
 UChar32 withoutAccents(UChar32 c) {
   if (c < 0xC0) return c;
@@ -105,7 +104,7 @@ void appendCodePoint(TLString& word, UChar32 c) {
   }
 }
 
-// Puts one word together from folded code points.
+// Builds one word from folded code points.
 class WordBuilder {
  public:
   explicit WordBuilder(TLString& word) : _word(word) { _word.clear(); }
@@ -128,7 +127,7 @@ class WordBuilder {
     return false;
   }
 
-  // True when there is a word; complete then.
+  // Completes the word; true if there is one.
   bool finish() {
     dropPossessive(_word, _joint);
     return !_word.empty();
@@ -152,7 +151,7 @@ class WordBuilder {
   }
 
   TLString& _word;
-  UChar32 _pending = 0;  // stays if a character of the right kind follows
+  UChar32 _pending = 0;  // kept if a character of the right kind follows
   Kind _pendingKind = kOther;
   Kind _last = kOther;  // of the last letter or digit
   bool _stripMarks = false;
@@ -207,7 +206,7 @@ bool WordScanner::enterNextStretch() {
   return true;
 }
 
-// The blank at which a stretch of mixed text ends, or the end of the text.
+// The white space at which a stretch of mixed text ends, or the end of the text.
 size_t WordScanner::mixedStretchEnd(size_t firstNonASCII) const {
   if (_mode == Mode::unicodeOnly) return _text.size();
   const size_t bound = firstNonASCII + kLongStretch;
