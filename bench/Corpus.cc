@@ -95,9 +95,10 @@ std::optional<uint64_t> ItemSpool::readCount() {
   return std::nullopt;
 }
 
-void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch) {
+void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch,
+                const std::string& protectionClass) {
   std::optional<TLError> error;
-  if (!service.indexItems(batch, kClientName, kProtectionClass, &error)) {
+  if (!service.indexItems(batch, kClientName, protectionClass, &error)) {
     throw std::runtime_error("indexing: " + platform::printable(error));
   }
 }

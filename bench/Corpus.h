@@ -72,6 +72,7 @@ class ItemSpool {
 };
 
 // Indexes the batch for the benchmark's client. Throws if the daemon refuses it.
-void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch);
+void indexBatch(client::SearchServiceProxy& service, std::span<const client::EncodedItem> batch,
+                const std::string& protectionClass = kProtectionClass);
 
 }  // namespace bench

@@ -168,6 +168,11 @@ std::optional<pid_t> DaemonRun::threadNamed(const std::string& name) const {
   return std::nullopt;
 }
 
+size_t DaemonRun::countEntries(const char* directory) const {
+  const auto path = std::filesystem::path("/proc") / std::to_string(_pid) / directory;
+  return static_cast<size_t>(std::distance(std::filesystem::directory_iterator(path), {}));
+}
+
 int DaemonRun::end(int signal) {
   const pid_t pid = std::exchange(_pid, -1);
   int status = 0;

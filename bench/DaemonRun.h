@@ -45,6 +45,10 @@ class DaemonRun {
   // Processor time of all its threads so far; less noisy than wall time on a busy machine.
   [[nodiscard]] double cpuSeconds() const;
 
+  // How many threads and open descriptors it has now.
+  [[nodiscard]] size_t threads() const { return countEntries("task"); }
+  [[nodiscard]] size_t descriptors() const { return countEntries("fd"); }
+
   // The thread ID of its thread with this name; nullopt if there is none now.
   [[nodiscard]] std::optional<pid_t> threadNamed(const std::string& name) const;
 
@@ -55,6 +59,8 @@ class DaemonRun {
   void spawn(const std::string& stateDirectory, const std::string& notifyPath,
              const std::string& logPath);
   void awaitReady(int notifySocket) const;
+  // In a directory of /proc/PID.
+  [[nodiscard]] size_t countEntries(const char* directory) const;
   // Returns the status from waitpid.
   int end(int signal);
 

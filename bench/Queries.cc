@@ -5,7 +5,6 @@
 #include <sstream>
 #include <stdexcept>
 
-#include "bench/Corpus.h"
 #include "records/TLParamsManager.h"
 
 namespace bench {
@@ -136,15 +135,15 @@ std::vector<std::string> wordsOfQuery(const std::string& query) {
   return words;
 }
 
-TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& text,
-                        bool asTyped) {
+TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& text, bool asTyped,
+                        const std::string& protectionClass) {
   TLQuery query;
   query.setRawQuery(platform::fromUTF8(text));
   query.setOriginalQuery(platform::fromUTF8(text));
   if (asTyped) query.setSearchParams(TLParamsManager::paramsFromString(kAsTyped));
   std::optional<TLError> error;
   const double start = secondsNow();
-  const auto items = service.searchItems(query, 0, kProtectionClass, kMaximumResults, &error);
+  const auto items = service.searchItems(query, 0, protectionClass, kMaximumResults, &error);
   const double seconds = secondsNow() - start;
   if (!items) throw std::runtime_error("search: " + platform::printable(error));
   return {seconds, items->size()};

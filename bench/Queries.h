@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "bench/Corpus.h"
 #include "client/Batches.h"
 #include "client/SearchServiceProxy.h"
 
@@ -69,6 +70,7 @@ struct TimedSearch {
 // One search through the daemon, from the call to the decoded items. Throws on failure. With
 // `asTyped` the query is not modified.
 [[nodiscard]] TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& query,
-                                      bool asTyped = false);
+                                      bool asTyped = false,
+                                      const std::string& protectionClass = kProtectionClass);
 
 }  // namespace bench

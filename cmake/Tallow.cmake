@@ -13,7 +13,7 @@ pkg_check_modules(URIPARSER REQUIRED IMPORTED_TARGET liburiparser)
 add_library(tallow_flags INTERFACE)
 target_include_directories(tallow_flags INTERFACE ${CMAKE_SOURCE_DIR})
 target_compile_options(
-  tallow_flags INTERFACE -Wall -Wextra -Wpedantic -Wshadow -Werror)
+  tallow_flags INTERFACE -Wall -Wextra -Wpedantic -Wshadow)
 if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
   target_compile_options(tallow_flags INTERFACE -Wthread-safety -Wthread-safety-beta)
 endif()
