@@ -107,7 +107,7 @@ std::unique_ptr<index> index::load(Database opened, TLErrorOut error) {
     if (const auto failure = systemError(opened.status)) platform::setError(error, *failure);
     return nullptr;
   }
-  const platform::CrashNote note(opened.files->crashNotes());
+  const platform::CrashNote note(opened.env->crashNotes());
   auto idx = std::make_unique<index>(std::move(opened));
   if (!idx->readRecords(error)) {
     Log.error("Loading failure: The database cannot be read.");
@@ -206,7 +206,7 @@ bool index::Compact() {
   if (interrupted()) return true;
   const Activity::Work compaction(_schedule.housekeeping());
   const bool done = compactRange(nullptr, nullptr);
-  _database.files->waitForDisk();
+  _database.env->waitForDisk();
   if (done) makeMissingPostings();
   return done;
 }

@@ -186,7 +186,7 @@ const Postings::Entry* Postings::find(std::string_view prefix) const {
 
 // A list has for each document: its DocID delta times 4, plus 1 if its zone mask follows (else it
 // has the mask of the previous one), plus 2 if its number of suffixes follows (else 1).
-bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* places) const {
+bool Postings::add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const {
   const Entry* const entry = find(prefix);
   if (entry == nullptr) return false;
   std::string bytes(entry->bytes, '\0');
@@ -205,7 +205,7 @@ bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* pla
   uint32_t mask = 0;
   const uint32_t allZones =
       _zones.size() == kMaxZones ? UINT32_MAX : (uint32_t{1} << _zones.size()) - 1;
-  PlaceSet::Adder adder(places, _zones);
+  PostingSet::Adder adder(places, _zones);
   while (!input.empty() && input.good) {
     const uint32_t step = input.varint();
     docID += step / 4;

@@ -12,7 +12,7 @@
 #include "platform/FileDescriptor.h"
 #include "salt/DocPages.h"
 #include "salt/DocSet.h"
-#include "salt/PlaceSet.h"
+#include "salt/PostingSet.h"
 
 // Posting lists for the prefixes that many suffixes of a shard begin with: the documents, with
 // their zones and number of suffixes. A scan for such a prefix reads the list instead of the pages.
@@ -48,7 +48,7 @@ class Postings {
 
   // Adds the places of all suffixes that begin with `prefix`, except those of documents in
   // `deleted`. False, adding nothing, when there is no list or, with a log line, it cannot be read.
-  [[nodiscard]] bool add(std::string_view prefix, const DocSet& deleted, PlaceSet* places) const;
+  [[nodiscard]] bool add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const;
 
  private:
   struct Entry {

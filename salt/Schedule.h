@@ -24,7 +24,7 @@ namespace salt {
 //   the end of the index             the running merge                           its next page
 //
 // An interruption ends all of these waits at once. Below this level, BatchWriter separates writes
-// from compactions on demand, and LogSync and IndexFiles wait for the disk.
+// from compactions on demand, and LogSync and OrderedSyncEnv wait for the disk.
 //
 // Any thread. The schedule owns the merge thread, which must be joined before anything that the
 // merge uses is destroyed.

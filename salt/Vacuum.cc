@@ -88,7 +88,7 @@ void index::mergeInto(uint8_t shard) {
     platform::returnFreeMemory();
     if (op.CompactAfterVacuum && !interrupted()) {
       compactRange(nullptr, nullptr);
-      _database.files->waitForDisk();
+      _database.env->waitForDisk();
     } else if (merged) {
       compactPart(kHotPart);
       compactPart(shard);

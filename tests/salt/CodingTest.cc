@@ -6,9 +6,9 @@
 #include <random>
 #include <sstream>
 
+#include "salt/BytewiseComparator.h"
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
-#include "salt/KeyOrder.h"
 #include "tests/salt/Model.h"
 #include "tests/support/Seed.h"
 
@@ -116,7 +116,7 @@ TEST(Keys, OnlyTextKeysParseAsSuch) {
 
 // An index written in one order and read in another would be lost.
 TEST(Keys, SortAsLeveldbSortsThem) {
-  const salt::KeyOrder order;
+  const salt::BytewiseComparator order;
   const leveldb::Comparator& bytewise = *leveldb::BytewiseComparator();
   EXPECT_STREQ(order.Name(), bytewise.Name());
   const auto sign = [](int result) { return (result > 0) - (result < 0); };

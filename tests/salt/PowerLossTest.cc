@@ -171,10 +171,10 @@ TEST(PowerLoss, LeavesTheFirstOperationsWithoutAGap) {
 }
 
 // A killed process leaves a table that no manifest lists, and its number is assigned again.
-TEST(IndexFilesTest, ARemovalThatWaitsDoesNotTakeANewFileOfTheSameName) {
+TEST(OrderedSyncEnvTest, ARemovalThatWaitsDoesNotTakeANewFileOfTheSameName) {
   const testsupport::TemporaryDirectory directory;
   const std::string path = directory / "000053.ldb";
-  salt::IndexFiles files(directory / "", leveldb::Env::Default());
+  salt::OrderedSyncEnv files(directory / "", leveldb::Env::Default());
   for (int i = 0; i < 2000; ++i) ASSERT_TRUE(files.RemoveFile(path).ok());
   leveldb::WritableFile* file = nullptr;
   ASSERT_TRUE(files.NewWritableFile(path, &file).ok());

@@ -17,11 +17,11 @@ namespace salt {
 // generation.
 //
 // Memory: kMostBytes. Any thread.
-class ScanMemory {
+class ScanCache {
  public:
   struct Found {
     uint64_t suffixes = 0;  // of live documents
-    std::string places;     // see PlaceSet::encode
+    std::string places;     // see PostingSet::encode
   };
 
   // Null when the prefix is not cached for this generation.

@@ -26,11 +26,11 @@ class index;
 // Disk: a quarter of the free space, at most kMostFileBytes; then the file starts over. Memory:
 // about 60 bytes for each cached zone. When the file cannot be created or used, each text is read
 // from the database. One thread. The index outlives it.
-class ZoneTexts {
+class ZoneTextCache {
  public:
   static constexpr uint64_t kMostFileBytes = uint64_t{1} << 30;
 
-  explicit ZoneTexts(const index& owner, uint64_t mostFileBytes = kMostFileBytes);
+  explicit ZoneTextCache(const index& owner, uint64_t mostFileBytes = kMostFileBytes);
 
   // The truncated text of a suffix, empty when absent. Valid until the next call.
   [[nodiscard]] std::string_view find(const SuffixMeta& meta);
