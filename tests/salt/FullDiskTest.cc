@@ -7,7 +7,7 @@
 #include <set>
 
 #include "salt/IndexImpl.h"
-#include "tests/salt/FilesBetween.h"
+#include "tests/salt/FaultInjectionEnv.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
@@ -25,29 +25,29 @@ using testsupport::TemporaryDirectory;
 
 // Limits the total bytes written. A write that does not fit is truncated and fails, as on a real
 // disk.
-class FullDisk final : public salttest::FilesBetween {
+class FullDiskEnv final : public salttest::FaultInjectionEnv {
  public:
   void setBytesLeft(int64_t bytes) { _bytesLeft = bytes; }
   [[nodiscard]] int64_t bytesLeft() const { return _bytesLeft; }
 
  private:
-  class File final : public salttest::FileBetween {
+  class File final : public salttest::FaultInjectionFile {
    public:
-    File(FullDisk* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
+    File(FullDiskEnv* disk, leveldb::WritableFile* file) : FaultInjectionFile(file), _disk(*disk) {}
     leveldb::Status Append(const leveldb::Slice& data) override {
       const auto size = static_cast<int64_t>(data.size());
       const int64_t left = std::max<int64_t>(_disk._bytesLeft.fetch_sub(size), 0);
-      if (left >= size) return FileBetween::Append(data);
-      static_cast<void>(FileBetween::Append({data.data(), static_cast<size_t>(left)}));
+      if (left >= size) return FaultInjectionFile::Append(data);
+      static_cast<void>(FaultInjectionFile::Append({data.data(), static_cast<size_t>(left)}));
       static_cast<void>(Flush());
       return leveldb::Status::IOError("No space left on device");
     }
 
    private:
-    FullDisk& _disk;
+    FullDiskEnv& _disk;
   };
 
-  leveldb::WritableFile* between(const std::string&, leveldb::WritableFile* file) override {
+  leveldb::WritableFile* wrap(const std::string&, leveldb::WritableFile* file) override {
     return new File(this, file);
   }
 
@@ -110,7 +110,7 @@ TEST(FullDisk, AnInterruptedMergeLosesNothingAndIsRepeated) {
   for (int64_t bytes = 0; failed; bytes += 1300) {
     const std::string path = directory / std::to_string(bytes);
     std::filesystem::copy(original, path);
-    FullDisk disk;
+    FullDiskEnv disk;
     auto index = salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, &disk));
     {
       const LogCapture log;

@@ -19,9 +19,9 @@ constexpr uint32_t kReopenings = 200;  // one in this many operations reopens th
 constexpr uint32_t kShortages = 25;    // one in this many changes the available space
 
 // During its lifetime the file system of `path` has only this much space left.
-class FullDisk {
+class DiskFiller {
  public:
-  FullDisk(const std::string& path, uint64_t room) : _ballast(ballastOf(path)) {
+  DiskFiller(const std::string& path, uint64_t room) : _ballast(ballastOf(path)) {
     const uint64_t free = platform::freeBytes(_ballast.parent_path());
     const int file = open(_ballast.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600);
     TL_ASSERT(file >= 0);
@@ -29,9 +29,9 @@ class FullDisk {
         posix_fallocate(file, 0, static_cast<off_t>(free - std::min(free, room)) + 1));
     close(file);
   }
-  ~FullDisk() { std::filesystem::remove(_ballast); }
-  FullDisk(const FullDisk&) = delete;
-  FullDisk& operator=(const FullDisk&) = delete;
+  ~DiskFiller() { std::filesystem::remove(_ballast); }
+  DiskFiller(const DiskFiller&) = delete;
+  DiskFiller& operator=(const DiskFiller&) = delete;
 
  private:
   const std::filesystem::path _ballast;
@@ -75,7 +75,7 @@ class Worker {
   void changeSpace() {
     if (isShort()) return endShortage();
     if (_task.shortage == Shortage::fullDisk) {
-      _shortage.emplace<FullDisk>(_task.path, _random() % 100000);
+      _shortage.emplace<DiskFiller>(_task.path, _random() % 100000);
     } else if (_task.shortage == Shortage::fileSize) {
       const uint64_t log = std::filesystem::file_size(newestLog(_task.path));
       const uint64_t sizes[] = {log + _random() % 300, log + _random() % 20000, _random() % 20000};
@@ -100,7 +100,7 @@ class Worker {
   const WorkerTask& _task;
   std::mt19937 _random;
   std::unique_ptr<salt::Index> _index;
-  std::variant<std::monostate, FileSizeLimit, FullDisk> _shortage;
+  std::variant<std::monostate, FileSizeLimit, DiskFiller> _shortage;
 };
 
 }  // namespace

@@ -9,9 +9,9 @@
 namespace salttest {
 
 // Forwards everything.
-class FileBetween : public leveldb::WritableFile {
+class FaultInjectionFile : public leveldb::WritableFile {
  public:
-  explicit FileBetween(leveldb::WritableFile* file) : _file(file) {}
+  explicit FaultInjectionFile(leveldb::WritableFile* file) : _file(file) {}
 
   leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
   leveldb::Status Flush() override { return _file->Flush(); }
@@ -23,26 +23,26 @@ class FileBetween : public leveldb::WritableFile {
 };
 
 // Forwards to the real files, but lets a test wrap every file that is opened for writing.
-class FilesBetween : public leveldb::EnvWrapper {
+class FaultInjectionEnv : public leveldb::EnvWrapper {
  public:
-  FilesBetween() : leveldb::EnvWrapper(leveldb::Env::Default()) {}
+  FaultInjectionEnv() : leveldb::EnvWrapper(leveldb::Env::Default()) {}
 
   leveldb::Status NewWritableFile(const std::string& path, leveldb::WritableFile** file) override {
-    return seen(path, target()->NewWritableFile(path, file), file);
+    return wrapIfOpened(path, target()->NewWritableFile(path, file), file);
   }
   leveldb::Status NewAppendableFile(const std::string& path,
                                     leveldb::WritableFile** file) override {
-    return seen(path, target()->NewAppendableFile(path, file), file);
+    return wrapIfOpened(path, target()->NewAppendableFile(path, file), file);
   }
 
  protected:
   // The wrapper of a file that was opened for writing; takes ownership.
-  virtual leveldb::WritableFile* between(const std::string& path, leveldb::WritableFile* file) = 0;
+  virtual leveldb::WritableFile* wrap(const std::string& path, leveldb::WritableFile* file) = 0;
 
  private:
-  leveldb::Status seen(const std::string& path, const leveldb::Status& status,
-                       leveldb::WritableFile** file) {
-    if (status.ok()) *file = between(path, *file);
+  leveldb::Status wrapIfOpened(const std::string& path, const leveldb::Status& status,
+                               leveldb::WritableFile** file) {
+    if (status.ok()) *file = wrap(path, *file);
     return status;
   }
 };
