@@ -58,7 +58,7 @@ enum class OpenMode { create, existing };
 // leveldb 1.23 ends the process when it fails to flush a memtable during a compaction on demand. So
 // no such compaction starts on a nearly full disk or beside another one, and writes that would fill
 // the memtable meanwhile wait up to a second. Bulk ingest has already waited, holding no lock (see
-// WaitWhileTidying).
+// WaitForMaintenance).
 class BatchWriter {
  public:
   // The open database must outlive this object.

@@ -204,7 +204,7 @@ bool index::Sync() {
 bool index::Compact() {
   _schedule.waitForMerge();
   if (interrupted()) return true;
-  const Activity::Work compaction(_schedule.housekeeping());
+  const Activity::Work compaction(_schedule.maintenance());
   const bool done = compactRange(nullptr, nullptr);
   _database.env->waitForDisk();
   if (done) makeMissingPostings();
@@ -224,8 +224,8 @@ void index::removeObsoleteFiles() const {
   (void)_writer.compact(&behind, &behind);
 }
 
-void index::WaitWhileTidying() {
-  _schedule.waitForHousekeeping();
+void index::WaitForMaintenance() {
+  _schedule.waitForMaintenance();
 }
 
 void index::Interrupt() {
@@ -300,7 +300,7 @@ IndexView::~IndexView() {
   iterators.clear();
   if (options.fill_cache || idx._compactionsEnded == _compactionsEnded) return;
   // Not on this thread: it takes as long as a memtable flush, and waits for a running compaction.
-  (void)idx._tidying.async([&owner = idx] {
+  (void)idx._fileCleanup.async([&owner = idx] {
     if (!owner.interrupted()) owner.removeObsoleteFiles();
   });
 }

@@ -16,7 +16,7 @@
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/DocSet.h"
-#include "salt/Helper.h"
+#include "salt/TwoThreadRunner.h"
 #include "salt/Index.h"
 #include "salt/Postings.h"
 #include "salt/ScanCache.h"
@@ -87,7 +87,7 @@ class index final : public Index {
                                      const PlacesCallback& callback) const override;
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override;
-  void WaitWhileTidying() override;
+  void WaitForMaintenance() override;
   void Interrupt() override;
   [[nodiscard]] bool interrupted() const { return _schedule.interrupted(); }
 
@@ -253,14 +253,14 @@ class index final : public Index {
   // deletions.
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
   mutable ScanCache _scanCache;  // thread-safe, as are the next two
-  mutable Helper _scanHelper;
+  mutable TwoThreadRunner _scanRunner;
   mutable Schedule _schedule;
 
   std::atomic<uint64_t> _compactionsEnded{0};  // on demand
 
   mutable SuffixStarts _starts;  // thread-safe; its thread reads the index
   // Removes the files that long reads kept alive; last, because it uses everything above.
-  mutable platform::SerialQueue _tidying{"tallow-tidy", platform::QueuePriority::low};
+  mutable platform::SerialQueue _fileCleanup{"tallow-tidy", platform::QueuePriority::low};
 };
 
 template <typename Change>

@@ -144,7 +144,7 @@ std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::
   if (byShard.size() <= kFewShards || view.iterators.size() == 1) {
     walk(0);
   } else {
-    _scanHelper.share(walk);
+    _scanRunner.run(walk);
   }
 
   const auto found = firstOfEach(byShard, sorted.size(), limit);

@@ -216,7 +216,7 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
   if (scan.shards() <= kFewShards || view.iterators.size() == 1) {
     scan.walk(0);
   } else {
-    _scanHelper.share([&scan](size_t walk) { scan.walk(walk); });
+    _scanRunner.run([&scan](size_t walk) { scan.walk(walk); });
   }
   const FoundPlaces found = scan.take();
   found.hot.deliver(callback);

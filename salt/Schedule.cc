@@ -26,7 +26,7 @@ constexpr milliseconds kInterval{250};
 constexpr uint64_t kPouring = 10000;
 constexpr seconds kLongestWaitForMore{60};
 
-constexpr seconds kLongestWaitForHousekeeping{10};
+constexpr seconds kMaxWaitForMaintenance{10};
 
 constexpr int kWaitOverComputing = 3;
 constexpr milliseconds kMostCredit{100};
@@ -96,8 +96,8 @@ void Schedule::waitForMerge() {
   while (_merging && !_interrupted) _changed.wait(_mutex);
 }
 
-void Schedule::waitForHousekeeping() {
-  _housekeeping.waitForEnd(kLongestWaitForHousekeeping);
+void Schedule::waitForMaintenance() {
+  _maintenance.waitForEnd(kMaxWaitForMaintenance);
 }
 
 void Schedule::interrupt() {
@@ -106,7 +106,7 @@ void Schedule::interrupt() {
     _interrupted = true;
     _changed.notify_all();
   }
-  _housekeeping.interrupt();
+  _maintenance.interrupt();
 }
 
 MergePace::MergePace(Activity& scans) : _scans(scans), _computed(platform::threadProcessorTime()) {}

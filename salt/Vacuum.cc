@@ -83,7 +83,7 @@ void index::runMerge(uint8_t shard) {
 void index::mergeInto(uint8_t shard) {
   const auto start = Clock::now();
   {
-    const Activity::Work merge(_schedule.housekeeping());
+    const Activity::Work merge(_schedule.maintenance());
     const bool merged = mergePages(shard, true);
     platform::returnFreeMemory();
     if (op.CompactAfterVacuum && !interrupted()) {

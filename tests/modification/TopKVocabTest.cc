@@ -63,7 +63,7 @@ class WatchedIndex final : public salt::Index {
   void ResetScanMetrics() override {}
   bool Validate() const override { return true; }
   std::string Dump() const override { return ""; }
-  void WaitWhileTidying() override {}
+  void WaitForMaintenance() override {}
   void Interrupt() override {}
 
  private:

@@ -153,13 +153,13 @@ TEST(BlockedDisk, IngestWaitsDuringACompaction) {
   WriteBlockingEnv disk(".ldb");
   const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
-  index->WaitWhileTidying();  // returns at once
+  index->WaitForMaintenance();  // returns at once
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
 
   disk.blockAfter(0);
   std::thread compacting([&index] { index->Compact(); });
   disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitWhileTidying(); });
+  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
   compacting.join();
 }
 
@@ -176,7 +176,7 @@ TEST(BlockedDisk, IngestWaitsDuringAMerge) {
   disk.blockAfter(2);  // lets the record of the merge pass, but not its pages
   index->Vacuum();
   disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitWhileTidying(); });
+  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
   EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
 }
 
@@ -199,7 +199,7 @@ TEST(BlockedDisk, AnInterruptionEndsAMergeAndAllWaits) {
   index->Vacuum();
   disk.waitForWriter();
   std::thread compacting([&index] { EXPECT_TRUE(index->Compact()); });
-  std::thread adding([&index] { index->WaitWhileTidying(); });
+  std::thread adding([&index] { index->WaitForMaintenance(); });
   index->Interrupt();
   compacting.join();
   adding.join();
