@@ -280,7 +280,7 @@ void RPCServerConnection::pump() {
       });
     }
     const bool betweenMessages = !_framer.inMessage();
-    if (betweenMessages && _calls.size() >= kMaximumPendingCalls) return setReading(false);
+    if (betweenMessages && _calls.size() >= kMaxPendingCalls) return setReading(false);
     if (_unread.empty() && !readSome()) break;
     const RPCFramer::Piece piece = _framer.next(_unread);
     const std::string_view bytes = _unread.substr(0, piece.size);
@@ -486,7 +486,7 @@ void RPCServerConnection::checkQueue(size_t bytes) {
   uint64_t waiting = 0;
   sd_bus_get_n_queued_write(_bus, &waiting);
   _queuedBytes = waiting == 0 ? 0 : _queuedBytes + bytes;
-  if (waiting < kMaximumQueuedMessages && _queuedBytes <= kMaximumQueuedBytes) return;
+  if (waiting < kMaxQueuedMessages && _queuedBytes <= kMaxQueuedBytes) return;
   endBecause("its replies are not read");
 }
 

@@ -23,7 +23,7 @@ constexpr size_t kLogLineBytes = 100;
 constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one compaction needs at a time
 // A batch takes up to three times its size in a memtable.
 constexpr size_t kBatchesBesideCompaction = kWriteBufferBytes / 4;
-constexpr std::chrono::seconds kLongestWait{1};  // with locks held that searches need
+constexpr std::chrono::seconds kMaxWait{1};  // with locks held that searches need
 
 leveldb::Status open(const leveldb::Options& options, const std::string& path,
                      std::unique_ptr<leveldb::DB>* db) {
@@ -75,7 +75,7 @@ bool BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end
 }
 
 bool BatchWriter::waitForCompaction(size_t bytes) {
-  const auto deadline = std::chrono::steady_clock::now() + kLongestWait;
+  const auto deadline = std::chrono::steady_clock::now() + kMaxWait;
   while (_compacts && (_logTorn || bytes > _room)) {
     if (_compacted.wait_until(_mutex, deadline) == std::cv_status::timeout) return false;
   }

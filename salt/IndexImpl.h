@@ -16,12 +16,12 @@
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/DocSet.h"
-#include "salt/TwoThreadRunner.h"
 #include "salt/Index.h"
 #include "salt/Postings.h"
 #include "salt/ScanCache.h"
 #include "salt/Schedule.h"
 #include "salt/SuffixStarts.h"
+#include "salt/TwoThreadRunner.h"
 
 namespace salt {
 

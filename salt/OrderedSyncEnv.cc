@@ -11,7 +11,7 @@ namespace salt {
 
 namespace {
 
-constexpr size_t kMostUnsyncedTables = 4;
+constexpr size_t kMaxUnsyncedTables = 4;
 
 bool isTable(std::string_view path) {
   return path.ends_with(".ldb");
@@ -207,7 +207,7 @@ leveldb::Status OrderedSyncEnv::failure() {
 void OrderedSyncEnv::finish(std::unique_ptr<leveldb::WritableFile> table) {
   {
     platform::MutexLock lock(_mutex);
-    while (_tables == kMostUnsyncedTables) _tableDone.wait(_mutex);
+    while (_tables == kMaxUnsyncedTables) _tableDone.wait(_mutex);
     ++_tables;
   }
   inOrder([file = std::shared_ptr<leveldb::WritableFile>(std::move(table))] {

@@ -126,7 +126,7 @@ class PrefixScan {
 // Threads of one scan through the pages. A device has more processors, but during a search it also
 // indexes, and displays what was found.
 constexpr size_t kPageWalks = 2;
-constexpr unsigned kFewShards = 2;  // not worth waking a thread
+constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // The result of a scan for places.
 struct FoundPlaces {
@@ -213,7 +213,7 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
   const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
   if (most > limit) return std::nullopt;
   PlacesScan scan(view, prefix, !known);
-  if (scan.shards() <= kFewShards || view.iterators.size() == 1) {
+  if (scan.shards() <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
     scan.walk(0);
   } else {
     _scanRunner.run([&scan](size_t walk) { scan.walk(walk); });

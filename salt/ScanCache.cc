@@ -29,7 +29,7 @@ void ScanCache::keep(std::string_view prefix, uint64_t generation,
   _entries.push_front({std::string(prefix), std::move(found)});
   _byPrefix.emplace(_entries.front().prefix, _entries.begin());
   _bytes += _entries.front().bytes();
-  while (_bytes > kMostBytes) {
+  while (_bytes > kMaxBytes) {
     _bytes -= _entries.back().bytes();
     _byPrefix.erase(_entries.back().prefix);
     _entries.pop_back();

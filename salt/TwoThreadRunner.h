@@ -9,9 +9,9 @@
 
 namespace salt {
 
-// Splits a short job between the calling thread and a second one, which takes its half if it wakes up
-// in time: waking a thread can take longer than the job, and nobody waits for a half that has not
-// begun. Any thread.
+// Splits a short job between the calling thread and a second one, which takes its half if it wakes
+// up in time: waking a thread can take longer than the job, and nobody waits for a half that has
+// not begun. Any thread.
 class TwoThreadRunner {
  public:
   // Runs half(0) on the calling thread and half(1) concurrently on the second thread. half(1) is

@@ -18,12 +18,12 @@ uint64_t idOf(uint32_t docID, uint16_t zoneID) {
 
 }  // namespace
 
-ZoneTextCache::ZoneTextCache(const index& owner, uint64_t mostFileBytes)
+ZoneTextCache::ZoneTextCache(const index& owner, uint64_t maxFileBytes)
     : _idx(owner),
       _iterator(owner.db->NewIterator(readOptions(false))),
       _file(open(owner.path().c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, S_IRUSR | S_IWUSR)) {
   if (_file.get() >= 0) {
-    _mostFileBytes = std::min(mostFileBytes, platform::freeBytes(owner.path()) / 4);
+    _maxFileBytes = std::min(maxFileBytes, platform::freeBytes(owner.path()) / 4);
   }
 }
 
@@ -76,7 +76,7 @@ void ZoneTextCache::keepRead() {
     _fileBytes += _read.size();
   }
   _read.clear();
-  if (_fileBytes > _mostFileBytes) {
+  if (_fileBytes > _maxFileBytes) {
     _kept.clear();
     _fileBytes = 0;
   }

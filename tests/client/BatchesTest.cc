@@ -83,15 +83,15 @@ TEST(Batches, RefusesAQueryBeyondTheRecordLimits) {
     EXPECT_TRUE(!bytes || read.initWithData(*bytes));
     return error ? error->message : std::string();
   };
-  constexpr size_t kBytes = client::kMaximumArrayBytes;
+  constexpr size_t kBytes = client::kMaxArrayBytes;
   auto high = std::make_shared<TLQueryNode>();
-  for (int i = 1; i < kMaximumRecordDepth; ++i) high = inner({high});
+  for (int i = 1; i < kMaxRecordDepth; ++i) high = inner({high});
   EXPECT_EQ(encoded(high, kBytes), "");
   high = inner({high});
   EXPECT_EQ(encoded(high, kBytes), "the query nests conditions more than 256 deep");
   for (int i = 0; i < 100000; ++i) high = inner({high});
   EXPECT_EQ(encoded(high, kBytes), "the query nests conditions more than 256 deep");
-  std::vector<std::shared_ptr<TLQueryNode>> many(kMaximumRecordElements - 1, inner({}));
+  std::vector<std::shared_ptr<TLQueryNode>> many(kMaxRecordElements - 1, inner({}));
   EXPECT_EQ(encoded(inner(many), kBytes), "");
   many.push_back(inner({}));
   EXPECT_EQ(encoded(inner(many), kBytes), "the query holds more than 262144 conditions");

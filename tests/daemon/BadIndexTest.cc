@@ -157,7 +157,7 @@ TEST_F(BadIndexTest, KillsDoNotCountAsDamage) {
 
 // The disk is full for files above a size that only the merge exceeds.
 TEST_F(BadIndexTest, AFullDiskInAMergeLosesNothing) {
-  constexpr rlim_t kMostBytes = 64 * 1024;
+  constexpr rlim_t kMaxBytes = 64 * 1024;
   signal(SIGXFSZ, SIG_IGN);  // inherited by the daemon
   editOptions([](auto& op) { op.MaxHotSuffixes = 4000; });
   {
@@ -165,7 +165,7 @@ TEST_F(BadIndexTest, AFullDiskInAMergeLosesNothing) {
     client::SearchServiceProxy service(daemon.runtimeDirectory());
     client::DebugServiceProxy debug(daemon.runtimeDirectory());
     EXPECT_EQ(search(service, "a", "bad"), 10);
-    rlimit limit{kMostBytes, RLIM_INFINITY};
+    rlimit limit{kMaxBytes, RLIM_INFINITY};
     ASSERT_EQ(prlimit(daemon.pid(), RLIMIT_FSIZE, &limit, nullptr), 0);
     EXPECT_TRUE(debug.forceVacuumAndCompact("bad", nullptr));
     EXPECT_TRUE(daemon.waitForLog("SALT Error writing to db: IO error"));

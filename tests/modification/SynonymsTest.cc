@@ -105,7 +105,7 @@ TEST_F(SynonymFile, UnreadableKeepsTheSynonymsAndReportsWhy) {
     EXPECT_TRUE(log.has("error TALSynonyms: Empty synonym file: " + path));
     log.clear();
   }
-  EXPECT_FALSE(load(std::string(TALSynonyms::kMaximumFileSize + 1, 'x')));
+  EXPECT_FALSE(load(std::string(TALSynonyms::kMaxFileBytes + 1, 'x')));
   EXPECT_EQ(error->code, EFBIG);
   EXPECT_TRUE(log.contains("error TALSynonyms: Failed to read synonym file: " + path +
                            " with error: POSIX "));
@@ -147,7 +147,7 @@ TEST_F(SynonymFile, GivesEachSynonymItsScore) {
 }
 
 TEST(ShippedSynonyms, AreAllUsableAndPlain) {
-  const auto bytes = platform::readFile(TALLOW_SYNONYMS, TALSynonyms::kMaximumFileSize, nullptr);
+  const auto bytes = platform::readFile(TALLOW_SYNONYMS, TALSynonyms::kMaxFileBytes, nullptr);
   ASSERT_TRUE(bytes);
   EXPECT_EQ(bytes->find_first_not_of("abcdefghijklmnopqrstuvwxyz ,\n"), std::string::npos);
   const TLString text = platform::fromUTF8(*bytes);

@@ -325,7 +325,7 @@ TEST_F(RPCTest, ConnectionsAreLimitedAndSilentOnesAreEvicted) {
   const Client working(path());
   EXPECT_EQ(working.echo("before"), "before");
   std::vector<int> silent;
-  for (size_t i = 0; i < platform::kMaximumConnections; ++i) silent.push_back(connectTo(path()));
+  for (size_t i = 0; i < platform::kMaxConnections; ++i) silent.push_back(connectTo(path()));
   EXPECT_TRUE(waitForEnd(silent.front()));
   EXPECT_EQ(Client(path()).echo("new"), "new");
   EXPECT_EQ(working.echo("after"), "after");
@@ -334,13 +334,13 @@ TEST_F(RPCTest, ConnectionsAreLimitedAndSilentOnesAreEvicted) {
     close(descriptor);
   }
   EXPECT_EQ(log.count("not authenticated in time") + log.count("evicted for a new connection"),
-            platform::kMaximumConnections);
+            platform::kMaxConnections);
   EXPECT_EQ(working.echo("still"), "still");
 }
 
 TEST_F(RPCTest, AConnectionWithCallsInFlightIsNotEvicted) {
   std::vector<std::unique_ptr<Client>> busy;
-  for (size_t i = 0; i < platform::kMaximumConnections; ++i) {
+  for (size_t i = 0; i < platform::kMaxConnections; ++i) {
     busy.push_back(std::make_unique<Client>(path()));
     held = {};
     busy.back()->hold();
@@ -365,7 +365,7 @@ TEST_F(RPCTest, APausedConnectionStillSendsAndNoticesTheEnd) {
     uint64_t cookie = 0;
     ASSERT_GE(sd_bus_send(client.bus, large, &cookie), 0);
     sd_bus_message_unref(large);
-    for (size_t i = 0; i < platform::kMaximumPendingCalls; ++i) {
+    for (size_t i = 0; i < platform::kMaxPendingCalls; ++i) {
       held = {};
       client.hold();
       replies.push_back(held.get_future().get());
@@ -412,7 +412,7 @@ TEST_F(RPCTest, RefusesContentThatDoesNotMatchItsSignature) {
   EXPECT_THAT(call("List", "as", "\x10\0\0\0\4\0\0\0abcd"s),
               testing::AnyOf(testing::HasSubstr(platform::kRPCInvalidArgs), testing::IsEmpty()));
   std::string many("\0\0\0\0", 4);
-  const size_t count = platform::kMaximumArrayElements + 1;
+  const size_t count = platform::kMaxArrayElements + 1;
   for (size_t i = 0; i < count; ++i) many += std::string(8, '\0');
   many.resize(many.size() - 3);  // the last element has no padding
   const auto length = static_cast<uint32_t>(many.size() - 4);
@@ -477,7 +477,7 @@ TEST(RPCRequestBudget, LimitsTheBytesOfAllRequests) {
   platform::RPCRequestBudget budget;
   int resumed = 0;
   const auto resume = [&resumed] { ++resumed; };
-  const size_t half = platform::kMaximumWaitingBytes / 2;
+  const size_t half = platform::kMaxWaitingBytes / 2;
   EXPECT_TRUE(budget.take(half + 1, resume));
   EXPECT_FALSE(budget.take(half, resume));
   EXPECT_TRUE(budget.take(platform::kSmallMessageBytes, resume));

@@ -176,12 +176,12 @@ TEST_F(QueryTree, ATreeHigherThanAQueryCarriesDoesNotParse) {
             u"kTLItemSubject = c",
         true);
   };
-  const auto highest = alternating(Additions::kMaximumTreeHeight - 2);
+  const auto highest = alternating(Additions::kMaxTreeHeight - 2);
   ASSERT_TRUE(highest->hasRoot());
   TLQuery read;
   EXPECT_TRUE(read.initWithData(highest->data()));
   EXPECT_TRUE(read.isEqual(*highest));
-  for (const size_t levels : {Additions::kMaximumTreeHeight, size_t{100000}}) {
+  for (const size_t levels : {Additions::kMaxTreeHeight, size_t{100000}}) {
     log.clear();
     EXPECT_FALSE(alternating(levels)->hasRoot());
     EXPECT_EQ(log.count("fault TLQueryParsing: Failed to parse query: "), 1u);

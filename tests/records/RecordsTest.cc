@@ -289,24 +289,24 @@ TEST(Records, WrittenItemsStayInWireFormUntilRead) {
 
 TEST(Records, NestingIsBounded) {
   TLQueryNode deepest;
-  EXPECT_TRUE(deepest.initWithData(chainBytes(kMaximumRecordDepth)));
-  EXPECT_EQ(deepest.data(), chainBytes(kMaximumRecordDepth));
+  EXPECT_TRUE(deepest.initWithData(chainBytes(kMaxRecordDepth)));
+  EXPECT_EQ(deepest.data(), chainBytes(kMaxRecordDepth));
   EXPECT_TRUE(deepest.copyWithZone()->isEqual(deepest));
   EXPECT_EQ(deepest.copyWithZone()->hash(), deepest.hash());
   EXPECT_FALSE(deepest.dictionaryRepresentation().empty());
-  for (const int levels : {kMaximumRecordDepth + 1, 100000}) {
+  for (const int levels : {kMaxRecordDepth + 1, 100000}) {
     TLQueryNode node;
     EXPECT_FALSE(node.initWithData(chainBytes(levels))) << levels;
   }
   const auto built = chain(100000);
-  EXPECT_DEATH((void)built->data(), "kMaximumRecordDepth");
-  EXPECT_DEATH((void)built->hash(), "kMaximumRecordDepth");
+  EXPECT_DEATH((void)built->data(), "kMaxRecordDepth");
+  EXPECT_DEATH((void)built->hash(), "kMaxRecordDepth");
 }
 
 TEST(Records, NumberOfElementsIsBounded) {
   for (const char* element : {"\x5a\x00", "\x52\x00"}) {
     std::string input;
-    for (uint32_t i = 0; i < kMaximumRecordElements; ++i) input.append(element, 2);
+    for (uint32_t i = 0; i < kMaxRecordElements; ++i) input.append(element, 2);
     EXPECT_TRUE(TLAttribute().initWithData(input));
     input.append(element, 2);
     EXPECT_FALSE(TLAttribute().initWithData(input));

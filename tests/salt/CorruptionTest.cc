@@ -158,7 +158,7 @@ TEST_F(CorruptionTest, RecoversTheOtherBlocksOfADamagedLog) {
 // Reads do not verify checksums, but a block must decompress. Everything in other blocks and tables
 // is delivered, then the scan logs the error.
 TEST_F(CorruptionTest, ScansEverythingOutsideADamagedBlock) {
-  constexpr size_t kMostKeys = 32 * 1024 / 30;  // of one block
+  constexpr size_t kMaxKeys = 32 * 1024 / 30;  // of one block
   flip(tables.at(0), 0);
   flip(tables.at(1), 0);
   const auto index = loadIndex(path);
@@ -176,7 +176,7 @@ TEST_F(CorruptionTest, ScansEverythingOutsideADamagedBlock) {
     for (; place != all.end() && !found.contains(*place); ++place) ++missing;
     EXPECT_TRUE(std::includes(found.begin(), found.end(), place, all.end())) << from;
     EXPECT_EQ(missing > 0, from != 201) << from;
-    EXPECT_LT(missing, kMostKeys) << from;
+    EXPECT_LT(missing, kMaxKeys) << from;
   }
   EXPECT_FALSE(index->Validate());
   EXPECT_EQ(log.count(line), 2u);

@@ -82,7 +82,7 @@ TEST(TopTokens, SkipsDeletedDocumentsAndVeryLongTokens) {
   const testsupport::TemporaryDirectory directory;
   const auto index = salttest::newIndex(directory / "i");
   addZone(*index, 1, 1, "b a  b a");
-  addZone(*index, 2, 1, " a " + std::string(saltsearch::kMostTokenBytes + 1, 'x'));
+  addZone(*index, 2, 1, " a " + std::string(saltsearch::kMaxTokenBytes + 1, 'x'));
   addZone(*index, 3, 1, "gone gone");
   addZone(*index, 4, 1, " ");
   ASSERT_TRUE(index->DeleteDoc(3));

@@ -53,7 +53,7 @@ class ZoneTextCacheTest : public testing::Test {
 };
 
 TEST_F(ZoneTextCacheTest, GivesTheSameWithAFileOfAnyLength) {
-  for (const uint64_t most : {salt::ZoneTextCache::kMostFileBytes, uint64_t{200000}, uint64_t{0}}) {
+  for (const uint64_t most : {salt::ZoneTextCache::kMaxFileBytes, uint64_t{200000}, uint64_t{0}}) {
     salt::ZoneTextCache texts(index(), most);
     expectAllTexts(&texts);
   }

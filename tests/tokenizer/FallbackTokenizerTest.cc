@@ -33,7 +33,7 @@ TEST(FallbackTokenizer, LowercasesAndSplits) {
 }
 
 TEST(FallbackTokenizer, TruncatesLongTextFirst) {
-  const size_t most = TLFallbackTokenizer::kMaximumTextSize;
+  const size_t most = TLFallbackTokenizer::kMaxTextUnits;
   const TLString fits(most, u'\u0130');  // lower case is longer
   EXPECT_EQ(TLFallbackTokenizer::getObject().CleanText(fits).size(), 2 * most + 1);
   EXPECT_EQ(TLFallbackTokenizer::getObject().CleanText(TLString(most, u'x') + u'y'),

@@ -176,7 +176,7 @@ TEST(Lexemon, EachLocaleAgreesWithTheTable) {
 
 // Each of these is one run without a space; if a step is not linear, the test does not end.
 TEST_F(LexemonTest, LongestDocumentsOfOneKind) {
-  constexpr size_t kLongest = 2097151;
+  constexpr size_t kMaxUnits = 2097151;
   const struct {
     TLStringView first;
     TLStringView unit;
@@ -190,23 +190,23 @@ TEST_F(LexemonTest, LongestDocumentsOfOneKind) {
       {u"\u30AB", u"\uFF9E\u0301", 1},
       {u"\u0F40", u"\u0F73\u0F71", 1},
       {u"", u"\u1161", 1},
-      {u"", u"\u6F22", kLongest},
+      {u"", u"\u6F22", kMaxUnits},
       {u"", u"\U0001F600", 0},
       {u"", u"\U0001F468\u200D", 0},
       {u"a", u"\u200C", 1},
       {u"", u"1:", 1},
       {u"\u00E9", u"1:", 1},
       {u"", u"_", 0},
-      {u"", u"\u00E9 ", kLongest / 2},
-      {u"", u"1\u202F", (kLongest + 1) / 2 - 1},
+      {u"", u"\u00E9 ", kMaxUnits / 2},
+      {u"", u"1\u202F", (kMaxUnits + 1) / 2 - 1},
   };
   for (const auto& each : cases) {
-    const TLString text = TLString(each.first) + repeated(each.unit, kLongest - each.first.size());
+    const TLString text = TLString(each.first) + repeated(each.unit, kMaxUnits - each.first.size());
     const TextForm form = textForm(*fast, text);
     EXPECT_EQ(brokenRule(form), "") << platform::toUTF8(each.unit);
     EXPECT_EQ(form.offsets.size(), each.words) << platform::toUTF8(each.unit);
   }
-  EXPECT_EQ(textForm(*fast, repeated(u"a", kLongest)).text.size(), kLongest + 1);
+  EXPECT_EQ(textForm(*fast, repeated(u"a", kMaxUnits)).text.size(), kMaxUnits + 1);
 }
 
 TEST_F(LexemonTest, ManyThreadsShareOneTokenizer) {

@@ -39,7 +39,7 @@ constexpr const char* kUsage =
 // The classes of clients by number; the first is refused while the device is locked.
 constexpr const char* kClasses[] = {"SysFileProtectionComplete", "default", "other"};
 constexpr const char* kName = "soak";
-constexpr size_t kMostMails = 200;  // per client
+constexpr size_t kMaxMails = 200;   // per client
 constexpr milliseconds kPause{20};  // maximum, between two calls of a client
 constexpr client::Patience kPatience{20000};
 
@@ -113,7 +113,7 @@ class Client {
     for (const auto& [mail, state] : _mails) {  // sends again what a kill interrupted
       if (state == State::unknown && numbers.size() < 20) numbers.push_back(mail);
     }
-    for (size_t i = _random() % 5 + 1; i > 0 && _mails.size() < kMostMails; --i) {
+    for (size_t i = _random() % 5 + 1; i > 0 && _mails.size() < kMaxMails; --i) {
       numbers.push_back(_next++);
       _mails[numbers.back()] = State::unknown;
     }
@@ -150,7 +150,7 @@ class Client {
         _mails[mail] = state;
       }
     }
-    while (_gone.size() > kMostMails) _gone.erase(_gone.begin());
+    while (_gone.size() > kMaxMails) _gone.erase(_gone.begin());
   }
 
   void searchOne() {
