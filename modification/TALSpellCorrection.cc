@@ -51,7 +51,7 @@ bool isPrintableASCII(std::string_view word) {
   return std::all_of(word.begin(), word.end(), [](char c) { return c >= 0x20 && c <= 0x7E; });
 }
 
-std::string_view withoutTrailingBlank(std::string_view token) {
+std::string_view withoutTrailingSpace(std::string_view token) {
   if (token.ends_with(' ')) token.remove_suffix(1);
   return token;
 }
@@ -159,7 +159,7 @@ void TALSpellCorrection::score(const std::vector<saltsearch::Term>& terms, size_
 std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidates(
     std::string_view word, saltsearch::Term term, const salt::Index& textStore) const {
   const bool wholeWord = word.ends_with(' ');
-  word = withoutTrailingBlank(word);
+  word = withoutTrailingSpace(word);
   if (!isPrintableASCII(word)) {
     log().debug("Token has unsupported char.");
   } else {
@@ -233,7 +233,7 @@ std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidatesFromTopKVo
   if (vocab == nullptr) return candidates;
   for (const std::string& entry : *vocab) {
     if (entry.size() < kMinEntryBytes || entry.size() > kMaxEntryBytes) continue;
-    const auto score = closeness(word, withoutTrailingBlank(entry));
+    const auto score = closeness(word, withoutTrailingSpace(entry));
     if (!score) continue;
     if (static_cast<int64_t>(candidates.size()) >= _candidateBudget) break;
     candidates.push_back({*score, 0, 0, entry});
