@@ -13,8 +13,7 @@ class Percentiles {
 
   [[nodiscard]] size_t size() const { return _values.size(); }
 
-  // The smallest value that is not below at least the share `part` (0 to 1) of all values; 0
-  // without values.
+  // The nearest-rank percentile for `part` (0 to 1); 0 without values.
   [[nodiscard]] double at(double part) const {
     if (_values.empty()) return 0;
     std::vector<double> sorted = _values;

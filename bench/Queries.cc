@@ -13,9 +13,9 @@ namespace {
 
 constexpr size_t kSampledMails = 2000;
 constexpr size_t kSampledUnits = 20000;  // of a body, in UTF-16 units
-constexpr size_t kLongestPrefix = 4;
-constexpr size_t kShortestWord = 2;
-constexpr size_t kShortestMistyped = 5;
+constexpr size_t kMaxPrefix = 4;
+constexpr size_t kMinWord = 2;
+constexpr size_t kMinMistyped = 5;
 
 constexpr TLStringView kAsTyped =
     u"queryModification.enableSpellModification=NO,"
@@ -32,8 +32,7 @@ std::vector<std::string> lettersOf(TLStringView text) {
   for (size_t at = 0; at < text.size();) {
     const size_t start = at;
     while (at < text.size() && isLetter(text[at])) ++at;
-    if (at - start >= kShortestWord)
-      words.push_back(platform::toUTF8(text.substr(start, at - start)));
+    if (at - start >= kMinWord) words.push_back(platform::toUTF8(text.substr(start, at - start)));
     if (at == start) ++at;
   }
   return words;
@@ -60,8 +59,8 @@ void QuerySource::see(const client::EncodedItem& encoded) {
 }
 
 std::vector<std::string> QuerySource::phrase(size_t words) {
-  constexpr size_t kMostTries = 100000;
-  for (size_t i = 0; i < kMostTries && !_mails.empty(); ++i) {
+  constexpr size_t kMaxTries = 100000;
+  for (size_t i = 0; i < kMaxTries && !_mails.empty(); ++i) {
     const auto& text = _mails[below(_mails.size())][below(2)];
     if (text.size() < words) continue;
     const auto first = text.begin() + static_cast<ptrdiff_t>(below(text.size() - words + 1));
@@ -72,16 +71,16 @@ std::vector<std::string> QuerySource::phrase(size_t words) {
 
 std::string QuerySource::draw(size_t words) {
   std::vector<std::string> parts = phrase(words);
-  parts.back().resize(std::min(parts.back().size(), 1 + below(kLongestPrefix)));
+  parts.back().resize(std::min(parts.back().size(), 1 + below(kMaxPrefix)));
   return joined(parts);
 }
 
 QuerySource::Mistyped QuerySource::drawMistyped() {
-  constexpr size_t kMostTries = 1000;
-  for (size_t i = 0; i < kMostTries; ++i) {
-    std::vector<std::string> parts = phrase(kMaximumWords);
-    std::string& word = parts[below(kMaximumWords)];
-    if (word.size() < kShortestMistyped) continue;
+  constexpr size_t kMaxTries = 1000;
+  for (size_t i = 0; i < kMaxTries; ++i) {
+    std::vector<std::string> parts = phrase(kMaxWords);
+    std::string& word = parts[below(kMaxWords)];
+    if (word.size() < kMinMistyped) continue;
     word = mistype(word);
     return {joined(parts), word};
   }
@@ -108,7 +107,7 @@ std::string QuerySource::mistype(std::string word) {
 
 std::vector<std::string> QuerySource::drawAll(size_t count) {
   std::vector<std::string> queries;
-  for (size_t i = 0; i < count; ++i) queries.push_back(draw(1 + i % kMaximumWords));
+  for (size_t i = 0; i < count; ++i) queries.push_back(draw(1 + i % kMaxWords));
   return queries;
 }
 
@@ -143,7 +142,7 @@ TimedSearch timedSearch(client::SearchServiceProxy& service, const std::string& 
   if (asTyped) query.setSearchParams(TLParamsManager::paramsFromString(kAsTyped));
   std::optional<TLError> error;
   const double start = secondsNow();
-  const auto items = service.searchItems(query, 0, protectionClass, kMaximumResults, &error);
+  const auto items = service.searchItems(query, 0, protectionClass, kMaxResults, &error);
   const double seconds = secondsNow() - start;
   if (!items) throw std::runtime_error("search: " + platform::printable(error));
   return {seconds, items->size()};

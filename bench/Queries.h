@@ -14,10 +14,10 @@
 namespace bench {
 
 // Upper bound of words in a query.
-inline constexpr size_t kMaximumWords = 3;
+inline constexpr size_t kMaxWords = 3;
 
 // Number of results a search asks for: enough for a list on a screen.
-inline constexpr int64_t kMaximumResults = 50;
+inline constexpr int64_t kMaxResults = 50;
 
 // Draws queries from a uniform sample, of fixed size, of the mail it is shown once. The same mail
 // and seed give the same queries.

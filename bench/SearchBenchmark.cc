@@ -100,13 +100,13 @@ int run(int argc, char** argv) {
   // The first search makes the index build the Bloom filter that later ones use.
   if (!mistyped.empty()) static_cast<void>(bench::timedSearch(service, mistyped.front()));
   bench::Percentiles all;
-  std::array<bench::Percentiles, bench::kMaximumWords> byWords;
+  std::array<bench::Percentiles, bench::kMaxWords> byWords;
   uint64_t results = 0;
   const double cpuBefore = daemon.cpuSeconds();
   for (size_t i = 0; i < queries.size(); ++i) {
     const bench::TimedSearch timed = bench::timedSearch(service, queries[i]);
     all.add(timed.seconds);
-    byWords[i % bench::kMaximumWords].add(timed.seconds);
+    byWords[i % bench::kMaxWords].add(timed.seconds);
     results += timed.results;
     if (verbose) fmt::print("{:8.2f} {:3} {}\n", timed.seconds * 1e3, timed.results, queries[i]);
   }
@@ -117,7 +117,7 @@ int run(int argc, char** argv) {
 
   std::string line =
       fmt::format("queries={} results={}", queries.size(), results) + figures("all", all);
-  for (size_t i = 0; i < bench::kMaximumWords; ++i) {
+  for (size_t i = 0; i < bench::kMaxWords; ++i) {
     line += figures(fmt::format("words{}", i + 1), byWords[i]);
   }
   if (!mistyped.empty()) {

@@ -88,7 +88,7 @@ std::shared_ptr<TLQueryNode> builtTree(const TLQuery& query, TLErrorOut error) {
   if (query.hasRoot()) return query.root()->copyWithZone();
   platform::setError(error, {kErrorDomain, kUnreadable,
                              fmt::format("the expression nests && and || more than {} deep",
-                                         TLQueryAdditions::kMaximumTreeHeight - 2)});
+                                         TLQueryAdditions::kMaxTreeHeight - 2)});
   return nullptr;
 }
 

@@ -225,7 +225,7 @@ class Expansion {
     }
   }
 
-  // The same for conditions of the query language, which are at most kMaximumRecordDepth high.
+  // The same for conditions of the query language, which are at most kMaxRecordDepth high.
   std::optional<Alternatives> of(const TLQueryNode& node) {
     if (node.mergeOp() == TLQueryNodeMergeOp::LEAF) return ofLeaf(node);
     const bool isAnd = node.mergeOp() == TLQueryNodeMergeOp::AND;

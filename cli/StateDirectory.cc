@@ -8,9 +8,9 @@
 #include <filesystem>
 
 #include "cli/Commands.h"
-#include "rpc/Channel.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
+#include "rpc/Channel.h"
 
 namespace cli {
 

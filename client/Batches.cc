@@ -38,12 +38,12 @@ std::string brokenLimit(const TLQuery& query) {
   std::vector<const TLQueryNode*> level;
   if (query.hasRoot()) level.push_back(query.root().get());
   for (int height = 1; !level.empty(); ++height) {
-    if (height > kMaximumRecordDepth) {
-      return fmt::format("nests conditions more than {} deep", kMaximumRecordDepth);
+    if (height > kMaxRecordDepth) {
+      return fmt::format("nests conditions more than {} deep", kMaxRecordDepth);
     }
     records += level.size();
-    if (records > kMaximumRecordElements) {
-      return fmt::format("holds more than {} conditions", kMaximumRecordElements);
+    if (records > kMaxRecordElements) {
+      return fmt::format("holds more than {} conditions", kMaxRecordElements);
     }
     std::vector<const TLQueryNode*> next;
     for (const TLQueryNode* node : level) {
@@ -69,7 +69,7 @@ std::optional<std::vector<std::span<const Element>>> split(std::span<const Eleme
                                       nameOf(elements[i]).substr(0, kNameLength), size, limit)});
       return std::nullopt;
     }
-    if (bytes + size > limit || i - begin == rpc::kMaximumArrayElements) {
+    if (bytes + size > limit || i - begin == rpc::kMaxArrayElements) {
       pieces.push_back(elements.subspan(begin, i - begin));
       begin = i;
       bytes = 0;

@@ -13,7 +13,7 @@
 namespace client {
 
 // D-Bus closes a connection over a longer array.
-inline constexpr size_t kMaximumArrayBytes = size_t{64} << 20;
+inline constexpr size_t kMaxArrayBytes = size_t{64} << 20;
 
 // An item in wire form, with its name in messages.
 struct EncodedItem {
@@ -27,14 +27,14 @@ struct EncodedItem {
 // possible. An empty list gives no piece. Nullopt, with an error that names it, if a single item or
 // text exceeds the limit.
 [[nodiscard]] std::optional<std::vector<std::span<const EncodedItem>>> splitItems(
-    std::span<const EncodedItem> items, TLErrorOut error, size_t limit = kMaximumArrayBytes);
+    std::span<const EncodedItem> items, TLErrorOut error, size_t limit = kMaxArrayBytes);
 [[nodiscard]] std::optional<std::vector<std::span<const std::string>>> splitTexts(
-    std::span<const std::string> texts, TLErrorOut error, size_t limit = kMaximumArrayBytes);
+    std::span<const std::string> texts, TLErrorOut error, size_t limit = kMaxArrayBytes);
 
 // The query in wire form. Nullopt, with an error that says why, if it exceeds a limit of the
-// daemon: kMaximumRecordDepth levels of nodes, kMaximumRecordElements records in all, or `limit`
+// daemon: kMaxRecordDepth levels of nodes, kMaxRecordElements records in all, or `limit`
 // bytes.
 [[nodiscard]] std::optional<std::string> encode(const TLQuery& query, TLErrorOut error,
-                                                size_t limit = kMaximumArrayBytes);
+                                                size_t limit = kMaxArrayBytes);
 
 }  // namespace client

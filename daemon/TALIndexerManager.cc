@@ -17,7 +17,7 @@ constexpr size_t kOpeningDescriptors = 16;  // more than opening the two databas
 bool createClassDirectory(const std::string& root, const std::string& protectionClass,
                           TLErrorOut error) {
   if (!platform::namesOneDirectory(protectionClass)) {
-    const bool tooLong = protectionClass.size() > platform::kLongestName;
+    const bool tooLong = protectionClass.size() > platform::kMaxNameBytes;
     platform::setError(error, platform::posixError(tooLong ? ENAMETOOLONG : EINVAL,
                                                    "a protection class must name one directory"));
     return false;

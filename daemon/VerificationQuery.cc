@@ -7,7 +7,7 @@
 
 namespace {
 
-constexpr size_t kFewestSubjects = 5;
+constexpr size_t kMinSubjects = 5;
 constexpr TLStringView kClause = u"kTLItemSubject = ";
 constexpr TLStringView kClauseStart = u"kTLItemSubject = '";
 constexpr TLStringView kSeparator = u"' || ";
@@ -41,7 +41,7 @@ TLStringView trim(TLStringView text, TLStringView characters) {
 bool TALSearchService::isMailVerificationQuery(const TLQuery* query) {
   if (query == nullptr || !query->hasRoot()) return false;
   const TLQueryNode& root = *query->root();
-  return root.mergeOp() == TLQueryNodeMergeOp::OR && root.childsCount() >= kFewestSubjects &&
+  return root.mergeOp() == TLQueryNodeMergeOp::OR && root.childsCount() >= kMinSubjects &&
          std::all_of(root.childs().begin(), root.childs().end(),
                      [](const auto& child) { return isSubjectClause(*child); });
 }

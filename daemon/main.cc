@@ -94,7 +94,7 @@ int main(int argc, char** argv) {
   platform::SerialQueue captureQueue("com.quill.tallow.capture");
   auto captureSource = loop.addSignal(kCaptureSignal, [&captureQueue](int) {
     if (!captureQueue.async(platform::logCapturedState)) {
-      log().error("No thread for a capture of the state");
+      log().error("No thread to capture the state");
     }
   });
 

@@ -110,7 +110,7 @@ bool StoreCopy::setVocabulary(std::string_view vocabulary, TLErrorOut error) {
 uint64_t unusedStoreBytes(const std::string& path) {
   constexpr size_t kPageSizeAt = 16;
   constexpr size_t kFreePagesAt = 36;
-  constexpr uint64_t kLargestPage = 65536;  // stored as 1
+  constexpr uint64_t kMaxPageBytes = 65536;  // stored as 1
   std::array<char, kFreePagesAt + 4> header{};
   const platform::FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   if (file.get() < 0 || !platform::readAt(file.get(), 0, header.data(), header.size())) return 0;
@@ -120,5 +120,5 @@ uint64_t unusedStoreBytes(const std::string& path) {
     return value;
   };
   const uint64_t pageSize = number(kPageSizeAt, 2);
-  return number(kFreePagesAt, 4) * (pageSize == 1 ? kLargestPage : pageSize);
+  return number(kFreePagesAt, 4) * (pageSize == 1 ? kMaxPageBytes : pageSize);
 }

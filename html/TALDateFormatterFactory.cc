@@ -14,7 +14,7 @@ using Mode = TALDateFormatter::Mode;
 constexpr double kMillisInSecond = 1000;
 
 // A longer text is not a date; the bound also suits ICU's 32-bit lengths.
-constexpr size_t kLongestDate = 256;
+constexpr size_t kMaxDateUnits = 256;
 
 constexpr std::array kDateTimeStyles = {
     u"uuuu'-'MM'-'dd'T'HH':'mm':'ss",
@@ -90,7 +90,7 @@ TALDateFormatter::TALDateFormatter(const char16_t* pattern, Mode mode)
 TALDateFormatter::~TALDateFormatter() = default;
 
 std::optional<double> TALDateFormatter::dateFromString(TLStringView text) const {
-  if (text.empty() || text.size() > kLongestDate) return std::nullopt;
+  if (text.empty() || text.size() > kMaxDateUnits) return std::nullopt;
   // Even when strict, ICU accepts a text that ends before the last literal of its pattern.
   if (!text.ends_with(_ending)) return std::nullopt;
   const auto length = static_cast<int32_t>(text.size());
@@ -103,7 +103,7 @@ std::optional<double> TALDateFormatter::dateFromString(TLStringView text) const 
 }
 
 TLString TALDateFormatter::stringFromDate(double date) const {
-  TLString text(kLongestDate, u'\0');
+  TLString text(kMaxDateUnits, u'\0');
   platform::MutexLock lock(_mutex);
   UErrorCode status = U_ZERO_ERROR;
   const int32_t length = udat_format(_format->handle, date * kMillisInSecond, text.data(),

@@ -55,7 +55,7 @@ constexpr std::array<uint16_t, kOtherNames.size()> kOtherCodes = {
     8971, 9001, 9002, 9674, 9824, 9827, 9829, 9830,
 };
 
-constexpr size_t kLongestName = 8;
+constexpr size_t kMaxNameBytes = 8;
 
 std::unordered_map<std::string_view, uint16_t> makeCodes() {
   std::unordered_map<std::string_view, uint16_t> codes;
@@ -70,7 +70,7 @@ std::unordered_map<std::string_view, uint16_t> makeCodes() {
 
 uint16_t TALHTMLEntityCode(std::string_view name) {
   static const auto kCodes = makeCodes();
-  if (name.size() > kLongestName) return 0;
+  if (name.size() > kMaxNameBytes) return 0;
   const auto found = kCodes.find(name);
   return found == kCodes.end() ? uint16_t{0} : found->second;
 }

@@ -10,7 +10,7 @@
 namespace {
 
 constexpr size_t kFirstCapacity = 4096;
-constexpr uint64_t kLeastTitleLimit = 512;
+constexpr uint64_t kMinTitleLimit = 512;
 constexpr int kBlankPasses = 10;
 constexpr const char* kTitleKey = "SysTitleDocumentAttribute";
 
@@ -46,7 +46,7 @@ std::string titleFromBody(TLStringView body) {
 bool hasTitleText(const TALHTMLParsing& parsing) {
   if (parsing.titleLength == 0) return false;
   TALHTMLParsing title = parsing.fresh();
-  title.indexingLimit = std::max(parsing.indexingLimit, kLeastTitleLimit);
+  title.indexingLimit = std::max(parsing.indexingLimit, kMinTitleLimit);
   TALHTMLScanBuffer({parsing.titleStart, parsing.titleLength}, nullptr, nullptr, nullptr, title);
   return !title.uniChars.empty();
 }

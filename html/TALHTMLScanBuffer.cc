@@ -151,8 +151,8 @@ class Scanner {
   size_t _at = 0;
 };
 
-constexpr size_t kMaximumDigits = 15;
-constexpr long kMaximumCode = 0xFFFF;
+constexpr size_t kMaxDigits = 15;
+constexpr long kMaxCode = 0xFFFF;
 
 // The code of "#65" or "#x41", given without its "#"; 0 for none. The number ends at the first
 // non-digit.
@@ -162,8 +162,8 @@ long numericCode(std::string_view number) {
     base = 16;
     number.remove_prefix(1);
   }
-  const std::string digits(number.substr(0, kMaximumDigits));
-  return std::clamp(std::strtol(digits.c_str(), nullptr, base), 0L, kMaximumCode);
+  const std::string digits(number.substr(0, kMaxDigits));
+  return std::clamp(std::strtol(digits.c_str(), nullptr, base), 0L, kMaxCode);
 }
 
 long entityCode(std::string_view name) {

@@ -12,7 +12,7 @@ namespace {
 constexpr size_t kSnippetUnits = 300;  // reading stops once the output has this many
 constexpr char16_t kLineBreakSign = u'\u2008';
 // How far around the cut to look for a character of many units.
-constexpr size_t kLongestCharacter = 64;
+constexpr size_t kMaxCharacterUnits = 64;
 
 bool isLineBreak(char16_t unit) {
   return unit == u'\n' || unit == u'\r';
@@ -31,8 +31,8 @@ struct Character {
 };
 
 Character characterAround(TLStringView body, size_t at) {
-  const size_t from = at > kLongestCharacter ? at - kLongestCharacter : 0;
-  const TLStringView window = body.substr(from, 2 * kLongestCharacter);
+  const size_t from = at > kMaxCharacterUnits ? at - kMaxCharacterUnits : 0;
+  const TLStringView window = body.substr(from, 2 * kMaxCharacterUnits);
   UErrorCode status = U_ZERO_ERROR;
   thread_local const std::unique_ptr<icu::BreakIterator> iterator(
       icu::BreakIterator::createCharacterInstance(icu::Locale::getRoot(), status));

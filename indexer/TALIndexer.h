@@ -181,7 +181,7 @@ class TALIndexer {
   [[nodiscard]] TLError noIndexError() const TL_REQUIRES(_indexMutex);
 
   // Backpressure: waits while the text index is busy with a merge or compaction. On `_queue`.
-  void holdBack() TL_EXCLUDES(_indexMutex);
+  void waitForMaintenance() TL_EXCLUDES(_indexMutex);
   bool _addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
   bool makeDocURLs(const Items& docs, const std::string& bundleID, Batch& batch, TLErrorOut error);

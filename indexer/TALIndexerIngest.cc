@@ -74,7 +74,7 @@ void TALIndexer::addDocs(Items docs, std::string bundleID, Completion completion
       "addDocs",
       [this, docs = std::move(docs), bundleID = std::move(bundleID)] {
         std::optional<TLError> error;
-        holdBack();
+        waitForMaintenance();
         {
           MutexLock lock(_indexMutex);
           const uint64_t signpost = Signpost::identifierForObject(&docs);
@@ -116,7 +116,7 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
                                                     const TLString& clientStateName,
                                                     const std::string& bundleID) {
   std::optional<TLError> error;
-  if (!docs.empty()) holdBack();
+  if (!docs.empty()) waitForMaintenance();
   MutexLock lock(_indexMutex);
   if (!docs.empty()) {
     const uint64_t signpost = Signpost::identifierForObject(&docs);
@@ -138,8 +138,8 @@ std::optional<TLError> TALIndexer::addAndStoreState(const Items& docs,
 }
 
 // Holds no lock, so searches go on meanwhile.
-void TALIndexer::holdBack() {
-  if (const auto text = _text.get()) text->index->WaitWhileTidying();
+void TALIndexer::waitForMaintenance() {
+  if (const auto text = _text.get()) text->index->WaitForMaintenance();
 }
 
 bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErrorOut error) {

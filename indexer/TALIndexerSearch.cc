@@ -42,8 +42,8 @@ size_t itemsToLog(const TLParameters& params) {
 }
 
 std::string dateText(double secondsSince1970) {
-  constexpr double kLatest = 253402300799.0;  // the last second of year 9999
-  if (!(secondsSince1970 >= 0 && secondsSince1970 <= kLatest)) return "(none)";
+  constexpr double kMaxTime = 253402300799.0;  // the last second of year 9999
+  if (!(secondsSince1970 >= 0 && secondsSince1970 <= kMaxTime)) return "(none)";
   const auto seconds = static_cast<time_t>(secondsSince1970);
   tm utc{};
   gmtime_r(&seconds, &utc);

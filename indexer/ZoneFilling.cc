@@ -93,7 +93,7 @@ void addToZones(zone::Zones& zones, int32_t zoneNumber, TLStringView text,
   if (!tokenize) {
     zone.AddTextAsIs(platform::toUTF8(text));
   } else if (tokenizer != nullptr) {
-    zone.AddText(text.substr(0, kMaximumTokenizedUnits), *tokenizer);
+    zone.AddText(text.substr(0, kMaxTokenizedUnits), *tokenizer);
   }
 }
 

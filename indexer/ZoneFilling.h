@@ -9,7 +9,7 @@
 
 // Upper bound, in UTF-16 units, of the text that is tokenised; the rest of a text is not
 // searchable.
-inline constexpr size_t kMaximumTokenizedUnits = 2097151;
+inline constexpr size_t kMaxTokenizedUnits = 2097151;
 
 // Adds the texts of `item` to `zones`, attribute by attribute in order. Without a tokenizer, texts
 // that need one are skipped.

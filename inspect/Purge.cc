@@ -101,7 +101,7 @@ class Purge {
     }
     const auto lock = platform::ProcessLock::acquire(platform::processLockPath(_state), error);
     if (lock == nullptr || !mayReplace(error)) return std::nullopt;
-    step("removing what an earlier purge has left");
+    step("removing the remains of an earlier purge");
     if (!platform::removeItem(_besides, error)) return std::nullopt;
     PurgeReport report;
     report.bytesBefore = sizeOfFiles(_old.directory);
@@ -206,7 +206,7 @@ class Purge {
   }
 
   bool build(PurgeReport& report, TLErrorOut error) {
-    step("looking at the text index");
+    step("opening the text index");
     if (!capture(error) || !loadOld(error) || !hasRoom(error)) return false;
     if (!platform::createDirectories(_besides, error) ||
         !platform::createDirectories(_new.directory, error, _class) ||
@@ -232,7 +232,7 @@ class Purge {
   // Compacts the copy, which also builds its posting lists, and reads all of it. Without space to
   // compact, the copy is correct but slower.
   bool check(StoreCopy& store, TLErrorOut error) {
-    step("sorting the text index");
+    step("compacting the text index");
     const std::unique_ptr<salt::Index> index(salt::LoadIndex(_new.index, error));
     if (index == nullptr) {
       if (*error) return false;
@@ -267,7 +267,7 @@ class Purge {
   }
 
   bool exchange(TLErrorOut error) {
-    step("writing to the disk");
+    step("syncing to the disk");
     if (!syncTree(_besides, error) || !syncItem(_state, error)) return false;
     step("exchanging old and new");
     if (renameat2(AT_FDCWD, _new.directory.c_str(), AT_FDCWD, _old.directory.c_str(),

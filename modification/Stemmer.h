@@ -32,4 +32,4 @@ void free_stemmer(stemmer* record);
 [[nodiscard]] std::string TALStemWord(std::string_view word, int32_t maximumLength);
 
 // Upper bound, in bytes, of the words that query modification stems.
-inline constexpr int32_t kMaximumStemmedLength = 100;
+inline constexpr int32_t kMaxStemmedBytes = 100;

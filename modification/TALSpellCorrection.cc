@@ -10,21 +10,21 @@
 namespace {
 
 // Bounds in bytes of tokens to correct, including a trailing space.
-constexpr size_t kShortestToken = 2;
-constexpr size_t kLongestToken = 21;
+constexpr size_t kMinTokenBytes = 2;
+constexpr size_t kMaxTokenBytes = 21;
 // Minimum number of letters of a word for the deletion of one.
-constexpr size_t kShortestForDeletion = 4;
+constexpr size_t kMinLettersForDeletion = 4;
 
 // A candidate counts as absent if none of its first suffixes, this many, is in a zone of the term.
 constexpr size_t kProbeSuffixes = 5;
 constexpr saltsearch::Options kScoring{1, 1000000, 0.02};
 
 // Bounds in bytes of vocabulary words to compare.
-constexpr size_t kShortestEntry = 3;
-constexpr size_t kLongestEntry = 20;
+constexpr size_t kMinEntryBytes = 3;
+constexpr size_t kMaxEntryBytes = 20;
 constexpr float kMaxDistance = 4.0F;
 constexpr float kMaxWeightedDistance = 1.2F;
-constexpr float kLeastScore = 0.9F;
+constexpr float kMinScore = 0.9F;
 
 // Scores of an edit at the first, a middle and the last position.
 struct EditScores {
@@ -62,7 +62,7 @@ std::optional<float> closeness(std::string_view word, std::string_view entry) {
   const auto longer = static_cast<float>(std::max(word.size(), entry.size()));
   if (d >= std::max(longer, kMaxDistance) || d < 0 || longer == 0) return std::nullopt;
   const float score = 1 - d / longer;
-  return score > kLeastScore ? std::optional(score) : std::nullopt;
+  return score > kMinScore ? std::optional(score) : std::nullopt;
 }
 
 }  // namespace
@@ -90,7 +90,7 @@ const std::array<std::string, 26>& TALSpellCorrection::kLettersEn() {
 bool TALSpellCorrection::_doNotCorrect(const saltsearch::Term& term) {
   if (!term.isUnigram || term.found || term.tokens.empty() || term.tokenScores.empty()) return true;
   const size_t size = term.tokens[0].size();
-  return size < kShortestToken || size > kLongestToken;
+  return size < kMinTokenBytes || size > kMaxTokenBytes;
 }
 
 float TALSpellCorrection::correctSpelling(const std::vector<saltsearch::Term>& terms,
@@ -210,7 +210,7 @@ std::vector<TALCorrectionCandidate> TALSpellCorrection::editOneCandidates(
       const char swapped[] = {word[i + 1], word[i]};
       more = add(with(i, 2, {swapped, 2}), kSwap.at(i, n - 2));
     }
-    if (more && n >= kShortestForDeletion) more = add(with(i, 1, ""), kDelete.at(i, n - 1));
+    if (more && n >= kMinLettersForDeletion) more = add(with(i, 1, ""), kDelete.at(i, n - 1));
     for (const std::string& letter : kLettersEn()) {
       if (more && letter[0] != word[i]) more = add(with(i, 1, letter), kReplace.at(i, n - 1));
     }
@@ -232,7 +232,7 @@ std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidatesFromTopKVo
   log().standard("topKVocab has {} entries.", vocab == nullptr ? 0 : vocab->size());
   if (vocab == nullptr) return candidates;
   for (const std::string& entry : *vocab) {
-    if (entry.size() < kShortestEntry || entry.size() > kLongestEntry) continue;
+    if (entry.size() < kMinEntryBytes || entry.size() > kMaxEntryBytes) continue;
     const auto score = closeness(word, withoutTrailingBlank(entry));
     if (!score) continue;
     if (static_cast<int64_t>(candidates.size()) >= _candidateBudget) break;

@@ -7,7 +7,7 @@
 
 namespace {
 
-constexpr size_t kShortestToken = 3;  // bytes
+constexpr size_t kMinTokenBytes = 3;
 
 }  // namespace
 
@@ -49,11 +49,11 @@ bool TALStemRewrite::stemRewrite(const std::vector<saltsearch::Term>& terms,
 
 std::string TALStemRewrite::getStemToken(saltsearch::Term term, const salt::Index& textStore) {
   std::string stemToken =
-      TALStemWord(modification::withoutBlank(term.tokens.front()), kMaximumStemmedLength);
+      TALStemWord(modification::withoutBlank(term.tokens.front()), kMaxStemmedBytes);
   modification::setFirstToken(term, stemToken);
   return modification::occurs(std::move(term), textStore) ? stemToken : std::string();
 }
 
 bool TALStemRewrite::_doNotStem(const saltsearch::Term& term) {
-  return !modification::isSingleWord(term) || term.tokens.front().size() < kShortestToken;
+  return !modification::isSingleWord(term) || term.tokens.front().size() < kMinTokenBytes;
 }

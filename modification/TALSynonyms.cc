@@ -107,7 +107,7 @@ bool TALSynonyms::loadSynonymsFromFile(const std::string& path, TLErrorOut error
     return false;
   }
   std::optional<TLError> failure;
-  const auto text = platform::readTextFile(path, kMaximumFileSize, &failure);
+  const auto text = platform::readTextFile(path, kMaxFileBytes, &failure);
   if (!text) {
     log().error("Failed to read synonym file: {} with error: {}", path,
                 platform::printable(failure));

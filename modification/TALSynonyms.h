@@ -33,7 +33,7 @@ class TALSynonyms {
 
   // A larger file is an error, because the synonyms stay in memory once per protection class. A
   // hundred times the size of the shipped file.
-  static constexpr size_t kMaximumFileSize = size_t{4} << 20;  // bytes
+  static constexpr size_t kMaxFileBytes = size_t{4} << 20;
 
   void setSynonymVocab(Vocab vocab) { _vocab = std::move(vocab); }
 

@@ -17,18 +17,18 @@ constexpr const char* kErrorDomain = "TALTopKVocab";
 constexpr int kDamagedArchive = 1;
 
 // Thresholds of a rebuild, in documents added since the last one.
-constexpr int64_t kLeastDocs = 51;     // required in any case
-constexpr int64_t kEnoughDocs = 2001;  // sufficient in any case
-constexpr float kGrowth = 0.5F;        // as a share of the documents before
-constexpr float kOldSeconds = 432000;  // 5 days
+constexpr int64_t kMinDocs = 51;           // required in any case
+constexpr int64_t kSufficientDocs = 2001;  // sufficient in any case
+constexpr float kGrowth = 0.5F;            // as a share of the documents before
+constexpr float kOldSeconds = 432000;      // 5 days
 
 TLError damaged(const char* what) {
   return {kErrorDomain, kDamagedArchive, std::string("the stored vocabulary has no ") + what};
 }
 
 std::string dateText(double secondsSince1970) {
-  constexpr double kLatest = 253402300799.0;  // the last second of year 9999
-  if (!(secondsSince1970 >= 0 && secondsSince1970 <= kLatest)) return "(none)";
+  constexpr double kMaxTime = 253402300799.0;  // the last second of year 9999
+  if (!(secondsSince1970 >= 0 && secondsSince1970 <= kMaxTime)) return "(none)";
   const auto seconds = static_cast<time_t>(secondsSince1970);
   tm local{};
   char text[64];
@@ -145,8 +145,8 @@ void TALTopKVocab::loadTopKVocabFromDocStore(TLErrorOut error) {
 bool TALTopKVocab::_needRebuildTopKVocab() const {
   const int64_t last = _lastTopKRebuildDocID;
   const int64_t delta = _maxDocID - last;
-  if (delta < kLeastDocs) return false;
-  if (delta >= kEnoughDocs || vocab()->empty()) return true;
+  if (delta < kMinDocs) return false;
+  if (delta >= kSufficientDocs || vocab()->empty()) return true;
   if (static_cast<float>(last) * kGrowth < static_cast<float>(delta)) return true;
   const double age = platform::secondsSince1970() - _lastTopKRebuildDate;
   return static_cast<float>(age) > kOldSeconds;

@@ -12,13 +12,13 @@ namespace {
 enum class Major : uint8_t { number = 0, bytes = 2, text = 3, array = 4, simple = 7 };
 
 // The lower five bits hold the argument itself up to this value, otherwise its size.
-constexpr uint8_t kLargestInline = 23;
+constexpr uint8_t kMaxInline = 23;
 constexpr uint8_t kOneByte = 24;
 constexpr uint8_t kEightBytes = 27;  // for `simple`: a double
 
 void putHead(std::string& out, Major major, uint64_t argument) {
   const auto kind = static_cast<uint8_t>(static_cast<unsigned>(major) << 5);
-  if (argument <= kLargestInline) {
+  if (argument <= kMaxInline) {
     out += static_cast<char>(kind | argument);
     return;
   }
@@ -50,7 +50,7 @@ class Reader {
     _rest.remove_prefix(1);
     if (first >> 5 != static_cast<uint8_t>(major)) return std::nullopt;
     const auto low = static_cast<uint8_t>(first & 0x1F);
-    if (low <= kLargestInline) return low;
+    if (low <= kMaxInline) return low;
     if (low > kEightBytes) return std::nullopt;
     const size_t size = size_t{1} << (low - kOneByte);
     if (_rest.size() < size) return std::nullopt;

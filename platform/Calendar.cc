@@ -14,8 +14,8 @@ namespace platform {
 namespace {
 
 constexpr double kMillisInSecond = 1000;
-constexpr double kFarthest = 5e6 * 366 * 86400;  // seconds
-constexpr int32_t kLargestField = 5000000;
+constexpr double kMaxTime = 5e6 * 366 * 86400;  // seconds
+constexpr int32_t kMaxField = 5000000;
 
 std::unique_ptr<icu::GregorianCalendar> newCalendar(const icu::Locale& locale) {
   UErrorCode status = U_ZERO_ERROR;
@@ -40,7 +40,7 @@ icu::GregorianCalendar* calendarIn(Zone zone) {
 
 // False for a time that is out of range.
 bool setTime(icu::GregorianCalendar& calendar, double time) {
-  if (!(std::fabs(time) <= kFarthest)) return false;
+  if (!(std::fabs(time) <= kMaxTime)) return false;
   UErrorCode status = U_ZERO_ERROR;
   calendar.setTime(std::floor(time) * kMillisInSecond, status);
   return U_SUCCESS(status);
@@ -61,7 +61,7 @@ std::optional<CalendarFields> fieldsOfTime(double time, Zone zone) {
 std::optional<double> timeOfFields(const CalendarFields& fields, Zone zone) {
   for (const int32_t field :
        {fields.year, fields.month, fields.day, fields.hour, fields.minute, fields.second}) {
-    if (field > kLargestField || field < -kLargestField) return std::nullopt;
+    if (field > kMaxField || field < -kMaxField) return std::nullopt;
   }
   icu::GregorianCalendar* const calendar = calendarIn(zone);
   if (calendar == nullptr) return std::nullopt;

@@ -10,7 +10,7 @@ namespace platform {
 namespace {
 
 // ICU counts bytes in 32 bits; no encoding takes more than 8 per unit.
-constexpr size_t kMaximumEncoded = size_t{1} << 27;
+constexpr size_t kMaxEncodedUnits = size_t{1} << 27;
 
 struct Encoding {
   uint64_t number;
@@ -136,7 +136,7 @@ bool Charset::decode(std::string_view bytes, TLString& out) const {
 }
 
 std::optional<std::string> Charset::encode(TLStringView text) const {
-  if (!_converter || text.size() > kMaximumEncoded) return std::nullopt;
+  if (!_converter || text.size() > kMaxEncodedUnits) return std::nullopt;
   std::string out(static_cast<size_t>(UCNV_GET_MAX_BYTES_FOR_STRING(
                       text.size(), ucnv_getMaxCharSize(_converter.get()))),
                   '\0');

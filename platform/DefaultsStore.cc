@@ -14,7 +14,7 @@ namespace platform {
 namespace {
 
 // A hand-edited settings file is far smaller; a larger one is treated as unreadable.
-constexpr size_t kMaximumFileSize = size_t{1} << 20;
+constexpr size_t kMaxFileBytes = size_t{1} << 20;
 
 // The leading decimal number of a text, after any white space; 0 if there is none.
 template <typename Number>
@@ -97,7 +97,7 @@ void DefaultsStore::load() {
   _loaded = true;
   if (!fileExists(_path)) return;
   std::optional<TLError> error;
-  const auto bytes = readFile(_path, kMaximumFileSize, &error);
+  const auto bytes = readFile(_path, kMaxFileBytes, &error);
   auto values = bytes ? nlohmann::json::parse(*bytes, nullptr, false) : nlohmann::json();
   _readable = bytes.has_value() && values.is_object();
   if (_readable) {

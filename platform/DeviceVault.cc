@@ -23,7 +23,7 @@ namespace {
 
 constexpr uint32_t kUnlocked = 0;
 constexpr uint32_t kLocked = 1;
-constexpr size_t kLongestStatus = 64;  // bytes; a longer file is invalid
+constexpr size_t kMaxStatusBytes = 64;  // bytes; a longer file is invalid
 
 struct Status {
   uint32_t state;
@@ -33,7 +33,7 @@ struct Status {
 Status readStatus(const std::string& path) {
   if (!fileExists(path)) return {kUnlocked, true};
   const Status garbled{kLocked, false};
-  const auto text = readFile(path, kLongestStatus, nullptr);
+  const auto text = readFile(path, kMaxStatusBytes, nullptr);
   if (!text) return garbled;
   std::istringstream words(*text);
   std::string state, unlocked, rest;

@@ -7,12 +7,12 @@ namespace platform {
 namespace {
 
 // Usually one each for ingest, search and merge; leveldb's thread shares one.
-constexpr int kMostArenas = 3;
+constexpr int kMaxArenas = 3;
 
 }  // namespace
 
 void limitMemoryArenas() {
-  mallopt(M_ARENA_MAX, kMostArenas);
+  mallopt(M_ARENA_MAX, kMaxArenas);
 }
 
 void returnFreeMemory() {

@@ -69,7 +69,7 @@ std::string lockStatusPath() {
 
 bool namesOneDirectory(std::string_view protectionClass) {
   return !protectionClass.empty() && protectionClass != "." && protectionClass != ".." &&
-         protectionClass.size() <= kLongestName &&
+         protectionClass.size() <= kMaxNameBytes &&
          protectionClass.find_first_of(std::string_view("/\0", 2)) == std::string_view::npos;
 }
 

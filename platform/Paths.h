@@ -28,7 +28,7 @@ namespace platform {
 // Whether clients may use this name for a protection class, which is a directory in the data root:
 // not empty, not a path elsewhere, and not too long for a file system.
 [[nodiscard]] bool namesOneDirectory(std::string_view protectionClass);
-inline constexpr size_t kLongestName = 255;  // bytes
+inline constexpr size_t kMaxNameBytes = 255;
 
 // The directory of the text index of a class.
 [[nodiscard]] std::string textIndexPath(const std::string& root,

@@ -12,13 +12,13 @@ namespace platform {
 
 namespace {
 
-constexpr size_t kLongestThreadName = 15;
+constexpr size_t kMaxThreadNameBytes = 15;
 constexpr int kBackgroundNiceness = 10;  // a weight of 110; normal threads have 1024
 
 }  // namespace
 
 void setThreadName(const std::string& name) {
-  const size_t cut = name.size() > kLongestThreadName ? name.size() - kLongestThreadName : 0;
+  const size_t cut = name.size() > kMaxThreadNameBytes ? name.size() - kMaxThreadNameBytes : 0;
   pthread_setname_np(pthread_self(), name.c_str() + cut);
 }
 

@@ -14,7 +14,7 @@ namespace platform {
 namespace {
 
 // Out of 100. Below this, the statistics match random bytes.
-constexpr int32_t kLeastConfidence = 20;
+constexpr int32_t kMinConfidence = 20;
 
 TLString decode(std::string_view bytes, const char* encoding) {
   const icu::UnicodeString text(bytes.data(), static_cast<int32_t>(bytes.size()), encoding);
@@ -29,7 +29,7 @@ std::string likeliestEncoding(std::string_view bytes) {
   ucsdet_setText(detector.get(), bytes.data(), static_cast<int32_t>(bytes.size()), &status);
   const UCharsetMatch* match = ucsdet_detect(detector.get(), &status);
   if (U_FAILURE(status) || match == nullptr ||
-      ucsdet_getConfidence(match, &status) < kLeastConfidence) {
+      ucsdet_getConfidence(match, &status) < kMinConfidence) {
     return {};
   }
   return ucsdet_getName(match, &status);

@@ -133,7 +133,7 @@ TALQueryProcessor::TokenList TALQueryProcessor::wordTokens(const TLString& word,
     }
   }
   if (isOn(searchParams, "queryModification.enableStemModificationFirstPass")) {
-    TLString stem = platform::fromUTF8(TALStemWord(platform::toUTF8(word), kMaximumStemmedLength));
+    TLString stem = platform::fromUTF8(TALStemWord(platform::toUTF8(word), kMaxStemmedBytes));
     if (stem != word &&
         std::find(list.tokens.begin(), list.tokens.end(), stem) == list.tokens.end()) {
       append(std::move(stem), kStemScore, false);

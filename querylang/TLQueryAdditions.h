@@ -32,7 +32,7 @@ class TLQueryAdditions {
   using Stack = std::vector<Node>;
 
   // Upper bound of the height of a tree: as much as a query can carry.
-  static constexpr size_t kMaximumTreeHeight = kMaximumRecordDepth;
+  static constexpr size_t kMaxTreeHeight = kMaxRecordDepth;
 
   // Sets rawQuery and originalQuery to the text; no root.
   [[nodiscard]] static std::shared_ptr<TLQuery> initWithQueryString(const TLString& string);
@@ -53,7 +53,7 @@ class TLQueryAdditions {
   static void optimizeFiltersOfQuery(TLQuery& query);
 
   // The tree of a text before optimisation, an AND node; null, with a fault in the log, if the text
-  // does not parse or nests deeper than kMaximumTreeHeight.
+  // does not parse or nests deeper than kMaxTreeHeight.
   [[nodiscard]] static Node _parse(const TLString& string);
 
   // Adds one parse node to the last element of the stack, which must be AND or OR; otherwise logs
@@ -73,7 +73,7 @@ class TLQueryAdditions {
   // Removes one asterisk at the front and one at the back. A single character is unchanged.
   [[nodiscard]] static TLString removeWildCard(const TLString& string);
 
-  // Rewrites a tree, at most kMaximumTreeHeight high, in place, and returns the node that replaces
+  // Rewrites a tree, at most kMaxTreeHeight high, in place, and returns the node that replaces
   // it, null if nothing is left. Words searched for in any attribute, or in five or more attributes
   // by one OR, are moved to `originalQueryParts`; constants are folded; duplicates below one node
   // are removed. An OR of nothing but false disappears as well.

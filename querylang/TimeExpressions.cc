@@ -43,9 +43,9 @@ double leadingNumber(std::string_view text) {
 
 // Truncated and clamped to the range of a field.
 int32_t asField(double value) {
-  constexpr double kLowest = std::numeric_limits<int32_t>::min();
-  constexpr double kHighest = std::numeric_limits<int32_t>::max();
-  return static_cast<int32_t>(std::fmax(kLowest, std::fmin(kHighest, std::trunc(value))));
+  constexpr double kMinField = std::numeric_limits<int32_t>::min();
+  constexpr double kMaxField = std::numeric_limits<int32_t>::max();
+  return static_cast<int32_t>(std::fmax(kMinField, std::fmin(kMaxField, std::trunc(value))));
 }
 
 int32_t added(int32_t field, double delta) {

@@ -141,7 +141,7 @@ bool TLQueryAdditions::_build(const sq::node* node, Stack& stack) {
     const TLQueryNodeMergeOp mergeOp = isAnd ? AND : OR;
     if (stack.back()->mergeOp() != mergeOp) {
       // The new node has at least a leaf below it.
-      if (stack.size() + 2 > kMaximumTreeHeight) return false;
+      if (stack.size() + 2 > kMaxTreeHeight) return false;
       auto inner = std::make_shared<TLQueryNode>();
       inner->setMergeOp(mergeOp);
       stack.back()->addChild(inner);

@@ -13,7 +13,7 @@ using Parts = TLQueryAdditions::Parts;
 using enum TLQueryNodeMergeOp;
 
 // A string searched for in this many attributes is free text.
-constexpr size_t kFewestAttributes = 5;
+constexpr size_t kMinAttributes = 5;
 
 // A subtree with its hash, computed once from the hashes of its children.
 struct Subtree {
@@ -64,7 +64,7 @@ bool isSoughtAnywhere(const TLQueryNode& leaf) {
 
 // Children that are not leaves are ignored.
 bool isOneStringInManyAttributes(const TLQueryNode& node) {
-  if (node.mergeOp() != OR || node.childsCount() < kFewestAttributes) return false;
+  if (node.mergeOp() != OR || node.childsCount() < kMinAttributes) return false;
   const auto& wanted = node.childs().front()->stringValue();
   return wanted.has_value() &&
          std::all_of(node.childs().begin(), node.childs().end(), [&](const Node& child) {
@@ -86,7 +86,7 @@ class Optimizer {
 
   // The subtree that replaces the node; empty if the node disappears.
   Subtree optimize(const Node& node, size_t height) {
-    TL_ASSERT(height <= TLQueryAdditions::kMaximumTreeHeight);
+    TL_ASSERT(height <= TLQueryAdditions::kMaxTreeHeight);
     switch (node->mergeOp()) {
       case LEAF:
         return leaf(node);

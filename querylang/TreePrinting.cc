@@ -32,7 +32,7 @@ void append(const TLQueryNode& node, size_t indent, bool inClear, std::string& o
 // `height` is the distance of the node from the root, which bounds the recursion.
 void appendTree(const TLQueryNode& node, size_t indent, size_t height, bool inClear,
                 std::string& out) {
-  TL_ASSERT(height <= TLQueryAdditions::kMaximumTreeHeight);
+  TL_ASSERT(height <= TLQueryAdditions::kMaxTreeHeight);
   append(node, indent, inClear, out);
   for (const auto& child : node.childs()) {
     appendTree(*child, indent + 1, height + 1, inClear, out);

@@ -50,7 +50,7 @@ class NestingGuard {
  public:
   NestingGuard() {
     ++_depth;
-    TL_ASSERT(_depth <= kMaximumRecordDepth);
+    TL_ASSERT(_depth <= kMaxRecordDepth);
   }
   ~NestingGuard() { --_depth; }
   NestingGuard(const NestingGuard&) = delete;

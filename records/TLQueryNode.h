@@ -7,7 +7,7 @@
 // One node of a query's condition tree. A leaf has keys, an op and the value to compare with; an
 // AND or OR node has only children.
 //
-// A tree has at most kMaximumRecordDepth levels of children, one less inside a query. A deeper one
+// A tree has at most kMaxRecordDepth levels of children, one less inside a query. A deeper one
 // can be built and destroyed, but writing, comparing, hashing, copying or describing it is a
 // programming error.
 class TLQueryNode final : public TLRecord<TLQueryNode> {

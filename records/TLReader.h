@@ -12,12 +12,12 @@
 // Maximum nesting of sub-records. Reading a deeper record fails, and every recursive operation
 // (write, compare, hash, copy, describe) asserts the same bound, so neither input nor a tree built
 // by hand can exhaust the stack.
-inline constexpr int kMaximumRecordDepth = 256;
+inline constexpr int kMaxRecordDepth = 256;
 
 // Maximum number of sub-records and list texts in one read. Two bytes on the wire can request a
 // record of about 300 bytes; above this limit, far beyond any real item, the read fails instead of
 // exhausting the memory of the device.
-inline constexpr uint32_t kMaximumRecordElements = uint32_t{1} << 18;
+inline constexpr uint32_t kMaxRecordElements = uint32_t{1} << 18;
 
 // Wire types: the low three bits of a tag.
 enum class TLWireType : uint8_t {
@@ -112,7 +112,7 @@ class TLReader {
 
   // Counts one element; false, with the error flag set, if the limit is exceeded.
   [[nodiscard]] bool takeElement() {
-    if (_elements == kMaximumRecordElements) _error = true;
+    if (_elements == kMaxRecordElements) _error = true;
     ++_elements;
     return !_error;
   }
@@ -120,7 +120,7 @@ class TLReader {
   // Runs `body` on a sub-record, within the limits of length, nesting and number.
   template <typename Body>
   [[nodiscard]] bool withRecord(Body&& body) {
-    if (_depth == kMaximumRecordDepth) _error = true;
+    if (_depth == kMaxRecordDepth) _error = true;
     if (!takeElement()) return false;
     ++_depth;
     const bool result = withLengthLimit(body);

@@ -12,7 +12,7 @@ RequestBudget& RequestBudget::shared() {
 
 bool RequestBudget::take(size_t bytes, Resume resume) {
   platform::MutexLock lock(_mutex);
-  const size_t most = bytes <= kSmallMessageBytes ? 2 * kMaximumWaitingBytes : kMaximumWaitingBytes;
+  const size_t most = bytes <= kSmallMessageBytes ? 2 * kMaxWaitingBytes : kMaxWaitingBytes;
   if (_taken != 0 && _taken + bytes > most) {
     _waiting.push_back(std::move(resume));
     return false;
@@ -51,7 +51,7 @@ Framer::Piece Framer::next(std::string_view bytes) {
 // The handshake is a NUL byte and lines that end in CR LF; messages follow after BEGIN.
 Framer::Piece Framer::nextOfAuthentication(std::string_view bytes) {
   for (size_t i = 0; i < bytes.size(); ++i) {
-    if (++_authenticationBytes > kMaximumAuthenticationBytes) return {Part::unacceptable, i};
+    if (++_authenticationBytes > kMaxAuthenticationBytes) return {Part::unacceptable, i};
     if (bytes[i] != '\n') {
       _line += bytes[i];
     } else if (std::exchange(_line, "") == "BEGIN\r") {
@@ -76,7 +76,7 @@ bool Framer::readHeader() {
   };
   const uint64_t fields = (number(12) + 7) / 8 * 8;
   const uint64_t size = kHeaderBytes + fields + number(4);
-  if (size > kMaximumMessageBytes) return false;
+  if (size > kMaxMessageBytes) return false;
   _messageBytes = size;
   _left = size - kHeaderBytes;
   return _left != 0;  // every message has fields

@@ -62,7 +62,7 @@ class Framer {
 
  private:
   static constexpr size_t kHeaderBytes = 16;
-  static constexpr size_t kMaximumAuthenticationBytes = 16384;
+  static constexpr size_t kMaxAuthenticationBytes = 16384;
 
   Piece nextOfAuthentication(std::string_view bytes);
   bool readHeader();

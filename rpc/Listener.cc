@@ -37,10 +37,10 @@ class ConnectionTable {
   bool enter(ServerConnection* connection) TL_EXCLUDES(_mutex) {
     platform::MutexLock lock(_mutex);
     // Evicted connections remain for a moment.
-    if (_connections.size() >= 2 * kMaximumConnections) return false;
+    if (_connections.size() >= 2 * kMaxConnections) return false;
     const auto staying = std::count_if(_connections.begin(), _connections.end(),
                                        [](const auto* one) { return !one->evicted(); });
-    if (static_cast<size_t>(staying) >= kMaximumConnections && !evictOne()) return false;
+    if (static_cast<size_t>(staying) >= kMaxConnections && !evictOne()) return false;
     _connections.push_back(connection);
     return true;
   }
@@ -200,7 +200,7 @@ class SocketListener : public Listener {
       return;
     } else if (!connectionTable().enter(connection.get())) {
       log().error("Refusing connection {}: {} are open", connection->description(),
-                  kMaximumConnections);
+                  kMaxConnections);
     } else {
       begin(std::move(connection));
     }

@@ -75,7 +75,7 @@ class ArgumentReader {
     if (sd_bus_message_enter_container(_message, 'a', contents) < 0) return std::nullopt;
     for (;;) {
       const int atEnd = sd_bus_message_at_end(_message, 0);
-      if (atEnd < 0 || values.size() > kMaximumArrayElements) return std::nullopt;
+      if (atEnd < 0 || values.size() > kMaxArrayElements) return std::nullopt;
       if (atEnd > 0) break;
       const auto value = readElement();
       if (!value) return std::nullopt;

@@ -28,18 +28,18 @@ namespace rpc {
 //
 // When all connections are taken, the one that has been idle longest without a call in flight is
 // closed to make room.
-inline constexpr size_t kMaximumConnections = 64;
+inline constexpr size_t kMaxConnections = 64;
 inline constexpr uint64_t kAuthenticationMilliseconds = 5000;
-inline constexpr uint64_t kMaximumQueuedMessages = 256;
-inline constexpr size_t kMaximumQueuedBytes = size_t{256} << 20;
+inline constexpr uint64_t kMaxQueuedMessages = 256;
+inline constexpr size_t kMaxQueuedBytes = size_t{256} << 20;
 // Calls of a connection whose reply is outstanding; at this number it stops reading.
-inline constexpr size_t kMaximumPendingCalls = 4;
-inline constexpr size_t kMaximumMessageBytes = size_t{128} << 20;  // the protocol's limit
-inline constexpr size_t kMaximumArrayElements = 262144;            // per argument
+inline constexpr size_t kMaxPendingCalls = 4;
+inline constexpr size_t kMaxMessageBytes = size_t{128} << 20;  // the protocol's limit
+inline constexpr size_t kMaxArrayElements = 262144;            // per argument
 // Total size of the requests, over all connections, that are being received or whose reply is
 // outstanding. A larger request waits until there is no other. Small ones may use as much again, so
 // that searches do not wait for large batches.
-inline constexpr size_t kMaximumWaitingBytes = size_t{64} << 20;
+inline constexpr size_t kMaxWaitingBytes = size_t{64} << 20;
 inline constexpr size_t kSmallMessageBytes = size_t{64} << 10;
 // Minimum progress, in each interval, of a message that has begun.
 inline constexpr uint64_t kProgressMilliseconds = 5000;

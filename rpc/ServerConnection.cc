@@ -163,7 +163,7 @@ ServerConnection::Idleness ServerConnection::idleness() const {
 
 void ServerConnection::evict() {
   _evicted = true;
-  _outbox->post([this] { endBecause("another needs its place"); });
+  _outbox->post([this] { endBecause("evicted for a new connection"); });
 }
 
 void ServerConnection::serve() {
@@ -274,7 +274,7 @@ void ServerConnection::pump() {
       });
     }
     const bool betweenMessages = !_framer.inMessage();
-    if (betweenMessages && _calls.size() >= kMaximumPendingCalls) return setReading(false);
+    if (betweenMessages && _calls.size() >= kMaxPendingCalls) return setReading(false);
     if (_unread.empty() && !readSome()) break;
     const Framer::Piece piece = _framer.next(_unread);
     const std::string_view bytes = _unread.substr(0, piece.size);
@@ -293,7 +293,7 @@ void ServerConnection::pump() {
         endMessage();
         break;
       case Framer::Part::unacceptable:
-        return endBecause("it sends what is no message");
+        return endBecause("invalid message");
     }
   }
   if (_ending) return;
@@ -370,7 +370,7 @@ void ServerConnection::checkProgress() {
   if (_ending) return;
   const bool stuck = _reading && _framer.inMessage() && _messages == _messagesBefore &&
                      _received - _receivedBefore < kProgressBytes;
-  if (stuck) return endBecause("a message does not go on");
+  if (stuck) return endBecause("a message has stalled");
   _progressTimer.reset();
   watchProgress();
 }
@@ -480,7 +480,7 @@ void ServerConnection::checkQueue(size_t bytes) {
   uint64_t waiting = 0;
   sd_bus_get_n_queued_write(_bus, &waiting);
   _queuedBytes = waiting == 0 ? 0 : _queuedBytes + bytes;
-  if (waiting < kMaximumQueuedMessages && _queuedBytes <= kMaximumQueuedBytes) return;
+  if (waiting < kMaxQueuedMessages && _queuedBytes <= kMaxQueuedBytes) return;
   endBecause("its replies are not read");
 }
 

@@ -14,7 +14,7 @@ namespace {
 
 // Bounds the candidate documents held at a time, over all tokens: about 12 MB, plus what the token
 // with the most documents needs.
-constexpr size_t kMostStandings = 500000;
+constexpr size_t kMaxStandings = 500000;
 
 // Evaluates the candidate documents of many tokens together, so that each of the other terms is
 // scanned only once.
@@ -32,7 +32,7 @@ class SharedSearch {
     std::vector<std::optional<double>> result(tokens.size());
     for (size_t first = 0; first < tokens.size();) {
       size_t last = first;
-      while (last < tokens.size() && _standings < kMostStandings) add(tokens[last++]);
+      while (last < tokens.size() && _standings < kMaxStandings) add(tokens[last++]);
       evaluate();
       for (const Matches& matches : _byToken) {
         for (const Standing& standing : matches.docs) {

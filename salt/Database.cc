@@ -23,7 +23,7 @@ constexpr size_t kLogLineBytes = 100;
 constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one compaction needs at a time
 // A batch takes up to three times its size in a memtable.
 constexpr size_t kBatchesBesideCompaction = kWriteBufferBytes / 4;
-constexpr std::chrono::seconds kLongestWait{1};  // with locks held that searches need
+constexpr std::chrono::seconds kMaxWait{1};  // with locks held that searches need
 
 leveldb::Status open(const leveldb::Options& options, const std::string& path,
                      std::unique_ptr<leveldb::DB>* db) {
@@ -75,7 +75,7 @@ bool BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end
 }
 
 bool BatchWriter::waitForCompaction(size_t bytes) {
-  const auto deadline = std::chrono::steady_clock::now() + kLongestWait;
+  const auto deadline = std::chrono::steady_clock::now() + kMaxWait;
   while (_compacts && (_logTorn || bytes > _room)) {
     if (_compacted.wait_until(_mutex, deadline) == std::cv_status::timeout) return false;
   }
@@ -121,17 +121,17 @@ std::optional<TLError> systemError(const leveldb::Status& status) {
   return platform::posixError(EIO, text);
 }
 
-Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* files) {
+Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* env) {
   Database result;
   result.path = path;
-  result.order = std::make_unique<KeyOrder>();
+  result.comparator = std::make_unique<BytewiseComparator>();
   result.logger = std::make_unique<LeveldbLogger>();
   result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
-  result.files = std::make_unique<IndexFiles>(path, files);
-  const platform::CrashNote note(result.files->crashNotes());
+  result.env = std::make_unique<OrderedSyncEnv>(path, env);
+  const platform::CrashNote note(result.env->crashNotes());
   leveldb::Options options;
-  options.env = result.files.get();
-  options.comparator = result.order.get();
+  options.env = result.env.get();
+  options.comparator = result.comparator.get();
   options.write_buffer_size = kWriteBufferBytes;
   options.block_cache = result.cache.get();
   options.block_size = kBlockBytes;
@@ -139,7 +139,7 @@ Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* file
   options.reuse_logs = true;
   options.info_log = result.logger.get();
   leveldb::Status status;
-  if (!result.files->start()) {
+  if (!result.env->start()) {
     status = leveldb::Status::IOError(path, std::strerror(EAGAIN));
   } else if (mode == OpenMode::create) {
     platform::removeItem(path, nullptr);

@@ -14,8 +14,8 @@
 #include "platform/Log.h"
 #include "platform/Mutex.h"
 #include "platform/TLError.h"
-#include "salt/IndexFiles.h"
-#include "salt/KeyOrder.h"
+#include "salt/BytewiseComparator.h"
+#include "salt/OrderedSyncEnv.h"
 
 namespace salt {
 
@@ -31,8 +31,8 @@ class LeveldbLogger final : public leveldb::Logger {
 // comparator, environment.
 struct Database {
   std::string path;
-  std::unique_ptr<IndexFiles> files;
-  std::unique_ptr<KeyOrder> order;
+  std::unique_ptr<OrderedSyncEnv> env;
+  std::unique_ptr<BytewiseComparator> comparator;
   std::unique_ptr<leveldb::Logger> logger;
   std::unique_ptr<leveldb::Cache> cache;
   std::unique_ptr<leveldb::DB> db;  // null when opening failed
@@ -45,9 +45,9 @@ struct Database {
 
 enum class OpenMode { create, existing };
 
-// `create` removes what is at `path` first. Failures are logged. `files` must outlive the database.
+// `create` removes what is at `path` first. Failures are logged. `env` must outlive the database.
 [[nodiscard]] Database openDatabase(const std::string& path, OpenMode mode,
-                                    leveldb::Env* files = leveldb::Env::Default());
+                                    leveldb::Env* env = leveldb::Env::Default());
 
 // All writes and compactions go through here. Any thread.
 //
@@ -58,7 +58,7 @@ enum class OpenMode { create, existing };
 // leveldb 1.23 ends the process when it fails to flush a memtable during a compaction on demand. So
 // no such compaction starts on a nearly full disk or beside another one, and writes that would fill
 // the memtable meanwhile wait up to a second. Bulk ingest has already waited, holding no lock (see
-// WaitWhileTidying).
+// WaitForMaintenance).
 class BatchWriter {
  public:
   // The open database must outlive this object.

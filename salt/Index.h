@@ -214,7 +214,7 @@ class Index {
   // Backpressure for bulk ingest, called between two batches and without any lock that a search
   // needs: waits while a merge or a compaction on demand runs, because concurrent writes make these
   // much slower; 10 seconds at most.
-  virtual void WaitWhileTidying() = 0;
+  virtual void WaitForMaintenance() = 0;
 
   // Called before the index is deleted: merges stop after the current batch, and nothing waits for
   // merges or compactions any more.

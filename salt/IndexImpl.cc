@@ -107,7 +107,7 @@ std::unique_ptr<index> index::load(Database opened, TLErrorOut error) {
     if (const auto failure = systemError(opened.status)) platform::setError(error, *failure);
     return nullptr;
   }
-  const platform::CrashNote note(opened.files->crashNotes());
+  const platform::CrashNote note(opened.env->crashNotes());
   auto idx = std::make_unique<index>(std::move(opened));
   if (!idx->readRecords(error)) {
     Log.error("Loading failure: The database cannot be read.");
@@ -204,9 +204,9 @@ bool index::Sync() {
 bool index::Compact() {
   _schedule.waitForMerge();
   if (interrupted()) return true;
-  const Activity::Work compaction(_schedule.housekeeping());
+  const Activity::Work compaction(_schedule.maintenance());
   const bool done = compactRange(nullptr, nullptr);
-  _database.files->waitForDisk();
+  _database.env->waitForDisk();
   if (done) makeMissingPostings();
   return done;
 }
@@ -224,8 +224,8 @@ void index::removeObsoleteFiles() const {
   (void)_writer.compact(&behind, &behind);
 }
 
-void index::WaitWhileTidying() {
-  _schedule.waitForHousekeeping();
+void index::WaitForMaintenance() {
+  _schedule.waitForMaintenance();
 }
 
 void index::Interrupt() {
@@ -300,7 +300,7 @@ IndexView::~IndexView() {
   iterators.clear();
   if (options.fill_cache || idx._compactionsEnded == _compactionsEnded) return;
   // Not on this thread: it takes as long as a memtable flush, and waits for a running compaction.
-  (void)idx._tidying.async([&owner = idx] {
+  (void)idx._fileCleanup.async([&owner = idx] {
     if (!owner.interrupted()) owner.removeObsoleteFiles();
   });
 }

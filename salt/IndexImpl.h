@@ -16,17 +16,17 @@
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/DocSet.h"
-#include "salt/Helper.h"
 #include "salt/Index.h"
 #include "salt/Postings.h"
-#include "salt/ScanMemory.h"
+#include "salt/ScanCache.h"
 #include "salt/Schedule.h"
 #include "salt/SuffixStarts.h"
+#include "salt/TwoThreadRunner.h"
 
 namespace salt {
 
 class IndexView;
-class PlaceSet;
+class PostingSet;
 
 // The counts that one scan adds to the metrics.
 struct ScanCounts {
@@ -87,7 +87,7 @@ class index final : public Index {
                                      const PlacesCallback& callback) const override;
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override;
-  void WaitWhileTidying() override;
+  void WaitForMaintenance() override;
   void Interrupt() override;
   [[nodiscard]] bool interrupted() const { return _schedule.interrupted(); }
 
@@ -125,8 +125,8 @@ class index final : public Index {
 
   [[nodiscard]] const std::string& path() const { return _database.path; }
 
-  // See IndexFiles.
-  [[nodiscard]] const std::string& crashNotes() const { return _database.files->crashNotes(); }
+  // See OrderedSyncEnv.
+  [[nodiscard]] const std::string& crashNotes() const { return _database.env->crashNotes(); }
 
  private:
   using Clock = std::chrono::steady_clock;
@@ -205,7 +205,7 @@ class index final : public Index {
 
   // Starts the build of the Bloom filter from the stored texts.
   void learnStarts() const;
-  void remember(std::string_view prefix, const IndexView& view, const PlaceSet& pages) const;
+  void remember(std::string_view prefix, const IndexView& view, const PostingSet& pages) const;
   void countScan(Clock::time_point start, const ScanCounts& counts) const
       TL_EXCLUDES(_metricsMutex);
   void forEachZone(const IndexView& view,
@@ -252,15 +252,15 @@ class index final : public Index {
   // Incremented by every change to pages or to the documents visible in them: merge commits and
   // deletions.
   uint64_t _pageGeneration TL_GUARDED_BY(_metricsMutex) = 1;
-  mutable ScanMemory _scanMemory;  // thread-safe, as are the next two
-  mutable Helper _scanHelper;
+  mutable ScanCache _scanCache;  // thread-safe, as are the next two
+  mutable TwoThreadRunner _scanRunner;
   mutable Schedule _schedule;
 
   std::atomic<uint64_t> _compactionsEnded{0};  // on demand
 
   mutable SuffixStarts _starts;  // thread-safe; its thread reads the index
   // Removes the files that long reads kept alive; last, because it uses everything above.
-  mutable platform::SerialQueue _tidying{"tallow-tidy", platform::QueuePriority::low};
+  mutable platform::SerialQueue _fileCleanup{"tallow-tidy", platform::QueuePriority::low};
 };
 
 template <typename Change>

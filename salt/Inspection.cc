@@ -3,19 +3,19 @@
 #include <utility>
 
 #include "platform/Assert.h"
-#include "salt/FrozenFiles.h"
 #include "salt/IndexImpl.h"
 #include "salt/LiveCopy.h"
+#include "salt/SnapshotEnv.h"
 
 namespace salt {
 
-Inspection::Inspection(std::string path, std::unique_ptr<FrozenFiles> files)
+Inspection::Inspection(std::string path, std::unique_ptr<SnapshotEnv> files)
     : _path(std::move(path)), _files(std::move(files)) {}
 
 Inspection::~Inspection() = default;
 
 std::unique_ptr<Inspection> Inspection::capture(const std::string& path, TLErrorOut error) {
-  auto files = FrozenFiles::capture(path, error);
+  auto files = SnapshotEnv::capture(path, error);
   if (files == nullptr) return nullptr;
   return std::unique_ptr<Inspection>(new Inspection(path, std::move(files)));
 }

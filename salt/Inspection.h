@@ -11,7 +11,7 @@
 
 namespace salt {
 
-class FrozenFiles;
+class SnapshotEnv;
 class index;
 
 // Reads an index that no process has open, without changing its directory. The files are captured
@@ -56,10 +56,10 @@ class Inspection {
                                                  TLErrorOut error) const;
 
  private:
-  Inspection(std::string path, std::unique_ptr<FrozenFiles> files);
+  Inspection(std::string path, std::unique_ptr<SnapshotEnv> files);
 
   const std::string _path;
-  const std::unique_ptr<FrozenFiles> _files;
+  const std::unique_ptr<SnapshotEnv> _files;
   std::unique_ptr<index> _index;
 };
 

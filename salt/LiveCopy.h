@@ -10,7 +10,7 @@
 
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
-#include "salt/ZoneTexts.h"
+#include "salt/ZoneTextCache.h"
 
 namespace salt {
 
@@ -50,7 +50,7 @@ class LiveCopy {
   const std::function<bool(uint32_t)>& _isKept;
   const std::function<void()>& _progress;
   const IndexView _view;
-  ZoneTexts _zoneTexts;
+  ZoneTextCache _zoneTexts;
   ShardCursor _cursor;
   Suffix _previous;                  // the last one in _pending
   std::vector<SuffixMeta> _pending;  // of the page under construction

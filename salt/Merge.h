@@ -10,7 +10,7 @@
 #include "salt/Postings.h"
 #include "salt/Schedule.h"
 #include "salt/Suffix.h"
-#include "salt/ZoneTexts.h"
+#include "salt/ZoneTextCache.h"
 
 namespace salt {
 
@@ -62,7 +62,7 @@ class Merge {
   MergePace _pace;
   const IndexView _oldView;
   const IndexView _hotView;
-  ZoneTexts _zoneTexts;
+  ZoneTextCache _zoneTexts;
   leveldb::WriteBatch _batch;
   ShardCursor _old;
   ShardCursor _hot;

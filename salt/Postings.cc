@@ -32,9 +32,9 @@ static_assert(sizeof(Header) == 48);
 
 constexpr size_t kMaxZones = 32;
 constexpr size_t kSumBytes = 4;  // before each list
-constexpr uint32_t kMostTableBytes = uint32_t{1} << 28;
-constexpr uint32_t kMostStep = uint32_t{1} << 30;
-constexpr uint64_t kLeastBudget = 64 * 1024;
+constexpr uint32_t kMaxTableBytes = uint32_t{1} << 28;
+constexpr uint32_t kMaxStep = uint32_t{1} << 30;
+constexpr uint64_t kMinBudget = 64 * 1024;
 // A suffix takes about eleven bytes of the index, so this limits posting lists to a twentieth.
 constexpr uint64_t kSuffixesPerByte = 2;
 
@@ -145,7 +145,7 @@ bool Postings::readTable(const PostingsOwner& owner) {
   if (std::memcmp(header.magic, Header().magic, sizeof header.magic) != 0 ||
       header.indexCreated != owner.indexCreated || header.shard != owner.shard ||
       header.fileBytes != static_cast<uint64_t>(info.st_size) ||
-      header.tableBytes > std::min<uint64_t>(kMostTableBytes, header.fileBytes)) {
+      header.tableBytes > std::min<uint64_t>(kMaxTableBytes, header.fileBytes)) {
     return false;
   }
   std::string table(header.tableBytes, '\0');
@@ -186,7 +186,7 @@ const Postings::Entry* Postings::find(std::string_view prefix) const {
 
 // A list has for each document: its DocID delta times 4, plus 1 if its zone mask follows (else it
 // has the mask of the previous one), plus 2 if its number of suffixes follows (else 1).
-bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* places) const {
+bool Postings::add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const {
   const Entry* const entry = find(prefix);
   if (entry == nullptr) return false;
   std::string bytes(entry->bytes, '\0');
@@ -205,7 +205,7 @@ bool Postings::add(std::string_view prefix, const DocSet& deleted, PlaceSet* pla
   uint32_t mask = 0;
   const uint32_t allZones =
       _zones.size() == kMaxZones ? UINT32_MAX : (uint32_t{1} << _zones.size()) - 1;
-  PlaceSet::Adder adder(places, _zones);
+  PostingSet::Adder adder(places, _zones);
   while (!input.empty() && input.good) {
     const uint32_t step = input.varint();
     docID += step / 4;
@@ -247,7 +247,7 @@ void PostingsBuilder::count(Node* node, size_t end) {
 void PostingsBuilder::fold() {
   size_t end = _pending.size() - 1;  // a node may begin with the last suffix
   for (Node& node : _open) {
-    if (suffixesOf(node) >= _least) continue;
+    if (suffixesOf(node) >= _minSuffixes) continue;
     end = std::min(end, node.begin);
     break;
   }
@@ -265,7 +265,7 @@ void PostingsBuilder::make(Node* node, std::string text, size_t above) {
   uint32_t mask = 0;
   node->counts->forEach([&](uint32_t docID, const Counts& counts) {
     if (counts.suffixes == 0) return;
-    if (docID - before >= kMostStep) _unfit = true;
+    if (docID - before >= kMaxStep) _unfit = true;
     const bool otherMask = counts.mask != mask;
     const bool several = counts.suffixes != 1;
     appendVarint(&list, (docID - before) * 4 + (several ? 2 : 0) + (otherMask ? 1 : 0));
@@ -282,14 +282,14 @@ void PostingsBuilder::make(Node* node, std::string text, size_t above) {
 }
 
 uint64_t PostingsBuilder::budget() const {
-  return std::max(kLeastBudget, _taken / kSuffixesPerByte);
+  return std::max(kMinBudget, _taken / kSuffixesPerByte);
 }
 
-void PostingsBuilder::prune(uint64_t mostBytes) {
-  while (_madeBytes > mostBytes) {
-    _least += std::max<uint64_t>(_least / 8, 1);
+void PostingsBuilder::prune(uint64_t maxBytes) {
+  while (_madeBytes > maxBytes) {
+    _minSuffixes += std::max<uint64_t>(_minSuffixes / 8, 1);
     std::erase_if(_made, [this](const Made& made) {
-      if (made.suffixes >= _least) return false;
+      if (made.suffixes >= _minSuffixes) return false;
       _madeBytes -= made.list.size() + made.text.size();
       return true;
     });

@@ -12,7 +12,7 @@
 #include "platform/FileDescriptor.h"
 #include "salt/DocPages.h"
 #include "salt/DocSet.h"
-#include "salt/PlaceSet.h"
+#include "salt/PostingSet.h"
 
 // Posting lists for the prefixes that many suffixes of a shard begin with: the documents, with
 // their zones and number of suffixes. A scan for such a prefix reads the list instead of the pages.
@@ -48,7 +48,7 @@ class Postings {
 
   // Adds the places of all suffixes that begin with `prefix`, except those of documents in
   // `deleted`. False, adding nothing, when there is no list or, with a log line, it cannot be read.
-  [[nodiscard]] bool add(std::string_view prefix, const DocSet& deleted, PlaceSet* places) const;
+  [[nodiscard]] bool add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const;
 
  private:
   struct Entry {
@@ -88,8 +88,8 @@ class PostingsBuilder {
   // `fullShard` is MaxShardSuffixes. Only prefixes with at least a 500th of that many suffixes,
   // 2,000 of a million, get an entry: scanning fewer from the pages is as fast.
   explicit PostingsBuilder(uint64_t fullShard)
-      : _least(std::max<uint64_t>(kLeast, fullShard / 500)),
-        _mostPending(std::clamp<uint64_t>(fullShard / 4, 64, uint64_t{1} << 18)) {}
+      : _minSuffixes(std::max<uint64_t>(kMinSuffixes, fullShard / 500)),
+        _maxPending(std::clamp<uint64_t>(fullShard / 4, 64, uint64_t{1} << 18)) {}
 
   // Takes the next suffix, which shares `lcp` bytes with the previous one. Where that ends a node
   // with many suffixes, `textBefore(n)` is asked for the first n bytes of the previous suffix.
@@ -98,7 +98,7 @@ class PostingsBuilder {
     close(lcp, textBefore);
     _pending.push_back(place);
     ++_taken;
-    if (_pending.size() >= _mostPending) fold();
+    if (_pending.size() >= _maxPending) fold();
   }
 
   // The bytes of the file after the last suffix; empty when there is no entry.
@@ -109,7 +109,7 @@ class PostingsBuilder {
   }
 
  private:
-  static constexpr uint64_t kLeast = 2;
+  static constexpr uint64_t kMinSuffixes = 2;
 
   struct Counts {
     uint32_t mask = 0;  // of zones
@@ -138,7 +138,7 @@ class PostingsBuilder {
     while (!_open.empty() && _open.back().depth > lcp) {
       next = std::move(_open.back());
       _open.pop_back();
-      if (suffixesOf(next) < _least) continue;
+      if (suffixesOf(next) < _minSuffixes) continue;
       const size_t above = std::max(lcp, _open.empty() ? 0 : _open.back().depth);
       make(&next, std::string(textBefore(next.depth)), above);
     }
@@ -158,14 +158,14 @@ class PostingsBuilder {
   void fold();
   [[nodiscard]] uint32_t bitOf(uint16_t zoneID);
 
-  // Drops the entries with the fewest suffixes until the lists take at most `mostBytes`.
-  void prune(uint64_t mostBytes);
+  // Drops the entries with the fewest suffixes until the lists take at most `maxBytes`.
+  void prune(uint64_t maxBytes);
   [[nodiscard]] uint64_t budget() const;
   [[nodiscard]] std::string file(const PostingsOwner& owner);
 
   uint64_t _taken = 0;
-  uint64_t _least;
-  const uint64_t _mostPending;
+  uint64_t _minSuffixes;
+  const uint64_t _maxPending;
   std::vector<Place> _pending;
   std::vector<Node> _open;
   std::vector<Made> _made;

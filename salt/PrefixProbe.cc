@@ -15,7 +15,7 @@ namespace {
 
 // The threads of a probe, as for ScanPlaces.
 constexpr size_t kWalks = 2;
-constexpr unsigned kFewShards = 2;  // not worth waking a thread
+constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // A suffix that begins with the prefix of this index.
 struct Find {
@@ -141,10 +141,10 @@ std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::
     }
     counts[number] = probe.counts;
   };
-  if (byShard.size() <= kFewShards || view.iterators.size() == 1) {
+  if (byShard.size() <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
     walk(0);
   } else {
-    _scanHelper.share(walk);
+    _scanRunner.run(walk);
   }
 
   const auto found = firstOfEach(byShard, sorted.size(), limit);

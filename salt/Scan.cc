@@ -4,7 +4,7 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
-#include "salt/PlaceSet.h"
+#include "salt/PostingSet.h"
 #include "salt/Suffix.h"
 
 // Prefix scans and iteration over stored texts.
@@ -26,10 +26,10 @@ class PrefixScan {
   }
 
   // False when a read has failed, which ends the scan.
-  bool hotPlaces(PlaceSet* places) {
+  bool hotPlaces(PostingSet* places) {
     return visitShard(0, [&] { return visitHotPlaces(places); });
   }
-  bool pagePlaces(unsigned shard, PlaceSet* places) {
+  bool pagePlaces(unsigned shard, PostingSet* places) {
     return visitShard(shard, [&] { return visitPagePlaces(places); });
   }
 
@@ -61,7 +61,7 @@ class PrefixScan {
     return true;
   }
 
-  bool visitHotPlaces(PlaceSet* places) {
+  bool visitHotPlaces(PostingSet* places) {
     for (; matches(); _cursor.next()) add(_cursor.suffix.meta, places);
     return true;
   }
@@ -69,7 +69,7 @@ class PrefixScan {
   // Within a page a suffix matches as long as it shares the whole prefix with the previous one. If
   // the next page begins with a match, the rest of this page matches, and most of its columns need
   // not be read.
-  bool visitPagePlaces(PlaceSet* places) {
+  bool visitPagePlaces(PostingSet* places) {
     if (!matches()) return true;
     bool more = addMatches(_cursor.pos, places) && nextPageMatches();
     while (more) {
@@ -89,7 +89,7 @@ class PrefixScan {
 
   // Adds the cursor's suffixes from `first`, a match, to the last match. True when that is the last
   // suffix of the page.
-  bool addMatches(size_t first, PlaceSet* places) {
+  bool addMatches(size_t first, PostingSet* places) {
     const std::vector<SuffixMeta>& metas = _cursor.metas;
     size_t at = first;
     for (; at < metas.size() && (at == first || metas[at].lcp >= _prefix.size()); ++at) {
@@ -99,7 +99,7 @@ class PrefixScan {
   }
 
   template <typename Standing>
-  void add(const Standing& at, PlaceSet* places) const {
+  void add(const Standing& at, PostingSet* places) const {
     if (_view.deleted->contains(at.DocID)) return;
     places->add({at.DocID, at.ZoneID});
   }
@@ -126,12 +126,12 @@ class PrefixScan {
 // Threads of one scan through the pages. A device has more processors, but during a search it also
 // indexes, and displays what was found.
 constexpr size_t kPageWalks = 2;
-constexpr unsigned kFewShards = 2;  // not worth waking a thread
+constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // The result of a scan for places.
 struct FoundPlaces {
-  PlaceSet hot;
-  PlaceSet pages;
+  PostingSet hot;
+  PostingSet pages;
   bool complete = true;  // no read has failed
   ScanCounts counts;
 
@@ -177,7 +177,7 @@ class PlacesScan {
   }
 
  private:
-  [[nodiscard]] bool addPostings(unsigned shard, PlaceSet* places) const {
+  [[nodiscard]] bool addPostings(unsigned shard, PostingSet* places) const {
     const auto& postings = *_view.postings;
     return shard < postings.size() && postings[shard] != nullptr &&
            postings[shard]->add(_prefix, *_view.deleted, places);
@@ -209,21 +209,21 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
   const Activity::Work running(_schedule.scans());
   const IndexView view(*this, true, kPageWalks);
   prefix = prefix.substr(0, suffixLength(prefix, op));
-  const auto known = _scanMemory.find(prefix, view.pageGeneration);
+  const auto known = _scanCache.find(prefix, view.pageGeneration);
   const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
   if (most > limit) return std::nullopt;
   PlacesScan scan(view, prefix, !known);
-  if (scan.shards() <= kFewShards || view.iterators.size() == 1) {
+  if (scan.shards() <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
     scan.walk(0);
   } else {
-    _scanHelper.share([&scan](size_t walk) { scan.walk(walk); });
+    _scanRunner.run([&scan](size_t walk) { scan.walk(walk); });
   }
   const FoundPlaces found = scan.take();
   found.hot.deliver(callback);
   ScanCounts counts = found.counts;
   counts.results = found.hot.suffixes();
   if (known) {
-    PlaceSet::deliver(known->places, callback);
+    PostingSet::deliver(known->places, callback);
     counts.results += known->suffixes;
   } else {
     found.pages.deliver(callback);
@@ -236,11 +236,12 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
   return counts.results;
 }
 
-void index::remember(std::string_view prefix, const IndexView& view, const PlaceSet& pages) const {
-  ScanMemory::Found found{pages.suffixes(), pages.encode()};
+void index::remember(std::string_view prefix, const IndexView& view,
+                     const PostingSet& pages) const {
+  ScanCache::Found found{pages.suffixes(), pages.encode()};
   if (found.places.empty()) return;
-  _scanMemory.keep(prefix, view.pageGeneration,
-                   std::make_shared<const ScanMemory::Found>(std::move(found)));
+  _scanCache.keep(prefix, view.pageGeneration,
+                  std::make_shared<const ScanCache::Found>(std::move(found)));
 }
 
 void index::countScan(Clock::time_point start, const ScanCounts& counts) const {

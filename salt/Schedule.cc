@@ -17,20 +17,20 @@ using std::chrono::seconds;
 
 // The size that the hot part should reach before a merge: a share of its shard, within multiples of
 // MaxHotSuffixes.
-constexpr uint64_t kLeastWorthwhile = 2;
-constexpr uint64_t kMostWorthwhile = 8;
+constexpr uint64_t kMinWorthwhile = 2;
+constexpr uint64_t kMaxWorthwhile = 8;
 constexpr uint64_t kShardPart = 2;
 constexpr uint32_t kSmallHotPart = 100000;  // below this waiting gains nothing
 // Mail pours in while each interval brings at least this many suffixes, those of about 25 mails.
 constexpr milliseconds kInterval{250};
 constexpr uint64_t kPouring = 10000;
-constexpr seconds kLongestWaitForMore{60};
+constexpr seconds kMaxWaitForMore{60};
 
-constexpr seconds kLongestWaitForHousekeeping{10};
+constexpr seconds kMaxWaitForMaintenance{10};
 
 constexpr int kWaitOverComputing = 3;
-constexpr milliseconds kMostCredit{100};
-constexpr milliseconds kLeastCredit{2};  // waking up has a cost too
+constexpr milliseconds kMaxCredit{100};
+constexpr milliseconds kMinCredit{2};  // waking up has a cost too
 
 }  // namespace
 
@@ -66,10 +66,9 @@ void Schedule::setMerging(bool merging) {
 void Schedule::waitForMore(uint32_t maxHotSuffixes, uint64_t shardSuffixes,
                            const std::function<uint64_t()>& hotSuffixes) {
   if (maxHotSuffixes < kSmallHotPart) return;
-  const uint64_t worthwhile =
-      std::clamp(shardSuffixes / kShardPart, kLeastWorthwhile * maxHotSuffixes,
-                 kMostWorthwhile * maxHotSuffixes);
-  const auto deadline = Clock::now() + kLongestWaitForMore;
+  const uint64_t worthwhile = std::clamp(
+      shardSuffixes / kShardPart, kMinWorthwhile * maxHotSuffixes, kMaxWorthwhile * maxHotSuffixes);
+  const auto deadline = Clock::now() + kMaxWaitForMore;
   uint64_t before = hotSuffixes();
   while (before < worthwhile && Clock::now() < deadline) {
     if (!pause()) return;
@@ -96,8 +95,8 @@ void Schedule::waitForMerge() {
   while (_merging && !_interrupted) _changed.wait(_mutex);
 }
 
-void Schedule::waitForHousekeeping() {
-  _housekeeping.waitForEnd(kLongestWaitForHousekeeping);
+void Schedule::waitForMaintenance() {
+  _maintenance.waitForEnd(kMaxWaitForMaintenance);
 }
 
 void Schedule::interrupt() {
@@ -106,7 +105,7 @@ void Schedule::interrupt() {
     _interrupted = true;
     _changed.notify_all();
   }
-  _housekeeping.interrupt();
+  _maintenance.interrupt();
 }
 
 MergePace::MergePace(Activity& scans) : _scans(scans), _computed(platform::threadProcessorTime()) {}
@@ -115,8 +114,8 @@ void MergePace::giveWay() {
   if (!_scans.any()) return;
   const nanoseconds computed = platform::threadProcessorTime();
   _credit += kWaitOverComputing * (computed - std::exchange(_computed, computed));
-  _credit = std::min<nanoseconds>(_credit, kMostCredit);
-  if (_credit < kLeastCredit) return;
+  _credit = std::min<nanoseconds>(_credit, kMaxCredit);
+  if (_credit < kMinCredit) return;
   const auto start = Clock::now();
   _scans.waitForEnd(_credit);
   _credit -= Clock::now() - start;

@@ -24,7 +24,7 @@ namespace salt {
 //   the end of the index             the running merge                           its next page
 //
 // An interruption ends all of these waits at once. Below this level, BatchWriter separates writes
-// from compactions on demand, and LogSync and IndexFiles wait for the disk.
+// from compactions on demand, and LogSync and OrderedSyncEnv wait for the disk.
 //
 // Any thread. The schedule owns the merge thread, which must be joined before anything that the
 // merge uses is destroyed.
@@ -53,12 +53,12 @@ class Schedule {
   void waitForMerge() TL_EXCLUDES(_mutex);
 
   // Waits while a merge or a compaction on demand runs.
-  void waitForHousekeeping();
+  void waitForMaintenance();
 
   // The running scans, which follow one another closely while a user types; and the running merges
   // and compactions on demand.
   [[nodiscard]] Activity& scans() { return _scans; }
-  [[nodiscard]] Activity& housekeeping() { return _housekeeping; }
+  [[nodiscard]] Activity& maintenance() { return _maintenance; }
 
   // Ends all waits, and merges at their next page, for good.
   void interrupt() TL_EXCLUDES(_mutex);
@@ -70,7 +70,7 @@ class Schedule {
   void setMerging(bool merging) TL_EXCLUDES(_mutex);
 
   Activity _scans{std::chrono::milliseconds(5)};  // one search makes several scans
-  Activity _housekeeping;
+  Activity _maintenance;
 
   platform::Mutex _mutex;
   std::condition_variable_any _changed;

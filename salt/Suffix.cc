@@ -5,14 +5,14 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
-#include "salt/ZoneTexts.h"
+#include "salt/ZoneTextCache.h"
 
 namespace salt {
 
 // Reads bypass the block cache: the few texts that a scan completes are scattered, and their blocks
 // would evict those of the scan, which the next token, often a longer or shorter form of this one,
 // needs again.
-Suffix::Suffix(const index& owner, ZoneTexts* zoneTexts)
+Suffix::Suffix(const index& owner, ZoneTextCache* zoneTexts)
     : idx(owner),
       options(readOptions(false)),
       _zoneTexts(zoneTexts),
@@ -111,7 +111,7 @@ void relate(Suffix* suffix, size_t lcp, SuffixMeta* meta) {
   meta->extra[1] = byteAt(suffix->knownText(), lcp + 1);
 }
 
-ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts,
+ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTextCache* zoneTexts,
                          size_t walk)
     : idx(view.idx),
       shard(shardNumber),

@@ -14,14 +14,14 @@ namespace salt {
 
 class index;
 class IndexView;
-class ZoneTexts;
+class ZoneTextCache;
 
 // A decoded suffix. Its text is known up to `size`; the rest is read from the stored zone when a
 // comparison needs it. One thread. The index outlives it.
 class Suffix {
  public:
   // Reads zone texts through `zoneTexts`, or from the database when that is null.
-  explicit Suffix(const index& owner, ZoneTexts* zoneTexts = nullptr);
+  explicit Suffix(const index& owner, ZoneTextCache* zoneTexts = nullptr);
   Suffix(const Suffix&) = delete;
   // Copies the suffix, but neither its text source nor its fetch count.
   Suffix& operator=(const Suffix& suffix);
@@ -50,7 +50,7 @@ class Suffix {
   SuffixMeta meta;
 
  private:
-  ZoneTexts* const _zoneTexts;
+  ZoneTextCache* const _zoneTexts;
   const std::unique_ptr<char[]> _text;  // MaxMatchLen bytes
   std::string _zoneText;                // of the last fetch; reused to avoid allocation
 };
@@ -66,7 +66,7 @@ void relate(Suffix* suffix, size_t lcp, SuffixMeta* meta);
 // thread. The view and `zoneTexts`, which callers that complete many suffixes pass, outlive it.
 class ShardCursor {
  public:
-  ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTexts* zoneTexts = nullptr,
+  ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTextCache* zoneTexts = nullptr,
               size_t walk = 0);
 
   // Switches to another shard: the cursor becomes invalid and its counts 0.

@@ -9,7 +9,7 @@ namespace saltsearch {
 
 namespace {
 
-constexpr size_t kLeastCandidates = 100;  // keeps the summary meaningful for a small k
+constexpr size_t kMinCandidates = 100;  // keeps the summary meaningful for a small k
 
 // Tokens with weights in a hash table with linear probing. A slot holds the upper half of the hash
 // beside the index of its entry, so a look-up of an absent token mostly ends within the slots,
@@ -102,7 +102,7 @@ void forEachToken(const salt::Index& index, const ZoneScore& zoneScore,
     offsets.push_back(static_cast<uint32_t>(text.size()));
     for (size_t i = 0; i + 1 < offsets.size(); ++i) {
       const size_t size = offsets[i + 1] - offsets[i];
-      if (size <= kMostTokenBytes) visit(text.substr(offsets[i], size), weight);
+      if (size <= kMaxTokenBytes) visit(text.substr(offsets[i], size), weight);
     }
     return true;
   });
@@ -130,7 +130,7 @@ std::vector<std::pair<std::string, double>> TopKTokens(const salt::Index& index,
                                                        const ZoneScore& zoneScore,
                                                        const TokenStarts& tokenizer,
                                                        const std::function<bool()>& goOn) {
-  const size_t minSize = std::max(k, kLeastCandidates);
+  const size_t minSize = std::max(k, kMinCandidates);
   const size_t maxSize = minSize + minSize / 2;
   TokenWeights tokenScores(maxSize + 1);
   forEachToken(index, zoneScore, tokenizer, goOn, [&](std::string_view token, double weight) {

@@ -19,7 +19,7 @@ using ZoneScore = std::function<double(uint32_t docID, uint16_t zone)>;
 using TokenStarts = std::function<std::vector<uint32_t>(std::string_view text)>;
 
 // Longer tokens are skipped: nobody types them, and thousands of them would take gigabytes.
-inline constexpr size_t kMostTokenBytes = 1024;
+inline constexpr size_t kMaxTokenBytes = 1024;
 
 // The `k` heaviest tokens of the live documents with the summed weights of their occurrences,
 // heaviest first, ties in byte order. A token extends to the start of the next one or to the end of

@@ -83,12 +83,12 @@ void index::runMerge(uint8_t shard) {
 void index::mergeInto(uint8_t shard) {
   const auto start = Clock::now();
   {
-    const Activity::Work merge(_schedule.housekeeping());
+    const Activity::Work merge(_schedule.maintenance());
     const bool merged = mergePages(shard, true);
     platform::returnFreeMemory();
     if (op.CompactAfterVacuum && !interrupted()) {
       compactRange(nullptr, nullptr);
-      _database.files->waitForDisk();
+      _database.env->waitForDisk();
     } else if (merged) {
       compactPart(kHotPart);
       compactPart(shard);

@@ -5,7 +5,7 @@
 
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
-#include "salt/ZoneTexts.h"
+#include "salt/ZoneTextCache.h"
 
 // Full reads of the index: one checks the invariants of a merge, one prints.
 namespace salt {
@@ -68,7 +68,7 @@ bool shardSound(ShardCursor* cursor, uint64_t* total) {
 
 bool index::Validate() const {
   const IndexView view(*this, false);
-  ZoneTexts zoneTexts(*this);
+  ZoneTextCache zoneTexts(*this);
   ShardCursor cursor(view, 0, &zoneTexts);
   uint64_t total = 0;
   for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {
@@ -92,7 +92,7 @@ std::string index::Dump() const {
 
 bool index::dumpTo(const std::function<bool(std::string_view)>& sink) const {
   const IndexView view(*this, false);
-  ZoneTexts zoneTexts(*this);
+  ZoneTextCache zoneTexts(*this);
   ShardCursor cursor(view, 0, &zoneTexts);
   std::string piece = std::string(view.metrics) + '\n';
   for (unsigned shard = 0; shard <= view.lastShard(); ++shard) {

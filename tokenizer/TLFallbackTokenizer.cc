@@ -36,7 +36,7 @@ const TLFallbackTokenizer& TLFallbackTokenizer::getObject() {
 }
 
 TLString TLFallbackTokenizer::CleanText(TLStringView text) const {
-  const TLString lower = lowered(text.substr(0, kMaximumTextSize));
+  const TLString lower = lowered(text.substr(0, kMaxTextUnits));
   return _splitNums ? _CleanTextSplitNums(lower) : _CleanText(lower);
 }
 

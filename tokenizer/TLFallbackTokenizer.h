@@ -12,7 +12,7 @@
 class TLFallbackTokenizer {
  public:
   // Only this many units of a text are processed; the rest is dropped.
-  static constexpr size_t kMaximumTextSize = 2097151;
+  static constexpr size_t kMaxTextUnits = 2097151;
 
   // The shared instance, which splits numbers.
   [[nodiscard]] static const TLFallbackTokenizer& getObject();

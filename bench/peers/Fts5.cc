@@ -107,7 +107,7 @@ size_t Fts5Database::search(const std::string& query) {
   check(
       sqlite3_bind_text64(select.get(), 1, match.data(), match.size(), SQLITE_STATIC, SQLITE_UTF8),
       SQLITE_OK);
-  check(sqlite3_bind_int64(select.get(), 2, bench::kMaximumResults), SQLITE_OK);
+  check(sqlite3_bind_int64(select.get(), 2, bench::kMaxResults), SQLITE_OK);
   size_t rows = 0;
   int code = SQLITE_ROW;
   while ((code = sqlite3_step(select.get())) == SQLITE_ROW) {

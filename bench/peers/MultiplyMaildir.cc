@@ -34,8 +34,7 @@ std::string changed(std::string mail, size_t copy, const std::string& word) {
   constexpr std::string_view kField = "message-id:";
   if (const size_t field = findField(mail, kField); field != std::string_view::npos) {
     const size_t id = mail.find_first_not_of("< \t\r\n", field + kField.size());
-    const bool empty =
-        id == std::string::npos || mail[id - 1] == '\n';  // next to the following field
+    const bool empty = id == std::string::npos || mail[id - 1] == '\n';
     if (!empty) mail.insert(id, "copy" + std::to_string(copy) + '.');
   }
   if (!mail.ends_with('\n')) mail += '\n';

@@ -104,13 +104,14 @@ class ToolRun {
   bench::Percentiles _starts;
 };
 
-const std::string kMaximum = std::to_string(bench::kMaximumResults);
+const std::string kMaxResultsText = std::to_string(bench::kMaxResults);
 
 Tool mu(const Workload& work, const bench::ScratchDirectory& scratch) {
   const std::string home = "--muhome=" + scratch / "mu";
   const auto search = [home](const std::string& query) -> Arguments {
     const auto words = bench::wordsOfQuery(query);
-    return {"mu", "find", home, "--maxnum=" + kMaximum, quotedWords(words) + words.back() + '*'};
+    return {"mu", "find", home, "--maxnum=" + kMaxResultsText,
+            quotedWords(words) + words.back() + '*'};
   };
   return {scratch / "mu/xapian",
           {{"HOME", scratch / ""}, {"LC_ALL", "C.UTF-8"}},
@@ -143,7 +144,7 @@ Figures measureNotmuch(const Workload& work) {
                                   "[maildir]\nsynchronize_flags=false\n";
   const auto search = [](const std::string& query) -> Arguments {
     const auto words = bench::wordsOfQuery(query);
-    return {"notmuch", "search", "--limit=" + kMaximum,
+    return {"notmuch", "search", "--limit=" + kMaxResultsText,
             quotedWords(words) + notmuchPrefix(words.back())};
   };
   const Tool tool{

@@ -53,10 +53,10 @@ class NewQueries {
 
   // Queries of one, two, three, one, ... words; fewer if the mail has no others.
   [[nodiscard]] std::vector<std::string> draw(size_t count) {
-    constexpr int kMostTries = 10000;  // for one
+    constexpr int kMaxTries = 10000;  // for one
     std::vector<std::string> queries;
-    for (int tries = 0; queries.size() < count && tries < kMostTries; ++tries) {
-      std::string query = _source.draw(1 + queries.size() % bench::kMaximumWords);
+    for (int tries = 0; queries.size() < count && tries < kMaxTries; ++tries) {
+      std::string query = _source.draw(1 + queries.size() % bench::kMaxWords);
       if (!isNew(query)) continue;
       queries.push_back(std::move(query));
       tries = 0;

@@ -46,8 +46,8 @@ std::optional<pid_t> mergeThread(const bench::DaemonRun& daemon) {
 // Merges and compacts the index until nothing is left to merge.
 void settle(client::DebugServiceProxy& service) {
   constexpr std::chrono::milliseconds kPoll(100);
-  constexpr int kMostRounds = 100;  // each moves at least a quarter of a million suffixes
-  for (int round = 0; round < kMostRounds; ++round) {
+  constexpr int kMaxRounds = 100;  // each moves at least a quarter of a million suffixes
+  for (int round = 0; round < kMaxRounds; ++round) {
     const uint64_t before = mergesOf(service).ended;
     std::optional<TLError> error;
     if (!service.forceVacuumAndCompact(bench::kProtectionClass, &error)) {

@@ -22,7 +22,7 @@ std::vector<size_t> counts(const std::vector<std::span<const client::EncodedItem
 
 }  // namespace
 
-// An element takes 4 bytes of length and its bytes, padded to a multiple of 4.
+// An element takes 4 bytes of length plus its bytes, padded to a multiple of 4.
 TEST(Batches, AreAsFullAsTheLimitAllows) {
   using Sizes = std::vector<size_t>;
   const struct {
@@ -48,13 +48,13 @@ TEST(Batches, AreAsFullAsTheLimitAllows) {
     EXPECT_EQ(counts(*pieces), c.counts) << "limit " << c.limit;
     const client::EncodedItem* next = items.data();
     for (const auto piece : *pieces) {
-      EXPECT_EQ(piece.data(), next);  // in order, nothing left out
+      EXPECT_EQ(piece.data(), next);  // in order and complete
       next += piece.size();
     }
   }
 }
 
-TEST(Batches, AnItemThatIsTooLongAloneIsNamed) {
+TEST(Batches, ErrorNamesAnItemThatExceedsTheLimit) {
   const auto items = itemsOfSizes({1, 97, 1});
   std::optional<TLError> error;
   EXPECT_FALSE(client::splitItems(items, &error, 100).has_value());
@@ -65,8 +65,8 @@ TEST(Batches, AnItemThatIsTooLongAloneIsNamed) {
   EXPECT_EQ(client::splitTexts(texts, &error, 16)->size(), 2u);
 }
 
-// A query that the daemon would refuse is not even written.
-TEST(Batches, AQueryKeepsToTheLimitsOfARecord) {
+// A query that the daemon would refuse is not even encoded.
+TEST(Batches, RefusesAQueryBeyondTheRecordLimits) {
   const auto inner = [](std::vector<std::shared_ptr<TLQueryNode>> childs) {
     auto node = std::make_shared<TLQueryNode>();
     node->setMergeOp(TLQueryNodeMergeOp::AND);
@@ -83,15 +83,15 @@ TEST(Batches, AQueryKeepsToTheLimitsOfARecord) {
     EXPECT_TRUE(!bytes || read.initWithData(*bytes));
     return error ? error->message : std::string();
   };
-  constexpr size_t kBytes = client::kMaximumArrayBytes;
+  constexpr size_t kBytes = client::kMaxArrayBytes;
   auto high = std::make_shared<TLQueryNode>();
-  for (int i = 1; i < kMaximumRecordDepth; ++i) high = inner({high});
+  for (int i = 1; i < kMaxRecordDepth; ++i) high = inner({high});
   EXPECT_EQ(encoded(high, kBytes), "");
   high = inner({high});
   EXPECT_EQ(encoded(high, kBytes), "the query nests conditions more than 256 deep");
   for (int i = 0; i < 100000; ++i) high = inner({high});
   EXPECT_EQ(encoded(high, kBytes), "the query nests conditions more than 256 deep");
-  std::vector<std::shared_ptr<TLQueryNode>> many(kMaximumRecordElements - 1, inner({}));
+  std::vector<std::shared_ptr<TLQueryNode>> many(kMaxRecordElements - 1, inner({}));
   EXPECT_EQ(encoded(inner(many), kBytes), "");
   many.push_back(inner({}));
   EXPECT_EQ(encoded(inner(many), kBytes), "the query holds more than 262144 conditions");

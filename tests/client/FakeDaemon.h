@@ -14,11 +14,11 @@
 
 namespace testsupport {
 
-// Both services of the daemon, in this process, with answers of the test's own. Every call is
-// written down as "Member(argument, ...)": lists as [n bytes, ...] or [text, ...].
+// Both services of the daemon, in this process, with replies chosen by the test. Every call is
+// recorded as "Member(argument, ...)"; lists as [n bytes, ...] or [text, ...].
 //
-// An answer runs on a thread of the RPC layer. It may be set at any time and counts from the next
-// call.
+// Answers run on a thread of the RPC layer. They may be set at any time and apply from the next
+// call on.
 class FakeDaemon {
  public:
   using Answer = std::function<void(rpc::Reply&)>;
@@ -28,16 +28,16 @@ class FakeDaemon {
   FakeDaemon(const FakeDaemon&) = delete;
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
-  // Without one, a member answers with what its signature allows and means nothing.
+  // By default a member replies with arbitrary values that match its signature.
   void answer(const std::string& member, Answer answer);
-  // What the next calls of a member get, one after the other, before `answer` counts.
+  // Errors for the next calls of a member, one each, before `answer` applies.
   void failOnce(const std::string& member, TLError error);
-  // Answers with an error to every IndexItems that holds an item whose bytes hold `text`.
+  // Replies with an error to every IndexItems with an item whose bytes contain `text`.
   void refuseItemsWith(const std::string& text, TLError error);
 
   [[nodiscard]] const std::string& runtimeDirectory() const { return _directory.path(); }
   [[nodiscard]] std::vector<std::string> calls() const;
-  // Items in wire form, of all calls that succeeded.
+  // Items in wire form from all successful calls.
   [[nodiscard]] std::vector<std::string> indexedItems() const;
   void stop();
 

@@ -63,7 +63,7 @@ TEST_F(ProxyTest, SearchSendsTheQueryAndReadsTheItems) {
                                           ">, 1, default, 9223372036854775807)"));
 }
 
-TEST_F(ProxyTest, StateTellsAbsentFromEmpty) {
+TEST_F(ProxyTest, StateDistinguishesAbsentFromEmpty) {
   EXPECT_FALSE(search.fetchLastClientState("me", "c", &error).has_value());
   EXPECT_FALSE(error.has_value());
   daemon.answer("FetchLastClientState", [](rpc::Reply& reply) {
@@ -72,7 +72,7 @@ TEST_F(ProxyTest, StateTellsAbsentFromEmpty) {
   EXPECT_EQ(search.fetchLastClientState("me", "c", &error), "");
 }
 
-TEST_F(ProxyTest, StatisticsKeepTheirNumbers) {
+TEST_F(ProxyTest, StatisticsKeepTheirNumberTypes) {
   const rpc::Dictionary sent{{"z", int64_t{-1}},
                              {"a", uint64_t{7}},
                              {"m", std::numeric_limits<uint64_t>::max()},
@@ -89,7 +89,7 @@ TEST_F(ProxyTest, StatisticsKeepTheirNumbers) {
   EXPECT_EQ(debug.fetchStatsForSalt("me", "c", &error), "metrics");
 }
 
-TEST_F(ProxyTest, ErrorsOfTheDaemonComeAsTheyAre) {
+TEST_F(ProxyTest, PassesOnErrorsOfTheDaemon) {
   const TLError failure{"TALIndexer", -4, "shutting down"};
   daemon.failOnce("DeleteAllItems", failure);
   EXPECT_FALSE(search.deleteAllItems("me", "c", &error));
@@ -100,17 +100,17 @@ TEST_F(ProxyTest, ErrorsOfTheDaemonComeAsTheyAre) {
   EXPECT_FALSE(debug.forceVacuumAndCompact("c", &error));
   EXPECT_EQ(error->domain, rpc::kProtocolDomain);
   EXPECT_EQ(error->message, "argument 0 is bad (org.freedesktop.DBus.Error.InvalidArgs)");
-  EXPECT_TRUE(search.deleteAllItems("me", "c", nullptr));  // the connection lives on
+  EXPECT_TRUE(search.deleteAllItems("me", "c", nullptr));  // the connection stays open
 }
 
-TEST_F(ProxyTest, TextThatDBusCannotCarryIsRefusedHere) {
+TEST_F(ProxyTest, RefusesTextThatDBusCannotCarry) {
   const std::vector<std::string> texts{"\xFF"};
   EXPECT_FALSE(search.deleteItemsWithIdentifiers(texts, "me", "c", &error));
   EXPECT_EQ(error->domain, rpc::kClientDomain);
   EXPECT_TRUE(daemon.calls().empty());
 }
 
-TEST_F(ProxyTest, AListBeyondOneArrayGoesInSeveralCallsAndTheStateWithTheLast) {
+TEST_F(ProxyTest, SplitsALongListAndSendsTheStateWithTheLastCall) {
   constexpr size_t kHalf = size_t{33} << 20;
   std::vector<EncodedItem> items;
   for (const char* name : {"a", "b"}) items.push_back({name, std::string(kHalf, 'i')});
@@ -134,7 +134,7 @@ TEST_F(ProxyTest, AFailureEndsASplitCall) {
   EXPECT_EQ(daemon.calls().size(), 1u);
 }
 
-TEST_F(ProxyTest, AnAbsentDaemonIsToldApart) {
+TEST_F(ProxyTest, AbsentDaemonHasItsOwnErrorDomain) {
   SearchServiceProxy nowhere("/nonexistent");
   EXPECT_FALSE(nowhere.deleteAllItems("me", "c", &error));
   EXPECT_TRUE(rpc::isUnreachable(error));
@@ -148,10 +148,10 @@ TEST_F(ProxyTest, AnAbsentDaemonIsToldApart) {
   EXPECT_TRUE(rpc::isUnreachable(error)) << platform::printable(error);
 }
 
-TEST_F(ProxyTest, ADaemonThatVanishesInMidCallIsUnreachable) {
+TEST_F(ProxyTest, DaemonThatEndsDuringACallIsUnreachable) {
   std::thread stopper;
   daemon.answer("Ping", [&](rpc::Reply&) {
-    // The reply is dropped; the listener joins this thread, so another one stops it.
+    // Drops the reply. The listener joins this thread, so another one must stop it.
     stopper = std::thread([&] { daemon.stop(); });
   });
   EXPECT_FALSE(debug.ping("hello", &error).has_value());
@@ -159,14 +159,14 @@ TEST_F(ProxyTest, ADaemonThatVanishesInMidCallIsUnreachable) {
   EXPECT_TRUE(rpc::isUnreachable(error)) << platform::printable(error);
 }
 
-TEST_F(ProxyTest, PatienceEndsWithTheSocketOrTheTime) {
+TEST_F(ProxyTest, WaitsForTheSocketUntilPatienceRunsOut) {
   const testsupport::TemporaryDirectory directory;
   const std::string runtime = directory / "later";
   DebugServiceProxy hasty(runtime, std::chrono::milliseconds(1));
   EXPECT_FALSE(hasty.ping("", &error).has_value());
   EXPECT_TRUE(rpc::isUnreachable(error));
   std::thread starter([&] {
-    // A directory that comes only now is seen as well.
+    // A directory that is created only now is noticed as well.
     EXPECT_EQ(rename(daemon.runtimeDirectory().c_str(), runtime.c_str()), 0);
   });
   DebugServiceProxy patient(runtime, std::chrono::minutes(1));

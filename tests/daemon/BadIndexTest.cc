@@ -15,7 +15,7 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// A class whose index is damaged or whose disk is full, and one beside it.
+// A class with a damaged index or a full disk, next to a healthy one.
 namespace {
 
 namespace fs = std::filesystem;
@@ -39,7 +39,7 @@ class BadIndexTest : public testing::Test {
     daemon.signal(SIGTERM);
     EXPECT_EQ(daemon.wait(), 0);
   }
-  // Puts the data back as it was before all damage.
+  // Restores the data as it was before all damage.
   void restore() const {
     fs::remove_all(root);
     fs::copy(kept, root, fs::copy_options::recursive);
@@ -56,7 +56,7 @@ class BadIndexTest : public testing::Test {
     const std::string value = bytes.str();
     salttest::editKey(index, "\xFFOPTIONS", &value);
   }
-  // Turns the first byte of each table round.
+  // Inverts the first byte of each table.
   void damageTables() const {
     salttest::loadIndex(index).reset();  // from the log into a table
     for (const auto& entry : fs::directory_iterator(index)) {
@@ -76,7 +76,7 @@ class BadIndexTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(BadIndexTest, DamageOfOneClassLeavesTheOtherAlone) {
+TEST_F(BadIndexTest, DamageInOneClassDoesNotAffectTheOther) {
   const struct {
     std::function<void()> damage;
     int64_t results;  // or the code of the error
@@ -102,7 +102,7 @@ TEST_F(BadIndexTest, DamageOfOneClassLeavesTheOtherAlone) {
   }
 }
 
-TEST_F(BadIndexTest, WhatEndsTheProcessTwiceIsSetAsideAndTheOtherClassStays) {
+TEST_F(BadIndexTest, SetsAsideAnIndexAfterTwoCrashesAndKeepsTheOtherClass) {
   const std::string page("\x02", 1);
   const struct {
     std::function<void()> damage;
@@ -144,7 +144,7 @@ TEST_F(BadIndexTest, WhatEndsTheProcessTwiceIsSetAsideAndTheOtherClassStays) {
   }
 }
 
-TEST_F(BadIndexTest, KillsAreNoSignOfDamage) {
+TEST_F(BadIndexTest, KillsDoNotCountAsDamage) {
   for (int start = 0; start < 3; ++start) {
     DaemonProcess daemon(directory.path());
     client::SearchServiceProxy service(daemon.runtimeDirectory());
@@ -155,17 +155,17 @@ TEST_F(BadIndexTest, KillsAreNoSignOfDamage) {
   EXPECT_TRUE(salt::indexesSetAside(index).empty());
 }
 
-// The disk is full for files above a limit that the merge passes and nothing else does.
+// The disk is full for files above a size that only the merge exceeds.
 TEST_F(BadIndexTest, AFullDiskInAMergeLosesNothing) {
-  constexpr rlim_t kMostBytes = 64 * 1024;
-  signal(SIGXFSZ, SIG_IGN);  // which the daemon inherits
+  constexpr rlim_t kMaxBytes = 64 * 1024;
+  signal(SIGXFSZ, SIG_IGN);  // inherited by the daemon
   editOptions([](auto& op) { op.MaxHotSuffixes = 4000; });
   {
     DaemonProcess daemon(directory.path());
     client::SearchServiceProxy service(daemon.runtimeDirectory());
     client::DebugServiceProxy debug(daemon.runtimeDirectory());
     EXPECT_EQ(search(service, "a", "bad"), 10);
-    rlimit limit{kMostBytes, RLIM_INFINITY};
+    rlimit limit{kMaxBytes, RLIM_INFINITY};
     ASSERT_EQ(prlimit(daemon.pid(), RLIMIT_FSIZE, &limit, nullptr), 0);
     EXPECT_TRUE(debug.forceVacuumAndCompact("bad", nullptr));
     EXPECT_TRUE(daemon.waitForLog("SALT Error writing to db: IO error"));

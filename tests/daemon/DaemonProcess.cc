@@ -20,7 +20,7 @@ namespace testsupport {
 
 namespace {
 
-constexpr size_t kMaximumLog = size_t{256} << 20;
+constexpr size_t kMaxLogBytes = size_t{256} << 20;
 constexpr int kFirstPassedSocket = 3;
 
 int listenForNotification(const std::string& path) {
@@ -100,7 +100,7 @@ int DaemonProcess::wait() {
 }
 
 std::string DaemonProcess::log() const {
-  return platform::readFile(_directory + "/log", kMaximumLog, nullptr).value_or("");
+  return platform::readFile(_directory + "/log", kMaxLogBytes, nullptr).value_or("");
 }
 
 bool DaemonProcess::waitForLog(const std::string& text) const {

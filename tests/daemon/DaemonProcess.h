@@ -7,13 +7,13 @@
 
 namespace testsupport {
 
-// The daemon as a process of its own, with its state and sockets below a directory of the test.
+// The daemon as its own process, with state and sockets in a directory of the test.
 class DaemonProcess {
  public:
-  // Starts it and waits until it says that it is ready, or has ended.
+  // Starts it and waits until it reports that it is ready, or has ended.
   explicit DaemonProcess(const std::string& directory, const std::vector<int>& passedSockets = {},
                          const std::string& socketNames = "");
-  // Kills it where it still runs.
+  // Kills the process if it is still running.
   ~DaemonProcess();
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;
@@ -26,11 +26,11 @@ class DaemonProcess {
   }
 
   void signal(int number) const;
-  // Waits for the end; the exit status, or 128 and the number of the signal that ended it.
+  // Waits for the end. Returns the exit status, or 128 plus the number of the signal that ended it.
   int wait();
-  // What it has written to its standard error so far.
+  // Its standard error so far.
   [[nodiscard]] std::string log() const;
-  // Waits until the log holds `text`; false when the daemon ended without.
+  // Waits until the log contains `text`; false if the daemon ended first.
   bool waitForLog(const std::string& text) const;
 
  private:
@@ -40,7 +40,7 @@ class DaemonProcess {
   const std::string _runtimeDirectory;
   pid_t _pid = -1;
   bool _ready = false;
-  int _ended = -1;  // a descriptor of the process that can be polled for its end
+  int _ended = -1;  // pidfd of the process, which can be polled
 };
 
 }  // namespace testsupport

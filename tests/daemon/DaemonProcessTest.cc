@@ -53,8 +53,8 @@ std::string varint(size_t value) {
   return bytes + static_cast<char>(value);
 }
 
-// A query whose root has a child that has a child and so on, written by hand, as the records refuse
-// to write so deep a tree.
+// A query with a chain of nested nodes, encoded by hand because the records refuse to write so deep
+// a tree.
 std::string queryOfDepth(size_t depth) {
   std::vector<std::string> lengths;  // innermost first
   for (size_t size = 0; lengths.size() < depth;) {
@@ -68,7 +68,7 @@ std::string queryOfDepth(size_t depth) {
   return bytes;
 }
 
-// The members of an introspection text with their arguments: "Member(sas)->b", names left out.
+// The members in an introspection text with their argument types: "Member(sas)->b".
 std::set<std::string> members(const std::string& xml, const std::string& interface) {
   std::set<std::string> out;
   const size_t from = xml.find("<interface name=\"" + interface + "\"");
@@ -110,7 +110,7 @@ std::string introspect(const std::string& socketPath, const std::string& objectP
 
 }  // namespace
 
-TEST_P(EndingSignal, EndsInOrderBesideABatchAndASearchAndLosesNothingAcknowledged) {
+TEST_P(EndingSignal, ShutsDownDuringABatchAndASearchWithoutLosingAcknowledgedMail) {
   int acknowledged = 0;
   {
     DaemonProcess daemon(directory.path());
@@ -172,7 +172,7 @@ TEST_F(DaemonProcessTest, TheCommandLineNeverStartsADaemon) {
   EXPECT_THAT(run("--help more"), testing::Pair(2, testing::HasSubstr("argument: more")));
 }
 
-TEST_F(DaemonProcessTest, WhatWasAcknowledgedSurvivesAKill) {
+TEST_F(DaemonProcessTest, AcknowledgedMailSurvivesAKill) {
   {
     DaemonProcess daemon(directory.path());
     client::SearchServiceProxy service(daemon.runtimeDirectory());
@@ -213,7 +213,7 @@ TEST_F(DaemonProcessTest, AllOperationsWorkOverTheSockets) {
       daemon.waitForLog("default index stats: {\"DocStoreNumItems\":0,\"SaltNumItems\":0}"));
 }
 
-TEST_F(DaemonProcessTest, WhatDoesNotParseIsRefusedByArgumentAndIndex) {
+TEST_F(DaemonProcessTest, RefusesInvalidBytesNamingArgumentAndIndex) {
   const DaemonProcess daemon(directory.path());
   client::SearchServiceProxy service(daemon.runtimeDirectory());
   Outcome error;
@@ -245,7 +245,7 @@ TEST_F(DaemonProcessTest, WhatDoesNotParseIsRefusedByArgumentAndIndex) {
   EXPECT_EQ(search(service, "fine"), 0);
 }
 
-TEST_F(DaemonProcessTest, OddItemsAndQueriesHaveTheirResult) {
+TEST_F(DaemonProcessTest, HandlesUnusualItemsAndQueries) {
   const DaemonProcess daemon(directory.path());
   client::SearchServiceProxy service(daemon.runtimeDirectory());
   const auto odd = [](const std::string& identifier, const std::string& marker) {
@@ -267,7 +267,7 @@ TEST_F(DaemonProcessTest, OddItemsAndQueriesHaveTheirResult) {
                                              TLString(3, char16_t(0xD800)));
   EncodedItem invalid = client::encode(*odd("invalid", "odd"));
   invalid.bytes +=
-      std::string("\x0A\x06\x08\x0D\x1A\x02\xFF\xC0", 8);  // a subject of no valid UTF-8
+      std::string("\x0A\x06\x08\x0D\x1A\x02\xFF\xC0", 8);  // a subject of invalid UTF-8
   const std::vector<EncodedItem> items{client::encode(*html), client::encode(*separators),
                                        client::encode(*unknown), client::encode(*surrogates),
                                        invalid};
@@ -333,7 +333,7 @@ TEST_F(DaemonProcessTest, ASecondDaemonEndsWithAMessage) {
   EXPECT_TRUE(debug.ping("x", nullptr));
 }
 
-TEST_F(DaemonProcessTest, TakesSocketsByActivation) {
+TEST_F(DaemonProcessTest, AcceptsSocketsFromSystemd) {
   const int search = listenAt(directory / "search");
   const int debug = listenAt(directory / "debug");
   DaemonProcess daemon(directory.path(), {search, debug},
@@ -349,7 +349,7 @@ TEST_F(DaemonProcessTest, TakesSocketsByActivation) {
   close(debug);
 }
 
-TEST_F(DaemonProcessTest, TheInterfacesAreThoseOfTheirFiles) {
+TEST_F(DaemonProcessTest, InterfacesMatchTheirDescriptions) {
   const DaemonProcess daemon(directory.path());
   const std::vector<std::pair<std::string, std::string>> services{
       {rpc::kSearchServiceName, "/com/quill/tallowsearch/SearchService"},

@@ -25,7 +25,7 @@ class FakeVault : public DeviceVault {
   }
   void cancel(int32_t token) override { cancelled = token; }
 
-  // The state changes, and its handler has run when this returns.
+  // Changes the state and waits until its handler has run.
   void change(uint32_t newState) {
     state = newState;
     onQueue->sync(notify);
@@ -108,7 +108,7 @@ TEST(LockMonitor, CallsTheDelegateDirectlyOrOnItsQueue) {
             (std::vector<std::string>{"will be unavailable", "unavailable", "available"}));
 }
 
-TEST(LockMonitor, GoesOnWithoutNotifications) {
+TEST(LockMonitor, WorksWithoutNotifications) {
   FakeVault vault;
   vault.status = 5;
   testsupport::LogCapture log;

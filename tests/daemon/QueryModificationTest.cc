@@ -12,7 +12,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// The subject of the first item, "" for none.
+// The subject of the first item, "" if there is none.
 std::string first(client::SearchServiceProxy& service, const TLString& text) {
   TLQuery query;
   query.setOriginalQuery(text);
@@ -21,7 +21,7 @@ std::string first(client::SearchServiceProxy& service, const TLString& text) {
   return platform::printable(items->at(0)->stringValueForKey(TLAttributeKey::SUBJECT));
 }
 
-// "typed>replacement reason" for each word that the last search replaced.
+// "typed>replacement reason" for each word replaced by the last search.
 std::string replaced(client::SearchServiceProxy& service) {
   std::optional<TLError> error;
   const auto words = service.replacedWords(&error);
@@ -48,7 +48,7 @@ TEST(QueryModificationProcess, MailIsFoundByASynonymAndByAnInflectedForm) {
   EXPECT_EQ(first(other, u"invoicing"), "First invoice for the shelves");
   EXPECT_EQ(replaced(service), "");
   const struct {
-    TLString typed;  // stands in no mail
+    TLString typed;  // occurs in no mail
     const char* subject;
     const char* replaced;
   } cases[] = {

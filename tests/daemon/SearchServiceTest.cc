@@ -28,7 +28,7 @@ std::shared_ptr<TLQuery> textQuery(const TLString& text) {
   return query;
 }
 
-// A query as a mail client asks whether it has messages with these subjects.
+// A query as a mail client sends it to check whether it has messages with these subjects.
 std::shared_ptr<TLQuery> verificationQuery(const std::vector<TLString>& subjects) {
   auto query = std::make_shared<TLQuery>();
   auto root = std::make_shared<TLQueryNode>();
@@ -59,7 +59,7 @@ class SearchServiceTest : public testing::Test {
     return outcomeOf(
         [&](auto reply) { service.indexItems(std::move(items), "test", protectionClass, reply); });
   }
-  // Number of results, -1 after an error, which goes to `lastError`.
+  // The number of results, or -1 with `lastError` set.
   int search(const std::shared_ptr<TLQuery>& query, int64_t maximum = 100,
              const std::string& protectionClass = "default") {
     int count = -2;
@@ -92,7 +92,7 @@ TEST_F(SearchServiceTest, LogsItsRequestsAndNeverPersonalText) {
               "context=<maxResults=100, options=TLSearchOptionTopHit>, protectionClass=default"));
   EXPECT_TRUE(log.contains("results=1, timeTaken="));
   EXPECT_FALSE(log.contains("private"));
-  // The word of a completion comes after its reply; the queue's drain at shutdown waits for it.
+  // The log line of a completion follows its reply; shutdown waits for it.
   service.shutdown();
   EXPECT_TRUE(
       log.contains("default TALSearchService: Finished indexItems numDocuments=1, callerName=test, "
@@ -100,7 +100,7 @@ TEST_F(SearchServiceTest, LogsItsRequestsAndNeverPersonalText) {
   EXPECT_TRUE(log.has("default TALSearchService: SearchService has shut down"));
 }
 
-TEST_F(SearchServiceTest, EmptyFieldsShowAsEmptyAndMaximaRead) {
+TEST_F(SearchServiceTest, LogsEmptyFieldsAndMaxima) {
   EXPECT_EQ(TALSearchService::cleanName(""), "<empty>");
   EXPECT_EQ(TALSearchService::cleanProtectionClass("x"), "x");
   EXPECT_EQ(TALSearchService::_searchDescriptionWithOptions(0, INT64_MAX),
@@ -109,7 +109,7 @@ TEST_F(SearchServiceTest, EmptyFieldsShowAsEmptyAndMaximaRead) {
             "<maxResults=-4, options=TLSearchOptionTopHit>");
 }
 
-TEST_F(SearchServiceTest, TheMaximumCutsAndANegativeOneDoesNot) {
+TEST_F(SearchServiceTest, MaximumTruncatesAndANegativeOneDoesNot) {
   ASSERT_EQ(index({mail(u"a", u"x"), mail(u"b", u"x"), mail(u"c", u"x")}), std::nullopt);
   for (const auto& [maximum, count] :
        std::vector<std::pair<int64_t, int>>{{2, 2}, {0, 0}, {-1, 3}}) {
@@ -117,7 +117,7 @@ TEST_F(SearchServiceTest, TheMaximumCutsAndANegativeOneDoesNot) {
   }
 }
 
-TEST_F(SearchServiceTest, TheLockStateGatesTheClasses) {
+TEST_F(SearchServiceTest, LockStateDecidesWhichClassesAreAccessible) {
   ASSERT_EQ(index({mail(u"a", u"x")}, "SysFileProtectionComplete"), std::nullopt);
   lock.protectedDataAvailable = false;
   const TLError unavailable = TALIndexerManager::indexerUnavailableError();
@@ -163,7 +163,7 @@ TEST_F(SearchServiceTest, AFailedStoreOpenIsTriedAgain) {
   EXPECT_EQ(index({mail(u"a", u"x")}), std::nullopt);
 }
 
-TEST_F(SearchServiceTest, OnAFullDiskAnOpenClassGoesOnAndNoOtherIsOpened) {
+TEST_F(SearchServiceTest, OnAFullDiskAnOpenClassWorksAndNoOtherIsOpened) {
   ASSERT_EQ(index({mail(u"a", u"x")}), std::nullopt);
   freeBytes = 0;
   EXPECT_EQ(search(textQuery(u"x")), 1);
@@ -220,7 +220,7 @@ TEST_F(SearchServiceTest, AfterShutdownNoReplyIsCalled) {
   service.indexItems({mail(u"a", u"x")}, "n", "default", [](const Outcome&) { FAIL(); });
 }
 
-TEST_F(SearchServiceTest, AnEndSignpostBearsTheCount) {
+TEST_F(SearchServiceTest, EndSignpostHasTheCount) {
   std::vector<std::string> events;
   ASSERT_EQ(index({mail(u"a", u"secret")}), std::nullopt);
   platform::setSignpostSink([&](const platform::SignpostEvent& event) {
@@ -269,7 +269,7 @@ TEST(VerificationQuery, SubjectsComeFromTheText) {
   for (const auto& [raw, subjects] : cases) {
     EXPECT_EQ(TALSearchService::subjectsFromRawQuery(raw), subjects) << platform::toUTF8(raw);
   }
-  // An escaped backslash before an apostrophe is undone twice.
+  // An escaped backslash before an apostrophe is unescaped twice.
   EXPECT_EQ(TALSearchService::_stringFromEscapedString(u"\\\\'"), u"'");
 }
 
@@ -288,7 +288,7 @@ TEST_F(SearchServiceTest, VerificationFindsExactSubjectsByBothPaths) {
   subjects[4] = u"Nobody wrote this";
   EXPECT_EQ(search(verificationQuery(subjects)), 4);
   EXPECT_TRUE(log.has("fault TALIndexer: Verification Query Failed"));
-  // As many results as the limit cannot be trusted.
+  // A number of results that reaches the limit cannot be trusted.
   subjects[4] = u"Party";
   const auto limited = verificationQuery(subjects);
   limited->setSearchParams(TLParamsManager::paramsFromString(u"salt.maxTopK=6"));

@@ -9,12 +9,12 @@
 #include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// Verification queries from their text to the mails that are found.
+// Verification queries from their text to the mails found.
 namespace {
 
 using Identifiers = std::multiset<TLString>;
 
-// Subjects that are hard to quote, each other than the rest.
+// Distinct subjects that are hard to quote.
 TLString subjectNumber(size_t i) {
   static const std::vector<std::string> kForms{"It's the {} o'clock news",
                                                "\"{}\", she said",
@@ -70,7 +70,7 @@ class Verification : public testing::Test {
                                 });
     return identifiers;
   }
-  // The mails that have one of the subjects.
+  // The mails with one of the subjects.
   [[nodiscard]] Identifiers expected(const std::vector<TLString>& subjects) const {
     const std::set<TLString> wanted(subjects.begin(), subjects.end());
     Identifiers identifiers;
@@ -97,7 +97,7 @@ TEST_F(Verification, AnySubjectsAreFoundExactlyByBothPaths) {
   for (size_t i = 0; i < kSubjects; ++i) {
     add(subjectNumber(i));
     if (i % 7 == 0) add(subjectNumber(i));                 // twice
-    if (i % 3 == 0) add(subjectNumber(i) + u" tomorrow");  // found by the words, and not meant
+    if (i % 3 == 0) add(subjectNumber(i) + u" tomorrow");  // matches the words only
   }
   index();
   for (const size_t count : {size_t{5}, size_t{50}, kSubjects}) {
@@ -116,7 +116,7 @@ TEST_F(Verification, AnySubjectsAreFoundExactlyByBothPaths) {
   }
 }
 
-// A subject without a word is in no index, and one that nobody has is nowhere.
+// A subject without words is in no index; one that no mail has is not found.
 TEST_F(Verification, TheLinearPathFindsWhatTheIndexCannot) {
   for (const char16_t* const subject : {u"one", u"two", u"three", u"four", u"!!!", u"!!!"})
     add(subject);

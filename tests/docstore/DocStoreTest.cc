@@ -22,7 +22,7 @@ using testsupport::url;
 
 namespace {
 
-// Another connection to the file of the store.
+// Another connection to the database file of the store.
 class Connection {
  public:
   explicit Connection(const std::string& path) {
@@ -364,11 +364,11 @@ TEST_F(DocStore, ALockedDatabaseFailsWritesAndStillReads) {
   EXPECT_EQ(_store.count(nullptr), 3);
 }
 
-TEST_F(DocStore, AFailedCommitIsToldByTheErrorAlone) {
+TEST_F(DocStore, AFailedCommitIsReportedByTheErrorOnly) {
   fill(1);
   struct stat log {};
   ASSERT_EQ(stat((_path + "-wal").c_str(), &log), 0);
-  // From here on the write-ahead log cannot grow.
+  // The write-ahead log cannot grow from here on.
   struct rlimit before {};
   getrlimit(RLIMIT_FSIZE, &before);
   const auto handler = std::signal(SIGXFSZ, SIG_IGN);
@@ -411,7 +411,7 @@ TEST_F(DocStore, DamagedAndMissingItems) {
   EXPECT_THAT(seen, ElementsAre(2U, 1U));
 }
 
-TEST_F(DocStore, AClosedStoreAnswersWithoutHarm) {
+TEST_F(DocStore, AClosedStoreRefusesOperations) {
   fill(1);
   LogCapture capture;
   _store.close();

@@ -10,7 +10,7 @@ using testsupport::item;
 using testsupport::subjectOf;
 using testsupport::url;
 
-TEST(DocStoreThreads, ReadersRunBesideAWriter) {
+TEST(DocStoreThreads, ReadersRunConcurrentlyWithAWriter) {
   TALSqliteDocStore store(":memory:");
   ASSERT_TRUE(store.openWithError(nullptr));
   constexpr size_t kDocuments = 300;
@@ -47,7 +47,7 @@ TEST(DocStoreThreads, ReadersRunBesideAWriter) {
   EXPECT_EQ(store.count(nullptr), static_cast<int64_t>(kDocuments));
 }
 
-TEST(DocStoreThreads, AnyOperationMayMeetTheClose) {
+TEST(DocStoreThreads, AnyOperationMayRunDuringClose) {
   TALSqliteDocStore store(":memory:");
   ASSERT_TRUE(store.openWithError(nullptr));
   ASSERT_TRUE(store.storeOrUpdateDocuments({{url(1), item(u"s")}}, nullptr, nullptr));

@@ -8,7 +8,7 @@ using Seconds = std::optional<double>;
 
 namespace {
 
-// Position of the first formatter that reads the text, and what it reads; -1 for none.
+// The index of the first formatter that reads the text, and the date; -1 for none.
 std::pair<int, double> firstThatReads(const std::vector<Factory::Formatter>& formatters,
                                       TLStringView text) {
   for (size_t i = 0; i < formatters.size(); ++i) {
@@ -55,7 +55,7 @@ TEST(DateFormatter, DatesAndTimes) {
   EXPECT_EQ(firstThatReads(times, u"01:00:01.5"), (std::pair<int, double>{3, 3601.5}));
 }
 
-TEST(DateFormatter, SingleOnesAreStrictAndWriteTheirPattern) {
+TEST(DateFormatter, SingleFormattersAreStrictAndWriteTheirPattern) {
   const double date = 1709634030;
   const struct {
     Factory::Formatter formatter;

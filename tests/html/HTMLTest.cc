@@ -14,8 +14,8 @@ constexpr uint64_t kNoLimit = 2147483647;
 constexpr uint64_t kLatin1 = 5;
 constexpr uint64_t kUTF16BE = 0x90000100;
 
-// The text in UTF-8, "(null)" for none. The bytes stand in memory of exactly their size, so that a
-// sanitizer sees a read past the end.
+// The text in UTF-8, "(null)" for none. The bytes are in memory of exactly their size, so that a
+// sanitizer detects a read past the end.
 std::string plain(std::string_view html, uint64_t limit = kNoLimit,
                   uint64_t encoding = platform::kEncodingUTF8) {
   const std::unique_ptr<char[]> bytes(new char[html.size()]);
@@ -35,7 +35,7 @@ struct Case {
   std::string text;
 };
 
-// Each stands for itself wherever it is put between other text, once there is text before it.
+// Fragments whose text does not depend on what surrounds them, if there is text before them.
 const Case kFragments[] = {
     {"word ", "word "},
     {"gr\xC3\xBC\xC3\x9F", "gr\xC3\xBC\xC3\x9F"},
@@ -76,7 +76,7 @@ TEST(HTML, TagsAndBlocks) {
       {"a<div>b</div>c", "a\nbc"},
       {"x<dt>a</dt><dd>b</dd><li>c</li><td>d</td>", "x\na\n\nb\nc\nd\n"},
       {"x<h1>a</h1><h6>b</h6><h7>c</h7><h>d</h>", "xa\nb\ncd"},
-      // Names count by their beginning.
+      // Names are compared by their beginning.
       {"x<pre>a</pre><param><link><button><picture>", "x\na\n\n\n\n"},
       {"x<brx><lix><ddx><dtx><divx>", "x\n\n\n\n\n"},
       {"x<d><l><di></d></t>", "x"},
@@ -109,7 +109,7 @@ TEST(HTML, AttributesOfTags) {
   for (const Case& each : cases) EXPECT_EQ(plain(each.html), each.text) << each.html;
 }
 
-TEST(HTML, WhatIsNoTagIsText) {
+TEST(HTML, InvalidTagsAreText) {
   const Case cases[] = {
       {"a<", "a<"},
       {"a<b", "a<b"},
@@ -219,7 +219,7 @@ TEST(HTML, OtherEncodings) {
   EXPECT_EQ(utf8.sourceSysEncoding, 0x8000100u);
 }
 
-TEST(HTML, TheLimitIsTestedBeforeARun) {
+TEST(HTML, LimitIsCheckedBeforeEachRun) {
   EXPECT_EQ(plain("long run<b>more&amp;<p>", 1), "long run");
   EXPECT_EQ(plain("a<b>b<b>c", 2), "ab");
   EXPECT_EQ(plain("a&amp;<br>b", 2), "a&");
@@ -302,7 +302,7 @@ TEST(HTML, AnySequenceOfFragmentsIsTheirTextsInOrder) {
   }
 }
 
-// Whatever a document is cut to, the text before the last complete fragment stays.
+// However a document is truncated, the text before the last complete fragment remains.
 TEST(HTML, EveryTruncationKeepsWhatWasCompleteBefore) {
   std::string html;
   for (const Case& fragment : kFragments) html += fragment.html;
@@ -322,7 +322,7 @@ TEST(HTML, EveryTruncationKeepsWhatWasCompleteBefore) {
   EXPECT_EQ(next, std::size(kFragments));
 }
 
-// A scan that goes over the rest of the bytes for each of these would not end.
+// If each of these caused a scan of the remaining bytes, this test would not end.
 TEST(HTML, RepetitionsOfAnyKindTakeOnePass) {
   for (const char* unit : {"<",
                            "&",

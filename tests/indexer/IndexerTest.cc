@@ -64,7 +64,7 @@ class IndexerTest : public testing::Test {
     });
   }
 
-  // Identifiers of the results, in order, separated by blanks; the error's message after a failure.
+  // Identifiers of the results, in order, separated by spaces; on failure the error message.
   std::string search(const std::string& text, std::shared_ptr<TLParameters> overrides = nullptr) {
     TLQuery query;
     query.setOriginalQuery(platform::fromUTF8(text));
@@ -102,22 +102,22 @@ TEST_F(IndexerTest, FindsByWordPhraseAndPrefixAndRanksByZone) {
   EXPECT_TRUE(log.has("error TALIndexer: Query processor failed to generate query terms"));
 }
 
-TEST_F(IndexerTest, EqualScoresGoByDateThenIdentifier) {
+TEST_F(IndexerTest, TiesAreOrderedByDateThenIdentifier) {
   ASSERT_EQ(
       add({mail("a", "x", "", 1000000), mail("b", "x", "", 3000000), mail("c", "x", "", 1000000)}),
       std::nullopt);
   EXPECT_EQ(search("x"), "b c a");
-  const double recent = 1.7e9;  // where a float is 128 seconds wide
+  const double recent = 1.7e9;  // where consecutive floats are 128 seconds apart
   ASSERT_EQ(add({mail("m", "near", "", recent + 64), mail("n", "near", "", recent)}), std::nullopt);
   EXPECT_EQ(search("near"), "n m");
 }
 
-TEST_F(IndexerTest, TheBestFewAreTheFirstOfAllWhateverIsKnownOfTheRest) {
+TEST_F(IndexerTest, TopResultsMatchTheFullRankingWhateverDatesAreCached) {
   const auto expectFirstOfAll = [&](const std::string& when) {
     TLQuery query;
     query.setOriginalQuery(u"word");
     query.setSearchParams(
-        parameters(u"ranking.rankingLogsItemCap=0"));  // else the log has them read
+        parameters(u"ranking.rankingLogsItemCap=0"));  // otherwise logging would read them
     const auto all = indexer->search(query, nullptr);
     for (const size_t most : {0, 1, 2, 3, 7, 19, 20, 100}) {
       size_t count = 0;
@@ -237,7 +237,7 @@ TEST_F(IndexerTest, HTMLPersonsAndListsGoToTheirZones) {
     EXPECT_EQ(search(text), "a") << text;
   }
   EXPECT_EQ(search("unsearchable"), "");
-  EXPECT_EQ(search("inbox"), "");  // no zone of free text
+  EXPECT_EQ(search("inbox"), "");  // the zone is not searched for free text
   EXPECT_EQ(*store->documentWithID(1, nullptr)->stringValueForKey(CONTENT_SNIPPET),
             u"Gr\u00fc\u00dfe aus Bern");
 }
@@ -296,7 +296,7 @@ TEST_F(IndexerTest, AnItemWithoutIdentifierStoresNothingOfTheBatch) {
   EXPECT_FALSE(log.contains("secret"));
 }
 
-TEST_F(IndexerTest, AZoneTooLargeFailsTheRestOfTheBatchAndASecondTryHeals) {
+TEST_F(IndexerTest, AZoneTooLargeFailsTheRestOfTheBatchAndSendingAgainRepairsIt) {
   const std::string tooLarge(200001, 'x');
   const Outcome error = add({mail("a", "word"), mail("b", "", tooLarge), mail("c", "word")});
   ASSERT_TRUE(error);
@@ -337,7 +337,7 @@ TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccess) {
   EXPECT_EQ(fetch(u"client"), std::nullopt);
 }
 
-TEST_F(IndexerTest, AResetForgetsAllAndGoesOn) {
+TEST_F(IndexerTest, AResetRemovesEverythingAndIndexingContinues) {
   ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
   EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
   EXPECT_EQ(search("word"), "");
@@ -346,7 +346,7 @@ TEST_F(IndexerTest, AResetForgetsAllAndGoesOn) {
   EXPECT_EQ(store->documentIDWithURL(*TLURL::parse("tlw://mail_bundle_id/b"), nullptr), 1u);
 }
 
-TEST_F(IndexerTest, IndexAndStoreNeverDifferInWhatTheyKnowOf) {
+TEST_F(IndexerTest, IndexAndStoreHoldTheSameDocuments) {
   ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
   indexer->shutdown();
   ASSERT_TRUE(platform::removeItem(directory / "salt", nullptr));
@@ -361,7 +361,7 @@ TEST_F(IndexerTest, IndexAndStoreNeverDifferInWhatTheyKnowOf) {
   EXPECT_TRUE(log.has("default TALIndexer: SALT was reset"));
 }
 
-TEST_F(IndexerTest, AnIndexThatDoesNotOpenIsMadeAnewAndEmptiesTheStore) {
+TEST_F(IndexerTest, AnIndexThatDoesNotOpenIsRecreatedAndEmptiesTheStore) {
   const std::string salt = directory / "salt";
   const struct {
     std::function<void()> damage;
@@ -391,7 +391,7 @@ TEST_F(IndexerTest, AnIndexThatDoesNotOpenIsMadeAnewAndEmptiesTheStore) {
   }
 }
 
-TEST_F(IndexerTest, AFileInPlaceOfTheIndexIsLeftAloneAndFailsWhatNeedsTheIndex) {
+TEST_F(IndexerTest, AFileInPlaceOfTheIndexIsKeptAndOperationsFail) {
   const std::string salt = directory / "salt";
   ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
   indexer->shutdown();
@@ -407,14 +407,14 @@ TEST_F(IndexerTest, AFileInPlaceOfTheIndexIsLeftAloneAndFailsWhatNeedsTheIndex) 
   EXPECT_EQ(indexer->saltMetrics(), "");
   EXPECT_EQ(platform::readFile(salt, 100, nullptr), "mine");
   EXPECT_EQ(store->count(nullptr), 1);
-  // Once the reason is gone, so is the error.
+  // Once the cause is gone, so is the error.
   ASSERT_TRUE(platform::removeItem(salt, nullptr));
   EXPECT_EQ(add({mail("b", "word")}), std::nullopt);
   EXPECT_EQ(search("word"), "b");
 }
 
-// Neither index nor store is lost when the system lacks something at the wrong moment.
-TEST_F(IndexerTest, AnIndexThatCannotBeOpenedNowKeepsItsMail) {
+// Neither index nor store is lost when the system runs out of something.
+TEST_F(IndexerTest, ATemporaryFailureToOpenKeepsTheMail) {
 #ifdef __SANITIZE_ADDRESS__
   GTEST_SKIP() << "the sanitizer itself needs descriptors for its checks";
 #endif
@@ -422,7 +422,7 @@ TEST_F(IndexerTest, AnIndexThatCannotBeOpenedNowKeepsItsMail) {
   indexer->shutdown();
   rlimit before;
   ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &before), 0);
-  // The store opens, and the index lacks descriptors at one point after the other.
+  // The store opens, but the index runs out of descriptors at one step after another.
   for (rlim_t most = 8; most < 40; ++most) {
     const rlimit few{most, before.rlim_max};
     ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &few), 0);
@@ -436,7 +436,7 @@ TEST_F(IndexerTest, AnIndexThatCannotBeOpenedNowKeepsItsMail) {
   EXPECT_TRUE(log.contains("Could not open the text index"));
 }
 
-TEST_F(IndexerTest, ADocumentThatTheStoreLostIsLeftOut) {
+TEST_F(IndexerTest, ADocumentMissingInTheStoreIsLeftOut) {
   ASSERT_EQ(add({mail("a", "word"), mail("b", "word")}), std::nullopt);
   ASSERT_TRUE(store->deleteDocument(1, nullptr));
   EXPECT_EQ(search("word"), "b");
@@ -444,7 +444,7 @@ TEST_F(IndexerTest, ADocumentThatTheStoreLostIsLeftOut) {
       log.contains("error TALIndexer: Internal docid 1 not found in docstore. Text score: 0.9"));
 }
 
-TEST_F(IndexerTest, AfterShutdownEverythingSaysSo) {
+TEST_F(IndexerTest, AfterShutdownEveryOperationFails) {
   ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
   indexer->shutdown();
   const TLError shuttingDown{"TALIndexer", 4, "shutting down"};
@@ -470,7 +470,7 @@ TEST_F(IndexerTest, StateIsCapturedFromTheQueue) {
             (nlohmann::json{{"DocStoreNumItems", 1}, {"SaltNumItems", 1}}));
 }
 
-TEST_F(IndexerTest, SubjectsAreFoundByAWalkOverTheStore) {
+TEST_F(IndexerTest, SubjectsAreFoundByReadingTheStore) {
   ASSERT_EQ(add({mail("a", "One"), mail("b", "Two"), mail("c", "One")}), std::nullopt);
   auto items = indexer->iterateAllDocsToFindMatchingSubjects({u"One"}, nullptr);
   ASSERT_TRUE(items);
@@ -483,12 +483,12 @@ TEST_F(IndexerTest, SubjectsAreFoundByAWalkOverTheStore) {
   EXPECT_TRUE(log.has("fault TALIndexer: Verification Query Failed"));
 }
 
-TEST_F(IndexerTest, SearchesAndStatisticsRunBesideIngest) {
+TEST_F(IndexerTest, SearchesAndStatisticsRunDuringIngest) {
   std::atomic<bool> done{false};
   std::thread reader([&] {
     while (!done) {
       search("word");
-      search("wording ");  // rewritten, beside the batches
+      search("wording ");  // modified, while batches run
       static_cast<void>(indexer->docStats());
       static_cast<void>(indexer->saltMetrics());
     }

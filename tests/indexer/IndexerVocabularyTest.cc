@@ -14,7 +14,7 @@ namespace {
 using testsupport::Outcome;
 using testsupport::outcomeOf;
 
-// Documents by which a vocabulary is due when there is none.
+// Number of documents from which a first vocabulary is due.
 constexpr int kDue = 51;
 
 class IndexerVocabularyTest : public testing::Test {
@@ -32,7 +32,7 @@ class IndexerVocabularyTest : public testing::Test {
     open();
   }
 
-  // Mail that is named by its subject.
+  // Mails with their subjects as identifiers.
   Outcome add(const std::vector<std::string>& subjects) {
     TALIndexer::Items items;
     for (const std::string& subject : subjects) {
@@ -51,7 +51,7 @@ class IndexerVocabularyTest : public testing::Test {
     for (int i = 0; i < count; ++i) subjects.push_back("common " + std::to_string(i));
     return add(subjects);
   }
-  // Adds documents so that a rebuild is due, and waits for it and one more.
+  // Adds enough documents for a rebuild, and waits for it and one more.
   void build() {
     ASSERT_EQ(addMany(kDue), std::nullopt);
     EXPECT_EQ(rebuild(), std::nullopt);
@@ -108,7 +108,7 @@ TEST_F(IndexerVocabularyTest, IsBuiltDuringIngestAndSurvivesARestart) {
   ASSERT_EQ(addMany(kDue - 1), std::nullopt);
   EXPECT_FALSE(log.contains("Starting to rebuild topK vocab"));
   ASSERT_EQ(addMany(kDue), std::nullopt);
-  EXPECT_EQ(rebuild(), std::nullopt);  // ends the one that has begun, if that still counts
+  EXPECT_EQ(rebuild(), std::nullopt);  // interrupts the running count, if any
   EXPECT_EQ(log.count("default TALTopKVocab: Starting to rebuild topK vocab from SALT."), 2U);
   EXPECT_TRUE(log.contains("default TALTopKVocab: Rebuild docID: 51."));
   EXPECT_EQ(indexer->topKVocabulary()->front(), "common ");
@@ -121,7 +121,7 @@ TEST_F(IndexerVocabularyTest, IsBuiltDuringIngestAndSurvivesARestart) {
   EXPECT_EQ(log.count("default TALTopKVocab: Starting to rebuild topK vocab from SALT."), 2U);
 }
 
-TEST_F(IndexerVocabularyTest, AResetForgetsItAndGoesOn) {
+TEST_F(IndexerVocabularyTest, AResetClearsItAndRebuildsContinue) {
   build();
   EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
   EXPECT_TRUE(indexer->topKVocabulary()->empty());
@@ -130,7 +130,7 @@ TEST_F(IndexerVocabularyTest, AResetForgetsItAndGoesOn) {
   EXPECT_EQ(search("comon 7"), "common-7");
 }
 
-TEST_F(IndexerVocabularyTest, AResetOrShutdownDuringARebuildNeitherHangsNorReadsWhatIsGone) {
+TEST_F(IndexerVocabularyTest, AResetOrShutdownDuringARebuildNeitherHangsNorUsesFreedMemory) {
   for (int round = 0; round < 4; ++round) {
     ASSERT_EQ(addMany(kDue), std::nullopt);
     for (int i = 0; i < 3; ++i) indexer->forceRebuildTopKVocabWithCompletionHandler(nullptr);

@@ -13,7 +13,7 @@
 
 namespace {
 
-// An indexer over three mails, with synonyms of its own.
+// An indexer with three mails and its own synonyms.
 class QueryModification : public testing::Test {
  protected:
   QueryModification() {
@@ -40,7 +40,7 @@ class QueryModification : public testing::Test {
     return item;
   }
 
-  // Identifiers in order; the error's message after a failure.
+  // Identifiers in order; on failure the error message.
   std::string search(const TLString& text, const TLString& parameters = u"salt.maxTopK=9") {
     TLQuery query;
     query.setOriginalQuery(text);
@@ -53,7 +53,7 @@ class QueryModification : public testing::Test {
     return error ? error->message : out;
   }
 
-  // What the driver logged of this search, without what others say in between.
+  // What the modification driver logged for this search, without the lines of others.
   std::vector<std::string> driverLines() const {
     const std::string prefix = "default TALIndexer: ";
     std::vector<std::string> lines;
@@ -83,7 +83,7 @@ const char* const kSpellingGoesOn =
 
 }  // namespace
 
-TEST_F(QueryModification, TriesSpellingSynonymsStemsAndTheFirstThatChangesSomethingEndsIt) {
+TEST_F(QueryModification, TriesSpellingThenSynonymsThenStemsUntilOneChangesSomething) {
   EXPECT_EQ(search(u"bill june"), "a");
   EXPECT_EQ(
       driverLines(),
@@ -110,13 +110,13 @@ TEST_F(QueryModification, TriesSpellingSynonymsStemsAndTheFirstThatChangesSometh
              "query modification.",
              "Stem rewrite started.", "Stem rewrite finished with query modified.",
              "Query modification finished. Results retrieved with modified query terms."}));
-  // The synonym keeps the stem, which mail has, from being tried.
+  // The synonym wins, so the stem, which would find mail, is not tried.
   EXPECT_EQ(search(u"shipping "), "a");
   EXPECT_EQ(search(u"shipping ", kSynonymsOff), "b");
   EXPECT_EQ(search(u"shipping "), "a");
 }
 
-TEST_F(QueryModification, LeavesWhatCannotBeChanged) {
+TEST_F(QueryModification, KeepsQueriesThatCannotBeModified) {
   EXPECT_EQ(search(u"zebra "), "");
   EXPECT_EQ(driverLines().back(),
             "Query modification didnt work out. Return original query results.");
@@ -128,7 +128,7 @@ TEST_F(QueryModification, LeavesWhatCannotBeChanged) {
                    "Query modification didnt work out. Return original query results."}));
 }
 
-TEST_F(QueryModification, RunsWithAtMostAsManyResultsAsTheThreshold) {
+TEST_F(QueryModification, RunsUpToTheThresholdOfResults) {
   const struct {
     TLString text;
     TLString threshold;
@@ -144,14 +144,14 @@ TEST_F(QueryModification, RunsWithAtMostAsManyResultsAsTheThreshold) {
     EXPECT_EQ(search(c.text, kThreshold + c.threshold), c.found);
     EXPECT_EQ(log.contains("Query modification started"), c.runs) << platform::toUTF8(c.text);
   }
-  // The second pass replaces the first one, even where it is poorer.
+  // The second pass replaces the first one even if it finds less.
   EXPECT_EQ(search(u"billing", kThreshold + u"5"), "c");
   EXPECT_EQ(search(u"bill address june", kThreshold + u"5"), "");
   EXPECT_TRUE(TALIndexer::_notSufficientRetrieval({}, 0));
   EXPECT_FALSE(TALIndexer::_shouldRunQueryModification(6, 5));
 }
 
-TEST_F(QueryModification, AFailureOfTheSecondPassIsTheSearchs) {
+TEST_F(QueryModification, AFailureOfTheSecondPassFailsTheSearch) {
   store->close();
   EXPECT_EQ(search(u"zebra "), "");
   const std::string failure = search(u"ordering ");
@@ -162,7 +162,7 @@ TEST_F(QueryModification, AFailureOfTheSecondPassIsTheSearchs) {
   EXPECT_FALSE(log.contains("Query modification finished."));
 }
 
-TEST_F(QueryModification, ManyWordsAndOddOnesHaveAnAnswer) {
+TEST_F(QueryModification, HandlesManyAndUnusualWords) {
   TLString words;
   for (int i = 0; i < 1000; ++i) words += u"zebra" + platform::fromUTF8(std::to_string(i)) + u' ';
   EXPECT_EQ(search(words), "");
@@ -177,7 +177,7 @@ TEST_F(QueryModification, WithoutASynonymFileThereAreNoSynonyms) {
   EXPECT_TRUE(log.has("error TALIndexer: Failed to load synonym file: " + missing));
   EXPECT_TRUE(log.has("error TALSynonyms: Failed to load synonym file: " + missing));
   other.shutdown();
-  // A reset reads the synonyms no second time.
+  // A reset does not read the synonyms again.
   log.clear();
   std::promise<void> done;
   indexer->resetWithCompletionHandler([&done](const auto&) { done.set_value(); });

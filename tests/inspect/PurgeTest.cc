@@ -33,7 +33,7 @@ using testsupport::outcomeOf;
 constexpr int kMails = 80;
 constexpr int kDeleted = 20;  // the first ones
 
-// Three words that stand in this mail only, in its subject, its snippet and its body.
+// Three words that occur in this mail only, in its subject, its snippet and its body.
 std::string rareWord(int mail, const char* where) {
   return fmt::format("q{}z{}vx{}kj", where, mail * 7919 % 104729, mail);
 }
@@ -92,7 +92,7 @@ class PurgeTest : public testing::Test {
     store.reset();
   }
 
-  // By query: identifier, ID in the store, and score of each result, in their order.
+  // By query: identifier, ID in the store, and score of each result, in order.
   std::map<std::string, std::string> answers() {
     std::map<std::string, std::string> all;
     for (const char* text : {"harbour", "invoice tea", "h", "ferry ", "meeting window t", "harbuor",
@@ -119,8 +119,8 @@ class PurgeTest : public testing::Test {
     return now;
   }
 
-  // How many of the deleted mails' words stand anywhere in a file of the state, the vocabulary
-  // included, or, as tables are compressed, in a key or value of the index.
+  // How many words of deleted mails occur in any file of the state (including the vocabulary) or,
+  // because tables are compressed, in a key or value of the index.
   size_t rareWordsLeft() {
     std::string bytes;
     for (const auto& entry : fs::recursive_directory_iterator(state)) {
@@ -146,7 +146,7 @@ class PurgeTest : public testing::Test {
         state, "default", [](const char*) {}, &error);
   }
 
-  // Purges in a process of its own, which `step` may end; the status, as of waitpid.
+  // Purges in its own process, which `step` may end; returns the status from waitpid.
   int purgeInChild(const std::function<void(int number, std::string_view step)>& step) {
     const pid_t child = fork();
     if (child == 0) {
@@ -176,7 +176,7 @@ class PurgeTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(PurgeTest, DeletedMailIsGoneAndAnswersStay) {
+TEST_F(PurgeTest, RemovesDeletedMailAndKeepsAnswers) {
   EXPECT_GT(rareWordsLeft(), size_t{kDeleted});
   const auto estimate = inspect::estimatePurge(state, "default", &error);
   ASSERT_TRUE(estimate) << platform::printable(error);
@@ -195,7 +195,7 @@ TEST_F(PurgeTest, DeletedMailIsGoneAndAnswersStay) {
   EXPECT_EQ(answersNow(), answersBefore);
   EXPECT_THAT(answersBefore["harbuor"], HasSubstr("mail-"));
 
-  open();  // IDs go on where they were
+  open();  // IDs continue where they were
   std::mt19937 random(2);
   TALIndexer::Items again{mail(kMails, random), mail(0, random)};
   EXPECT_EQ(outcomeOf([&](auto done) { indexer->addDocs(again, "mail", done); }), std::nullopt);
@@ -210,8 +210,8 @@ TEST_F(PurgeTest, DeletedMailIsGoneAndAnswersStay) {
   EXPECT_EQ(second->documents, 0u);
 }
 
-// Documents that the store does not have are found by nobody.
-TEST_F(PurgeTest, WhatOnlyTheIndexHasGoesToo) {
+// Documents missing in the store are not found by any search.
+TEST_F(PurgeTest, RemovesDocumentsThatOnlyTheIndexHas) {
   {
     const auto index = salttest::loadIndex(classPath + "/salt");
     ASSERT_TRUE(salttest::addZone(*index, kMails + 9, 1, "orphanedword "));
@@ -240,7 +240,7 @@ TEST_F(PurgeTest, AKillLeavesTheOldClassOrTheNew) {
   EXPECT_FALSE(fs::exists(platform::purgeDirectory(state)));
 }
 
-TEST_F(PurgeTest, TheDaemonRemovesWhatAKillHasLeft) {
+TEST_F(PurgeTest, TheDaemonRemovesTheRemainsOfAKilledPurge) {
   const int status = purgeInChild([](int, std::string_view step) {
     if (step == "removing the old files") raise(SIGKILL);
   });
@@ -271,7 +271,7 @@ TEST_F(PurgeTest, TheDaemonRemovesWhatAKillHasLeft) {
   EXPECT_THAT(text, HasSubstr("0 deleted messages removed from the disk, "));
 }
 
-// A write that fails ends the purge, or the process, and leaves the old class.
+// A failed write ends the purge, or the process, and leaves the old class.
 TEST_F(PurgeTest, AFullDiskChangesNothing) {
   for (const uint64_t bytes : {0, 1000, 20000, 60000, 150000}) {
     const int status = purgeInChild([bytes](int number, std::string_view) {

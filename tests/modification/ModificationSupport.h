@@ -11,18 +11,18 @@
 
 namespace testsupport {
 
-// The term of one word of a query in two zones, 13 and 171; with a blank at its end a whole word.
+// The term of one query word in two zones, 13 and 171; with a trailing space it is a whole word.
 [[nodiscard]] saltsearch::Term word(const std::string& token);
 
-// The first tokens of the terms in brackets.
+// The first tokens of the terms, joined by bars, in brackets.
 [[nodiscard]] std::string tokensOf(const std::vector<saltsearch::Term>& terms);
 
-// An index of documents 1 and on, each of one text, and the log.
+// An index of documents 1, 2, ... with one text each, and a log capture.
 struct Corpus {
-  // Texts are words with a blank behind each.
+  // Each word of a text is followed by a space.
   explicit Corpus(const std::vector<std::string>& texts);
 
-  // The terms as they are after a search that found what there is of them.
+  // The terms after a search, with `found` set.
   [[nodiscard]] std::vector<saltsearch::Term> searched(std::vector<saltsearch::Term> terms) const;
 
   LogCapture log;

@@ -43,7 +43,7 @@ class SpellCorrectionTest : public testing::Test {
     spelling = std::make_unique<TALSpellCorrection>(vocab);
   }
 
-  // Searches, so that `found` is set, and corrects. The terms' first tokens afterwards, "-" when
+  // Searches, so that `found` is set, and corrects. Returns the first tokens of the terms, "-" if
   // nothing changed.
   std::string correct(std::vector<Term> terms) {
     static_cast<void>(saltsearch::Search(*index, terms, {1000, 1000000, 0.02}));
@@ -75,7 +75,7 @@ class SpellCorrectionTest : public testing::Test {
 
 }  // namespace
 
-// Two letters: no deletion; one pair, which is the first.
+// Two letters: no deletion, and a single pair to swap.
 TEST_F(SpellCorrectionTest, EditsComeInOrderOfPosition) {
   const auto all = spelling->editOneCandidates("ab");
   std::vector<std::pair<std::string, float>> expected{{"ba", 0.61F}};
@@ -103,7 +103,7 @@ TEST_F(SpellCorrectionTest, EditsByLengthOfTheWord) {
   const struct {
     std::string word;
     size_t count;
-    std::vector<std::pair<std::string, float>> some;  // candidate and score, in order
+    std::vector<std::pair<std::string, float>> some;  // candidates with scores, in order
     std::vector<std::string> none;
   } cases[] = {
       {"abc",
@@ -127,7 +127,7 @@ TEST_F(SpellCorrectionTest, EditsByLengthOfTheWord) {
         {"abcdz", 0.75F}},
        {"cd"}},
       {"aabb", 1 + 4 + 4 * 51 + 26, {{"abb", 0.6F}, {"abab", 0.7F}, {"aab", 0.72F}}, {}},
-      // The budget of 1000 is used up at the nineteenth letter: 18 * 53 candidates before it.
+      // The budget of 1000 is exhausted at the nineteenth letter, after 18 * 53 candidates.
       {"abcdefghijklmnopqrst", 1000, {{"abcdefghijklmnopqrts", 0.62F}}, {"abcdefghijklmnopqrstz"}},
       {"abcdefghijklmnopqrstu", 1000, {{"abcdefghijklmnopqrtsu", 0.7F}}, {"abcdefghijklmnopqrsut"}},
   };
@@ -200,14 +200,14 @@ TEST_F(SpellCorrectionTest, ChangesOneTokenAndItsScore) {
   EXPECT_TRUE(corrected[0].isUnigram);
 }
 
-TEST_F(SpellCorrectionTest, TheWholeQueryJudgesAndTheFirstOfEqualsWins) {
+TEST_F(SpellCorrectionTest, CandidatesAreScoredByTheWholeQueryAndTheFirstWinsTies) {
   add(1, "cart red ");
   add(2, "cast blue ");
   add(3, "carp red ");
   EXPECT_EQ(correct({word("cazt "), word("blue ")}), "cast |blue |");
   // Both replace the third letter.
   EXPECT_EQ(correct({word("caqt ")}), "cart |");
-  // None is in a document with the other word.
+  // No document contains both a candidate and the other word.
   EXPECT_EQ(correct({word("cazt "), word("green ")}), "-");
   EXPECT_TRUE(
       log.has("default TALSpellCorrection: Skipping spelling correction as more than 1 "
@@ -231,14 +231,14 @@ TEST_F(SpellCorrectionTest, CandidatesMustBeInTheTermsZonesAndWithinTheBudget) {
   add(9, "cast ");
   add(10, "cant ");
   add(11, "catt ");
-  // Five suffixes in other zones come before the one that would count.
+  // Five suffixes in other zones come before the matching one.
   EXPECT_THAT(tokens(spelling->_getCandidates("cazt ", word("cazt "), *index)),
               ElementsAre("cant ", "catt "));
   const TALSpellCorrection frugal(vocab, 1000, 1);
   EXPECT_THAT(tokens(frugal._getCandidates("cazt ", word("cazt "), *index)), ElementsAre("cant "));
 }
 
-TEST_F(SpellCorrectionTest, TakesFrequentWordsWhereNoEditFits) {
+TEST_F(SpellCorrectionTest, UsesFrequentWordsWhereNoEditFits) {
   add(1, "international ");
   vocab->setVocab({"in ", "international ", "internationalisation", "internatioal", "intern "});
   EXPECT_EQ(correct({word("interantionel ")}), "international |");
@@ -246,7 +246,7 @@ TEST_F(SpellCorrectionTest, TakesFrequentWordsWhereNoEditFits) {
       log.has("default TALSpellCorrection: Spelling did not find any candidate from edit "
               "distance 1. Continue with topK method."));
   EXPECT_TRUE(log.has("default TALSpellCorrection: topKVocab has 5 entries."));
-  // The entry's own form counts, whatever was typed.
+  // The form of the entry decides, not that of the typed word.
   const auto candidates = spelling->_getCandidatesFromTopKVocab("interantionel", true);
   ASSERT_THAT(tokens(candidates), ElementsAre("international ", "internatioal"));
   EXPECT_FLOAT_EQ(candidates[0]._scoreError, 1 - (cSwapMid + cSubMid) / 13);
@@ -260,7 +260,7 @@ TEST_F(SpellCorrectionTest, TakesFrequentWordsWhereNoEditFits) {
   EXPECT_EQ(correct({word("\xF0\x9F\x98\x80\xF0\x9F\x98\x80 ")}), "-");
 }
 
-TEST_F(SpellCorrectionTest, AThousandWordsAreNoTrouble) {
+TEST_F(SpellCorrectionTest, HandlesAThousandWords) {
   add(1, "word ");
   std::vector<Term> terms(1000, word("word "));
   terms[500] = word("wrd ");

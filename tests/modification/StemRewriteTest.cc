@@ -19,7 +19,7 @@ std::string rewrite(const Corpus& corpus, const Terms& terms) {
 
 }  // namespace
 
-TEST(StemRewrite, MakesEachWordItsStemAsAPrefix) {
+TEST(StemRewrite, ReplacesEachWordByItsStemAsAPrefix) {
   const Corpus corpus({"we shipped the orders ", "shipping an order to a b "});
   saltsearch::Term phrase = word("shippings ordered ");
   phrase.isUnigram = false;
@@ -28,7 +28,7 @@ TEST(StemRewrite, MakesEachWordItsStemAsAPrefix) {
   scoreless.tokenScores.clear();
   saltsearch::Term weak = word("ordering");
   weak.tokenScores = {0.1};
-  // Whether a word was found makes no difference; one of less than 3 bytes stays.
+  // Words are stemmed whether they were found or not; those of less than 3 bytes are unchanged.
   EXPECT_EQ(rewrite(corpus, corpus.searched({phrase, empty, scoreless, word("shippings "), weak,
                                              word("order "), word("a "), word("b"), word("to ")})),
             "[shippings ordered ][][shippings ][ship][order][order][a ][b][to]");
@@ -42,7 +42,7 @@ TEST(StemRewrite, MakesEachWordItsStemAsAPrefix) {
   EXPECT_EQ(weak.tokens[0], "ordering");
 }
 
-TEST(StemRewrite, GivesUpWithoutAWordOrAtAStemThatIsNowhere) {
+TEST(StemRewrite, GivesUpWithoutAWordOrAtAStemThatIsNotInTheIndex) {
   const Corpus corpus({"ship order "});
   for (const Terms& terms : {Terms{}, Terms{word("a "), word("b")}}) {
     EXPECT_EQ(rewrite(corpus, terms), "no");
@@ -52,7 +52,7 @@ TEST(StemRewrite, GivesUpWithoutAWordOrAtAStemThatIsNowhere) {
   EXPECT_TRUE(corpus.log.has(
       "default TALStemRewrite: Skipping stem rewrite as stemToken has no match in the lexicon"));
   EXPECT_FALSE(corpus.log.contains("orders"));
-  // Another zone than those that are searched is nowhere, too.
+  // A zone that is not searched does not count.
   saltsearch::Term elsewhere = word("ships ");
   elsewhere.zones = {107};
   elsewhere.zoneScores = {1};

@@ -9,7 +9,7 @@
 TEST(Stemmer, FollowsTheRulesOfEachStep) {
   struct Step {
     const char* name;
-    const char* words;  // each word and its stem
+    const char* words;  // alternating words and stems
   };
   const Step steps[] = {
       {"words of one or two letters stay", "a a, s s, is is, be be, by by, as as, ed ed"},
@@ -92,7 +92,7 @@ TEST(Stemmer, FollowsTheRulesOfEachStep) {
   EXPECT_GE(words, 200u);
 }
 
-TEST(Stemmer, WorksInPlaceWithARecordOfTheCallers) {
+TEST(Stemmer, WorksInPlaceOnTheCallersRecord) {
   stemmer* record = create_stemmer();
   std::string word = "hoppingX";
   EXPECT_EQ(stem(record, word.data(), 6), 2);
@@ -104,7 +104,7 @@ TEST(Stemmer, WorksInPlaceWithARecordOfTheCallers) {
   free_stemmer(record);
 }
 
-TEST(Stemmer, BoundsTheLengthInBytesAndCutsNoCharacter) {
+TEST(Stemmer, LimitsTheLengthInBytesAndSplitsNoCharacter) {
   const std::string hundred = std::string(96, 'b') + "ains";
   EXPECT_EQ(TALStemWord(hundred, 100), hundred.substr(0, 99));
   EXPECT_EQ(TALStemWord('b' + hundred, 100), 'b' + hundred);

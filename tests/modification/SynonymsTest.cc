@@ -34,7 +34,7 @@ class SynonymFile : public testing::Test {
   std::optional<TLError> error;
 };
 
-// Big-endian, of the basic plane, behind a byte order mark.
+// Big-endian UTF-16 with a byte order mark; basic plane only.
 std::string utf16BE(const std::string& text) {
   std::string bytes = "\xFE\xFF";
   for (const char16_t unit : platform::fromUTF8(text)) {
@@ -85,7 +85,7 @@ TEST_F(SynonymFile, IsReadLineByLine) {
   }
 }
 
-TEST_F(SynonymFile, ComesInAnyEncoding) {
+TEST_F(SynonymFile, MayHaveAnyEncoding) {
   const std::string text = "caf\xC3\xA9,bistro\nna\xC3\xAFve,green\nHome,house\n";
   const std::string latin1 = "caf\xE9,bistro\nna\xEFve,green\nHome,house\n";
   for (const std::string& bytes : {text, "\xEF\xBB\xBF" + text, utf16BE(text), latin1}) {
@@ -94,7 +94,7 @@ TEST_F(SynonymFile, ComesInAnyEncoding) {
   }
 }
 
-TEST_F(SynonymFile, ThatCannotBeReadLeavesTheSynonymsAndSaysWhy) {
+TEST_F(SynonymFile, UnreadableKeepsTheSynonymsAndReportsWhy) {
   ASSERT_TRUE(load("car,auto\nbad line\nhome,house"));
   EXPECT_EQ(log.lines(), (std::vector<std::string>{
                              "default TALSynonyms: Loading synonym from file: " + path,
@@ -105,7 +105,7 @@ TEST_F(SynonymFile, ThatCannotBeReadLeavesTheSynonymsAndSaysWhy) {
     EXPECT_TRUE(log.has("error TALSynonyms: Empty synonym file: " + path));
     log.clear();
   }
-  EXPECT_FALSE(load(std::string(TALSynonyms::kMaximumFileSize + 1, 'x')));
+  EXPECT_FALSE(load(std::string(TALSynonyms::kMaxFileBytes + 1, 'x')));
   EXPECT_EQ(error->code, EFBIG);
   EXPECT_TRUE(log.contains("error TALSynonyms: Failed to read synonym file: " + path +
                            " with error: POSIX "));
@@ -118,7 +118,7 @@ TEST_F(SynonymFile, ThatCannotBeReadLeavesTheSynonymsAndSaysWhy) {
   EXPECT_EQ(of("car"), "auto");
 }
 
-TEST_F(SynonymFile, OfAnyContentsLoads) {
+TEST_F(SynonymFile, LoadsWithAnyContents) {
   std::string longLine = "head";
   for (char32_t i = 0; longLine.size() < (size_t{1} << 20); ++i) {
     for (size_t rest = i + 1; rest != 0; rest /= 26) {
@@ -138,7 +138,7 @@ TEST_F(SynonymFile, OfAnyContentsLoads) {
   EXPECT_TRUE(load(std::string(5, '\0')));
 }
 
-TEST_F(SynonymFile, GivesEachSynonymItsWorth) {
+TEST_F(SynonymFile, GivesEachSynonymItsScore) {
   EXPECT_TRUE(model.getSynonymsScores("car").empty());
   ASSERT_TRUE(load("car,auto,van,cab"));
   EXPECT_EQ(model.getSynonymsScores("car"), (std::vector<std::pair<std::string, float>>{
@@ -147,7 +147,7 @@ TEST_F(SynonymFile, GivesEachSynonymItsWorth) {
 }
 
 TEST(ShippedSynonyms, AreAllUsableAndPlain) {
-  const auto bytes = platform::readFile(TALLOW_SYNONYMS, TALSynonyms::kMaximumFileSize, nullptr);
+  const auto bytes = platform::readFile(TALLOW_SYNONYMS, TALSynonyms::kMaxFileBytes, nullptr);
   ASSERT_TRUE(bytes);
   EXPECT_EQ(bytes->find_first_not_of("abcdefghijklmnopqrstuvwxyz ,\n"), std::string::npos);
   const TLString text = platform::fromUTF8(*bytes);
@@ -195,7 +195,8 @@ class Expansion : public testing::Test {
 }  // namespace
 
 TEST_F(Expansion, TakesTheSynonymThatServesTheWholeQueryBest) {
-  EXPECT_EQ(expand({word("car ")}), "[van ]");  // all score alike: the first of the file
+  EXPECT_EQ(expand({word("car ")}),
+            "[van ]");  // all have the same score, so the first in the file wins
   EXPECT_FLOAT_EQ(score, 0.9F);
   EXPECT_EQ(expand({word("red "), word("car ")}), "[red ][auto ]");
   EXPECT_FLOAT_EQ(score, 0.81F);
@@ -209,7 +210,7 @@ TEST_F(Expansion, TakesTheSynonymThatServesTheWholeQueryBest) {
                      "<\"ca...\"<3 chars>> modified with best synonym <\"au...\"<5 chars>>."));
 }
 
-TEST_F(Expansion, LeavesAQueryThatItCannotMend) {
+TEST_F(Expansion, KeepsAQueryThatItCannotImprove) {
   saltsearch::Term pair = word("car boat ");
   pair.isUnigram = false;
   const struct {
@@ -227,7 +228,7 @@ TEST_F(Expansion, LeavesAQueryThatItCannotMend) {
     EXPECT_TRUE(corpus.log.has("default TALSynonyms: Skipping synonym expansion " + c.line))
         << c.line;
   }
-  // A synonym that only stands in other documents than the rest of the query.
+  // A synonym that occurs only in documents without the rest of the query.
   EXPECT_EQ(expand({word("open "), word("car ")}), "no");
   EXPECT_TRUE(
       corpus.log.has("default TALSynonyms: Synonym expansion returns score -1, as best candidate "

@@ -24,7 +24,7 @@ using testsupport::Outcome;
 using testsupport::outcomeOf;
 using Words = TALTopKVocab::Words;
 
-// An index of a hundred zones, whose walks call a function at each.
+// An index of a hundred zones that calls a function for each zone iterated over.
 class WatchedIndex final : public salt::Index {
  public:
   std::function<void()> atZone = [] {};
@@ -63,7 +63,7 @@ class WatchedIndex final : public salt::Index {
   void ResetScanMetrics() override {}
   bool Validate() const override { return true; }
   std::string Dump() const override { return ""; }
-  void WaitWhileTidying() override {}
+  void WaitForMaintenance() override {}
   void Interrupt() override {}
 
  private:
@@ -79,7 +79,7 @@ class TopKVocabTest : public testing::Test {
         [&vocab](auto done) { vocab.checkAndRebuildTopKVocabWithCompletionHandler(done, true); });
   }
 
-  // What loading gives for a stored blob: an object, its error, and what it has then.
+  // The outcome of loading a stored blob: an object, its error, and its contents.
   struct Loaded {
     Outcome error;
     Words words;
@@ -107,7 +107,7 @@ class TopKVocabTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(TopKVocabTest, IsDueByDocumentsThatCameAndByAge) {
+TEST_F(TopKVocabTest, RebuildIsDueByDocumentsAddedAndByAge) {
   const double now = platform::secondsSince1970();
   const double old = now - 432010;
   const struct {
@@ -169,12 +169,12 @@ TEST_F(TopKVocabTest, CountsStoresAndSurvivesARestart) {
   const TALTopKVocab again(store, index.get());
   EXPECT_THAT(*again.vocab(), ElementsAre("b ", "a ", "b", "c\xF0\x9F\x98\x80 "));
   EXPECT_EQ(again.lastTopKRebuildDocID(), 77U);
-  EXPECT_EQ(again.maxDocID(), 77U);  // those that had piled up are forgotten
+  EXPECT_EQ(again.maxDocID(), 77U);  // the count of documents since the last rebuild is reset
   EXPECT_NEAR(again.lastTopKRebuildDate(), platform::secondsSince1970(), 60);
   EXPECT_TRUE(log.has("default TALTopKVocab: TopK loaded from docstore."));
 }
 
-TEST_F(TopKVocabTest, AnEmptyIndexGivesAnEmptyVocabularyWhichIsNoDamage) {
+TEST_F(TopKVocabTest, AnEmptyIndexGivesAnEmptyVocabularyWithoutAnError) {
   TALTopKVocab vocab(store, index.get());
   EXPECT_EQ(rebuild(vocab), std::nullopt);
   Outcome error;
@@ -187,7 +187,7 @@ TEST_F(TopKVocabTest, AnEmptyIndexGivesAnEmptyVocabularyWhichIsNoDamage) {
   EXPECT_TRUE(nothing.vocab()->empty());
 }
 
-TEST_F(TopKVocabTest, DamagedBlobsLeaveWhatTheDamageIsNotIn) {
+TEST_F(TopKVocabTest, KeepsTheUndamagedPartsOfABlob) {
   const std::string words = "\x82\x63one\x63two";
   const std::string docID = "\x18\x64";
   const std::string date = std::string("\xFB\x41\xD9\0\0\0\0\0\0", 9);  // 1677721600
@@ -232,7 +232,7 @@ TEST_F(TopKVocabTest, DamagedBlobsLeaveWhatTheDamageIsNotIn) {
   EXPECT_TRUE(log.contains("error TALTopKVocab: TopK cannot be unarchived: TALTopKVocab 1: "));
 }
 
-TEST_F(TopKVocabTest, TruncatedOrChangedBlobsAreReadSoundly) {
+TEST_F(TopKVocabTest, ReadsTruncatedOrChangedBlobsSafely) {
   const std::string blob = topkvocab::archive({"one", std::string(300, 'x'), ""}, 70000, 1.5e9);
   EXPECT_EQ(load(blob).words, (Words{"one", std::string(300, 'x'), ""}));
   EXPECT_EQ(load(blob).docID, 70000U);
@@ -255,8 +255,8 @@ TEST_F(TopKVocabTest, TruncatedOrChangedBlobsAreReadSoundly) {
   }
 }
 
-// It rests for hours, unless the rest is ended.
-TEST_F(TopKVocabTest, OneThatIsAskedForAndShutdownEndTheRestOfOneThatIsNot) {
+// The rest would last for hours if nothing ended it.
+TEST_F(TopKVocabTest, ARequestedRebuildAndShutdownEndTheRestOfARoutineOne) {
   constexpr int kForHours = 1000000000;
   WatchedIndex watched;
   TALTopKVocab vocab(store, &watched, kForHours);
@@ -265,14 +265,14 @@ TEST_F(TopKVocabTest, OneThatIsAskedForAndShutdownEndTheRestOfOneThatIsNot) {
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   EXPECT_EQ(watched.zones, 200);
   EXPECT_EQ(rebuild(vocab), std::nullopt);
-  EXPECT_EQ(watched.zones, 402);  // the one that rested gives way at once
+  EXPECT_EQ(watched.zones, 402);  // the routine rebuild gives way at once
   vocab.setMaxDocID(5000);
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   vocab.shutdown();
   EXPECT_EQ(watched.zones, 402);
 }
 
-TEST_F(TopKVocabTest, ShutdownEndsTheCountAndWhatWaitsBehindIt) {
+TEST_F(TopKVocabTest, ShutdownEndsTheRunningCountAndWaitingRebuilds) {
   auto watched = std::make_unique<WatchedIndex>();
   std::latch counting(1);
   std::latch shuttingDown(1);
@@ -297,21 +297,21 @@ TEST_F(TopKVocabTest, ShutdownEndsTheCountAndWhatWaitsBehindIt) {
   while (!vocab.isShutdown()) std::this_thread::yield();
   shuttingDown.count_down();
   ending.join();
-  EXPECT_EQ(watched->zones, 2);  // one a pass
+  EXPECT_EQ(watched->zones, 2);  // one per pass
   watched.reset();
   store->close();
   EXPECT_THAT(*vocab.vocab(), ElementsAre("old"));
   EXPECT_TRUE(log.has("default TALTopKVocab: TopKVocab is shutting down before storeTopKVocab."));
-  // One that was asked for, and one for three batches.
+  // One requested rebuild, and one for three batches.
   EXPECT_EQ(log.count("default TALTopKVocab: TopKVocab is shutting down before TopKTokens."), 2U);
   EXPECT_FALSE(log.contains("saved to docstore"));
-  // None begins any more.
+  // No rebuild starts any more.
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
   vocab.shutdown();
   EXPECT_THAT(outcomes, ElementsAre(std::nullopt, std::nullopt, std::nullopt));
 }
 
-TEST_F(TopKVocabTest, OneThatIsAskedForEndsARoutineCount) {
+TEST_F(TopKVocabTest, ARequestedRebuildEndsARoutineCount) {
   auto watched = std::make_unique<WatchedIndex>();
   std::latch counting(1);
   std::latch asked(1);
@@ -342,7 +342,7 @@ TEST_F(TopKVocabTest, ALoadNeverBringsOlderWordsBack) {
   vocab.loadTopKVocabFromDocStore(&error);
   ASSERT_EQ(error, std::nullopt);
   ASSERT_THAT(*vocab.vocab(), ElementsAre("stored"));
-  sqlite3* other = nullptr;  // keeps the store from being written
+  sqlite3* other = nullptr;  // blocks writes to the store
   ASSERT_EQ(sqlite3_open((directory / "docs.db").c_str(), &other), SQLITE_OK);
   ASSERT_EQ(sqlite3_exec(other, "begin immediate;", nullptr, nullptr, nullptr), SQLITE_OK);
   EXPECT_NE(rebuild(vocab), std::nullopt);

@@ -12,7 +12,7 @@ namespace {
 
 constexpr float kUnbounded = 100;
 
-// The whole table of the two words, common ends taken off, one cell from its neighbours.
+// The full distance table of two words without their common ends, cell by cell.
 class Model {
  public:
   Model(std::string a, std::string b) : _longerTyped(a.size() > b.size()) {
@@ -48,10 +48,10 @@ class Model {
   }
 
   float distance = 0;
-  bool gapAlone = false;  // one word is the other with letters put in at one place
+  bool gapAlone = false;  // one word is the other with letters inserted at one position
 
  private:
-  // Letters of the longer word alone (row 0), or of the shorter one alone (column 0).
+  // Row 0 and column 0, which consist of insertions or deletions only.
   float border(size_t i, size_t j) const {
     const bool deletes = (i == 0) == _longerTyped;
     const float middle = deletes ? cDelMid : cInsMid;
@@ -97,7 +97,7 @@ class Model {
 
 }  // namespace
 
-TEST(WeightedDistance, SingleMistakesCostWhatTheirPlaceSays) {
+TEST(WeightedDistance, SingleMistakesCostByPosition) {
   const struct {
     const char* typed;
     const char* meant;
@@ -130,11 +130,11 @@ TEST(WeightedDistance, IsTheLimitForWordsTooFarApart) {
   EXPECT_EQ(weightedDistance("a", "abcdef", 4, 1.2F), 4);
   EXPECT_EQ(weightedDistance("abcdef", "uvwxyz", 4, 1.2F), 4);
   EXPECT_EQ(weightedDistance("abcdef", "uvwxyz", 7, 1.2F), 7);
-  // Letters missing at one place alone know no limit of cost.
+  // The cost of letters missing at a single position is not limited.
   EXPECT_EQ(weightedDistance("", "abc", 4, 1.2F), 3 * cInsStart);
 }
 
-TEST(WeightedDistance, IsThatOfTheWholeTableWhereTheBandHoldsIt) {
+TEST(WeightedDistance, EqualsTheFullTableWithinTheBand) {
   std::mt19937 random(testsupport::firstSeed());
   const auto word = [&random](size_t longest) {
     std::string made;
@@ -157,7 +157,7 @@ TEST(WeightedDistance, IsThatOfTheWholeTableWhereTheBandHoldsIt) {
   }
 }
 
-TEST(WeightedDistance, TakesWordsAndBandsOfAnySize) {
+TEST(WeightedDistance, HandlesWordsAndBandsOfAnySize) {
   std::mt19937 random(testsupport::firstSeed());
   for (int round = 0; round < 20000; ++round) {
     std::string words[2];

@@ -78,7 +78,7 @@ TEST(Clock, MillisecondsAreWholeAndADenominatorOfZeroGivesZero) {
   EXPECT_EQ(platform::millisFromTicks(5000000, {1, 0}), 0u);
 }
 
-// Also on a thread whose own pending signals nobody looks at.
+// Also from a thread whose own pending signals nobody handles.
 TEST(Log, ALogThatNobodyReadsAsksTheProcessToEnd) {
   sigset_t broken;
   sigemptyset(&broken);
@@ -97,7 +97,7 @@ TEST(Log, ALogThatNobodyReadsAsksTheProcessToEnd) {
   EXPECT_EQ(sigtimedwait(&broken, nullptr, &atOnce), SIGPIPE);
 }
 
-TEST(Paths, AUserWhoIsNotRootGetsDirectoriesOfTheirOwn) {
+TEST(Paths, AUserOtherThanRootHasTheirOwnDirectories) {
   for (const char* name : {"STATE_DIRECTORY", "RUNTIME_DIRECTORY", "XDG_STATE_HOME"})
     unsetenv(name);
   setenv("HOME", "/home/mara", 1);
@@ -133,11 +133,11 @@ TEST(Queue, RunsInOrderAndDrainsAtTheEnd) {
   for (int i = 0; i <= 100; ++i) EXPECT_EQ(order[static_cast<size_t>(i)], i);
 }
 
-// A thread that ends as soon as it has nothing to do, so that items meet it in all its states.
+// A thread that ends as soon as it is idle, so that items arrive in each of its states.
 TEST(Queue, LosesNothingWhenThreadsComeAndGo) {
   constexpr int kThreads = 4;
   constexpr int kItems = 500;
-  int count = 0;  // of the queue
+  int count = 0;  // used on the queue
   std::vector<int> orders(kThreads, 0);
   {
     platform::SerialQueue queue("queue", platform::QueuePriority::unspecified,
@@ -180,7 +180,7 @@ TEST(Concurrent, VisitsEveryIndexOnce) {
   platform::concurrentApply(0, [](size_t) { FAIL(); });
 }
 
-TEST(URL, TakesOnlyStrictAbsoluteOnes) {
+TEST(URL, AcceptsOnlyStrictAbsoluteURLs) {
   EXPECT_TRUE(TLURL::parse("tlw://mail_bundle_id/file/tmp/a%20b"));
   EXPECT_TRUE(TLURL::parse("tlw://b/x?offset=10"));
   for (const char* bad : {"", "no scheme", "tlw://b/a b", "tlw://b/\xC3\xA9", "tlw://b/%zz",
@@ -226,7 +226,7 @@ TEST(Files, FailuresNameThePath) {
   EXPECT_EQ(platform::listDirectory(temporary.path(), nullptr)->size(), 0u);
 }
 
-TEST(TextFile, TellsTheEncoding) {
+TEST(TextFile, DetectsTheEncoding) {
   using namespace std::string_literals;
   const TLString text = u"na\u00efve,gr\u00fcn\n";
   const std::pair<std::string, TLString> cases[] = {
@@ -272,7 +272,7 @@ TEST(StateCapture, RecordHasTheStatedLayout) {
   EXPECT_TRUE(platform::captureState().empty());
 }
 
-// A class that works for long holds up neither the coming nor the going of another.
+// A busy class must not delay the registration or cancellation of another.
 TEST(StateCapture, WaitsForABusyQueueWithoutHoldingUpOthers) {
   platform::SerialQueue busy("busy");
   platform::SerialQueue other("other");

@@ -41,7 +41,7 @@ class QueryProcessorTest : public testing::Test {
     return processor->termsFromQuery(query);
   }
 
-  // One line a term: tokens with scores, score without a match, whether it is one word.
+  // One line per term: tokens with scores, score without a match, whether it is a single word.
   static std::string print(const std::vector<TALTerm>& terms) {
     std::string out;
     for (const TALTerm& term : terms) {
@@ -86,13 +86,13 @@ TEST_F(QueryProcessorTest, FreeTextBecomesPhrasePairsAndWords) {
   EXPECT_TRUE(log.has("default TALQueryProcessor: Query tree node is empty."));
 }
 
-TEST_F(QueryProcessorTest, TheFirstPassTakesSynonymsAndStemsWhereTheParametersSay) {
+TEST_F(QueryProcessorTest, TheFirstPassUsesSynonymsAndStemsIfTheParametersSaySo) {
   TALSynonyms synonyms;
   synonyms.setSynonymVocab({{"invoices", {"bills", "money owed"}}, {"ships", {"ship"}}});
   processor = TALQueryProcessor::initWithZoneManager(zoneManager, &synonyms);
   const TLString bySynonyms = u"queryModification.enableSynonymModificationFirstPass=YES";
   const TLString byStems = u"queryModification.enableStemModificationFirstPass=YES";
-  // The worth of a synonym is a float, that of a stem a double.
+  // The score of a synonym is a float, that of a stem a double.
   const struct {
     TLString text;
     TLString parameters;
@@ -108,7 +108,7 @@ TEST_F(QueryProcessorTest, TheFirstPassTakesSynonymsAndStemsWhereTheParametersSa
       {u"ship invoices", byStems,
        "[\"ship invoices\" 2] nomatch:0.8\n[\"ship \" 1] nomatch:0 word\n"
        "[\"invoices\" 1 | \"invoic\" 0.05] nomatch:0 word\n"},
-      // A stem is a prefix, and so another token than the same word in whole.
+      // A stem is a prefix, and so a different token from the same whole word.
       {u"ships ", bySynonyms + u"," + byStems,
        "[\"ships \" 1 | \"ship \" 0.10000000149011612 | \"ship\" 0.05] nomatch:0 word\n"},
       {u"ships", bySynonyms + u"," + byStems,
@@ -144,12 +144,12 @@ TEST_F(QueryProcessorTest, ALeafRestrictsToItsZone) {
   terms = termsOfTree(leaf(SUBJECT, u"spam", Op::STRING_NOT_EQUAL));
   EXPECT_EQ(print(terms), "[\"spam\" 0] nomatch:1\n");
   EXPECT_EQ(zonesOf(terms[0]), "zones:{13:1}");
-  // Identifiers and content types are not cut into words.
+  // Identifiers and content types are not tokenised.
   EXPECT_EQ(print(termsOfTree(leaf(CONTENT_TYPE, u"Message/RFC822"))),
             "[\"Message/RFC822\" 1] nomatch:0\n");
 }
 
-TEST_F(QueryProcessorTest, WhatMakesNoTerm) {
+TEST_F(QueryProcessorTest, ConditionsWithoutATerm) {
   auto number = std::make_shared<TLQueryNode>();
   number->addKey(SUBJECT);
   number->setDoubleValue(1);
@@ -171,7 +171,7 @@ TEST_F(QueryProcessorTest, WhatMakesNoTerm) {
                 "info TALQueryProcessor: Cannot handle op 5 under an OR node."}));
 }
 
-TEST_F(QueryProcessorTest, AnOrNodeIsOneTermAndAnAndNodeUnfoldsInOrder) {
+TEST_F(QueryProcessorTest, AnOrNodeIsOneTermAndAnAndNodeIsFlattenedInOrder) {
   const auto either =
       inner(Merge::OR, {leaf(SUBJECT, u"one"), leaf(AUTHORS, u"two"), leaf(SUBJECT, u"one")});
   const auto terms = termsOfTree(inner(
@@ -183,7 +183,7 @@ TEST_F(QueryProcessorTest, AnOrNodeIsOneTermAndAnAndNodeUnfoldsInOrder) {
   EXPECT_EQ(zonesOf(terms[1]), "zones:{13:1,107:1}");
 }
 
-TEST_F(QueryProcessorTest, ATreeOfAnyDepthIsWalked) {
+TEST_F(QueryProcessorTest, HandlesATreeOfAnyDepth) {
   auto root = leaf(SUBJECT, u"deep");
   for (int i = 0; i < 100000; ++i) root = inner(Merge::AND, {root});
   EXPECT_EQ(termsOfTree(root).size(), 1u);

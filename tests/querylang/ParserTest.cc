@@ -4,7 +4,7 @@
 
 namespace {
 
-// The tree as an expression whose every comparison stands in brackets; "(fails)".
+// The tree as an expression with every comparison in brackets; "(fails)".
 std::string parsed(const std::string& input) {
   sq::Tree tree;
   if (!sq::parse(input.c_str(), tree)) return "(fails)";
@@ -84,7 +84,7 @@ TEST(Parser, TimeFunctions) {
       {"a > $time.this_year", "a > $time.this_year(0)"},
       {"a > $time.yesterday", "a > $time.yesterday(0)"},
       {"a > $time.last_week", "a > $time.last_week(0)"},
-      // A word behind a time is no modifier: it ends the expression.
+      // A word after a time is not a modifier: it ends the expression.
       {"a > $time.nowhere && b = c", "a > $time.now(0)"},
       {"a > $time.now(abc)", kFails},
       {"a > $time.now(1", kFails},
@@ -121,7 +121,7 @@ TEST(Parser, ConnectivesAndParentheses) {
   });
 }
 
-TEST(Parser, AStringBehindAStringValueIsAModifier) {
+TEST(Parser, AStringAfterAStringValueIsAModifier) {
   expectAll({
       {"a = 'x*'cdw && b = c", "a = x* && b = c"},
       {"a = x 'y' && b = c", "a = x && b = c"},
@@ -130,8 +130,8 @@ TEST(Parser, AStringBehindAStringValueIsAModifier) {
   });
 }
 
-// What an expression begins with is not looked at: the attribute is the last text that was read.
-TEST(Parser, ATextLastsUntilTheNext) {
+// The start of an expression is not read: its attribute is the last text read.
+TEST(Parser, ATextRemainsUntilTheNextOne) {
   expectAll({
       {"== = b", "\"\" = b"},
       {"&& == b", "\"\" == b"},
@@ -153,7 +153,7 @@ TEST(Parser, EscapedTextIsReadBackInQuotesOfBothKinds) {
   }
 }
 
-TEST(Parser, TellsWhereItStopped) {
+TEST(Parser, ReportsWhereItStopped) {
   const auto stopOf = [](const char* input) {
     sq::Tree tree;
     size_t stop = 0;
@@ -167,8 +167,8 @@ TEST(Parser, TellsWhereItStopped) {
   EXPECT_EQ(stopOf("a = 'b"), 4u);
 }
 
-// Each of these nests, or would nest, as deep as it is long; reading, writing and freeing it does
-// not.
+// Each of these nests, or seems to nest, as deeply as it is long; parsing, printing and freeing it
+// must not recurse.
 TEST(Parser, NoInputIsTooDeep) {
   const std::string open = megabyteOf("(");
   EXPECT_EQ(parsed(open), kFails);

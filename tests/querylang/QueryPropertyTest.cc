@@ -16,7 +16,7 @@ using Node = Additions::Node;
 using Merge = TLQueryNodeMergeOp;
 using Op = TLQueryNodeOp;
 
-// Draws parse trees from a small world, so that equal conditions meet often.
+// Generates parse trees from few names and values, so that equal conditions are frequent.
 class Generator {
  public:
   explicit Generator(uint32_t seed) : _random(seed) {}
@@ -31,8 +31,8 @@ class Generator {
     return connective(any(left), any(leaves - left));
   }
 
-  // Without free text. Every connective has a comparison right below it, since one over nothing but
-  // constants that do not decide leaves the tree even where it decides the one above.
+  // Trees without free text. Every connective has a comparison directly below it, because one over
+  // nothing but neutral constants disappears even where it would decide its parent.
   sq::Tree conditions(size_t leaves) {
     if (leaves <= 1) return condition();
     sq::Tree rest = leaves == 2 && chance(30) ? constant() : conditions(leaves - 1);
@@ -40,7 +40,7 @@ class Generator {
                       : connective(std::move(rest), condition());
   }
 
-  // Words in many attributes, times, constants and conditions mixed.
+  // Words in many attributes, times, constants and conditions.
   sq::Tree mixed(size_t leaves) {
     if (leaves >= 5 && chance(30)) return disjunction(4 + below(4));
     if (leaves <= 1) return chance(15) ? constant() : comparison(oneOf(kAll), smallText());
@@ -48,7 +48,7 @@ class Generator {
     return connective(mixed(left), mixed(leaves - left));
   }
 
-  // Bytes that look like a query, or not.
+  // Bytes that may look like a query.
   std::string noise() {
     static constexpr const char* kPieces[] = {
         "(",  ")",   "||",         "&&",   "|", "&",  "!",   "!=",   "=",    "==",
@@ -112,7 +112,7 @@ class Generator {
                 std::make_unique<sq::node>(sq::kTokenString, "com_quill_mail_dateReceived"),
                 std::move(time));
   }
-  // Mostly one word in many attributes.
+  // Usually one word in many attributes.
   sq::Tree disjunction(size_t leaves) {
     const std::string text = smallText();
     sq::Tree tree;
@@ -138,14 +138,14 @@ TLString textOf(const sq::Tree& tree) {
   return platform::fromUTF8(sq::expressionText(*tree));
 }
 
-// One mail: what its attributes hold. Numbers of READ as text, seconds of its date.
+// The attribute values of one mail: READ as text, its date in seconds.
 struct Mail {
   std::map<int32_t, TLString> texts;
   double date;
 };
 
-// Compares as the conditions say. What the optimiser takes off a string before it is sent is taken
-// off here, unless the tree has been through it.
+// Evaluates the conditions. Removes the wildcards that the optimiser would remove, unless the tree
+// has already been optimised.
 bool satisfies(const Mail& mail, const TLQueryNode& node, bool optimized) {
   const auto below = [&](const Node& child) { return satisfies(mail, *child, optimized); };
   if (node.mergeOp() == Merge::AND) {
@@ -183,7 +183,7 @@ bool satisfies(const Mail& mail, const TLQueryNode& node, bool optimized) {
   }
 }
 
-// Every mail of the small world of conditions.
+// Every mail that the generated conditions can distinguish.
 std::vector<Mail> corpus() {
   std::vector<Mail> mails;
   for (const char16_t* const subject : {u"1", u"x", u"y"}) {
@@ -221,8 +221,8 @@ bool holdsFreeText(const TLQueryNode& node) {
                      [](const Node& child) { return holdsFreeText(*child); });
 }
 
-// Optimises on paper: a tree is its text, nothing the empty one, and constants are "true" and
-// "false".
+// Reference optimiser on texts: a tree is its text, nothing is the empty text, and constants are
+// "true" and "false".
 std::string onPaper(const TLQueryNode& node, std::vector<std::string>& parts) {
   const auto bare = [](const TLQueryNode& leaf) {
     return platform::toUTF8(Additions::removeWildCard(*leaf.stringValue()));
@@ -256,7 +256,7 @@ std::string onPaper(const TLQueryNode& node, std::vector<std::string>& parts) {
   return fmt::format("({} {})", isAnd ? "AND" : "OR", fmt::join(rest, " "));
 }
 
-// A tree as `onPaper` writes it.
+// A tree in the notation of `onPaper`.
 std::string paperOf(const TLQueryNode& node) {
   if (node.mergeOp() == Merge::LEAF) {
     if (node.op() == Op::BOOL_CONSTANT) return node.boolValue() ? "true" : "false";
@@ -309,7 +309,7 @@ TEST(QueryProperties, OptimisingKeepsWhichMailsSatisfyTheConditions) {
   EXPECT_GT(changed, compared / 2);
 }
 
-TEST(QueryProperties, OptimisingTakesOutWhatTheRulesSay) {
+TEST(QueryProperties, OptimisingMatchesTheReferenceRules) {
   Generator generator(testsupport::firstSeed());
   int withText = 0;
   for (int i = 0; i < kRounds; ++i) {
@@ -330,8 +330,8 @@ TEST(QueryProperties, OptimisingTakesOutWhatTheRulesSay) {
   EXPECT_GT(withText, kRounds / 4);
 }
 
-// The text ends where its memory does, or with something behind it that would change the result.
-TEST(QueryProperties, NothingBehindTheEndIsRead) {
+// The text ends where its memory ends, or is followed by something that would change the result.
+TEST(QueryProperties, NothingAfterTheEndIsRead) {
   Generator generator(testsupport::firstSeed());
   const auto outcome = [](const char* input) {
     sq::Tree tree;

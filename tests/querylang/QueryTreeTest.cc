@@ -17,7 +17,7 @@ class QueryTree : public testing::Test {
   static std::string built(const TLString& text) {
     return print(*Additions::initWithBeaconQueryString(text, false));
   }
-  // The free text, and the tree that is left.
+  // The free text, and the remaining tree.
   static std::string optimized(const TLString& text) {
     const auto query = Additions::initWithBeaconQueryString(text, true);
     EXPECT_EQ(query->rawQuery(), text);
@@ -92,7 +92,7 @@ TEST_F(QueryTree, FreeTextAndConstantsLeaveTheTree) {
       {u"** > $time.absolute(1)", "<>"},
       {TLString(kFiveAttributes), "<x>"},
       {TLString(kFiveAttributes) + u" && kTLItemSubject = '*y**'", "<x>" + subject + "y*"},
-      // A connective inside does not count, and goes with the rest.
+      // A connective inside is ignored, and removed with the rest.
       {TLString(kFiveAttributes.substr(0, kFiveAttributes.size() - 1)) +
            u" || (kTLItemSubject = z && ** = gone))",
        "<x>"},
@@ -106,7 +106,7 @@ TEST_F(QueryTree, FreeTextAndConstantsLeaveTheTree) {
       {u"true || kTLItemSubject == a", "<>"},
       {u"kTLItemSubject == a && (kTLItemAuthors == b || true)", "<>" + subject + "a"},
       {u"false || false", "<>"},
-      // What stands behind the constant that decides is not looked at.
+      // What follows the deciding constant is not evaluated.
       {u"** = a && false && ** = b", "<a>\nLEAF, BOOL_CONSTANT, 0, "},
       {u"kTLItemSubject == a && kTLItemAuthors == b && kTLItemSubject == a",
        "<>\nAND, \n\tLEAF, STRING_EQUAL, SUBJECT, a\n\tLEAF, STRING_EQUAL, AUTHORS, b"},
@@ -166,7 +166,7 @@ TEST_F(QueryTree, FiltersReplaceTheRoot) {
 }
 
 TEST_F(QueryTree, ATreeHigherThanAQueryCarriesDoesNotParse) {
-  // A long chain is one node; each change of connective is a level of the tree.
+  // A long chain is one node; each change of connective adds a level to the tree.
   TLQuery flat;
   flat.setRoot(Additions::_parse(repeated(u"kTLItemSubject = a || ", 1000) + u"true"));
   EXPECT_EQ(flat.root()->childAtIndex(0)->childsCount(), 1001u);
@@ -176,12 +176,12 @@ TEST_F(QueryTree, ATreeHigherThanAQueryCarriesDoesNotParse) {
             u"kTLItemSubject = c",
         true);
   };
-  const auto highest = alternating(Additions::kMaximumTreeHeight - 2);
+  const auto highest = alternating(Additions::kMaxTreeHeight - 2);
   ASSERT_TRUE(highest->hasRoot());
   TLQuery read;
   EXPECT_TRUE(read.initWithData(highest->data()));
   EXPECT_TRUE(read.isEqual(*highest));
-  for (const size_t levels : {Additions::kMaximumTreeHeight, size_t{100000}}) {
+  for (const size_t levels : {Additions::kMaxTreeHeight, size_t{100000}}) {
     log.clear();
     EXPECT_FALSE(alternating(levels)->hasRoot());
     EXPECT_EQ(log.count("fault TLQueryParsing: Failed to parse query: "), 1u);
@@ -202,7 +202,7 @@ TEST_F(QueryTree, OnlyAnOpenNodeTakesChildren) {
                                       "OR TLNodeQuery: (null)",
                                       "error TLQueryParsing: Stack is empty or contains non AND or "
                                       "OR TLNodeQuery: \nLEAF, "}));
-  // Nodes that mean nothing add nothing.
+  // Parse nodes without meaning add nothing.
   Additions::Stack stack{std::make_shared<TLQueryNode>()};
   stack[0]->setMergeOp(Merge::AND);
   for (const int32_t type : {sq::kTokenString, sq::kTokenError, sq::kTokenEnd}) {

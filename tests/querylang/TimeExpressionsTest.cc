@@ -17,7 +17,7 @@ using platform::Zone;
 
 constexpr double kDay = 86400;
 
-// In a zone that is an hour ahead of UTC, two in summer, and a country whose weeks begin on Monday.
+// A time zone one hour ahead of UTC, two in summer, and a country whose weeks begin on Monday.
 class TimeExpressions : public testing::Test {
  protected:
   TimeExpressions() {
@@ -37,7 +37,7 @@ class TimeExpressions : public testing::Test {
 
 }  // namespace
 
-TEST_F(TimeExpressions, ISO8601IsReadByPlaces) {
+TEST_F(TimeExpressions, ISO8601IsReadByPosition) {
   const struct {
     const char* text;
     double expected;
@@ -57,7 +57,7 @@ TEST_F(TimeExpressions, ISO8601IsReadByPlaces) {
       {"2001-01-01T00:00:00-01:30", 5400},
       {"2001-01-01T00:00:00Z+01", -3600},
       {"2001-01-01T00:00:00-", local(2001, 1, 1)},
-      // The byte behind the minutes is passed over, here the sign, so that the offset has none.
+      // The byte after the minutes, here the sign, is skipped, so the offset has none.
       {"2001-01-01T00:30-05:00", 1800 - 18000},
       {"2001-01-01T00:30:00-05:00", 1800 + 18000},
       {"2001-01-01T12", local(2001, 1, 1, 12)},
@@ -75,7 +75,7 @@ TEST_F(TimeExpressions, ISO8601IsReadByPlaces) {
   }
 }
 
-TEST_F(TimeExpressions, FunctionsCountFromTheirMoment) {
+TEST_F(TimeExpressions, FunctionsAreRelativeToTheGivenTime) {
   // A Wednesday in summer.
   const double now = local(2024, 7, 10, 15, 30, 45) + kReferenceDate + 0.25;
   const struct {
@@ -103,8 +103,7 @@ TEST_F(TimeExpressions, FunctionsCountFromTheirMoment) {
       {sq::kTokenTimeThisYear, "0", local(2024, 1, 1)},
       {sq::kTokenTimeThisYear, "-1", local(2023, 1, 1)},
       {sq::kTokenTimeIso, "2001-01-01T00:00:00Z", 0},
-      // Days of 86400 seconds, without regard to the clock's change, where months go by the
-      // calendar.
+      // Days have 86400 seconds regardless of clock changes; months follow the calendar.
       {sq::kTokenTimeToday, "-200", local(2024, 7, 10) - 200 * kDay},
   };
   for (const auto& one : kCases) {
@@ -123,7 +122,7 @@ TEST_F(TimeExpressions, FunctionsCountFromTheirMoment) {
   EXPECT_TRUE(log.lines().empty());
 }
 
-TEST_F(TimeExpressions, WhatCannotBeFormedIsTheReferenceDate) {
+TEST_F(TimeExpressions, InvalidTimesAreTheReferenceDate) {
   const double now = local(2024, 7, 10) + kReferenceDate;
   const std::string many(400, '9');
   EXPECT_EQ(evalTimeExpressionAt(sq::kTokenTimeAbsolute, many, now), INFINITY);
@@ -153,7 +152,7 @@ TEST_F(TimeExpressions, TheCalendarCarries) {
   EXPECT_EQ(carried({2024, 13, 1, 0, 0, -1}), (CalendarFields{2024, 12, 31, 23, 59, 59}));
   EXPECT_EQ(carried({1500, 2, 29, 0, 0, 0}), (CalendarFields{1500, 3, 1, 0, 0, 0}));
   EXPECT_EQ(carried({0, 1, 1, 0, 0, 0}), (CalendarFields{0, 1, 1, 0, 0, 0}));
-  // 2:30 is left out on the last Sunday of March, and comes twice on that of October.
+  // 2:30 does not exist on the last Sunday of March, and occurs twice on that of October.
   EXPECT_EQ(local(2024, 3, 31, 2, 30), utc(2024, 3, 31, 1, 30));
   EXPECT_EQ(local(2024, 10, 27, 2, 30), utc(2024, 10, 27, 0, 30));
 }

@@ -60,7 +60,7 @@ std::shared_ptr<TLIndexableItem> richItem() {
   return item;
 }
 
-// A chain of `levels` nodes, each the only child of the one before.
+// A chain of `levels` nodes, each the only child of the previous one.
 std::shared_ptr<TLQueryNode> chain(int levels) {
   std::shared_ptr<TLQueryNode> top;
   for (int i = 0; i < levels; ++i) {
@@ -71,7 +71,7 @@ std::shared_ptr<TLQueryNode> chain(int levels) {
   return top;
 }
 
-// The wire form of a node with `levels` nodes inside each other below it.
+// The wire form of a node with `levels` nested nodes.
 std::string chainBytes(int levels) {
   std::string reversed;
   for (int i = 0; i < levels; ++i) {
@@ -161,7 +161,7 @@ TEST(Records, PresenceAndDefaults) {
   EXPECT_FALSE(fresh.isEqual(TLAttribute()));
 }
 
-// Input as it must not come, or as other writers make it: what is read, seen by writing it again.
+// Invalid input, or input as other writers produce it: what is read is checked by writing it again.
 template <typename Record>
 void expectRead(const std::string& input, bool result, const std::string& rewritten) {
   Record record;
@@ -169,26 +169,26 @@ void expectRead(const std::string& input, bool result, const std::string& rewrit
   EXPECT_EQ(hex(record.data()), rewritten) << input;
 }
 
-TEST(Records, ReadsWhatOtherWritersMakeOfThem) {
+TEST(Records, ReadsTheOutputOfOtherWriters) {
   expectRead<TLIndexableItem>("", true, "12 00");
-  // Unknown fields of every wire type, field 0, a field number beyond 32 bits.
+  // Unknown fields of every wire type, field 0, and a field number above 32 bits.
   expectRead<TLAttribute>("60 05 08 0d", true, "08 0d");
   expectRead<TLAttribute>("61 01 02 03 04 05 06 07 08 08 0d", true, "08 0d");
   expectRead<TLAttribute>("62 02 08 01 65 01 02 03 04 02 00 08 0d", true, "08 0d");
   expectRead<TLAttribute>("f8 ff ff ff ff ff 01 05 08 0d", true, "08 0d");
   expectRead<TLCard>("4d 00 00 80 3f 0d 00 00 80 3f", true, "0d 00 00 80 3f");
-  // A group is skipped with what is in it, groups too.
+  // A group is skipped with its contents, including nested groups.
   expectRead<TLAttribute>("63 08 01 6b 12 01 00 6c 64 08 0d", true, "08 0d");
-  // An end tag ends the record well.
+  // An end tag validly ends the record.
   expectRead<TLAttribute>("08 0d 0c 20 07", true, "08 0d");
-  // The wire type of a known field is not looked at: field 5 takes four bytes, field 1 a varint.
+  // The wire type of a known field is ignored: field 5 takes four bytes, field 1 a varint.
   expectRead<TLAttribute>("28 00 00 80 3f 0a 0d", true, "08 0d 2d 00 00 80 3f");
-  // The key keeps the low 32 bits, a truth value is whatever is not 0.
+  // The key keeps the low 32 bits; a boolean is any value other than 0.
   expectRead<TLAttribute>("08 8d 80 80 80 80 01 38 80 02", true, "08 0d 38 01");
-  // A later value wins; a later person replaces the earlier one whole.
+  // A later value wins; a later person replaces the earlier one completely.
   expectRead<TLAttribute>("1a 01 61 1a 00", true, "1a 00");
   expectRead<TLAttribute>("42 03 0a 01 61 42 03 12 01 62", true, "42 03 12 01 62");
-  // Ten bytes with their top bit set read as 0, and the eleventh byte is the next tag.
+  // Ten bytes with their top bit set yield 0, and the eleventh byte is the next tag.
   expectRead<TLAttribute>("20 ff ff ff ff ff ff ff ff ff ff 08 0d", true, "08 0d 20 00");
   expectRead<TLAttribute>("20 ff ff ff ff ff ff ff ff ff 7f", true,
                           "20 ff ff ff ff ff ff ff ff ff 01");
@@ -196,7 +196,7 @@ TEST(Records, ReadsWhatOtherWritersMakeOfThem) {
                           "20 80 80 80 80 80 80 80 80 80 01");
   // Packed keys, also mixed with single ones.
   expectRead<TLQueryNode>("0a 03 0d ab 01 08 02 0a 00", true, "08 0d 08 ab 01 08 02");
-  // Invalid UTF-8 reads as U+FFFD.
+  // Invalid UTF-8 becomes U+FFFD.
   expectRead<TLAttribute>("1a 02 61 ff", true, "1a 04 61 ef bf bd");
 }
 
@@ -235,12 +235,13 @@ TEST(Records, EveryTruncationFailsOrParses) {
     ASSERT_TRUE(again.initWithData(item.data())) << length;
     EXPECT_TRUE(again.isEqual(item)) << length;
   }
-  // Nothing, each of the two attributes, and each of the four fields behind them end a record.
+  // The empty prefix is valid, and those that end after one of the two attributes or of the four
+  // fields after them.
   EXPECT_EQ(parsed, 7U);
 }
 
-// Attributes in wire form against those that are decoded at once.
-TEST(Records, WrittenItemsAreForwardedAsTheyAreAndReadWhenAskedFor) {
+// Attributes kept in wire form compared with attributes decoded at once.
+TEST(Records, WrittenItemsStayInWireFormUntilRead) {
   const auto date = TLAttributeKey::MAIL_DATE_RECEIVED;
   const auto item = richItem();
   item->setCard(nullptr);
@@ -288,24 +289,24 @@ TEST(Records, WrittenItemsAreForwardedAsTheyAreAndReadWhenAskedFor) {
 
 TEST(Records, NestingIsBounded) {
   TLQueryNode deepest;
-  EXPECT_TRUE(deepest.initWithData(chainBytes(kMaximumRecordDepth)));
-  EXPECT_EQ(deepest.data(), chainBytes(kMaximumRecordDepth));
+  EXPECT_TRUE(deepest.initWithData(chainBytes(kMaxRecordDepth)));
+  EXPECT_EQ(deepest.data(), chainBytes(kMaxRecordDepth));
   EXPECT_TRUE(deepest.copyWithZone()->isEqual(deepest));
   EXPECT_EQ(deepest.copyWithZone()->hash(), deepest.hash());
   EXPECT_FALSE(deepest.dictionaryRepresentation().empty());
-  for (const int levels : {kMaximumRecordDepth + 1, 100000}) {
+  for (const int levels : {kMaxRecordDepth + 1, 100000}) {
     TLQueryNode node;
     EXPECT_FALSE(node.initWithData(chainBytes(levels))) << levels;
   }
   const auto built = chain(100000);
-  EXPECT_DEATH((void)built->data(), "kMaximumRecordDepth");
-  EXPECT_DEATH((void)built->hash(), "kMaximumRecordDepth");
+  EXPECT_DEATH((void)built->data(), "kMaxRecordDepth");
+  EXPECT_DEATH((void)built->hash(), "kMaxRecordDepth");
 }
 
 TEST(Records, NumberOfElementsIsBounded) {
   for (const char* element : {"\x5a\x00", "\x52\x00"}) {
     std::string input;
-    for (uint32_t i = 0; i < kMaximumRecordElements; ++i) input.append(element, 2);
+    for (uint32_t i = 0; i < kMaxRecordElements; ++i) input.append(element, 2);
     EXPECT_TRUE(TLAttribute().initWithData(input));
     input.append(element, 2);
     EXPECT_FALSE(TLAttribute().initWithData(input));
@@ -379,7 +380,7 @@ TEST(Records, CopyingSharesOrCopies) {
   EXPECT_NE(deep->attributesAtIndex(0), item->attributesAtIndex(0));
   EXPECT_NE(deep->attributesAtIndex(0)->personValue(), item->attributesAtIndex(0)->personValue());
 
-  // What the source lacks stays in the target of copyTo, and is absent from a new copy.
+  // copyTo keeps fields that the source lacks; a new copy does not have them.
   TLIndexableItem nothing;
   nothing.setIdentifier(std::nullopt);
   nothing.copyTo(shared);

@@ -14,8 +14,8 @@
 #include "tests/records/Hex.h"
 #include "tests/support/Seed.h"
 
-// The published schema against the records: what protoc's code writes, the records read, and the
-// other way round. Its random messages are also the random input of the records' own operations.
+// The published schema compared with the records: the records read what protoc's code writes, and
+// the other way round. The random messages also test the records' own operations.
 
 namespace schema = com::quill::tallow;
 using google::protobuf::FieldDescriptor;
@@ -28,13 +28,13 @@ class RandomMessages {
  public:
   explicit RandomMessages(uint32_t seed) : _random(seed) {}
 
-  // Sets each field with even odds; sub-messages nest up to `depth` levels.
+  // Sets each field with a probability of one half; sub-messages nest up to `depth` levels.
   void fill(Message& message, int depth) {
     for (int i = 0; i < message.GetDescriptor()->field_count(); ++i) {
       const FieldDescriptor* field = message.GetDescriptor()->field(i);
       const bool message_ = field->cpp_type() == FieldDescriptor::CPPTYPE_MESSAGE;
       if (message_ && depth == 0) continue;
-      // A fresh item has an identifier and a parameter must have a key.
+      // A new item has an identifier, and a parameter must have a key.
       const bool required =
           field->name() == "identifier" || (field->name() == "key" && field->cpp_type() == kText);
       if (field->is_repeated()) {

@@ -31,7 +31,7 @@ using testsupport::receiveSome;
 constexpr const char* kService = "com.quill.test.Echo";
 constexpr const char* kPath = "/com/quill/test/Echo";
 
-// True once the other side has closed; waits for it.
+// Waits for the other side to close; true once it has.
 bool waitForEnd(int descriptor) {
   char buffer[4096];
   ssize_t n;
@@ -63,10 +63,10 @@ class Client {
     return call;
   }
 
-  // Makes a call that the test answers.
+  // Makes a call to which the test replies later.
   void hold() const {
     sd_bus_message* call = newCall("Hold");
-    uint64_t cookie = 0;  // asking for it asks for a reply
+    uint64_t cookie = 0;  // reading it requests a reply
     EXPECT_GE(sd_bus_send(bus, call, &cookie), 0);
     sd_bus_message_unref(call);
     EXPECT_GE(sd_bus_flush(bus), 0);
@@ -89,8 +89,8 @@ class Client {
   int descriptor;
 };
 
-// A service with an Echo that answers from another thread, a Make that answers with many bytes, and
-// a Hold whose reply the test sends when it likes.
+// A service with an Echo that replies from another thread, a Make that replies with many bytes, and
+// a Hold to which the test replies.
 class RPCTest : public testing::Test {
  protected:
   RPCTest() : queue("echo") {
@@ -147,7 +147,7 @@ class RPCTest : public testing::Test {
 
   std::string path() const { return directory / kService; }
 
-  // Waits until no connection has a thread any more.
+  // Waits until no connection has a running thread.
   static void waitForThreads() {
     const auto serving = [] {
       for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
@@ -165,7 +165,7 @@ class RPCTest : public testing::Test {
   std::promise<std::shared_ptr<rpc::Reply>> held;
   std::vector<std::shared_ptr<rpc::Reply>> replies;
   rpc::Interface interface;
-  std::vector<rpc::Interface> interfaces;  // beside it, set before a client connects
+  std::vector<rpc::Interface> interfaces;  // additional interfaces, set before a client connects
   platform::RunLoop loop;
   std::unique_ptr<rpc::Listener> listener;
   std::thread thread;
@@ -245,7 +245,7 @@ TEST(RPCListener, AStaleSocketIsReplaced) {
       rpc::makeListener(loop, directory / std::string(100, 'd'), kService)->resume(nullptr));
 }
 
-// The call comes in one piece with the end of the authentication, as some libraries send it.
+// Some libraries send the call together with the end of the authentication.
 TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
   using namespace std::string_literals;
   const int descriptor = connectTo(path());
@@ -261,7 +261,7 @@ TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
   close(descriptor);
 }
 
-TEST_F(RPCTest, AClientThatVanishesInMidCallHarmsNobody) {
+TEST_F(RPCTest, AClientThatEndsDuringACallAffectsNobodyElse) {
   {
     const Client client(path());
     client.hold();
@@ -284,12 +284,13 @@ TEST_F(RPCTest, AClientThatNeverReadsIsClosed) {
     if (sent < 0 || sd_bus_flush(client.bus) < 0) break;
   }
   pollfd closed{client.descriptor, POLLRDHUP, 0};
-  EXPECT_EQ(poll(&closed, 1, -1), 1);  // by the other side, as nothing has been read here
+  EXPECT_EQ(poll(&closed, 1, -1),
+            1);  // closed by the other side, because nothing has been read here
   EXPECT_EQ(Client(path()).echo("other"), "other");
   EXPECT_TRUE(log.contains("replies are not read"));
 }
 
-TEST_F(RPCTest, AReplyBeyondTheProtocolIsAnError) {
+TEST_F(RPCTest, AReplyBeyondTheProtocolLimitsIsAnError) {
   const Client client(path());
   sd_bus_error error{};
   EXPECT_LT(sd_bus_call_method(client.bus, nullptr, kPath, kService, "Make", &error, nullptr, "x",
@@ -299,7 +300,7 @@ TEST_F(RPCTest, AReplyBeyondTheProtocolIsAnError) {
   sd_bus_error_free(&error);
 }
 
-TEST_F(RPCTest, RubbishEndsOnlyItsOwnConnection) {
+TEST_F(RPCTest, InvalidBytesEndOnlyTheirOwnConnection) {
   for (const std::string& bytes :
        {std::string("GET / HTTP/1.0\r\n\r\n"), std::string(100000, '\xFF'),
         std::string("\0AUTH EXTERNAL 39393939\r\nBEGIN\r\nl\1", 34)}) {
@@ -312,12 +313,13 @@ TEST_F(RPCTest, RubbishEndsOnlyItsOwnConnection) {
   EXPECT_EQ(Client(path()).echo("alive"), "alive");
 }
 
-// The longest idle one makes room, but never one that works while others have said nothing.
-TEST_F(RPCTest, ConnectionsAreBoundedAndSilentOnesGo) {
+// The connection that has been idle longest is evicted, but never a working one while others are
+// silent.
+TEST_F(RPCTest, ConnectionsAreLimitedAndSilentOnesAreEvicted) {
   const Client working(path());
   EXPECT_EQ(working.echo("before"), "before");
   std::vector<int> silent;
-  for (size_t i = 0; i < rpc::kMaximumConnections; ++i) silent.push_back(connectTo(path()));
+  for (size_t i = 0; i < rpc::kMaxConnections; ++i) silent.push_back(connectTo(path()));
   EXPECT_TRUE(waitForEnd(silent.front()));
   EXPECT_EQ(Client(path()).echo("new"), "new");
   EXPECT_EQ(working.echo("after"), "after");
@@ -325,14 +327,14 @@ TEST_F(RPCTest, ConnectionsAreBoundedAndSilentOnesGo) {
     EXPECT_TRUE(waitForEnd(descriptor));
     close(descriptor);
   }
-  EXPECT_EQ(log.count("not authenticated in time") + log.count("another needs its place"),
-            rpc::kMaximumConnections);
+  EXPECT_EQ(log.count("not authenticated in time") + log.count("evicted for a new connection"),
+            rpc::kMaxConnections);
   EXPECT_EQ(working.echo("still"), "still");
 }
 
-TEST_F(RPCTest, AConnectionWithCallsInFlightKeepsItsPlace) {
+TEST_F(RPCTest, AConnectionWithCallsInFlightIsNotEvicted) {
   std::vector<std::unique_ptr<Client>> busy;
-  for (size_t i = 0; i < rpc::kMaximumConnections; ++i) {
+  for (size_t i = 0; i < rpc::kMaxConnections; ++i) {
     busy.push_back(std::make_unique<Client>(path()));
     held = {};
     busy.back()->hold();
@@ -347,9 +349,9 @@ TEST_F(RPCTest, AConnectionWithCallsInFlightKeepsItsPlace) {
   EXPECT_EQ(Client(path()).echo("room"), "room");
 }
 
-// While four calls are in flight no more are read; what was answered goes out all the same, and the
-// end of the peer is seen.
-TEST_F(RPCTest, APausedConnectionSendsAndSeesTheEnd) {
+// With four calls in flight no more are read, but replies are still sent and the end of the peer is
+// noticed.
+TEST_F(RPCTest, APausedConnectionStillSendsAndNoticesTheEnd) {
   {
     const Client client(path());
     sd_bus_message* large = client.newCall("Make");
@@ -357,7 +359,7 @@ TEST_F(RPCTest, APausedConnectionSendsAndSeesTheEnd) {
     uint64_t cookie = 0;
     ASSERT_GE(sd_bus_send(client.bus, large, &cookie), 0);
     sd_bus_message_unref(large);
-    for (size_t i = 0; i < rpc::kMaximumPendingCalls; ++i) {
+    for (size_t i = 0; i < rpc::kMaxPendingCalls; ++i) {
       held = {};
       client.hold();
       replies.push_back(held.get_future().get());
@@ -373,12 +375,12 @@ TEST_F(RPCTest, APausedConnectionSendsAndSeesTheEnd) {
     EXPECT_EQ(answered, cookie);
     sd_bus_message_unref(answer);
   }
-  // Its thread ends, though its calls are still in flight.
+  // Its thread ends although its calls are still in flight.
   waitForThreads();
 }
 
-// All of these have a sound header; what is wrong shows only when the content is read.
-TEST_F(RPCTest, ContentThatIsNotWhatItsSignatureSaysIsRefused) {
+// The headers are valid; the errors show only when the content is read.
+TEST_F(RPCTest, RefusesContentThatDoesNotMatchItsSignature) {
   const auto call = [this](const char* member, const char* signature, const std::string& body) {
     const int descriptor = connectTo(path());
     EXPECT_TRUE(authenticate(descriptor));
@@ -392,8 +394,8 @@ TEST_F(RPCTest, ContentThatIsNotWhatItsSignatureSaysIsRefused) {
   using namespace std::string_literals;
   EXPECT_THAT(call("Echo", "s", "\2\0\0\0hi\0"s), testing::HasSubstr("hi"));
   const std::vector<std::pair<const char*, std::string>> bad{
-      {"s", "\2\0\0\0\xFF\xFE\0"s},  // no UTF-8
-      {"s", "\2\0\0\0hi!"s},         // no NUL at the end
+      {"s", "\2\0\0\0\xFF\xFE\0"s},  // invalid UTF-8
+      {"s", "\2\0\0\0hi!"s},         // no terminating NUL
       {"s", "\xFF\0\0\0hi\0"s},      // longer than the body
       {"s", ""s},
   };
@@ -404,9 +406,9 @@ TEST_F(RPCTest, ContentThatIsNotWhatItsSignatureSaysIsRefused) {
   EXPECT_THAT(call("List", "as", "\x10\0\0\0\4\0\0\0abcd"s),
               testing::AnyOf(testing::HasSubstr(rpc::kInvalidArgs), testing::IsEmpty()));
   std::string many("\0\0\0\0", 4);
-  const size_t count = rpc::kMaximumArrayElements + 1;
+  const size_t count = rpc::kMaxArrayElements + 1;
   for (size_t i = 0; i < count; ++i) many += std::string(8, '\0');
-  many.resize(many.size() - 3);  // the last has no padding
+  many.resize(many.size() - 3);  // the last element has no padding
   const auto length = static_cast<uint32_t>(many.size() - 4);
   std::memcpy(many.data(), &length, sizeof length);
   EXPECT_THAT(call("List", "as", many), testing::HasSubstr(rpc::kInvalidArgs));
@@ -421,8 +423,7 @@ TEST_F(RPCTest, AHandlerThatFailsAnswersItsCall) {
   EXPECT_EQ(client.echo("next"), "next");
 }
 
-TEST(RPCFramer, FindsMessagesHoweverTheyAreCut) {
-  using rpc::Framer;
+TEST(RPCFramer, FindsMessagesHoweverTheInputIsSplit) {
   std::string stream = std::string(1, '\0') + "AUTH EXTERNAL 30\r\nBEGIN x\r\nBEGIN\r\n";
   const size_t authentication = stream.size();
   const std::vector<size_t> sizes{24, 16 + 8 + 1000, 70000};
@@ -463,13 +464,13 @@ TEST(RPCFramer, FindsMessagesHoweverTheyAreCut) {
   }
 }
 
-// Large requests wait for each other, small ones do not, and one that is larger than the budget
-// comes once there is no other.
-TEST(RPCRequestBudget, BoundsWhatAllRequestsHold) {
+// Large requests wait for each other, small ones do not, and one above the budget is let in when it
+// is the only one.
+TEST(RPCRequestBudget, LimitsTheBytesOfAllRequests) {
   rpc::RequestBudget budget;
   int resumed = 0;
   const auto resume = [&resumed] { ++resumed; };
-  const size_t half = rpc::kMaximumWaitingBytes / 2;
+  const size_t half = rpc::kMaxWaitingBytes / 2;
   EXPECT_TRUE(budget.take(half + 1, resume));
   EXPECT_FALSE(budget.take(half, resume));
   EXPECT_TRUE(budget.take(rpc::kSmallMessageBytes, resume));
@@ -482,7 +483,7 @@ TEST(RPCRequestBudget, BoundsWhatAllRequestsHold) {
   EXPECT_TRUE(budget.take(3 * half, resume));
 }
 
-TEST_F(RPCTest, WhatIsReadyGoesOutBeforeTheEnd) {
+TEST_F(RPCTest, PendingRepliesAreSentBeforeTheEnd) {
   const Client client(path());
   sd_bus_message* call = client.newCall("Hold");
   sd_bus_message* answer = nullptr;

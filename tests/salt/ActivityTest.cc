@@ -13,8 +13,8 @@ using std::chrono::hours;
 
 }  // namespace
 
-// An end that is not told would be waited for until the test is killed.
-TEST(Activity, WhoWaitsGoesOnBehindTheLastScan) {
+// Without a notification of the end the wait would last until the test is killed.
+TEST(Activity, WaitEndsAfterTheLastScan) {
   Activity traffic;
   EXPECT_FALSE(traffic.any());
   traffic.waitForEnd(hours(1));

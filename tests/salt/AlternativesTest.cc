@@ -24,7 +24,7 @@ std::string randomWord(std::mt19937& random, size_t longest) {
   return word;
 }
 
-// Short words of few letters in some shards and a hot part, with deleted documents.
+// Short words of few letters in some shards and the hot part, with deleted documents.
 std::unique_ptr<salt::Index> randomIndex(const std::string& path, std::mt19937& random) {
   salt::Index::Options options;
   options.MaxPageSuffixes = 5;
@@ -46,7 +46,7 @@ std::unique_ptr<salt::Index> randomIndex(const std::string& path, std::mt19937& 
   return index;
 }
 
-// One like those of the query processor.
+// A term like those of the query processor.
 Term randomTerm(std::mt19937& random) {
   static constexpr std::pair<double, double> kWorths[] = {{5, 1}, {2, 0.8}, {1, 0}, {1, 0}, {0, 1}};
   Term term;
@@ -80,12 +80,12 @@ class Alternatives : public testing::Test {
 
 }  // namespace
 
-TEST_F(Alternatives, ManyPrefixesFindWhatEachFindsByItself) {
+TEST_F(Alternatives, ManyPrefixesFindTheSameAsEachAlone) {
   ASSERT_GT(index->GetMetrics().Shards, 1U);
   ASSERT_GT(index->GetMetrics().HotSuffixes, 0U);
   size_t found = 0;
   for (int round = 0; round < 200; ++round) {
-    if (round == 100) {  // from now on most prefixes need no look
+    if (round == 100) {  // from now on the Bloom filter rejects most prefixes
       while (!dynamic_cast<const salt::index&>(*index).knowsStarts()) std::this_thread::yield();
       EXPECT_TRUE(salttest::addZone(*index, 1000, 1, "cabbaca bbbbbb ", {0, 8}));
     }
@@ -112,7 +112,7 @@ TEST_F(Alternatives, ManyPrefixesFindWhatEachFindsByItself) {
   EXPECT_GT(found, 500U);
 }
 
-TEST_F(Alternatives, AnyDocumentAnswersAsSearchDoes) {
+TEST_F(Alternatives, AnyDocumentAgreesWithSearch) {
   size_t yes = 0;
   for (int round = 0; round < 300; ++round) {
     Term term = randomTerm(random);
@@ -136,7 +136,7 @@ TEST_F(Alternatives, AnyDocumentAnswersAsSearchDoes) {
   EXPECT_GT(yes, 500U);
 }
 
-TEST_F(Alternatives, BestScoresAreThoseOfSearchToTheLastBit) {
+TEST_F(Alternatives, BestScoresEqualSearchToTheLastBit) {
   size_t scored = 0;
   for (int round = 0; round < 600; ++round) {
     std::vector<Term> terms(1 + random() % 5);

@@ -6,9 +6,9 @@
 #include <random>
 #include <sstream>
 
+#include "salt/BytewiseComparator.h"
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
-#include "salt/KeyOrder.h"
 #include "tests/salt/Model.h"
 #include "tests/support/Seed.h"
 
@@ -55,7 +55,7 @@ TEST(Varint, RoundTripsAroundPowersOfTwoAndEndsAtEveryTruncation) {
   EXPECT_DEATH(salt::readVarint(endless), "shift < 32");
 }
 
-TEST(SuffixLength, EndsAtNULAtALateBlankAndAtTheMaximum) {
+TEST(SuffixLength, EndsAtNULAtALateSpaceAndAtTheMaximum) {
   const std::string a31(31, 'a');
   const std::string a99(99, 'a');
   const struct {
@@ -66,8 +66,8 @@ TEST(SuffixLength, EndsAtNULAtALateBlankAndAtTheMaximum) {
       {"abc", 3},
       {"\0abc"s, 0},
       {"ab\0c"s, 2},
-      {a31 + " b", 33},   // a blank at 31 is content
-      {a31 + "a b", 33},  // at 32 it ends the text and stays
+      {a31 + " b", 33},   // a space at 31 does not end the text
+      {a31 + "a b", 33},  // a space at 32 ends the text and is kept
       {a31 + "a  b", 33},
       {a31 + "aaa\0 b"s, 34},
       {a31 + "a \0b"s, 33},
@@ -89,7 +89,7 @@ TEST(SuffixLength, EndsAtNULAtALateBlankAndAtTheMaximum) {
   }
 }
 
-TEST(Keys, HaveTheirBytes) {
+TEST(Keys, HaveGoldenBytes) {
   EXPECT_EQ(key(0, "ab", {300, 5, 7, 0, {}}), "\0ab\0\x07\x05\xAC\x02"s);
   EXPECT_EQ(key(16, "", {1, 200, 256, 9, {1, 2}}), "\x10\0\x80\x02\xC8\x01\x01"s);
   EXPECT_EQ(key(3, "ab", {0, 5, 7, 0, {}}), "\x03"s + "ab");
@@ -114,9 +114,9 @@ TEST(Keys, OnlyTextKeysParseAsSuch) {
   EXPECT_FALSE(salt::parseTextKey("", &docID, &zoneID));
 }
 
-// An index written in one order and read in the other would be lost.
+// An index written in one order and read in another would be lost.
 TEST(Keys, SortAsLeveldbSortsThem) {
-  const salt::KeyOrder order;
+  const salt::BytewiseComparator order;
   const leveldb::Comparator& bytewise = *leveldb::BytewiseComparator();
   EXPECT_STREQ(order.Name(), bytewise.Name());
   const auto sign = [](int result) { return (result > 0) - (result < 0); };
@@ -124,7 +124,7 @@ TEST(Keys, SortAsLeveldbSortsThem) {
   const std::string_view alphabet("\0a\x7F\x80\xFF", 5);
   for (int round = 0; round < 20000; ++round) {
     std::string left(random() % 20, 'x');
-    std::string right = left;  // in common, up to where the tails below begin
+    std::string right = left;  // common up to where the tails below begin
     for (std::string* key : {&left, &right}) {
       for (auto bytes = random() % 10; bytes > 0; --bytes) {
         key->push_back(alphabet[random() % alphabet.size()]);
@@ -158,7 +158,7 @@ TEST(SuffixMeta, Prints) {
   EXPECT_EQ(std::string(SuffixMeta{5, 6, 7, 12, {'a', 'b'}}), "[5,7:6 (12)+\"ab\"]");
 }
 
-TEST(Page, HasItsBytesAndRoundTrips) {
+TEST(Page, HasGoldenBytesAndRoundTrips) {
   const std::vector<SuffixMeta> metas{{1, 300, 2, 0, {'x', 'y'}}, {128, 0, 256, 200, {0, 0}}};
   std::string value;
   salt::pageToValue(metas.data(), metas.size(), &value);
@@ -184,7 +184,7 @@ TEST(Page, HasItsBytesAndRoundTrips) {
   }
 }
 
-TEST(Options, HaveTheirBytesAndParseBack) {
+TEST(Options, HaveGoldenBytesAndRoundTrip) {
   Index::Options options;
   options.Path = "abc";
   const std::string golden =
@@ -268,7 +268,7 @@ Index::Metrics numberedMetrics() {
 
 }  // namespace
 
-TEST(Metrics, HaveTheirBytesAndParseBack) {
+TEST(Metrics, HaveGoldenBytesAndRoundTrip) {
   std::ostringstream out;
   ASSERT_TRUE(numberedMetrics().SerializeToOstream(out));
   const std::string bytes = out.str();

@@ -16,7 +16,7 @@
 #include "tests/support/TemporaryDirectory.h"
 
 // Damaged and foreign files in the directory of an index: how much is still found, and what is
-// said.
+// logged.
 namespace {
 
 namespace fs = std::filesystem;
@@ -43,7 +43,7 @@ void addDocs(Index& index, uint32_t from) {
   }
 }
 
-// The byte at `at` is turned round; below 0 it counts from the end.
+// Inverts the byte at `at`; a negative position counts from the end.
 void flip(const fs::path& path, int64_t at) {
   std::fstream file(path, std::ios::in | std::ios::out | std::ios::binary);
   if (at < 0) at += static_cast<int64_t>(fs::file_size(path));
@@ -63,7 +63,7 @@ Place placeOf(uint32_t docID, uint32_t offset) {
           docID};
 }
 
-// Of the documents of one file.
+// The suffixes of the documents of one file.
 std::set<Place> placesOf(uint32_t from) {
   std::set<Place> places;
   for (uint32_t docID = from; docID < from + kDocsPerFile; ++docID) {
@@ -83,8 +83,8 @@ std::set<Place> findAll(const Index& index) {
   return places;
 }
 
-// Documents 1 to 100 in an old table, 101 to 200 in a newer one, 201 to 300 in the log: three
-// tables once it is open, which is one less than leveldb compacts.
+// Documents 1 to 100 in an old table, 101 to 200 in a newer one, 201 to 300 in the log. Opening
+// makes three tables of them, one less than leveldb compacts.
 class CorruptionTest : public testing::Test {
  protected:
   CorruptionTest() {
@@ -119,14 +119,14 @@ class CorruptionTest : public testing::Test {
 
   testsupport::TemporaryDirectory directory;
   const std::string path = directory / "i";
-  std::vector<fs::path> tables;  // the older first
+  std::vector<fs::path> tables;  // older first
 };
 
 }  // namespace
 
-// The log knows by its checksums what is damaged, drops the rest of that block, and goes on with
-// the next; a document that begins in the dropped part is lost.
-TEST_F(CorruptionTest, OfADamagedLogTheOtherBlocksAreFound) {
+// Checksums reveal damage in the log: the rest of the block is dropped, and recovery continues with
+// the next block. A document that begins in the dropped part is lost.
+TEST_F(CorruptionTest, RecoversTheOtherBlocksOfADamagedLog) {
   constexpr int64_t kBlockBytes = 32768;
   constexpr int64_t kBeforeKey = 7 + 12 + 2;  // headers of record, batch and key
   const fs::path log = files(".log").at(0);
@@ -155,10 +155,10 @@ TEST_F(CorruptionTest, OfADamagedLogTheOtherBlocksAreFound) {
   }
 }
 
-// Reads do not verify checksums, but a block must decompress. What the other blocks and tables hold
-// is delivered, and then the scan says so.
-TEST_F(CorruptionTest, OfADamagedBlockTheRestIsDelivered) {
-  constexpr size_t kMostKeys = 32 * 1024 / 30;  // of one block
+// Reads do not verify checksums, but a block must decompress. Everything in other blocks and tables
+// is delivered, then the scan logs the error.
+TEST_F(CorruptionTest, ScansEverythingOutsideADamagedBlock) {
+  constexpr size_t kMaxKeys = 32 * 1024 / 30;  // of one block
   flip(tables.at(0), 0);
   flip(tables.at(1), 0);
   const auto index = loadIndex(path);
@@ -169,20 +169,20 @@ TEST_F(CorruptionTest, OfADamagedBlockTheRestIsDelivered) {
       "error SALT: Error scanning index: Corruption: corrupted compressed block contents";
   EXPECT_TRUE(log.has(line));
   for (const uint32_t from : {1u, 101u, 201u}) {
-    // Of each damaged table the first keys are missing, and those only.
+    // Of each damaged table only its first keys are missing.
     const std::set<Place> all = placesOf(from);
     auto place = all.begin();
     size_t missing = 0;
     for (; place != all.end() && !found.contains(*place); ++place) ++missing;
     EXPECT_TRUE(std::includes(found.begin(), found.end(), place, all.end())) << from;
     EXPECT_EQ(missing > 0, from != 201) << from;
-    EXPECT_LT(missing, kMostKeys) << from;
+    EXPECT_LT(missing, kMaxKeys) << from;
   }
   EXPECT_FALSE(index->Validate());
   EXPECT_EQ(log.count(line), 2u);
 }
 
-TEST_F(CorruptionTest, ADamagedFrameOfTheDatabaseDoesNotOpen) {
+TEST_F(CorruptionTest, ADatabaseWithDamagedMetadataDoesNotOpen) {
   const struct {
     std::function<void()> damage;
     std::string line;
@@ -209,9 +209,9 @@ TEST_F(CorruptionTest, ADamagedFrameOfTheDatabaseDoesNotOpen) {
   }
 }
 
-// What an index must know of itself is read first: unreadable metrics are those of another version,
-// anything else unreadable ends the process.
-TEST_F(CorruptionTest, ATableWithoutItsEndIsNotReadPast) {
+// The records of an index are read first: unreadable metrics count as another version, and any
+// other unreadable record ends the process.
+TEST_F(CorruptionTest, ATruncatedTableIsNotReadPastItsEnd) {
   fs::remove(files(".log").at(0));
   fs::copy(path, directory / "newest");
   flip(fs::path(directory / "newest") / tables.at(1).filename(), -1);
@@ -222,9 +222,9 @@ TEST_F(CorruptionTest, ATableWithoutItsEndIsNotReadPast) {
   EXPECT_DEATH(static_cast<void>(loadIndex(path)), "status\\.ok\\(\\)");
 }
 
-// Each in a directory of its own here and below: tests of death fork, and a database of few tables
-// starts no thread that a fork would miss.
-TEST(Corruption, OptionsThatAreNotValidEndTheProcess) {
+// These tests use a directory each: death tests fork, and a database of few tables starts no thread
+// that the fork would lose.
+TEST(Corruption, InvalidOptionsEndTheProcess) {
   const auto expectDeath = [](const std::string& bytes, const char* assertion) {
     const testsupport::TemporaryDirectory directory;
     newIndex(directory / "i").reset();
@@ -248,8 +248,8 @@ TEST(Corruption, OptionsThatAreNotValidEndTheProcess) {
   expectDeath(std::string(47, '\0'), "parseRecord\\(bytes, &op\\)");
 }
 
-// What is valid and odd does no harm.
-TEST(Corruption, OddOptionsWork) {
+// Valid but unusual options do no harm.
+TEST(Corruption, UnusualOptionsWork) {
   const std::function<void(Index::Options&)> edits[] = {
       [](auto& op) { op.MinMatchLen = op.MaxMatchLen = 0; },
       [](auto& op) { op.MaxMatchLen = 255; },
@@ -309,7 +309,7 @@ TEST(Corruption, APageThatCannotBeReadEndsTheProcess) {
       {kPageKey, "", "s\\.size\\(\\)"},
       {kPageKey, page.substr(0, 12), "s\\.size\\(\\)"},
       {kPageKey, "\x33", "size <= op\\.MaxPageSuffixes"},
-      // Five bytes of the second suffix are known from its page.
+      // The page has five bytes of the second suffix.
       {kTextKey, "aaaa", "text\\.size\\(\\) >= size"},
   };
   const std::function<void(Index&)> steps[] = {
@@ -338,7 +338,7 @@ TEST_F(CorruptionTest, ForeignFilesAreLeftAloneAndDoNoHarm) {
   write("notes.txt", "mine");
   fs::create_directory(path + "/subdirectory");
   write("subdirectory/CURRENT", "mine");
-  // These have names of leveldb's, which it takes away or, the log, looks for records in.
+  // leveldb recognises these names: it removes the files or, for the log, reads records from it.
   write("999999.ldb", garbage);
   write("999998.log", garbage);
   write("MANIFEST-999997", garbage);

@@ -7,13 +7,13 @@
 #include <set>
 
 #include "salt/IndexImpl.h"
-#include "tests/salt/FilesBetween.h"
+#include "tests/salt/FaultInjectionEnv.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// A disk that is full at any moment of a merge.
+// A disk that becomes full at any point of a merge.
 namespace {
 
 using salt::Index;
@@ -23,30 +23,31 @@ using salttest::scan;
 using testsupport::LogCapture;
 using testsupport::TemporaryDirectory;
 
-// A disk with so many bytes left. A write that does not fit is cut and fails, as on a real one.
-class FullDisk final : public salttest::FilesBetween {
+// Limits the total bytes written. A write that does not fit is truncated and fails, as on a real
+// disk.
+class FullDiskEnv final : public salttest::FaultInjectionEnv {
  public:
   void setBytesLeft(int64_t bytes) { _bytesLeft = bytes; }
   [[nodiscard]] int64_t bytesLeft() const { return _bytesLeft; }
 
  private:
-  class File final : public salttest::FileBetween {
+  class File final : public salttest::FaultInjectionFile {
    public:
-    File(FullDisk* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
+    File(FullDiskEnv* disk, leveldb::WritableFile* file) : FaultInjectionFile(file), _disk(*disk) {}
     leveldb::Status Append(const leveldb::Slice& data) override {
       const auto size = static_cast<int64_t>(data.size());
       const int64_t left = std::max<int64_t>(_disk._bytesLeft.fetch_sub(size), 0);
-      if (left >= size) return FileBetween::Append(data);
-      static_cast<void>(FileBetween::Append({data.data(), static_cast<size_t>(left)}));
+      if (left >= size) return FaultInjectionFile::Append(data);
+      static_cast<void>(FaultInjectionFile::Append({data.data(), static_cast<size_t>(left)}));
       static_cast<void>(Flush());
       return leveldb::Status::IOError("No space left on device");
     }
 
    private:
-    FullDisk& _disk;
+    FullDiskEnv& _disk;
   };
 
-  leveldb::WritableFile* between(const std::string&, leveldb::WritableFile* file) override {
+  leveldb::WritableFile* wrap(const std::string&, leveldb::WritableFile* file) override {
     return new File(this, file);
   }
 
@@ -63,8 +64,8 @@ void addDocs(Index& index, uint32_t from, uint32_t to) {
   }
 }
 
-// A shard and a hot part, which a merge commits in several batches. Merges start only when asked
-// for.
+// An index with a shard and a hot part whose merge takes several commits. Merges start on request
+// only.
 void makeIndex(const std::string& path) {
   Index::Options options;
   options.MaxHotSuffixes = kMaxHotSuffixes;
@@ -85,7 +86,7 @@ std::vector<std::string> sortedScan(const Index& index) {
   return found;
 }
 
-// The hot keys and the pages in the database.
+// The number of hot keys and of pages in the database.
 std::pair<uint64_t, uint64_t> countKeys(const std::string& path) {
   const salt::Database database = salt::openDatabase(path, salt::OpenMode::existing);
   const std::unique_ptr<leveldb::Iterator> key(database.db->NewIterator({}));
@@ -98,7 +99,7 @@ std::pair<uint64_t, uint64_t> countKeys(const std::string& path) {
 
 }  // namespace
 
-TEST(FullDisk, AMergeThatItCutsShortLosesNothingAndIsMadeUpFor) {
+TEST(FullDisk, AnInterruptedMergeLosesNothingAndIsRepeated) {
   const TemporaryDirectory directory;
   const std::string original = directory / "original";
   makeIndex(original);
@@ -109,7 +110,7 @@ TEST(FullDisk, AMergeThatItCutsShortLosesNothingAndIsMadeUpFor) {
   for (int64_t bytes = 0; failed; bytes += 1300) {
     const std::string path = directory / std::to_string(bytes);
     std::filesystem::copy(original, path);
-    FullDisk disk;
+    FullDiskEnv disk;
     auto index = salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, &disk));
     {
       const LogCapture log;

@@ -21,7 +21,7 @@ namespace {
 
 constexpr uint32_t kHistories = 24;
 constexpr size_t kSteps = 60;
-constexpr unsigned kMaxSeconds = 60;  // of one run; longer is a deadlock
+constexpr unsigned kMaxSeconds = 60;  // for one run; longer means a deadlock
 
 struct Step {
   enum class Kind { add, append, remove, vacuum, compact, reopen };
@@ -31,7 +31,7 @@ struct Step {
   uint16_t zoneID = 0;
   std::string text;
   std::vector<uint32_t> offsets;
-  std::string prefix;  // of the scan that follows
+  std::string prefix;  // for the scan that follows
 };
 
 struct History {
@@ -111,7 +111,7 @@ class Generator {
     _texts.push_back(step->text);
   }
 
-  // Mostly one that occurs: a piece of a text, perhaps changed at the end.
+  // Usually a prefix that occurs: a piece of a text, perhaps changed at its end.
   std::string prefix() {
     if (_texts.empty() || _random() % 8 == 0) {
       return salttest::randomText(_random, _random() % 150);
@@ -127,7 +127,7 @@ class Generator {
   std::vector<std::string> _texts;
 };
 
-// Takes the steps one by one, with the index and with the model, while merges run as they will.
+// Applies the steps to the index and to the model, while merges run freely.
 class Run {
  public:
   Run(const History& history, const std::string& path)
@@ -136,7 +136,7 @@ class Run {
         _path(path),
         _index(salttest::newIndex(path, history.options)) {}
 
-  // What went wrong first, or empty.
+  // The first fault, or empty.
   std::string fault() {
     for (size_t i = 0; i < _history.steps.size(); ++i) {
       const Step& step = _history.steps[i];
@@ -172,7 +172,7 @@ class Run {
     return "";
   }
 
-  // A merge may be running: which shard a suffix is in is not known.
+  // A merge may be running, so the shard of a suffix is unknown.
   std::string look(const std::string& prefix) {
     for (const std::string& text : {""s, prefix}) {
       auto found = salttest::scan(*_index, text);
@@ -187,8 +187,8 @@ class Run {
     return _model.difference(_index->GetMetrics());
   }
 
-  // The end of an index waits for its merge. Then the keys tell where each suffix is, and the scans
-  // must follow that order.
+  // Closing the index waits for its merge. Then the keys tell where each suffix is, and scans must
+  // follow that order.
   std::string reopen() {
     _index.reset();
     const salttest::Keys keys = salttest::readKeys(_path);
@@ -205,7 +205,7 @@ class Run {
     return "";
   }
 
-  // The second scan of a prefix may answer from memory.
+  // The second scan of a prefix may be answered from the cache.
   std::string comparedPlaces(const std::string& prefix, const std::vector<std::string>& suffixes) {
     std::set<std::string> expected;
     for (const std::string& suffix : suffixes) expected.insert(suffix.substr(0, suffix.find(':')));
@@ -240,8 +240,8 @@ class Run {
   std::unique_ptr<Index> _index;
 };
 
-// In a process of its own, so that an assertion or a deadlock is a fault like any other. For that
-// no test of this program may start a thread.
+// Runs in its own process, so that an assertion or a deadlock is a fault like any other. Because of
+// the fork, this test program must not start threads.
 std::string faultOf(const History& history) {
   const TemporaryDirectory directory;
   int ends[2];
@@ -264,7 +264,7 @@ std::string faultOf(const History& history) {
   return status == 0 ? fault : fmt::format("the process ended with status {:#x}", status);
 }
 
-// Merges run at their own pace: a fault need not show each time.
+// Merges run at their own pace, so a fault need not show every time.
 bool fails(const History& history) {
   for (int i = 0; i < 3; ++i) {
     if (!faultOf(history).empty()) return true;
@@ -272,7 +272,7 @@ bool fails(const History& history) {
   return false;
 }
 
-// Leaves out what the failure does not need: steps, large pieces first, then ends of texts.
+// Removes what the failure does not need: steps, large groups first, then the ends of texts.
 History shortest(History failing) {
   const auto accept = [&failing](History shorter) {
     const bool good = fails(shorter);
@@ -310,7 +310,7 @@ TEST_P(Histories, AgreeWithTheModel) {
   }
 }
 
-// Four tests, so that they run beside each other.
+// Four tests, which can run in parallel.
 INSTANTIATE_TEST_SUITE_P(Random, Histories, testing::Range(0u, 4u));
 
 }  // namespace

@@ -33,7 +33,7 @@ std::string padded(std::string text, size_t size) {
 
 }  // namespace
 
-TEST(AddZone, RefusesEachFaultWithItsLine) {
+TEST(AddZone, RefusesInvalidInputWithALogLine) {
   const TemporaryDirectory directory;
   Index::Options options;
   options.MaxZoneSize = 20;
@@ -75,7 +75,7 @@ TEST(AddZone, RefusesEachFaultWithItsLine) {
   EXPECT_FALSE(index->DeleteDoc(0));
 }
 
-// The same once while the index remembers that the document is new, once after it was reopened.
+// Once while the index remembers that the document is new, and once after reopening.
 TEST(AddZone, AppendsAnotherTextAndIgnoresTheSame) {
   for (const bool reopen : {false, true}) {
     const TemporaryDirectory directory;
@@ -134,7 +134,7 @@ TEST(AddZone, DelaysOnlyFromTwiceTheHotLimit) {
   const TemporaryDirectory directory;
   Index::Options options;
   options.MaxHotSuffixes = 10;
-  options.MaxPageSuffixes = 0;  // no merge takes from the hot part
+  options.MaxPageSuffixes = 0;  // disables merges
   options.ThrottleFactor = 1;
   const auto index = newIndex(directory / "i", options);
   const std::string text(19, 'a');
@@ -149,8 +149,8 @@ TEST(AddZone, DelaysOnlyFromTwiceTheHotLimit) {
   EXPECT_GT(index->GetMetrics().ThrottlingSeconds, once);
 }
 
-// A failed write leaves half a record in the log; what comes later must not go behind it.
-TEST(Writes, LoseNothingAroundAFailedOne) {
+// A failed write leaves a torn record in the log; later writes must not follow it.
+TEST(Writes, LoseNothingAfterAFailedOne) {
   const std::function<bool(Index&)> writes[] = {
       [](Index& index) { return addZone(index, 2, 1, std::string(5000, 'z')); },
       [](Index& index) { return index.DeleteDoc(1); },
@@ -221,7 +221,7 @@ TEST(ForEachZone, VisitsTextsInKeyOrderUntilToldToStop) {
   EXPECT_EQ(seen.size(), 6u);
 }
 
-TEST(Compact, WhatAWalkStillReadGoesWhenItEnds) {
+TEST(Compact, FilesKeptByALongReadAreRemovedWhenItEnds) {
   const TemporaryDirectory directory;
   const auto tablesLeft = [&directory](const char* name, bool walking) {
     auto index = newIndex(directory / name);
@@ -259,7 +259,7 @@ TEST(Open, NewIndexWipesAndOptionsComeFromTheDatabase) {
   index->Compact();
 }
 
-TEST(Open, EachFailureHasItsLine) {
+TEST(Open, EachFailureIsLogged) {
   const std::string version = "error SALT: Loading failure: Mismatched code version.";
   const std::string corrupted = "fault SALT: Loading failure: Metrics corrupted.";
   const struct {
@@ -303,8 +303,8 @@ TEST(Open, FailsWithoutADatabaseOrWithoutItsRecords) {
   EXPECT_DEATH(static_cast<void>(loadIndex(directory / "i")), "status\\.ok\\(\\)");
 }
 
-// An index as this format's first release wrote it: three documents merged into a page, a suffix
-// that is hot, and a document deleted since.
+// An index written by the first release of this format: three documents merged into a page, one hot
+// suffix, and one document deleted.
 TEST(Open, ReadsTheKeptIndexOfItsVersion) {
   const TemporaryDirectory directory;
   std::filesystem::copy(SALT_TEST_DATA "/v304", directory / "i");
@@ -328,15 +328,15 @@ TEST(Open, ReadsTheKeptIndexOfItsVersion) {
   EXPECT_EQ(m.Pages, 1u);
 }
 
-TEST(Open, ForgetsAVacuumThatACrashCutShort) {
+TEST(Open, ClearsVacuumInProgressAfterACrash) {
   const TemporaryDirectory directory;
   newIndex(directory / "i").reset();
   salttest::editMetrics(directory / "i", [](auto& m) { m.VacuumInProgress = true; });
   EXPECT_FALSE(loadIndex(directory / "i")->GetMetrics().VacuumInProgress);
 }
 
-// What is acknowledged after an open on a torn log must be there after the next open.
-TEST(Open, ATornLogHidesNothingThatComesLater) {
+// What is acknowledged after opening a torn log must survive the next open.
+TEST(Open, ATornLogLosesNoLaterWrites) {
   for (const uint64_t cut : {1u, 20u, 150u}) {
     const TemporaryDirectory directory;
     auto index = newIndex(directory / "i");
@@ -360,7 +360,7 @@ TEST(Open, ATornLogHidesNothingThatComesLater) {
 
 namespace {
 
-// An index with one zone of 8 words and one page in shard 1 of the given suffixes of it.
+// An index with one zone of 8 words, and in shard 1 one page with the given suffixes of it.
 std::unique_ptr<Index> withPage(const std::string& path, const std::vector<SuffixMeta>& metas,
                                 bool validateOnLoad = false) {
   Index::Options options;

@@ -11,7 +11,7 @@
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// An index written anew without what was deleted.
+// Copies of an index without deleted documents.
 namespace {
 
 using salt::Index;
@@ -20,12 +20,12 @@ using salttest::Model;
 constexpr uint32_t kSeeds = 6;
 constexpr uint32_t kDocs = 60;
 
-// A word that stands in this document only.
+// A word that occurs in this document only.
 std::string wordOf(uint32_t docID) {
   return "only" + std::to_string(docID) + "here";
 }
 
-// Some places of the text, and those of its words.
+// Some positions of the text, and those of its words.
 std::vector<uint32_t> placesIn(std::mt19937& random, const std::string& text) {
   std::vector<uint32_t> places = salttest::randomOffsets(random, text);
   for (const uint32_t word : salttest::wordOffsets(text)) {
@@ -38,7 +38,7 @@ std::vector<uint32_t> placesIn(std::mt19937& random, const std::string& text) {
 
 class LiveCopyTest : public testing::Test {
  protected:
-  // Two zones a document, some of it merged into shards, some hot.
+  // Two zones per document, some merged into shards and some hot.
   void fill(uint32_t seed) {
     std::mt19937 random(seed);
     Index::Options options;
@@ -62,7 +62,7 @@ class LiveCopyTest : public testing::Test {
     for (uint32_t docID = 1; docID <= kDocs; ++docID) {
       if (random() % (1 + seed % 4) == 0) gone.insert(docID);
     }
-    const uint32_t unknown = *gone.rbegin();  // not kept, and not deleted
+    const uint32_t unknown = *gone.rbegin();  // neither kept nor deleted
     for (const uint32_t docID : gone) {
       if (docID == unknown) continue;
       ASSERT_TRUE(index->DeleteDoc(docID));
@@ -96,7 +96,7 @@ class LiveCopyTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(LiveCopyTest, AnswersTheSameAndHoldsNothingElse) {
+TEST_F(LiveCopyTest, GivesTheSameAnswersAndContainsNothingElse) {
   for (uint32_t seed = testsupport::firstSeed(); seed < testsupport::firstSeed() + kSeeds; ++seed) {
     SCOPED_TRACE(seed);
     gone.clear();
@@ -133,7 +133,7 @@ TEST_F(LiveCopyTest, AnswersTheSameAndHoldsNothingElse) {
     EXPECT_LE(metrics.Pages,
               2 * (metrics.Suffixes - metrics.HotSuffixes) / page + 2 * metrics.Shards);
 
-    // It can be added to and merged like any other.
+    // The copy accepts documents and merges like any other index.
     for (uint32_t docID = kDocs + 1; docID < kDocs + 30; ++docID) {
       const std::string text = wordOf(docID) + ' ' + salttest::randomText(random, 200);
       ASSERT_TRUE(salttest::addZone(*made, docID, 1, text, placesIn(random, text)));

@@ -37,7 +37,7 @@ uint32_t takeVarint(std::string_view* bytes) {
   return value;
 }
 
-// What the format makes of places that follow one another in a page.
+// A page of consecutive places, encoded as the format says.
 std::string naivePage(const std::vector<const Place*>& places) {
   std::string docIDs, zoneIDs, offsets, lengths, extras;
   for (size_t i = 0; i < places.size(); ++i) {
@@ -54,12 +54,12 @@ std::string naivePage(const std::vector<const Place*>& places) {
     zoneIDs += naiveVarint(place.zoneID);
     offsets += naiveVarint(place.offset);
   }
-  // Those of the first mean nothing.
+  // For the first suffix these values have no meaning.
   return naiveVarint(static_cast<uint32_t>(places.size())) + docIDs + zoneIDs + offsets + lengths +
          extras;
 }
 
-// The walk over all keys that compares them with the model.
+// Iterates over all keys and compares them with the model.
 class Comparison {
  public:
   explicit Comparison(Model* model) : _model(*model) {
@@ -96,7 +96,7 @@ class Comparison {
     if (found != expected) fail(fmt::format("{}: {} instead of {}", what, found, expected));
   }
 
-  // Takes the place with these numbers, which must be the next of its shard.
+  // Consumes the place with these numbers, which must be the next one of its shard.
   const Place* take(uint8_t shard, const ID& id) {
     const auto found = _unseen.find(id);
     if (found == _unseen.end()) {
@@ -169,7 +169,7 @@ class Comparison {
     expect("HotSuffixes", m.HotSuffixes, _suffixes[0]);
     expect("Pages", m.Pages, _pages);
     if (_suffixes.rbegin()->first > m.Shards) fail("page of a shard that is not opened");
-    // All that goes into the newest shard is counted, while it fills up and at its turns.
+    // Counts all suffixes added to the newest shard, both while it fills up and later.
     expect("LastShardSuffixes", m.LastShardSuffixes,
            m.Shards == 0 ? 0 : _suffixes[static_cast<uint8_t>(m.Shards)]);
     expect("IndexingCalls", m.IndexingCalls, _model.indexingCalls);

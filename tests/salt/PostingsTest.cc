@@ -12,7 +12,7 @@
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// Scans by postings beside scans that walk.
+// Scans with posting lists compared with scans of the pages.
 namespace {
 
 namespace fs = std::filesystem;
@@ -26,7 +26,7 @@ struct Answer {
   bool operator==(const Answer&) const = default;
 };
 
-// As ScanPlaces says, which may use postings.
+// The result of ScanPlaces, which may use posting lists.
 Answer placesOf(const Index& index, const std::string& prefix) {
   Answer answer;
   const auto suffixes =
@@ -38,7 +38,7 @@ Answer placesOf(const Index& index, const std::string& prefix) {
   return answer;
 }
 
-// As the pages say.
+// The result from the pages.
 Answer walk(const Index& index, const std::string& prefix) {
   Answer answer;
   index.ScanPrefix(prefix, [&](const salt::SuffixMeta& meta) {
@@ -55,7 +55,7 @@ class PostingsTest : public testing::Test {
 
   PostingsTest() {
     options.MaxHotSuffixes = 400;
-    options.MaxShardSuffixes = 2000;  // entries from 4 suffixes on
+    options.MaxShardSuffixes = 2000;  // gives prefixes with 4 or more suffixes a posting list
     options.MaxShards = 3;
     options.MaxPageSuffixes = 10;
     index = salttest::newIndex(path, options);
@@ -95,7 +95,7 @@ class PostingsTest : public testing::Test {
       ASSERT_EQ(placesOf(*index, prefix), walk(*index, prefix)) << prefix;
     }
   }
-  // How many pages the scans for the most frequent prefixes read.
+  // How many pages scans for the most frequent prefixes read.
   [[nodiscard]] uint64_t pageReads() const {
     const uint64_t before = index->GetMetrics().ScanPageReads;
     for (const char* prefix : {"a", "aa", "b", "ab"}) placesOf(*index, prefix);
@@ -113,7 +113,7 @@ class PostingsTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(PostingsTest, AnswersAreThoseOfThePagesThroughMergesDeletionsAndReopening) {
+TEST_F(PostingsTest, AnswersMatchThePagesThroughMergesDeletionsAndReopening) {
   for (int round = 0; round < 8; ++round) {
     addDocs(40);
     index->Vacuum();
@@ -142,7 +142,7 @@ TEST_F(PostingsTest, ThereAreNoneWithMoreZonesThanBits) {
   expectSame();
 }
 
-TEST_F(PostingsTest, WhatIsNotAsItShouldBeIsPassedOverAndMadeAnew) {
+TEST_F(PostingsTest, InvalidFilesAreIgnoredAndRebuilt) {
   addDocs(100);
   index->Vacuum();
   reopen();
@@ -157,7 +157,7 @@ TEST_F(PostingsTest, WhatIsNotAsItShouldBeIsPassedOverAndMadeAnew) {
     contents.push_back(good);
     contents.back()[at] ^= 0x20;
   }
-  // A list is looked at when it is read; this one is some prefix's.
+  // A list is checked when it is read; this is the list of some prefix.
   std::string list = good;
   list[good.size() - 20] ^= 0x20;
   index.reset();
@@ -187,7 +187,7 @@ TEST_F(PostingsTest, WhatIsNotAsItShouldBeIsPassedOverAndMadeAnew) {
   expectSame();
 }
 
-TEST_F(PostingsTest, OfAnotherShardOrIndexTheyAreNotUsed) {
+TEST_F(PostingsTest, FilesOfAnotherShardOrIndexAreNotUsed) {
   for (int i = 0; i < 4; ++i) {
     addDocs(60);
     index->Vacuum();
@@ -206,7 +206,7 @@ TEST_F(PostingsTest, OfAnotherShardOrIndexTheyAreNotUsed) {
   expectSame();
 }
 
-TEST_F(PostingsTest, AMergeThatCannotWriteThemIsDoneAllTheSame) {
+TEST_F(PostingsTest, AMergeSucceedsEvenIfTheFileCannotBeWritten) {
   testsupport::LogCapture log;
   fs::create_directory(salt::postingsPath(path, 1) + ".new");
   addDocs(20);

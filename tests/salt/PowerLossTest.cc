@@ -7,41 +7,41 @@
 
 #include "platform/Mutex.h"
 #include "salt/IndexImpl.h"
-#include "tests/salt/FilesBetween.h"
+#include "tests/salt/FaultInjectionEnv.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// The power goes while leveldb writes tables and removes what they replace.
+// Power losses while leveldb writes tables and removes what they replace.
 namespace {
 
 using salt::Index;
 using testsupport::TemporaryDirectory;
 
-// Knows how much of each file is sure to be on the disk, and takes pictures of the directory as it
-// would be found if the power went now: each time a file is gone, or a manifest has grown. A
-// manifest reaches the disk sooner than it must, a table not before it is synced. Of each log the
-// synced part is there, all of it, or any part in between, whatever there is of the others.
-class Disk final : public salttest::FilesBetween {
+// Tracks how much of each file is certainly on disk, and takes snapshots of the directory as a
+// power loss would leave it: whenever a file is removed or a manifest grows. A manifest reaches the
+// disk as early as possible, a table only when it is synced. Of a log the snapshot has the synced
+// part, all of it, or any part in between, independently of other logs.
+class PowerLossEnv final : public salttest::FaultInjectionEnv {
  public:
-  struct Picture {
+  struct Snapshot {
     std::string path;
-    uint32_t acknowledged = 0;  // what the caller has set by then
+    uint32_t acknowledged = 0;  // value set by the test by then
     enum class Logs { whole, synced, cut } logs;
   };
 
-  explicit Disk(std::string pictures) : _directory(std::move(pictures)) {}
+  explicit PowerLossEnv(std::string snapshots) : _directory(std::move(snapshots)) {}
 
   std::atomic<uint32_t> acknowledged{0};
 
-  [[nodiscard]] std::vector<Picture> pictures() {
+  [[nodiscard]] std::vector<Snapshot> snapshots() {
     platform::MutexLock lock(_mutex);
-    return _pictures;
+    return _snapshots;
   }
 
   leveldb::Status RemoveFile(const std::string& path) override {
     const leveldb::Status status = target()->RemoveFile(path);
     platform::MutexLock lock(_mutex);
-    if (_synced.erase(path) != 0) takePicture();
+    if (_synced.erase(path) != 0) takeSnapshot();
     return status;
   }
   leveldb::Status RenameFile(const std::string& from, const std::string& to) override {
@@ -52,31 +52,32 @@ class Disk final : public salttest::FilesBetween {
   }
 
  private:
-  class File final : public salttest::FileBetween {
+  class File final : public salttest::FaultInjectionFile {
    public:
-    File(Disk* disk, std::string path, leveldb::WritableFile* file)
-        : FileBetween(file), _disk(*disk), _path(std::move(path)) {}
+    File(PowerLossEnv* disk, std::string path, leveldb::WritableFile* file)
+        : FaultInjectionFile(file), _disk(*disk), _path(std::move(path)) {}
 
     leveldb::Status Flush() override {
-      const leveldb::Status status = FileBetween::Flush();
+      const leveldb::Status status = FaultInjectionFile::Flush();
       if (_path.find("MANIFEST") != std::string::npos) _disk.manifestGrew(_path);
       return status;
     }
     leveldb::Status Sync() override {
-      if (const leveldb::Status flushed = FileBetween::Flush(); !flushed.ok()) return flushed;
-      std::error_code gone;  // a log may be obsolete by now
+      if (const leveldb::Status flushed = FaultInjectionFile::Flush(); !flushed.ok())
+        return flushed;
+      std::error_code gone;  // an obsolete log may have been removed
       const uint64_t written = std::filesystem::file_size(_path, gone);
-      const leveldb::Status status = FileBetween::Sync();
+      const leveldb::Status status = FaultInjectionFile::Sync();
       if (!gone) _disk.synced(_path, written);
       return status;
     }
 
    private:
-    Disk& _disk;
+    PowerLossEnv& _disk;
     const std::string _path;
   };
 
-  leveldb::WritableFile* between(const std::string& path, leveldb::WritableFile* file) override {
+  leveldb::WritableFile* wrap(const std::string& path, leveldb::WritableFile* file) override {
     platform::MutexLock lock(_mutex);
     _synced.emplace(path, 0);
     return new File(this, path, file);
@@ -91,43 +92,43 @@ class Disk final : public salttest::FilesBetween {
   void manifestGrew(const std::string& path) {
     platform::MutexLock lock(_mutex);
     _synced[path] = std::filesystem::file_size(path);
-    takePicture();
+    takeSnapshot();
   }
 
-  void takePicture() TL_REQUIRES(_mutex) {
-    const std::string number = std::to_string(_pictures.size());
-    const Picture picture{_directory + '/' + number, acknowledged,
-                          static_cast<Picture::Logs>(_pictures.size() % 3)};
-    std::filesystem::create_directories(picture.path);
+  void takeSnapshot() TL_REQUIRES(_mutex) {
+    const std::string number = std::to_string(_snapshots.size());
+    const Snapshot snapshot{_directory + '/' + number, acknowledged,
+                            static_cast<Snapshot::Logs>(_snapshots.size() % 3)};
+    std::filesystem::create_directories(snapshot.path);
     for (const auto& [path, synced] : _synced) {
       const std::filesystem::path file = path;
-      const auto copy = std::filesystem::path(picture.path) / file.filename();
+      const auto copy = std::filesystem::path(snapshot.path) / file.filename();
       if (file.extension() == ".ldb" && synced != 0) {
-        std::filesystem::create_hard_link(file, copy);  // it does not change any more
+        std::filesystem::create_hard_link(file, copy);  // immutable
         continue;
       }
       std::filesystem::copy_file(file, copy);
       const uint64_t size = std::filesystem::file_size(copy);
       uint64_t left = synced;
-      if (file.extension() == ".log" && picture.logs == Picture::Logs::whole) left = size;
-      if (file.extension() == ".log" && picture.logs == Picture::Logs::cut && size > synced) {
+      if (file.extension() == ".log" && snapshot.logs == Snapshot::Logs::whole) left = size;
+      if (file.extension() == ".log" && snapshot.logs == Snapshot::Logs::cut && size > synced) {
         left += _random() % 2 == 0 ? size - synced : _random() % (size - synced);
       }
       std::filesystem::resize_file(copy, std::min(left, size));
     }
-    _pictures.push_back(picture);
+    _snapshots.push_back(snapshot);
   }
 
   const std::string _directory;
   platform::Mutex _mutex;
-  std::map<std::string, uint64_t> _synced TL_GUARDED_BY(_mutex);  // bytes of files, by path
-  std::vector<Picture> _pictures TL_GUARDED_BY(_mutex);
+  std::map<std::string, uint64_t> _synced TL_GUARDED_BY(_mutex);  // synced bytes by path
+  std::vector<Snapshot> _snapshots TL_GUARDED_BY(_mutex);
   std::mt19937 _random TL_GUARDED_BY(_mutex){7};
 };
 
-constexpr uint32_t kWords = 1000;  // of a document
+constexpr uint32_t kWords = 1000;  // per document
 
-void addDocs(Index& index, Disk& disk, uint32_t count) {
+void addDocs(Index& index, PowerLossEnv& disk, uint32_t count) {
   std::mt19937 random(5);
   for (uint32_t docID = 1; docID <= count; ++docID) {
     std::string text;
@@ -139,7 +140,7 @@ void addDocs(Index& index, Disk& disk, uint32_t count) {
 
 TEST(PowerLoss, LeavesTheFirstOperationsWithoutAGap) {
   const TemporaryDirectory directory;
-  Disk disk(directory / "pictures");
+  PowerLossEnv disk(directory / "snapshots");
   const std::string path = directory / "index";
   Index::Options options;
   options.MaxHotSuffixes = 50000;
@@ -151,18 +152,18 @@ TEST(PowerLoss, LeavesTheFirstOperationsWithoutAGap) {
 
   uint32_t before = 0;
   size_t opened = 0;
-  for (const Disk::Picture& picture : disk.pictures()) {
-    if (!std::filesystem::exists(picture.path + "/CURRENT")) continue;
-    const auto found = salttest::loadIndex(picture.path);
-    ASSERT_TRUE(found) << picture.path;
+  for (const PowerLossEnv::Snapshot& snapshot : disk.snapshots()) {
+    if (!std::filesystem::exists(snapshot.path + "/CURRENT")) continue;
+    const auto found = salttest::loadIndex(snapshot.path);
+    ASSERT_TRUE(found) << snapshot.path;
     const Index::Metrics metrics = found->GetMetrics();
-    EXPECT_TRUE(found->Validate()) << picture.path;
+    EXPECT_TRUE(found->Validate()) << snapshot.path;
     EXPECT_EQ(metrics.Docs, metrics.MaxDocID);
     EXPECT_EQ(metrics.Suffixes, uint64_t{metrics.MaxDocID} * kWords);
-    EXPECT_GE(metrics.MaxDocID, before) << picture.path;
-    if (picture.logs == Disk::Picture::Logs::synced) before = metrics.MaxDocID;
-    if (picture.logs == Disk::Picture::Logs::whole) {
-      EXPECT_GE(metrics.MaxDocID, picture.acknowledged) << picture.path;
+    EXPECT_GE(metrics.MaxDocID, before) << snapshot.path;
+    if (snapshot.logs == PowerLossEnv::Snapshot::Logs::synced) before = metrics.MaxDocID;
+    if (snapshot.logs == PowerLossEnv::Snapshot::Logs::whole) {
+      EXPECT_GE(metrics.MaxDocID, snapshot.acknowledged) << snapshot.path;
     }
     ++opened;
   }
@@ -170,11 +171,11 @@ TEST(PowerLoss, LeavesTheFirstOperationsWithoutAGap) {
   EXPECT_GT(before, 0u);
 }
 
-// A process that was killed leaves a table that no manifest names, and the number is given again.
-TEST(IndexFilesTest, ARemovalThatWaitsDoesNotTakeANewFileOfTheSameName) {
+// A killed process leaves a table that no manifest lists, and its number is assigned again.
+TEST(OrderedSyncEnvTest, ARemovalThatWaitsDoesNotTakeANewFileOfTheSameName) {
   const testsupport::TemporaryDirectory directory;
   const std::string path = directory / "000053.ldb";
-  salt::IndexFiles files(directory / "", leveldb::Env::Default());
+  salt::OrderedSyncEnv files(directory / "", leveldb::Env::Default());
   for (int i = 0; i < 2000; ++i) ASSERT_TRUE(files.RemoveFile(path).ok());
   leveldb::WritableFile* file = nullptr;
   ASSERT_TRUE(files.NewWritableFile(path, &file).ok());

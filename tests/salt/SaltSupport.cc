@@ -62,7 +62,7 @@ void editKey(const std::string& path, const std::string& key, const std::string*
 std::filesystem::path newestLog(const std::string& path) {
   std::filesystem::path newest;
   for (const auto& entry : std::filesystem::directory_iterator(path)) {
-    // Their names are numbers of the same width.
+    // Names are numbers of equal width.
     if (entry.path().extension() == ".log") newest = std::max(newest, entry.path());
   }
   return newest;

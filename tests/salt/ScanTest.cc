@@ -36,7 +36,7 @@ TEST(ScanPrefix, StopsWhenToldAndCountsWhatItDid) {
   ASSERT_TRUE(addZone(*index, 1, 1, "alpha beta gamma", {0, 6}));
   ASSERT_TRUE(addZone(*index, 2, 1, "alpha beta delta", {}));
   index.reset();
-  // The second suffix of the page is known for 12 bytes only.
+  // The page has only 12 bytes of the second suffix.
   salttest::writePage(directory / "i", 1, "alpha beta delta",
                       {{2, 0, 1, 0, {}}, {1, 0, 1, 11, {'g', 'a'}}});
   index = loadIndex(directory / "i");
@@ -62,8 +62,8 @@ TEST(ScanPrefix, StopsWhenToldAndCountsWhatItDid) {
   EXPECT_TRUE(index->ScanPrefix("missing", {}));
 }
 
-// A new shard without pages, and a first byte that only the neighbours of a shard have.
-TEST(ScanPrefix, PassesOverShardsWithoutPages) {
+// A new shard without pages, and a first byte that occurs only in the neighbours of a shard.
+TEST(ScanPrefix, SkipsShardsWithoutPages) {
   const TemporaryDirectory directory;
   auto index = newIndex(directory / "i");
   ASSERT_TRUE(addZone(*index, 1, 1, "word", {}));
@@ -78,7 +78,7 @@ TEST(ScanPrefix, PassesOverShardsWithoutPages) {
   EXPECT_THAT(scan(*index, "wz"), ElementsAre());
 }
 
-TEST(ScanPrefix, RunsBesideAddZone) {
+TEST(ScanPrefix, RunsConcurrentlyWithAddZone) {
   const TemporaryDirectory directory;
   const auto index = newIndex(directory / "i");
   std::atomic<uint32_t> added{0};
@@ -107,10 +107,10 @@ TEST(Suffix, DerivesTheNextFromThePageEntry) {
     std::string known;
     bool full;
   } cases[] = {
-      {{1, 0, 1, 3, {'x', 'y'}}, "abcxy", false},  // may go on
+      {{1, 0, 1, 3, {'x', 'y'}}, "abcxy", false},  // may be longer
       {{1, 0, 1, 3, {'x', 0}}, "abcx", true},
       {{1, 0, 1, 3, {0, 0}}, "abc", true},
-      {{1, 0, 1, 0, {0, 0}}, "", false},  // nothing known is fetched
+      {{1, 0, 1, 0, {0, 0}}, "", false},  // nothing is known, so it is fetched
   };
   for (const auto& c : cases) {
     salt::Suffix suffix(index, {});
@@ -127,7 +127,7 @@ TEST(Suffix, DerivesTheNextFromThePageEntry) {
       "\x01"
       "abcde\0\x01\0\x01"s);
   suffix.fromNextMeta({1, 0, 1, 1, {'b', 'c'}});
-  suffix.fromNextMeta({1, 0, 1, 4, {'e', 0}});  // common with more than is known: nothing changes
+  suffix.fromNextMeta({1, 0, 1, 4, {'e', 0}});  // longer common prefix than the known text: ignored
   EXPECT_EQ(suffix.knownText(), "abc");
   EXPECT_FALSE(suffix.full);
   suffix.fetch();
@@ -152,6 +152,6 @@ TEST(Suffix, CorruptDataEndsTheProcess) {
   suffix.fromKey("\0abcd\0\1\1\1"s);
   EXPECT_DEATH(suffix.fromNextMeta({1, 0, 1, 5, {}}), "full && meta\\.lcp > size");
   EXPECT_DEATH(suffix.fromNextMeta({1, 0, 1, 4, {'a', 'b'}}), "size <= idx\\.op\\.MaxMatchLen");
-  suffix.fromNextMeta({1, 0, 1, 0, {'a', 'b'}});  // its zone is not there
+  suffix.fromNextMeta({1, 0, 1, 0, {'a', 'b'}});  // its zone is absent
   EXPECT_DEATH(suffix.fetch(), "size\\(\\) >= size");
 }

@@ -50,7 +50,7 @@ std::vector<std::string> search(const salt::Index& index, std::vector<Term> term
 
 using Texts = std::map<std::pair<uint32_t, uint16_t>, std::string>;
 
-// Evaluates every document against every term, by the texts alone.
+// Evaluates every document against every term, using only the texts.
 class Oracle {
  public:
   explicit Oracle(const Texts& texts) : _texts(texts) {}
@@ -103,8 +103,8 @@ class Oracle {
   const Texts& _texts;
 };
 
-// Scores are powers of two, so that products are exact, and no match scores below the default, so
-// that a document dropped early cannot come back better.
+// Scores are powers of two, so products are exact, and no match scores below the default, so a
+// document dropped early cannot become better later.
 Term randomTerm(std::mt19937& random) {
   Term made;
   for (size_t i = 1 + random() % 3; i > 0; --i) {
@@ -126,7 +126,7 @@ Term randomTerm(std::mt19937& random) {
 
 }  // namespace
 
-TEST(Search, GivesWhatAnExhaustiveEvaluationGives) {
+TEST(Search, AgreesWithAnExhaustiveEvaluation) {
   std::mt19937 random(17);
   const TemporaryDirectory directory;
   const auto index = newIndex(directory / "i");
@@ -181,7 +181,7 @@ TEST_F(SearchSmall, ThresholdZeroKeepsWhatAnyTermMatched) {
   EXPECT_THAT(search(*index, {term({"apple"}, {1}), term({"pear"}, {0.5})}, {1, 100, 0}),
               ElementsAre("2:0.5"));
   EXPECT_THAT(search(*index, {term({"apple"}, {1})}, {0, 100, 0}), ElementsAre());
-  // A document that nothing matches stays out, whatever the default.
+  // A document without a match is not a result, whatever the default.
   EXPECT_THAT(search(*index, {term({"plum"}, {1}, 1)}, {10, 100, 0.5}), ElementsAre("4:1"));
 }
 
@@ -191,7 +191,7 @@ TEST_F(SearchSmall, ALaterTermThatNothingCanMatchPrunesAllButAtThresholdZero) {
   EXPECT_THAT(search(*index, terms), ElementsAre("3:0", "2:0", "1:0"));
 }
 
-// More than are scanned for ahead of the others.
+// More than are scanned before the others.
 TEST_F(SearchSmall, EachOfManyRequiredTermsIsRequired) {
   std::vector<Term> terms(20, term({"apple"}, {1}));
   terms.insert(terms.begin(), term({"pear"}, {2}, 0.5));
@@ -220,7 +220,7 @@ TEST_F(SearchSmall, MinTakesTheLowestTokenOfADocument) {
   EXPECT_THAT(search(*index, {both}), ElementsAre("3:1", "2:0.5", "1:0.5"));
 }
 
-TEST_F(SearchSmall, MalformedTermsAreSkippedWithALine) {
+TEST_F(SearchSmall, MalformedTermsAreSkippedWithALogLine) {
   const Term apple = term({"apple"}, {1});
   const auto zones = [&apple](uint16_t count) {
     std::vector<uint16_t> numbers;
@@ -249,15 +249,15 @@ TEST_F(SearchSmall, SuffixesAreLimitedPerTermAndFoundIsSet) {
   std::vector<Term> terms{term({"apple", "pear", "none"}, {1, 1, 1}), term({"none"}, {1}, 1)};
   const auto results = saltsearch::Search(*index, terms, {10, 2, 0});
   EXPECT_THAT(printed(results), ElementsAre("3:1", "2:1"));  // "apple " before "apple pear "
-  EXPECT_EQ(index->GetMetrics().ScanResults, 4u);  // two taken, one refused for each token
+  EXPECT_EQ(index->GetMetrics().ScanResults, 4u);  // two taken, and one rejected per token
   EXPECT_TRUE(terms[0].found);
   EXPECT_FALSE(terms[1].found);
   EXPECT_EQ(results[0].tokenScore, -1.0);
   EXPECT_EQ(results[0].zoneMask, 0u);
 }
 
-// Places come in runs; the limit holds within one and over several.
-TEST(SearchLimit, HoldsWithinAndOverRuns) {
+// Places come in batches; the limit applies within a batch and across batches.
+TEST(SearchLimit, AppliesWithinAndAcrossBatches) {
   const TemporaryDirectory directory;
   const auto index = salttest::newIndex(directory / "index");
   for (uint32_t docID = 1; docID <= 700; ++docID) {

@@ -25,7 +25,7 @@ namespace {
 
 using Counts = std::map<std::string, double>;
 
-// Zones of random words, with the weight of each word as counted by itself.
+// Adds zones of random words, and returns the weight of each word, counted separately.
 Counts fill(salt::Index& index, std::mt19937& random, bool skewed) {
   Counts counts;
   std::uniform_real_distribution<double> exponent(0, std::log(5000));
@@ -78,11 +78,11 @@ TEST(TopTokens, CountsExactlyWhatTheSummaryGuarantees) {
   EXPECT_GT(certain, 4000U);
 }
 
-TEST(TopTokens, LeavesOutTheDeletedAndTheVeryLong) {
+TEST(TopTokens, SkipsDeletedDocumentsAndVeryLongTokens) {
   const testsupport::TemporaryDirectory directory;
   const auto index = salttest::newIndex(directory / "i");
   addZone(*index, 1, 1, "b a  b a");
-  addZone(*index, 2, 1, " a " + std::string(saltsearch::kMostTokenBytes + 1, 'x'));
+  addZone(*index, 2, 1, " a " + std::string(saltsearch::kMaxTokenBytes + 1, 'x'));
   addZone(*index, 3, 1, "gone gone");
   addZone(*index, 4, 1, " ");
   ASSERT_TRUE(index->DeleteDoc(3));
@@ -123,10 +123,10 @@ TEST(TopTokens, TakesNoMoreMemoryForMoreTokens) {
   };
   ASSERT_EQ(TopKTokens(*index, 100, ZoneScoreDefault, TokenizeSpace, watch).size(), 100U);
   if (before == 0) GTEST_SKIP() << "this allocator does not count";
-  EXPECT_LT(most, before + 2'000'000);  // all of them would be 30 million
+  EXPECT_LT(most, before + 2'000'000);  // all tokens would take 30 million
 }
 
-TEST(TopTokens, SplittersTellWhereWordsBegin) {
+TEST(TopTokens, SplittersFindTheStartsOfWords) {
   const struct {
     const char* text;
     std::vector<uint32_t> space;

@@ -49,7 +49,7 @@ void vacuum(Index& index) {
   while (index.GetMetrics().VacuumInProgress) std::this_thread::yield();
 }
 
-TEST(Vacuum, WhatIsRememberedOfThePagesTellsWhetherALimitHolds) {
+TEST(Vacuum, CachedScansDecideWhetherALimitHolds) {
   const TemporaryDirectory directory;
   const auto index = newIndex(directory / "index", smallOptions(100));
   Model model(index->GetOptions());
@@ -68,11 +68,11 @@ TEST(Vacuum, WhatIsRememberedOfThePagesTellsWhetherALimitHolds) {
   EXPECT_EQ(places(10), 10u);
   EXPECT_EQ(places(9), std::nullopt);
   addDocs(*index, &model, 11, 11);
-  EXPECT_EQ(places(14), std::nullopt);  // all 5 hot ones might match
+  EXPECT_EQ(places(14), std::nullopt);  // all 5 hot suffixes might match
   EXPECT_EQ(places(15), 11u);
 }
 
-TEST(Vacuum, MovesTheHotPartIntoOneShardAfterTheOther) {
+TEST(Vacuum, MergesTheHotPartIntoTheShardsInTurn) {
   const TemporaryDirectory directory;
   const std::string path = directory / "index";
   auto index = newIndex(path, smallOptions(100));
@@ -80,13 +80,13 @@ TEST(Vacuum, MovesTheHotPartIntoOneShardAfterTheOther) {
   struct Round {
     uint64_t shards, lastShardSuffixes, lastShardVacuumed;
   };
-  // 50 suffixes a round against 8 a shard: each round fills a shard, then they take turns.
+  // 50 suffixes per round and 8 per shard: each round fills a shard; then shards take turns.
   const Round rounds[] = {{1, 50, 1}, {2, 50, 2}, {2, 50, 1}, {2, 100, 2}};
   uint64_t vacuums = 0;
   uint32_t docID = 1;
   for (const Round& round : rounds) {
     addDocs(*index, &model, docID, docID + 8);
-    index->Vacuum();  // 45 are less than half of what may be hot
+    index->Vacuum();  // 45 are less than half of MaxHotSuffixes
     EXPECT_EQ(index->GetMetrics().HotSuffixes, 45u);
     addDocs(*index, &model, docID + 9, docID + 9);
     ASSERT_TRUE(index->DeleteDoc(docID) && model.deleteDoc(docID));  // merged like any other
@@ -107,8 +107,9 @@ TEST(Vacuum, MovesTheHotPartIntoOneShardAfterTheOther) {
   }
 }
 
-// Each scan finds what was added before it exactly once, wherever the merges have it at the moment.
-TEST(Vacuum, ScansAndAddsGoOnBesideMerges) {
+// Each scan finds everything added before it exactly once, wherever the merges have it at the
+// moment.
+TEST(Vacuum, ScansAndAddsRunDuringMerges) {
   constexpr uint32_t kDocs = 100;
   constexpr uint64_t kVacuums = 4;
   const TemporaryDirectory directory;
@@ -121,7 +122,7 @@ TEST(Vacuum, ScansAndAddsGoOnBesideMerges) {
       for (bool last = false; !last;) {
         last = ended;
         const uint32_t before = added;
-        auto found = scan(*index, "t");  // two of each document
+        auto found = scan(*index, "t");  // two per document
         std::sort(found.begin(), found.end());
         EXPECT_EQ(std::adjacent_find(found.begin(), found.end()), found.end());
         EXPECT_GE(found.size(), 2 * before);
@@ -142,8 +143,8 @@ TEST(Vacuum, ScansAndAddsGoOnBesideMerges) {
   EXPECT_EQ(difference(salttest::readKeys(directory / "index"), &model), "");
 }
 
-// With the first batch of a merge or a later one, into a new shard or into one with pages.
-// The merge is long enough to give way more than once.
+// During the first batch of a merge or a later one, into a new shard or one with pages. The merge
+// is long enough to give way more than once.
 TEST(Vacuum, EndsWhileAScanGoesOn) {
   constexpr uint32_t kDocs = 4000;
   const TemporaryDirectory directory;
@@ -177,7 +178,7 @@ TEST(Vacuum, AFailedWriteEndsAMergeAndLosesNothing) {
       vacuum(*index);
       add30Docs();
     }
-    index.reset();  // with all that it does in the background, a new log among it
+    index.reset();  // includes its background work, such as a new log
     index = loadIndex(path);
     ASSERT_TRUE(index);
     {
@@ -205,8 +206,8 @@ TEST(Vacuum, AFailedWriteEndsAMergeAndLosesNothing) {
 
 }  // namespace
 
-// A merge of a large hot part would rather wait for more.
-TEST(Vacuum, OneThatIsAskedForBeginsAtOnceAndCompactionFollowsIt) {
+// A merge of a large hot part would otherwise wait for more.
+TEST(Vacuum, ARequestedMergeBeginsAtOnceAndIsFollowedByCompaction) {
   const TemporaryDirectory directory;
   Index::Options options;
   options.MaxHotSuffixes = 100000;

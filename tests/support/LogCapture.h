@@ -8,7 +8,7 @@
 
 namespace testsupport {
 
-// Collects every log message of the process, of all levels, for as long as it lives. Any thread may
+// Captures every log message of the process, at all levels, during its lifetime. Any thread may
 // log.
 class LogCapture {
  public:
@@ -20,7 +20,7 @@ class LogCapture {
   // "LEVEL CATEGORY: MESSAGE", in order.
   [[nodiscard]] std::vector<std::string> lines() const;
 
-  // True when some line equals, or holds, `text`.
+  // True if some line equals (`has`) or contains the text.
   [[nodiscard]] bool has(const std::string& line) const;
   [[nodiscard]] bool contains(const std::string& text) const;
   [[nodiscard]] size_t count(const std::string& text) const;

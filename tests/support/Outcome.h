@@ -7,11 +7,10 @@
 
 namespace testsupport {
 
-// No value is success.
+// Nullopt means success.
 using Outcome = std::optional<TLError>;
 
-// Calls start(completion), which starts an operation that completes on whatever thread, and waits
-// for its outcome.
+// Calls start(completion), which starts an asynchronous operation, and waits for its outcome.
 template <typename Start>
 Outcome outcomeOf(const Start& start) {
   std::promise<Outcome> promise;

@@ -11,10 +11,10 @@
 #include <string>
 #include <string_view>
 
-// D-Bus by hand, for peers that do not keep to it.
+// Hand-made D-Bus messages, for peers that violate the protocol.
 namespace testsupport {
 
-// A socket that is connected to `path`; negative where nobody takes it.
+// A socket connected to `path`; negative if nobody accepts.
 inline int connectTo(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -38,14 +38,14 @@ inline std::string authenticationLines() {
   return text + "\r\n";
 }
 
-// What comes next, empty at the end.
+// The next bytes received; empty at the end.
 inline std::string receiveSome(int descriptor) {
   char buffer[4096];
   const ssize_t size = recv(descriptor, buffer, sizeof buffer, 0);
   return {buffer, static_cast<size_t>(std::max<ssize_t>(size, 0))};
 }
 
-// False when the other side has gone.
+// False when the other side has closed.
 inline bool sendAll(int descriptor, std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t size = send(descriptor, bytes.data(), bytes.size(), MSG_NOSIGNAL);
@@ -61,7 +61,7 @@ inline bool authenticate(int descriptor) {
          sendAll(descriptor, "BEGIN\r\n");
 }
 
-// The content of a message, little-endian, value by value.
+// The body of a message, little-endian, value by value.
 class RawBody {
  public:
   RawBody& number32(uint32_t value) { return align(4).little(value, 4); }
@@ -76,7 +76,7 @@ class RawBody {
     _bytes.append(value);
     return *this;
   }
-  // An array of what `append` adds for each element; the elements begin at multiples of 4.
+  // An array; `append` adds each element, which begins at a multiple of 4.
   template <typename Elements, typename Append>
   RawBody& array(const Elements& elements, const Append& append) {
     number32(0);

@@ -5,7 +5,7 @@
 
 namespace testsupport {
 
-// Where the seeds of random tests begin: TALLOW_TEST_SEED, 1 unless set.
+// The first seed of random tests: TALLOW_TEST_SEED, 1 if not set.
 inline uint32_t firstSeed() {
   const char* text = std::getenv("TALLOW_TEST_SEED");
   return text != nullptr ? static_cast<uint32_t>(std::strtoul(text, nullptr, 10)) : 1;

@@ -4,7 +4,7 @@
 
 namespace testsupport {
 
-// A fresh directory that is gone, with all in it, at the end of the test.
+// A new directory, removed with its contents at the end of the test.
 class TemporaryDirectory {
  public:
   TemporaryDirectory();

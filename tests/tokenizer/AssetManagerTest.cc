@@ -9,7 +9,7 @@ using platform::Locale;
 
 namespace {
 
-// Records each call; data appears for a language once it was fetched, if `fetchable` has it.
+// Records each call. After a download a language has data if it is in `fetchable`.
 class FakeAssets : public LexemonAssets {
  public:
   std::vector<std::string> EmbeddedLanguages() override { return {"en", "fr"}; }
@@ -56,7 +56,7 @@ TEST(AssetManager, AsksOncePerLanguage) {
   EXPECT_EQ(lexemon::resources::DataRegistrationService::dataPathForLanguage("xx"), std::nullopt);
 }
 
-TEST(AssetManager, WaitsForAFetchWithinATimeout) {
+TEST(AssetManager, WaitsForADownloadUntilTheTimeout) {
   FakeAssets assets;
   assets.fetchable = {"aa"};
   TLLexemonAssetManager manager(assets);
@@ -79,7 +79,7 @@ TEST(AssetManager, WaitsForAFetchWithinATimeout) {
   EXPECT_TRUE(log.contains("error" + category + "Asset download timed out with error: "));
 }
 
-TEST(AssetManager, PicksALocaleThatIsServed) {
+TEST(AssetManager, PicksASupportedLocale) {
   FakeAssets assets;
   TLLexemonAssetManager manager(assets);
   EXPECT_EQ(tokenizer::bestLexemonLocaleFrom("fr_CA", manager), "fr_CA");
@@ -93,7 +93,7 @@ TEST(AssetManager, PicksALocaleThatIsServed) {
   EXPECT_NE(tokenizer::NewFastLexemonTokenizer(bestLexemonLocale()), nullptr);
 }
 
-TEST(AssetManager, SystemServiceFetchesNothing) {
+TEST(AssetManager, SystemServiceDownloadsNothing) {
   TLLexemonAssetManager manager(LexemonAssets::systemService());
   for (const char* language : {"en", "de", "ja", "th"}) {
     EXPECT_TRUE(manager.isLanguageSupported(language, 0)) << language;

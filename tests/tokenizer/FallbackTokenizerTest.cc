@@ -2,11 +2,11 @@
 
 #include "tokenizer/TLFallbackTokenizer.h"
 
-TEST(FallbackTokenizer, LowersAndCuts) {
+TEST(FallbackTokenizer, LowercasesAndSplits) {
   const struct {
     TLString text;
-    TLString whole;  // cut at separators
-    TLString split;  // and between digits and others
+    TLString whole;  // split at separators
+    TLString split;  // split also between digits and others
   } kCases[] = {
       {u"", u"", u""},
       {u"?! \t\u3000\u0001", u"", u""},
@@ -18,7 +18,7 @@ TEST(FallbackTokenizer, LowersAndCuts) {
       {u"x86y a1b2 abc123def", u"x86y a1b2 abc123def ", u"x86y a1b2 abc123def "},
       {u"12 34", u"12 34 ", u"12 34 "},
       {u"1\u0967", u"1\u0967 ", u"1 \u0967 "},
-      // A character outside the first plane is two units, of which neither separates.
+      // A character outside the basic plane is two units, neither of which separates.
       {u"\xD83D\xDE00!\xD800", u"\xD83D\xDE00 \xD800 ", u"\xD83D\xDE00 \xD800 "},
       {u"\u0130\u00C4\u03A3", u"i\u0307\u00E4\u03C2 ", u"i\u0307\u00E4\u03C2 "},
   };
@@ -32,9 +32,9 @@ TEST(FallbackTokenizer, LowersAndCuts) {
   EXPECT_TRUE(whole.CleanTokens(u"?!").empty());
 }
 
-TEST(FallbackTokenizer, WhatIsTooLongIsCutFirst) {
-  const size_t most = TLFallbackTokenizer::kMaximumTextSize;
-  const TLString fits(most, u'\u0130');  // of which lower case is longer
+TEST(FallbackTokenizer, TruncatesLongTextFirst) {
+  const size_t most = TLFallbackTokenizer::kMaxTextUnits;
+  const TLString fits(most, u'\u0130');  // lower case is longer
   EXPECT_EQ(TLFallbackTokenizer::getObject().CleanText(fits).size(), 2 * most + 1);
   EXPECT_EQ(TLFallbackTokenizer::getObject().CleanText(TLString(most, u'x') + u'y'),
             TLString(most, u'x') + u' ');

@@ -24,7 +24,7 @@ TextForm textForm(const Tokenizer& tokenizer, TLStringView text) {
   return form;
 }
 
-// Empty when `form` is "word blank word blank", with an offset for each word and no NUL.
+// Empty if `form` is "word space word space" with one offset per word and no NUL.
 std::string brokenRule(const TextForm& form) {
   if (form.text.find('\0') != std::string::npos) return "a NUL";
   if (!platform::isValidUTF8(form.text)) return "invalid UTF-8";
@@ -39,7 +39,7 @@ std::string brokenRule(const TextForm& form) {
   return start == form.text.size() ? "" : "text without offset";
 }
 
-// The forms as GoogleTest shows them.
+// How GoogleTest prints a text form.
 void PrintTo(const TextForm& form, std::ostream* out) {
   *out << '"' << form.text << '"' << testing::PrintToString(form.offsets);
 }
@@ -59,7 +59,7 @@ class LexemonTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(LexemonTest, CutsAndCleans) {
+TEST_F(LexemonTest, SplitsAndCleans) {
   const struct {
     TLStringView text;
     std::string words;
@@ -118,7 +118,8 @@ TEST_F(LexemonTest, ListFormHasTheSameWordsAndBothAppend) {
   }
 }
 
-// The table and the stretches of the fast form against the Unicode rules over the whole text.
+// The table and the stretches of the fast form must give the same as the Unicode rules over the
+// whole text.
 TEST_F(LexemonTest, FastFormEqualsTheUnicodeRulesOnRandomText) {
   const std::vector<TLString> alphabets = {
       u"abSs 019.,;:'_-\n",
@@ -130,7 +131,7 @@ TEST_F(LexemonTest, FastFormEqualsTheUnicodeRulesOnRandomText) {
   std::mt19937 random(11);
   for (int round = 0; round < 30000; ++round) {
     TLString text;
-    // Now and then a text that fills several stretches of mixed text.
+    // Sometimes long enough for several stretches of mixed text.
     for (size_t i = round % 1000 == 0 ? 12000 : random() % 60; i > 0; --i) {
       const TLString& alphabet = alphabets[random() % 8 == 0 ? random() % alphabets.size()
                                                              : static_cast<size_t>(round) % 5];
@@ -173,10 +174,9 @@ TEST(Lexemon, EachLocaleAgreesWithTheTable) {
   }
 }
 
-// Each of these is one run without a blank; a step that is not linear shows as a test that does not
-// end.
+// Each of these is one run without a space; if a step is not linear, the test does not end.
 TEST_F(LexemonTest, LongestDocumentsOfOneKind) {
-  constexpr size_t kLongest = 2097151;
+  constexpr size_t kMaxUnits = 2097151;
   const struct {
     TLStringView first;
     TLStringView unit;
@@ -190,23 +190,23 @@ TEST_F(LexemonTest, LongestDocumentsOfOneKind) {
       {u"\u30AB", u"\uFF9E\u0301", 1},
       {u"\u0F40", u"\u0F73\u0F71", 1},
       {u"", u"\u1161", 1},
-      {u"", u"\u6F22", kLongest},
+      {u"", u"\u6F22", kMaxUnits},
       {u"", u"\U0001F600", 0},
       {u"", u"\U0001F468\u200D", 0},
       {u"a", u"\u200C", 1},
       {u"", u"1:", 1},
       {u"\u00E9", u"1:", 1},
       {u"", u"_", 0},
-      {u"", u"\u00E9 ", kLongest / 2},
-      {u"", u"1\u202F", (kLongest + 1) / 2 - 1},
+      {u"", u"\u00E9 ", kMaxUnits / 2},
+      {u"", u"1\u202F", (kMaxUnits + 1) / 2 - 1},
   };
   for (const auto& each : cases) {
-    const TLString text = TLString(each.first) + repeated(each.unit, kLongest - each.first.size());
+    const TLString text = TLString(each.first) + repeated(each.unit, kMaxUnits - each.first.size());
     const TextForm form = textForm(*fast, text);
     EXPECT_EQ(brokenRule(form), "") << platform::toUTF8(each.unit);
     EXPECT_EQ(form.offsets.size(), each.words) << platform::toUTF8(each.unit);
   }
-  EXPECT_EQ(textForm(*fast, repeated(u"a", kLongest)).text.size(), kLongest + 1);
+  EXPECT_EQ(textForm(*fast, repeated(u"a", kMaxUnits)).text.size(), kMaxUnits + 1);
 }
 
 TEST_F(LexemonTest, ManyThreadsShareOneTokenizer) {
@@ -228,7 +228,7 @@ TEST_F(LexemonTest, ManyThreadsShareOneTokenizer) {
   for (const TextForm& form : forms) EXPECT_EQ(form, expected);
 }
 
-TEST(Factories, LogAndRefuseWhatIsNoLocale) {
+TEST(Factories, RefuseAnInvalidLocaleWithALogLine) {
   testsupport::LogCapture log;
   EXPECT_NE(tokenizer::NewLexemonTokenizer("de_DE"), nullptr);
   EXPECT_NE(tokenizer::NewFastLexemonTokenizer("de_DE"), nullptr);
@@ -247,7 +247,7 @@ TEST(Factories, LogAndRefuseWhatIsNoLocale) {
   }
 }
 
-TEST(SpaceTokenizer, KeepsTheTextAndAllButOneBlank) {
+TEST(SpaceTokenizer, KeepsTheTextAndAllButOneSpace) {
   const auto tokenizer = tokenizer::NewSpaceTokenizer();
   const struct {
     TLStringView text;

@@ -25,7 +25,7 @@ class DateRangeTest : public testing::TestWithParam<const char*> {
     icu::TimeZone::adoptDefault(icu::TimeZone::createTimeZone(GetParam()));
   }
 
-  // The local day of a time as text.
+  // The local date of a time as text.
   static std::string dayOf(double time, const char* format = "%Y-%m-%d") {
     const auto seconds = static_cast<time_t>(time);
     tm parts{};
@@ -44,8 +44,8 @@ INSTANTIATE_TEST_SUITE_P(Zones, DateRangeTest,
                          testing::Values("UTC", "Europe/Berlin", "America/New_York",
                                          "Pacific/Auckland"));
 
-// A time is within a year, month or day exactly if its local date, as text, begins with its name.
-TEST_P(DateRangeTest, PeriodsHoldWhatTheirNamesBegin) {
+// A time is in a year, month or day exactly if its local date, as text, begins with that name.
+TEST_P(DateRangeTest, PeriodsContainTheDatesThatBeginWithTheirNames) {
   std::mt19937 random(testsupport::firstSeed());
   std::uniform_real_distribution<double> times(0, 2e9);
   for (int i = 0; i < 3000; ++i) {
@@ -69,7 +69,7 @@ TEST_P(DateRangeTest, DaysCountFromToday) {
     const auto period = periodNamed(name, now);
     return period ? dayOf(*period->from) + ' ' + dayOf(*period->until - 1) : "none";
   };
-  const double noon = kNow + 4 * 3600;  // the same day in all zones but the last
+  const double noon = kNow + 4 * 3600;  // the same date in all zones but the last
   const bool far = std::string(GetParam()) == "Pacific/Auckland";
   const double now = far ? kNow : noon;
   EXPECT_EQ(day("today", now), "2024-01-08 2024-01-08");
@@ -89,7 +89,7 @@ TEST_P(DateRangeTest, DaysCountFromToday) {
             (DateRange{periodNamed("2010-03", now)->from, periodNamed("2011", now)->until}));
 }
 
-TEST_P(DateRangeTest, WhatIsNoDateIsNone) {
+TEST_P(DateRangeTest, RejectsInvalidDates) {
   for (const char* text :
        {"", "x", "10", "20100", "0000", "2010-13", "2010-00", "2010-02-29", "2010-04-31", "2010-1-",
         "2010-01-01-01", "-2010", "3", "w", "3x", "99999999d", "3000y", "today2", "2010 "}) {

@@ -66,8 +66,8 @@ TEST_F(SyntaxTest, OnlyWordsArePlain) {
   }
 }
 
-// Nothing that was typed is lost, and there is a word about it.
-TEST_F(SyntaxTest, WhatCannotBeReadIsTakenAsWords) {
+// Nothing that was typed is lost, and a remark explains it.
+TEST_F(SyntaxTest, InvalidSyntaxIsTakenAsWords) {
   const struct {
     const char* text;
     const char* tree;

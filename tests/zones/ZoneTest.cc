@@ -15,7 +15,7 @@ using enum TLAttributeKey;
 
 namespace {
 
-// Keeps the user defaults of the machine out of the scores.
+// Makes the scores independent of the user defaults of the machine.
 class EmptyDefaults : public testing::Environment {
  public:
   void SetUp() override { setenv("STATE_DIRECTORY", _directory.path().c_str(), 1); }

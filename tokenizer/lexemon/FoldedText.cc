@@ -18,17 +18,17 @@ namespace {
 
 constexpr char16_t kFullwidthColon = 0xFF1A;
 
-constexpr int32_t kMaximumMarks = 30;
+constexpr int32_t kMaxMarks = 30;
 
 // A piece ends at the first normalization boundary after the first bound, at worst at the second
 // bound. No code point grows to more than 18 units.
 constexpr int32_t kPieceUnits = 256;
-constexpr int32_t kMaximumPieceUnits = 512;
-constexpr int32_t kMaximumGrowth = 18;
+constexpr int32_t kMaxPieceUnits = 512;
+constexpr int32_t kMaxGrowth = 18;
 
 // Iterators have caches that grow with the longest text between two boundaries; after a longer text
 // they are discarded.
-constexpr size_t kMaximumKeptText = size_t{1} << 16;
+constexpr size_t kMaxKeptTextUnits = size_t{1} << 16;
 
 struct BreakIteratorCloser {
   void operator()(UBreakIterator* iterator) const { ubrk_close(iterator); }
@@ -51,8 +51,8 @@ struct Workspace {
   std::string locale;
   std::unique_ptr<UBreakIterator, BreakIteratorCloser> iterator;
   size_t longestText = 0;
-  std::array<char16_t, kMaximumPieceUnits + 2> raw;
-  std::array<char16_t, size_t{kMaximumPieceUnits + 2} * kMaximumGrowth> folded;
+  std::array<char16_t, kMaxPieceUnits + 2> raw;
+  std::array<char16_t, size_t{kMaxPieceUnits + 2} * kMaxGrowth> folded;
 };
 
 namespace {
@@ -74,7 +74,7 @@ WorkspaceLease::WorkspaceLease(const std::string& locale) : _workspace(std::move
 }
 
 WorkspaceLease::~WorkspaceLease() {
-  if (_workspace->longestText <= kMaximumKeptText) keptWorkspace() = std::move(_workspace);
+  if (_workspace->longestText <= kMaxKeptTextUnits) keptWorkspace() = std::move(_workspace);
 }
 
 FoldedText::FoldedText(TLStringView text, Workspace& workspace)
@@ -144,7 +144,7 @@ bool FoldedText::isJoiningColon(int32_t index) const {
 
 void FoldedText::foldPiece() {
   int32_t length = 0;
-  while (_position < _wordEnd && length < kMaximumPieceUnits) {
+  while (_position < _wordEnd && length < kMaxPieceUnits) {
     int32_t next = _position;
     UChar32 c;
     U16_NEXT(_text.data(), next, _wordEnd, c);
@@ -152,7 +152,7 @@ void FoldedText::foldPiece() {
     _position = next;
     if (u_hasBinaryProperty(c, UCHAR_DEFAULT_IGNORABLE_CODE_POINT)) continue;
     _marks = isMark(c) ? _marks + 1 : 0;
-    if (_marks <= kMaximumMarks) {
+    if (_marks <= kMaxMarks) {
       U16_APPEND_UNSAFE(_workspace.raw.data(), length, c);
     }
   }

@@ -1,6 +1,6 @@
-// Runs the daemon while single system calls fail or it is killed in front of them, and while
-// descriptors, threads or address space run out. It must go on answering or end in order, and after
-// a restart everything that was acknowledged must be there exactly once. Ends with 1 at the first
+// Runs the daemon while single system calls fail or it is killed before them, and while
+// descriptors, threads or address space run out. It must continue to answer or end in order, and
+// after a restart everything acknowledged must be there exactly once. Exits with 1 at the first
 // fault.
 #include <fmt/format.h>
 #include <sys/resource.h>
@@ -40,16 +40,15 @@ constexpr const char* kUsage =
 
 constexpr const char* kClient = "fault driver";
 constexpr const char* kClass = "default";
-constexpr int kBefore = 60;  // mails that are there before the daemon under test starts
+constexpr int kBefore = 60;  // mails indexed before the daemon under test starts
 constexpr int kBatches = 6;
 constexpr int kMailsInBatch = 25;
-constexpr int kPlaces = 50;  // of each call
-constexpr int kOtherClasses =
-    10;  // opened with each batch, where that is needed to reach all places
+constexpr int kPlaces = 50;        // faults per call
+constexpr int kOtherClasses = 10;  // classes opened with each batch, if needed to reach all calls
 constexpr std::chrono::seconds kPatience{60};
 constexpr std::chrono::seconds kLongPatience{600};
 
-// By call, the errors that it can give.
+// The possible errors of each call.
 const std::map<const char*, std::vector<int>>& errorsOfCalls() {
   static const std::map<const char*, std::vector<int>> rows{{"write", {ENOSPC, EIO, EINTR}},
                                                             {"pwrite64", {ENOSPC, EIO}},
@@ -65,7 +64,7 @@ const std::map<const char*, std::vector<int>>& errorsOfCalls() {
   return rows;
 }
 
-// Made as a class or a connection comes and goes, and seldom otherwise.
+// Calls made mainly when a class or a connection is opened or closed.
 const std::set<std::string_view> kCallsOfOpening{"rename", "unlink",    "mmap", "accept4",
                                                  "clone3", "ftruncate", "fsync"};
 
@@ -88,7 +87,7 @@ std::vector<Trial> allTrials() {
   return trials;
 }
 
-// Ends a process that does not come to an end in time.
+// Kills a process that does not end in time.
 class Watchdog {
  public:
   explicit Watchdog(pid_t process, std::chrono::seconds patience = kPatience)
@@ -101,7 +100,7 @@ class Watchdog {
           kill(process, SIGABRT);
         }) {}
 
-  // Ends the watch; false when the process had to be ended.
+  // Stops watching; false if the process had to be killed.
   [[nodiscard]] bool end() {
     _thread.request_stop();
     _thread.join();
@@ -115,7 +114,7 @@ class Watchdog {
   std::jthread _thread;
 };
 
-// Sets variables for the daemons that are started while it lives.
+// Sets environment variables for daemons started during its lifetime.
 class Environment {
  public:
   explicit Environment(std::map<std::string, std::string> variables)
@@ -162,8 +161,8 @@ class Ledger {
     for (int i = 0; i < kBefore; ++i) _present.insert(fmt::format("old{}", i));
   }
 
-  // The batch of the number: new mails, and two earlier ones that go; when it is sent again, mails
-  // alone, as deletions may have been done. True when acknowledged.
+  // Sends the batch of this number: new mails, and the deletion of two earlier ones. When sent
+  // again, mails only, because the deletions may have been done. True if acknowledged.
   bool send(SearchServiceProxy& service, int batch, bool again) {
     const auto items = testsupport::mails(fmt::format("b{}x", batch), kMailsInBatch);
     std::vector<std::string> going;
@@ -180,7 +179,7 @@ class Ledger {
     return done;
   }
 
-  // Sends a mail to each of some more classes, over a connection of its own.
+  // Sends a mail to each of several more classes, over its own connection.
   void openClasses(const std::string& runtimeDirectory) {
     for (int i = 0; i < kOtherClasses; ++i) {
       SearchServiceProxy service(runtimeDirectory);
@@ -192,7 +191,7 @@ class Ledger {
     }
   }
 
-  // What of these is wrong after a restart, or empty.
+  // What is wrong with these classes after a restart, or empty.
   [[nodiscard]] std::string checkClasses(SearchServiceProxy& service) const {
     for (const int number : _classes) {
       std::optional<TLError> error;
@@ -203,7 +202,7 @@ class Ledger {
     return "";
   }
 
-  // The first thing wrong with what a search has found, or empty.
+  // The first error in the results of a search, or empty.
   [[nodiscard]] std::string check(const std::multiset<std::string>& identifiers) const {
     for (const std::string& name : identifiers) {
       if (identifiers.count(name) != 1) return name + " is found twice";
@@ -217,8 +216,8 @@ class Ledger {
     return "";
   }
 
-  // The same of a stored state: it is the last acknowledged one or a later try, and all that it
-  // covers is found.
+  // The first error in a stored client state: it must be the last acknowledged one or a later
+  // attempt, and everything it covers must be found.
   [[nodiscard]] std::string checkState(const std::optional<std::string>& state,
                                        const std::multiset<std::string>& identifiers) const {
     if (!state) return _state < 0 ? "" : "the client state is gone";
@@ -248,7 +247,7 @@ struct Tally {
   int errors = 0;  // calls that were answered with one
 };
 
-// A state directory with mail in it, left by a daemon that was killed, so that opening recovers.
+// A state directory with mail, left by a killed daemon, so that opening it recovers.
 void makeTemplate(const std::string& directory) {
   DaemonProcess daemon(directory);
   SearchServiceProxy service(daemon.runtimeDirectory());
@@ -260,7 +259,7 @@ void makeTemplate(const std::string& directory) {
   daemon.wait();
 }
 
-// Works with a daemon under a fault until it has ended. The result is what is wrong, or empty.
+// Uses a daemon with a fault until it ends. Returns what is wrong, or empty.
 std::string work(DaemonProcess& daemon, const Trial& trial, Ledger& ledger, Tally& tally) {
   if (daemon.ready()) {
     SearchServiceProxy service(daemon.runtimeDirectory());
@@ -392,7 +391,7 @@ constexpr int kClasses = 500;
 constexpr int kConnections = 100;
 constexpr int kMailsInClass = 5;
 
-// Open connections that do nothing.
+// Opens idle connections.
 std::vector<std::unique_ptr<client::DebugServiceProxy>> connectMany(const std::string& directory) {
   std::vector<std::unique_ptr<client::DebugServiceProxy>> connections;
   for (int i = 0; i < kConnections; ++i) {
@@ -402,12 +401,12 @@ std::vector<std::unique_ptr<client::DebugServiceProxy>> connectMany(const std::s
   return connections;
 }
 
-// Asks for many classes over one connection after the other has gone; then those that were opened
-// must answer rightly, from another connection, too.
+// Asks for many classes, each over a new connection. Then those that were opened must answer
+// correctly, also over another connection.
 std::string exhaust(DaemonProcess& daemon) {
   std::set<int> open;
   std::map<int, int> refusals;  // by code
-  int lost = 0;                 // calls that met no connection
+  int lost = 0;                 // calls without a connection
   std::optional<SearchServiceProxy> service;
   for (int number = 0; number < kClasses; ++number) {
     if (!service) service.emplace(daemon.runtimeDirectory());

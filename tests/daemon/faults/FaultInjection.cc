@@ -1,13 +1,12 @@
-// Loaded into a daemon before the C library: lets one system call fail, or kills the process in
-// front of it.
+// Fault injection, preloaded into a daemon: lets one system call fail, or kills the process just
+// before it.
 //
-//   TALLOW_FAULT="CALL K ACTION"  the K-th call of CALL, counted from 1; ACTION is an errno in
-//                                 decimal, or "kill"
-//   TALLOW_FAULT_MARK=FILE        made when the fault happens
-//   TALLOW_FAULT_THREADS=N        no thread is started while N run
+//   TALLOW_FAULT="CALL K ACTION"  the K-th call of CALL, counted from 1; ACTION is a decimal errno
+//                                 or "kill"
+//   TALLOW_FAULT_MARK=FILE        created when the fault happens
+//   TALLOW_FAULT_THREADS=N        no thread is started while N are running
 //
-// Of write and mmap only calls on regular files count, so that the log, sockets and wake-ups do not
-// use up the count.
+// Of write and mmap only calls on regular files count, not those for the log, sockets and wake-ups.
 #include <dirent.h>
 #include <dlfcn.h>
 #include <fcntl.h>
@@ -48,7 +47,7 @@ Fault& fault() {
   return instance;
 }
 
-// The errno of the fault where this call is the one to fail, else 0.
+// The errno of the fault if this call must fail, otherwise 0.
 int faultAt(const char* call) {
   Fault& f = fault();
   if (f.at == 0 || std::strcmp(f.call, call) != 0 || ++f.seen != f.at) return 0;
@@ -70,7 +69,7 @@ Function* next(const char* name) {
   return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, name));
 }
 
-// False, with errno set, where the call is to fail.
+// False, with errno set, if the call must fail.
 bool passes(const char* call) {
   const int code = faultAt(call);
   if (code != 0) errno = code;

@@ -1,6 +1,6 @@
-// Clients that do not keep to the protocol, beside one that does: calls with wrong bytes,
-// connections that say nothing, that send a byte a second, that never read. The daemon must live,
-// and the good client must get right answers only. Ends with 1 otherwise.
+// Runs clients that violate the protocol next to one that does not: calls with wrong bytes,
+// connections that are silent, that send a byte per second, that never read. The daemon must
+// survive, and the good client must get only correct answers. Exits with 1 otherwise.
 #include <fmt/format.h>
 #include <sys/resource.h>
 
@@ -39,8 +39,8 @@ constexpr const char* kUsage =
     "       rpc_hostile_driver --mode flood [--seconds N] [--max-mb N]\n";
 
 constexpr const char* kGoodClass = "the class of the good client";
-constexpr const char* kBadClass = "e";  // short, so that few changed bytes make another class
-constexpr rlim_t kDescriptors = 512;    // of the daemon, which bounds its classes
+constexpr const char* kBadClass = "e";  // short, so that changing a few bytes gives another class
+constexpr rlim_t kDescriptors = 512;    // of the daemon, which limits the number of its classes
 constexpr int kMessagesOfConnection = 16;
 
 struct Options {
@@ -51,12 +51,12 @@ struct Options {
   uint32_t seed = std::random_device()();
 };
 
-// A client that keeps to everything. Each of its searches has one right answer.
+// A well-behaved client. Each of its searches has a single correct result.
 class GoodClient {
  public:
   GoodClient(const std::string& directory, int batch) : _directory(directory), _batch(batch) {}
 
-  // Until the stop or the first wrong answer, which is left in `wrong`.
+  // Runs until the stop or the first wrong answer, which is stored in `wrong`.
   void work(const std::stop_token& stop) {
     SearchServiceProxy service(_directory, rpc::Patience(5000));
     client::DebugServiceProxy debug(_directory, rpc::Patience(5000));
@@ -82,8 +82,8 @@ class GoodClient {
     }
   }
 
-  // Until its first calls on both connections have ended: before that, connections that have never
-  // made a call, and its own are among them, make room for newer ones.
+  // Waits until its first calls on both connections have ended. Until then its connections may be
+  // evicted, because they have never made a call.
   void waitUntilBegun() const { _begun.wait(); }
 
   [[nodiscard]] std::string report() const {
@@ -165,15 +165,15 @@ std::vector<Call> validCalls() {
 std::string mutated(std::string message, std::mt19937& random) {
   if (random() % 50 == 0) message.resize(random() % message.size());
   for (size_t i = random() % 6 + 1; i > 0 && !message.empty(); --i) {
-    // The header as often as the content.
+    // Changes the header as often as the content.
     const size_t range = random() % 2 == 0 ? std::min<size_t>(message.size(), 200) : message.size();
     message[random() % range] = static_cast<char>(random());
   }
   return message;
 }
 
-// Waits for room to send or for something to read, but not for long, since a peer that was lied to
-// about a length waits for the rest. False when the connection has ended.
+// Sends and receives, waiting only briefly, because a peer that was told a wrong length waits for
+// the rest. False when the connection has ended.
 bool exchange(int socket, std::string_view message) {
   while (!message.empty()) {
     const ssize_t size = send(socket, message.data(), message.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
@@ -193,7 +193,7 @@ bool exchange(int socket, std::string_view message) {
   return size < 0 && errno == EAGAIN;
 }
 
-// Sends wrong messages; the number of those sent.
+// Sends invalid messages and returns their number.
 int sendWrongMessages(const DaemonProcess& daemon, const Options& options,
                       const std::function<bool()>& goesOn) {
   std::mt19937 random(options.seed);
@@ -227,7 +227,7 @@ size_t anonymousKilobytes(pid_t process) {
   return 0;
 }
 
-// Ends the daemon in order and says what was wrong. The status of the driver.
+// Shuts the daemon down and prints what was wrong. Returns the exit status of the driver.
 int conclude(DaemonProcess& daemon, const GoodClient& good, const std::string& line) {
   daemon.signal(SIGTERM);
   const int status = daemon.wait();
@@ -257,8 +257,8 @@ int runMutations(const Options& options) {
 
 // ---- floods ----
 
-// Connections that are held and say nothing: until `stop`, then how many are still open after the
-// time that they have to authenticate.
+// Holds silent connections until `stop` and reports how many are still open after the time limit
+// for authentication.
 void holdSilentOnes(const std::string& path, int count, const std::stop_token& stop) {
   std::vector<FileDescriptor> held;
   for (int i = 0; i < count && !stop.stop_requested(); ++i) {
@@ -267,7 +267,7 @@ void holdSilentOnes(const std::string& path, int count, const std::stop_token& s
   while (!stop.stop_requested()) std::this_thread::sleep_for(milliseconds(50));
 }
 
-// Send a byte a second of a message that says to be large.
+// Each connection sends one byte per second of a message that claims to be large.
 void drip(const std::string& path, int count, const std::stop_token& stop) {
   std::vector<FileDescriptor> sockets(static_cast<size_t>(count));
   const std::string header = std::string("l\1\0\1\0\0\0\2\1\0\0\0\x60\0\0\0", 16);  // 32 MiB
@@ -283,7 +283,7 @@ void drip(const std::string& path, int count, const std::stop_token& stop) {
   }
 }
 
-// Searches for everything, again and again, and never reads an answer.
+// Repeatedly searches for everything and never reads a reply.
 void neverRead(const std::string& path, const std::string& message, const std::stop_token& stop) {
   while (!stop.stop_requested()) {
     const FileDescriptor socket(testsupport::connectTo(path));

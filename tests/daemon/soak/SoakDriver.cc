@@ -1,6 +1,6 @@
-// Clients of all kinds work with one daemon for as long as one likes, while it is locked and
-// unlocked, asked for its state, and killed and restarted. Each client knows what it may find: a
-// wrong answer ends with 1. The memory of the daemon is reported by thirds of the time.
+// Runs clients of all kinds against one daemon for any length of time, while it is locked and
+// unlocked, asked for its state, and killed and restarted. Each client knows what it must find; a
+// wrong answer exits with 1. Reports the memory of the daemon for each third of the time.
 #include <fmt/format.h>
 
 #include <atomic>
@@ -36,11 +36,11 @@ using std::chrono::seconds;
 constexpr const char* kUsage =
     "Usage: soak_driver [--seconds N] [--clients N] [--kill-every SECONDS] [--seed N]\n";
 
-// The class of a client by its number; the first is refused while the device is locked.
+// The classes of clients by number; the first is refused while the device is locked.
 constexpr const char* kClasses[] = {"SysFileProtectionComplete", "default", "other"};
 constexpr const char* kName = "soak";
-constexpr size_t kMostMails = 200;  // that one client keeps
-constexpr milliseconds kPause{20};  // at most, between two calls of a client
+constexpr size_t kMaxMails = 200;   // per client
+constexpr milliseconds kPause{20};  // maximum, between two calls of a client
 constexpr rpc::Patience kPatience{20000};
 
 struct Options {
@@ -50,7 +50,7 @@ struct Options {
   uint32_t seed = std::random_device()();
 };
 
-// What all threads count.
+// Counters of all threads.
 struct Tally {
   std::atomic<uint64_t> calls{0};
   std::atomic<uint64_t> searches{0};
@@ -59,7 +59,7 @@ struct Tally {
   std::atomic<bool> wrong{false};
 };
 
-// Waits until the time has passed or the stop is requested; false then.
+// False when a stop was requested before the time had passed.
 bool pauseFor(const std::stop_token& stop, milliseconds time) {
   std::mutex mutex;
   std::condition_variable_any wake;
@@ -68,7 +68,7 @@ bool pauseFor(const std::stop_token& stop, milliseconds time) {
   return !stop.stop_requested();
 }
 
-// One client with mails of its own in one class.
+// One client with its own mails in one class.
 class Client {
  public:
   Client(int number, const Options& options, std::string directory, Tally& tally)
@@ -110,10 +110,10 @@ class Client {
 
   void add() {
     std::vector<uint32_t> numbers;
-    for (const auto& [mail, state] : _mails) {  // what a kill left open is sent again
+    for (const auto& [mail, state] : _mails) {  // sends again what a kill interrupted
       if (state == State::unknown && numbers.size() < 20) numbers.push_back(mail);
     }
-    for (size_t i = _random() % 5 + 1; i > 0 && _mails.size() < kMostMails; --i) {
+    for (size_t i = _random() % 5 + 1; i > 0 && _mails.size() < kMaxMails; --i) {
       numbers.push_back(_next++);
       _mails[numbers.back()] = State::unknown;
     }
@@ -150,7 +150,7 @@ class Client {
         _mails[mail] = state;
       }
     }
-    while (_gone.size() > kMostMails) _gone.erase(_gone.begin());
+    while (_gone.size() > kMaxMails) _gone.erase(_gone.begin());
   }
 
   void searchOne() {
@@ -199,7 +199,7 @@ class Client {
     return error && error->domain == "com.quill.tallow.TALIndexerManager";
   }
 
-  // Counts the outcome of a call; after a failure the next has a new connection.
+  // Counts the outcome of a call; after a failure the next call reconnects.
   bool settle(bool done, const std::optional<TLError>& error) {
     if (done || !error) return done;
     if (refusedByLock(error)) {
@@ -222,7 +222,7 @@ class Client {
   uint32_t _next = 0;
 };
 
-// In kilobytes; 0 for a process that has ended.
+// In kilobytes; 0 if the process has ended.
 size_t anonymousMemory(pid_t process) {
   std::ifstream status(fmt::format("/proc/{}/status", process));
   std::string name;
@@ -233,7 +233,7 @@ size_t anonymousMemory(pid_t process) {
   return 0;
 }
 
-// The daemon and what is done to it, on the main thread.
+// Controls the daemon, on the main thread.
 class Supervisor {
  public:
   Supervisor(const Options& options, const std::string& directory)
@@ -243,7 +243,7 @@ class Supervisor {
 
   [[nodiscard]] std::string runtimeDirectory() const { return _directory + "/run"; }
 
-  // Until the end of the time or a wrong answer. False when the daemon ended by itself.
+  // Runs until the end of the time or a wrong answer. False if the daemon ended unexpectedly.
   bool supervise(const Tally& tally) {
     const auto start = Clock::now();
     auto nextKill = start + _options.killEvery;
@@ -269,7 +269,7 @@ class Supervisor {
     return true;
   }
 
-  // Ends the daemon in order; false when it did not.
+  // Shuts the daemon down; false if it fails.
   bool end() {
     _daemon->signal(SIGTERM);
     const int status = _daemon->wait();
@@ -297,7 +297,7 @@ class Supervisor {
   const std::string _directory;
   std::mt19937 _random;
   std::optional<DaemonProcess> _daemon;
-  size_t _memory[3] = {0, 0, 0};  // highest of each third, in kilobytes
+  size_t _memory[3] = {0, 0, 0};  // peak of each third, in kilobytes
   int _kills = 0;
 };
 

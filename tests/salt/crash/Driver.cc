@@ -1,6 +1,6 @@
-// Kills a process with signal 9 while it adds, deletes and merges, again and again on the same
-// database, and checks after each kill, by the keys, that every acknowledged operation is there
-// exactly once. Ends with 1 at the first fault and leaves the database where it is.
+// Kills a process with SIGKILL while it adds, deletes and merges, repeatedly on the same database,
+// and checks after each kill that the keys contain every acknowledged operation exactly once. Exits
+// with 1 at the first fault and keeps the database.
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <poll.h>
@@ -29,12 +29,12 @@ using std::chrono::microseconds;
 
 namespace {
 
-constexpr uint32_t kGenerations = 12;  // kills of one database
-constexpr size_t kMaxPlaces = 20000;   // in one database; more only makes the check slow
+constexpr uint32_t kGenerations = 12;  // kills per database
+constexpr size_t kMaxPlaces = 20000;   // per database; more would only slow down the check
 constexpr microseconds kForever = std::chrono::hours(24);
 constexpr uint64_t kLogBlock = 32768;
 
-constexpr uint64_t kMaxDiskBytes = 256 * 1024 * 1024;  // of a file system to be filled
+constexpr uint64_t kMaxDiskBytes = 256 * 1024 * 1024;  // of a file system to fill
 
 constexpr const char* kUsage =
     "Usage: salt_crash_driver [--mode kill|truncate|enospc] [--kills N] [--seed N]\n"
@@ -49,7 +49,7 @@ struct Options {
   uint64_t kills = 200;
   uint32_t seed = 1;
   Mode mode = Mode::kill;
-  std::string disk;  // a directory on a small file system of its own, which workers fill
+  std::string disk;  // a directory on its own small file system, which workers fill
   std::chrono::seconds most{86400};
 };
 
@@ -60,10 +60,10 @@ struct Tally {
   uint64_t databases = 0;
   uint64_t operations = 0;
   uint64_t failedForSpace = 0;
-  uint64_t lostTails = 0;  // databases that a cut log took something from
+  uint64_t lostTails = 0;  // databases that lost operations to a truncated log
 };
 
-// A worker and the pipe that it reports through.
+// A worker process and the pipe for its reports.
 class WorkerProcess {
  public:
   explicit WorkerProcess(const WorkerTask& task) {
@@ -94,7 +94,7 @@ class WorkerProcess {
   WorkerProcess(const WorkerProcess&) = delete;
   WorkerProcess& operator=(const WorkerProcess&) = delete;
 
-  // Waits for reports until `end` and appends them. False when the worker has ended.
+  // Appends reports until `end`. False when the worker has ended.
   bool read(Clock::time_point end, std::string* reports) const {
     const auto left = std::chrono::ceil<microseconds>(end - Clock::now());
     const timespec time{left.count() / 1'000'000, left.count() % 1'000'000 * 1000};
@@ -106,7 +106,7 @@ class WorkerProcess {
     return size > 0;
   }
 
-  // The status that it ended with; what it reported before is appended.
+  // Returns the exit status, and appends the remaining reports.
   int end(std::string* reports) const {
     kill(_pid, SIGKILL);
     while (read(Clock::now() + kForever, reports)) {
@@ -121,7 +121,7 @@ class WorkerProcess {
   int _reports = -1;
 };
 
-// One database through its kills.
+// One database through all its kills.
 class Trial {
  public:
   Trial(const Options& options, uint32_t seed, Tally* tally)
@@ -140,7 +140,8 @@ class Trial {
   }
   [[nodiscard]] const std::string& path() const { return _path; }
 
-  // Lets a worker go on where the last one was killed. The result is the first fault, or empty.
+  // Starts a worker that continues where the last one was killed. Returns the first fault, or
+  // empty.
   std::string nextGeneration() {
     WorkerTask task;
     task.path = _path;
@@ -163,8 +164,7 @@ class Trial {
   }
 
  private:
-  // Kills while the index is opened, or some time after a number of reports, or right after a write
-  // that failed.
+  // Kills during opening, or some time after a number of reports, or right after a failed write.
   int killed(const WorkerProcess& worker, std::string* reports) {
     const microseconds pause(_random() % 3000);
     const size_t quota = 1 + _random() % 80;
@@ -182,7 +182,7 @@ class Trial {
     return worker.end(reports);
   }
 
-  // Takes over what the worker says of itself.
+  // Updates the expectations from the worker's reports.
   std::string believe(const std::string& reports) {
     if (reports.empty()) ++_tally.whileOpening;
     for (const char byte : reports) {
@@ -209,10 +209,10 @@ class Trial {
     std::filesystem::resize_file(log, std::min(size, places[_random() % std::size(places)]));
   }
 
-  // Works on copies, so that the next worker is the first to open what this one left.
+  // Works on copies, so that the next worker is the first to open the database.
   std::string check(bool worked) {
     const Keys keys = readKeys(freshCopy());
-    if (keys.size() < 2 && _mode == Mode::truncate) {  // without its metrics there is no index
+    if (keys.size() < 2 && _mode == Mode::truncate) {  // without metrics there is no index
       startAnew();
       return "";
     }
@@ -235,8 +235,9 @@ class Trial {
     return copy;
   }
 
-  // Brings the model to what the keys hold: the operation after the last acknowledged may be there;
-  // after a cut, any number of the last ones may be missing. False when they hold anything else.
+  // Updates the model to what the keys contain: the operation after the last acknowledged one may
+  // be there, and after a truncation any number of the last ones may be missing. False if the keys
+  // contain anything else.
   bool catchUpWith(const Keys& keys) {
     const auto agree = [&] {
       return _model.indexingCalls == storedMetrics(keys).IndexingCalls &&
@@ -272,9 +273,9 @@ class Trial {
   Tally& _tally;
   std::mt19937 _random;
   Model _model;
-  microseconds _opening{10000};  // how long it took the last time
+  microseconds _opening{10000};  // duration of the last opening
   uint32_t _generation = 0;
-  uint32_t _next = 0;  // number of the first operation that the model has not seen
+  uint32_t _next = 0;  // number of the first operation not yet in the model
   bool _created = false;
 };
 
@@ -312,7 +313,7 @@ int worker(char** words) {
                     number(words[4]) != 0, static_cast<Shortage>(number(words[5]))});
 }
 
-// False when the words make no sense.
+// False for invalid arguments.
 bool parse(int count, char** words, Options* options) {
   for (int i = 0; i + 1 < count; i += 2) {
     const std::string_view name = words[i];
@@ -345,6 +346,7 @@ int main(int count, char** words) {
     fmt::print(stderr, "{}", kUsage);
     return 2;
   }
-  setenv("TALLOW_LOG", "fault", 0);  // refused and failed operations are what a worker expects
+  setenv("TALLOW_LOG", "fault",
+         0);  // workers log refused and failed operations, which are expected
   return drive(options);
 }

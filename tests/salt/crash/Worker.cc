@@ -15,13 +15,13 @@ namespace salttest {
 
 namespace {
 
-constexpr uint32_t kReopenings = 200;  // one in so many operations closes and opens the index first
-constexpr uint32_t kShortages = 25;    // the same for a shortage of space
+constexpr uint32_t kReopenings = 200;  // one in this many operations reopens the index first
+constexpr uint32_t kShortages = 25;    // one in this many changes the available space
 
-// While it lives, the file system of `path` has only so many bytes left.
-class FullDisk {
+// During its lifetime the file system of `path` has only this much space left.
+class DiskFiller {
  public:
-  FullDisk(const std::string& path, uint64_t room) : _ballast(ballastOf(path)) {
+  DiskFiller(const std::string& path, uint64_t room) : _ballast(ballastOf(path)) {
     const uint64_t free = platform::freeBytes(_ballast.parent_path());
     const int file = open(_ballast.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600);
     TL_ASSERT(file >= 0);
@@ -29,9 +29,9 @@ class FullDisk {
         posix_fallocate(file, 0, static_cast<off_t>(free - std::min(free, room)) + 1));
     close(file);
   }
-  ~FullDisk() { std::filesystem::remove(_ballast); }
-  FullDisk(const FullDisk&) = delete;
-  FullDisk& operator=(const FullDisk&) = delete;
+  ~DiskFiller() { std::filesystem::remove(_ballast); }
+  DiskFiller(const DiskFiller&) = delete;
+  DiskFiller& operator=(const DiskFiller&) = delete;
 
  private:
   const std::filesystem::path _ballast;
@@ -60,7 +60,7 @@ class Worker {
   [[nodiscard]] bool isShort() const { return _shortage.index() != 0; }
   void endShortage() { _shortage.emplace<std::monostate>(); }
 
-  // Without space it may fail, with space never.
+  // May fail without space, but never with it.
   void reopen() {
     _index.reset();
     _index = loadIndex(_task.path);
@@ -70,12 +70,12 @@ class Worker {
     reopen();
   }
 
-  // A file may grow a little more than the log has, enough for some operations or some batches of a
-  // merge; or less, and tables come to their limit, too.
+  // Sets a new limit. A file may grow slightly beyond the log, enough for some operations or some
+  // batches of a merge; or less, so that tables reach the limit too.
   void changeSpace() {
     if (isShort()) return endShortage();
     if (_task.shortage == Shortage::fullDisk) {
-      _shortage.emplace<FullDisk>(_task.path, _random() % 100000);
+      _shortage.emplace<DiskFiller>(_task.path, _random() % 100000);
     } else if (_task.shortage == Shortage::fileSize) {
       const uint64_t log = std::filesystem::file_size(newestLog(_task.path));
       const uint64_t sizes[] = {log + _random() % 300, log + _random() % 20000, _random() % 20000};
@@ -83,8 +83,8 @@ class Worker {
     }
   }
 
-  // Tries until it is clear that the answer has nothing to do with space. What leveldb keeps in
-  // mind of a failure is forgotten when the index is opened again.
+  // Repeats until the answer cannot depend on space. Reopening the index makes leveldb forget an
+  // earlier failure.
   bool answer(const Operation& operation) {
     while (isShort()) {
       if (carryOut(*_index, operation)) return true;
@@ -100,7 +100,7 @@ class Worker {
   const WorkerTask& _task;
   std::mt19937 _random;
   std::unique_ptr<salt::Index> _index;
-  std::variant<std::monostate, FileSizeLimit, FullDisk> _shortage;
+  std::variant<std::monostate, FileSizeLimit, DiskFiller> _shortage;
 };
 
 }  // namespace

@@ -20,7 +20,7 @@ Value oneOf(std::mt19937& random, const Value (&values)[count]) {
 
 }  // namespace
 
-// One database in eight has the sizes of a real one, the others merge all the time.
+// One database in eight has realistic sizes; the others merge all the time.
 salt::Index::Options workloadOptions(uint32_t seed, Shortage shortage) {
   std::mt19937 random = randomOf(seed, UINT32_MAX);
   salt::Index::Options op;
@@ -48,7 +48,7 @@ salt::Index::Options workloadOptions(uint32_t seed, Shortage shortage) {
 Operation workloadOperation(uint32_t seed, uint32_t number) {
   std::mt19937 random = randomOf(seed, number);
   auto dice = random() % 40;
-  if (dice == 0 && number > 0) {  // the same once more, mostly a duplicate
+  if (dice == 0 && number > 0) {  // the previous operation again, mostly a duplicate
     number -= 1 + random() % std::min(number, 8u);
     random = randomOf(seed, number);
     dice = random() % 40;
@@ -58,7 +58,7 @@ Operation workloadOperation(uint32_t seed, uint32_t number) {
   if (dice < 6) made.docID = 1 + random() % made.docID;
   if (dice == 1) return made;  // a deletion
   made.zoneID = kZones[(dice < 6 ? random() : number) % std::size(kZones)];
-  // Some records of the log are larger than its blocks of 32 KiB and than a file's buffer.
+  // Some log records exceed the log's blocks of 32 KiB and the buffer of a file.
   const size_t size = dice == 39 ? 20000 + random() % 60000 : random() % 300;
   made.text = randomText(random, size);
   made.offsets = randomOffsets(random, std::string_view(made.text).substr(0, 300));

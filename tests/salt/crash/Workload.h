@@ -9,7 +9,7 @@
 
 namespace salttest {
 
-// One call of AddZone or, where `zoneID` is 0, of DeleteDoc.
+// One call of AddZone or, if `zoneID` is 0, of DeleteDoc.
 struct Operation {
   uint32_t docID = 0;
   uint16_t zoneID = 0;
@@ -17,42 +17,42 @@ struct Operation {
   std::vector<uint32_t> offsets;
 };
 
-// How a worker is kept from writing at times.
+// How space is withheld from a worker.
 enum class Shortage { none, fileSize, fullDisk };
 
-// What one database is put through. It follows from these arguments alone, so that the process that
-// does the work and the one that checks it need not tell each other.
+// The workload of one database, a pure function of these arguments, so that the worker and the
+// checker need not communicate.
 [[nodiscard]] salt::Index::Options workloadOptions(uint32_t seed, Shortage shortage);
 [[nodiscard]] Operation workloadOperation(uint32_t seed, uint32_t number);
 
-// The answers of index and model.
+// Applies an operation to the index or the model, and returns its answer.
 bool carryOut(salt::Index& index, Operation operation);
 bool carryOut(Model& model, const Operation& operation);
 
-// What a worker process writes to its standard output, a byte each.
+// Reports of a worker on its standard output, one byte each.
 enum class Report : char {
   opened = 'o',
   done = 't',
-  refused = 'f',  // the operation was answered with false for good
-  failed = 'x',   // there was no space; the operation will be tried again
+  refused = 'f',  // the operation returned false, permanently
+  failed = 'x',   // there was no space; the operation will be repeated
 };
 
-// What a worker is told on its command line.
+// The command line arguments of a worker.
 struct WorkerTask {
   std::string path;
   uint32_t seed = 0;        // of the workload
-  uint32_t first = 0;       // number of the operation to begin with
-  uint32_t generation = 0;  // seeds what is random beside the workload
-  bool create = false;      // rather than open
+  uint32_t first = 0;       // number of the first operation
+  uint32_t generation = 0;  // seeds randomness outside the workload
+  bool create = false;      // create the index instead of opening it
   Shortage shortage = Shortage::none;
 };
 
-// What fills the disk, beside the index.
+// The file beside the index that fills the disk.
 [[nodiscard]] inline std::string ballastOf(const std::string& path) {
   return path + ".ballast";
 }
 
-// Carries out one operation after the other until it is killed. Returns only when it cannot go on.
+// Runs operations until it is killed. Returns only if it cannot continue.
 int runWorker(const WorkerTask& task);
 
 }  // namespace salttest

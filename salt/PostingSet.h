@@ -15,7 +15,7 @@ namespace salt {
 
 // The distinct places of many suffixes, and the number of suffixes. A mail has about ten zones, so
 // the zones of a document are stored as the bits of one number. One thread.
-class PlaceSet {
+class PostingSet {
  public:
   void add(const Place& place) {
     ++_suffixes;
@@ -28,13 +28,13 @@ class PlaceSet {
   }
 
   // The two sets must not count the same suffix.
-  void add(PlaceSet&& other);
+  void add(PostingSet&& other);
 
   // Adds documents whose zone bits index one list. Their suffixes are counted separately, by
   // addSuffixes.
   class Adder {
    public:
-    Adder(PlaceSet* set, const std::vector<uint16_t>& zones);
+    Adder(PostingSet* set, const std::vector<uint16_t>& zones);
 
     void add(const DocZones& doc) {
       if (_bits) {
@@ -47,7 +47,7 @@ class PlaceSet {
    private:
     void addOneByOne(const DocZones& doc);
 
-    PlaceSet& _set;
+    PostingSet& _set;
     const std::vector<uint16_t>& _zones;
     std::optional<ZoneMaskMap> _bits;  // nullopt when the set has no bit left for one of them
   };

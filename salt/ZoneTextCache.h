@@ -23,14 +23,14 @@ class index;
 // database, which the kernel caches as far as memory allows. Documents with neighbouring numbers
 // mostly share a shard, so a read from the database reads ahead.
 //
-// Disk: a quarter of the free space, at most kMostFileBytes; then the file starts over. Memory:
+// Disk: a quarter of the free space, at most kMaxFileBytes; then the file starts over. Memory:
 // about 60 bytes for each cached zone. When the file cannot be created or used, each text is read
 // from the database. One thread. The index outlives it.
-class ZoneTexts {
+class ZoneTextCache {
  public:
-  static constexpr uint64_t kMostFileBytes = uint64_t{1} << 30;
+  static constexpr uint64_t kMaxFileBytes = uint64_t{1} << 30;
 
-  explicit ZoneTexts(const index& owner, uint64_t mostFileBytes = kMostFileBytes);
+  explicit ZoneTextCache(const index& owner, uint64_t maxFileBytes = kMaxFileBytes);
 
   // The truncated text of a suffix, empty when absent. Valid until the next call.
   [[nodiscard]] std::string_view find(const SuffixMeta& meta);
@@ -57,7 +57,7 @@ class ZoneTexts {
   const index& _idx;
   const std::unique_ptr<leveldb::Iterator> _iterator;
   platform::FileDescriptor _file;
-  uint64_t _mostFileBytes = 0;
+  uint64_t _maxFileBytes = 0;
   uint64_t _fileBytes = 0;
   std::unordered_map<uint64_t, Stretch> _kept;
   std::string _read;    // texts to be written at _fileBytes

@@ -1,4 +1,4 @@
-#include "salt/PlaceSet.h"
+#include "salt/PostingSet.h"
 
 #include <bit>
 
@@ -41,7 +41,7 @@ void appendVarint(std::string* out, uint32_t value) {
 
 }  // namespace
 
-uint32_t PlaceSet::newBit(uint16_t zoneID) {
+uint32_t PostingSet::newBit(uint16_t zoneID) {
   if (_zones.size() == kMaxZones) return 0;
   if (zoneID >= _bits.size()) _bits.resize(zoneID + size_t{1});
   _bits[zoneID] = uint32_t{1} << _zones.size();
@@ -49,7 +49,7 @@ uint32_t PlaceSet::newBit(uint16_t zoneID) {
   return _bits[zoneID];
 }
 
-void PlaceSet::add(PlaceSet&& other) {
+void PostingSet::add(PostingSet&& other) {
   if (_suffixes == 0) std::swap(*this, other);
   if (other._suffixes == 0) return;
   other.deliver([this](const std::vector<uint16_t>& zones, const DocZones* docs, size_t count) {
@@ -59,14 +59,14 @@ void PlaceSet::add(PlaceSet&& other) {
   addSuffixes(other._suffixes);
 }
 
-PlaceSet::Adder::Adder(PlaceSet* set, const std::vector<uint16_t>& zones)
+PostingSet::Adder::Adder(PostingSet* set, const std::vector<uint16_t>& zones)
     : _set(*set), _zones(zones) {
   bool all = true;
   for (const uint16_t zone : zones) all = set->bitOf(zone) != 0 && all;
   if (all) _bits.emplace(zones, [set](uint16_t zone) { return set->bitOf(zone); });
 }
 
-void PlaceSet::Adder::addOneByOne(const DocZones& doc) {
+void PostingSet::Adder::addOneByOne(const DocZones& doc) {
   for (uint32_t mask = doc.zones; mask != 0; mask &= mask - 1) {
     const uint16_t zone = _zones[static_cast<size_t>(std::countr_zero(mask))];
     if (const uint32_t bit = _set.bitOf(zone); bit != 0) {
@@ -78,7 +78,7 @@ void PlaceSet::Adder::addOneByOne(const DocZones& doc) {
 }
 
 // Number of zones, the zones, then for each document the delta of its DocID and its mask.
-std::string PlaceSet::encode() const {
+std::string PostingSet::encode() const {
   std::string out;
   if (!_others.empty()) return out;
   appendVarint(&out, static_cast<uint32_t>(_zones.size()));
@@ -93,7 +93,7 @@ std::string PlaceSet::encode() const {
   return out;
 }
 
-void PlaceSet::deliver(const PlacesCallback& callback) const {
+void PostingSet::deliver(const PlacesCallback& callback) const {
   for (const Place& place : _others) {
     const DocZones doc{place.DocID, 1};
     callback({place.ZoneID}, &doc, 1);
@@ -105,7 +105,7 @@ void PlaceSet::deliver(const PlacesCallback& callback) const {
   runs.flush();
 }
 
-void PlaceSet::deliver(std::string_view encoded, const PlacesCallback& callback) {
+void PostingSet::deliver(std::string_view encoded, const PlacesCallback& callback) {
   std::vector<uint16_t> zones(readVarint(encoded));
   for (uint16_t& zone : zones) zone = static_cast<uint16_t>(readVarint(encoded));
   Runs runs(zones, callback);

@@ -31,11 +31,11 @@ namespace salt {
 // shares one among all databases of the process.
 //
 // Any thread. Outlives the database; the destructor ends both threads.
-class IndexFiles final : public leveldb::EnvWrapper {
+class OrderedSyncEnv final : public leveldb::EnvWrapper {
  public:
-  // For the database in the directory `path`. Does all file operations through `files`, which must
+  // For the database in the directory `path`. Does all file operations through `base`, which must
   // outlive this object.
-  IndexFiles(const std::string& path, leveldb::Env* files);
+  OrderedSyncEnv(const std::string& path, leveldb::Env* base);
 
   // The file that records that the process crashed during work on this database (see
   // platform::CrashNote).

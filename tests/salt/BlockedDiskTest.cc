@@ -9,66 +9,67 @@
 #include "platform/Mutex.h"
 #include "salt/IndexImpl.h"
 #include "salt/LogSync.h"
-#include "tests/salt/FilesBetween.h"
+#include "tests/salt/FaultInjectionEnv.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// A disk that takes its time.
+// Tests with delayed disk operations.
 namespace {
 
 using salt::Index;
 using salttest::addZone;
 
-// Where files of one kind can be held up: who writes to one waits until they go on.
-class SlowDisk final : public salttest::FilesBetween {
+// Can block writes to files of one kind until they are released.
+class WriteBlockingEnv final : public salttest::FaultInjectionEnv {
  public:
-  explicit SlowDisk(std::string suffix) : _suffix(std::move(suffix)) {}
+  explicit WriteBlockingEnv(std::string suffix) : _suffix(std::move(suffix)) {}
 
-  // From the write on that follows so many others; a record of a log is two.
-  void holdUpAfter(int writes) {
+  // Blocks from the write after so many others; a log record takes two.
+  void blockAfter(int writes) {
     platform::MutexLock lock(_mutex);
-    _heldUp = true;
+    _blocked = true;
     _pass = writes;
   }
-  void goOn() {
+  void release() {
     platform::MutexLock lock(_mutex);
-    _heldUp = _waiting = false;
+    _blocked = _waiting = false;
     _changed.notify_all();
   }
-  // Returns when somebody waits.
+  // Returns when a writer is blocked.
   void waitForWriter() {
     platform::MutexLock lock(_mutex);
     while (!_waiting) _changed.wait(_mutex);
   }
 
  private:
-  class SlowFile final : public salttest::FileBetween {
+  class File final : public salttest::FaultInjectionFile {
    public:
-    SlowFile(SlowDisk* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
+    File(WriteBlockingEnv* disk, leveldb::WritableFile* file)
+        : FaultInjectionFile(file), _disk(*disk) {}
     leveldb::Status Append(const leveldb::Slice& bytes) override {
       _disk.pass();
-      return FileBetween::Append(bytes);
+      return FaultInjectionFile::Append(bytes);
     }
 
    private:
-    SlowDisk& _disk;
+    WriteBlockingEnv& _disk;
   };
 
-  leveldb::WritableFile* between(const std::string& path, leveldb::WritableFile* file) override {
-    return path.ends_with(_suffix) ? new SlowFile(this, file) : file;
+  leveldb::WritableFile* wrap(const std::string& path, leveldb::WritableFile* file) override {
+    return path.ends_with(_suffix) ? new File(this, file) : file;
   }
   void pass() {
     platform::MutexLock lock(_mutex);
-    if (!_heldUp || _pass-- > 0) return;
+    if (!_blocked || _pass-- > 0) return;
     _waiting = true;
     _changed.notify_all();
-    while (_heldUp) _changed.wait(_mutex);
+    while (_blocked) _changed.wait(_mutex);
   }
 
   const std::string _suffix;
   platform::Mutex _mutex;
   std::condition_variable_any _changed;
-  bool _heldUp TL_GUARDED_BY(_mutex) = false;
+  bool _blocked TL_GUARDED_BY(_mutex) = false;
   bool _waiting TL_GUARDED_BY(_mutex) = false;
   int _pass TL_GUARDED_BY(_mutex) = 0;
 };
@@ -83,31 +84,31 @@ std::optional<uint64_t> countOfPlaces(const Index& index) {
   return index.ScanPlaces("a", 1000, [](const auto&, const auto*, size_t) {});
 }
 
-std::unique_ptr<salt::index> openOn(SlowDisk* disk, const std::string& path) {
+std::unique_ptr<salt::index> openOn(WriteBlockingEnv* disk, const std::string& path) {
   return salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, disk));
 }
 
-// Runs `waits` while somebody waits for the disk already. Were it not to wait, `goesOn` would be
-// false; were the end not told, it would take ten seconds.
+// Runs `waits`, which is released from another thread. If it did not wait, `released` would be
+// false; if its end were not notified, it would take ten seconds.
 template <typename Waits>
-void expectWaiting(SlowDisk* disk, const Waits& waits) {
+void expectWaiting(WriteBlockingEnv* disk, const Waits& waits) {
   std::atomic<bool> begins = false;
-  std::atomic<bool> goesOn = false;
+  std::atomic<bool> released = false;
   std::thread releasing([&] {
     while (!begins) std::this_thread::yield();
-    goesOn = true;
-    disk->goOn();
+    released = true;
+    disk->release();
   });
   begins = true;
   waits();
-  EXPECT_TRUE(goesOn);
+  EXPECT_TRUE(released);
   releasing.join();
 }
 
 }  // namespace
 
-// Were a scan to wait for the write, this would wait for ever.
-TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
+// If scans waited for the write, this test would not end.
+TEST(BlockedDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   constexpr uint32_t kDocs = 20;
   const testsupport::TemporaryDirectory directory;
   Index::Options options;
@@ -119,26 +120,26 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
       ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
     }
   }
-  SlowDisk disk(".log");
+  WriteBlockingEnv disk(".log");
   const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
 
-  disk.holdUpAfter(0);
+  disk.blockAfter(0);
   std::thread adding([&index] { EXPECT_TRUE(addZone(*index, kDocs, 1, "a b", {0, 2})); });
   disk.waitForWriter();
   EXPECT_EQ(sortedScan(*index).size(), 2 * (kDocs - 1));
   EXPECT_EQ(countOfPlaces(*index), kDocs - 1);
-  disk.goOn();
+  disk.release();
   adding.join();
   const auto all = sortedScan(*index);
   EXPECT_EQ(all.size(), 2 * kDocs);
 
-  disk.holdUpAfter(2);  // the mark of a merge passes, its pages do not
+  disk.blockAfter(2);  // lets the record of the merge pass, but not its pages
   index->Vacuum();
   disk.waitForWriter();
   EXPECT_EQ(sortedScan(*index), all);
   EXPECT_EQ(countOfPlaces(*index), kDocs);
-  disk.goOn();
+  disk.release();
   while (index->GetMetrics().VacuumInProgress) std::this_thread::yield();
   EXPECT_GT(index->GetMetrics().Pages, 0u);
   EXPECT_EQ(sortedScan(*index), all);
@@ -146,41 +147,41 @@ TEST(SlowDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   EXPECT_TRUE(index->Validate());
 }
 
-TEST(SlowDisk, WhoAddsALotHoldsBackDuringACompaction) {
+TEST(BlockedDisk, IngestWaitsDuringACompaction) {
   const testsupport::TemporaryDirectory directory;
   ASSERT_NE(salttest::newIndex(directory / "i"), nullptr);
-  SlowDisk disk(".ldb");
+  WriteBlockingEnv disk(".ldb");
   const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
-  index->WaitWhileTidying();  // for nothing
+  index->WaitForMaintenance();  // returns at once
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
 
-  disk.holdUpAfter(0);
+  disk.blockAfter(0);
   std::thread compacting([&index] { index->Compact(); });
   disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitWhileTidying(); });
+  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
   compacting.join();
 }
 
-TEST(SlowDisk, WhoAddsALotHoldsBackDuringAMerge) {
+TEST(BlockedDisk, IngestWaitsDuringAMerge) {
   const testsupport::TemporaryDirectory directory;
   Index::Options options;
   options.MaxHotSuffixes = 4;
   ASSERT_NE(salttest::newIndex(directory / "i", options), nullptr);
-  SlowDisk disk(".log");
+  WriteBlockingEnv disk(".log");
   const auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
   ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
 
-  disk.holdUpAfter(2);  // the mark of a merge passes, its pages do not
+  disk.blockAfter(2);  // lets the record of the merge pass, but not its pages
   index->Vacuum();
   disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitWhileTidying(); });
+  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
   EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
 }
 
-// A merge that would go on for long, and an index that nobody needs any more.
-TEST(SlowDisk, AnInterruptionEndsAMergeAndAllWaitingForIt) {
+// A merge that would run for long, in an index that nobody needs any more.
+TEST(BlockedDisk, AnInterruptionEndsAMergeAndAllWaits) {
   constexpr uint32_t kDocs = 400;
   const testsupport::TemporaryDirectory directory;
   Index::Options options;
@@ -188,21 +189,21 @@ TEST(SlowDisk, AnInterruptionEndsAMergeAndAllWaitingForIt) {
   options.MaxPageSuffixes = 2;
   options.MaxBatchBytes = 1;
   ASSERT_NE(salttest::newIndex(directory / "i", options), nullptr);
-  SlowDisk disk(".log");
+  WriteBlockingEnv disk(".log");
   auto index = openOn(&disk, directory / "i");
   ASSERT_NE(index, nullptr);
   for (uint32_t docID = 1; docID <= kDocs; ++docID) {
     ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
   }
-  disk.holdUpAfter(2);  // the mark of the merge and its first pages pass
+  disk.blockAfter(2);  // lets the record of the merge and its first pages pass
   index->Vacuum();
   disk.waitForWriter();
   std::thread compacting([&index] { EXPECT_TRUE(index->Compact()); });
-  std::thread adding([&index] { index->WaitWhileTidying(); });
+  std::thread adding([&index] { index->WaitForMaintenance(); });
   index->Interrupt();
   compacting.join();
   adding.join();
-  disk.goOn();
+  disk.release();
   index.reset();
   const auto again = salttest::loadIndex(directory / "i");
   ASSERT_NE(again, nullptr);
@@ -212,9 +213,9 @@ TEST(SlowDisk, AnInterruptionEndsAMergeAndAllWaitingForIt) {
 }
 
 // leveldb would end the process if it failed to write that memtable.
-TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
+TEST(BlockedDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   const testsupport::TemporaryDirectory directory;
-  SlowDisk disk(".ldb");
+  WriteBlockingEnv disk(".ldb");
   const salt::Database database =
       salt::openDatabase(directory / "i", salt::OpenMode::create, &disk);
   ASSERT_NE(database.db, nullptr);
@@ -226,7 +227,7 @@ TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   };
   write(1);
 
-  disk.holdUpAfter(0);
+  disk.blockAfter(0);
   std::thread compacting([&] { writer.compact(nullptr, nullptr); });
   disk.waitForWriter();
   write(1);
@@ -236,12 +237,12 @@ TEST(SlowDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
 
 namespace {
 
-// Where syncs can be held up.
-class SlowSyncs final : public salttest::FilesBetween {
+// Can block syncs.
+class SyncBlockingEnv final : public salttest::FaultInjectionEnv {
  public:
-  void holdUp() { _gate = std::make_unique<Gate>(); }
+  void block() { _gate = std::make_unique<Gate>(); }
   void waitForSync() { _gate->reached.wait(); }
-  void goOn() { _gate->open.count_down(); }
+  void release() { _gate->open.count_down(); }
 
  private:
   struct Gate {
@@ -249,22 +250,23 @@ class SlowSyncs final : public salttest::FilesBetween {
     std::latch open{1};
     std::atomic<bool> passed{false};
   };
-  class File final : public salttest::FileBetween {
+  class File final : public salttest::FaultInjectionFile {
    public:
-    File(SlowSyncs* disk, leveldb::WritableFile* file) : FileBetween(file), _disk(*disk) {}
+    File(SyncBlockingEnv* disk, leveldb::WritableFile* file)
+        : FaultInjectionFile(file), _disk(*disk) {}
     leveldb::Status Sync() override {
       if (!_disk._gate->passed.exchange(true)) {
         _disk._gate->reached.count_down();
         _disk._gate->open.wait();
       }
-      return FileBetween::Sync();
+      return FaultInjectionFile::Sync();
     }
 
    private:
-    SlowSyncs& _disk;
+    SyncBlockingEnv& _disk;
   };
 
-  leveldb::WritableFile* between(const std::string&, leveldb::WritableFile* file) override {
+  leveldb::WritableFile* wrap(const std::string&, leveldb::WritableFile* file) override {
     return new File(this, file);
   }
 
@@ -273,13 +275,13 @@ class SlowSyncs final : public salttest::FilesBetween {
 
 }  // namespace
 
-// The thread that syncs in the background once spun with the lock held that the other needed.
-TEST(SlowDisk, ASyncEndsWhileMuchMoreIsWritten) {
+// The background sync thread once spun while it held the lock that the other thread needed.
+TEST(BlockedDisk, ASyncEndsWhileMuchMoreIsWritten) {
   const testsupport::TemporaryDirectory directory;
   const std::string much(size_t{2} << 20, 'x');
   for (int round = 0; round < 10; ++round) {
-    SlowSyncs disk;
-    disk.holdUp();
+    SyncBlockingEnv disk;
+    disk.block();
     salt::LogSync logs(&disk);
     leveldb::WritableFile* opened = nullptr;
     const std::string path = directory / ("log" + std::to_string(round));
@@ -291,7 +293,7 @@ TEST(SlowDisk, ASyncEndsWhileMuchMoreIsWritten) {
     disk.waitForSync();
     ASSERT_TRUE(file->Append(much).ok());
     ASSERT_TRUE(file->Flush().ok());
-    disk.goOn();
+    disk.release();
     syncing.join();
     EXPECT_TRUE(file->Sync().ok());
   }

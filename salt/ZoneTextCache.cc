@@ -1,4 +1,4 @@
-#include "salt/ZoneTexts.h"
+#include "salt/ZoneTextCache.h"
 
 #include <fcntl.h>
 
@@ -18,22 +18,22 @@ uint64_t idOf(uint32_t docID, uint16_t zoneID) {
 
 }  // namespace
 
-ZoneTexts::ZoneTexts(const index& owner, uint64_t mostFileBytes)
+ZoneTextCache::ZoneTextCache(const index& owner, uint64_t maxFileBytes)
     : _idx(owner),
       _iterator(owner.db->NewIterator(readOptions(false))),
       _file(open(owner.path().c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, S_IRUSR | S_IWUSR)) {
   if (_file.get() >= 0) {
-    _mostFileBytes = std::min(mostFileBytes, platform::freeBytes(owner.path()) / 4);
+    _maxFileBytes = std::min(maxFileBytes, platform::freeBytes(owner.path()) / 4);
   }
 }
 
-std::string_view ZoneTexts::find(const SuffixMeta& meta) {
+std::string_view ZoneTextCache::find(const SuffixMeta& meta) {
   const auto kept = _kept.find(idOf(meta.DocID, meta.ZoneID));
   if (kept == _kept.end() || !readKept(kept->second, meta)) readStored(meta);
   return _suffix;
 }
 
-bool ZoneTexts::readKept(const Stretch& stretch, const SuffixMeta& meta) {
+bool ZoneTextCache::readKept(const Stretch& stretch, const SuffixMeta& meta) {
   const uint32_t offset = std::min(meta.Offset, stretch.bytes);
   _suffix.resize(std::min<size_t>(stretch.bytes - offset, _idx.op.MaxMatchLen));
   if (!platform::readAt(_file.get(), stretch.begin + offset, _suffix.data(), _suffix.size())) {
@@ -44,7 +44,7 @@ bool ZoneTexts::readKept(const Stretch& stretch, const SuffixMeta& meta) {
   return true;
 }
 
-void ZoneTexts::readStored(const SuffixMeta& meta) {
+void ZoneTextCache::readStored(const SuffixMeta& meta) {
   _suffix.clear();
   const TextKey key = index::textKey(meta.DocID, meta.ZoneID);
   _iterator->Seek(slice(key.view()));
@@ -63,27 +63,27 @@ void ZoneTexts::readStored(const SuffixMeta& meta) {
   keepRead();
 }
 
-void ZoneTexts::addRead(uint64_t id) {
+void ZoneTextCache::addRead(uint64_t id) {
   const leveldb::Slice text = _iterator->value();
   _kept[id] = {_fileBytes + _read.size(), static_cast<uint32_t>(text.size())};
   _read.append(text.data(), text.size());
 }
 
-void ZoneTexts::keepRead() {
+void ZoneTextCache::keepRead() {
   if (!platform::writeAt(_file.get(), _fileBytes, _read)) {
     forget();
   } else {
     _fileBytes += _read.size();
   }
   _read.clear();
-  if (_fileBytes > _mostFileBytes) {
+  if (_fileBytes > _maxFileBytes) {
     _kept.clear();
     _fileBytes = 0;
   }
 }
 
 // When the disk is full or fails, the texts in the file are not needed: the database has them.
-void ZoneTexts::forget() {
+void ZoneTextCache::forget() {
   _kept.clear();
   _file.reset();
 }

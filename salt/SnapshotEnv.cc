@@ -1,4 +1,4 @@
-#include "salt/FrozenFiles.h"
+#include "salt/SnapshotEnv.h"
 
 #include <fcntl.h>
 #include <leveldb/helpers/memenv.h>
@@ -37,7 +37,7 @@ bool isCopied(std::string_view name) {
 }
 
 leveldb::Status refused(const std::string& path) {
-  return leveldb::Status::IOError(path, "frozen");
+  return leveldb::Status::IOError(path, "read-only snapshot");
 }
 
 // Reads from a descriptor that it does not own.
@@ -69,14 +69,14 @@ class TableReader final : public leveldb::RandomAccessFile {
 
 }  // namespace
 
-FrozenFiles::FrozenFiles(std::unique_ptr<leveldb::Env> memory)
+SnapshotEnv::SnapshotEnv(std::unique_ptr<leveldb::Env> memory)
     : leveldb::EnvWrapper(memory.get()), _memory(std::move(memory)) {}
 
-std::unique_ptr<FrozenFiles> FrozenFiles::capture(const std::string& directory, TLErrorOut error) {
+std::unique_ptr<SnapshotEnv> SnapshotEnv::capture(const std::string& directory, TLErrorOut error) {
   const auto names = platform::listDirectory(directory, error);
   if (!names) return nullptr;
   std::unique_ptr<leveldb::Env> memory(leveldb::NewMemEnv(leveldb::Env::Default()));
-  std::unique_ptr<FrozenFiles> files(new FrozenFiles(std::move(memory)));
+  std::unique_ptr<SnapshotEnv> files(new SnapshotEnv(std::move(memory)));
   for (const std::string& name : *names) {
     const std::string path = platform::joinPath(directory, name);
     if (isTable(name) && !files->addTable(path, error)) return nullptr;
@@ -85,7 +85,7 @@ std::unique_ptr<FrozenFiles> FrozenFiles::capture(const std::string& directory, 
   return files;
 }
 
-bool FrozenFiles::addTable(const std::string& path, TLErrorOut error) {
+bool SnapshotEnv::addTable(const std::string& path, TLErrorOut error) {
   Table table{platform::FileDescriptor(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK)), 0};
   struct stat info;
   if (table.file.get() < 0 || fstat(table.file.get(), &info) != 0) {
@@ -98,56 +98,56 @@ bool FrozenFiles::addTable(const std::string& path, TLErrorOut error) {
   return true;
 }
 
-bool FrozenFiles::addCopy(const std::string& path, TLErrorOut error) {
+bool SnapshotEnv::addCopy(const std::string& path, TLErrorOut error) {
   const auto bytes = platform::readFile(path, kMaxCopiedBytes, error);
   return bytes && leveldb::WriteStringToFile(_memory.get(), *bytes, path).ok();
 }
 
-const FrozenFiles::Table* FrozenFiles::table(const std::string& path) {
+const SnapshotEnv::Table* SnapshotEnv::table(const std::string& path) {
   const auto entry = _tables.find(path);
   return entry == _tables.end() || target()->FileExists(path) ? nullptr : &entry->second;
 }
 
-leveldb::Status FrozenFiles::NewRandomAccessFile(const std::string& path,
+leveldb::Status SnapshotEnv::NewRandomAccessFile(const std::string& path,
                                                  leveldb::RandomAccessFile** file) {
-  const Table* const frozen = table(path);
-  if (frozen == nullptr) return target()->NewRandomAccessFile(path, file);
-  *file = new TableReader(path, frozen->file.get());
+  const Table* const captured = table(path);
+  if (captured == nullptr) return target()->NewRandomAccessFile(path, file);
+  *file = new TableReader(path, captured->file.get());
   return leveldb::Status::OK();
 }
 
-leveldb::Status FrozenFiles::NewWritableFile(const std::string& path,
+leveldb::Status SnapshotEnv::NewWritableFile(const std::string& path,
                                              leveldb::WritableFile** file) {
   return mayWrite() ? target()->NewWritableFile(path, file) : refused(path);
 }
 
-leveldb::Status FrozenFiles::NewAppendableFile(const std::string& path,
+leveldb::Status SnapshotEnv::NewAppendableFile(const std::string& path,
                                                leveldb::WritableFile** file) {
   return mayWrite() ? target()->NewAppendableFile(path, file) : refused(path);
 }
 
-bool FrozenFiles::FileExists(const std::string& path) {
+bool SnapshotEnv::FileExists(const std::string& path) {
   return table(path) != nullptr || target()->FileExists(path);
 }
 
-leveldb::Status FrozenFiles::GetChildren(const std::string& directory,
+leveldb::Status SnapshotEnv::GetChildren(const std::string& directory,
                                          std::vector<std::string>* names) {
   const leveldb::Status status = target()->GetChildren(directory, names);
-  for (const auto& [path, frozen] : _tables) {
+  for (const auto& [path, captured] : _tables) {
     if (table(path) != nullptr) names->push_back(path.substr(path.rfind('/') + 1));
   }
   return status;
 }
 
 // leveldb removes a captured table when it no longer needs it; the file stays.
-leveldb::Status FrozenFiles::RemoveFile(const std::string& path) {
+leveldb::Status SnapshotEnv::RemoveFile(const std::string& path) {
   return table(path) != nullptr ? leveldb::Status::OK() : target()->RemoveFile(path);
 }
 
-leveldb::Status FrozenFiles::GetFileSize(const std::string& path, uint64_t* size) {
-  const Table* const frozen = table(path);
-  if (frozen == nullptr) return target()->GetFileSize(path, size);
-  *size = frozen->size;
+leveldb::Status SnapshotEnv::GetFileSize(const std::string& path, uint64_t* size) {
+  const Table* const captured = table(path);
+  if (captured == nullptr) return target()->GetFileSize(path, size);
+  *size = captured->size;
   return leveldb::Status::OK();
 }
 

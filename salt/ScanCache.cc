@@ -1,8 +1,8 @@
-#include "salt/ScanMemory.h"
+#include "salt/ScanCache.h"
 
 namespace salt {
 
-bool ScanMemory::enter(uint64_t generation) {
+bool ScanCache::enter(uint64_t generation) {
   if (generation > _generation) {
     _byPrefix.clear();
     _entries.clear();
@@ -12,8 +12,8 @@ bool ScanMemory::enter(uint64_t generation) {
   return generation == _generation;
 }
 
-std::shared_ptr<const ScanMemory::Found> ScanMemory::find(std::string_view prefix,
-                                                          uint64_t generation) {
+std::shared_ptr<const ScanCache::Found> ScanCache::find(std::string_view prefix,
+                                                        uint64_t generation) {
   platform::MutexLock lock(_mutex);
   if (!enter(generation)) return nullptr;
   const auto known = _byPrefix.find(prefix);
@@ -22,14 +22,14 @@ std::shared_ptr<const ScanMemory::Found> ScanMemory::find(std::string_view prefi
   return _entries.front().found;
 }
 
-void ScanMemory::keep(std::string_view prefix, uint64_t generation,
-                      std::shared_ptr<const Found> found) {
+void ScanCache::keep(std::string_view prefix, uint64_t generation,
+                     std::shared_ptr<const Found> found) {
   platform::MutexLock lock(_mutex);
   if (!enter(generation) || _byPrefix.contains(prefix)) return;
   _entries.push_front({std::string(prefix), std::move(found)});
   _byPrefix.emplace(_entries.front().prefix, _entries.begin());
   _bytes += _entries.front().bytes();
-  while (_bytes > kMostBytes) {
+  while (_bytes > kMaxBytes) {
     _bytes -= _entries.back().bytes();
     _byPrefix.erase(_entries.back().prefix);
     _entries.pop_back();

@@ -18,10 +18,10 @@ namespace salt {
 // memory too. Any thread may read. Only the thread that captured the snapshot may create files, as
 // opening a database does. On leveldb's background thread file creation fails, because compactions
 // would fill the memory with tables; reading still works.
-class FrozenFiles final : public leveldb::EnvWrapper {
+class SnapshotEnv final : public leveldb::EnvWrapper {
  public:
   // Null with an error when the directory or one of the database files cannot be read.
-  [[nodiscard]] static std::unique_ptr<FrozenFiles> capture(const std::string& directory,
+  [[nodiscard]] static std::unique_ptr<SnapshotEnv> capture(const std::string& directory,
                                                             TLErrorOut error);
 
   leveldb::Status NewRandomAccessFile(const std::string& path,
@@ -40,7 +40,7 @@ class FrozenFiles final : public leveldb::EnvWrapper {
     uint64_t size = 0;
   };
 
-  explicit FrozenFiles(std::unique_ptr<leveldb::Env> memory);
+  explicit SnapshotEnv(std::unique_ptr<leveldb::Env> memory);
 
   // Null when the path is no captured table, or when the database has since written a file of the
   // same name, which takes precedence.

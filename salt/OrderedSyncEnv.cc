@@ -1,4 +1,4 @@
-#include "salt/IndexFiles.h"
+#include "salt/OrderedSyncEnv.h"
 
 #include <string_view>
 #include <utility>
@@ -11,7 +11,7 @@ namespace salt {
 
 namespace {
 
-constexpr size_t kMostUnsyncedTables = 4;
+constexpr size_t kMaxUnsyncedTables = 4;
 
 bool isTable(std::string_view path) {
   return path.ends_with(".ldb");
@@ -28,9 +28,9 @@ bool isManifest(std::string_view path) {
 }  // namespace
 
 // leveldb syncs a table when it is complete and then closes it.
-class IndexFiles::Table final : public leveldb::WritableFile {
+class OrderedSyncEnv::Table final : public leveldb::WritableFile {
  public:
-  Table(IndexFiles* files, leveldb::WritableFile* file) : _files(*files), _file(file) {}
+  Table(OrderedSyncEnv* env, leveldb::WritableFile* file) : _env(*env), _file(file) {}
 
   leveldb::Status Append(const leveldb::Slice& bytes) override { return _file->Append(bytes); }
   // leveldb flushes after each block, but nobody reads a table before it is complete.
@@ -44,19 +44,19 @@ class IndexFiles::Table final : public leveldb::WritableFile {
 
   leveldb::Status Close() override {
     if (!_complete) return _file->Close();
-    _files.finish(std::move(_file));
+    _env.finish(std::move(_file));
     return {};
   }
 
  private:
-  IndexFiles& _files;
+  OrderedSyncEnv& _env;
   std::unique_ptr<leveldb::WritableFile> _file;  // null after closing
   bool _complete = false;
 };
 
-class IndexFiles::Manifest final : public leveldb::WritableFile {
+class OrderedSyncEnv::Manifest final : public leveldb::WritableFile {
  public:
-  Manifest(IndexFiles* files, leveldb::WritableFile* file) : _files(*files), _file(file) {}
+  Manifest(OrderedSyncEnv* env, leveldb::WritableFile* file) : _env(*env), _file(file) {}
 
   leveldb::Status Append(const leveldb::Slice& bytes) override {
     return later([file = _file, copy = bytes.ToString()] { return file->Append(copy); });
@@ -73,44 +73,44 @@ class IndexFiles::Manifest final : public leveldb::WritableFile {
 
  private:
   leveldb::Status later(Step step) {
-    _files.inOrder(std::move(step));
-    return _files.failure();
+    _env.inOrder(std::move(step));
+    return _env.failure();
   }
 
-  IndexFiles& _files;
+  OrderedSyncEnv& _env;
   const std::shared_ptr<leveldb::WritableFile> _file;  // shared with the queued steps
 };
 
-class IndexFiles::RecoveredLog final : public leveldb::SequentialFile {
+class OrderedSyncEnv::RecoveredLog final : public leveldb::SequentialFile {
  public:
-  RecoveredLog(IndexFiles* files, leveldb::SequentialFile* file) : _files(*files), _file(file) {}
+  RecoveredLog(OrderedSyncEnv* env, leveldb::SequentialFile* file) : _env(*env), _file(file) {}
 
   leveldb::Status Read(size_t size, leveldb::Slice* result, char* scratch) override {
     const leveldb::Status status = _file->Read(size, result, scratch);
-    _files.fail(status);
+    _env.fail(status);
     return status;
   }
   leveldb::Status Skip(uint64_t size) override {
     const leveldb::Status status = _file->Skip(size);
-    _files.fail(status);
+    _env.fail(status);
     return status;
   }
 
  private:
-  IndexFiles& _files;
+  OrderedSyncEnv& _env;
   const std::unique_ptr<leveldb::SequentialFile> _file;
 };
 
-IndexFiles::IndexFiles(const std::string& path, leveldb::Env* files)
-    : EnvWrapper(files),
+OrderedSyncEnv::OrderedSyncEnv(const std::string& path, leveldb::Env* base)
+    : EnvWrapper(base),
       _crashNotes(crashNotesPath(path)),
-      _logs(files),
+      _logs(base),
       _steps("tallow-files"),
       _work("tallow-leveldb", platform::QueuePriority::background,
             platform::SerialQueue::kForever) {}
 
-leveldb::Status IndexFiles::NewSequentialFile(const std::string& path,
-                                              leveldb::SequentialFile** file) {
+leveldb::Status OrderedSyncEnv::NewSequentialFile(const std::string& path,
+                                                  leveldb::SequentialFile** file) {
   const leveldb::Status status = target()->NewSequentialFile(path, file);
   if (!isLog(path)) return status;
   fail(status);
@@ -118,19 +118,20 @@ leveldb::Status IndexFiles::NewSequentialFile(const std::string& path,
   return status;
 }
 
-leveldb::Status IndexFiles::NewWritableFile(const std::string& path, leveldb::WritableFile** file) {
+leveldb::Status OrderedSyncEnv::NewWritableFile(const std::string& path,
+                                                leveldb::WritableFile** file) {
   if (isToBeRemoved(path)) waitForDisk();
   const leveldb::Status status = target()->NewWritableFile(path, file);
   return status.ok() ? wrap(path, file) : status;
 }
 
-leveldb::Status IndexFiles::NewAppendableFile(const std::string& path,
-                                              leveldb::WritableFile** file) {
+leveldb::Status OrderedSyncEnv::NewAppendableFile(const std::string& path,
+                                                  leveldb::WritableFile** file) {
   const leveldb::Status status = target()->NewAppendableFile(path, file);
   return status.ok() ? wrap(path, file) : status;
 }
 
-leveldb::Status IndexFiles::wrap(const std::string& path, leveldb::WritableFile** file) {
+leveldb::Status OrderedSyncEnv::wrap(const std::string& path, leveldb::WritableFile** file) {
   if (isTable(path)) {
     *file = new Table(this, *file);
   } else if (isManifest(path)) {
@@ -143,7 +144,7 @@ leveldb::Status IndexFiles::wrap(const std::string& path, leveldb::WritableFile*
 
 // A failed removal is ignored: after each compaction leveldb removes again whatever it finds and
 // does not need.
-leveldb::Status IndexFiles::RemoveFile(const std::string& path) {
+leveldb::Status OrderedSyncEnv::RemoveFile(const std::string& path) {
   {
     const platform::MutexLock lock(_mutex);
     _removals.insert(path);
@@ -157,27 +158,27 @@ leveldb::Status IndexFiles::RemoveFile(const std::string& path) {
   return {};
 }
 
-bool IndexFiles::isToBeRemoved(const std::string& path) {
+bool OrderedSyncEnv::isToBeRemoved(const std::string& path) {
   const platform::MutexLock lock(_mutex);
   return _removals.contains(path);
 }
 
-void IndexFiles::waitForDisk() {
+void OrderedSyncEnv::waitForDisk() {
   _steps.drain();
 }
 
-leveldb::Status IndexFiles::RenameFile(const std::string& from, const std::string& to) {
+leveldb::Status OrderedSyncEnv::RenameFile(const std::string& from, const std::string& to) {
   waitForDisk();
   const leveldb::Status status = failure();
   return status.ok() ? target()->RenameFile(from, to) : status;
 }
 
-leveldb::Status IndexFiles::UnlockFile(leveldb::FileLock* lock) {
+leveldb::Status OrderedSyncEnv::UnlockFile(leveldb::FileLock* lock) {
   waitForDisk();
   return target()->UnlockFile(lock);
 }
 
-void IndexFiles::Schedule(void (*work)(void*), void* argument) {
+void OrderedSyncEnv::Schedule(void (*work)(void*), void* argument) {
   // leveldb calls this with its mutex held, and the work takes that mutex, so it must not run on
   // this thread.
   TL_ASSERT(_work.async([this, work, argument] {
@@ -186,27 +187,27 @@ void IndexFiles::Schedule(void (*work)(void*), void* argument) {
   }));
 }
 
-void IndexFiles::inOrder(Step step) {
+void OrderedSyncEnv::inOrder(Step step) {
   _steps.submit([this, step = std::move(step)] {
     if (!failure().ok()) return;
     fail(step());
   });
 }
 
-void IndexFiles::fail(const leveldb::Status& status) {
+void OrderedSyncEnv::fail(const leveldb::Status& status) {
   platform::MutexLock lock(_mutex);
   if (_failure.ok()) _failure = status;
 }
 
-leveldb::Status IndexFiles::failure() {
+leveldb::Status OrderedSyncEnv::failure() {
   platform::MutexLock lock(_mutex);
   return _failure;
 }
 
-void IndexFiles::finish(std::unique_ptr<leveldb::WritableFile> table) {
+void OrderedSyncEnv::finish(std::unique_ptr<leveldb::WritableFile> table) {
   {
     platform::MutexLock lock(_mutex);
-    while (_tables == kMostUnsyncedTables) _tableDone.wait(_mutex);
+    while (_tables == kMaxUnsyncedTables) _tableDone.wait(_mutex);
     ++_tables;
   }
   inOrder([file = std::shared_ptr<leveldb::WritableFile>(std::move(table))] {

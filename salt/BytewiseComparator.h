@@ -1,6 +1,7 @@
 #pragma once
 
 #include <leveldb/comparator.h>
+#include <leveldb/slice.h>
 
 #include <bit>
 #include <cstdint>
@@ -12,7 +13,7 @@ namespace salt {
 // leveldb's bytewise order under the same name, so that either can open the other's databases. A
 // quarter of the work on the index is comparing keys, and neighbouring keys share long prefixes:
 // this compares eight bytes at a time, without a further call.
-class KeyOrder final : public leveldb::Comparator {
+class BytewiseComparator final : public leveldb::Comparator {
  public:
   int Compare(const leveldb::Slice& left, const leveldb::Slice& right) const override {
     const size_t shorter = left.size() < right.size() ? left.size() : right.size();

@@ -4,7 +4,7 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
-#include "salt/ZoneTexts.h"
+#include "salt/ZoneTextCache.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -12,10 +12,10 @@ namespace {
 
 using salttest::FileSizeLimit;
 
-// Some of the zones are longer than what is read on at a time; every tenth document has none.
-class ZoneTextsTest : public testing::Test {
+// Some zones are longer than one read-ahead; every tenth document has none.
+class ZoneTextCacheTest : public testing::Test {
  protected:
-  ZoneTextsTest() {
+  ZoneTextCacheTest() {
     for (uint32_t doc = 1; doc <= kDocs; ++doc) {
       std::string text;
       const size_t words = doc % 10 == 0 ? 0 : 1 + _random() % (doc % 7 == 0 ? 8000 : 100);
@@ -27,7 +27,7 @@ class ZoneTextsTest : public testing::Test {
     }
   }
 
-  void expectAllTexts(salt::ZoneTexts* texts) {
+  void expectAllTexts(salt::ZoneTextCache* texts) {
     for (int i = 0; i < 3000; ++i) {
       salt::SuffixMeta meta{};
       meta.DocID = 1 + static_cast<uint32_t>(_random() % kDocs);
@@ -52,15 +52,15 @@ class ZoneTextsTest : public testing::Test {
   std::vector<std::string> _texts;
 };
 
-TEST_F(ZoneTextsTest, GivesTheSameWithAFileOfAnyLength) {
-  for (const uint64_t most : {salt::ZoneTexts::kMostFileBytes, uint64_t{200000}, uint64_t{0}}) {
-    salt::ZoneTexts texts(index(), most);
+TEST_F(ZoneTextCacheTest, GivesTheSameWithAFileOfAnyLength) {
+  for (const uint64_t most : {salt::ZoneTextCache::kMaxFileBytes, uint64_t{200000}, uint64_t{0}}) {
+    salt::ZoneTextCache texts(index(), most);
     expectAllTexts(&texts);
   }
 }
 
-TEST_F(ZoneTextsTest, GoesOnWhereTheFileCannotGrow) {
-  salt::ZoneTexts texts(index());
+TEST_F(ZoneTextCacheTest, WorksWhenTheFileCannotGrow) {
+  salt::ZoneTextCache texts(index());
   {
     const FileSizeLimit limit(100000);
     expectAllTexts(&texts);

@@ -16,12 +16,12 @@ namespace salt {
 // scanned by everybody. Each change to the pages or to the deleted documents starts a new
 // generation.
 //
-// Memory: kMostBytes. Any thread.
-class ScanMemory {
+// Memory: kMaxBytes. Any thread.
+class ScanCache {
  public:
   struct Found {
     uint64_t suffixes = 0;  // of live documents
-    std::string places;     // see PlaceSet::encode
+    std::string places;     // see PostingSet::encode
   };
 
   // Null when the prefix is not cached for this generation.
@@ -41,7 +41,7 @@ class ScanMemory {
   };
   using Entries = std::list<Entry>;
 
-  static constexpr size_t kMostBytes = 16 * 1024 * 1024;
+  static constexpr size_t kMaxBytes = 16 * 1024 * 1024;
   static constexpr size_t kOverhead = 256;  // approximate: list, table and allocator
 
   // Drops all entries if the generation is newer; false if it is older.
