@@ -1,6 +1,6 @@
 #include <benchmark/benchmark.h>
 
-#include "indexer/TALHTMLParsing.h"
+#include "html/TALHTMLParsing.h"
 
 namespace {
 

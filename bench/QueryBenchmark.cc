@@ -3,7 +3,7 @@
 #include <string>
 
 #include "platform/Log.h"
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 
 // Measures the way from the text of a query to its optimised tree, with logging as in a program.
 namespace {

@@ -12,7 +12,7 @@
 #include "bench/DaemonRun.h"
 #include "bench/Percentiles.h"
 #include "bench/Queries.h"
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 
 // Measures how long the daemon takes to answer verification queries, through its index and by

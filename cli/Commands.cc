@@ -166,7 +166,7 @@ ExitStatus complain(const std::optional<TLError>& error) {
     complain(std::string("the daemon gave no answer"));
     return ExitStatus::failure;
   }
-  const bool unreachable = client::isUnreachable(error);
+  const bool unreachable = rpc::isUnreachable(error);
   complain(plainText(*error));
   if (unreachable) {
     complain(

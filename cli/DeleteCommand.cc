@@ -122,7 +122,7 @@ ExitStatus runDelete(const Options& options) {
   size_t done = 0;
   for (const std::string& argument : options.arguments) {
     const Deletion deletion = deleting.run(argument);
-    if (client::isUnreachable(deletion.error)) return complain(deletion.error);
+    if (rpc::isUnreachable(deletion.error)) return complain(deletion.error);
     const bool deleted = !deletion.error && deletion.messages > 0;
     if (deleted) {
       text += lineOf(argument, deletion);

@@ -6,7 +6,7 @@
 #include <iterator>
 #include <string_view>
 
-#include "client/Channel.h"
+#include "rpc/Channel.h"
 
 namespace cli {
 
@@ -49,7 +49,7 @@ std::string plainText(const TLError& error) {
     return error.domain == one.domain && error.code == one.code;
   });
   if (row != std::end(kRows)) return row->text;
-  if (error.domain == client::kProtocolDomain) return withoutName(error.message);
+  if (error.domain == rpc::kProtocolDomain) return withoutName(error.message);
   if (error.domain == kStoreDomain) {
     return fmt::format("the daemon's store failed{}{}", error.message.empty() ? "" : ": ",
                        error.message);

@@ -8,7 +8,7 @@
 #include "modification/TALSynonyms.h"
 #include "platform/Paths.h"
 #include "query/TALQueryProcessor.h"
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 
 namespace cli {

@@ -3,7 +3,7 @@
 #include <algorithm>
 
 #include "cli/MessageParser.h"
-#include "indexer/TALHTMLParsing.h"
+#include "html/TALHTMLParsing.h"
 
 namespace cli {
 

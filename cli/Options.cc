@@ -11,7 +11,7 @@
 #include "cli/Arguments.h"
 #include "cli/Examples.h"
 #include "cli/NearestName.h"
-#include "client/Channel.h"
+#include "rpc/Channel.h"
 
 namespace cli {
 
@@ -339,7 +339,7 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
     return std::nullopt;
   }
   if (options.runtimeDirectory.empty()) {
-    options.runtimeDirectory = client::defaultRuntimeDirectory();
+    options.runtimeDirectory = rpc::defaultRuntimeDirectory();
   }
   return options;
 }

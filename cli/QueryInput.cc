@@ -6,7 +6,7 @@
 #include <array>
 #include <set>
 
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 
 namespace cli {

@@ -8,7 +8,7 @@
 
 #include "cli/TextMatch.h"
 #include "platform/Calendar.h"
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 #include "tokenizer/Tokenizer.h"
 

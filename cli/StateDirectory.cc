@@ -8,9 +8,9 @@
 #include <filesystem>
 
 #include "cli/Commands.h"
-#include "client/Channel.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
+#include "rpc/Channel.h"
 
 namespace cli {
 
@@ -52,7 +52,7 @@ std::string stateDirectory(const Options& options) {
 
 bool isUnknownClass(const Options& options) {
   const bool told = !options.stateDirectory.empty() || !variable("STATE_DIRECTORY").empty();
-  if (!told && options.runtimeDirectory != client::defaultRuntimeDirectory()) return false;
+  if (!told && options.runtimeDirectory != rpc::defaultRuntimeDirectory()) return false;
   if (!platform::namesOneDirectory(options.protectionClass)) return false;
   const std::string state = stateDirectory(options);
   if (!platform::fileExists(platform::processLockPath(state))) return false;

@@ -5,7 +5,7 @@
 
 #include <algorithm>
 
-#include "indexer/TALHTMLParsing.h"
+#include "html/TALHTMLParsing.h"
 #include "tokenizer/TLLexemonAssetManager.h"
 #include "tokenizer/Tokenizer.h"
 

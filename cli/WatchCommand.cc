@@ -69,7 +69,7 @@ class WatchLoop {
   bool add(const MailboxGroup& group, TLErrorOut error) {
     mailsync::WatchSettings settings;
     settings.sync = syncSettings(_options, group);
-    settings.sync.patience = client::Patience(0);  // the watch has its own
+    settings.sync.patience = rpc::Patience(0);  // the watch has its own
     settings.roots = group.roots;
     settings.onBattery = group.onBattery || _options.onBattery;
     const mailsync::WatchObserver observer{

@@ -1,7 +1,7 @@
 #include "client/Batches.h"
 
-#include "client/Channel.h"
-#include "platform/RPC.h"
+#include "rpc/Channel.h"
+#include "rpc/Server.h"
 
 namespace client {
 
@@ -64,12 +64,12 @@ std::optional<std::vector<std::span<const Element>>> split(std::span<const Eleme
     const size_t size = sizeOf(elements[i]);
     if (size > limit) {
       platform::setError(error,
-                         {kClientDomain, kTooLarge,
+                         {rpc::kClientDomain, kTooLarge,
                           fmt::format("{} takes {} bytes, more than the {} that one call can carry",
                                       nameOf(elements[i]).substr(0, kNameLength), size, limit)});
       return std::nullopt;
     }
-    if (bytes + size > limit || i - begin == platform::kMaxArrayElements) {
+    if (bytes + size > limit || i - begin == rpc::kMaxArrayElements) {
       pieces.push_back(elements.subspan(begin, i - begin));
       begin = i;
       bytes = 0;
@@ -104,7 +104,7 @@ std::optional<std::string> encode(const TLQuery& query, TLErrorOut error, size_t
                          limit);
   }
   if (broken.empty()) return bytes;
-  platform::setError(error, {kClientDomain, kTooLarge, "the query " + broken});
+  platform::setError(error, {rpc::kClientDomain, kTooLarge, "the query " + broken});
   return std::nullopt;
 }
 

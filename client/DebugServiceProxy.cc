@@ -9,7 +9,7 @@ namespace client {
 
 namespace {
 
-Channel::Body readText(std::optional<std::string>& text) {
+rpc::Channel::Body readText(std::optional<std::string>& text) {
   return [&text](sd_bus_message* reply) {
     const char* value = nullptr;
     const int result = sd_bus_message_read(reply, "s", &value);
@@ -18,7 +18,7 @@ Channel::Body readText(std::optional<std::string>& text) {
   };
 }
 
-Channel::Body appendTexts(const std::string& first, const std::string& second) {
+rpc::Channel::Body appendTexts(const std::string& first, const std::string& second) {
   return [&](sd_bus_message* call) {
     return sd_bus_message_append(call, "ss", first.c_str(), second.c_str());
   };
@@ -94,7 +94,7 @@ int readEntry(sd_bus_message* reply, Statistics& statistics) {
 std::optional<std::string> DebugServiceProxy::ping(const std::string& input, TLErrorOut error) {
   std::optional<std::string> text;
   _channel.call(
-      "Ping", kShortTimeout,
+      "Ping", rpc::kShortTimeout,
       [&](sd_bus_message* call) { return sd_bus_message_append(call, "s", input.c_str()); },
       readText(text), error);
   return text;
@@ -110,7 +110,7 @@ std::optional<Statistics> DebugServiceProxy::fetchStatsForIndexer(
     }
     return result;
   };
-  if (!_channel.call("FetchStatsForIndexer", kShortTimeout, appendTexts(name, protectionClass),
+  if (!_channel.call("FetchStatsForIndexer", rpc::kShortTimeout, appendTexts(name, protectionClass),
                      read, error)) {
     return std::nullopt;
   }
@@ -121,7 +121,7 @@ std::optional<std::string> DebugServiceProxy::fetchStatsForSalt(const std::strin
                                                                 const std::string& protectionClass,
                                                                 TLErrorOut error) {
   std::optional<std::string> text;
-  _channel.call("FetchStatsForSalt", kShortTimeout, appendTexts(name, protectionClass),
+  _channel.call("FetchStatsForSalt", rpc::kShortTimeout, appendTexts(name, protectionClass),
                 readText(text), error);
   return text;
 }
@@ -129,7 +129,7 @@ std::optional<std::string> DebugServiceProxy::fetchStatsForSalt(const std::strin
 bool DebugServiceProxy::forceVacuumAndCompact(const std::string& protectionClass,
                                               TLErrorOut error) {
   return _channel.call(
-      "ForceVacuumAndCompact", kLongTimeout,
+      "ForceVacuumAndCompact", rpc::kLongTimeout,
       [&](sd_bus_message* call) {
         return sd_bus_message_append(call, "s", protectionClass.c_str());
       },

@@ -7,11 +7,9 @@
 #include <variant>
 #include <vector>
 
-#include "client/Channel.h"
+#include "rpc/Channel.h"
 
 namespace client {
-
-inline constexpr const char* kDebugServiceName = "com.quill.tallow.DebugService";
 
 // Whole numbers are int64_t, even if the daemon sends them unsigned, unless they are too large for
 // it.
@@ -21,8 +19,9 @@ using Statistics = std::vector<std::pair<std::string, Statistic>>;
 // The daemon's diagnostic service; threads and errors as in SearchServiceProxy.
 class DebugServiceProxy {
  public:
-  explicit DebugServiceProxy(const std::string& runtimeDirectory, Patience patience = Patience(0))
-      : _channel(runtimeDirectory, kDebugServiceName, patience) {}
+  explicit DebugServiceProxy(const std::string& runtimeDirectory,
+                             rpc::Patience patience = rpc::Patience(0))
+      : _channel(runtimeDirectory, rpc::kDebugServiceName, patience) {}
 
   // A text about the daemon that contains `input`.
   [[nodiscard]] std::optional<std::string> ping(const std::string& input, TLErrorOut error);
@@ -40,7 +39,7 @@ class DebugServiceProxy {
   bool forceVacuumAndCompact(const std::string& protectionClass, TLErrorOut error);
 
  private:
-  Channel _channel;
+  rpc::Channel _channel;
 };
 
 }  // namespace client

@@ -70,7 +70,7 @@ bool SearchServiceProxy::indexItems(std::span<const EncodedItem> items, const st
       const int result = appendItems(call, piece);
       return result < 0 ? result : appendNames(call, name, protectionClass);
     };
-    if (!_channel.call("IndexItems", kLongTimeout, append, nothing, error)) return false;
+    if (!_channel.call("IndexItems", rpc::kLongTimeout, append, nothing, error)) return false;
   }
   return true;
 }
@@ -85,7 +85,7 @@ bool SearchServiceProxy::callWithTexts(const char* member, std::span<const std::
       const int result = appendTexts(call, piece);
       return result < 0 ? result : appendNames(call, name, protectionClass);
     };
-    if (!_channel.call(member, kLongTimeout, append, nothing, error)) return false;
+    if (!_channel.call(member, rpc::kLongTimeout, append, nothing, error)) return false;
   }
   return true;
 }
@@ -136,7 +136,7 @@ bool SearchServiceProxy::indexItems(std::span<const EncodedItem> items,
     if (result >= 0) result = appendBytes(call, clientState.value_or(std::string()));
     return result < 0 ? result : appendNames(call, name, protectionClass);
   };
-  return _channel.call("IndexItemsDeleteItemsWithIdentifiers", kLongTimeout, append, nothing,
+  return _channel.call("IndexItemsDeleteItemsWithIdentifiers", rpc::kLongTimeout, append, nothing,
                        error);
 }
 
@@ -152,7 +152,7 @@ std::optional<std::string> SearchServiceProxy::fetchLastClientState(
     return result;
   };
   _channel.call(
-      "FetchLastClientState", kShortTimeout,
+      "FetchLastClientState", rpc::kShortTimeout,
       [&](sd_bus_message* call) { return appendNames(call, name, protectionClass); }, read, error);
   return state;
 }
@@ -160,7 +160,7 @@ std::optional<std::string> SearchServiceProxy::fetchLastClientState(
 bool SearchServiceProxy::deleteAllItems(const std::string& name, const std::string& protectionClass,
                                         TLErrorOut error) {
   return _channel.call(
-      "DeleteAllItems", kLongTimeout,
+      "DeleteAllItems", rpc::kLongTimeout,
       [&](sd_bus_message* call) { return appendNames(call, name, protectionClass); }, nothing,
       error);
 }
@@ -178,7 +178,7 @@ std::optional<SearchServiceProxy::Items> SearchServiceProxy::searchItems(
                : sd_bus_message_append(call, "tsx", options, protectionClass.c_str(), maxResults);
   };
   const auto read = [&](sd_bus_message* reply) { return readItems(reply, items); };
-  if (!_channel.call("SearchItemsForQuery", kShortTimeout, append, read, error)) {
+  if (!_channel.call("SearchItemsForQuery", rpc::kShortTimeout, append, read, error)) {
     return std::nullopt;
   }
   return items;
@@ -187,8 +187,8 @@ std::optional<SearchServiceProxy::Items> SearchServiceProxy::searchItems(
 std::optional<std::vector<ReplacedWord>> SearchServiceProxy::replacedWords(TLErrorOut error) {
   std::vector<ReplacedWord> words;
   const auto read = [&](sd_bus_message* reply) { return readReplacedWords(reply, words); };
-  if (!_channel.call(kSearchExplanationName, "FetchReplacedWords", kShortTimeout, nothing, read,
-                     error)) {
+  if (!_channel.call(rpc::kSearchExplanationName, "FetchReplacedWords", rpc::kShortTimeout, nothing,
+                     read, error)) {
     return std::nullopt;
   }
   return words;

@@ -9,14 +9,12 @@
 #include <vector>
 
 #include "client/Batches.h"
-#include "client/Channel.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
+#include "rpc/Channel.h"
 
+// The client library: everything that a client program needs to talk to the daemon.
 namespace client {
-
-inline constexpr const char* kSearchServiceName = "com.quill.tallowsearch.SearchService";
-inline constexpr const char* kSearchExplanationName = "com.quill.tallowsearch.SearchExplanation";
 
 // A word that a search replaced because it found too little as typed.
 struct ReplacedWord {
@@ -35,8 +33,9 @@ struct ReplacedWord {
 // operation; earlier calls keep their effect.
 class SearchServiceProxy {
  public:
-  explicit SearchServiceProxy(const std::string& runtimeDirectory, Patience patience = Patience(0))
-      : _channel(runtimeDirectory, kSearchServiceName, patience) {}
+  explicit SearchServiceProxy(const std::string& runtimeDirectory,
+                              rpc::Patience patience = rpc::Patience(0))
+      : _channel(runtimeDirectory, rpc::kSearchServiceName, patience) {}
 
   // `name` identifies the client in the daemon's log and its client state; `protectionClass`
   // selects the index.
@@ -81,7 +80,7 @@ class SearchServiceProxy {
   bool callWithTexts(const char* member, std::span<const std::string> texts,
                      const std::string& name, const std::string& protectionClass, TLErrorOut error);
 
-  Channel _channel;
+  rpc::Channel _channel;
 };
 
 }  // namespace client

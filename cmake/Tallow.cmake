@@ -34,12 +34,14 @@ function(tallow_library name)
   add_library(${name} STATIC ${ARG_SOURCES})
   target_link_libraries(${name} PUBLIC tallow_flags ${ARG_DEPS})
   target_compile_options(${name} PRIVATE -Wconversion -Wno-sign-conversion)
+  tallow_note_folder(${name})
 endfunction()
 
 function(tallow_program name)
   cmake_parse_arguments(ARG "" "" "SOURCES;DEPS" ${ARGN})
   add_executable(${name} ${ARG_SOURCES})
   target_link_libraries(${name} PRIVATE tallow_flags ${ARG_DEPS})
+  tallow_note_folder(${name})
 endfunction()
 
 # tallow_test(NAME SOURCES ... DEPS ...): one GoogleTest program; every case is a ctest of its own, so
@@ -48,6 +50,14 @@ function(tallow_test name)
   cmake_parse_arguments(ARG "" "" "SOURCES;DEPS" ${ARGN})
   tallow_program(${name} SOURCES ${ARG_SOURCES} DEPS tallow_test_support ${ARG_DEPS})
   gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES TIMEOUT 300)
+endfunction()
+
+# tallow_test_library(NAME SOURCES ... DEPS ...): what tests of several folders share.
+function(tallow_test_library name)
+  cmake_parse_arguments(ARG "" "" "SOURCES;DEPS" ${ARGN})
+  add_library(${name} STATIC ${ARG_SOURCES})
+  target_link_libraries(${name} PUBLIC tallow_flags ${ARG_DEPS})
+  tallow_note_folder(${name})
 endfunction()
 
 # tallow_benchmark(NAME ...): a Google Benchmark program.

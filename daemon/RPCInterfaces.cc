@@ -2,15 +2,15 @@
 
 #include <utility>
 
-using platform::RPCArguments;
-using platform::RPCInterface;
-using platform::RPCValues;
-using Reply = std::shared_ptr<platform::RPCReply>;
+using rpc::Arguments;
+using rpc::Interface;
+using rpc::Values;
+using Reply = std::shared_ptr<rpc::Reply>;
 
 namespace {
 
 // Decodes the items of a call; if one is invalid, refuses the call and returns nullopt.
-std::optional<TALSearchService::Items> readItems(RPCArguments& arguments, const Reply& reply) {
+std::optional<TALSearchService::Items> readItems(rpc::Arguments& arguments, const Reply& reply) {
   const auto encoded = arguments.readBytesArray();
   TALSearchService::Items items;
   items.reserve(encoded.size());
@@ -18,7 +18,7 @@ std::optional<TALSearchService::Items> readItems(RPCArguments& arguments, const 
     auto item = std::make_shared<TLIndexableItem>();
     if (!item->initWithData(encoded[i])) {
       reply->sendFailure(
-          platform::kRPCInvalidArgs,
+          rpc::kInvalidArgs,
           fmt::format("argument 0 (items), index {}: the bytes are no TLIndexableItem", i));
       return std::nullopt;
     }
@@ -27,7 +27,7 @@ std::optional<TALSearchService::Items> readItems(RPCArguments& arguments, const 
   return items;
 }
 
-TALSearchService::Strings readStrings(RPCArguments& arguments) {
+TALSearchService::Strings readStrings(rpc::Arguments& arguments) {
   TALSearchService::Strings strings;
   for (const std::string_view text : arguments.readStringArray()) {
     strings.push_back(platform::fromUTF8(text));
@@ -45,7 +45,7 @@ TLErrorReply replyWithError(const Reply& reply) {
   };
 }
 
-void indexItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void indexItems(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   auto items = readItems(arguments, reply);
   if (!items) return;
   const std::string name(arguments.readString());
@@ -53,7 +53,7 @@ void indexItems(TALSearchService& service, RPCArguments& arguments, const Reply&
   service.indexItems(std::move(*items), name, protectionClass, replyWithError(reply));
 }
 
-void deleteItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void deleteItems(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   auto identifiers = readStrings(arguments);
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
@@ -61,7 +61,7 @@ void deleteItems(TALSearchService& service, RPCArguments& arguments, const Reply
                                      replyWithError(reply));
 }
 
-void indexAndDeleteItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void indexAndDeleteItems(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   auto items = readItems(arguments, reply);
   if (!items) return;
   auto identifiers = readStrings(arguments);
@@ -75,18 +75,18 @@ void indexAndDeleteItems(TALSearchService& service, RPCArguments& arguments, con
                      protectionClass, replyWithError(reply));
 }
 
-void fetchState(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void fetchState(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
   service.fetchLastClientStateFromIndexerNamed(
       name, protectionClass,
       [reply](const std::optional<std::string>& state, const std::optional<TLError>& error) {
         if (error) return reply->sendError(*error);
-        reply->send({state.has_value(), platform::RPCBytes{state.value_or("")}});
+        reply->send({state.has_value(), rpc::Bytes{state.value_or("")}});
       });
 }
 
-void deleteDomains(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void deleteDomains(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   auto domains = readStrings(arguments);
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
@@ -94,18 +94,18 @@ void deleteDomains(TALSearchService& service, RPCArguments& arguments, const Rep
                                            replyWithError(reply));
 }
 
-void deleteAll(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void deleteAll(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
   service.deleteAllItemsFromIndexerNamed(name, protectionClass, replyWithError(reply));
 }
 
-void searchItems(TALSearchService& service, RPCArguments& arguments, const Reply& reply,
+void searchItems(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply,
                  WordReplacements& replaced) {
   replaced.clear();
   TLQuery query;
   if (!query.initWithData(arguments.readBytes())) {
-    reply->sendFailure(platform::kRPCInvalidArgs, "argument 0 (query): the bytes are no TLQuery");
+    reply->sendFailure(rpc::kInvalidArgs, "argument 0 (query): the bytes are no TLQuery");
     return;
   }
   const uint64_t options = arguments.readUInt64();
@@ -116,7 +116,7 @@ void searchItems(TALSearchService& service, RPCArguments& arguments, const Reply
       [&reply](const std::optional<TALSearchService::Items>& items,
                const std::optional<TLError>& error) {
         if (error) return reply->sendError(*error);
-        platform::RPCBytesArray encoded;
+        rpc::BytesArray encoded;
         encoded.reserve(items->size());
         for (const auto& item : *items) encoded.push_back(item->data());
         reply->send({std::move(encoded)});
@@ -136,13 +136,13 @@ const char* nameOf(WordReplacement::Reason reason) {
   return "stem";
 }
 
-void ping(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void ping(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   service.ping(std::string(arguments.readString()),
                [&reply](const std::string& text) { reply->send({text}); });
 }
 
-platform::RPCDictionary toDictionary(const nlohmann::json& stats) {
-  platform::RPCDictionary dictionary;
+rpc::Dictionary toDictionary(const nlohmann::json& stats) {
+  rpc::Dictionary dictionary;
   if (!stats.is_object()) return dictionary;
   for (const auto& [key, value] : stats.items()) {
     if (value.is_number_float()) {
@@ -156,7 +156,7 @@ platform::RPCDictionary toDictionary(const nlohmann::json& stats) {
   return dictionary;
 }
 
-void fetchIndexerStats(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void fetchIndexerStats(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
   service.fetchStatsForIndexerNamed(
@@ -167,7 +167,7 @@ void fetchIndexerStats(TALSearchService& service, RPCArguments& arguments, const
       });
 }
 
-void fetchSaltStats(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void fetchSaltStats(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   const std::string name(arguments.readString());
   const std::string protectionClass(arguments.readString());
   service.fetchStatsForSaltNamed(
@@ -178,26 +178,25 @@ void fetchSaltStats(TALSearchService& service, RPCArguments& arguments, const Re
       });
 }
 
-void forceVacuum(TALSearchService& service, RPCArguments& arguments, const Reply& reply) {
+void forceVacuum(TALSearchService& service, rpc::Arguments& arguments, const Reply& reply) {
   service.forceVacuumAndCompactForProtectionClass(std::string(arguments.readString()),
                                                   replyWithError(reply));
 }
 
-using Operation = void (*)(TALSearchService&, RPCArguments&, const Reply&);
+using Operation = void (*)(TALSearchService&, rpc::Arguments&, const Reply&);
 
-platform::RPCMethod method(TALSearchService& service, const char* member, const char* input,
-                           const char* output, std::vector<const char*> names,
-                           Operation operation) {
+rpc::Method method(TALSearchService& service, const char* member, const char* input,
+                   const char* output, std::vector<const char*> names, Operation operation) {
   return {member, input, output, std::move(names),
-          [&service, operation](RPCArguments& arguments, Reply reply) {
+          [&service, operation](rpc::Arguments& arguments, Reply reply) {
             operation(service, arguments, reply);
           }};
 }
 
 }  // namespace
 
-RPCInterface makeSearchServiceProtocol(TALSearchService& service,
-                                       std::shared_ptr<WordReplacements> lastReplaced) {
+rpc::Interface makeSearchServiceProtocol(TALSearchService& service,
+                                         std::shared_ptr<WordReplacements> lastReplaced) {
   return {{
       method(service, "IndexItems", "aayss", "", {"items", "toIndexerNamed", "protectionClass"},
              indexItems),
@@ -217,24 +216,24 @@ RPCInterface makeSearchServiceProtocol(TALSearchService& service,
        "aytsx",
        "aay",
        {"query", "options", "protectionClass", "maxResults", "items"},
-       [&service, lastReplaced](RPCArguments& arguments, Reply reply) {
+       [&service, lastReplaced](rpc::Arguments& arguments, Reply reply) {
          searchItems(service, arguments, reply, *lastReplaced);
        }},
   }};
 }
 
-RPCInterface makeSearchExplanationProtocol(std::shared_ptr<const WordReplacements> lastReplaced) {
-  const auto fetch = [lastReplaced](RPCArguments&, Reply reply) {
-    platform::RPCTextRows rows;
+rpc::Interface makeSearchExplanationProtocol(std::shared_ptr<const WordReplacements> lastReplaced) {
+  const auto fetch = [lastReplaced](rpc::Arguments&, Reply reply) {
+    rpc::TextRows rows;
     for (const WordReplacement& word : *lastReplaced) {
       rows.push_back({word.typed, word.replacement, nameOf(word.reason)});
     }
     reply->send({std::move(rows)});
   };
-  return {{{"FetchReplacedWords", "", "a(sss)", {"replaced"}, fetch}}, kSearchExplanationName};
+  return {{{"FetchReplacedWords", "", "a(sss)", {"replaced"}, fetch}}, rpc::kSearchExplanationName};
 }
 
-RPCInterface makeDebugServiceProtocol(TALSearchService& service) {
+rpc::Interface makeDebugServiceProtocol(TALSearchService& service) {
   return {{
       method(service, "Ping", "s", "s", {"input", "reply"}, ping),
       method(service, "FetchStatsForIndexer", "ss", "a{sv}",

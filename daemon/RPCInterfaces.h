@@ -1,11 +1,7 @@
 #pragma once
 
 #include "daemon/TALSearchService.h"
-#include "platform/RPC.h"
-
-inline constexpr const char* kSearchServiceName = "com.quill.tallowsearch.SearchService";
-inline constexpr const char* kSearchExplanationName = "com.quill.tallowsearch.SearchExplanation";
-inline constexpr const char* kDebugServiceName = "com.quill.tallow.DebugService";
+#include "rpc/Server.h"
 
 // The operations of the two services as members of their RPC interfaces. Records are decoded here:
 // a call with invalid bytes is refused before anything is done, with the argument and the index in
@@ -13,8 +9,8 @@ inline constexpr const char* kDebugServiceName = "com.quill.tallow.DebugService"
 //
 // The interfaces of the search service belong to one connection and its thread: they share the
 // words that its last search replaced.
-[[nodiscard]] platform::RPCInterface makeSearchServiceProtocol(
+[[nodiscard]] rpc::Interface makeSearchServiceProtocol(
     TALSearchService& service, std::shared_ptr<WordReplacements> lastReplaced);
-[[nodiscard]] platform::RPCInterface makeSearchExplanationProtocol(
+[[nodiscard]] rpc::Interface makeSearchExplanationProtocol(
     std::shared_ptr<const WordReplacements> lastReplaced);
-[[nodiscard]] platform::RPCInterface makeDebugServiceProtocol(TALSearchService& service);
+[[nodiscard]] rpc::Interface makeDebugServiceProtocol(TALSearchService& service);

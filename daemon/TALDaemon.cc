@@ -35,9 +35,9 @@ TALDaemon::TALDaemon(platform::RunLoop& loop, const std::string& path,
                      const std::string& runtimeDirectory)
     : _searchService(std::make_unique<TALSearchService>(std::make_shared<TALIndexerManager>(path))),
       _debugServiceProtocol(makeDebugServiceProtocol(*_searchService)),
-      _searchServiceListener(platform::makeRPCListener(loop, runtimeDirectory, kSearchServiceName)),
-      _debugServiceListener(platform::makeRPCListener(loop, runtimeDirectory, kDebugServiceName)) {
-  const auto delegate = [this](platform::RPCListener& from, platform::RPCConnection& connection) {
+      _searchServiceListener(rpc::makeListener(loop, runtimeDirectory, rpc::kSearchServiceName)),
+      _debugServiceListener(rpc::makeListener(loop, runtimeDirectory, rpc::kDebugServiceName)) {
+  const auto delegate = [this](rpc::Listener& from, rpc::Connection& connection) {
     return listener(from, connection);
   };
   _searchServiceListener->setDelegate(delegate);
@@ -46,15 +46,15 @@ TALDaemon::TALDaemon(platform::RunLoop& loop, const std::string& path,
 
 TALDaemon::~TALDaemon() = default;
 
-bool TALDaemon::listener(platform::RPCListener&, platform::RPCConnection& connection) {
+bool TALDaemon::listener(rpc::Listener&, rpc::Connection& connection) {
   log().standard("accept new connection: {}", connection.description());
-  if (connection.serviceName() == kSearchServiceName) {
+  if (connection.serviceName() == rpc::kSearchServiceName) {
     const auto lastReplaced = std::make_shared<WordReplacements>();
     connection.addExportedInterface(makeSearchServiceProtocol(*_searchService, lastReplaced));
     connection.addExportedInterface(makeSearchExplanationProtocol(lastReplaced));
     return true;
   }
-  if (connection.serviceName() == kDebugServiceName) {
+  if (connection.serviceName() == rpc::kDebugServiceName) {
     connection.addExportedInterface(_debugServiceProtocol);
     return true;
   }

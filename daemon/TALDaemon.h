@@ -5,8 +5,8 @@
 #include "daemon/RPCInterfaces.h"
 #include "daemon/TALSearchService.h"
 #include "platform/Log.h"
-#include "platform/RPC.h"
 #include "platform/RunLoop.h"
+#include "rpc/Server.h"
 
 // Owns the one service object of the process and the two listeners that export it.
 //
@@ -25,12 +25,11 @@ class TALDaemon {
   ~TALDaemon();
 
   [[nodiscard]] TALSearchService& searchService() { return *_searchService; }
-  [[nodiscard]] platform::RPCListener& searchServiceListener() { return *_searchServiceListener; }
-  [[nodiscard]] platform::RPCListener& debugServiceListener() { return *_debugServiceListener; }
+  [[nodiscard]] rpc::Listener& searchServiceListener() { return *_searchServiceListener; }
+  [[nodiscard]] rpc::Listener& debugServiceListener() { return *_debugServiceListener; }
 
   // Exports the interface of a service, chosen by the service name alone, to a new connection.
-  [[nodiscard]] bool listener(platform::RPCListener& listener,
-                              platform::RPCConnection& shouldAcceptNewConnection);
+  [[nodiscard]] bool listener(rpc::Listener& listener, rpc::Connection& shouldAcceptNewConnection);
 
   // Starts listening; further calls do nothing. False when a socket is unavailable.
   bool run(TLErrorOut error);
@@ -47,8 +46,8 @@ class TALDaemon {
   TALDaemon(platform::RunLoop& loop, const std::string& path, const std::string& runtimeDirectory);
 
   std::unique_ptr<TALSearchService> _searchService;
-  platform::RPCInterface _debugServiceProtocol;
-  std::unique_ptr<platform::RPCListener> _searchServiceListener;
-  std::unique_ptr<platform::RPCListener> _debugServiceListener;
+  rpc::Interface _debugServiceProtocol;
+  std::unique_ptr<rpc::Listener> _searchServiceListener;
+  std::unique_ptr<rpc::Listener> _debugServiceListener;
   bool _running = false;
 };

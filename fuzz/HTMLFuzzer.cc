@@ -1,7 +1,7 @@
 #include <cstddef>
 #include <cstdint>
 
-#include "indexer/TALHTMLParsing.h"
+#include "html/TALHTMLParsing.h"
 #include "platform/Assert.h"
 
 // The first byte selects the encoding, the rest is the document. The text must not be longer than

@@ -8,7 +8,7 @@
 
 #include "platform/Assert.h"
 #include "platform/Log.h"
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 
 namespace {
 

@@ -10,21 +10,21 @@
 #include <string_view>
 
 #include "platform/Assert.h"
-#include "platform/RPCConnection.h"
+#include "rpc/ServerConnection.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
 #include "tests/support/RawMessages.h"
 
 namespace {
 
-using platform::RPCArguments;
-using platform::RPCReply;
+using rpc::Arguments;
+using rpc::Reply;
 
 constexpr const char* kService = "f.f";  // short, so that random input can match it
 
 // Reads all arguments and decodes records, like the handlers of the daemon.
-void handle(const char* signature, RPCArguments& arguments,
-            const std::shared_ptr<RPCReply>& reply) {
+void handle(const char* signature, rpc::Arguments& arguments,
+            const std::shared_ptr<rpc::Reply>& reply) {
   size_t sum = 0;
   for (const char* type = signature; *type != 0; ++type) {
     const std::string_view rest = type;
@@ -54,9 +54,9 @@ void handle(const char* signature, RPCArguments& arguments,
   reply->send({std::to_string(sum)});
 }
 
-const platform::RPCInterface& interface() {
-  static const platform::RPCInterface made = [] {
-    platform::RPCInterface methods;
+const rpc::Interface& interface() {
+  static const rpc::Interface made = [] {
+    rpc::Interface methods;
     int number = 0;
     static const char* const names[] = {"A", "B", "C", "D", "E", "F"};
     for (const char* signature : {"aayss", "asss", "aayasbayss", "ss", "aytsx", "s"}) {
@@ -65,7 +65,7 @@ const platform::RPCInterface& interface() {
            signature,
            "s",
            {},
-           [signature](RPCArguments& arguments, const std::shared_ptr<RPCReply>& reply) {
+           [signature](rpc::Arguments& arguments, const std::shared_ptr<rpc::Reply>& reply) {
              handle(signature, arguments, reply);
            }});
     }
@@ -86,7 +86,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (size > kFitsSocket || socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return 0;
   fcntl(ends[1], F_SETFL, O_NONBLOCK);
   {
-    platform::RPCServerConnection connection(ends[1], kService, "fuzzer");
+    rpc::ServerConnection connection(ends[1], kService, "fuzzer");
     connection.addExportedInterface(interface());
     bool ended = false;
     if (connection.open([&ended] { ended = true; })) {

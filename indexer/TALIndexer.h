@@ -11,7 +11,7 @@
 #include "docstore/TALDocStore.h"
 #include "indexer/DocDates.h"
 #include "indexer/OpenText.h"
-#include "indexer/TALZoneManager.h"
+#include "zones/TALZoneManager.h"
 #include "indexer/WordReplacement.h"
 #include "modification/TALStemRewrite.h"
 #include "modification/TALSynonyms.h"

@@ -2,7 +2,7 @@
 
 #include <array>
 
-#include "indexer/TALHTMLParsing.h"
+#include "html/TALHTMLParsing.h"
 
 namespace {
 

@@ -1,7 +1,7 @@
 #pragma once
 
-#include "indexer/TALZoneManager.h"
-#include "indexer/zone.h"
+#include "zones/TALZoneManager.h"
+#include "zones/zone.h"
 #include "records/TLIndexableItem.h"
 #include "tokenizer/Tokenizer.h"
 

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "indexer/TALZoneManager.h"
+#include "zones/TALZoneManager.h"
 #include "modification/TALSynonyms.h"
 #include "platform/Log.h"
 #include "query/TALTerm.h"

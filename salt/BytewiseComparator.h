@@ -1,6 +1,7 @@
 #pragma once
 
 #include <leveldb/comparator.h>
+#include <leveldb/slice.h>
 
 #include <bit>
 #include <cstdint>

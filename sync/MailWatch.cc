@@ -79,7 +79,7 @@ void MailWatch::turn(Time now) {
 void MailWatch::take(const Change& change, Time now) {
   if (change.kind == Change::Kind::lost) return _plan.lost(now);
   if (change.directory == _settings.sync.runtimeDirectory &&
-      change.name == client::kSearchServiceName) {
+      change.name == rpc::kSearchServiceName) {
     _plan.retry(now);
   }
   const std::string entry =

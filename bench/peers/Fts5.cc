@@ -6,7 +6,7 @@
 #include <stdexcept>
 
 #include "bench/Queries.h"
-#include "indexer/TALHTMLParsing.h"
+#include "html/TALHTMLParsing.h"
 
 namespace peers {
 

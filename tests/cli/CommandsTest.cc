@@ -11,7 +11,7 @@
 #include "cli/Commands.h"
 #include "cli/Identifier.h"
 #include "platform/Files.h"
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
 #include "tests/client/FakeDaemon.h"
@@ -52,10 +52,10 @@ class CommandsTest : public testing::Test {
   }
 
   void answerWith(std::vector<std::shared_ptr<TLIndexableItem>> items) {
-    platform::RPCBytesArray bytes;
+    rpc::BytesArray bytes;
     for (const auto& item : items) bytes.push_back(item->data());
     daemon.answer("SearchItemsForQuery",
-                  [bytes](platform::RPCReply& reply) { reply.send({bytes}); });
+                  [bytes](rpc::Reply& reply) { reply.send({bytes}); });
   }
 
   // The query of the last search that reached the daemon.
@@ -269,9 +269,9 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
 
   EXPECT_EQ(answer["changed"], nlohmann::json::array());
 
-  daemon.answer("FetchReplacedWords", [](platform::RPCReply& reply) {
+  daemon.answer("FetchReplacedWords", [](rpc::Reply& reply) {
     reply.send(
-        {platform::RPCTextRows{{"invocie", "inv\x1b", "spelling"}, {"dues", "due", "stem"}}});
+        {rpc::TextRows{{"invocie", "inv\x1b", "spelling"}, {"dues", "due", "stem"}}});
   });
   EXPECT_EQ(run({"search", "--format", "json", "invocie dues"}), ExitStatus::done);
   EXPECT_EQ(errors, "tallow: showing results for inv\uFFFD, due...\n");
@@ -410,15 +410,15 @@ TEST_F(CommandsTest, ResetWithoutATerminalNeedsYes) {
 }
 
 TEST_F(CommandsTest, Diagnostics) {
-  daemon.answer("FetchStatsForIndexer", [](platform::RPCReply& reply) {
-    reply.send({platform::RPCDictionary{{"Count", int64_t{3}}, {"Seconds", 0.5}}});
+  daemon.answer("FetchStatsForIndexer", [](rpc::Reply& reply) {
+    reply.send({rpc::Dictionary{{"Count", int64_t{3}}, {"Seconds", 0.5}}});
   });
   EXPECT_EQ(run({"stats"}), ExitStatus::done);
   EXPECT_THAT(output, testing::MatchesRegex("Count +3\nSeconds +0.5\n"));
   EXPECT_EQ(run({"stats", "--format=json"}), ExitStatus::done);
   EXPECT_EQ(nlohmann::json::parse(output), nlohmann::json::parse(R"({"Count":3,"Seconds":0.5})"));
-  daemon.answer("FetchStatsForIndexer", [](platform::RPCReply& reply) {
-    reply.send({platform::RPCDictionary{{"TLDebugServiceDocStoreNumOfItems", int64_t{30}},
+  daemon.answer("FetchStatsForIndexer", [](rpc::Reply& reply) {
+    reply.send({rpc::Dictionary{{"TLDebugServiceDocStoreNumOfItems", int64_t{30}},
                                         {"TLDebugServiceTextStoreNumOfItems", uint64_t{28}}}});
   });
   EXPECT_EQ(run({"stats"}), ExitStatus::done);
@@ -441,8 +441,8 @@ TEST_F(CommandsTest, State) {
   EXPECT_EQ(run({"state", "--name", "phone"}), ExitStatus::nothingFound);
   EXPECT_EQ(daemon.calls().back(), "FetchLastClientState(phone, default)");
   std::string bytes = "v1";
-  daemon.answer("FetchLastClientState", [&](platform::RPCReply& reply) {
-    reply.send({true, platform::RPCBytes{bytes}});
+  daemon.answer("FetchLastClientState", [&](rpc::Reply& reply) {
+    reply.send({true, rpc::Bytes{bytes}});
   });
   EXPECT_EQ(run({"state"}), ExitStatus::done);
   EXPECT_EQ(output, "7631\nv1\n");

@@ -221,7 +221,7 @@ TEST(IndexTest, AnInterruptLeavesASummary) {
   const auto read = [&](const char* name) {
     return platform::readFile(directory / name, 1000, nullptr).value_or("");
   };
-  daemon.answer("IndexItems", [&](platform::RPCReply& reply) {
+  daemon.answer("IndexItems", [&](rpc::Reply& reply) {
     kill(std::atoi(read("pid").c_str()), SIGINT);
     reply.send({});
   });

@@ -9,7 +9,7 @@ namespace testsupport {
 namespace {
 
 // The next argument, by its type; removes the type from the signature.
-std::string readArgument(platform::RPCArguments& arguments, std::string& signature,
+std::string readArgument(rpc::Arguments& arguments, std::string& signature,
                          std::vector<std::string>& items) {
   const auto take = [&](const char* type) {
     const std::string wanted(type);
@@ -37,29 +37,28 @@ std::string readArgument(platform::RPCArguments& arguments, std::string& signatu
 }  // namespace
 
 FakeDaemon::FakeDaemon() {
-  using platform::RPCBytes;
+  using rpc::Bytes;
   addMethod(_search, "IndexItems", "aayss", "", {});
   addMethod(_search, "DeleteItemsWithIdentifiers", "asss", "", {});
   addMethod(_search, "IndexItemsDeleteItemsWithIdentifiers", "aayasbayss", "", {});
-  addMethod(_search, "FetchLastClientState", "ss", "bay", {false, RPCBytes{}});
+  addMethod(_search, "FetchLastClientState", "ss", "bay", {false, rpc::Bytes{}});
   addMethod(_search, "DeleteItemsWithDomainIdentifiers", "asss", "", {});
   addMethod(_search, "DeleteAllItems", "ss", "", {});
-  addMethod(_search, "SearchItemsForQuery", "aytsx", "aay", {platform::RPCBytesArray{}});
+  addMethod(_search, "SearchItemsForQuery", "aytsx", "aay", {rpc::BytesArray{}});
   _explanation.name = "com.quill.tallowsearch.SearchExplanation";
-  addMethod(_explanation, "FetchReplacedWords", "", "a(sss)", {platform::RPCTextRows{}});
+  addMethod(_explanation, "FetchReplacedWords", "", "a(sss)", {rpc::TextRows{}});
   addMethod(_debug, "Ping", "s", "s", {std::string("pong")});
-  addMethod(_debug, "FetchStatsForIndexer", "ss", "a{sv}", {platform::RPCDictionary{}});
+  addMethod(_debug, "FetchStatsForIndexer", "ss", "a{sv}", {rpc::Dictionary{}});
   addMethod(_debug, "FetchStatsForSalt", "ss", "s", {std::string("metrics")});
   addMethod(_debug, "ForceVacuumAndCompact", "s", "", {});
   for (auto [name, interface] : {std::pair("com.quill.tallowsearch.SearchService", &_search),
                                  std::pair("com.quill.tallow.DebugService", &_debug)}) {
-    auto listener = platform::makeRPCListener(_loop, _directory.path(), name);
-    listener->setDelegate(
-        [this, interface = interface](auto&, platform::RPCConnection& connection) {
-          connection.addExportedInterface(*interface);
-          if (interface == &_search) connection.addExportedInterface(_explanation);
-          return true;
-        });
+    auto listener = rpc::makeListener(_loop, _directory.path(), name);
+    listener->setDelegate([this, interface = interface](auto&, rpc::Connection& connection) {
+      connection.addExportedInterface(*interface);
+      if (interface == &_search) connection.addExportedInterface(_explanation);
+      return true;
+    });
     std::optional<TLError> error;
     EXPECT_TRUE(listener->resume(&error)) << platform::printable(error);
     _listeners.push_back(std::move(listener));
@@ -78,18 +77,17 @@ void FakeDaemon::stop() {
   _thread.join();
 }
 
-void FakeDaemon::addMethod(platform::RPCInterface& interface, const char* member, const char* input,
+void FakeDaemon::addMethod(rpc::Interface& interface, const char* member, const char* input,
                            const char* output, Values values) {
-  interface.methods.push_back(
-      {member, input, output, std::vector<const char*>(),
-       [this, member, signature = std::string(input), values](
-           platform::RPCArguments& arguments, std::shared_ptr<platform::RPCReply> reply) {
-         serve(member, signature, values, arguments, *reply);
-       }});
+  interface.methods.push_back({member, input, output, std::vector<const char*>(),
+                               [this, member, signature = std::string(input), values](
+                                   rpc::Arguments& arguments, std::shared_ptr<rpc::Reply> reply) {
+                                 serve(member, signature, values, arguments, *reply);
+                               }});
 }
 
 void FakeDaemon::serve(const char* member, const std::string& signature, const Values& values,
-                       platform::RPCArguments& arguments, platform::RPCReply& reply) {
+                       rpc::Arguments& arguments, rpc::Reply& reply) {
   std::vector<std::string> texts;
   std::vector<std::string> items;
   for (std::string rest = signature; !rest.empty();) {

@@ -8,8 +8,8 @@
 #include <vector>
 
 #include "platform/Mutex.h"
-#include "platform/RPC.h"
 #include "platform/RunLoop.h"
+#include "rpc/Server.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace testsupport {
@@ -21,7 +21,7 @@ namespace testsupport {
 // call on.
 class FakeDaemon {
  public:
-  using Answer = std::function<void(platform::RPCReply&)>;
+  using Answer = std::function<void(rpc::Reply&)>;
 
   FakeDaemon();
   ~FakeDaemon();
@@ -42,17 +42,17 @@ class FakeDaemon {
   void stop();
 
  private:
-  using Values = platform::RPCValues;
+  using Values = rpc::Values;
 
-  void addMethod(platform::RPCInterface& interface, const char* member, const char* input,
+  void addMethod(rpc::Interface& interface, const char* member, const char* input,
                  const char* output, Values values);
   void serve(const char* member, const std::string& signature, const Values& values,
-             platform::RPCArguments& arguments, platform::RPCReply& reply);
+             rpc::Arguments& arguments, rpc::Reply& reply);
 
   TemporaryDirectory _directory;
-  platform::RPCInterface _search;
-  platform::RPCInterface _explanation;
-  platform::RPCInterface _debug;
+  rpc::Interface _search;
+  rpc::Interface _explanation;
+  rpc::Interface _debug;
   mutable platform::Mutex _mutex;
   std::map<std::string, Answer> _answers TL_GUARDED_BY(_mutex);
   std::map<std::string, std::vector<TLError>> _failures TL_GUARDED_BY(_mutex);
@@ -61,7 +61,7 @@ class FakeDaemon {
   std::string _refusedText TL_GUARDED_BY(_mutex);
   TLError _refusal TL_GUARDED_BY(_mutex);
   platform::RunLoop _loop;
-  std::vector<std::unique_ptr<platform::RPCListener>> _listeners;
+  std::vector<std::unique_ptr<rpc::Listener>> _listeners;
   std::thread _thread;
 };
 

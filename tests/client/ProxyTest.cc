@@ -50,8 +50,8 @@ TEST_F(ProxyTest, CallsCarryTheirArguments) {
 TEST_F(ProxyTest, SearchSendsTheQueryAndReadsTheItems) {
   TLIndexableItem item;
   item.setIdentifier(u"one");
-  daemon.answer("SearchItemsForQuery", [bytes = item.data()](platform::RPCReply& reply) {
-    reply.send({platform::RPCBytesArray{bytes, ""}});
+  daemon.answer("SearchItemsForQuery", [bytes = item.data()](rpc::Reply& reply) {
+    reply.send({rpc::BytesArray{bytes, ""}});
   });
   TLQuery query;
   query.setOriginalQuery(u"café ");
@@ -66,18 +66,18 @@ TEST_F(ProxyTest, SearchSendsTheQueryAndReadsTheItems) {
 TEST_F(ProxyTest, StateDistinguishesAbsentFromEmpty) {
   EXPECT_FALSE(search.fetchLastClientState("me", "c", &error).has_value());
   EXPECT_FALSE(error.has_value());
-  daemon.answer("FetchLastClientState", [](platform::RPCReply& reply) {
-    reply.send({true, platform::RPCBytes{}});
+  daemon.answer("FetchLastClientState", [](rpc::Reply& reply) {
+    reply.send({true, rpc::Bytes{}});
   });
   EXPECT_EQ(search.fetchLastClientState("me", "c", &error), "");
 }
 
 TEST_F(ProxyTest, StatisticsKeepTheirNumberTypes) {
-  const platform::RPCDictionary sent{{"z", int64_t{-1}},
-                                     {"a", uint64_t{7}},
-                                     {"m", std::numeric_limits<uint64_t>::max()},
-                                     {"d", 0.5}};
-  daemon.answer("FetchStatsForIndexer", [&](platform::RPCReply& reply) { reply.send({sent}); });
+  const rpc::Dictionary sent{{"z", int64_t{-1}},
+                             {"a", uint64_t{7}},
+                             {"m", std::numeric_limits<uint64_t>::max()},
+                             {"d", 0.5}};
+  daemon.answer("FetchStatsForIndexer", [&](rpc::Reply& reply) { reply.send({sent}); });
   const auto statistics = debug.fetchStatsForIndexer("me", "c", &error);
   ASSERT_TRUE(statistics.has_value()) << error->message;
   const client::Statistics expected{{"z", int64_t{-1}},
@@ -94,11 +94,11 @@ TEST_F(ProxyTest, PassesOnErrorsOfTheDaemon) {
   daemon.failOnce("DeleteAllItems", failure);
   EXPECT_FALSE(search.deleteAllItems("me", "c", &error));
   EXPECT_EQ(error, failure);
-  daemon.answer("ForceVacuumAndCompact", [](platform::RPCReply& reply) {
-    reply.sendFailure(platform::kRPCInvalidArgs, "argument 0 is bad");
+  daemon.answer("ForceVacuumAndCompact", [](rpc::Reply& reply) {
+    reply.sendFailure(rpc::kInvalidArgs, "argument 0 is bad");
   });
   EXPECT_FALSE(debug.forceVacuumAndCompact("c", &error));
-  EXPECT_EQ(error->domain, client::kProtocolDomain);
+  EXPECT_EQ(error->domain, rpc::kProtocolDomain);
   EXPECT_EQ(error->message, "argument 0 is bad (org.freedesktop.DBus.Error.InvalidArgs)");
   EXPECT_TRUE(search.deleteAllItems("me", "c", nullptr));  // the connection stays open
 }
@@ -106,7 +106,7 @@ TEST_F(ProxyTest, PassesOnErrorsOfTheDaemon) {
 TEST_F(ProxyTest, RefusesTextThatDBusCannotCarry) {
   const std::vector<std::string> texts{"\xFF"};
   EXPECT_FALSE(search.deleteItemsWithIdentifiers(texts, "me", "c", &error));
-  EXPECT_EQ(error->domain, client::kClientDomain);
+  EXPECT_EQ(error->domain, rpc::kClientDomain);
   EXPECT_TRUE(daemon.calls().empty());
 }
 
@@ -137,26 +137,26 @@ TEST_F(ProxyTest, AFailureEndsASplitCall) {
 TEST_F(ProxyTest, AbsentDaemonHasItsOwnErrorDomain) {
   SearchServiceProxy nowhere("/nonexistent");
   EXPECT_FALSE(nowhere.deleteAllItems("me", "c", &error));
-  EXPECT_TRUE(client::isUnreachable(error));
+  EXPECT_TRUE(rpc::isUnreachable(error));
   SearchServiceProxy tooLong(std::string(200, 'd'));
   EXPECT_FALSE(tooLong.deleteAllItems("me", "c", &error));
-  EXPECT_TRUE(client::isUnreachable(error));
+  EXPECT_TRUE(rpc::isUnreachable(error));
 
   EXPECT_TRUE(search.deleteAllItems("me", "c", nullptr));
   daemon.stop();
   EXPECT_FALSE(search.deleteAllItems("me", "c", &error));
-  EXPECT_TRUE(client::isUnreachable(error)) << platform::printable(error);
+  EXPECT_TRUE(rpc::isUnreachable(error)) << platform::printable(error);
 }
 
 TEST_F(ProxyTest, DaemonThatEndsDuringACallIsUnreachable) {
   std::thread stopper;
-  daemon.answer("Ping", [&](platform::RPCReply&) {
+  daemon.answer("Ping", [&](rpc::Reply&) {
     // Drops the reply. The listener joins this thread, so another one must stop it.
     stopper = std::thread([&] { daemon.stop(); });
   });
   EXPECT_FALSE(debug.ping("hello", &error).has_value());
   stopper.join();
-  EXPECT_TRUE(client::isUnreachable(error)) << platform::printable(error);
+  EXPECT_TRUE(rpc::isUnreachable(error)) << platform::printable(error);
 }
 
 TEST_F(ProxyTest, WaitsForTheSocketUntilPatienceRunsOut) {
@@ -164,7 +164,7 @@ TEST_F(ProxyTest, WaitsForTheSocketUntilPatienceRunsOut) {
   const std::string runtime = directory / "later";
   DebugServiceProxy hasty(runtime, std::chrono::milliseconds(1));
   EXPECT_FALSE(hasty.ping("", &error).has_value());
-  EXPECT_TRUE(client::isUnreachable(error));
+  EXPECT_TRUE(rpc::isUnreachable(error));
   std::thread starter([&] {
     // A directory that is created only now is noticed as well.
     EXPECT_EQ(rename(daemon.runtimeDirectory().c_str(), runtime.c_str()), 0);

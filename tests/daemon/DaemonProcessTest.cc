@@ -229,11 +229,11 @@ TEST_F(DaemonProcessTest, RefusesInvalidBytesNamingArgumentAndIndex) {
   const std::string tree = queryOfDepth(100000);
   sd_bus* bus = nullptr;
   sd_bus_new(&bus);
-  sd_bus_set_address(bus, ("unix:path=" + daemon.socketOf(client::kSearchServiceName)).c_str());
+  sd_bus_set_address(bus, ("unix:path=" + daemon.socketOf(rpc::kSearchServiceName)).c_str());
   ASSERT_GE(sd_bus_start(bus), 0);
   sd_bus_message* call = nullptr;
   sd_bus_message_new_method_call(bus, &call, nullptr, "/com/quill/tallowsearch/SearchService",
-                                 client::kSearchServiceName, "SearchItemsForQuery");
+                                 rpc::kSearchServiceName, "SearchItemsForQuery");
   sd_bus_message_append_array(call, 'y', tree.data(), tree.size());
   sd_bus_message_append(call, "tsx", uint64_t{0}, "default", int64_t{1});
   sd_bus_error refused{};
@@ -337,11 +337,11 @@ TEST_F(DaemonProcessTest, AcceptsSocketsFromSystemd) {
   const int search = listenAt(directory / "search");
   const int debug = listenAt(directory / "debug");
   DaemonProcess daemon(directory.path(), {search, debug},
-                       std::string(client::kSearchServiceName) + ":" + client::kDebugServiceName);
+                       std::string(rpc::kSearchServiceName) + ":" + rpc::kDebugServiceName);
   ASSERT_TRUE(daemon.ready());
   EXPECT_NE(introspect(directory / "debug", "/com/quill/tallow/DebugService").find("Ping"),
             std::string::npos);
-  EXPECT_FALSE(platform::fileExists(daemon.socketOf(client::kDebugServiceName)));
+  EXPECT_FALSE(platform::fileExists(daemon.socketOf(rpc::kDebugServiceName)));
   daemon.signal(SIGTERM);
   EXPECT_EQ(daemon.wait(), 0);
   EXPECT_TRUE(platform::fileExists(directory / "debug"));
@@ -352,8 +352,8 @@ TEST_F(DaemonProcessTest, AcceptsSocketsFromSystemd) {
 TEST_F(DaemonProcessTest, InterfacesMatchTheirDescriptions) {
   const DaemonProcess daemon(directory.path());
   const std::vector<std::pair<std::string, std::string>> services{
-      {client::kSearchServiceName, "/com/quill/tallowsearch/SearchService"},
-      {client::kDebugServiceName, "/com/quill/tallow/DebugService"}};
+      {rpc::kSearchServiceName, "/com/quill/tallowsearch/SearchService"},
+      {rpc::kDebugServiceName, "/com/quill/tallow/DebugService"}};
   for (const auto& [name, path] : services) {
     const auto file =
         platform::readFile(std::string(TALLOW_INTERFACES) + "/" + name + ".xml", 1 << 20, nullptr);
@@ -362,8 +362,8 @@ TEST_F(DaemonProcessTest, InterfacesMatchTheirDescriptions) {
     EXPECT_GE(expected.size(), 4u);
     const std::string served = introspect(daemon.socketOf(name), path);
     EXPECT_EQ(members(served, name), expected);
-    const auto beside = members(*file, client::kSearchExplanationName);
-    EXPECT_EQ(beside.size(), name == client::kSearchServiceName ? 1u : 0u);
-    EXPECT_EQ(members(served, client::kSearchExplanationName), beside);
+    const auto beside = members(*file, rpc::kSearchExplanationName);
+    EXPECT_EQ(beside.size(), name == rpc::kSearchServiceName ? 1u : 0u);
+    EXPECT_EQ(members(served, rpc::kSearchExplanationName), beside);
   }
 }

@@ -3,7 +3,7 @@
 #include <set>
 
 #include "daemon/TALSearchService.h"
-#include "query/TLQueryAdditions.h"
+#include "querylang/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"

@@ -16,18 +16,18 @@ const TLError kBroken{"Test", 5, "the call failed"};
 }  // namespace
 
 StoringDaemon::StoringDaemon() {
-  using platform::RPCArguments;
-  using Reply = std::shared_ptr<platform::RPCReply>;
+  using rpc::Arguments;
+  using Reply = std::shared_ptr<rpc::Reply>;
   const auto add = [&](const char* member, const char* input, const char* output, auto handler) {
     _interface.methods.push_back({member, input, output, std::vector<const char*>(), handler});
   };
-  add("DeleteItemsWithIdentifiers", "asss", "", [this](RPCArguments& arguments, Reply reply) {
+  add("DeleteItemsWithIdentifiers", "asss", "", [this](rpc::Arguments& arguments, Reply reply) {
     std::vector<std::string> identifiers;
     for (const auto text : arguments.readStringArray()) identifiers.emplace_back(text);
     change(identifiers, {}, std::nullopt, *reply);
   });
   add("IndexItemsDeleteItemsWithIdentifiers", "aayasbayss", "",
-      [this](RPCArguments& arguments, Reply reply) {
+      [this](rpc::Arguments& arguments, Reply reply) {
         std::vector<std::string> items;
         for (const auto bytes : arguments.readBytesArray()) items.emplace_back(bytes);
         std::vector<std::string> identifiers;
@@ -37,16 +37,16 @@ StoringDaemon::StoringDaemon() {
         if (!given) state.reset();
         change(identifiers, items, state, *reply);
       });
-  add("FetchLastClientState", "ss", "bay", [this](RPCArguments&, Reply reply) {
+  add("FetchLastClientState", "ss", "bay", [this](rpc::Arguments&, Reply reply) {
     const Content now = content();
-    reply->send({now.state.has_value(), platform::RPCBytes{now.state.value_or("")}});
+    reply->send({now.state.has_value(), rpc::Bytes{now.state.value_or("")}});
   });
-  add("SearchItemsForQuery", "aytsx", "aay", [this](RPCArguments& arguments, Reply reply) {
+  add("SearchItemsForQuery", "aytsx", "aay", [this](rpc::Arguments& arguments, Reply reply) {
     search(std::string(arguments.readBytes()), *reply);
   });
   _listener =
-      platform::makeRPCListener(_loop, _directory.path(), "com.quill.tallowsearch.SearchService");
-  _listener->setDelegate([this](auto&, platform::RPCConnection& connection) {
+      rpc::makeListener(_loop, _directory.path(), "com.quill.tallowsearch.SearchService");
+  _listener->setDelegate([this](auto&, rpc::Connection& connection) {
     connection.addExportedInterface(_interface);
     return true;
   });
@@ -63,7 +63,7 @@ StoringDaemon::~StoringDaemon() {
 
 void StoringDaemon::change(const std::vector<std::string>& identifiers,
                            const std::vector<std::string>& items,
-                           const std::optional<std::string>& state, platform::RPCReply& reply) {
+                           const std::optional<std::string>& state, rpc::Reply& reply) {
   const platform::MutexLock lock(_mutex);
   Fault fault = Fault::none;
   if (_fault != Fault::none && _faultIn-- == 0) fault = std::exchange(_fault, Fault::none);
@@ -90,11 +90,11 @@ void StoringDaemon::change(const std::vector<std::string>& identifiers,
 }
 
 // Of what an inventory asks for: items whose folder's path begins with a text.
-void StoringDaemon::search(const std::string& bytes, platform::RPCReply& reply) {
+void StoringDaemon::search(const std::string& bytes, rpc::Reply& reply) {
   TLQuery query;
   EXPECT_TRUE(query.initWithData(bytes));
   const TLString place(platform::orEmpty(query.root()->stringValue()));
-  platform::RPCBytesArray found;
+  rpc::BytesArray found;
   for (const auto& [identifier, item] : content().items) {
     const auto* folders = item->stringValuesForKey(TLAttributeKey::MAILBOX_IDENTIFIERS);
     if (folders != nullptr && folders->front().starts_with(place)) found.push_back(item->data());

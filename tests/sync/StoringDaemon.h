@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/Mutex.h"
-#include "platform/RPC.h"
+#include "rpc/Server.h"
 #include "platform/RunLoop.h"
 #include "records/TLIndexableItem.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -44,11 +44,11 @@ class StoringDaemon {
 
  private:
   void change(const std::vector<std::string>& identifiers, const std::vector<std::string>& items,
-              const std::optional<std::string>& state, platform::RPCReply& reply);
-  void search(const std::string& query, platform::RPCReply& reply);
+              const std::optional<std::string>& state, rpc::Reply& reply);
+  void search(const std::string& query, rpc::Reply& reply);
 
   TemporaryDirectory _directory;
-  platform::RPCInterface _interface;
+  rpc::Interface _interface;
   mutable platform::Mutex _mutex;
   Content _content TL_GUARDED_BY(_mutex);
   Fault _fault TL_GUARDED_BY(_mutex) = Fault::none;
@@ -56,7 +56,7 @@ class StoringDaemon {
   std::string _refused TL_GUARDED_BY(_mutex);
   size_t _received TL_GUARDED_BY(_mutex) = 0;
   platform::RunLoop _loop;
-  std::unique_ptr<platform::RPCListener> _listener;
+  std::unique_ptr<rpc::Listener> _listener;
   std::thread _thread;
 };
 

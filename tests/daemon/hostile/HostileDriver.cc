@@ -58,8 +58,8 @@ class GoodClient {
 
   // Runs until the stop or the first wrong answer, which is stored in `wrong`.
   void work(const std::stop_token& stop) {
-    SearchServiceProxy service(_directory, client::Patience(5000));
-    client::DebugServiceProxy debug(_directory, client::Patience(5000));
+    SearchServiceProxy service(_directory, rpc::Patience(5000));
+    client::DebugServiceProxy debug(_directory, rpc::Patience(5000));
     while (!stop.stop_requested() && wrong.empty()) {
       std::optional<TLError> error;
       const std::string prefix = fmt::format("good{}x", _rounds++);
@@ -127,8 +127,8 @@ struct Call {
 
 // One valid call of each operation.
 std::vector<Call> validCalls() {
-  const std::string search = client::kSearchServiceName;
-  const std::string debug = client::kDebugServiceName;
+  const std::string search = rpc::kSearchServiceName;
+  const std::string debug = rpc::kDebugServiceName;
   const auto items = testsupport::mails("bad", 2);
   const std::vector<std::string> names{"bad0", "bad1"};
   TLQuery query;
@@ -303,7 +303,7 @@ int runFlood(const Options& options) {
   constexpr int kBatch = 500;
   const testsupport::TemporaryDirectory scratch;
   DaemonProcess daemon(scratch.path());
-  const std::string path = daemon.socketOf(client::kSearchServiceName);
+  const std::string path = daemon.socketOf(rpc::kSearchServiceName);
   GoodClient good(daemon.runtimeDirectory(), kBatch);
   const std::string message = validCalls()[6].message;
   size_t most = 0;

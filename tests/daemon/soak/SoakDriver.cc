@@ -41,7 +41,7 @@ constexpr const char* kClasses[] = {"SysFileProtectionComplete", "default", "oth
 constexpr const char* kName = "soak";
 constexpr size_t kMaxMails = 200;   // per client
 constexpr milliseconds kPause{20};  // maximum, between two calls of a client
-constexpr client::Patience kPatience{20000};
+constexpr rpc::Patience kPatience{20000};
 
 struct Options {
   seconds length{1800};

@@ -1,0 +1,189 @@
+#include <gtest/gtest.h>
+
+#include "querylang/Parser.h"
+
+namespace {
+
+// The tree as an expression with every comparison in brackets; "(fails)".
+std::string parsed(const std::string& input) {
+  sq::Tree tree;
+  if (!sq::parse(input.c_str(), tree)) return "(fails)";
+  return sq::expressionText(*tree);
+}
+
+std::string repeated(const std::string& unit, size_t times) {
+  std::string out;
+  for (size_t i = 0; i < times; ++i) out += unit;
+  return out;
+}
+
+// A megabyte of it.
+std::string megabyteOf(const std::string& unit) {
+  return repeated(unit, (size_t{1} << 20) / unit.size());
+}
+
+struct Case {
+  const char* input;
+  const char* expected;
+};
+
+void expectAll(std::initializer_list<Case> cases) {
+  for (const Case& one : cases) EXPECT_EQ(parsed(one.input), one.expected) << one.input;
+}
+
+constexpr const char* kFails = "(fails)";
+
+}  // namespace
+
+TEST(Parser, OperandsAndValues) {
+  expectAll({
+      {"", kFails},
+      {" \t\n\v\f\r", kFails},
+      {"true", "true"},
+      {" FALSE ", "false"},
+      {"'TrUe'", "true"},
+      {"tru\\e", kFails},
+      {"a = b", "a = b"},
+      {"a==\"x y\"", "a == \"x y\""},
+      {"a!='x'", "a != x"},
+      {"a = 'it\\'s'", "a = \"it's\""},
+      {"a = \"\\\\ \\\" \\*\"", "a = \"\\\\ \\\" *\""},
+      {"a = ''", "a = \"\""},
+      {"a == b*", "a == b*"},
+      {"** == *", "** == *"},
+      {"com_quill-x.y_z = 1", "com_quill-x.y_z = 1"},
+      {"a == caf\xC3\xA9", "a == caf"},
+      {"a == 'caf\xC3\xA9'", "a == \"caf\xC3\xA9\""},
+      {"\xC3\xA9 == a", kFails},
+      {"a == 'x' && \xFF", kFails},
+      {"a", kFails},
+      {"a ==", kFails},
+      {"a == b c d", "a == b"},
+      {"a == (b)", kFails},
+      {"a > 5", kFails},
+      {"a < 'x'", kFails},
+      {"a == \"b", kFails},
+      {"a == 'b\\", kFails},
+      {"a == 'b\\'", kFails},
+      {"a & b", kFails},
+      {"! a == b", kFails},
+      {"_a == b", kFails},
+  });
+}
+
+TEST(Parser, TimeFunctions) {
+  expectAll({
+      {"a > $time.now", "a > $time.now(0)"},
+      {"a > $time.now()", "a > $time.now()"},
+      {"a = $time.now (\t-3600 )", "a = $time.now(-3600 )"},
+      {"a <= $time.today(-7)", "a <= $time.today(-7)"},
+      {"a >= $time.iso(2020-01-02T03:04:05Z)", "a >= $time.iso(2020-01-02T03:04:05Z)"},
+      {"a < $time.absolute(1.5)", "a < $time.absolute(1.5)"},
+      {"a != $time.this_week", "a != $time.this_week(0)"},
+      {"a == $time.this_month", "a == $time.this_month(0)"},
+      {"a > $time.this_year", "a > $time.this_year(0)"},
+      {"a > $time.yesterday", "a > $time.yesterday(0)"},
+      {"a > $time.last_week", "a > $time.last_week(0)"},
+      // A word after a time is not a modifier: it ends the expression.
+      {"a > $time.nowhere && b = c", "a > $time.now(0)"},
+      {"a > $time.now(abc)", kFails},
+      {"a > $time.now(1", kFails},
+      {"a > $time", kFails},
+      {"a > $", kFails},
+      {"a > time.now", kFails},
+  });
+  for (int32_t token = -1; token <= 24; ++token) {
+    EXPECT_EQ(sq::isTimeOperator(token), token >= 5 && token <= 13) << token;
+  }
+}
+
+TEST(Parser, ConnectivesAndParentheses) {
+  expectAll({
+      {"a=1 && b=2 && c=3", "a = 1 && b = 2 && c = 3"},
+      {"a=1 && b=2 || c=3", "a = 1 && (b = 2 || c = 3)"},
+      {"a=1 || b=2 && c=3", "a = 1 || (b = 2 && c = 3)"},
+      {"(a=1 || b=2) && c=3", "(a = 1 || b = 2) && c = 3"},
+      {"(a=1 && b=2) && c=3", "(a = 1 && b = 2) && c = 3"},
+      {"((a=1))", "a = 1"},
+      {"true && a == b", "true && a == b"},
+      {"()", kFails},
+      {"(())", kFails},
+      {"(a=1", "a = 1"},
+      {"(a=1 && (b=2", "a = 1 && b = 2"},
+      {"a=1)", "a = 1"},
+      {"a=1) || b=2", "a = 1"},
+      {"true == 'x'", "true"},
+      {"a=1 b=2", "a = 1"},
+      {"a=1 &&", kFails},
+      {"a=1 && && b=2", kFails},
+      {"a=1 | b=2", "a = 1"},
+      {"(a > $time.now(1) c) && b == x", "a > $time.now(1)"},
+  });
+}
+
+TEST(Parser, AStringAfterAStringValueIsAModifier) {
+  expectAll({
+      {"a = 'x*'cdw && b = c", "a = x* && b = c"},
+      {"a = x 'y' && b = c", "a = x && b = c"},
+      {"a = x y z && b = c", "a = x"},
+      {"a = x 'y", "a = x"},
+  });
+}
+
+// The start of an expression is not read: its attribute is the last text read.
+TEST(Parser, ATextRemainsUntilTheNextOne) {
+  expectAll({
+      {"== = b", "\"\" = b"},
+      {"&& == b", "\"\" == b"},
+      {"a == b && ) == c", "a == b && b == c"},
+      {"true && ) rest", "true && true"},
+      {"'true", "true"},
+      {"'tru", kFails},
+      {"$time.now(12 == c", "\"12 \" == c"},
+      {"$time.now == c", "0 == c"},
+  });
+}
+
+TEST(Parser, EscapedTextIsReadBackInQuotesOfBothKinds) {
+  const std::string text = "it's \"a\\b\" *\\* \xE6\x97\xA5\n";
+  for (const char quote : {'"', '\''}) {
+    sq::Tree tree;
+    ASSERT_TRUE(sq::parse(("a = " + (quote + sq::escaped(text) + quote)).c_str(), tree));
+    EXPECT_EQ(tree->right->text, text);
+  }
+}
+
+TEST(Parser, ReportsWhereItStopped) {
+  const auto stopOf = [](const char* input) {
+    sq::Tree tree;
+    size_t stop = 0;
+    static_cast<void>(sq::parse(input, tree, &stop));
+    return stop;
+  };
+  EXPECT_EQ(stopOf("a = b"), 5u);
+  EXPECT_EQ(stopOf("a = b) || c"), 5u);
+  EXPECT_EQ(stopOf("a = b && c"), 10u);
+  EXPECT_EQ(stopOf("a > 5"), 4u);
+  EXPECT_EQ(stopOf("a = 'b"), 4u);
+}
+
+// Each of these nests, or seems to nest, as deeply as it is long; parsing, printing and freeing it
+// must not recurse.
+TEST(Parser, NoInputIsTooDeep) {
+  const std::string open = megabyteOf("(");
+  EXPECT_EQ(parsed(open), kFails);
+  EXPECT_EQ(parsed(open + "a=b"), "a = b");
+  EXPECT_EQ(parsed(open + "a=b" + megabyteOf(")") + "&& c=d"), "a = b && c = d");
+  for (const char* unit : {"a=b && (", "'", "'a\\", "'a' ", "a=b || ", "a='b", "$time.now("}) {
+    const std::string result = parsed(megabyteOf(unit));
+    EXPECT_TRUE(result == kFails || result == "a = \"ba=\"") << unit;
+  }
+  for (const auto& [unit, end] :
+       {std::pair("a = b || ", "true"), std::pair("(a = b || c = d) && ", "true"),
+        std::pair("a = b && (c = d || (", "a = b && true")}) {
+    const std::string input = repeated(unit, 100000) + end;
+    const std::string output = parsed(input);
+    EXPECT_TRUE(output.starts_with(input)) << unit;
+    EXPECT_TRUE(parsed(output) == output) << unit;
+  }
+}

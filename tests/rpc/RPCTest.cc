@@ -1,0 +1,499 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <systemd/sd-bus.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <filesystem>
+#include <future>
+#include <latch>
+#include <system_error>
+#include <thread>
+
+#include "platform/Files.h"
+#include "platform/Queue.h"
+#include "rpc/Inlet.h"
+#include "rpc/Server.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/RawMessages.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace {
+
+using testsupport::authenticate;
+using testsupport::connectTo;
+using testsupport::receiveSome;
+
+constexpr const char* kService = "com.quill.test.Echo";
+constexpr const char* kPath = "/com/quill/test/Echo";
+
+// Waits for the other side to close; true once it has.
+bool waitForEnd(int descriptor) {
+  char buffer[4096];
+  ssize_t n;
+  do {
+    pollfd readable{descriptor, POLLIN, 0};
+    poll(&readable, 1, -1);
+    n = read(descriptor, buffer, sizeof buffer);
+  } while (n > 0 || (n < 0 && errno == EAGAIN));
+  return n == 0 || errno == ECONNRESET;
+}
+
+std::string messageOf(const char* member, const char* signature, const std::string& body) {
+  return testsupport::rawCall(kPath, kService, member, signature, body);
+}
+
+class Client {
+ public:
+  explicit Client(const std::string& path) {
+    descriptor = connectTo(path);
+    sd_bus_new(&bus);
+    sd_bus_set_fd(bus, descriptor, descriptor);
+    EXPECT_GE(sd_bus_start(bus), 0);
+  }
+  ~Client() { sd_bus_close_unref(bus); }
+
+  sd_bus_message* newCall(const char* member) const {
+    sd_bus_message* call = nullptr;
+    sd_bus_message_new_method_call(bus, &call, nullptr, kPath, kService, member);
+    return call;
+  }
+
+  // Makes a call to which the test replies later.
+  void hold() const {
+    sd_bus_message* call = newCall("Hold");
+    uint64_t cookie = 0;  // reading it requests a reply
+    EXPECT_GE(sd_bus_send(bus, call, &cookie), 0);
+    sd_bus_message_unref(call);
+    EXPECT_GE(sd_bus_flush(bus), 0);
+  }
+
+  // The text of the reply, or the name of the error.
+  std::string echo(const std::string& text, const char* interface = kService) const {
+    sd_bus_error error{};
+    sd_bus_message* reply = nullptr;
+    sd_bus_call_method(bus, nullptr, kPath, interface, "Echo", &error, &reply, "s", text.c_str());
+    const char* result = error.name;
+    if (reply != nullptr) sd_bus_message_read(reply, "s", &result);
+    std::string answer = result == nullptr ? "" : result;
+    sd_bus_error_free(&error);
+    sd_bus_message_unref(reply);
+    return answer;
+  }
+
+  sd_bus* bus = nullptr;
+  int descriptor;
+};
+
+// A service with an Echo that replies from another thread, a Make that replies with many bytes, and
+// a Hold to which the test replies.
+class RPCTest : public testing::Test {
+ protected:
+  RPCTest() : queue("echo") {
+    interface.methods.push_back(
+        {"Echo",
+         "s",
+         "s",
+         {"input", "output"},
+         [this](rpc::Arguments& arguments, std::shared_ptr<rpc::Reply> reply) {
+           std::string text(arguments.readString());
+           if (text == "fail") return reply->sendError({"Domain", -2, "went wrong"});
+           if (text == "memory") throw std::bad_alloc();
+           if (text == "thread") throw std::system_error(EAGAIN, std::generic_category());
+           if (text == "binary") return reply->send({std::string("\xFF\0x", 3)});
+           queue.submit([text, reply] { reply->send({text}); });
+         }});
+    interface.methods.push_back({"Make",
+                                 "x",
+                                 "aay",
+                                 {"size", "bytes"},
+                                 [](rpc::Arguments& arguments, std::shared_ptr<rpc::Reply> reply) {
+                                   const auto size = static_cast<size_t>(arguments.readInt64());
+                                   reply->send({rpc::BytesArray{std::string(size, 'b')}});
+                                 }});
+    interface.methods.push_back(
+        {"Hold", "", "", {}, [this](rpc::Arguments&, std::shared_ptr<rpc::Reply> reply) {
+           held.set_value(std::move(reply));
+         }});
+    interface.methods.push_back({"List",
+                                 "as",
+                                 "s",
+                                 {"texts", "output"},
+                                 [](rpc::Arguments& arguments, std::shared_ptr<rpc::Reply> reply) {
+                                   reply->send(
+                                       {std::to_string(arguments.readStringArray().size())});
+                                 }});
+    listener = rpc::makeListener(loop, directory.path(), kService);
+    listener->setDelegate([this](rpc::Listener& l, rpc::Connection& connection) {
+      connection.addExportedInterface(interface);
+      for (const auto& other : interfaces) connection.addExportedInterface(other);
+      return l.serviceName() == connection.serviceName();
+    });
+    std::optional<TLError> error;
+    EXPECT_TRUE(listener->resume(&error)) << platform::printable(error);
+    thread = std::thread([this] { loop.run(); });
+  }
+
+  void stop() {
+    loop.post([this] { listener->invalidate(1000); });
+    loop.stop();
+    if (thread.joinable()) thread.join();
+  }
+  ~RPCTest() override { stop(); }
+
+  std::string path() const { return directory / kService; }
+
+  // Waits until no connection has a running thread.
+  static void waitForThreads() {
+    const auto serving = [] {
+      for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+        const auto name = platform::readFile(task.path() / "comm", 64, nullptr);
+        if (name == "tallow.rpc\n") return true;
+      }
+      return false;
+    };
+    while (serving()) std::this_thread::yield();
+  }
+
+  testsupport::TemporaryDirectory directory;
+  testsupport::LogCapture log;
+  platform::SerialQueue queue;
+  std::promise<std::shared_ptr<rpc::Reply>> held;
+  std::vector<std::shared_ptr<rpc::Reply>> replies;
+  rpc::Interface interface;
+  std::vector<rpc::Interface> interfaces;  // additional interfaces, set before a client connects
+  platform::RunLoop loop;
+  std::unique_ptr<rpc::Listener> listener;
+  std::thread thread;
+};
+
+}  // namespace
+
+TEST_F(RPCTest, AnswersAndReportsErrorsByName) {
+  const Client client(path());
+  EXPECT_EQ(client.echo("hello"), "hello");
+  EXPECT_EQ(client.echo("fail"), "com.quill.tallow.Error");
+  sd_bus_error error{};
+  EXPECT_LT(
+      sd_bus_call_method(client.bus, nullptr, kPath, kService, "Nothing", &error, nullptr, ""), 0);
+  EXPECT_STREQ(error.name, "org.freedesktop.DBus.Error.UnknownMethod");
+  sd_bus_error_free(&error);
+  EXPECT_LT(sd_bus_call_method(client.bus, nullptr, kPath, kService, "Echo", &error, nullptr, "x",
+                               int64_t{1}),
+            0);
+  EXPECT_STREQ(error.name, rpc::kInvalidArgs);
+  sd_bus_error_free(&error);
+  EXPECT_EQ(client.echo("still here"), "still here");
+}
+
+TEST_F(RPCTest, AMemberIsThatOfItsInterface) {
+  interfaces.push_back(
+      {{{"Echo", "s", "s", {}, [](rpc::Arguments&, auto reply) { reply->send({"other"}); }},
+        {"Row",
+         "",
+         "a(sss)",
+         {},
+         [](rpc::Arguments&, auto reply) {
+           reply->send({rpc::TextRows{{"a", "b\xFF", std::string("\0", 1)}, {"", "", ""}}});
+         }}},
+       "org.example.Other"});
+  const Client client(path());
+  EXPECT_EQ(client.echo("x"), "x");
+  EXPECT_EQ(client.echo("x", "org.example.Other"), "other");
+  EXPECT_EQ(client.echo("x", "org.example.Third"), SD_BUS_ERROR_UNKNOWN_METHOD);
+  sd_bus_message* reply = nullptr;
+  ASSERT_GE(sd_bus_call_method(client.bus, nullptr, kPath, "org.example.Other", "Row", nullptr,
+                               &reply, ""),
+            0);
+  const char *a = nullptr, *b = nullptr, *c = nullptr;
+  EXPECT_GT(sd_bus_message_enter_container(reply, 'a', "(sss)"), 0);
+  EXPECT_GT(sd_bus_message_read(reply, "(sss)", &a, &b, &c), 0);
+  EXPECT_EQ(fmt::format("{} {} {}", a, b, c), "a b\uFFFD \uFFFD");
+  EXPECT_GT(sd_bus_message_read(reply, "(sss)", &a, &b, &c), 0);
+  EXPECT_EQ(sd_bus_message_read(reply, "(sss)", &a, &b, &c), 0);
+  sd_bus_message_unref(reply);
+}
+
+TEST_F(RPCTest, TheSocketIsPrivateAndALiveOneIsNotReplaced) {
+  struct stat info;
+  ASSERT_EQ(stat(path().c_str(), &info), 0);
+  EXPECT_EQ(info.st_mode & 0777, 0600u);
+  platform::RunLoop other;
+  auto second = rpc::makeListener(other, directory.path(), kService);
+  std::optional<TLError> error;
+  EXPECT_FALSE(second->resume(&error));
+  EXPECT_NE(error->message.find("is served by a running daemon"), std::string::npos);
+  EXPECT_EQ(Client(path()).echo("first"), "first");
+}
+
+TEST(RPCListener, AStaleSocketIsReplaced) {
+  const testsupport::TemporaryDirectory directory;
+  platform::RunLoop loop;
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  (directory / kService).copy(address.sun_path, sizeof address.sun_path - 1);
+  const int dead = socket(AF_UNIX, SOCK_STREAM, 0);
+  ASSERT_EQ(bind(dead, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  close(dead);
+  EXPECT_TRUE(rpc::makeListener(loop, directory.path(), kService)->resume(nullptr));
+  EXPECT_FALSE(platform::fileExists(directory / kService));
+  EXPECT_FALSE(
+      rpc::makeListener(loop, directory / std::string(100, 'd'), kService)->resume(nullptr));
+}
+
+// Some libraries send the call together with the end of the authentication.
+TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
+  using namespace std::string_literals;
+  const int descriptor = connectTo(path());
+  const std::string eager =
+      testsupport::authenticationLines() + "BEGIN\r\n" + messageOf("Echo", "s", "\2\0\0\0hi\0"s);
+  ASSERT_EQ(send(descriptor, eager.data(), eager.size(), 0), static_cast<ssize_t>(eager.size()));
+  std::string answer;
+  while (answer.find("hi") == std::string::npos) {
+    const std::string more = receiveSome(descriptor);
+    ASSERT_FALSE(more.empty());
+    answer += more;
+  }
+  close(descriptor);
+}
+
+TEST_F(RPCTest, AClientThatEndsDuringACallAffectsNobodyElse) {
+  {
+    const Client client(path());
+    client.hold();
+    auto reply = held.get_future().get();
+    shutdown(client.descriptor, SHUT_RDWR);
+    queue.submit([reply] { reply->send({}); });
+  }
+  queue.drain();
+  EXPECT_EQ(Client(path()).echo("next"), "next");
+}
+
+TEST_F(RPCTest, AClientThatNeverReadsIsClosed) {
+  const Client client(path());
+  for (int i = 0; i < 2000; ++i) {
+    sd_bus_message* call = client.newCall("Make");
+    sd_bus_message_append(call, "x", int64_t{100000});
+    uint64_t cookie = 0;
+    const int sent = sd_bus_send(client.bus, call, &cookie);
+    sd_bus_message_unref(call);
+    if (sent < 0 || sd_bus_flush(client.bus) < 0) break;
+  }
+  pollfd closed{client.descriptor, POLLRDHUP, 0};
+  EXPECT_EQ(poll(&closed, 1, -1),
+            1);  // closed by the other side, because nothing has been read here
+  EXPECT_EQ(Client(path()).echo("other"), "other");
+  EXPECT_TRUE(log.contains("replies are not read"));
+}
+
+TEST_F(RPCTest, AReplyBeyondTheProtocolLimitsIsAnError) {
+  const Client client(path());
+  sd_bus_error error{};
+  EXPECT_LT(sd_bus_call_method(client.bus, nullptr, kPath, kService, "Make", &error, nullptr, "x",
+                               int64_t{200} << 20),
+            0);
+  EXPECT_STREQ(error.name, SD_BUS_ERROR_LIMITS_EXCEEDED);
+  sd_bus_error_free(&error);
+}
+
+TEST_F(RPCTest, InvalidBytesEndOnlyTheirOwnConnection) {
+  for (const std::string& bytes :
+       {std::string("GET / HTTP/1.0\r\n\r\n"), std::string(100000, '\xFF'),
+        std::string("\0AUTH EXTERNAL 39393939\r\nBEGIN\r\nl\1", 34)}) {
+    const int descriptor = connectTo(path());
+    [[maybe_unused]] const ssize_t n = send(descriptor, bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    shutdown(descriptor, SHUT_WR);
+    EXPECT_TRUE(waitForEnd(descriptor));
+    close(descriptor);
+  }
+  EXPECT_EQ(Client(path()).echo("alive"), "alive");
+}
+
+// The connection that has been idle longest is evicted, but never a working one while others are
+// silent.
+TEST_F(RPCTest, ConnectionsAreLimitedAndSilentOnesAreEvicted) {
+  const Client working(path());
+  EXPECT_EQ(working.echo("before"), "before");
+  std::vector<int> silent;
+  for (size_t i = 0; i < rpc::kMaxConnections; ++i) silent.push_back(connectTo(path()));
+  EXPECT_TRUE(waitForEnd(silent.front()));
+  EXPECT_EQ(Client(path()).echo("new"), "new");
+  EXPECT_EQ(working.echo("after"), "after");
+  for (const int descriptor : silent) {
+    EXPECT_TRUE(waitForEnd(descriptor));
+    close(descriptor);
+  }
+  EXPECT_EQ(log.count("not authenticated in time") + log.count("evicted for a new connection"),
+            rpc::kMaxConnections);
+  EXPECT_EQ(working.echo("still"), "still");
+}
+
+TEST_F(RPCTest, AConnectionWithCallsInFlightIsNotEvicted) {
+  std::vector<std::unique_ptr<Client>> busy;
+  for (size_t i = 0; i < rpc::kMaxConnections; ++i) {
+    busy.push_back(std::make_unique<Client>(path()));
+    held = {};
+    busy.back()->hold();
+    replies.push_back(held.get_future().get());
+  }
+  const int refused = connectTo(path());
+  EXPECT_TRUE(waitForEnd(refused));
+  close(refused);
+  EXPECT_TRUE(log.contains("Refusing connection"));
+  replies.pop_back();  // without an answer
+  EXPECT_EQ(busy.back()->echo("heard"), "heard");
+  EXPECT_EQ(Client(path()).echo("room"), "room");
+}
+
+// With four calls in flight no more are read, but replies are still sent and the end of the peer is
+// noticed.
+TEST_F(RPCTest, APausedConnectionStillSendsAndNoticesTheEnd) {
+  {
+    const Client client(path());
+    sd_bus_message* large = client.newCall("Make");
+    sd_bus_message_append(large, "x", int64_t{20} << 20);
+    uint64_t cookie = 0;
+    ASSERT_GE(sd_bus_send(client.bus, large, &cookie), 0);
+    sd_bus_message_unref(large);
+    for (size_t i = 0; i < rpc::kMaxPendingCalls; ++i) {
+      held = {};
+      client.hold();
+      replies.push_back(held.get_future().get());
+    }
+    sd_bus_message* answer = nullptr;
+    while (answer == nullptr && sd_bus_wait(client.bus, UINT64_MAX) >= 0) {
+      while (sd_bus_process(client.bus, &answer) > 0 && answer == nullptr) {
+      }
+    }
+    ASSERT_NE(answer, nullptr);
+    uint64_t answered = 0;
+    sd_bus_message_get_reply_cookie(answer, &answered);
+    EXPECT_EQ(answered, cookie);
+    sd_bus_message_unref(answer);
+  }
+  // Its thread ends although its calls are still in flight.
+  waitForThreads();
+}
+
+// The headers are valid; the errors show only when the content is read.
+TEST_F(RPCTest, RefusesContentThatDoesNotMatchItsSignature) {
+  const auto call = [this](const char* member, const char* signature, const std::string& body) {
+    const int descriptor = connectTo(path());
+    EXPECT_TRUE(authenticate(descriptor));
+    const std::string message = messageOf(member, signature, body);
+    EXPECT_EQ(send(descriptor, message.data(), message.size(), MSG_NOSIGNAL),
+              static_cast<ssize_t>(message.size()));
+    const std::string answer = receiveSome(descriptor);
+    close(descriptor);
+    return answer;
+  };
+  using namespace std::string_literals;
+  EXPECT_THAT(call("Echo", "s", "\2\0\0\0hi\0"s), testing::HasSubstr("hi"));
+  const std::vector<std::pair<const char*, std::string>> bad{
+      {"s", "\2\0\0\0\xFF\xFE\0"s},  // invalid UTF-8
+      {"s", "\2\0\0\0hi!"s},         // no terminating NUL
+      {"s", "\xFF\0\0\0hi\0"s},      // longer than the body
+      {"s", ""s},
+  };
+  for (const auto& [signature, body] : bad) {
+    EXPECT_THAT(call("Echo", signature, body),
+                testing::AnyOf(testing::HasSubstr(rpc::kInvalidArgs), testing::IsEmpty()));
+  }
+  EXPECT_THAT(call("List", "as", "\x10\0\0\0\4\0\0\0abcd"s),
+              testing::AnyOf(testing::HasSubstr(rpc::kInvalidArgs), testing::IsEmpty()));
+  std::string many("\0\0\0\0", 4);
+  const size_t count = rpc::kMaxArrayElements + 1;
+  for (size_t i = 0; i < count; ++i) many += std::string(8, '\0');
+  many.resize(many.size() - 3);  // the last element has no padding
+  const auto length = static_cast<uint32_t>(many.size() - 4);
+  std::memcpy(many.data(), &length, sizeof length);
+  EXPECT_THAT(call("List", "as", many), testing::HasSubstr(rpc::kInvalidArgs));
+  EXPECT_EQ(Client(path()).echo("alive"), "alive");
+}
+
+TEST_F(RPCTest, AHandlerThatFailsAnswersItsCall) {
+  const Client client(path());
+  EXPECT_EQ(client.echo("memory"), SD_BUS_ERROR_NO_MEMORY);
+  EXPECT_EQ(client.echo("thread"), rpc::kErrorName);
+  EXPECT_EQ(client.echo("binary"), "\uFFFD\uFFFDx");
+  EXPECT_EQ(client.echo("next"), "next");
+}
+
+TEST(RPCFramer, FindsMessagesHoweverTheInputIsSplit) {
+  std::string stream = std::string(1, '\0') + "AUTH EXTERNAL 30\r\nBEGIN x\r\nBEGIN\r\n";
+  const size_t authentication = stream.size();
+  const std::vector<size_t> sizes{24, 16 + 8 + 1000, 70000};
+  for (const size_t size : sizes) {
+    std::string message(size, 'm');
+    const auto put = [&message](size_t at, size_t value) {
+      for (size_t i = 0; i < 4; ++i) message[at + i] = static_cast<char>(value >> (8 * i));
+    };
+    message[0] = 'l';
+    put(4, size - 24);
+    put(12, 5);  // padded to 8
+    stream += message;
+  }
+  for (const size_t step : {size_t{1}, size_t{7}, size_t{16}, size_t{4096}, stream.size()}) {
+    rpc::Framer framer;
+    std::vector<size_t> found;
+    size_t at = 0;
+    while (at < stream.size()) {
+      const auto piece = framer.next(std::string_view(stream).substr(at, step));
+      ASSERT_NE(piece.part, rpc::Framer::Part::unacceptable);
+      at += piece.size;
+      if (piece.part == rpc::Framer::Part::begins) found.push_back(framer.messageBytes());
+      if (piece.part == rpc::Framer::Part::ends && found.empty()) {
+        EXPECT_EQ(at, authentication);
+      }
+    }
+    EXPECT_EQ(found, sizes);
+    EXPECT_FALSE(framer.inMessage());
+  }
+  rpc::Framer endless;
+  EXPECT_EQ(endless.next(std::string(20000, 'A')).part, rpc::Framer::Part::unacceptable);
+  for (const std::string& header :
+       {std::string("x") + std::string(15, '\0'), std::string("l") + std::string(15, '\0'),
+        std::string("l\0\0\0\xFF\xFF\xFF\xFF\0\0\0\0\1\0\0\0", 16)}) {
+    rpc::Framer framer;
+    EXPECT_EQ(framer.next("BEGIN\r\n").part, rpc::Framer::Part::ends);
+    EXPECT_EQ(framer.next(header).part, rpc::Framer::Part::unacceptable);
+  }
+}
+
+// Large requests wait for each other, small ones do not, and one above the budget is let in when it
+// is the only one.
+TEST(RPCRequestBudget, LimitsTheBytesOfAllRequests) {
+  rpc::RequestBudget budget;
+  int resumed = 0;
+  const auto resume = [&resumed] { ++resumed; };
+  const size_t half = rpc::kMaxWaitingBytes / 2;
+  EXPECT_TRUE(budget.take(half + 1, resume));
+  EXPECT_FALSE(budget.take(half, resume));
+  EXPECT_TRUE(budget.take(rpc::kSmallMessageBytes, resume));
+  EXPECT_FALSE(budget.take(3 * half, resume));
+  budget.give(rpc::kSmallMessageBytes);
+  EXPECT_EQ(resumed, 2);
+  EXPECT_FALSE(budget.take(3 * half, resume));
+  budget.give(half + 1);
+  EXPECT_EQ(resumed, 3);
+  EXPECT_TRUE(budget.take(3 * half, resume));
+}
+
+TEST_F(RPCTest, PendingRepliesAreSentBeforeTheEnd) {
+  const Client client(path());
+  sd_bus_message* call = client.newCall("Hold");
+  sd_bus_message* answer = nullptr;
+  std::thread caller([&] { sd_bus_call(client.bus, call, 0, nullptr, &answer); });
+  auto reply = held.get_future().get();
+  queue.submit([reply = std::move(reply)] { reply->send({}); });
+  queue.drain();
+  stop();
+  caller.join();
+  EXPECT_NE(answer, nullptr);
+  sd_bus_message_unref(answer);
+  sd_bus_message_unref(call);
+}

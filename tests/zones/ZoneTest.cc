@@ -1,0 +1,202 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <thread>
+
+#include "zones/TALZoneManager.h"
+#include "zones/zone.h"
+#include "records/TLParamsManager.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using zone::Zone;
+using Offsets = std::vector<uint32_t>;
+using enum TLAttributeKey;
+
+namespace {
+
+// Makes the scores independent of the user defaults of the machine.
+class EmptyDefaults : public testing::Environment {
+ public:
+  void SetUp() override { setenv("STATE_DIRECTORY", _directory.path().c_str(), 1); }
+
+ private:
+  testsupport::TemporaryDirectory _directory;
+};
+[[maybe_unused]] testing::Environment* const kEmptyDefaults =
+    testing::AddGlobalTestEnvironment(new EmptyDefaults);
+
+std::string withNULs(std::string_view shown) {
+  std::string bytes(shown);
+  std::replace(bytes.begin(), bytes.end(), '|', '\0');
+  return bytes;
+}
+
+std::shared_ptr<TLAttribute> attribute(TLAttributeKey key, TLStringView value,
+                                       std::optional<TLString> customKey = std::nullopt) {
+  auto made = std::make_shared<TLAttribute>();
+  made->setKey(key);
+  made->setCustomKey(std::move(customKey));
+  made->setStringValue(TLString(value));
+  return made;
+}
+
+TLIndexableItem& fill(TLIndexableItem& item, TLStringView identifier,
+                      const std::vector<std::shared_ptr<TLAttribute>>& attributes) {
+  item.setIdentifier(TLString(identifier));
+  for (const auto& each : attributes) item.addAttributes(each);
+  return item;
+}
+
+// "KEY=value" of each attribute in order.
+std::vector<std::string> shown(const TLIndexableItem& item) {
+  std::vector<std::string> lines;
+  for (const auto& each : item.attributes()) {
+    lines.push_back(TLAttribute::keyAsString(each->key()) + "=" +
+                    platform::printable(each->stringValue()));
+  }
+  return lines;
+}
+
+std::shared_ptr<TLParameters> parameters(TLStringView overrides) {
+  return TLParamsManager::resolveOverrides(*TLParamsManager::paramsFromString(overrides), true);
+}
+
+}  // namespace
+
+TEST(Zone, ValuesAreSeparatedByOneNUL) {
+  Zone asIs;
+  asIs.AddTextAsIs("a");
+  asIs.AddTextAsIs("bc");
+  EXPECT_EQ(asIs.text, withNULs("a|bc"));
+  EXPECT_EQ(asIs.offsets, (Offsets{0, 2}));
+
+  Zone tokenized;
+  tokenized.AddTokenizedText("ab cd ");
+  EXPECT_EQ(tokenized.offsets, (Offsets{0, 3}));
+  tokenized.AddTokenizedText("");
+  tokenized.AddTokenizedText("x  y");
+  EXPECT_EQ(tokenized.text, withNULs("ab cd ||x  y"));
+  EXPECT_EQ(tokenized.offsets, (Offsets{0, 3, 8, 10, 11}));
+
+  const auto tokenizer = tokenizer::NewFastLexemonTokenizer("en_US");
+  Zone text;
+  text.AddText(u"?!", *tokenizer);
+  text.AddText(u"One TWO", *tokenizer);
+  text.AddText(u"\u00DCber", *tokenizer);
+  EXPECT_EQ(text.text, withNULs("one two |uber "));
+  EXPECT_EQ(text.offsets, (Offsets{0, 4, 9}));
+}
+
+TEST(Zone, ZonesAreMadeOnDemand) {
+  zone::Zones zones;
+  zones.GetZone(13).AddTextAsIs("a");
+  Zone& first = zones.GetZone(13);
+  for (uint16_t id = 100; id < 1000; ++id) EXPECT_TRUE(zones.GetZone(id).text.empty());
+  EXPECT_EQ(&zones.GetZone(13), &first);
+  EXPECT_EQ(first.text, "a");
+  EXPECT_EQ(zones.size(), 901u);
+}
+
+TEST(ZoneManager, ZonesAreAttributeKeys) {
+  const TALZoneManager manager;
+  EXPECT_EQ(manager.zoneIDForAttributeKey(13, std::nullopt), 13);
+  EXPECT_EQ(manager.zoneIDForAttributeKey(999, u"x"), 999);
+  for (const int32_t key : {0, -1, INT32_MIN}) {
+    EXPECT_EQ(manager.zoneIDForAttributeKey(key, std::nullopt), std::nullopt);
+  }
+  for (const std::optional<TLString>& custom : {std::optional<TLString>(), {u""}, {u"anything"}}) {
+    EXPECT_EQ(manager.zoneIDForAttributeKey(1, custom), std::nullopt);
+  }
+}
+
+TEST(ZoneManager, DefaultScoresAndTheirOrder) {
+  const struct {
+    int32_t zone;
+    std::optional<float> score;
+  } rows[] = {{13, 0.9F},  {171, 0.5F}, {104, 0.5F}, {107, 1.0F}, {111, 0.1F},
+              {115, 0.1F}, {119, 0.0F}, {108, 0.8F}, {112, 0.1F}, {116, 0.1F},
+              {120, 0.0F}, {22, {}},    {138, 1.0F}, {165, 1.0F}, {106, 1.0F},
+              {180, 1.0F}, {147, 0.2F}, {132, 0.2F}, {131, 0.2F}};
+  TALZoneManager manager;
+  manager.setupAttributeScoresWithSearchParams(*TLParamsManager::paramsFromFallback());
+  ASSERT_EQ(manager.indexableEnumKeyAttribs().size(), std::size(rows));
+  for (size_t i = 0; i < std::size(rows); ++i) {
+    EXPECT_EQ(static_cast<int32_t>(manager.indexableEnumKeyAttribs()[i]), rows[i].zone);
+    EXPECT_EQ(manager.scoreForZoneID(rows[i].zone), rows[i].score) << rows[i].zone;
+  }
+  EXPECT_EQ(manager.scoreForZoneID(std::nullopt), std::nullopt);
+  EXPECT_EQ(manager.scoreForZoneID(999), std::nullopt);
+}
+
+TEST(ZoneManager, ParametersOfASearchStayInForce) {
+  TALZoneManager manager;
+  manager.setupAttributeScoresWithSearchParams(*parameters(u"zoneScore.Subject=0.25"));
+  EXPECT_EQ(manager.scoreForZoneID(13), 0.25F);
+  EXPECT_EQ(manager.scoreForZoneID(107), 1.0F);
+  manager.overrideScoreForZoneID(999, 3.0F);
+  manager.overrideScoreForZoneID(107, std::nullopt);
+  manager.overrideScoreForZoneID(std::nullopt, 1.0F);
+  EXPECT_EQ(manager.scoreForZoneID(999), 3.0F);
+  EXPECT_EQ(manager.scoreForZoneID(107), std::nullopt);
+  manager.setupAttributeScoresWithSearchParams(*parameters(u"zoneScore.XFrom=0.5"));
+  EXPECT_EQ(manager.scoreForZoneID(13), 0.9F);
+  EXPECT_EQ(manager.scoreForZoneID(107), 1.0F);
+  EXPECT_EQ(manager.scoreForZoneID(147), 0.5F);
+  EXPECT_EQ(manager.scoreForZoneID(999), 3.0F);
+}
+
+TEST(ZoneManager, ScoresAreSetWhileOthersRead) {
+  TALZoneManager manager;
+  const auto low = parameters(u"zoneScore.Subject=0.25");
+  const auto high = parameters(u"zoneScore.Subject=0.75");
+  manager.setupAttributeScoresWithSearchParams(*low);
+  std::thread writer([&] {
+    for (int i = 0; i < 2000; ++i) {
+      manager.setupAttributeScoresWithSearchParams(i % 2 == 0 ? *high : *low);
+    }
+  });
+  for (int i = 0; i < 20000; ++i) {
+    const auto score = manager.scoreForZoneID(13);
+    EXPECT_TRUE(score == 0.25F || score == 0.75F);
+    EXPECT_EQ(manager.scoreForZoneID(107), 1.0F);
+  }
+  writer.join();
+}
+
+TEST(ZoneManager, MergesAttributeByAttribute) {
+  const TALZoneManager manager;
+  bool shouldIndex = false;
+  TLIndexableItem oldDoc;
+  fill(oldDoc, u"id",
+       {attribute(SUBJECT, u"old"), attribute(READ, u"no"), attribute(AUTHORS, u"ann"),
+        attribute(CUSTOM, u"kept", u"k1"), attribute(CUSTOM, u"replaced", u"k2"),
+        attribute(CUSTOM, u"nameless"), attribute(AUTHORS, u"bob")});
+
+  TLIndexableItem full;
+  const auto merged =
+      manager.mergeNewDoc(fill(full, u"id2", {attribute(SUBJECT, u"new"), attribute(READ, u"yes")}),
+                          &oldDoc, &shouldIndex);
+  EXPECT_EQ(merged->identifier(), u"id2");
+  EXPECT_EQ(shown(*merged),
+            (std::vector<std::string>{"SUBJECT=new", "READ=yes", "AUTHORS=ann", "CUSTOM=kept",
+                                      "CUSTOM=replaced", "CUSTOM=nameless", "AUTHORS=bob"}));
+  EXPECT_TRUE(shouldIndex);
+  EXPECT_EQ(full.attributes().size(), 2u);
+  EXPECT_EQ(oldDoc.attributes().size(), 7u);
+
+  TLIndexableItem custom;
+  const auto other = manager.mergeNewDoc(
+      fill(custom, u"id", {attribute(READ, u"yes"), attribute(CUSTOM, u"mine", u"k2")}), &oldDoc,
+      &shouldIndex);
+  EXPECT_EQ(shown(*other),
+            (std::vector<std::string>{"READ=yes", "CUSTOM=mine", "SUBJECT=old", "AUTHORS=ann",
+                                      "CUSTOM=kept", "CUSTOM=nameless", "AUTHORS=bob"}));
+  EXPECT_FALSE(shouldIndex);
+
+  TLIndexableItem fresh;
+  const auto first = manager.mergeNewDoc(fill(fresh, u"id", {attribute(CONTENT_TYPE, u"t")}),
+                                         nullptr, &shouldIndex);
+  EXPECT_EQ(shown(*first), (std::vector<std::string>{"CONTENT_TYPE=t"}));
+  EXPECT_TRUE(shouldIndex);
+}
