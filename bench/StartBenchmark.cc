@@ -40,9 +40,10 @@ struct ColdStart {
   bench::Percentiles tenth;
 };
 
-void addColdStart(ColdStart& times, const bench::ScratchDirectory& scratch,
-                  const std::string& stateDirectory, const Queries& queries, size_t round) {
+void addColdStart(ColdStart& times, const std::string& stateDirectory, const Queries& queries,
+                  size_t round) {
   constexpr size_t kQueries = 10;
+  const bench::ScratchDirectory scratch;
   evictFromPageCache(stateDirectory);
   const double start = bench::secondsNow();
   bench::DaemonRun daemon(scratch, stateDirectory);
@@ -62,10 +63,9 @@ std::string figures(const char* name, const bench::Percentiles& times) {
                      times.at(1) * 1e3);
 }
 
-void measureColdStarts(const bench::ScratchDirectory& scratch, const std::string& stateDirectory,
-                       const Queries& queries, size_t rounds) {
+void measureColdStarts(const std::string& stateDirectory, const Queries& queries, size_t rounds) {
   ColdStart times;
-  for (size_t i = 0; i < rounds; ++i) addColdStart(times, scratch, stateDirectory, queries, i);
+  for (size_t i = 0; i < rounds; ++i) addColdStart(times, stateDirectory, queries, i);
   fmt::print("cold_starts={}{}{}{}\n", rounds, figures("ready", times.ready),
              figures("first_search", times.first), figures("tenth_search", times.tenth));
 }
@@ -100,8 +100,9 @@ class Growth {
 using ForClass = std::function<void(client::SearchServiceProxy&, const std::string& name)>;
 
 // Calls `use` for each class, waits until they are idle, and prints the cost of a class.
-void measureClasses(const bench::ScratchDirectory& scratch, const std::string& stateDirectory,
-                    const char* what, size_t classes, const ForClass& use) {
+void measureClasses(const std::string& stateDirectory, const char* what, size_t classes,
+                    const ForClass& use) {
+  const bench::ScratchDirectory scratch;
   bench::DaemonRun daemon(scratch, stateDirectory);
   const Growth growth(daemon);
   client::SearchServiceProxy service(daemon.runtimeDirectory());
@@ -159,19 +160,19 @@ int run(int argc, char** argv) {
     spool.send(service);
     daemon.stop();
   }
-  measureColdStarts(scratch, stateDirectory, queries, rounds);
+  measureColdStarts(stateDirectory, queries, rounds);
 
   std::vector<client::EncodedItem> batch;
   spool.rewind();
   static_cast<void>(spool.next(batch));
   if (batch.size() > mails) batch.resize(mails);
-  measureClasses(scratch, scratch / "classes", "empty", classes, search);
+  measureClasses(scratch / "classes", "empty", classes, search);
   const std::string full = fmt::format("mails={}", batch.size());
-  measureClasses(scratch, scratch / "full", full.c_str(), classes,
+  measureClasses(scratch / "full", full.c_str(), classes,
                  [&](client::SearchServiceProxy& service, const std::string& name) {
                    bench::indexBatch(service, batch, name);
                  });
-  measureClasses(scratch, scratch / "full", (full + " reopened").c_str(), classes, search);
+  measureClasses(scratch / "full", (full + " reopened").c_str(), classes, search);
   return 0;
 }
 

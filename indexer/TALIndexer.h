@@ -11,7 +11,6 @@
 #include "docstore/TALDocStore.h"
 #include "indexer/DocDates.h"
 #include "indexer/OpenText.h"
-#include "zones/TALZoneManager.h"
 #include "indexer/WordReplacement.h"
 #include "modification/TALStemRewrite.h"
 #include "modification/TALSynonyms.h"
@@ -20,21 +19,13 @@
 #include "platform/Queue.h"
 #include "platform/TLError.h"
 #include "query/TALQueryProcessor.h"
+#include "records/TLErrorCodes.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
 #include "salt/Index.h"
 #include "salt/Search.h"
 #include "tokenizer/Tokenizer.h"
-
-inline constexpr const char* kTALIndexerErrorDomain = "TALIndexer";
-
-// Error codes of this class.
-enum class TALIndexerError {
-  document = 1,          // "document has no identifier", "index failed"
-  query = 3,             // the query yielded no terms
-  shuttingDown = 4,      // "shutting down"
-  validationFailed = 5,  // "index validation failed"
-};
+#include "zones/TALZoneManager.h"
 
 // Indexes and searches the documents of one protection class: owns its text index and its document
 // store, and performs all work that changes them.
