@@ -4,9 +4,9 @@ struct sd_bus;
 
 namespace rpc {
 
-// Adds the few operations of a bus daemon that general D-Bus tools call before and beside those of
-// a service, such as Hello, although there is no bus: busctl and gdbus cannot do without them.
-// Nothing is looked up or remembered. Returns false for want of memory.
+// Adds the operations of a bus daemon, such as Hello, that busctl, gdbus and other D-Bus tools call
+// before those of a service. There is no bus, so nothing is looked up or stored. False when memory
+// is short.
 [[nodiscard]] bool addGreeting(sd_bus* bus);
 
 }  // namespace rpc

@@ -16,9 +16,8 @@ namespace salt {
 
 namespace {
 
-constexpr size_t kWriteBufferBytes =
-    6 * 1024 * 1024;  // size of memtable and log at which leveldb flushes
-constexpr size_t kBlockCacheBytes = 8 * 1024 * 1024;  // of all databases together
+constexpr size_t kWriteBufferBytes = 6 * 1024 * 1024;  // leveldb flushes a memtable of this size
+constexpr size_t kBlockCacheBytes = 8 * 1024 * 1024;   // of all databases together
 constexpr size_t kBlockBytes = 32 * 1024;
 constexpr size_t kFileBytes = 4 * 1024 * 1024;
 constexpr size_t kLogLineBytes = 100;
