@@ -12,7 +12,6 @@
 
 namespace {
 
-
 struct Close {
   void operator()(sqlite3* database) const { sqlite3_close(database); }
   void operator()(sqlite3_stmt* statement) const { sqlite3_finalize(statement); }

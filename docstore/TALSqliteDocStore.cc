@@ -8,7 +8,6 @@
 
 namespace {
 
-
 constexpr const char* kVersion = "v0.4";
 constexpr const char* kVersionKey = "version";
 constexpr const char* kInMemory = ":memory:";
@@ -212,7 +211,8 @@ TALSqliteDocStore::Statement TALSqliteDocStore::_prepare(const std::string& quer
 }
 
 TLError TALSqliteDocStore::_lastSqliteErrorWithError(TLErrorOut error) {
-  if (_database == nullptr) return _errorWithCode(static_cast<int>(TALDocStoreError::noConnection), error);
+  if (_database == nullptr)
+    return _errorWithCode(static_cast<int>(TALDocStoreError::noConnection), error);
   TLError result{kDocStoreErrorDomain, sqlite3_errcode(_database), sqlite3_errmsg(_database)};
   platform::setError(error, result);
   return result;

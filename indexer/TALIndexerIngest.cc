@@ -415,7 +415,7 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorO
   std::vector<uint32_t> deleted;
   DocDates* const dates = &_docDates;
   const auto store = docStore();
-  const bool walked = store->enumerateDocIDs(
+  const bool readAll = store->enumerateDocIDs(
       error, [&](int64_t, uint32_t docID, const TLURL&, bool* stop, TLErrorOut handlerError) {
         const auto doc = store->documentWithID(docID, nullptr);
         if (doc == nullptr || doc->domainIdentifier() != domain) return;
@@ -432,5 +432,5 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorO
         *stop = true;
       });
   hideDeleted(&deleted);
-  return walked;
+  return readAll;
 }
