@@ -12,17 +12,17 @@
 #include "bench/Percentiles.h"
 #include "bench/Queries.h"
 
-// What a start costs: the first searches after one, with nothing in the page cache, and many small
+// Measures the cost of a start: the first searches with a cold page cache, and many small
 // protection classes.
 namespace {
 
 using Queries = std::vector<std::string>;
 
-// Queues end their threads when they have been idle for two seconds.
+// The threads of queues end after two idle seconds.
 constexpr std::chrono::seconds kUntilIdle(5);
 
-// Has the kernel drop what it has cached of the files below `path`. It keeps pages that are not on
-// the disk yet, so each file is synced first.
+// Evicts the files in `path` from the page cache. Each is synced first, because the kernel keeps
+// pages that are not on disk yet.
 void evictFromPageCache(const std::string& path) {
   for (const auto& entry : std::filesystem::recursive_directory_iterator(path)) {
     if (!entry.is_regular_file()) continue;
@@ -70,7 +70,7 @@ void measureColdStarts(const std::string& stateDirectory, const Queries& queries
              figures("first_search", times.first), figures("tenth_search", times.tenth));
 }
 
-// What the daemon has now, beside what it had before.
+// The resources that the daemon has gained since construction.
 class Growth {
  public:
   explicit Growth(bench::DaemonRun& daemon)
@@ -99,7 +99,7 @@ class Growth {
 
 using ForClass = std::function<void(client::SearchServiceProxy&, const std::string& name)>;
 
-// Calls `use` for each class, then waits until they are idle, and prints what a class has cost.
+// Calls `use` for each class, waits until they are idle, and prints the cost of a class.
 void measureClasses(const std::string& stateDirectory, const char* what, size_t classes,
                     const ForClass& use) {
   const bench::ScratchDirectory scratch;

@@ -33,11 +33,6 @@ namespace {
 // the store.
 constexpr size_t kDeletedAtATime = 100;
 
-// For an unknown document the store returns 0 without an error, but deleting it is an error, with
-// the store's domain and the engine's code for "not found".
-constexpr int kDocumentNotFound = 12;
-constexpr const char* kDocStoreErrorDomain = "DocStore";
-
 // Sets the plain text and the snippet of one item, and touches nothing else.
 void prepareText(TLIndexableItem& item) {
   std::optional<TLString> body;
@@ -372,7 +367,8 @@ std::optional<uint32_t> TALIndexer::deleteStored(const TLString& identifier,
   const std::string shown = url ? url->absoluteString() : "(null)";
   const uint32_t docID = url ? docStore()->documentIDWithURL(*url, failure) : 0;
   if (docID == 0 && !*failure) {
-    *failure = TLError{kDocStoreErrorDomain, kDocumentNotFound, "no document with URL " + shown};
+    *failure = TLError{kDocStoreErrorDomain, static_cast<int>(TALDocStoreError::notFound),
+                       "no document with URL " + shown};
   }
   if (*failure) {
     log().error("Failed to fetch document ID in docstore for URL {}: {}", shown,
@@ -419,7 +415,7 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorO
   std::vector<uint32_t> deleted;
   DocDates* const dates = &_docDates;
   const auto store = docStore();
-  const bool walked = store->enumerateDocIDs(
+  const bool readAll = store->enumerateDocIDs(
       error, [&](int64_t, uint32_t docID, const TLURL&, bool* stop, TLErrorOut handlerError) {
         const auto doc = store->documentWithID(docID, nullptr);
         if (doc == nullptr || doc->domainIdentifier() != domain) return;
@@ -436,5 +432,5 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorO
         *stop = true;
       });
   hideDeleted(&deleted);
-  return walked;
+  return readAll;
 }
