@@ -18,6 +18,8 @@ namespace cli {
 // known to be that of the daemon, or cannot be read.
 [[nodiscard]] bool isUnknownClass(const Options& options);
 
+// What to tell the user then.
+[[nodiscard]] std::string unknownClassText(const Options& options);
 // Says so; the status that goes with it.
 [[nodiscard]] ExitStatus complainOfUnknownClass(const Options& options);
 

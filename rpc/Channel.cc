@@ -135,9 +135,12 @@ bool Channel::connect(TLErrorOut error) {
   const int descriptor = connectWithin(_patience, _runtimeDirectory, _socketPath);
   int result = descriptor;
   if (result >= 0) {
-    result = sd_bus_new(&_bus);
+    result = adopt(descriptor) ? sd_bus_new(&_bus) : -ECANCELED;
     if (result >= 0) result = sd_bus_set_fd(_bus, descriptor, descriptor);
-    if (result < 0) close(descriptor);
+    if (result < 0) {
+      adopt(-1);
+      close(descriptor);
+    }
   }
   if (result >= 0) result = sd_bus_negotiate_fds(_bus, 0);
   if (result >= 0) result = sd_bus_start(_bus);
@@ -147,7 +150,20 @@ bool Channel::connect(TLErrorOut error) {
   return false;
 }
 
+bool Channel::adopt(int descriptor) {
+  const platform::MutexLock lock(_mutex);
+  _descriptor = descriptor;
+  return !_interrupted;
+}
+
+void Channel::interrupt() {
+  const platform::MutexLock lock(_mutex);
+  _interrupted = true;
+  if (_descriptor >= 0) shutdown(_descriptor, SHUT_RDWR);
+}
+
 void Channel::disconnect() {
+  adopt(-1);
   if (_bus != nullptr) sd_bus_close(_bus);
   _bus = sd_bus_unref(_bus);
 }

@@ -173,3 +173,14 @@ TEST_F(ProxyTest, WaitsForTheSocketUntilPatienceRunsOut) {
   EXPECT_EQ(patient.ping("", &error), "pong");
   starter.join();
 }
+
+TEST_F(ProxyTest, AfterAnInterruptNothingBegins) {
+  EXPECT_FALSE(search.fetchLastClientState("me", "c", &error));
+  ASSERT_FALSE(error.has_value()) << error->message;
+  search.interrupt();
+  EXPECT_FALSE(search.fetchLastClientState("me", "c", &error));
+  EXPECT_TRUE(rpc::isUnreachable(error));
+  EXPECT_FALSE(search.fetchLastClientState("me", "c", &error));
+  EXPECT_TRUE(rpc::isUnreachable(error));
+  EXPECT_EQ(daemon.calls().size(), 1u);
+}
