@@ -20,7 +20,7 @@ namespace testsupport {
 
 namespace {
 
-constexpr size_t kMaxLogBytes = size_t{64} << 20;
+constexpr size_t kMaxLogBytes = size_t{256} << 20;
 constexpr int kFirstPassedSocket = 3;
 
 int listenForNotification(const std::string& path) {
