@@ -14,6 +14,8 @@ namespace {
 
 constexpr const char* kStoreDomain = "DocStore";
 constexpr int kNotStored = 12;
+constexpr const char* kIndexerDomain = "TALIndexer";
+constexpr int kRefused = 1;
 
 struct Row {
   const char* domain;
@@ -22,10 +24,10 @@ struct Row {
 };
 
 constexpr Row kRows[] = {
-    {"TALIndexer", 1, "the daemon could not put the message into the index"},
-    {"TALIndexer", 3, "there is nothing in the search that can be looked up"},
-    {"TALIndexer", 4, "the daemon is about to end; try again in a moment"},
-    {"TALIndexer", 5, "the index of this class is damaged; `tallow validate` tells more"},
+    {kIndexerDomain, kRefused, "the daemon could not put the message into the index"},
+    {kIndexerDomain, 3, "there is nothing in the search that can be looked up"},
+    {kIndexerDomain, 4, "the daemon is about to end; try again in a moment"},
+    {kIndexerDomain, 5, "the index of this class is damaged; `tallow validate` tells more"},
     {"com.quill.tallow.TALIndexerManager", -2,
      "the index of this class cannot be opened now; `tallow status` tells whether the device is "
      "locked"},
@@ -42,6 +44,10 @@ std::string withoutName(const std::string& message) {
 
 bool isNotIndexed(const TLError& error) {
   return error.domain == kStoreDomain && error.code == kNotStored;
+}
+
+bool isRefusedMessage(const TLError& error) {
+  return error.domain == kIndexerDomain && error.code == kRefused;
 }
 
 std::string plainText(const TLError& error) {

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "cli/Options.h"
 
@@ -17,6 +18,10 @@ namespace cli {
 // the state directory, and the class has no directory there. False where the state directory is not
 // known to be that of the daemon, or cannot be read.
 [[nodiscard]] bool isUnknownClass(const Options& options);
+
+// The classes that have a directory, in order; none where the state directory is not known to be
+// that of the daemon, or cannot be read.
+[[nodiscard]] std::vector<std::string> classesOnDisk(const Options& options);
 
 // Says so; the status that goes with it.
 [[nodiscard]] ExitStatus complainOfUnknownClass(const Options& options);

@@ -69,12 +69,16 @@ std::unique_ptr<platform::ProcessLock> acquireLock(const SyncSettings& settings,
   }
 }
 
+std::string damagedPath(const std::string& path) {
+  return path + ".damaged";
+}
+
 // A file that is no catalogue any more is set aside, and one is made anew.
 std::unique_ptr<Catalogue> openForWriting(const std::string& path, TLErrorOut error) {
   std::optional<TLError> failure;
   auto catalogue = Catalogue::open(path, &failure);
   if (catalogue == nullptr && (failure->code == SQLITE_NOTADB || failure->code == SQLITE_CORRUPT)) {
-    std::rename(path.c_str(), (path + ".damaged").c_str());
+    std::rename(path.c_str(), damagedPath(path).c_str());
     std::remove((path + "-wal").c_str());
     std::remove((path + "-shm").c_str());
     failure.reset();
@@ -285,9 +289,24 @@ std::string watchLockPath(const SyncSettings& settings) {
   return pathOf(settings) + ".watch";
 }
 
+bool hasCatalogue(const SyncSettings& settings) {
+  return platform::fileExists(pathOf(settings));
+}
+
 std::unique_ptr<Catalogue> openCatalogue(const SyncSettings& settings, TLErrorOut error) {
-  const std::string path = pathOf(settings);
-  return platform::fileExists(path) ? Catalogue::open(path, error) : nullptr;
+  return hasCatalogue(settings) ? Catalogue::open(pathOf(settings), error) : nullptr;
+}
+
+bool forgetDeleted(const SyncSettings& settings, TLErrorOut error) {
+  std::remove(damagedPath(pathOf(settings)).c_str());
+  if (!hasCatalogue(settings)) return true;
+  const auto lock = acquireLock(
+      settings, [] { return false; }, error);
+  if (lock == nullptr) return false;
+  const auto catalogue = Catalogue::open(pathOf(settings), error);
+  if (catalogue == nullptr) return false;
+  if (!catalogue->forgetDeletions()) platform::setError(error, *catalogue->failure());
+  return !catalogue->failure();
 }
 
 std::optional<int64_t> lastSync(Catalogue& catalogue) {
