@@ -119,8 +119,7 @@ bool isWatched(const Options& options) {
   return lock == nullptr && failure->code == EWOULDBLOCK;
 }
 
-std::string mailboxText(mailsync::Catalogue& catalogue) {
-  const auto last = mailsync::lastSync(catalogue);
+std::string mailboxText(mailsync::Catalogue& catalogue, const std::optional<int64_t>& last) {
   std::string text = fmt::format("Last sync  {}\n", last ? timeText(*last) : "not ended yet");
   for (const mailsync::FolderCount& count : catalogue.folderCounts()) {
     text += fmt::format("{} {:>8} of {:>8}  {}", barOf(count), count.indexed, count.messages,
@@ -140,7 +139,7 @@ std::string mailboxText(mailsync::Catalogue& catalogue) {
   return text;
 }
 
-nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue) {
+nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue, const std::optional<int64_t>& last) {
   nlohmann::json folders = nlohmann::json::array();
   for (const mailsync::FolderCount& count : catalogue.folderCounts()) {
     folders.push_back({{"path", count.path},
@@ -154,7 +153,6 @@ nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue) {
   for (const mailsync::Problem& problem : catalogue.problems(kMostProblems)) {
     problems.push_back({{"path", problem.path}, {"reason", problem.reason}});
   }
-  const auto last = mailsync::lastSync(catalogue);
   return {{"lastSync", last ? nlohmann::json(timeText(*last)) : nlohmann::json()},
           {"roots", catalogue.roots()},
           {"folders", std::move(folders)},
@@ -201,6 +199,7 @@ std::string diskText(const DiskUse& disk, const std::optional<IndexStatus>& inde
 struct ClassStatus {
   std::string name;
   std::unique_ptr<mailsync::Catalogue> catalogue;
+  std::optional<int64_t> lastSync;
   bool isNew = false;  // nothing was ever indexed, and the daemon is not asked
   std::optional<IndexStatus> index;
   std::optional<DiskUse> disk;
@@ -217,6 +216,7 @@ ClassStatus readClass(const Options& options) {
   ClassStatus status;
   status.name = options.protectionClass;
   status.catalogue = mailsync::openCatalogue(syncSettings(options), &status.error);
+  status.lastSync = mailsync::lastSync(syncSettings(options));
   status.isNew = isUnknownClass(options);
   if (!status.isNew) status.index = readIndexStatus(options, &status.error);
   status.disk = diskUse(options);
@@ -225,7 +225,7 @@ ClassStatus readClass(const Options& options) {
 }
 
 std::string classText(const ClassStatus& status) {
-  std::string text = status.catalogue ? mailboxText(*status.catalogue)
+  std::string text = status.catalogue ? mailboxText(*status.catalogue, status.lastSync)
                                       : "No mailbox is kept in step; see tallow sync.\n";
   text +=
       fmt::format("Watch      {}\n", status.watched ? "at work" : "not at work; see tallow watch");
@@ -241,7 +241,8 @@ nlohmann::json classJSON(const ClassStatus& status) {
     files = {{"indexBytes", status.disk->index}, {"storeBytes", status.disk->store}};
   }
   return {{"class", status.name},
-          {"mailboxes", status.catalogue ? mailboxJSON(*status.catalogue) : nlohmann::json()},
+          {"mailboxes",
+           status.catalogue ? mailboxJSON(*status.catalogue, status.lastSync) : nlohmann::json()},
           {"index", status.index ? indexJSON(*status.index) : nlohmann::json()},
           {"files", std::move(files)},
           {"watched", status.watched}};

@@ -96,6 +96,6 @@ bool syncPlaces(const SyncSettings& settings, const std::vector<std::string>& pl
 bool forgetDeleted(const SyncSettings& settings, TLErrorOut error);
 
 // Seconds since 1970 of the last run that went to its end; none where there was none.
-[[nodiscard]] std::optional<int64_t> lastSync(Catalogue& catalogue);
+[[nodiscard]] std::optional<int64_t> lastSync(const SyncSettings& settings);
 
 }  // namespace mailsync

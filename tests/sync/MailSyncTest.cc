@@ -273,6 +273,24 @@ TEST_F(MailSyncTest, WhatCannotBeIndexedIsToldAndNotTakenForSent) {
   EXPECT_EQ(indexed(), (Lines{"a: one", "a: poison"}));
 }
 
+// Neither does it wait for the disk.
+TEST_F(MailSyncTest, WithoutChangesTheCatalogueIsNotWritten) {
+  EXPECT_EQ(mailsync::lastSync(settings), std::nullopt);
+  add("a/cur/1", "one");
+  age();
+  ASSERT_TRUE(sync());
+  ASSERT_TRUE(sync());
+  struct stat before {};
+  struct stat after {};
+  ASSERT_EQ(stat(cataloguePath().c_str(), &before), 0);
+  ASSERT_TRUE(sync());
+  ASSERT_EQ(stat(cataloguePath().c_str(), &after), 0);
+  EXPECT_EQ(before.st_mtim.tv_sec, after.st_mtim.tv_sec);
+  EXPECT_EQ(before.st_mtim.tv_nsec, after.st_mtim.tv_nsec);
+  EXPECT_NEAR(static_cast<double>(mailsync::lastSync(settings).value_or(0)),
+              static_cast<double>(std::time(nullptr)), 60);
+}
+
 TEST_F(MailSyncTest, ADryRunChangesNothing) {
   add("a/cur/1", "one");
   ASSERT_TRUE(sync());
