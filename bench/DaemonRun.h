@@ -45,7 +45,7 @@ class DaemonRun {
   // Processor time of all its threads so far; less noisy than wall time on a busy machine.
   [[nodiscard]] double cpuSeconds() const;
 
-  // How many threads and open descriptors it has now.
+  // The current number of threads and of open descriptors.
   [[nodiscard]] size_t threads() const { return countEntries("task"); }
   [[nodiscard]] size_t descriptors() const { return countEntries("fd"); }
 

@@ -12,17 +12,17 @@
 #include "bench/Percentiles.h"
 #include "bench/Queries.h"
 
-// What a start costs: the first searches after one, with nothing in the page cache, and many small
+// Measures the cost of a start: the first searches with a cold page cache, and many small
 // protection classes.
 namespace {
 
 using Queries = std::vector<std::string>;
 
-// Queues end their threads when they have been idle for two seconds.
+// The threads of queues end after two idle seconds.
 constexpr std::chrono::seconds kUntilIdle(5);
 
-// Has the kernel drop what it has cached of the files below `path`. It keeps pages that are not on
-// the disk yet, so each file is synced first.
+// Evicts the files in `path` from the page cache. Each is synced first, because the kernel keeps
+// pages that are not on disk yet.
 void evictFromPageCache(const std::string& path) {
   for (const auto& entry : std::filesystem::recursive_directory_iterator(path)) {
     if (!entry.is_regular_file()) continue;
@@ -40,9 +40,10 @@ struct ColdStart {
   bench::Percentiles tenth;
 };
 
-void addColdStart(ColdStart& times, const bench::ScratchDirectory& scratch,
-                  const std::string& stateDirectory, const Queries& queries, size_t round) {
+void addColdStart(ColdStart& times, const std::string& stateDirectory, const Queries& queries,
+                  size_t round) {
   constexpr size_t kQueries = 10;
+  const bench::ScratchDirectory scratch;
   evictFromPageCache(stateDirectory);
   const double start = bench::secondsNow();
   bench::DaemonRun daemon(scratch, stateDirectory);
@@ -62,15 +63,14 @@ std::string figures(const char* name, const bench::Percentiles& times) {
                      times.at(1) * 1e3);
 }
 
-void measureColdStarts(const bench::ScratchDirectory& scratch, const std::string& stateDirectory,
-                       const Queries& queries, size_t rounds) {
+void measureColdStarts(const std::string& stateDirectory, const Queries& queries, size_t rounds) {
   ColdStart times;
-  for (size_t i = 0; i < rounds; ++i) addColdStart(times, scratch, stateDirectory, queries, i);
+  for (size_t i = 0; i < rounds; ++i) addColdStart(times, stateDirectory, queries, i);
   fmt::print("cold_starts={}{}{}{}\n", rounds, figures("ready", times.ready),
              figures("first_search", times.first), figures("tenth_search", times.tenth));
 }
 
-// What the daemon has now, beside what it had before.
+// The resources that the daemon has gained since construction.
 class Growth {
  public:
   explicit Growth(bench::DaemonRun& daemon)
@@ -99,9 +99,10 @@ class Growth {
 
 using ForClass = std::function<void(client::SearchServiceProxy&, const std::string& name)>;
 
-// Calls `use` for each class, then waits until they are idle, and prints what a class has cost.
-void measureClasses(const bench::ScratchDirectory& scratch, const std::string& stateDirectory,
-                    const char* what, size_t classes, const ForClass& use) {
+// Calls `use` for each class, waits until they are idle, and prints the cost of a class.
+void measureClasses(const std::string& stateDirectory, const char* what, size_t classes,
+                    const ForClass& use) {
+  const bench::ScratchDirectory scratch;
   bench::DaemonRun daemon(scratch, stateDirectory);
   const Growth growth(daemon);
   client::SearchServiceProxy service(daemon.runtimeDirectory());
@@ -159,19 +160,19 @@ int run(int argc, char** argv) {
     spool.send(service);
     daemon.stop();
   }
-  measureColdStarts(scratch, stateDirectory, queries, rounds);
+  measureColdStarts(stateDirectory, queries, rounds);
 
   std::vector<client::EncodedItem> batch;
   spool.rewind();
   static_cast<void>(spool.next(batch));
   if (batch.size() > mails) batch.resize(mails);
-  measureClasses(scratch, scratch / "classes", "empty", classes, search);
+  measureClasses(scratch / "classes", "empty", classes, search);
   const std::string full = fmt::format("mails={}", batch.size());
-  measureClasses(scratch, scratch / "full", full.c_str(), classes,
+  measureClasses(scratch / "full", full.c_str(), classes,
                  [&](client::SearchServiceProxy& service, const std::string& name) {
                    bench::indexBatch(service, batch, name);
                  });
-  measureClasses(scratch, scratch / "full", (full + " reopened").c_str(), classes, search);
+  measureClasses(scratch / "full", (full + " reopened").c_str(), classes, search);
   return 0;
 }
 

@@ -90,20 +90,20 @@ Identifiers search(client::SearchServiceProxy& service, const TLQuery& query) {
 }
 
 // How often the daemon has read all messages.
-size_t walksLoggedIn(const std::string& path) {
+size_t linearSearchesIn(const std::string& path) {
   std::ifstream log(path);
-  size_t walks = 0;
+  size_t searches = 0;
   for (std::string line; std::getline(log, line);) {
-    if (line.find("will use a slow linear search") != std::string::npos) ++walks;
+    if (line.find("will use a slow linear search") != std::string::npos) ++searches;
   }
-  return walks;
+  return searches;
 }
 
 int run(int argc, char** argv) {
   std::vector<std::string> paths{TALLOW_SAMPLE_MAIL};
   size_t rounds = 5;
   uint32_t seed = 1;
-  CLI::App app("Times verification queries, by the index and by a walk over all messages.",
+  CLI::App app("Times verification queries, by the index and by reading all messages.",
                "verification_benchmark");
   app.add_option("MAIL", paths, "Maildirs, mbox files, directories (default: the sample mail)");
   app.add_option("--rounds", rounds, "Queries of each kind (default: 5)")
@@ -139,9 +139,9 @@ int run(int argc, char** argv) {
     }
   }
   daemon.stop();
-  const size_t walks = walksLoggedIn(scratch / "daemon.log");
+  const size_t searches = linearSearchesIn(scratch / "daemon.log");
   fmt::print("{} regular_that_walked={} wrong_answers={}\n", line,
-             walks - rounds * std::size(kCounts), wrong);
+             searches - rounds * std::size(kCounts), wrong);
   return wrong == 0 ? 0 : 1;
 }
 

@@ -6,10 +6,10 @@
 #include "daemon/TLDeviceLockMonitor.h"
 #include "docstore/TALSqliteDocStore.h"
 #include "platform/Paths.h"
+#include "records/TLErrorCodes.h"
 
 namespace {
 
-constexpr int kIndexerUnavailable = -2;
 // More than the recovery of a class's two databases writes.
 constexpr uint64_t kOpeningRoom = 32 * 1024 * 1024;
 constexpr size_t kOpeningDescriptors = 16;  // more than opening the two databases needs at a time
@@ -34,7 +34,8 @@ const platform::Log& TALIndexerManager::log() {
 }
 
 TLError TALIndexerManager::indexerUnavailableError() {
-  return {"com.quill.tallow.TALIndexerManager", kIndexerUnavailable, "Indexer unavailable."};
+  return {kTALIndexerManagerErrorDomain, static_cast<int>(TALIndexerManagerError::unavailable),
+          "Indexer unavailable."};
 }
 
 TALIndexerManager::TALIndexerManager(std::string path)

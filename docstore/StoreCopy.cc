@@ -8,10 +8,9 @@
 
 #include "platform/FileDescriptor.h"
 #include "platform/Files.h"
+#include "records/TLErrorCodes.h"
 
 namespace {
-
-constexpr const char* kErrorDomain = "DocStore";
 
 struct Close {
   void operator()(sqlite3* database) const { sqlite3_close(database); }
@@ -25,7 +24,7 @@ Connection open(const std::string& path, TLErrorOut error) {
   const int code = sqlite3_open_v2(path.c_str(), &opened, SQLITE_OPEN_READWRITE, nullptr);
   Connection database(opened);
   if (code == SQLITE_OK) return database;
-  platform::setError(error, {kErrorDomain, code, path + ": " + sqlite3_errstr(code)});
+  platform::setError(error, {kDocStoreErrorDomain, code, path + ": " + sqlite3_errstr(code)});
   return nullptr;
 }
 
@@ -42,7 +41,7 @@ bool run(sqlite3* database, const char* query, const std::function<int(sqlite3_s
     }
   }
   if (code == SQLITE_DONE) return true;
-  platform::setError(error, {kErrorDomain, code, sqlite3_errmsg(database)});
+  platform::setError(error, {kDocStoreErrorDomain, code, sqlite3_errmsg(database)});
   return false;
 }
 

@@ -4,11 +4,9 @@
 
 #include "docstore/Statement.h"
 #include "platform/Files.h"
+#include "records/TLErrorCodes.h"
 
 namespace {
-
-constexpr const char* kErrorDomain = "DocStore";
-constexpr int kNoConnection = 1001;
 
 constexpr const char* kVersion = "v0.4";
 constexpr const char* kVersionKey = "version";
@@ -86,7 +84,7 @@ bool TALSqliteDocStore::_openConnection(TLErrorOut error) {
   const int code = sqlite3_open_v2(_storePath.c_str(), &_database, flags, nullptr);
   if (code != SQLITE_OK) {
     log().error("Failed to open database with error code {}", code);
-    platform::setError(error, {kErrorDomain, code, sqlite3_errstr(code)});
+    platform::setError(error, {kDocStoreErrorDomain, code, sqlite3_errstr(code)});
     sqlite3_close(_database);
     _database = nullptr;
     return false;
@@ -213,14 +211,15 @@ TALSqliteDocStore::Statement TALSqliteDocStore::_prepare(const std::string& quer
 }
 
 TLError TALSqliteDocStore::_lastSqliteErrorWithError(TLErrorOut error) {
-  if (_database == nullptr) return _errorWithCode(kNoConnection, error);
-  TLError result{kErrorDomain, sqlite3_errcode(_database), sqlite3_errmsg(_database)};
+  if (_database == nullptr)
+    return _errorWithCode(static_cast<int>(TALDocStoreError::noConnection), error);
+  TLError result{kDocStoreErrorDomain, sqlite3_errcode(_database), sqlite3_errmsg(_database)};
   platform::setError(error, result);
   return result;
 }
 
 TLError TALSqliteDocStore::_errorWithCode(int code, TLErrorOut error) {
-  TLError result{kErrorDomain, code, ""};
+  TLError result{kDocStoreErrorDomain, code, ""};
   platform::setError(error, result);
   return result;
 }

@@ -10,9 +10,9 @@
 #include <string_view>
 
 #include "platform/Assert.h"
-#include "rpc/ServerConnection.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
+#include "rpc/ServerConnection.h"
 #include "tests/support/RawMessages.h"
 
 namespace {

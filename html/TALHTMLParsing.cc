@@ -11,14 +11,14 @@ namespace {
 
 constexpr size_t kFirstCapacity = 4096;
 constexpr uint64_t kMinTitleLimit = 512;
-constexpr int kBlankPasses = 10;
+constexpr int kMaxHalvings = 10;
 constexpr const char* kTitleKey = "SysTitleDocumentAttribute";
 
 // The number of bytes after a lead byte, by its high nibble; 0 for other bytes.
 constexpr std::array<uint8_t, 16> kFollowing = {0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 1, 1, 2, 3};
 
 // Replaces each two spaces by one.
-bool halveBlanks(std::string& text) {
+bool halveSpaces(std::string& text) {
   std::string out;
   out.reserve(text.size());
   for (size_t i = 0; i < text.size(); ++i) {
@@ -38,7 +38,7 @@ std::string titleFromBody(TLStringView body) {
   for (char& c : title) {
     if (c == '\n' || c == '\t') c = ' ';
   }
-  for (int pass = 0; pass < kBlankPasses && halveBlanks(title); ++pass) {
+  for (int pass = 0; pass < kMaxHalvings && halveSpaces(title); ++pass) {
   }
   return title;
 }

@@ -17,11 +17,11 @@ constexpr size_t kMaxCharacterUnits = 64;
 bool isLineBreak(char16_t unit) {
   return unit == u'\n' || unit == u'\r';
 }
-bool isBlank(char16_t unit) {
+bool isSpaceOrTab(char16_t unit) {
   return unit == u'\t' || unit == u' ' || unit == u'\u00A0';
 }
 bool isSkippedAtStart(char16_t unit) {
-  return isLineBreak(unit) || isBlank(unit) || unit == u'\uFFFC';
+  return isLineBreak(unit) || isSpaceOrTab(unit) || unit == u'\uFFFC';
 }
 
 // The start of the composed character that contains body[at], and its length in units.
@@ -66,7 +66,7 @@ std::optional<TLString> snippetOfBody(const std::optional<TLString>& body) {
     if (isLineBreak(unit)) {
       ++pendingLineBreaks;
       blank = false;
-    } else if (isBlank(unit)) {
+    } else if (isSpaceOrTab(unit)) {
       if (!blank) out += u' ';
       blank = true;
     } else {

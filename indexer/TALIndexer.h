@@ -20,22 +20,13 @@
 #include "platform/Queue.h"
 #include "platform/TLError.h"
 #include "query/TALQueryProcessor.h"
+#include "records/TLErrorCodes.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"
 #include "salt/Index.h"
 #include "salt/Search.h"
 #include "tokenizer/Tokenizer.h"
 #include "zones/TALZoneManager.h"
-
-inline constexpr const char* kTALIndexerErrorDomain = "TALIndexer";
-
-// Error codes of this class.
-enum class TALIndexerError {
-  document = 1,          // "document has no identifier", "index failed"
-  query = 3,             // the query yielded no terms
-  shuttingDown = 4,      // "shutting down"
-  validationFailed = 5,  // "index validation failed"
-};
 
 // Indexes and searches the documents of one protection class: owns its text index and its document
 // store, and performs all work that changes them.
@@ -111,9 +102,9 @@ class TALIndexer {
   // more than "queryModification.sufficentRetrievalThreshold" items, the query is modified, and the
   // results are those of the modified words, if any.
   //
-  // Returns the best `most` items. `count` and `replaced` may be null: they receive how many items
+  // Returns the best `maxItems`. `count` and `replaced` may be null: they receive how many items
   // were ranked, and the words that were replaced for these results.
-  [[nodiscard]] Items search(TLQuery& query, TLErrorOut error, size_t most = SIZE_MAX,
+  [[nodiscard]] Items search(TLQuery& query, TLErrorOut error, size_t maxItems = SIZE_MAX,
                              size_t* count = nullptr, WordReplacements* replaced = nullptr);
 
   // Every stored document whose subject is one of `subjects`, in the store's order and without
@@ -219,16 +210,16 @@ class TALIndexer {
   struct RankParams;
   struct RankKey;
 
-  Found searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms, size_t most,
-                   TLErrorOut error) TL_REQUIRES(_indexMutex);
+  Found searchOnce(const TLQuery& query, std::vector<saltsearch::Term>& saltQueryTerms,
+                   size_t maxItems, TLErrorOut error) TL_REQUIRES(_indexMutex);
   // One key for each result, in the same order, with an item only if its date was unknown or all
   // items are wanted. Results without a document in the store are dropped.
   std::vector<RankKey> rankKeys(const std::vector<saltsearch::DocResult>& results,
-                                const RankParams& params, size_t most, TLErrorOut error)
+                                const RankParams& params, size_t maxItems, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
   bool retrieveItems(const std::vector<RankKey*>& keys, const RankParams& params, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
-  Found bestItems(std::vector<RankKey>& keys, const RankParams& params, size_t most,
+  Found bestItems(std::vector<RankKey>& keys, const RankParams& params, size_t maxItems,
                   TLErrorOut error) TL_REQUIRES(_indexMutex);
   static std::vector<saltsearch::Term> _populateQueryTerms(const std::vector<TALTerm>& terms);
   static void _fillScores(TLIndexableItem& item, const saltsearch::DocResult& indexerResult,
@@ -237,7 +228,7 @@ class TALIndexer {
   // The second pass: searches with modified terms if a modifier finds some, otherwise returns
   // `firstResults`. Drops these if the second pass fails.
   Found searchModified(const TLQuery& query, const std::vector<saltsearch::Term>& saltQueryTerms,
-                       Found firstResults, size_t most, TLErrorOut error,
+                       Found firstResults, size_t maxItems, TLErrorOut error,
                        WordReplacements* replaced);
   // Tries the modifiers in turn on terms that found too little; the first that changes a term wins.
   // True when `modifiedQueryTerms` and `reason` are set.

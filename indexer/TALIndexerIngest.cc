@@ -33,11 +33,6 @@ namespace {
 // remain in the index without being in the store.
 constexpr size_t kDeletedAtATime = 100;
 
-// For an unknown document the store returns 0 without an error, but deleting it is an error, with
-// the store's domain and the engine's code for "not found".
-constexpr int kDocumentNotFound = 12;
-constexpr const char* kDocStoreErrorDomain = "DocStore";
-
 // Sets the plain text and the snippet of one item, and touches nothing else.
 void prepareText(TLIndexableItem& item) {
   std::optional<TLString> body;
@@ -371,7 +366,8 @@ std::vector<uint32_t> TALIndexer::storedIDs(std::span<const TLString> identifier
     const uint32_t docID = url ? docStore()->documentIDWithURL(*url, &failure) : 0;
     const bool repeated = std::find(docIDs.begin(), docIDs.end(), docID) != docIDs.end();
     if (!failure && (docID == 0 || repeated)) {
-      failure = TLError{kDocStoreErrorDomain, kDocumentNotFound, "no document with URL " + shown};
+      failure = TLError{kDocStoreErrorDomain, static_cast<int>(TALDocStoreError::notFound),
+                        "no document with URL " + shown};
     }
     if (failure) {
       log().error("Failed to fetch document ID in docstore for URL {}: {}", shown,

@@ -20,8 +20,8 @@ WordReplacements replacedWords(const std::vector<saltsearch::Term>& typed,
     const std::string& from = typed[i].tokens.front();
     const std::string& to = modified[i].tokens.front();
     if (from == to || std::max(from.size(), to.size()) > kMaxReplacedWordSize) continue;
-    words.push_back({std::string(modification::withoutBlank(from)),
-                     std::string(modification::withoutBlank(to)), reason});
+    words.push_back({std::string(modification::withoutTrailingSpace(from)),
+                     std::string(modification::withoutTrailingSpace(to)), reason});
   }
   return words;
 }
@@ -38,7 +38,7 @@ bool TALIndexer::_shouldRunQueryModification(size_t results, int64_t retrievalTh
 
 TALIndexer::Found TALIndexer::searchModified(const TLQuery& query,
                                              const std::vector<saltsearch::Term>& saltQueryTerms,
-                                             Found firstResults, size_t most, TLErrorOut error,
+                                             Found firstResults, size_t maxItems, TLErrorOut error,
                                              WordReplacements* replaced) {
   log().standard("Query modification started for query with {} terms", saltQueryTerms.size());
   std::vector<saltsearch::Term> modified;
@@ -52,7 +52,7 @@ TALIndexer::Found TALIndexer::searchModified(const TLQuery& query,
   Found found;
   {
     MutexLock lock(_indexMutex);
-    found = searchOnce(query, modified, most, &failure);
+    found = searchOnce(query, modified, maxItems, &failure);
   }
   if (failure) {
     log().error("Failed to search modified query in SALT due to error: {}",

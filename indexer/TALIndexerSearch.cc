@@ -114,8 +114,8 @@ struct TALIndexer::RankKey {
   float mailDateReceived = 0;  // narrowed to float: dates within about two minutes tie
 };
 
-TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t most, size_t* count,
-                                     WordReplacements* replaced) {
+TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t maxItems,
+                                     size_t* count, WordReplacements* replaced) {
   if (count != nullptr) *count = 0;
   if (replaced != nullptr) replaced->clear();
   query.setSearchParams(query.hasSearchParams()
@@ -137,7 +137,7 @@ TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t mo
   Found found;
   {
     MutexLock lock(_indexMutex);
-    found = searchOnce(query, saltQueryTerms, most, &failure);
+    found = searchOnce(query, saltQueryTerms, maxItems, &failure);
   }
   if (failure) {
     log().error("Failed to search query in salt due to error: {}", platform::printable(failure));
@@ -147,7 +147,7 @@ TALIndexer::Items TALIndexer::search(TLQuery& query, TLErrorOut error, size_t mo
   const int64_t threshold =
       query.searchParams()->intValueForKey("queryModification.sufficentRetrievalThreshold");
   if (_shouldRunQueryModification(found.count, threshold)) {
-    found = searchModified(query, saltQueryTerms, std::move(found), most, error, replaced);
+    found = searchModified(query, saltQueryTerms, std::move(found), maxItems, error, replaced);
   }
   if (count != nullptr) *count = found.count;
   return std::move(found.items);
@@ -171,8 +171,8 @@ std::vector<saltsearch::Term> TALIndexer::_populateQueryTerms(const std::vector<
 }
 
 TALIndexer::Found TALIndexer::searchOnce(const TLQuery& query,
-                                         std::vector<saltsearch::Term>& saltQueryTerms, size_t most,
-                                         TLErrorOut error) {
+                                         std::vector<saltsearch::Term>& saltQueryTerms,
+                                         size_t maxItems, TLErrorOut error) {
   const auto text = _text.get();
   if (_shutdown || text == nullptr) {
     platform::setError(error, noIndexError());
@@ -192,7 +192,7 @@ TALIndexer::Found TALIndexer::searchOnce(const TLQuery& query,
   if (results.empty()) return {};
 
   const RankParams ranking(params, queryTime);
-  const size_t read = std::max(most, itemsToLog(params));
+  const size_t read = std::max(maxItems, itemsToLog(params));
   Signpost::begin(signpost, "retrieve items", "retrieving {} items", results.size());
   std::vector<RankKey> keys = rankKeys(results, ranking, read, error);
   Signpost::end(signpost, "retrieve items", "retrieved {} items", keys.size());
@@ -200,12 +200,12 @@ TALIndexer::Found TALIndexer::searchOnce(const TLQuery& query,
   Found found = bestItems(keys, ranking, read, error);
   Signpost::end(signpost, "ranking items", "ranked {} items", found.count);
   logRanking(query, found);
-  if (found.items.size() > most) found.items.resize(most);
+  if (found.items.size() > maxItems) found.items.resize(maxItems);
   return found;
 }
 
 std::vector<TALIndexer::RankKey> TALIndexer::rankKeys(
-    const std::vector<saltsearch::DocResult>& results, const RankParams& params, size_t most,
+    const std::vector<saltsearch::DocResult>& results, const RankParams& params, size_t maxItems,
     TLErrorOut error) {
   std::vector<RankKey> keys;
   std::vector<RankKey*> unknown;
@@ -213,7 +213,7 @@ std::vector<TALIndexer::RankKey> TALIndexer::rankKeys(
   for (const auto& result : results) {
     if (result.docID == 0) log().error("Invalid doc id: {}", result.docID);
     RankKey& key = keys.emplace_back(RankKey{&result});
-    const auto date = results.size() > most ? _docDates.find(result.docID) : std::nullopt;
+    const auto date = results.size() > maxItems ? _docDates.find(result.docID) : std::nullopt;
     if (date) {
       key.setDate(*date, params);
     } else {
@@ -260,13 +260,14 @@ bool TALIndexer::retrieveItems(const std::vector<RankKey*>& keys, const RankPara
   return true;
 }
 
-// Reads only the items that may be among the best `most`: these and the ones tied with the last.
+// Reads only the items that may be among the best `maxItems`: these and the ones tied with the
+// last.
 TALIndexer::Found TALIndexer::bestItems(std::vector<RankKey>& keys, const RankParams& params,
-                                        size_t most, TLErrorOut error) {
+                                        size_t maxItems, TLErrorOut error) {
   std::stable_sort(keys.begin(), keys.end(), RankKey::scoresBefore);
   size_t end = 0;
   for (std::vector<RankKey*> unread;;) {
-    end = std::min(most, keys.size());
+    end = std::min(maxItems, keys.size());
     while (end != 0 && end < keys.size() && !RankKey::scoresBefore(keys[end - 1], keys[end])) ++end;
     unread.clear();
     for (size_t i = 0; i < end; ++i) {
@@ -278,8 +279,9 @@ TALIndexer::Found TALIndexer::bestItems(std::vector<RankKey>& keys, const RankPa
   }
   std::stable_sort(keys.begin(), keys.begin() + static_cast<ptrdiff_t>(end), RankKey::ranksBefore);
   Found found{{}, keys.size()};
-  found.items.reserve(std::min(most, end));
-  for (size_t i = 0; i < std::min(most, end); ++i) found.items.push_back(std::move(keys[i].item));
+  found.items.reserve(std::min(maxItems, end));
+  for (size_t i = 0; i < std::min(maxItems, end); ++i)
+    found.items.push_back(std::move(keys[i].item));
   return found;
 }
 
@@ -325,7 +327,7 @@ std::optional<TALIndexer::Items> TALIndexer::iterateAllDocsToFindMatchingSubject
   Items results;
   std::optional<TLError> failure;
   const auto store = docStore();
-  const bool walked =
+  const bool readAll =
       store != nullptr &&
       store->enumerateDocIDs(
           &failure, [&](int64_t, uint32_t docID, const TLURL& url, bool*, TLErrorOut) {
@@ -341,7 +343,7 @@ std::optional<TALIndexer::Items> TALIndexer::iterateAllDocsToFindMatchingSubject
             results.push_back(doc);
             unmatched.erase(*subject);
           });
-  if (!walked || failure) {
+  if (!readAll || failure) {
     log().error("Error in retriving via DocStore: {}", platform::printable(failure));
     if (!failure) _errorWithCode(TALIndexerError::shuttingDown, "shutting down", &failure);
     platform::setError(error, *failure);

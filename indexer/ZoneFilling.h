@@ -1,9 +1,9 @@
 #pragma once
 
-#include "zones/TALZoneManager.h"
-#include "zones/zone.h"
 #include "records/TLIndexableItem.h"
 #include "tokenizer/Tokenizer.h"
+#include "zones/TALZoneManager.h"
+#include "zones/zone.h"
 
 // Fills the zones of the text index from the attributes of an item.
 

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "modification/TermTokens.h"
 #include "modification/WeightedDistance.h"
 #include "platform/Redaction.h"
 #include "salt/Alternatives.h"
@@ -49,11 +50,6 @@ std::string redacted(std::string_view token) {
 
 bool isPrintableASCII(std::string_view word) {
   return std::all_of(word.begin(), word.end(), [](char c) { return c >= 0x20 && c <= 0x7E; });
-}
-
-std::string_view withoutTrailingBlank(std::string_view token) {
-  if (token.ends_with(' ')) token.remove_suffix(1);
-  return token;
 }
 
 // 1 minus the distance divided by the longer word's length; nullopt for words too far apart.
@@ -159,7 +155,7 @@ void TALSpellCorrection::score(const std::vector<saltsearch::Term>& terms, size_
 std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidates(
     std::string_view word, saltsearch::Term term, const salt::Index& textStore) const {
   const bool wholeWord = word.ends_with(' ');
-  word = withoutTrailingBlank(word);
+  word = modification::withoutTrailingSpace(word);
   if (!isPrintableASCII(word)) {
     log().debug("Token has unsupported char.");
   } else {
@@ -233,7 +229,7 @@ std::vector<TALCorrectionCandidate> TALSpellCorrection::_getCandidatesFromTopKVo
   if (vocab == nullptr) return candidates;
   for (const std::string& entry : *vocab) {
     if (entry.size() < kMinEntryBytes || entry.size() > kMaxEntryBytes) continue;
-    const auto score = closeness(word, withoutTrailingBlank(entry));
+    const auto score = closeness(word, modification::withoutTrailingSpace(entry));
     if (!score) continue;
     if (static_cast<int64_t>(candidates.size()) >= _candidateBudget) break;
     candidates.push_back({*score, 0, 0, entry});

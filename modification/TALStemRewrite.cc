@@ -49,7 +49,7 @@ bool TALStemRewrite::stemRewrite(const std::vector<saltsearch::Term>& terms,
 
 std::string TALStemRewrite::getStemToken(saltsearch::Term term, const salt::Index& textStore) {
   std::string stemToken =
-      TALStemWord(modification::withoutBlank(term.tokens.front()), kMaxStemmedBytes);
+      TALStemWord(modification::withoutTrailingSpace(term.tokens.front()), kMaxStemmedBytes);
   modification::setFirstToken(term, stemToken);
   return modification::occurs(std::move(term), textStore) ? stemToken : std::string();
 }

@@ -135,7 +135,7 @@ float TALSynonyms::synonymExpansion(const std::vector<saltsearch::Term>& terms,
   const size_t target = targetOf(terms);
   if (target == terms.size()) return kNoExpansion;
   const std::string& token = terms[target].tokens.front();
-  const std::string word(modification::withoutBlank(token));
+  const std::string word(modification::withoutTrailingSpace(token));
   if (word.size() == token.size()) {
     log().standard("Skipping synonym expansion for <{}> as it doesn't have a trailing space",
                    redacted(word));

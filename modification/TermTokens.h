@@ -18,7 +18,7 @@ namespace modification {
 }
 
 // The token without its trailing space, if any.
-[[nodiscard]] inline std::string_view withoutBlank(std::string_view token) {
+[[nodiscard]] inline std::string_view withoutTrailingSpace(std::string_view token) {
   if (token.ends_with(' ')) token.remove_suffix(1);
   return token;
 }

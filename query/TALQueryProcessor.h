@@ -5,12 +5,12 @@
 #include <string>
 #include <vector>
 
-#include "zones/TALZoneManager.h"
 #include "modification/TALSynonyms.h"
 #include "platform/Log.h"
 #include "query/TALTerm.h"
 #include "records/TLQuery.h"
 #include "tokenizer/Tokenizer.h"
+#include "zones/TALZoneManager.h"
 
 // Turns a query into the flat list of scored terms that the text index evaluates; this determines
 // the ranking.

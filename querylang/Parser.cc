@@ -10,7 +10,7 @@ namespace sq {
 namespace {
 
 // Character classes of the POSIX locale: bytes from 0x80 on belong to none.
-constexpr bool isBlank(char c) {
+constexpr bool isWhiteSpace(char c) {
   return c == ' ' || (c >= '\t' && c <= '\r');
 }
 constexpr bool isDigit(char c) {
@@ -26,8 +26,8 @@ constexpr bool continuesWord(char c) {
   return startsWord(c) || c == '-' || c == '.' || c == '_';
 }
 constexpr bool isTimeArgument(char c) {
-  return isDigit(c) || isBlank(c) || c == '+' || c == '-' || c == '.' || c == ':' || c == 'T' ||
-         c == 'Z';
+  return isDigit(c) || isWhiteSpace(c) || c == '+' || c == '-' || c == '.' || c == ':' ||
+         c == 'T' || c == 'Z';
 }
 
 struct Spelling {
@@ -84,8 +84,8 @@ class Scanner {
   [[nodiscard]] size_t position() const { return static_cast<size_t>(_tokenAt - _begin); }
 
  private:
-  void skipBlanks() {
-    while (isBlank(*_at)) ++_at;
+  void skipWhiteSpace() {
+    while (isWhiteSpace(*_at)) ++_at;
   }
   template <typename Class>
   void takeRun(const Class& isMember) {
@@ -104,7 +104,7 @@ class Scanner {
 };
 
 Token Scanner::next() {
-  skipBlanks();
+  skipWhiteSpace();
   _tokenAt = _at;
   if (*_at == '\0') return kTokenEnd;
   if (startsWord(*_at)) return word();
@@ -142,13 +142,13 @@ Token Scanner::timeFunction() {
   for (const Spelling& function : kTimeFunctions) {
     if (!beginsWith(_at, function.text)) continue;
     _at += function.text.size();
-    skipBlanks();
+    skipWhiteSpace();
     if (*_at != '(') {
       _text = "0";
       return function.token;
     }
     ++_at;
-    skipBlanks();
+    skipWhiteSpace();
     takeRun(isTimeArgument);
     if (*_at != ')') return kTokenError;
     ++_at;

@@ -18,14 +18,14 @@ constexpr double kSecondsInWeek = 7 * kSecondsInDay;
 bool isDigit(char c) {
   return c >= '0' && c <= '9';
 }
-bool isBlank(char c) {
+bool isWhiteSpace(char c) {
   return c == ' ' || (c >= '\t' && c <= '\r');
 }
 
 // The decimal number at the start of a text, after white space; 0 if there is none, infinite if it
 // is too large.
 double leadingNumber(std::string_view text) {
-  while (!text.empty() && isBlank(text.front())) text.remove_prefix(1);
+  while (!text.empty() && isWhiteSpace(text.front())) text.remove_prefix(1);
   const bool negative = text.starts_with('-');
   if (negative || text.starts_with('+')) text.remove_prefix(1);
   if (text.starts_with('-')) return 0;
@@ -107,8 +107,8 @@ class PlacesReader {
     }
     return value;
   }
-  void skipBlanks() {
-    while (!atEnd() && isBlank(_text[_position])) ++_position;
+  void skipWhiteSpace() {
+    while (!atEnd() && isWhiteSpace(_text[_position])) ++_position;
   }
 
  private:
@@ -151,9 +151,9 @@ bool evalTimeISO8601(std::string_view text, double* time) {
   reader.takeIf('-');
   if (!reader.atEnd()) fields.day = reader.number(2);
   const char separator = reader.take();
-  if (isBlank(separator) || separator == 'T' || separator == 'Z') {
+  if (isWhiteSpace(separator) || separator == 'T' || separator == 'Z') {
     readTimeOfDay(reader, fields);
-    reader.skipBlanks();
+    reader.skipWhiteSpace();
     if (separator == 'Z') {
       zone = Zone::utc;
     } else if (separator != 'T' || !reader.atEnd()) {

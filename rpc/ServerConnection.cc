@@ -17,6 +17,7 @@
 #include "platform/Clock.h"
 #include "platform/Log.h"
 #include "platform/Queue.h"
+#include "rpc/Greeting.h"
 #include "rpc/Marshal.h"
 
 namespace rpc {
@@ -219,7 +220,8 @@ bool ServerConnection::openBus() {
 }
 
 bool ServerConnection::exportInterfaces() {
-  return std::all_of(_interfaces.begin(), _interfaces.end(),
+  return addGreeting(_bus) &&
+         std::all_of(_interfaces.begin(), _interfaces.end(),
                      [this](const Interface& interface) { return exportInterface(interface); });
 }
 

@@ -26,8 +26,8 @@ void Activity::interrupt() {
   _changed.notify_all();
 }
 
-void Activity::waitForEnd(std::chrono::nanoseconds most) {
-  const auto deadline = Clock::now() + most;
+void Activity::waitForEnd(std::chrono::nanoseconds timeout) {
+  const auto deadline = Clock::now() + timeout;
   platform::MutexLock lock(_mutex);
   for (;;) {
     const auto over = [this]() TL_REQUIRES(_mutex) { return _interrupted || !any(); };

@@ -29,9 +29,9 @@ class Activity {
   // Cheap: one relaxed load.
   [[nodiscard]] bool any() const { return _running.load(std::memory_order_relaxed) != 0; }
 
-  // Waits until nothing has run for the length of the gap; at most `most`, and not after an
+  // Waits until nothing has run for the length of the gap; at most `timeout`, and not after an
   // interruption.
-  void waitForEnd(std::chrono::nanoseconds most) TL_EXCLUDES(_mutex);
+  void waitForEnd(std::chrono::nanoseconds timeout) TL_EXCLUDES(_mutex);
   // Ends all waits, now and in future.
   void interrupt() TL_EXCLUDES(_mutex);
 

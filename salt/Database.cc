@@ -1,5 +1,7 @@
 #include "salt/Database.h"
 
+#include <leveldb/cache.h>
+
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
@@ -14,9 +16,8 @@ namespace salt {
 
 namespace {
 
-constexpr size_t kWriteBufferBytes =
-    6 * 1024 * 1024;  // size of memtable and log at which leveldb flushes
-constexpr size_t kBlockCacheBytes = 1024 * 1024;
+constexpr size_t kWriteBufferBytes = 6 * 1024 * 1024;  // leveldb flushes a memtable of this size
+constexpr size_t kBlockCacheBytes = 8 * 1024 * 1024;   // of all databases together
 constexpr size_t kBlockBytes = 32 * 1024;
 constexpr size_t kFileBytes = 4 * 1024 * 1024;
 constexpr size_t kLogLineBytes = 100;
@@ -24,6 +25,13 @@ constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one compac
 // A batch takes up to three times its size in a memtable.
 constexpr size_t kBatchesBesideCompaction = kWriteBufferBytes / 4;
 constexpr std::chrono::seconds kMaxWait{1};  // with locks held that searches need
+
+// One for the process, so that its size does not grow with the number of classes; never destroyed.
+// A search reads some hundred blocks, most of which the search for the next letter reads again.
+leveldb::Cache* blockCache() {
+  static leveldb::Cache* const cache = leveldb::NewLRUCache(kBlockCacheBytes);
+  return cache;
+}
 
 leveldb::Status open(const leveldb::Options& options, const std::string& path,
                      std::unique_ptr<leveldb::DB>* db) {
@@ -126,14 +134,13 @@ Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* env)
   result.path = path;
   result.comparator = std::make_unique<BytewiseComparator>();
   result.logger = std::make_unique<LeveldbLogger>();
-  result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
   result.env = std::make_unique<OrderedSyncEnv>(path, env);
   const platform::CrashNote note(result.env->crashNotes());
   leveldb::Options options;
   options.env = result.env.get();
   options.comparator = result.comparator.get();
   options.write_buffer_size = kWriteBufferBytes;
-  options.block_cache = result.cache.get();
+  options.block_cache = blockCache();
   options.block_size = kBlockBytes;
   options.max_file_size = kFileBytes;
   options.reuse_logs = true;

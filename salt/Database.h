@@ -1,6 +1,5 @@
 #pragma once
 
-#include <leveldb/cache.h>
 #include <leveldb/db.h>
 #include <leveldb/env.h>
 #include <leveldb/write_batch.h>
@@ -27,14 +26,13 @@ class LeveldbLogger final : public leveldb::Logger {
   void Logv(const char* format, va_list arguments) override;
 };
 
-// An open database with everything it depends on; destroyed in the order database, cache, logger,
+// An open database with everything it depends on; destroyed in the order database, logger,
 // comparator, environment.
 struct Database {
   std::string path;
   std::unique_ptr<OrderedSyncEnv> env;
   std::unique_ptr<BytewiseComparator> comparator;
   std::unique_ptr<leveldb::Logger> logger;
-  std::unique_ptr<leveldb::Cache> cache;
   std::unique_ptr<leveldb::DB> db;  // null when opening failed
   leveldb::Status status;           // of opening
 };

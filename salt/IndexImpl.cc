@@ -281,16 +281,16 @@ void index::restore(const MetricsBlock& before) {
   static_cast<MetricsBlock&>(metrics) = block;
 }
 
-IndexView::IndexView(const index& owner, bool fillCache, size_t walks)
+IndexView::IndexView(const index& owner, bool fillCache, size_t iteratorCount)
     : idx(owner),
       options(readOptions(fillCache)),
       _compactionsEnded(fillCache ? 0 : owner._compactionsEnded.load()),
       _note(owner.crashNotes()) {
   if (fillCache) {
-    take(walks);
+    take(iteratorCount);
   } else {
     platform::MutexLock lock(owner._commitMutex);
-    take(walks);
+    take(iteratorCount);
   }
 }
 
@@ -305,9 +305,9 @@ IndexView::~IndexView() {
   });
 }
 
-void IndexView::take(size_t walks) {
+void IndexView::take(size_t iteratorCount) {
   platform::MutexLock lock(idx._metricsMutex);
-  iterators.resize(idx._suffixesMove ? 1 : walks);
+  iterators.resize(idx._suffixesMove ? 1 : iteratorCount);
   for (auto& iterator : iterators) iterator.reset(idx.db->NewIterator(options));
   metrics = idx.metrics;
   deleted = idx._deleted;

@@ -297,7 +297,7 @@ class IndexView {
   // while suffixes move, because a second could be created after the batch and see another state.
   // With `fillCache` false the reads bypass the block cache, and the constructor waits for a moment
   // between batches.
-  IndexView(const index& owner, bool fillCache, size_t walks = 1);
+  IndexView(const index& owner, bool fillCache, size_t iteratorCount = 1);
   // Schedules the removal of files that only this view kept alive.
   ~IndexView();
   IndexView(const IndexView&) = delete;
@@ -315,7 +315,7 @@ class IndexView {
   uint64_t pageGeneration = 0;                                                   // 0 when unknown
 
  private:
-  void take(size_t walks);
+  void take(size_t iteratorCount);
 
   uint64_t _compactionsEnded;  // when the view was taken; unused by scans
   const platform::CrashNote _note;

@@ -14,7 +14,7 @@ namespace salt {
 namespace {
 
 // The threads of a probe, as for ScanPlaces.
-constexpr size_t kWalks = 2;
+constexpr size_t kProbeThreads = 2;
 constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // A suffix that begins with the prefix of this index.
@@ -28,10 +28,11 @@ struct Find {
 // neighbours of a word do.
 class PrefixProbe {
  public:
-  // The prefixes are truncated, sorted and distinct. `walk` is the index of the view's iterator.
+  // The prefixes are truncated, sorted and distinct. `iterator` is an index into the
+  // iterators of the view.
   PrefixProbe(const IndexView& view, const std::vector<std::string_view>& prefixes, size_t limit,
-              size_t walk)
-      : _view(view), _prefixes(prefixes), _limit(limit), _cursor(view, 0, nullptr, walk) {}
+              size_t iterator)
+      : _view(view), _prefixes(prefixes), _limit(limit), _cursor(view, 0, nullptr, iterator) {}
 
   // Appends the first `limit` suffixes of each prefix. False, with a log line, when a read failed.
   bool visit(unsigned shard, std::vector<Find>* found) {
@@ -118,7 +119,7 @@ std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::
   const auto start = Clock::now();
   const Activity::Work running(_schedule.scans());
   if (!_starts.complete()) learnStarts();
-  const IndexView view(*this, true, kWalks);
+  const IndexView view(*this, true, kProbeThreads);
   const auto cut = [this](const std::string& prefix) {
     return std::string_view(prefix).substr(0, suffixLength(prefix, op));
   };
@@ -132,8 +133,8 @@ std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::
 
   std::vector<std::vector<Find>> byShard(view.lastShard() + size_t{1});
   std::atomic<size_t> next{0};
-  std::array<ScanCounts, kWalks> counts;
-  const auto walk = [&](size_t number) {
+  std::array<ScanCounts, kProbeThreads> counts;
+  const auto probePart = [&](size_t number) {
     PrefixProbe probe(view, sorted, limit, number);
     bool good = true;
     for (size_t shard = next++; good && shard < byShard.size(); shard = next++) {
@@ -142,9 +143,9 @@ std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::
     counts[number] = probe.counts;
   };
   if (byShard.size() <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
-    walk(0);
+    probePart(0);
   } else {
-    _scanRunner.run(walk);
+    _scanRunner.run(probePart);
   }
 
   const auto found = firstOfEach(byShard, sorted.size(), limit);

@@ -15,8 +15,8 @@ namespace {
 // Scans the hot part and the shards for one prefix, which is truncated already.
 class PrefixScan {
  public:
-  PrefixScan(const IndexView& view, std::string_view prefix, size_t walk = 0)
-      : _view(view), _prefix(prefix), _cursor(view, 0, nullptr, walk) {}
+  PrefixScan(const IndexView& view, std::string_view prefix, size_t iterator = 0)
+      : _view(view), _prefix(prefix), _cursor(view, 0, nullptr, iterator) {}
 
   // Calls `callback` for each suffix until it returns false or a read fails.
   void suffixes(const std::function<bool(const SuffixMeta&)>& callback) {
@@ -125,7 +125,7 @@ class PrefixScan {
 
 // Threads of one scan through the pages. A device has more processors, but during a search it also
 // indexes, and displays what was found.
-constexpr size_t kPageWalks = 2;
+constexpr size_t kScanThreads = 2;
 constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // The result of a scan for places.
@@ -155,7 +155,7 @@ class PlacesScan {
   [[nodiscard]] unsigned shards() const { return _last + 1; }
 
   // Each part runs on a thread of its own.
-  void walk(size_t number) {
+  void scanPart(size_t number) {
     const platform::CrashNote note(_view.idx.crashNotes());
     FoundPlaces& found = _found[number];
     PrefixScan scan(_view, _prefix, number);
@@ -170,7 +170,7 @@ class PlacesScan {
   }
 
   [[nodiscard]] FoundPlaces take() {
-    for (size_t number = 1; number < kPageWalks; ++number) {
+    for (size_t number = 1; number < kScanThreads; ++number) {
       _found.front().add(std::move(_found[number]));
     }
     return std::move(_found.front());
@@ -187,7 +187,7 @@ class PlacesScan {
   const std::string_view _prefix;
   const unsigned _last;
   std::atomic<unsigned> _next{0};
-  std::array<FoundPlaces, kPageWalks> _found;
+  std::array<FoundPlaces, kScanThreads> _found;
 };
 
 }  // namespace
@@ -207,16 +207,16 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
                                           const PlacesCallback& callback) const {
   const auto start = Clock::now();
   const Activity::Work running(_schedule.scans());
-  const IndexView view(*this, true, kPageWalks);
+  const IndexView view(*this, true, kScanThreads);
   prefix = prefix.substr(0, suffixLength(prefix, op));
   const auto known = _scanCache.find(prefix, view.pageGeneration);
   const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
   if (most > limit) return std::nullopt;
   PlacesScan scan(view, prefix, !known);
   if (scan.shards() <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
-    scan.walk(0);
+    scan.scanPart(0);
   } else {
-    _scanRunner.run([&scan](size_t walk) { scan.walk(walk); });
+    _scanRunner.run([&scan](size_t part) { scan.scanPart(part); });
   }
   const FoundPlaces found = scan.take();
   found.hot.deliver(callback);

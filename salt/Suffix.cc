@@ -112,10 +112,10 @@ void relate(Suffix* suffix, size_t lcp, SuffixMeta* meta) {
 }
 
 ShardCursor::ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTextCache* zoneTexts,
-                         size_t walk)
+                         size_t iteratorIndex)
     : idx(view.idx),
       shard(shardNumber),
-      iterator(view.iterators[walk].get()),
+      iterator(view.iterators[iteratorIndex].get()),
       suffix(idx, zoneTexts) {}
 
 void ShardCursor::moveTo(uint8_t shardNumber) {

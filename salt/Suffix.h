@@ -67,7 +67,7 @@ void relate(Suffix* suffix, size_t lcp, SuffixMeta* meta);
 class ShardCursor {
  public:
   ShardCursor(const IndexView& view, uint8_t shardNumber, ZoneTextCache* zoneTexts = nullptr,
-              size_t walk = 0);
+              size_t iteratorIndex = 0);
 
   // Switches to another shard: the cursor becomes invalid and its counts 0.
   void moveTo(uint8_t shardNumber);

@@ -13,13 +13,13 @@ SuffixStarts::~SuffixStarts() {
   if (_thread.joinable()) _thread.join();
 }
 
-void SuffixStarts::beginWith(Walk walk) {
+void SuffixStarts::beginWith(ForEachText forEachText) {
   platform::MutexLock lock(_mutex);
   if (_complete || _thread.joinable()) return;
-  const auto body = [this, walk = std::move(walk)] {
+  const auto body = [this, forEachText = std::move(forEachText)] {
     platform::setThreadName("tallow-starts");
     platform::lowerThreadPriority();
-    const bool all = walk([this](std::string_view text) {
+    const bool all = forEachText([this](std::string_view text) {
       for (; text.size() >= kBytes && !_ending; text.remove_prefix(1)) add(text);
       return !_ending;
     });

@@ -29,7 +29,7 @@ class SuffixStarts {
  public:
   // Calls its argument for each stored text until that returns false; returns true when all were
   // read.
-  using Walk = std::function<bool(const std::function<bool(std::string_view text)>&)>;
+  using ForEachText = std::function<bool(const std::function<bool(std::string_view text)>&)>;
 
   SuffixStarts() : _bits(static_cast<uint64_t*>(std::calloc(kBits / 64, sizeof(uint64_t)))) {
     if (_bits == nullptr) throw std::bad_alloc();
@@ -43,7 +43,7 @@ class SuffixStarts {
   void beginEmpty() { _complete = true; }
   // Starts the scan unless it has started; a later call tries again if the system could not create
   // a thread.
-  void beginWith(Walk walk) TL_EXCLUDES(_mutex);
+  void beginWith(ForEachText forEachText) TL_EXCLUDES(_mutex);
   [[nodiscard]] bool complete() const { return _complete; }
 
   // A suffix begins with `text`; it may end sooner.

@@ -159,8 +159,9 @@ uint64_t index::suffixesPerShard() const {
 
 // A merge leaves a tombstone for each suffix that was hot, and a seek iterates over them up to the
 // next live suffix. leveldb drops tombstones as they move down, but not those above the few hot
-// suffixes that once reached a deep level, and they stay there. With nothing hot left, compacting
-// the part drops all tombstones and what they delete; during ingest something would always be left.
+// suffixes that have once reached a deep level; these suffixes stay there, and so do the
+// tombstones. When nothing is hot, compacting the hot part removes all of them; during ingest
+// something would always be left.
 //
 // New pages must not stay in levels that ingest passes through either. leveldb splits its files by
 // size alone: a file with the last hot suffixes and the first texts spans all shards, and is then

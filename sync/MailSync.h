@@ -26,7 +26,7 @@ struct SyncSettings {
   std::string protectionClass;
   std::string name;                // of the client, and of its state in the daemon
   std::string catalogueDirectory;  // see defaultCatalogueDirectory
-  rpc::Patience patience{0};    // for a daemon that is not there
+  rpc::Patience patience{0};       // for a daemon that is not there
   std::chrono::milliseconds lockPatience{std::chrono::seconds(30)};  // for another sync
 
   std::vector<std::string> excluded;  // directories

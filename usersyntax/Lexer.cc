@@ -15,7 +15,7 @@ using Type = Token::Type;
 constexpr size_t kMaxNameBytes = 24;
 constexpr size_t kShownBytes = 40;
 
-bool isBlank(char c) {
+bool isWhiteSpace(char c) {
   return c == ' ' || (c >= '\t' && c <= '\r');
 }
 
@@ -39,7 +39,7 @@ class Lexer {
 
   std::vector<Token> run() {
     while (true) {
-      while (_at < _text.size() && isBlank(_text[_at])) ++_at;
+      while (_at < _text.size() && isWhiteSpace(_text[_at])) ++_at;
       if (_at == _text.size()) return std::move(_tokens);
       next();
     }
@@ -50,7 +50,7 @@ class Lexer {
     _begin = _at;
     Token token;
     if (_text[_at] == '-' && _at + 1 < _text.size() && _text[_at + 1] != '-' &&
-        !isBlank(_text[_at + 1])) {
+        !isWhiteSpace(_text[_at + 1])) {
       token.negated = true;
       ++_at;
     }
@@ -66,7 +66,7 @@ class Lexer {
     if (length == std::string_view::npos || !isName(_text.substr(_at, length))) return;
     const std::string_view name = _text.substr(_at, length);
     const size_t colon = _at + length;
-    const bool hasValue = colon + 1 < _text.size() && !isBlank(_text[colon + 1]) &&
+    const bool hasValue = colon + 1 < _text.size() && !isWhiteSpace(_text[colon + 1]) &&
                           _text[colon + 1] != ')' && _text[colon + 1] != '/';
     const bool path = colon + 1 < _text.size() && _text[colon + 1] == '/';
     const auto field = fieldNamed(name);
@@ -103,7 +103,7 @@ class Lexer {
       _remarks.emplace_back("the quote is not closed, so what follows it is taken as words");
       token.source = _text.substr(_at, 1);
       ++_at;
-      if (_at < _text.size() && !isBlank(_text[_at])) {
+      if (_at < _text.size() && !isWhiteSpace(_text[_at])) {
         readWord(token);
       } else if (token.field != Field::any || token.negated) {
         asTyped(token);
@@ -119,7 +119,7 @@ class Lexer {
   void readWord(Token& token) {
     const size_t begin = _at;
     size_t inner = 0;
-    for (; _at < _text.size() && !isBlank(_text[_at]); ++_at) {
+    for (; _at < _text.size() && !isWhiteSpace(_text[_at]); ++_at) {
       if (_text[_at] == '(') ++inner;
       if (_text[_at] != ')') continue;
       if (inner == 0 && _depth > 0) break;

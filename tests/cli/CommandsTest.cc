@@ -54,8 +54,7 @@ class CommandsTest : public testing::Test {
   void answerWith(std::vector<std::shared_ptr<TLIndexableItem>> items) {
     rpc::BytesArray bytes;
     for (const auto& item : items) bytes.push_back(item->data());
-    daemon.answer("SearchItemsForQuery",
-                  [bytes](rpc::Reply& reply) { reply.send({bytes}); });
+    daemon.answer("SearchItemsForQuery", [bytes](rpc::Reply& reply) { reply.send({bytes}); });
   }
 
   // The query of the last search that reached the daemon.
@@ -270,8 +269,7 @@ TEST_F(CommandsTest, ResultsInEveryFormat) {
   EXPECT_EQ(answer["changed"], nlohmann::json::array());
 
   daemon.answer("FetchReplacedWords", [](rpc::Reply& reply) {
-    reply.send(
-        {rpc::TextRows{{"invocie", "inv\x1b", "spelling"}, {"dues", "due", "stem"}}});
+    reply.send({rpc::TextRows{{"invocie", "inv\x1b", "spelling"}, {"dues", "due", "stem"}}});
   });
   EXPECT_EQ(run({"search", "--format", "json", "invocie dues"}), ExitStatus::done);
   EXPECT_EQ(errors, "tallow: showing results for inv\uFFFD, due...\n");
@@ -419,7 +417,7 @@ TEST_F(CommandsTest, Diagnostics) {
   EXPECT_EQ(nlohmann::json::parse(output), nlohmann::json::parse(R"({"Count":3,"Seconds":0.5})"));
   daemon.answer("FetchStatsForIndexer", [](rpc::Reply& reply) {
     reply.send({rpc::Dictionary{{"TLDebugServiceDocStoreNumOfItems", int64_t{30}},
-                                        {"TLDebugServiceTextStoreNumOfItems", uint64_t{28}}}});
+                                {"TLDebugServiceTextStoreNumOfItems", uint64_t{28}}}});
   });
   EXPECT_EQ(run({"stats"}), ExitStatus::done);
   EXPECT_THAT(output, HasSubstr("2 stored and not searchable"));

@@ -23,10 +23,10 @@ TEST(DocStoreThreads, ReadersRunConcurrentlyWithAWriter) {
         EXPECT_EQ(store.documentsWithURLs({url(1)}, nullptr, nullptr).size(), 1U);
       }
       EXPECT_EQ(store.metadataValueForKey("version", nullptr), "v0.4");
-      int64_t walked = 0;
-      store.enumerateDocIDs(nullptr,
-                            [&](int64_t, uint32_t, const TLURL&, bool*, TLErrorOut) { ++walked; });
-      EXPECT_LE(walked, store.count(nullptr));
+      int64_t enumerated = 0;
+      store.enumerateDocIDs(
+          nullptr, [&](int64_t, uint32_t, const TLURL&, bool*, TLErrorOut) { ++enumerated; });
+      EXPECT_LE(enumerated, store.count(nullptr));
       store.storeTopKVocab("vocab", nullptr);
       EXPECT_EQ(store.loadTopKVocab(nullptr), "vocab");
     } while (!done);

@@ -58,7 +58,7 @@ TEST(Stemmer, FollowsTheRulesOfEachStep) {
        "adjustable adjust, able abl, defensible defens, irritant irrit, giant giant, replacement "
        "replac, element element, adjustment adjust, payment payment, dependent depend, agent "
        "agent, cement cement"},
-      {"4, ion behind s or t only",
+      {"4, ion after s or t only",
        "adoption adopt, decision decis, champion champion, companion companion, nation nation, "
        "region region"},
       {"4, ou ism ate iti ous ive ize",

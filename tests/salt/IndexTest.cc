@@ -223,12 +223,12 @@ TEST(ForEachZone, VisitsTextsInKeyOrderUntilToldToStop) {
 
 TEST(Compact, FilesKeptByALongReadAreRemovedWhenItEnds) {
   const TemporaryDirectory directory;
-  const auto tablesLeft = [&directory](const char* name, bool walking) {
+  const auto tablesLeft = [&directory](const char* name, bool reading) {
     auto index = newIndex(directory / name);
     EXPECT_TRUE(addZone(*index, 1, 1, "one text"));
     index->Compact();
     EXPECT_TRUE(addZone(*index, 2, 1, "another text"));
-    if (walking) {
+    if (reading) {
       index->ForEachZone([&index](auto...) {
         index->Compact();
         return false;
@@ -241,7 +241,7 @@ TEST(Compact, FilesKeptByALongReadAreRemovedWhenItEnds) {
     return std::count_if(begin(files), end(files),
                          [](const auto& file) { return file.path().extension() == ".ldb"; });
   };
-  EXPECT_EQ(tablesLeft("walked", true), tablesLeft("not walked", false));
+  EXPECT_EQ(tablesLeft("read", true), tablesLeft("not read", false));
 }
 
 TEST(Open, NewIndexWipesAndOptionsComeFromTheDatabase) {

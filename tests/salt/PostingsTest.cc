@@ -39,7 +39,7 @@ Answer placesOf(const Index& index, const std::string& prefix) {
 }
 
 // The result from the pages.
-Answer walk(const Index& index, const std::string& prefix) {
+Answer scanPages(const Index& index, const std::string& prefix) {
   Answer answer;
   index.ScanPrefix(prefix, [&](const salt::SuffixMeta& meta) {
     answer.places.emplace(meta.DocID, meta.ZoneID);
@@ -92,7 +92,7 @@ class PostingsTest : public testing::Test {
   }
   void expectSame() const {
     for (const std::string& prefix : prefixes) {
-      ASSERT_EQ(placesOf(*index, prefix), walk(*index, prefix)) << prefix;
+      ASSERT_EQ(placesOf(*index, prefix), scanPages(*index, prefix)) << prefix;
     }
   }
   // How many pages scans for the most frequent prefixes read.

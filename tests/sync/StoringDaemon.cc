@@ -46,8 +46,7 @@ StoringDaemon::StoringDaemon() {
   add("SearchItemsForQuery", "aytsx", "aay", [this](rpc::Arguments& arguments, Reply reply) {
     search(std::string(arguments.readBytes()), *reply);
   });
-  _listener =
-      rpc::makeListener(_loop, _directory.path(), "com.quill.tallowsearch.SearchService");
+  _listener = rpc::makeListener(_loop, _directory.path(), "com.quill.tallowsearch.SearchService");
   _listener->setDelegate([this](auto&, rpc::Connection& connection) {
     connection.addExportedInterface(_interface);
     return true;

@@ -9,9 +9,9 @@
 #include <vector>
 
 #include "platform/Mutex.h"
-#include "rpc/Server.h"
 #include "platform/RunLoop.h"
 #include "records/TLIndexableItem.h"
+#include "rpc/Server.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace testsupport {

@@ -30,11 +30,11 @@ std::string brokenRule(const TextForm& form) {
   if (!platform::isValidUTF8(form.text)) return "invalid UTF-8";
   size_t start = 0;
   for (const uint32_t offset : form.offsets) {
-    if (offset != start) return "an offset that is not behind a blank";
-    const size_t blank = form.text.find(' ', start);
-    if (blank == std::string::npos) return "a word without blank";
-    if (blank == start) return "an empty word";
-    start = blank + 1;
+    if (offset != start) return "an offset that is not after a space";
+    const size_t space = form.text.find(' ', start);
+    if (space == std::string::npos) return "a word without a space";
+    if (space == start) return "an empty word";
+    start = space + 1;
   }
   return start == form.text.size() ? "" : "text without offset";
 }

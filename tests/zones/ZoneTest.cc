@@ -4,10 +4,10 @@
 #include <cstdlib>
 #include <thread>
 
-#include "zones/TALZoneManager.h"
-#include "zones/zone.h"
 #include "records/TLParamsManager.h"
 #include "tests/support/TemporaryDirectory.h"
+#include "zones/TALZoneManager.h"
+#include "zones/zone.h"
 
 using zone::Zone;
 using Offsets = std::vector<uint32_t>;

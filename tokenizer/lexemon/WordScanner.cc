@@ -45,7 +45,7 @@ bool isWordKind(Kind kind) {
   return kind == kLetter || kind == kDigit;
 }
 
-bool isASCIIBlank(char16_t c) {
+bool isASCIIWhiteSpace(char16_t c) {
   return c == u' ' || (c >= u'\t' && c <= u'\r');
 }
 
@@ -192,7 +192,7 @@ bool WordScanner::enterNextStretch() {
   const size_t firstNonASCII =
       _mode == Mode::unicodeOnly ? start : start + platform::asciiPrefixLength(_text.substr(start));
   size_t mixedStart = firstNonASCII;
-  while (mixedStart > start && !isASCIIBlank(_text[mixedStart - 1])) --mixedStart;
+  while (mixedStart > start && !isASCIIWhiteSpace(_text[mixedStart - 1])) --mixedStart;
   _position = start;
   if (firstNonASCII == _text.size() && _mode == Mode::asciiByTable) {
     _stretchEnd = _text.size();
@@ -212,9 +212,9 @@ size_t WordScanner::mixedStretchEnd(size_t firstNonASCII) const {
   const size_t bound = firstNonASCII + kLongStretch;
   size_t nonASCII = firstNonASCII;
   for (;;) {
-    const auto blank =
-        std::find_if(_text.begin() + static_cast<ptrdiff_t>(nonASCII), _text.end(), isASCIIBlank);
-    const size_t end = static_cast<size_t>(blank - _text.begin());
+    const auto space = std::find_if(_text.begin() + static_cast<ptrdiff_t>(nonASCII), _text.end(),
+                                    isASCIIWhiteSpace);
+    const size_t end = static_cast<size_t>(space - _text.begin());
     const size_t ascii = platform::asciiPrefixLength(_text.substr(end, kShortASCII));
     if (end >= bound || ascii == kShortASCII || end + ascii == _text.size()) return end;
     nonASCII = end + ascii;
