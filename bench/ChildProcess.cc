@@ -29,10 +29,6 @@ std::vector<char*> pointersTo(std::vector<std::string>& texts) {
   return pointers;
 }
 
-std::string errorsOf(const Command& command) {
-  return command.output + ".errors";
-}
-
 // The file descriptors of a program at its start.
 class FileActions {
  public:
@@ -113,6 +109,10 @@ std::vector<std::string> environmentWith(const Variables& values) {
 
 std::string programBeside(const std::string& name) {
   return std::filesystem::read_symlink("/proc/self/exe").replace_filename(name);
+}
+
+std::string errorsOf(const Command& command) {
+  return command.output + ".errors";
 }
 
 Run runProgram(const Command& command, bool watchMemory) {

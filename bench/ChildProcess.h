@@ -25,6 +25,9 @@ struct Command {
   std::vector<int> goodStatuses = {0};
 };
 
+// Where the standard error of a command goes.
+[[nodiscard]] std::string errorsOf(const Command& command);
+
 struct Run {
   double seconds;         // wall time from start to end
   double cpuSeconds;      // of all its threads

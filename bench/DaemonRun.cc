@@ -151,11 +151,7 @@ void DaemonRun::awaitReady(int notifySocket) const {
 }
 
 double DaemonRun::cpuSeconds() const {
-  clockid_t clock;
-  if (const int code = clock_getcpuclockid(_pid, &clock); code != 0) {
-    throw std::system_error(code, std::generic_category(), "clock_getcpuclockid");
-  }
-  return secondsOf(clock);
+  return cpuSecondsOf(_pid);
 }
 
 std::optional<pid_t> DaemonRun::threadNamed(const std::string& name) const {
@@ -200,6 +196,14 @@ uint64_t bytesOnDisk(const std::string& path) {
 
 double secondsNow() {
   return secondsOf(CLOCK_MONOTONIC);
+}
+
+double cpuSecondsOf(pid_t process) {
+  clockid_t clock;
+  if (const int code = clock_getcpuclockid(process, &clock); code != 0) {
+    throw std::system_error(code, std::generic_category(), "clock_getcpuclockid");
+  }
+  return secondsOf(clock);
 }
 
 double cpuSecondsNow() {

@@ -75,7 +75,8 @@ class DaemonRun {
 // Monotonic seconds.
 [[nodiscard]] double secondsNow();
 
-// Processor time of all threads of this process.
+// Processor time of all threads of a process, and of this one.
+[[nodiscard]] double cpuSecondsOf(pid_t process);
 [[nodiscard]] double cpuSecondsNow();
 
 // Calls `run`; turns an exception into a message and exit status 1.

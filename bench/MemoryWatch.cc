@@ -16,21 +16,32 @@ namespace {
 
 constexpr std::chrono::milliseconds kSampleInterval(20);
 
-// The value of one line of /proc/PID/status, converted from kilobytes to bytes.
+std::string statusOf(pid_t process) {
+  std::ifstream file("/proc/" + std::to_string(process) + "/status");
+  return std::string(std::istreambuf_iterator<char>(file), {});
+}
+
+uint64_t numberIn(const std::string& status, std::string_view field) {
+  const size_t at = status.find('\n' + std::string(field));
+  return at == std::string::npos ? 0
+                                 : strtoull(status.c_str() + at + 1 + field.size(), nullptr, 10);
+}
+
 uint64_t statusBytes(const std::string& status, std::string_view field) {
-  const size_t at = status.find(field);
-  if (at == std::string::npos) return 0;
-  return strtoull(status.c_str() + at + field.size(), nullptr, 10) * 1024;
+  return numberIn(status, field) * 1024;  // the kernel writes kilobytes
 }
 
 }  // namespace
+
+uint64_t statusNumber(pid_t process, std::string_view field) {
+  return numberIn(statusOf(process), field);
+}
 
 MemoryWatch::MemoryWatch(pid_t process) : _process(process), _sampler([this] { sample(); }) {}
 
 void MemoryWatch::look() {
   if (_ending) return;
-  std::ifstream file("/proc/" + std::to_string(_process) + "/status");
-  const std::string status{std::istreambuf_iterator<char>(file), {}};
+  const std::string status = statusOf(_process);
   const uint64_t anonymous = statusBytes(status, "RssAnon:");
   if (anonymous == 0) return;  // the process has ended
   _memory.anonymous = anonymous;

@@ -4,6 +4,7 @@
 
 #include <condition_variable>
 #include <cstdint>
+#include <string_view>
 #include <thread>
 
 #include "platform/Mutex.h"
@@ -17,6 +18,9 @@ struct Memory {
   uint64_t anonymousPeak = 0;  // highest RssAnon, sampled every 20 ms
   uint64_t residentPeak = 0;   // VmHWM, which includes mapped files
 };
+
+// The number in the line of /proc/PID/status that begins with `field`; 0 where there is none.
+[[nodiscard]] uint64_t statusNumber(pid_t process, std::string_view field);
 
 // Samples the memory of one process every 20 ms. (The kernel's figures for a child that has ended
 // are unsuitable: they include the memory of the parent before the fork.)

@@ -6,14 +6,12 @@
 #include <iterator>
 #include <string_view>
 
+#include "records/TLErrorCodes.h"
 #include "rpc/Channel.h"
 
 namespace cli {
 
 namespace {
-
-constexpr const char* kStoreDomain = "DocStore";
-constexpr int kNotStored = 12;
 
 struct Row {
   const char* domain;
@@ -21,15 +19,20 @@ struct Row {
   const char* text;
 };
 
+constexpr Row row(TALIndexerError code, const char* text) {
+  return {kTALIndexerErrorDomain, static_cast<int>(code), text};
+}
+
 constexpr Row kRows[] = {
-    {"TALIndexer", 1, "the daemon could not put the message into the index"},
-    {"TALIndexer", 3, "there is nothing in the search that can be looked up"},
-    {"TALIndexer", 4, "the daemon is about to end; try again in a moment"},
-    {"TALIndexer", 5, "the index of this class is damaged; `tallow validate` tells more"},
-    {"com.quill.tallow.TALIndexerManager", -2,
+    row(TALIndexerError::document, "the daemon could not put the message into the index"),
+    row(TALIndexerError::query, "there is nothing in the search that can be looked up"),
+    row(TALIndexerError::shuttingDown, "the daemon is about to end; try again in a moment"),
+    row(TALIndexerError::validationFailed,
+        "the index of this class is damaged; `tallow validate` tells more"),
+    {kTALIndexerManagerErrorDomain, static_cast<int>(TALIndexerManagerError::unavailable),
      "the index of this class cannot be opened now; `tallow status` tells whether the device is "
      "locked"},
-    {kStoreDomain, kNotStored, "not in the index"},
+    {kDocStoreErrorDomain, static_cast<int>(TALDocStoreError::notFound), "not in the index"},
 };
 
 // The name of a D-Bus error stands in parentheses at the end.
@@ -41,16 +44,22 @@ std::string withoutName(const std::string& message) {
 }  // namespace
 
 bool isNotIndexed(const TLError& error) {
-  return error.domain == kStoreDomain && error.code == kNotStored;
+  return error.domain == kDocStoreErrorDomain &&
+         error.code == static_cast<int>(TALDocStoreError::notFound);
+}
+
+bool isRefusedMessage(const TLError& error) {
+  return error.domain == kTALIndexerErrorDomain &&
+         error.code == static_cast<int>(TALIndexerError::document);
 }
 
 std::string plainText(const TLError& error) {
-  const auto row = std::find_if(std::begin(kRows), std::end(kRows), [&error](const Row& one) {
+  const auto known = std::find_if(std::begin(kRows), std::end(kRows), [&error](const Row& one) {
     return error.domain == one.domain && error.code == one.code;
   });
-  if (row != std::end(kRows)) return row->text;
+  if (known != std::end(kRows)) return known->text;
   if (error.domain == rpc::kProtocolDomain) return withoutName(error.message);
-  if (error.domain == kStoreDomain) {
+  if (error.domain == kDocStoreErrorDomain) {
     return fmt::format("the daemon's store failed{}{}", error.message.empty() ? "" : ": ",
                        error.message);
   }

@@ -12,4 +12,7 @@ namespace cli {
 // Whether the daemon says that the index has no such message.
 [[nodiscard]] bool isNotIndexed(const TLError& error);
 
+// Whether it refused one message, which then ended its batch.
+[[nodiscard]] bool isRefusedMessage(const TLError& error);
+
 }  // namespace cli

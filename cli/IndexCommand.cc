@@ -23,10 +23,6 @@ namespace cli {
 
 namespace {
 
-// How the daemon says that one item of a batch stopped it.
-constexpr const char* kIndexerDomain = "TALIndexer";
-constexpr int kItemFailed = 1;
-
 uint64_t totalBytes(const std::vector<std::string>& paths) {
   uint64_t total = 0;
   const WalkVisitor visitor{[&](const std::string&, bool, uint64_t size) {
@@ -109,7 +105,7 @@ class Indexing {
       _indexed += items.size();
       return true;
     }
-    if (failure->domain != kIndexerDomain || failure->code != kItemFailed) {
+    if (!isRefusedMessage(*failure)) {
       platform::setError(error, *failure);
       return false;
     }

@@ -14,8 +14,10 @@
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
+#include "cli/ErrorText.h"
 #include "cli/Results.h"
 #include "cli/StateDirectory.h"
+#include "cli/SyncCommand.h"
 #include "platform/FileDescriptor.h"
 
 // Dump, validate and purge. The text index is the daemon's, so a program of its own reads it,
@@ -189,6 +191,11 @@ ExitStatus runPurge(const Options& options) {
                     "systemctl --user stop 'tallowsearchd*', and start it afterwards"));
   }
   if (status != ExitStatus::done || !outcome.is_object()) return status;
+  std::optional<TLError> failure;
+  if (!options.dryRun && !mailsync::forgetDeleted(syncSettings(options), &failure)) {
+    complain("the names of deleted messages stay in the catalogue of tallow sync: " +
+             plainText(*failure));
+  }
   return print(options.format == OutputFormat::json ? outcome.dump(2) + '\n' : purgeText(outcome),
                status);
 }

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <filesystem>
@@ -34,6 +35,15 @@ std::optional<uint64_t> bytesIn(const std::filesystem::path& directory) {
   return failure ? std::nullopt : std::optional(bytes);
 }
 
+// The data root of the daemon that is asked; none where that is not known.
+std::optional<std::string> knownDataRoot(const Options& options) {
+  const bool told = !options.stateDirectory.empty() || !variable("STATE_DIRECTORY").empty();
+  if (!told && options.runtimeDirectory != rpc::defaultRuntimeDirectory()) return std::nullopt;
+  const std::string state = stateDirectory(options);
+  if (!platform::fileExists(platform::processLockPath(state))) return std::nullopt;
+  return platform::dataRoot(state);
+}
+
 }  // namespace
 
 std::string stateDirectory(const Options& options) {
@@ -51,13 +61,9 @@ std::string stateDirectory(const Options& options) {
 }
 
 bool isUnknownClass(const Options& options) {
-  const bool told = !options.stateDirectory.empty() || !variable("STATE_DIRECTORY").empty();
-  if (!told && options.runtimeDirectory != rpc::defaultRuntimeDirectory()) return false;
-  if (!platform::namesOneDirectory(options.protectionClass)) return false;
-  const std::string state = stateDirectory(options);
-  if (!platform::fileExists(platform::processLockPath(state))) return false;
-  const std::string directory =
-      platform::joinPath(platform::dataRoot(state), options.protectionClass);
+  const auto root = knownDataRoot(options);
+  if (!root || !platform::namesOneDirectory(options.protectionClass)) return false;
+  const std::string directory = platform::joinPath(*root, options.protectionClass);
   struct stat info;
   return stat(directory.c_str(), &info) != 0 && errno == ENOENT;
 }
@@ -67,6 +73,18 @@ std::string unknownClassText(const Options& options) {
              ? "nothing has been indexed yet; `tallow sync ~/Mail` does that"
              : fmt::format("nothing has been indexed for class \"{}\" yet",
                            options.protectionClass);
+}
+
+std::vector<std::string> classesOnDisk(const Options& options) {
+  const auto root = knownDataRoot(options);
+  if (!root) return {};
+  std::vector<std::string> names =
+      platform::listDirectory(*root, nullptr).value_or(std::vector<std::string>());
+  std::erase_if(names, [&root](const std::string& name) {
+    return !platform::fileExists(platform::textIndexPath(*root, name));
+  });
+  std::sort(names.begin(), names.end());
+  return names;
 }
 
 ExitStatus complainOfUnknownClass(const Options& options) {

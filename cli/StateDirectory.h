@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "cli/Options.h"
 
@@ -20,8 +21,13 @@ namespace cli {
 
 // What to tell the user then.
 [[nodiscard]] std::string unknownClassText(const Options& options);
+
 // Says so; the status that goes with it.
 [[nodiscard]] ExitStatus complainOfUnknownClass(const Options& options);
+
+// The classes that have a directory, in order; none where the state directory is not known to be
+// that of the daemon, or cannot be read.
+[[nodiscard]] std::vector<std::string> classesOnDisk(const Options& options);
 
 // Bytes of the files of one protection class.
 struct DiskUse {

@@ -6,9 +6,11 @@
 #include <cstring>
 #include <ctime>
 #include <nlohmann/json.hpp>
+#include <set>
 
 #include "cli/Commands.h"
 #include "cli/Results.h"
+#include "cli/Settings.h"
 #include "cli/StateDirectory.h"
 #include "cli/SyncCommand.h"
 #include "client/DebugServiceProxy.h"
@@ -25,26 +27,24 @@ constexpr size_t kBarColumns = 20;
 constexpr size_t kShownProblems = 20;  // in text
 constexpr size_t kMostProblems = 10000;
 constexpr size_t kLockStatusBytes = 64;
+constexpr int kSchema = 1;  // of the JSON
 
 // What the daemon tells of one class.
 struct IndexStatus {
   int64_t stored = 0;      // items
   int64_t searchable = 0;  // of these
-  int64_t highestID = 0;   // as many documents have ever been stored
   int64_t textBytes = 0;
   int64_t suffixes = 0;
   int64_t hotSuffixes = 0;  // not sorted in yet
   int64_t merges = 0;       // since the index was opened
   double mergeSeconds = 0;  // of these together
   bool merging = false;
-  int64_t documents = 0;         // in the files, with those that are only marked as deleted
-  int64_t deletedDocuments = 0;  // of these
+  int64_t deleted = 0;  // documents whose text is still in the files
 
-  [[nodiscard]] int64_t deleted() const { return std::max<int64_t>(highestID - stored, 0); }
   // How much of the files belongs to deleted mail, from 0 to 1; mails are taken for equally long.
   [[nodiscard]] double deletedShare() const {
-    return documents <= 0 ? 0.0
-                          : static_cast<double>(deletedDocuments) / static_cast<double>(documents);
+    const int64_t all = searchable + deleted;
+    return all <= 0 ? 0.0 : static_cast<double>(deleted) / static_cast<double>(all);
   }
 };
 
@@ -65,7 +65,6 @@ std::optional<IndexStatus> readIndexStatus(const Options& options, TLErrorOut er
   const std::pair<std::string_view, int64_t*> fields[] = {
       {TLDebugServiceDocStoreNumOfItems, &status.stored},
       {TLDebugServiceTextStoreNumOfItems, &status.searchable},
-      {TLDebugServiceSaltMaxDocID, &status.highestID},
       {TLDebugServiceTextStoreSize, &status.textBytes},
       {TLDebugServiceSaltTotalSuffixes, &status.suffixes},
       {TLDebugServiceSaltHotSuffixes, &status.hotSuffixes},
@@ -83,8 +82,7 @@ std::optional<IndexStatus> readIndexStatus(const Options& options, TLErrorOut er
   const auto metrics = service.fetchStatsForSalt(options.name, options.protectionClass, error);
   if (!metrics) return std::nullopt;
   status.merging = metrics->find("(IN PROGRESS)") != std::string::npos;
-  status.documents = metric(*metrics, "---- Docs: ");
-  status.deletedDocuments = metric(*metrics, "---- Deleted docs: ");
+  status.deleted = metric(*metrics, "---- Deleted docs: ");
   return status;
 }
 
@@ -121,8 +119,7 @@ bool isWatched(const Options& options) {
   return lock == nullptr && failure->code == EWOULDBLOCK;
 }
 
-std::string mailboxText(mailsync::Catalogue& catalogue) {
-  const auto last = mailsync::lastSync(catalogue);
+std::string mailboxText(mailsync::Catalogue& catalogue, const std::optional<int64_t>& last) {
   std::string text = fmt::format("Last sync  {}\n", last ? timeText(*last) : "not ended yet");
   for (const mailsync::FolderCount& count : catalogue.folderCounts()) {
     text += fmt::format("{} {:>8} of {:>8}  {}", barOf(count), count.indexed, count.messages,
@@ -142,7 +139,7 @@ std::string mailboxText(mailsync::Catalogue& catalogue) {
   return text;
 }
 
-nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue) {
+nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue, const std::optional<int64_t>& last) {
   nlohmann::json folders = nlohmann::json::array();
   for (const mailsync::FolderCount& count : catalogue.folderCounts()) {
     folders.push_back({{"path", count.path},
@@ -156,7 +153,6 @@ nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue) {
   for (const mailsync::Problem& problem : catalogue.problems(kMostProblems)) {
     problems.push_back({{"path", problem.path}, {"reason", problem.reason}});
   }
-  const auto last = mailsync::lastSync(catalogue);
   return {{"lastSync", last ? nlohmann::json(timeText(*last)) : nlohmann::json()},
           {"roots", catalogue.roots()},
           {"folders", std::move(folders)},
@@ -164,13 +160,10 @@ nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue) {
 }
 
 std::string indexText(const IndexStatus& index) {
-  const double share = index.highestID == 0 ? 0.0
-                                            : 100.0 * static_cast<double>(index.deleted()) /
-                                                  static_cast<double>(index.highestID);
   std::string text = fmt::format("Index      {} messages, {:.1f} MB of text\n", index.stored,
                                  static_cast<double>(index.textBytes) / 1e6);
-  text += fmt::format("Deleted    {} messages, {:.0f} % of all that were stored\n", index.deleted(),
-                      share);
+  text += fmt::format("Deleted    {} messages, {:.0f} % of what the files hold\n", index.deleted,
+                      100 * index.deletedShare());
   text += fmt::format(
       "Merging    {}; {} of {} suffixes not sorted in yet, {} merges so far in {:.0f} s\n",
       index.merging ? "at work" : "not at present", index.hotSuffixes, index.suffixes, index.merges,
@@ -184,7 +177,7 @@ std::string indexText(const IndexStatus& index) {
 
 nlohmann::json indexJSON(const IndexStatus& index) {
   return {{"messages", index.stored},   {"searchable", index.searchable},
-          {"deleted", index.deleted()}, {"textBytes", index.textBytes},
+          {"deleted", index.deleted},   {"textBytes", index.textBytes},
           {"suffixes", index.suffixes}, {"hotSuffixes", index.hotSuffixes},
           {"merges", index.merges},     {"mergeSeconds", index.mergeSeconds},
           {"merging", index.merging},   {"deletedShare", index.deletedShare()}};
@@ -194,7 +187,7 @@ std::string diskText(const DiskUse& disk, const std::optional<IndexStatus>& inde
   std::string text =
       fmt::format("Files      {:.1f} MB of index, {:.1f} MB of store",
                   static_cast<double>(disk.index) / 1e6, static_cast<double>(disk.store) / 1e6);
-  if (index && index->deletedDocuments > 0) {
+  if (index && index->deleted > 0) {
     const auto bytes = static_cast<double>(disk.index + disk.store);
     text +=
         fmt::format(", some {:.1f} MB of it for deleted mail", bytes * index->deletedShare() / 1e6);
@@ -202,35 +195,111 @@ std::string diskText(const DiskUse& disk, const std::optional<IndexStatus>& inde
   return text + '\n';
 }
 
+// All that there is to tell of one class.
+struct ClassStatus {
+  std::string name;
+  std::unique_ptr<mailsync::Catalogue> catalogue;
+  std::optional<int64_t> lastSync;
+  bool isNew = false;  // nothing was ever indexed, and the daemon is not asked
+  std::optional<IndexStatus> index;
+  std::optional<DiskUse> disk;
+  bool watched = false;
+  std::optional<TLError> error;  // of catalogue or index
+};
+
+Options withClass(Options options, const std::string& name) {
+  options.protectionClass = name;
+  return options;
+}
+
+ClassStatus readClass(const Options& options) {
+  ClassStatus status;
+  status.name = options.protectionClass;
+  status.catalogue = mailsync::openCatalogue(syncSettings(options), &status.error);
+  status.lastSync = mailsync::lastSync(syncSettings(options));
+  status.isNew = isUnknownClass(options);
+  if (!status.isNew) status.index = readIndexStatus(options, &status.error);
+  status.disk = diskUse(options);
+  status.watched = isWatched(options);
+  return status;
+}
+
+std::string classText(const ClassStatus& status) {
+  std::string text = status.catalogue ? mailboxText(*status.catalogue, status.lastSync)
+                                      : "No mailbox is kept in step; see tallow sync.\n";
+  text +=
+      fmt::format("Watch      {}\n", status.watched ? "at work" : "not at work; see tallow watch");
+  if (status.isNew) text += "Index      nothing has been indexed yet\n";
+  if (status.index) text += indexText(*status.index);
+  if (status.disk) text += diskText(*status.disk, status.index);
+  return text;
+}
+
+nlohmann::json classJSON(const ClassStatus& status) {
+  nlohmann::json files;
+  if (status.disk) {
+    files = {{"indexBytes", status.disk->index}, {"storeBytes", status.disk->store}};
+  }
+  return {{"class", status.name},
+          {"mailboxes",
+           status.catalogue ? mailboxJSON(*status.catalogue, status.lastSync) : nlohmann::json()},
+          {"index", status.index ? indexJSON(*status.index) : nlohmann::json()},
+          {"files", std::move(files)},
+          {"watched", status.watched}};
+}
+
+// The class of the command line; else all that have an index or a catalogue, as far as the state
+// directory and the settings tell, and the default one where there is none.
+std::vector<std::string> classesOf(const Options& options) {
+  if (options.classGiven) return {options.protectionClass};
+  const std::vector<std::string> onDisk = classesOnDisk(options);
+  std::set<std::string> names(onDisk.begin(), onDisk.end());
+  const auto settings = readSettings();
+  if (const auto* const read = std::get_if<Settings>(&settings)) {
+    for (const auto& [folder, name] : read->classes) names.insert(name);
+  }
+  names.insert(options.protectionClass);
+  std::erase_if(names, [&](const std::string& name) {
+    const Options one = withClass(options, name);
+    return isUnknownClass(one) && !mailsync::hasCatalogue(syncSettings(one));
+  });
+  if (names.empty()) names.insert(options.protectionClass);
+  return {names.begin(), names.end()};
+}
+
+std::string statusText(const std::vector<ClassStatus>& classes, const std::string& lock) {
+  std::string text;
+  for (const ClassStatus& status : classes) {
+    if (classes.size() > 1) text += fmt::format("Class      {}\n", cleanForTerminal(status.name));
+    text += classText(status);
+    if (classes.size() > 1) text += '\n';
+  }
+  return text + fmt::format("Device     {}\n", lock);
+}
+
+std::string statusJSON(const std::vector<ClassStatus>& classes, const std::string& lock) {
+  nlohmann::json list = nlohmann::json::array();
+  for (const ClassStatus& status : classes) list.push_back(classJSON(status));
+  return jsonText({{"schema", kSchema}, {"lock", lock}, {"classes", std::move(list)}});
+}
+
 }  // namespace
 
 // What the catalogue knows is shown without the daemon as well.
 ExitStatus runStatus(const Options& options) {
-  std::optional<TLError> failure;
-  const auto catalogue = mailsync::openCatalogue(syncSettings(options), &failure);
-  if (failure) return complain(failure);
-  std::optional<TLError> error;
-  const auto index = readIndexStatus(options, &error);
-  const auto disk = diskUse(options);
-  const bool watched = isWatched(options);
-  std::string text;
-  if (options.format == OutputFormat::json) {
-    text = jsonText(
-        {{"mailboxes", catalogue ? mailboxJSON(*catalogue) : nlohmann::json()},
-         {"index", index ? indexJSON(*index) : nlohmann::json()},
-         {"files", disk ? nlohmann::json({{"indexBytes", disk->index}, {"storeBytes", disk->store}})
-                        : nlohmann::json()},
-         {"watched", watched},
-         {"lock", lockStatus(options)}});
-  } else {
-    text = catalogue ? mailboxText(*catalogue) : "No mailbox is kept in step; see tallow sync.\n";
-    text += fmt::format("Watch      {}\n", watched ? "at work" : "not at work; see tallow watch");
-    if (index) text += indexText(*index);
-    if (disk) text += diskText(*disk, index);
-    text += fmt::format("Device     {}\n", lockStatus(options));
+  std::vector<ClassStatus> classes;
+  for (const std::string& name : classesOf(options)) {
+    classes.push_back(readClass(withClass(options, name)));
   }
-  const ExitStatus written = print(text);
-  return index ? written : complain(error);
+  const std::string lock = lockStatus(options);
+  ExitStatus status = print(options.format == OutputFormat::json ? statusJSON(classes, lock)
+                                                                 : statusText(classes, lock));
+  for (const ClassStatus& one : classes) {
+    if (!one.error) continue;
+    status = complain(one.error);
+    if (status == ExitStatus::unreachable) break;
+  }
+  return status;
 }
 
 }  // namespace cli

@@ -88,6 +88,8 @@ class TALDocStore {
                                       TLErrorOut error) = 0;
   // Also true for an ID without a document.
   virtual bool deleteDocument(uint32_t docID, TLErrorOut error) = 0;
+  // The same of several, all or none, in one transaction: each transaction waits for the disk.
+  virtual bool deleteDocuments(const std::vector<uint32_t>& docIDs, TLErrorOut error) = 0;
 
   // Returns free space to the file system. Always returns true.
   virtual bool vacuumWithError(TLErrorOut error) = 0;

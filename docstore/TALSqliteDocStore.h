@@ -55,6 +55,7 @@ class TALSqliteDocStore final : public TALDocStore {
   bool storeOrUpdateDocuments(const TLDocumentBatch& documents, const TLDocumentIDs& atDocIDs,
                               TLDocumentIDs* newIDs, TLErrorOut error) override;
   bool deleteDocument(uint32_t docID, TLErrorOut error) override;
+  bool deleteDocuments(const std::vector<uint32_t>& docIDs, TLErrorOut error) override;
   bool vacuumWithError(TLErrorOut error) override;
   bool resetWithError(TLErrorOut error) override;
   int64_t count(TLErrorOut error) override;
@@ -125,6 +126,7 @@ class TALSqliteDocStore final : public TALDocStore {
   // The given ID, or 0.
   uint32_t _storeOrUpdateDocumentAtDocID(const TLIndexableItem& document, uint32_t atDocID,
                                          TLErrorOut error) TL_REQUIRES(_mutex);
+  bool _deleteDocument(uint32_t docID, TLErrorOut error) TL_REQUIRES(_mutex);
   // The number of rows in the page below the cursor; 0 for a buffer size below 1, -1 on failure.
   int _listDocIDsWithBuffer(std::vector<uint32_t>& docIDs, std::vector<std::string>& docURLs,
                             int bufferSize, uint32_t cursor, TLErrorOut error) TL_REQUIRES(_mutex);

@@ -221,7 +221,21 @@ uint32_t TALSqliteDocStore::_storeOrUpdateDocumentAtDocID(const TLIndexableItem&
 
 bool TALSqliteDocStore::deleteDocument(uint32_t docID, TLErrorOut error) {
   const platform::MutexLock lock(_mutex);
-  if (!_ready(error)) return false;
+  return _ready(error) && _deleteDocument(docID, error);
+}
+
+bool TALSqliteDocStore::deleteDocuments(const std::vector<uint32_t>& docIDs, TLErrorOut error) {
+  const platform::MutexLock lock(_mutex);
+  if (!_ready(error) || !_beginTransaction(error)) return false;
+  for (const uint32_t docID : docIDs) {
+    if (_deleteDocument(docID, error)) continue;
+    _rollback();
+    return false;
+  }
+  return _commit(error);
+}
+
+bool TALSqliteDocStore::_deleteDocument(uint32_t docID, TLErrorOut error) {
   Use use(_deleteDocumentStmt);
   if (use.bindInt(1, docID).step() == SQLITE_DONE) return true;
   log().error("Unable to commit {}", platform::printable(_lastSqliteErrorWithError(error)));

@@ -5,6 +5,7 @@
 #include <memory>
 #include <nlohmann/json.hpp>
 #include <optional>
+#include <span>
 #include <string>
 #include <vector>
 
@@ -190,15 +191,15 @@ class TALIndexer {
                                           const std::string& bundleID);
   bool _deleteItemsByIdentifiers(const Strings& identifiers, const std::string& bundleID,
                                  TLErrorOut error);
-  // Deletes the document from the store. Nullopt when it was not deleted.
-  [[nodiscard]] std::optional<uint32_t> deleteStored(const TLString& identifier,
-                                                     const std::string& bundleID,
-                                                     std::optional<TLError>* failure)
+  // The IDs of the identifiers up to the first that is not stored, which is an error. So is one
+  // that is repeated, because it is gone by then.
+  std::vector<uint32_t> storedIDs(std::span<const TLString> identifiers,
+                                  const std::string& bundleID, TLErrorOut error);
+  // Deletes documents from the store and hides them in the text index, some at a time. Those before
+  // a failure stay deleted.
+  bool deleteDocs(std::span<const uint32_t> docIDs, TLErrorOut error) TL_REQUIRES(_indexMutex);
+  bool _deleteItemsByDomainIdentifier(const Strings& domains, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
-  bool _deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error)
-      TL_REQUIRES(_indexMutex);
-  // Hides documents that were deleted from the store in the text index, and clears the list.
-  void hideDeleted(std::vector<uint32_t>* docIDs);
 
   // The result of a pass: the best items, and the number of items ranked.
   struct Found {

@@ -28,9 +28,9 @@ struct TALIndexer::Batch {
 
 namespace {
 
-// The index rewrites the whole set of deleted documents at each deletion, so this many are deleted
-// together. If the process is killed in between, as many may remain in the index without being in
-// the store.
+// The store syncs its file for each transaction, and the index rewrites the whole set of deleted
+// documents, so this many are deleted together. If the process is killed in between, as many may
+// remain in the index without being in the store.
 constexpr size_t kDeletedAtATime = 100;
 
 // Sets the plain text and the snippet of one item, and touches nothing else.
@@ -344,51 +344,59 @@ bool TALIndexer::_deleteItemsByIdentifiers(const Strings& identifiers, const std
   const std::span<const TLString> all(identifiers);
   for (size_t at = 0; at < all.size(); at += kDeletedAtATime) {
     MutexLock lock(_indexMutex);
-    std::vector<uint32_t> deleted;
-    std::optional<TLError> failure;
-    for (const TLString& identifier : all.subspan(at, std::min(kDeletedAtATime, all.size() - at))) {
-      if (const auto docID = deleteStored(identifier, bundleID, &failure))
-        deleted.push_back(*docID);
-      if (failure) break;
-    }
-    hideDeleted(&deleted);
-    if (failure) {
-      platform::setError(error, *failure);
+    std::optional<TLError> unknown;
+    const auto docIDs =
+        storedIDs(all.subspan(at, std::min(kDeletedAtATime, all.size() - at)), bundleID, &unknown);
+    if (!deleteDocs(docIDs, error)) return false;
+    if (unknown) {
+      platform::setError(error, *unknown);
       return false;
     }
   }
   return true;
 }
 
-std::optional<uint32_t> TALIndexer::deleteStored(const TLString& identifier,
-                                                 const std::string& bundleID,
-                                                 std::optional<TLError>* failure) {
-  const auto url = documentURLForIdentifier(identifier, bundleID);
-  const std::string shown = url ? url->absoluteString() : "(null)";
-  const uint32_t docID = url ? docStore()->documentIDWithURL(*url, failure) : 0;
-  if (docID == 0 && !*failure) {
-    *failure = TLError{kDocStoreErrorDomain, static_cast<int>(TALDocStoreError::notFound),
-                       "no document with URL " + shown};
+std::vector<uint32_t> TALIndexer::storedIDs(std::span<const TLString> identifiers,
+                                            const std::string& bundleID, TLErrorOut error) {
+  std::vector<uint32_t> docIDs;
+  for (const TLString& identifier : identifiers) {
+    const auto url = documentURLForIdentifier(identifier, bundleID);
+    const std::string shown = url ? url->absoluteString() : "(null)";
+    std::optional<TLError> failure;
+    const uint32_t docID = url ? docStore()->documentIDWithURL(*url, &failure) : 0;
+    const bool repeated = std::find(docIDs.begin(), docIDs.end(), docID) != docIDs.end();
+    if (!failure && (docID == 0 || repeated)) {
+      failure = TLError{kDocStoreErrorDomain, static_cast<int>(TALDocStoreError::notFound),
+                        "no document with URL " + shown};
+    }
+    if (failure) {
+      log().error("Failed to fetch document ID in docstore for URL {}: {}", shown,
+                  platform::printable(failure));
+      platform::setError(error, *failure);
+      break;
+    }
+    docIDs.push_back(docID);
   }
-  if (*failure) {
-    log().error("Failed to fetch document ID in docstore for URL {}: {}", shown,
-                platform::printable(*failure));
-    return std::nullopt;
-  }
-  _docDates.forget(docID);
-  const bool deleted = docStore()->deleteDocument(docID, failure);
-  if (*failure) {
-    log().error("Failed to delete document with ID {} in docstore: {}", docID,
-                platform::printable(*failure));
-  }
-  return deleted ? std::optional(docID) : std::nullopt;
+  return docIDs;
 }
 
-// A document that is still in the index but no longer in the store is not a result.
-void TALIndexer::hideDeleted(std::vector<uint32_t>* docIDs) {
+bool TALIndexer::deleteDocs(std::span<const uint32_t> docIDs, TLErrorOut error) {
   const auto text = _text.get();
-  if (text != nullptr && !docIDs->empty()) text->index->DeleteDocs(*docIDs);
-  docIDs->clear();
+  for (; !docIDs.empty(); docIDs = docIDs.subspan(std::min(kDeletedAtATime, docIDs.size()))) {
+    const auto piece = docIDs.first(std::min(kDeletedAtATime, docIDs.size()));
+    const std::vector<uint32_t> deleted(piece.begin(), piece.end());
+    for (const uint32_t docID : deleted) _docDates.forget(docID);
+    std::optional<TLError> failure;
+    if (!docStore()->deleteDocuments(deleted, &failure)) {
+      log().error("Failed to delete document with doc ID {} in docstore: {}", deleted.front(),
+                  platform::printable(failure));
+      platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
+      return false;
+    }
+    // A document that is still in the index but no longer in the store is not a result.
+    if (text != nullptr) text->index->DeleteDocs(deleted);
+  }
+  return true;
 }
 
 void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
@@ -401,36 +409,22 @@ void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
         const uint64_t signpost = Signpost::identifierForObject(this);
         Signpost::begin(signpost, "deleteItemsByDomainIdentifiers", "delete {} domains",
                         domains.size());
-        for (const TLString& domain : domains) {
-          _deleteItemsByDomainIdentifier(domain, &error);
-          if (error) break;
-        }
+        _deleteItemsByDomainIdentifier(domains, &error);
         Signpost::end(signpost, "deleteItemsByDomainIdentifiers", "");
         return error;
       },
       std::move(completionHandler));
 }
 
-bool TALIndexer::_deleteItemsByDomainIdentifier(const TLString& domain, TLErrorOut error) {
-  std::vector<uint32_t> deleted;
-  DocDates* const dates = &_docDates;
+// Scans the store once for all domains.
+bool TALIndexer::_deleteItemsByDomainIdentifier(const Strings& domains, TLErrorOut error) {
+  const std::unordered_set<TLString> wanted(domains.begin(), domains.end());
+  std::vector<uint32_t> found;
   const auto store = docStore();
-  const bool readAll = store->enumerateDocIDs(
-      error, [&](int64_t, uint32_t docID, const TLURL&, bool* stop, TLErrorOut handlerError) {
-        const auto doc = store->documentWithID(docID, nullptr);
-        if (doc == nullptr || doc->domainIdentifier() != domain) return;
-        std::optional<TLError> failure;
-        dates->forget(docID);
-        if (store->deleteDocument(docID, &failure)) {
-          deleted.push_back(docID);
-          if (deleted.size() == kDeletedAtATime) hideDeleted(&deleted);
-          return;
-        }
-        log().error("Failed to delete document with doc ID {} in docstore: {}", docID,
-                    platform::printable(failure));
-        if (failure) platform::setError(handlerError, *failure);
-        *stop = true;
-      });
-  hideDeleted(&deleted);
-  return readAll;
+  store->enumerateDocIDs(error, [&](int64_t, uint32_t docID, const TLURL&, bool*, TLErrorOut) {
+    const auto doc = store->documentWithID(docID, nullptr);
+    if (doc == nullptr || !doc->domainIdentifier()) return;
+    if (wanted.contains(*doc->domainIdentifier())) found.push_back(docID);
+  });
+  return deleteDocs(found, error);
 }

@@ -51,13 +51,18 @@ class ConnectionTable {
   }
 
  private:
-  // Evicts connections that have never made a call first, so that many silent peers cannot push out
-  // a working one.
+  // A connection whose peer has hung up leaves by itself, and so makes room without an eviction.
+  // Next come connections that have never made a call, so that many silent peers cannot push out a
+  // working one.
   bool evictOne() TL_REQUIRES(_mutex) {
     ServerConnection* chosen = nullptr;
     ServerConnection::Idleness least;
     for (ServerConnection* connection : _connections) {
       const auto idle = connection->idleness();
+      if (idle.gone && !connection->evicted()) {
+        chosen = connection;
+        break;
+      }
       if (idle.calling) continue;
       const bool longer = chosen == nullptr || (least.called && !idle.called) ||
                           (least.called == idle.called && idle.since < least.since);

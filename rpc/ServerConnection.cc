@@ -1,6 +1,7 @@
 #include "rpc/ServerConnection.h"
 
 #include <fcntl.h>
+#include <poll.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <systemd/sd-id128.h>
@@ -122,6 +123,7 @@ ServerConnection::ServerConnection(int descriptor, std::string serviceName, std:
     : _serviceName(std::move(serviceName)),
       _peer(std::move(peer)),
       _socket(descriptor),
+      _descriptor(descriptor),
       _idleSince(platform::monotonicTicks()) {}
 
 ServerConnection::~ServerConnection() {
@@ -160,13 +162,14 @@ void ServerConnection::finish(uint64_t milliseconds) {
 }
 
 ServerConnection::Idleness ServerConnection::idleness() const {
-  return {_inFlight != 0 || _evicted, _called, _idleSince};
+  pollfd socket{_descriptor, POLLRDHUP, 0};
+  const bool gone = poll(&socket, 1, 0) > 0;
+  return {gone, _inFlight != 0 || _evicted, _called, _idleSince};
 }
 
 void ServerConnection::evict() {
   _evicted = true;
   _outbox->post([this] {
-    // A call that has arrived since then is served.
     int unread = 0;
     _evicted = _calls.empty() && ioctl(_socket.get(), FIONREAD, &unread) == 0 && unread == 0;
     if (_evicted) endBecause("evicted for a new connection");
@@ -193,6 +196,7 @@ void ServerConnection::serve() {
     sd_bus_close_unref(_bus);
   }
   _inlet.reset();
+  _descriptor = -1;
   _socket.reset();
   _loop.reset();
   _ended();

@@ -68,12 +68,13 @@ class ServerConnection : public Connection {
 
   // Whether the connection is idle, and since when. Any thread.
   struct Idleness {
+    bool gone = false;     // the peer has hung up, and the connection will end soon
     bool calling = false;  // a call is in flight, or the connection is closing
     bool called = false;   // it has made at least one call
     uint64_t since = 0;    // nanoseconds of the monotonic clock
   };
   [[nodiscard]] Idleness idleness() const;
-  // Any thread: closes the connection to make room for another.
+  // Any thread: closes the connection to make room for another, unless a call has arrived.
   void evict();
   [[nodiscard]] bool evicted() const { return _evicted; }
 
@@ -121,6 +122,7 @@ class ServerConnection : public Connection {
   std::function<void()> _ended;
 
   platform::FileDescriptor _socket;
+  std::atomic<int> _descriptor;     // of the socket, for `idleness`; -1 at the end
   platform::FileDescriptor _inlet;  // what is written here, the bus reads
   std::unique_ptr<platform::RunLoop> _loop;
   const std::shared_ptr<Outbox> _outbox = std::make_shared<Outbox>();  // thread-safe

@@ -162,6 +162,13 @@ int64_t Catalogue::horizon() {
   return toNumber(value("horizon"));
 }
 
+bool Catalogue::forgetDeletions() {
+  begin();
+  sql("DELETE FROM deletion WHERE sequence <= ?").bind(_acknowledged).run();
+  setValue("horizon", std::to_string(_acknowledged));
+  return commit() && _database->execute("VACUUM; PRAGMA wal_checkpoint(TRUNCATE);");
+}
+
 void Catalogue::forgetOldDeletions() {
   Statement& count = sql("SELECT COUNT(*) FROM deletion WHERE sequence <= ?");
   count.bind(_acknowledged);

@@ -120,6 +120,9 @@ class Catalogue {
   // Deletions up to this number are forgotten.
   [[nodiscard]] int64_t horizon();
   void forgetOldDeletions();
+  // All that the daemon has acknowledged, also in the bytes of the file. Not between `begin` and
+  // `commit`. A daemon that is set back afterwards is asked for what it holds.
+  bool forgetDeletions();
   [[nodiscard]] std::string value(const char* key);
   void setValue(const char* key, const std::string& value);
 

@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <charconv>
 
+#include "cli/ErrorText.h"
+
 namespace mailsync {
 
 namespace {
@@ -13,14 +15,6 @@ constexpr std::string_view kStatePrefix = "tallow-sync 1 ";
 
 constexpr size_t kDeletionsOfACall = 500;
 constexpr size_t kMessagesOfAReader = 5000;
-
-// How the daemon says that it does not know an identifier, and that one item stopped a batch.
-bool isUnknownIdentifier(const TLError& error) {
-  return error.domain == "DocStore" && error.code == 12;
-}
-bool isItemFailure(const TLError& error) {
-  return error.domain == "TALIndexer" && error.code == 1;
-}
 
 }  // namespace
 
@@ -100,7 +94,7 @@ bool Delivery::sendDeletions(TLErrorOut error) {
     if (!noted) return false;
     std::optional<TLError> failure;
     if (!call({}, deletions, stateIsDue(), &failure)) {
-      if (!isUnknownIdentifier(*failure)) {
+      if (!cli::isNotIndexed(*failure)) {
         platform::setError(error, *failure);
         return false;
       }
@@ -119,7 +113,7 @@ bool Delivery::deleteSingly(const std::vector<std::string>& identifiers, TLError
     std::optional<TLError> failure;
     if (!_service.deleteItemsWithIdentifiers(std::span(&identifier, 1), _target.name,
                                              _target.protectionClass, &failure) &&
-        !isUnknownIdentifier(*failure)) {
+        !cli::isNotIndexed(*failure)) {
       platform::setError(error, *failure);
       return false;
     }
@@ -188,12 +182,12 @@ bool Delivery::sendPiece(Items items, TLErrorOut error) {
   if (!noted) return false;
   std::optional<TLError> failure;
   bool sent = call(encoded, deletions, stateIsDue(), &failure);
-  if (!sent && isUnknownIdentifier(*failure)) {
+  if (!sent && cli::isNotIndexed(*failure)) {
     if (!deleteSingly(deletions, error)) return false;
     failure.reset();
     sent = call(encoded, {}, stateIsDue(), &failure);
   }
-  if (!sent && isItemFailure(*failure)) return sendSingly(items, error);
+  if (!sent && cli::isRefusedMessage(*failure)) return sendSingly(items, error);
   if (!sent) {
     platform::setError(error, *failure);
     return false;
@@ -211,15 +205,16 @@ bool Delivery::sendSingly(Items items, TLErrorOut error) {
       ++(item.replace ? _counts.replaced : _counts.added);
       continue;
     }
-    if (!isItemFailure(*failure)) {
+    if (!cli::isRefusedMessage(*failure)) {
       platform::setError(error, *failure);
       return false;
     }
-    _observer.complain(item.item.identifier, failure->message);
+    const std::string reason = cli::plainText(*failure);
+    _observer.complain(item.item.identifier, reason);
     ++_counts.failed;
     // Parts of it may be in the index.
     if (!deleteSingly({item.item.identifier}, error)) return false;
-    if (!note([&] { _catalogue.setFailed(item.message, failure->message, true); }, error)) {
+    if (!note([&] { _catalogue.setFailed(item.message, reason, true); }, error)) {
       return false;
     }
   }

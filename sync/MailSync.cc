@@ -1,7 +1,9 @@
 #include "sync/MailSync.h"
 
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <sqlite3.h>
+#include <sys/stat.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -10,7 +12,7 @@
 #include <filesystem>
 #include <thread>
 
-#include "platform/Clock.h"
+#include "platform/FileDescriptor.h"
 #include "platform/Files.h"
 #include "sync/Inventory.h"
 
@@ -39,11 +41,23 @@ std::vector<std::string> outermost(std::vector<std::string> paths) {
 namespace {
 
 constexpr std::chrono::milliseconds kLockStep{50};
-constexpr const char* kLastSync = "lastSync";
 
 std::string pathOf(const SyncSettings& settings) {
   return cataloguePath(settings.catalogueDirectory, settings.runtimeDirectory,
                        settings.protectionClass);
+}
+
+// The time of this file is when the last run has ended. A run without changes writes nothing to the
+// catalogue, since a transaction would wait for the disk several times.
+std::string endPath(const SyncSettings& settings) {
+  return pathOf(settings) + ".ended";
+}
+
+// It is only shown, so that a failure changes nothing.
+void noteEnd(const SyncSettings& settings) {
+  const platform::FileDescriptor file(
+      open(endPath(settings).c_str(), O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
+  if (file.get() >= 0) futimens(file.get(), nullptr);
 }
 
 // The lock of one catalogue; waits for another process, up to the bound.
@@ -69,12 +83,16 @@ std::unique_ptr<platform::ProcessLock> acquireLock(const SyncSettings& settings,
   }
 }
 
+std::string damagedPath(const std::string& path) {
+  return path + ".damaged";
+}
+
 // A file that is no catalogue any more is set aside, and one is made anew.
 std::unique_ptr<Catalogue> openForWriting(const std::string& path, TLErrorOut error) {
   std::optional<TLError> failure;
   auto catalogue = Catalogue::open(path, &failure);
   if (catalogue == nullptr && (failure->code == SQLITE_NOTADB || failure->code == SQLITE_CORRUPT)) {
-    std::rename(path.c_str(), (path + ".damaged").c_str());
+    std::rename(path.c_str(), damagedPath(path).c_str());
     std::remove((path + "-wal").c_str());
     std::remove((path + "-shm").c_str());
     failure.reset();
@@ -176,17 +194,20 @@ class Run {
   }
 
   void scanRoots(MailboxScan& scanner, const std::vector<std::string>& paths) {
-    std::vector<std::string> roots = _catalogue->roots();
+    const std::vector<std::string> before = _catalogue->roots();
+    std::vector<std::string> roots = before;
     std::vector<std::string> wanted;
     for (const std::string& path : paths) wanted.push_back(canonicalPath(path));
     wanted = outermost(std::move(wanted));
-    for (const std::string& path : paths.empty() ? roots : wanted) {
+    for (const std::string& path : paths.empty() ? before : wanted) {
       const bool found = scanner.scan(path);
       if (found) roots.push_back(path);
       if (!found && _settings.pruneMissing) std::erase(roots, path);
     }
-    for (const std::string& root : _catalogue->roots()) _catalogue->removeRoot(root);
-    for (const std::string& root : outermost(std::move(roots))) _catalogue->addRoot(root);
+    roots = outermost(std::move(roots));
+    if (roots == before) return;
+    for (const std::string& root : before) _catalogue->removeRoot(root);
+    for (const std::string& root : roots) _catalogue->addRoot(root);
   }
 
   void scanPlaces(MailboxScan& scanner, std::vector<std::string> places) {
@@ -251,13 +272,8 @@ class Run {
     const bool done = delivery.run(_stored, error);
     _report.delivery = delivery.counts();
     _report.cancelled = _observer.cancelled();
-    if (!done || _report.cancelled) return done;
-    _catalogue->begin();
-    _catalogue->setValue(kLastSync,
-                         std::to_string(static_cast<int64_t>(platform::secondsSince1970())));
-    if (_catalogue->commit()) return true;
-    platform::setError(error, *_catalogue->failure());
-    return false;
+    if (done && !_report.cancelled) noteEnd(_settings);
+    return done;
   }
 
   const SyncSettings& _settings;
@@ -285,14 +301,30 @@ std::string watchLockPath(const SyncSettings& settings) {
   return pathOf(settings) + ".watch";
 }
 
-std::unique_ptr<Catalogue> openCatalogue(const SyncSettings& settings, TLErrorOut error) {
-  const std::string path = pathOf(settings);
-  return platform::fileExists(path) ? Catalogue::open(path, error) : nullptr;
+bool hasCatalogue(const SyncSettings& settings) {
+  return platform::fileExists(pathOf(settings));
 }
 
-std::optional<int64_t> lastSync(Catalogue& catalogue) {
-  const std::string text = catalogue.value(kLastSync);
-  return text.empty() ? std::nullopt : std::optional(std::strtoll(text.c_str(), nullptr, 10));
+std::unique_ptr<Catalogue> openCatalogue(const SyncSettings& settings, TLErrorOut error) {
+  return hasCatalogue(settings) ? Catalogue::open(pathOf(settings), error) : nullptr;
+}
+
+bool forgetDeleted(const SyncSettings& settings, TLErrorOut error) {
+  std::remove(damagedPath(pathOf(settings)).c_str());
+  if (!hasCatalogue(settings)) return true;
+  const auto lock = acquireLock(
+      settings, [] { return false; }, error);
+  if (lock == nullptr) return false;
+  const auto catalogue = Catalogue::open(pathOf(settings), error);
+  if (catalogue == nullptr) return false;
+  if (!catalogue->forgetDeletions()) platform::setError(error, *catalogue->failure());
+  return !catalogue->failure();
+}
+
+std::optional<int64_t> lastSync(const SyncSettings& settings) {
+  struct stat info;
+  if (stat(endPath(settings).c_str(), &info) != 0) return std::nullopt;
+  return info.st_mtim.tv_sec;
 }
 
 }  // namespace mailsync

@@ -84,11 +84,18 @@ bool syncPlaces(const SyncSettings& settings, const std::vector<std::string>& pl
 // of a run, which it takes for each.
 [[nodiscard]] std::string watchLockPath(const SyncSettings& settings);
 
+[[nodiscard]] bool hasCatalogue(const SyncSettings& settings);
+
 // The catalogue of these settings, to read; null without an error where there is none yet.
 [[nodiscard]] std::unique_ptr<Catalogue> openCatalogue(const SyncSettings& settings,
                                                        TLErrorOut error);
 
+// Has the catalogue of these settings, if there is one, forget the names of messages that are
+// deleted in the daemon as well. Without it they are kept, so that they can be deleted again in a
+// daemon that is set back.
+bool forgetDeleted(const SyncSettings& settings, TLErrorOut error);
+
 // Seconds since 1970 of the last run that went to its end; none where there was none.
-[[nodiscard]] std::optional<int64_t> lastSync(Catalogue& catalogue);
+[[nodiscard]] std::optional<int64_t> lastSync(const SyncSettings& settings);
 
 }  // namespace mailsync

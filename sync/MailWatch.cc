@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <utility>
 
+#include "cli/ErrorText.h"
 #include "cli/Identifier.h"
 #include "platform/Files.h"
 #include "platform/Paths.h"
@@ -60,7 +61,7 @@ MailWatch::MailWatch(WatchSettings settings, std::unique_ptr<ChangeSource> sourc
       _observer(std::move(observer)),
       _lock(std::move(lock)),
       _plan(now),
-      _nextPower(now + kPowerInterval) {
+      _nextPower(now + _settings.powerInterval) {
   watchAround();
 }
 
@@ -106,7 +107,7 @@ void MailWatch::watchAround() {
 
 void MailWatch::checkPower(Time now) {
   if (_held == 0 || now < _nextPower) return;
-  _nextPower = now + kPowerInterval;
+  _nextPower = now + _settings.powerInterval;
   if (!platform::runsOnBattery(_settings.powerDirectory)) _plan.request(now);
 }
 
@@ -114,7 +115,7 @@ void MailWatch::checkPower(Time now) {
 bool MailWatch::stopsForPower() {
   const Time now = RescanPlan::Clock::now();
   if (_settings.onBattery || _remaining <= kBatteryBacklog || now < _nextPower) return false;
-  _nextPower = now + kPowerInterval;
+  _nextPower = now + _settings.powerInterval;
   _stoppedForPower = platform::runsOnBattery(_settings.powerDirectory);
   return _stoppedForPower;
 }
@@ -136,7 +137,7 @@ void MailWatch::run(const RescanPlan::Round& round) {
   if (round.everything) _said.clear();
   _stoppedForPower = false;
   _remaining = 0;
-  _nextPower = RescanPlan::Clock::now() + kPowerInterval;
+  _nextPower = RescanPlan::Clock::now() + _settings.powerInterval;
   SyncSettings settings = _settings.sync;
   const bool onBattery = !_settings.onBattery && platform::runsOnBattery(_settings.powerDirectory);
   settings.backlogLimit = onBattery ? kBatteryBacklog : 0;
@@ -209,7 +210,7 @@ void MailWatch::settle(const SyncReport& report, bool everything, Time now) {
 // --- What the user hears
 
 void MailWatch::tellFailure(const std::optional<TLError>& error) {
-  const std::string failure = error ? error->message : "the daemon gave no answer";
+  const std::string failure = error ? cli::plainText(*error) : "the daemon gave no answer";
   if (failure == _failure) return;
   _failure = failure;
   _observer.say(failure + "; tried again until it succeeds");

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <functional>
 #include <map>
 #include <memory>
@@ -20,6 +21,8 @@ struct WatchSettings {
   std::vector<std::string> roots;  // canonical paths, none below another
   bool onBattery = false;          // large backlogs do not wait for power
   std::string powerDirectory = platform::kPowerSupplyDirectory;
+  // How often the power is looked at while something waits for it, or a round takes that long.
+  std::chrono::milliseconds powerInterval{std::chrono::minutes(1)};
 };
 
 struct WatchObserver {
@@ -40,8 +43,6 @@ class MailWatch {
 
   // On battery more messages than this wait for power.
   static constexpr uint64_t kBatteryBacklog = 500;
-  // How often the power is looked at while something waits for it, or a round takes that long.
-  static constexpr std::chrono::minutes kPowerInterval{1};
 
   // Null with an error when the class is watched already, or the lock cannot be made.
   [[nodiscard]] static std::unique_ptr<MailWatch> start(WatchSettings settings,

@@ -523,7 +523,7 @@ TEST_F(CommandsTest, SyncAndStatus) {
   EXPECT_THAT(output, HasSubstr("       1 of        2  " + mail + ", 1 failed\n"));
   EXPECT_THAT(output, HasSubstr("/cur/2:2,: the message is empty\n"));
   EXPECT_EQ(run({"status", "--format=json"}), ExitStatus::done);
-  const auto json = nlohmann::json::parse(output);
+  const auto json = nlohmann::json::parse(output)["classes"][0];
   EXPECT_EQ(json["mailboxes"]["folders"][0]["indexed"], 1);
   EXPECT_EQ(json["mailboxes"]["roots"][0], mail);
   daemon.stop();

@@ -214,6 +214,39 @@ TEST_F(EverydayTest, AClassWithoutMailIsNotMade) {
   EXPECT_EQ(run("search toast" + state), 0);
 }
 
+TEST_F(EverydayTest, StatusOfAllClassesAndOfDeletedMail) {
+  const std::string state = " --format=json --state-dir " + directory / "state";
+  EXPECT_EQ(run("index --class work " + mail + "/drafts"), 0);
+  const int family = count("folder:family");
+  EXPECT_EQ(run("delete " + mail + "/family"), 0);
+  const auto classes = [this](const std::string& arguments) {
+    EXPECT_EQ(run("status" + arguments), 0) << errors;
+    return nlohmann::json::parse(output).at("classes");
+  };
+  const auto all = classes(state);
+  ASSERT_EQ(all.size(), 2U);
+  EXPECT_EQ(all[0].at("class"), "default");
+  EXPECT_EQ(all[0].at("index").at("deleted"), family);
+  const double stored = all[0].at("index").at("messages");
+  EXPECT_NEAR(all[0].at("index").at("deletedShare"), family / (stored + family), 1e-9);
+  EXPECT_EQ(all[1].at("class"), "work");
+  EXPECT_EQ(all[1].at("index").at("deleted"), 0);
+  EXPECT_GT(all[1].at("files").at("indexBytes"), 0);
+  const auto one = classes(state + " --class work");
+  ASSERT_EQ(one.size(), 1U);
+  EXPECT_EQ(one[0].at("index").at("messages"), all[1].at("index").at("messages"));
+  // One that the settings name counts once it has been synced, and is not made by the look.
+  platform::createDirectories(directory / "config/tallow", nullptr);
+  platform::writeFileAtomically(
+      directory / "config/tallow/config.toml",
+      fmt::format("roots = ['{0}']\n[class]\n'{0}' = 'private'\n", mail + "/drafts"), nullptr);
+  EXPECT_EQ(classes(state).size(), 2U);
+  EXPECT_TRUE(classes(state + " --class private")[0].at("index").is_null());
+  EXPECT_FALSE(std::filesystem::exists(directory / "state/TallowSearch/private"));
+  EXPECT_EQ(run("sync"), 0) << errors;
+  EXPECT_EQ(classes(state).size(), 3U);
+}
+
 // The signal comes while the daemon has the first batch.
 TEST(IndexTest, AnInterruptLeavesASummary) {
   const testsupport::TemporaryDirectory directory;

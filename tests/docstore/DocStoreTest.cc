@@ -177,6 +177,8 @@ TEST_F(DocStore, MapsURLsAndIDs) {
   EXPECT_TRUE(_store.deleteDocument(2, &error));
   EXPECT_TRUE(_store.deleteDocument(2, &error));
   EXPECT_EQ(_store.documentIDWithURL(url(2), &error), 0U);
+  EXPECT_TRUE(_store.deleteDocuments({1, 2, 3}, &error));
+  EXPECT_EQ(_store.count(nullptr), 0);
   EXPECT_FALSE(error);
   TLDocumentIDs ids;
   ASSERT_TRUE(_store.storeOrUpdateDocuments({{url(2), item(u"s")}}, &ids, nullptr));
@@ -349,6 +351,7 @@ TEST_F(DocStore, ALockedDatabaseFailsWritesAndStillReads) {
                   "DocStore 1: cannot rollback - no transaction is active"));
   capture.clear();
   EXPECT_FALSE(_store.deleteDocument(1, nullptr));
+  EXPECT_FALSE(_store.deleteDocuments({1, 2}, nullptr));
   EXPECT_FALSE(_store.setMetadataValue("v", "k", nullptr));
   EXPECT_FALSE(_store.resetWithError(nullptr));
   EXPECT_TRUE(
@@ -429,6 +432,7 @@ TEST_F(DocStore, AClosedStoreRefusesOperations) {
   EXPECT_TRUE(fails([&](auto e) { return _store.storeOrUpdateDocuments(batch, nullptr, e); }));
   EXPECT_TRUE(fails([&](auto e) { return _store.storeOrUpdateDocuments(batch, {}, nullptr, e); }));
   EXPECT_TRUE(fails([&](auto e) { return _store.deleteDocument(1, e); }));
+  EXPECT_TRUE(fails([&](auto e) { return _store.deleteDocuments({1}, e); }));
   EXPECT_TRUE(fails([&](auto e) { return _store.resetWithError(e); }));
   EXPECT_TRUE(fails([&](auto e) { return _store.documentIDWithURL(url(1), e) != 0; }));
   EXPECT_TRUE(fails([&](auto e) { return _store.metadataValueForKey("version", e).has_value(); }));

@@ -268,6 +268,9 @@ TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
       log.contains("Failed to fetch document ID in docstore for URL tlw://mail_bundle_id/nobody"));
   EXPECT_EQ(search("word"), "b");
   EXPECT_TRUE(remove({u""}));
+  // The second time it is not there any more.
+  EXPECT_TRUE(remove({u"b", u"b"}));
+  EXPECT_EQ(store->count(nullptr), 0);
 }
 
 TEST_F(IndexerTest, DeletesByDomain) {
@@ -276,13 +279,16 @@ TEST_F(IndexerTest, DeletesByDomain) {
     items.push_back(mail(std::to_string(i), "word"));
     items.back()->setDomainIdentifier(i % 2 == 0 || i > 5 ? u"even" : u"odd");
   }
+  items.push_back(mail("other", "word"));
+  items.back()->setDomainIdentifier(u"third");
+  items.push_back(mail("none", "word"));
   ASSERT_EQ(add(items), std::nullopt);
   EXPECT_EQ(outcomeOf([&](auto done) {
-              indexer->deleteItemsByDomainIdentifiers({u"even", u"none"}, done);
+              indexer->deleteItemsByDomainIdentifiers({u"even", u"nothing", u"third"}, done);
             }),
             std::nullopt);
-  EXPECT_EQ(search("word"), "5 3 1");
-  EXPECT_EQ(store->count(nullptr), 3);
+  EXPECT_EQ(search("word"), "none 5 3 1");
+  EXPECT_EQ(store->count(nullptr), 4);
 }
 
 TEST_F(IndexerTest, AnItemWithoutIdentifierStoresNothingOfTheBatch) {

@@ -252,7 +252,8 @@ TEST_F(PurgeTest, TheDaemonRemovesTheRemainsOfAKilledPurge) {
   EXPECT_EQ(purge(), std::nullopt);
   EXPECT_EQ(error->code, EWOULDBLOCK);
   const auto client = [this](const std::string& arguments) {
-    const std::string command = TALLOW_PROGRAM " --state-dir " + state + " purge " + arguments +
+    const std::string command = "XDG_STATE_HOME=" + directory.path() +
+                                " " TALLOW_PROGRAM " --state-dir " + state + " purge " + arguments +
                                 " >" + directory / "out" + " 2>&1";
     const int ended = std::system(command.c_str());
     return std::pair(WEXITSTATUS(ended),

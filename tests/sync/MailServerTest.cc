@@ -1,8 +1,7 @@
 #include "tests/sync/WatchProcessSupport.h"
 
 // The watch beside what people use: an IMAP server, and a program that copies its mail into a
-// Maildir. Skipped where they are not installed, but
-// not where CI=true (scripts/ci-packages.list).
+// Maildir.
 
 namespace fs = std::filesystem;
 
@@ -17,12 +16,7 @@ constexpr uid_t kNobody = 65534;  // the server does not serve root
 class MailServerTest : public testsupport::WatchProcessTest {
  protected:
   void SetUp() override {
-    if (!fs::exists(kServer) || !fs::exists(kCopier)) {
-      const char* const ci = std::getenv("CI");
-      ASSERT_FALSE(ci != nullptr && std::string(ci) == "true")
-          << "dovecot-imapd or isync is missing";
-      GTEST_SKIP() << "dovecot-imapd or isync is not installed";
-    }
+    if (!hasPrograms({kServer, kCopier})) return;
     const bool root = geteuid() == 0;
     write("server.conf",
           fmt::format("mail_location = maildir:{0}/server\nbase_dir = {0}/base\n"

@@ -13,6 +13,7 @@
 #include <set>
 
 #include "cli/Identifier.h"
+#include "platform/Files.h"
 #include "platform/Text.h"
 #include "sync/MailSync.h"
 #include "sync/MessageDigest.h"
@@ -256,10 +257,13 @@ TEST_F(MailSyncTest, WhatCannotBeIndexedIsToldAndNotTakenForSent) {
   ASSERT_TRUE(sync());
   EXPECT_EQ(indexed(), (Lines{"a: one"}));
   EXPECT_EQ(report.delivery.failed, 2U);
+  EXPECT_THAT(complaints, testing::Contains(HasSubstr("/a/cur/2: the daemon could not put")));
   auto catalogue = mailsync::openCatalogue(settings, nullptr);
   std::vector<std::string> reasons;
   for (const auto& problem : catalogue->problems(10)) reasons.push_back(problem.reason);
-  EXPECT_THAT(reasons, testing::UnorderedElementsAre("index failed", "the message is empty"));
+  EXPECT_THAT(reasons,
+              testing::UnorderedElementsAre(HasSubstr("could not put the message into the index"),
+                                            "the message is empty"));
   catalogue.reset();
   daemon.refuse("");
   ASSERT_TRUE(sync());
@@ -267,6 +271,24 @@ TEST_F(MailSyncTest, WhatCannotBeIndexedIsToldAndNotTakenForSent) {
   settings.retryFailed = true;
   ASSERT_TRUE(sync());
   EXPECT_EQ(indexed(), (Lines{"a: one", "a: poison"}));
+}
+
+// Neither does it wait for the disk.
+TEST_F(MailSyncTest, WithoutChangesTheCatalogueIsNotWritten) {
+  EXPECT_EQ(mailsync::lastSync(settings), std::nullopt);
+  add("a/cur/1", "one");
+  age();
+  ASSERT_TRUE(sync());
+  ASSERT_TRUE(sync());
+  struct stat before {};
+  struct stat after {};
+  ASSERT_EQ(stat(cataloguePath().c_str(), &before), 0);
+  ASSERT_TRUE(sync());
+  ASSERT_EQ(stat(cataloguePath().c_str(), &after), 0);
+  EXPECT_EQ(before.st_mtim.tv_sec, after.st_mtim.tv_sec);
+  EXPECT_EQ(before.st_mtim.tv_nsec, after.st_mtim.tv_nsec);
+  EXPECT_NEAR(static_cast<double>(mailsync::lastSync(settings).value_or(0)),
+              static_cast<double>(std::time(nullptr)), 60);
 }
 
 TEST_F(MailSyncTest, ADryRunChangesNothing) {
@@ -306,6 +328,30 @@ TEST_F(MailSyncTest, ACatalogueThatIsLostOrDamagedSendsNothingAgain) {
   std::ofstream(cataloguePath(), std::ios::binary) << std::string(8192, 'x');
   ASSERT_TRUE(sync()) << platform::printable(error);
   EXPECT_EQ(daemon.received(), 4U);
+}
+
+// After a purge. A daemon that was set back to before the deletion is asked for what it holds.
+TEST_F(MailSyncTest, NamesOfDeletedMessagesCanBeForgotten) {
+  add("a/cur/departed", "one");
+  add("a/cur/2", "two");
+  ASSERT_TRUE(sync());
+  const StoringDaemon::Content before = daemon.content();
+  fs::remove(mail + "/a/cur/departed");
+  ASSERT_TRUE(sync());
+  const auto names = [this] {
+    const auto bytes = platform::readFile(cataloguePath(), size_t{1} << 20, nullptr);
+    return bytes.value_or("").find("departed") != std::string::npos;
+  };
+  EXPECT_TRUE(names());
+  EXPECT_TRUE(mailsync::forgetDeleted(settings, &error)) << platform::printable(error);
+  EXPECT_FALSE(names());
+  ASSERT_TRUE(sync());
+  EXPECT_FALSE(report.compared);
+  daemon.setContent(before);
+  ASSERT_TRUE(sync());
+  EXPECT_TRUE(report.compared);
+  EXPECT_EQ(indexed(), (Lines{"a: two"}));
+  EXPECT_EQ(daemon.received(), 2U);
 }
 
 // A time that is not past tells nothing: the clock may have been set back since.

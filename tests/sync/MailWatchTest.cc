@@ -60,7 +60,6 @@ class MailWatchTest : public testing::Test {
     }
   }
   void start(const std::string& root) {
-    mailsync::WatchSettings settings;
     settings.sync.runtimeDirectory = daemon.runtimeDirectory();
     settings.sync.protectionClass = "default";
     settings.sync.name = "tallow";
@@ -96,6 +95,7 @@ class MailWatchTest : public testing::Test {
   const std::string mail = directory / "mail";
   testsupport::StoringDaemon daemon;
   ScriptedSource* source = nullptr;
+  mailsync::WatchSettings settings;
   std::set<std::string> refused;
   std::unique_ptr<mailsync::MailWatch> watch;
   mailsync::MailWatch::Time now = mailsync::RescanPlan::Clock::now();
@@ -193,12 +193,37 @@ TEST_F(MailWatchTest, ALargeBacklogWaitsForPowerAndNewMailDoesNot) {
   EXPECT_EQ(said.size(), 2U);
 }
 
+// What is lost while a round sends.
+TEST_F(MailWatchTest, ARoundStopsForPowerWhereMuchIsLeft) {
+  settings.powerInterval = std::chrono::milliseconds(0);
+  setPower(true);
+  const size_t limit = mailsync::MailWatch::kBatteryBacklog;
+  const size_t many = 3 * limit;
+  for (size_t i = 0; i < many; ++i) add("a/cur/" + std::to_string(i) + ":2,");
+  daemon.whenReceived(limit / 2, [this] { setPower(false); });
+  start(mail);
+  const size_t sent = indexed();
+  EXPECT_GE(sent, limit / 2);
+  EXPECT_LT(sent, many - limit);
+  pass(std::chrono::seconds(1));
+  EXPECT_THAT(said, ElementsAre(HasSubstr(std::to_string(many - sent) + " messages wait")));
+  add("b/new/1");
+  tell(mail + "/b/new", "1");
+  EXPECT_EQ(indexed(), sent + 1);
+  setPower(true);
+  pass(minutes(2));
+  pass(std::chrono::seconds(1));
+  EXPECT_EQ(indexed(), many + 1);
+  EXPECT_EQ(daemon.received(), many + 1);
+  // What a person waits for is sent to its end.
+  for (size_t i = 0; i < limit; ++i) add("b/cur/more" + std::to_string(i) + ":2,");
+  daemon.whenReceived(many + 2, [this] { setPower(false); });
+  tell(mail + "/b/cur", "more0:2,");
+  EXPECT_EQ(indexed(), many + 1 + limit);
+}
+
 TEST_F(MailWatchTest, ASecondWatchOfTheClassSaysSo) {
   start(mail);
-  mailsync::WatchSettings settings;
-  settings.sync.runtimeDirectory = daemon.runtimeDirectory();
-  settings.sync.protectionClass = "default";
-  settings.sync.catalogueDirectory = directory / "state";
   std::optional<TLError> error;
   EXPECT_EQ(
       mailsync::MailWatch::start(settings, std::make_unique<ScriptedSource>(), {}, now, &error),

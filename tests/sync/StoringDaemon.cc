@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <utility>
+
 #include "platform/Text.h"
 #include "records/TLQuery.h"
 
@@ -82,6 +84,7 @@ void StoringDaemon::change(const std::vector<std::string>& identifiers,
     }
     _content.items[platform::toUTF8(platform::orEmpty(item->identifier()))] = std::move(item);
   }
+  if (_whenReceived && _received >= _awaited) std::exchange(_whenReceived, nullptr)();
   if (fault == Fault::afterItems) return reply.sendError(kBroken);
   if (state) _content.state = state;
   if (fault == Fault::afterState) return reply.sendError(kBroken);
@@ -125,6 +128,12 @@ void StoringDaemon::refuse(const std::string& subject) {
 size_t StoringDaemon::received() const {
   const platform::MutexLock lock(_mutex);
   return _received;
+}
+
+void StoringDaemon::whenReceived(size_t items, std::function<void()> action) {
+  const platform::MutexLock lock(_mutex);
+  _awaited = items;
+  _whenReceived = std::move(action);
 }
 
 }  // namespace testsupport

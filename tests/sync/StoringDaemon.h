@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -41,6 +42,9 @@ class StoringDaemon {
   void refuse(const std::string& subject);
   // How many items have come, since the start.
   [[nodiscard]] size_t received() const;
+  // `action` runs once, on the daemon's thread, before the reply to the call that brings so many
+  // items.
+  void whenReceived(size_t items, std::function<void()> action);
 
  private:
   void change(const std::vector<std::string>& identifiers, const std::vector<std::string>& items,
@@ -55,6 +59,8 @@ class StoringDaemon {
   size_t _faultIn TL_GUARDED_BY(_mutex) = 0;
   std::string _refused TL_GUARDED_BY(_mutex);
   size_t _received TL_GUARDED_BY(_mutex) = 0;
+  size_t _awaited TL_GUARDED_BY(_mutex) = 0;
+  std::function<void()> _whenReceived TL_GUARDED_BY(_mutex);
   platform::RunLoop _loop;
   std::unique_ptr<rpc::Listener> _listener;
   std::thread _thread;
