@@ -101,6 +101,12 @@ int exchange(sd_bus* bus, sd_bus_message* request, std::chrono::microseconds tim
   return reply != nullptr ? 0 : result;
 }
 
+// Whether the daemon has closed the connection, for example for want of room.
+bool hungUp(sd_bus* bus) {
+  pollfd socket{sd_bus_get_fd(bus), POLLRDHUP, 0};
+  return poll(&socket, 1, 0) > 0;
+}
+
 }  // namespace
 
 std::string defaultRuntimeDirectory() {
@@ -131,6 +137,7 @@ TLError Channel::unreachable(int errnoValue) const {
 }
 
 bool Channel::connect(TLErrorOut error) {
+  if (_bus != nullptr && hungUp(_bus)) disconnect();
   if (_bus != nullptr) return true;
   const int descriptor = connectWithin(_patience, _runtimeDirectory, _socketPath);
   int result = descriptor;
