@@ -1,6 +1,9 @@
 #include "cli/MailReader.h"
 
+#include <sys/stat.h>
+
 #include <algorithm>
+#include <array>
 
 #include "cli/LineReader.h"
 #include "cli/MailFile.h"
@@ -12,6 +15,22 @@ namespace cli {
 namespace {
 
 constexpr std::string_view kFlags = ":2,";
+constexpr std::array<const char*, 2> kMailDirectories{"new", "cur"};
+
+// Of a directory that is not there, 0.
+std::vector<timespec> changeTimesOf(const std::string& maildir) {
+  std::vector<timespec> times;
+  for (const char* const sub : kMailDirectories) {
+    struct stat info {};
+    const bool there = stat((maildir + '/' + sub).c_str(), &info) == 0;
+    times.push_back(there ? info.st_mtim : timespec{});
+  }
+  return times;
+}
+
+bool isSame(const timespec& a, const timespec& b) {
+  return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
+}
 
 std::string nameOf(const std::string& path) {
   return path.substr(path.rfind('/') + 1);
@@ -82,15 +101,23 @@ const MailReader::Listing& MailReader::listingOf(const std::string& maildir) {
   if (known != _listings.end()) return known->second;
   if (_listings.size() >= kMaxListings) _listings.clear();
   Listing& listing = _listings[maildir];
-  for (const char* const sub : {"new", "cur"}) {
+  listing.times = changeTimesOf(maildir);
+  for (const char* const sub : kMailDirectories) {
     const std::string directory = maildir + '/' + sub + '/';
     const auto names = platform::listDirectory(directory, nullptr);
     if (!names) continue;
     for (const std::string& name : *names) {
-      listing[name.substr(0, name.rfind(kFlags))] = directory + name;
+      listing.paths[name.substr(0, name.rfind(kFlags))] = directory + name;
     }
   }
   return listing;
+}
+
+void MailReader::refresh() {
+  std::erase_if(_listings, [](const auto& entry) {
+    const auto now = changeTimesOf(entry.first);
+    return !std::equal(now.begin(), now.end(), entry.second.times.begin(), isSame);
+  });
 }
 
 std::optional<MailLocation> MailReader::locate(const std::string& identifier) {
@@ -101,8 +128,8 @@ std::optional<MailLocation> MailReader::locate(const std::string& identifier) {
   }
   if (!location || location->offset || !isMaildirFile(location->path)) return location;
   const Listing& listing = listingOf(maildirOf(location->path));
-  const auto found = listing.find(nameOf(location->path));
-  if (found == listing.end()) return std::nullopt;
+  const auto found = listing.paths.find(nameOf(location->path));
+  if (found == listing.paths.end()) return std::nullopt;
   location->path = found->second;
   return location;
 }

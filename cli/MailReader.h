@@ -1,12 +1,14 @@
 #pragma once
 
 #include <cstdint>
+#include <ctime>
 #include <functional>
 #include <map>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 #include "cli/Identifier.h"
 #include "platform/TLError.h"
@@ -34,9 +36,15 @@ class MailReader {
   [[nodiscard]] std::optional<std::string> read(const std::string& identifier, size_t most,
                                                 TLErrorOut error);
 
+  // Forgets what has changed since it was listed, for programs that go on for long.
+  void refresh();
+
  private:
-  // By name without flags: the path.
-  using Listing = std::map<std::string, std::string, std::less<>>;
+  struct Listing {
+    // By name without flags: the path.
+    std::map<std::string, std::string, std::less<>> paths;
+    std::vector<timespec> times;  // when "new" and "cur" were changed last
+  };
 
   const Listing& listingOf(const std::string& maildir);
 

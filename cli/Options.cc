@@ -1,9 +1,11 @@
 #include "cli/Options.h"
 
 #include <fmt/format.h>
+#include <unistd.h>
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <cstdlib>
 #include <iostream>
 #include <limits>
 #include <map>
@@ -269,6 +271,13 @@ ExitStatus showHelp(CLI::App& app, const std::string& command) {
   return ExitStatus::done;
 }
 
+// Whether a person looks at a screen that can be drawn on.
+bool isScreen() {
+  const char* const terminal = std::getenv("TERM");
+  return isatty(STDIN_FILENO) == 1 && isatty(STDOUT_FILENO) == 1 && terminal != nullptr &&
+         *terminal != '\0' && std::string_view(terminal) != "dumb";
+}
+
 const char* misuseOfShow(const Options& options) {
   if (options.raw && options.attachment != 0) return "--raw does not go with --attachment";
   if ((options.attachment != 0) != !options.output.empty()) {
@@ -305,7 +314,8 @@ const char* misuse(const Options& options) {
 std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitStatus& status) {
   Options options;
   CLI::App app("Full-text search of personal mail; a client of tallowsearchd.", "tallow");
-  app.require_subcommand(1);
+  app.require_subcommand(isScreen() ? 0 : 1, 1);
+  app.footer("Without a command, on a terminal: search as you type.");
   app.failure_message(misuseText);
   addGlobalOptions(app, options);
   for (const CommandRow& row : kCommands) addCommand(app, row, options);
@@ -319,6 +329,7 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
     app.parse(std::move(arguments));
     restoreWords(options.arguments);
     options.classGiven = app.count("--class") > 0;
+    if (app.get_subcommands().empty()) options.command = Command::screen;
   } catch (const CLI::ParseError& error) {
     const std::string word = unknownCommand(app);
     if (error.get_exit_code() != 0 && !word.empty()) {

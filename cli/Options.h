@@ -38,7 +38,8 @@ enum class Command {
   watch,
   show,
   address,
-  save
+  save,
+  screen  // search as you type
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };
@@ -67,6 +68,7 @@ struct Options {
   bool verbose = false;
 
   bool threads = false;  // results by conversation
+  std::string folder;    // beside words: only mail in this folder, as folder:NAME; empty for all
 
   // Of show.
   bool raw = false;
@@ -91,8 +93,9 @@ struct Options {
   }
 };
 
-// Reads the command line. When the program has nothing more to do, after --help, --version or wrong
-// use, it has been told on the standard output or error, and `status` is what to end with.
+// Reads the command line. Without a command on a terminal that is Command::screen. When the program
+// has nothing more to do, after --help, --version or wrong use, it has been told on the standard
+// output or error, and `status` is what to end with.
 [[nodiscard]] std::optional<Options> parseCommandLine(int argc, const char* const* argv,
                                                       ExitStatus& status);
 

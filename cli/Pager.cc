@@ -1,7 +1,6 @@
 #include "cli/Pager.h"
 
 #include <fcntl.h>
-#include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -12,6 +11,7 @@
 #include <string>
 
 #include "cli/Commands.h"
+#include "cli/ShellCommand.h"
 #include "platform/FileDescriptor.h"
 
 namespace cli {
@@ -43,26 +43,6 @@ class IgnoredSignals {
   void (*const _quit)(int);
 };
 
-// The pager as a shell starts it, with the signals as a program expects them; 0 or an errno value.
-int start(const std::string& command, int input, pid_t& process) {
-  const std::array<const char*, 4> arguments{"sh", "-c", command.c_str(), nullptr};
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
-  posix_spawnattr_t attributes;
-  posix_spawnattr_init(&attributes);
-  sigset_t signals;
-  sigemptyset(&signals);
-  for (const int signal : {SIGPIPE, SIGINT, SIGQUIT}) sigaddset(&signals, signal);
-  posix_spawnattr_setsigdefault(&attributes, &signals);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
-  const int result = posix_spawn(&process, "/bin/sh", &actions, &attributes,
-                                 const_cast<char* const*>(arguments.data()), environ);
-  posix_spawnattr_destroy(&attributes);
-  posix_spawn_file_actions_destroy(&actions);
-  return result;
-}
-
 // Stops where the reader has gone.
 void writeAll(int output, std::string_view text) {
   while (!text.empty()) {
@@ -86,7 +66,7 @@ ExitStatus page(std::string_view text) {
   // A pager that is "less" alone would show escape sequences as text.
   setenv("LESS", "R", 0);
   pid_t process = -1;
-  if (start(command, input.get(), process) != 0) return print(text);
+  if (startShell(command, {}, input.get(), process) != 0) return print(text);
   input.reset();
   writeAll(output.get(), text);
   output.reset();

@@ -146,6 +146,18 @@ void readTyped(QueryInput& input) {
   input.main = {input.words, usersyntax::printed(input.typed.root), nullptr, nullptr};
 }
 
+// What was typed, in one folder only.
+void limitToFolder(const std::string& folder, usersyntax::Query& typed) {
+  usersyntax::Node place;
+  place.kind = usersyntax::Kind::text;
+  place.field = usersyntax::Field::folder;
+  place.text = folder;
+  usersyntax::Node both;
+  both.children = {std::move(typed.root), std::move(place)};
+  typed.root = std::move(both);
+  typed.plain = false;
+}
+
 // As one query of the daemon's where that tells all, else as a plan.
 bool makePlan(QueryInput& input, bool typed, TLErrorOut error) {
   const TLQuery& query = *input.query;
@@ -173,7 +185,8 @@ std::string QueryInput::markedWords() const {
     const usersyntax::Node& node = *open.back();
     open.pop_back();
     if (node.kind == usersyntax::Kind::negation) continue;
-    if (node.kind == usersyntax::Kind::text) marked += node.text + ' ';
+    const bool folder = node.field == usersyntax::Field::folder;
+    if (node.kind == usersyntax::Kind::text && !folder) marked += node.text + ' ';
     for (auto child = node.children.rbegin(); child != node.children.rend(); ++child) {
       open.push_back(&*child);
     }
@@ -186,6 +199,7 @@ std::optional<QueryInput> queryInput(const Options& options, double now, TLError
   input.words = joinedWords(options.arguments);
   if (options.query.empty()) input.typed = usersyntax::parse(input.words, now);
   input.remarks = input.typed.remarks;
+  if (!options.folder.empty()) limitToFolder(options.folder, input.typed);
   const bool typed = !input.typed.plain;
   const std::string expression = options.query.empty() ? disjunctionOf(input.words) : options.query;
   if (typed) {

@@ -165,8 +165,7 @@ Hits joinCopies(const ResultItems& items, MailFacts& facts) {
   std::unordered_map<std::string, size_t> known;  // by Message-ID
   for (const auto& item : items) {
     const std::string identifier = textOf(item->identifier());
-    const bool readable = facts.reader().locate(identifier).has_value();
-    if (readable && alike[keyOf(*item)] > 1) {
+    if (alike[keyOf(*item)] > 1 && facts.reader().locate(identifier)) {
       const auto head = facts.head(identifier);
       if (head && !head->messageID.empty()) {
         const auto [at, added] = known.try_emplace(head->messageID, hits.size());

@@ -9,12 +9,12 @@
 
 #include "cli/Commands.h"
 #include "cli/Explanation.h"
+#include "cli/HitSearch.h"
 #include "cli/LastSearch.h"
 #include "cli/MailPlaces.h"
 #include "cli/QueryInput.h"
 #include "cli/Results.h"
 #include "cli/SavedSearches.h"
-#include "cli/SearchRun.h"
 #include "cli/StateDirectory.h"
 #include "cli/Threads.h"
 #include "client/SearchServiceProxy.h"
@@ -39,50 +39,22 @@ std::optional<QueryInput> readQuery(Options options) {
   return input;
 }
 
-// What has been found, with what is known of it.
-struct Outcome {
-  Hits hits;
-  ResultItems items;
-  bool complete = true;
-  std::vector<client::ReplacedWord> replaced;
-};
-
-void remarkOn(const SearchResults& found, size_t wanted, const MailFacts& facts) {
-  if (facts.unreadable() > 0) {
+void remarkOn(const Outcome& outcome) {
+  if (outcome.unreadable > 0) {
     complain(fmt::format("{} messages cannot be read to look for what the index does not hold",
-                         facts.unreadable()));
+                         outcome.unreadable));
   }
-  if (!found.complete && found.items.size() < wanted) {
-    complain(fmt::format("only the first {} that may match were looked at", found.lookedAt));
+  if (outcome.lookedAt > 0) {
+    complain(fmt::format("only the first {} that may match were looked at", outcome.lookedAt));
   }
 }
 
-// Asks for more as long as copies of messages leave fewer results than are wanted.
 std::optional<Outcome> search(const Options& options, const QueryInput& input, MailFacts& facts,
                               TLErrorOut error) {
-  constexpr size_t kCounted = 1000;  // also what makes threads, unless more are shown
-  // Copies of the last message shown rank directly after it.
-  constexpr size_t kCopies = 30;
   client::SearchServiceProxy service(options.runtimeDirectory, options.patience());
-  const size_t limit = static_cast<size_t>(options.limit);
-  const size_t shown =
-      limit == 0 || options.count ? SIZE_MAX : limit + static_cast<size_t>(options.offset);
-  size_t wanted = shown > SIZE_MAX - kCopies ? SIZE_MAX : shown + kCopies;
-  if (options.format == OutputFormat::json) wanted = std::max(wanted, kCounted);
-  if (options.threads) wanted = std::clamp(shown, kCounted, kMaxThreadedHits);
-  for (;;) {
-    auto found = runPlan(input.plan, {options.protectionClass, options.sort, wanted, options.count},
-                         service, facts, error);
-    if (!found) return std::nullopt;
-    const bool all = found->complete || found->items.size() < wanted;
-    if (all || wanted == SIZE_MAX) remarkOn(*found, wanted, facts);
-    Hits hits = joinCopies(found->items, facts);
-    if (all || options.threads || hits.size() >= shown || wanted > SIZE_MAX / 4) {
-      return Outcome{std::move(hits), std::move(found->items), found->complete,
-                     std::move(found->replaced)};
-    }
-    wanted *= 4;
-  }
+  auto outcome = findHits(options, input.plan, service, facts, error);
+  if (outcome) remarkOn(*outcome);
+  return outcome;
 }
 
 // Where ranks are shown, they are known to `tallow show` afterwards.

@@ -1,6 +1,7 @@
 #include "cli/SearchRun.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <cmath>
 #include <unordered_map>
 #include <unordered_set>
@@ -88,6 +89,10 @@ class Run {
   }
 
   std::optional<ResultItems> ask(const TLQuery& query, TLErrorOut error) {
+    if (_request.stop.stop_requested()) {
+      platform::setError(error, {"tallow", ECANCELED, "the search was given up"});
+      return std::nullopt;
+    }
     const auto sent = query.copyWithZone();
     // Words as they are typed go to the daemon as they are, unless that is not enough.
     const bool raised = !_plan.asTyped || needsAll();
@@ -163,7 +168,8 @@ class Run {
   SearchResults check(const std::vector<Candidate>& candidates) {
     SearchResults results;
     for (const Candidate& candidate : candidates) {
-      if (!_request.complete && results.items.size() >= _request.wanted) {
+      const bool enough = !_request.complete && results.items.size() >= _request.wanted;
+      if (enough || _request.stop.stop_requested()) {
         results.complete = false;
         break;
       }

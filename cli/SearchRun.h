@@ -1,5 +1,6 @@
 #pragma once
 
+#include <stop_token>
 #include <string>
 #include <vector>
 
@@ -16,6 +17,7 @@ struct SearchRequest {
   SortOrder order = SortOrder::relevance;
   size_t wanted = 20;     // results that are needed; SIZE_MAX for all
   bool complete = false;  // all have to be found, whatever is wanted, so that they can be counted
+  std::stop_token stop = {};  // the results are wanted no more
 };
 
 struct SearchResults {
@@ -33,7 +35,7 @@ inline constexpr size_t kCandidateSteps[] = {1000, 10000, 100000};
 
 // Carries out a plan: asks the daemon for the candidates of each branch, takes out what has to go,
 // joins the branches by identifier, and checks the candidates in order until enough are found.
-// None, with the error, where the daemon answers with one.
+// None, with the error, where the daemon answers with one, or with one of ours after a stop.
 [[nodiscard]] std::optional<SearchResults> runPlan(const SearchPlan& plan,
                                                    const SearchRequest& request,
                                                    client::SearchServiceProxy& service,

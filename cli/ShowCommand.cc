@@ -15,6 +15,7 @@
 #include "cli/MailPlaces.h"
 #include "cli/MailView.h"
 #include "cli/Pager.h"
+#include "cli/Reading.h"
 #include "cli/Results.h"
 #include "platform/FileDescriptor.h"
 #include "platform/Files.h"
@@ -22,9 +23,6 @@
 namespace cli {
 
 namespace {
-
-// The longest name of a field, a colon and a space.
-constexpr size_t kFieldColumns = 10;
 
 std::optional<size_t> rankOf(const std::string& argument) {
   size_t rank = 0;
@@ -66,63 +64,10 @@ std::optional<Wanted> wantedMessage(const std::string& argument, ExitStatus& sta
 }
 
 std::optional<std::string> readMessage(const std::string& identifier, MailReader& reader) {
-  if (!parseIdentifier(identifier)) {
-    complain(fmt::format("{}: no message on this disk is named so", identifier));
-    return std::nullopt;
-  }
   std::optional<TLError> error;
-  auto message = reader.read(identifier, kMaximumMessageBytes, &error);
+  auto message = readSingleMessage(identifier, kMaximumMessageBytes, reader, &error);
   if (!message) complain(fmt::format("{}: {}", identifier, error->message));
-  if (message && message->starts_with("From ") &&
-      isFromLine(message->substr(0, message->find('\n') + 1))) {
-    complain(
-        fmt::format("{}: this is a mailbox; name one of its messages, as `tallow search "
-                    "--format=files` does",
-                    identifier));
-    return std::nullopt;
-  }
   return message;
-}
-
-std::string sizeText(uint64_t bytes) {
-  if (bytes < 1000) return fmt::format("{} B", bytes);
-  if (bytes < 1000000) return fmt::format("{:.1f} kB", static_cast<double>(bytes) / 1e3);
-  return fmt::format("{:.1f} MB", static_cast<double>(bytes) / 1e6);
-}
-
-// The message as one clean text, with words marked.
-std::string readingText(MailView& view, const std::string& path,
-                        const std::vector<std::string>& words, const Palette& palette) {
-  const auto marked = [&](const std::string& text) {
-    return highlight(cleanLinesForTerminal(text), words, palette.match, palette.end);
-  };
-  std::string out;
-  const auto addField = [&](const std::string& name, const std::string& value) {
-    out += fmt::format("{}{:{}}{}", palette.faint, name + ':', kFieldColumns, palette.end) + value +
-           '\n';
-  };
-  for (const auto& [name, value] : view.fields()) addField(name, marked(cleanForTerminal(value)));
-  addField("File", cleanForTerminal(path));
-  const std::string body = marked(view.text());
-  out += '\n' + (body.empty() ? fmt::format("{}(no text){}", palette.faint, palette.end) : body);
-  if (!out.ends_with('\n')) out += '\n';
-  if (!view.complete()) {
-    out += fmt::format("\n{}The text is longer than is shown; --raw shows all of it.{}\n",
-                       palette.faint, palette.end);
-  }
-  const auto attachments = view.attachments();
-  if (!attachments.empty()) {
-    out += fmt::format("\n{}Attachments, saved by --attachment N -o FILE:{}\n", palette.faint,
-                       palette.end);
-  }
-  size_t number = 0;
-  for (const auto& attachment : attachments) {
-    const std::string name = cleanForTerminal(attachment.name);
-    out += fmt::format("{:3}  {}  {}{}, {}{}\n", ++number, name.empty() ? "(no name)" : name,
-                       palette.faint, cleanForTerminal(attachment.type), sizeText(attachment.bytes),
-                       palette.end);
-  }
-  return out;
 }
 
 std::string readingJSON(MailView& view, const std::string& identifier, const std::string& path) {

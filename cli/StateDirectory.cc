@@ -80,11 +80,15 @@ std::vector<std::string> classesOnDisk(const Options& options) {
   return names;
 }
 
+std::string unknownClassText(const Options& options) {
+  return options.protectionClass == "default"
+             ? "nothing has been indexed yet; `tallow sync ~/Mail` does that"
+             : fmt::format("nothing has been indexed for class \"{}\" yet",
+                           options.protectionClass);
+}
+
 ExitStatus complainOfUnknownClass(const Options& options) {
-  complain(
-      options.protectionClass == "default"
-          ? std::string("nothing has been indexed yet; `tallow sync ~/Mail` does that")
-          : fmt::format("nothing has been indexed for class \"{}\" yet", options.protectionClass));
+  complain(unknownClassText(options));
   return ExitStatus::nothingFound;
 }
 

@@ -23,6 +23,8 @@ namespace cli {
 // that of the daemon, or cannot be read.
 [[nodiscard]] std::vector<std::string> classesOnDisk(const Options& options);
 
+// What to tell the user then.
+[[nodiscard]] std::string unknownClassText(const Options& options);
 // Says so; the status that goes with it.
 [[nodiscard]] ExitStatus complainOfUnknownClass(const Options& options);
 

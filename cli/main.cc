@@ -2,6 +2,7 @@
 
 #include "cli/Commands.h"
 #include "platform/Log.h"
+#include "screen/Screen.h"
 
 // The command-line client of tallowsearchd.
 int main(int argc, char** argv) {
@@ -11,6 +12,9 @@ int main(int argc, char** argv) {
   platform::setProcessLogThreshold(platform::LogLevel::error);
   cli::ExitStatus status = cli::ExitStatus::failure;
   const auto options = cli::parseCommandLine(argc, argv, status);
-  if (options) status = cli::runCommand(*options);
+  if (options) {
+    status = options->command == cli::Command::screen ? mailscreen::runScreen(*options)
+                                                      : cli::runCommand(*options);
+  }
   return static_cast<int>(status);
 }

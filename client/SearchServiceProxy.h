@@ -27,7 +27,8 @@ struct ReplacedWord {
 };
 
 // The daemon's search service. Each operation waits for its reply and fails with an error of the
-// daemon or of this library (see Channel.h). One thread at a time.
+// daemon or of this library (see Channel.h). One thread at a time, except
+// `interrupt`.
 //
 // A list that is too long for one call is sent in several, in order. The first failure ends the
 // operation; earlier calls keep their effect.
@@ -75,6 +76,9 @@ class SearchServiceProxy {
   // The words that the last search of this proxy replaced. Nullopt on failure, also if the daemon
   // does not support it or the connection has changed since the search.
   [[nodiscard]] std::optional<std::vector<ReplacedWord>> replacedWords(TLErrorOut error);
+
+  // From any thread: ends the operation in hand, and lets no later one begin.
+  void interrupt() { _channel.interrupt(); }
 
  private:
   bool callWithTexts(const char* member, std::span<const std::string> texts,

@@ -101,6 +101,12 @@ int exchange(sd_bus* bus, sd_bus_message* request, std::chrono::microseconds tim
   return reply != nullptr ? 0 : result;
 }
 
+// Whether the daemon has closed the connection, for example for want of room.
+bool hungUp(sd_bus* bus) {
+  pollfd socket{sd_bus_get_fd(bus), POLLRDHUP, 0};
+  return poll(&socket, 1, 0) > 0;
+}
+
 }  // namespace
 
 std::string defaultRuntimeDirectory() {
@@ -131,13 +137,17 @@ TLError Channel::unreachable(int errnoValue) const {
 }
 
 bool Channel::connect(TLErrorOut error) {
+  if (_bus != nullptr && hungUp(_bus)) disconnect();
   if (_bus != nullptr) return true;
   const int descriptor = connectWithin(_patience, _runtimeDirectory, _socketPath);
   int result = descriptor;
   if (result >= 0) {
-    result = sd_bus_new(&_bus);
+    result = adopt(descriptor) ? sd_bus_new(&_bus) : -ECANCELED;
     if (result >= 0) result = sd_bus_set_fd(_bus, descriptor, descriptor);
-    if (result < 0) close(descriptor);
+    if (result < 0) {
+      adopt(-1);
+      close(descriptor);
+    }
   }
   if (result >= 0) result = sd_bus_negotiate_fds(_bus, 0);
   if (result >= 0) result = sd_bus_start(_bus);
@@ -147,7 +157,20 @@ bool Channel::connect(TLErrorOut error) {
   return false;
 }
 
+bool Channel::adopt(int descriptor) {
+  const platform::MutexLock lock(_mutex);
+  _descriptor = descriptor;
+  return !_interrupted;
+}
+
+void Channel::interrupt() {
+  const platform::MutexLock lock(_mutex);
+  _interrupted = true;
+  if (_descriptor >= 0) shutdown(_descriptor, SHUT_RDWR);
+}
+
 void Channel::disconnect() {
+  adopt(-1);
   if (_bus != nullptr) sd_bus_close(_bus);
   _bus = sd_bus_unref(_bus);
 }

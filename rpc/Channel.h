@@ -4,6 +4,7 @@
 #include <functional>
 #include <string>
 
+#include "platform/Mutex.h"
 #include "platform/TLError.h"
 #include "rpc/Names.h"
 
@@ -42,7 +43,7 @@ using Patience = std::chrono::milliseconds;
 // call waits up to `patience` for the socket to accept connections, so a client may start before
 // the daemon.
 //
-// Threads: one at a time per channel; channels are independent.
+// Threads: one at a time per channel, except `interrupt`; channels are independent.
 class Channel {
  public:
   Channel(const std::string& runtimeDirectory, std::string serviceName, Patience patience);
@@ -63,9 +64,13 @@ class Channel {
   bool call(const char* interface, const char* member, std::chrono::seconds timeout,
             const Body& append, const Body& read, TLErrorOut error);
 
+  // From any thread: ends the call in hand, and lets no later one begin; they are unreachable.
+  void interrupt() TL_EXCLUDES(_mutex);
+
  private:
   bool connect(TLErrorOut error);
   void disconnect();
+  bool adopt(int descriptor) TL_EXCLUDES(_mutex);
   [[nodiscard]] TLError unreachable(int errnoValue) const;
 
   const std::string _runtimeDirectory;
@@ -74,6 +79,9 @@ class Channel {
   const std::string _objectPath;
   const Patience _patience;
   sd_bus* _bus = nullptr;
+  platform::Mutex _mutex;
+  int _descriptor TL_GUARDED_BY(_mutex) = -1;  // of the connection, to be shut down
+  bool _interrupted TL_GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace rpc

@@ -1,6 +1,7 @@
 #include "rpc/ServerConnection.h"
 
 #include <fcntl.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <systemd/sd-id128.h>
 #include <unistd.h>
@@ -164,7 +165,12 @@ ServerConnection::Idleness ServerConnection::idleness() const {
 
 void ServerConnection::evict() {
   _evicted = true;
-  _outbox->post([this] { endBecause("evicted for a new connection"); });
+  _outbox->post([this] {
+    // A call that has arrived since then is served.
+    int unread = 0;
+    _evicted = _calls.empty() && ioctl(_socket.get(), FIONREAD, &unread) == 0 && unread == 0;
+    if (_evicted) endBecause("evicted for a new connection");
+  });
 }
 
 void ServerConnection::serve() {

@@ -1,5 +1,7 @@
 #include <gtest/gtest.h>
 
+#include <chrono>
+#include <filesystem>
 #include <fstream>
 
 #include "cli/MailReader.h"
@@ -50,6 +52,28 @@ TEST_F(MailReaderTest, AMessageNamedByItsContentIsThatMessageOrNone) {
   EXPECT_FALSE(read(name));
   _offset = 100000;
   EXPECT_FALSE(read(name));
+}
+
+// Directories are listed once, and again after a change that is told of.
+TEST_F(MailReaderTest, AMaildirThatHasChangedIsListedAgain) {
+  namespace fs = std::filesystem;
+  const std::string maildir = _directory / "Mail";
+  fs::create_directories(maildir + "/cur");
+  fs::create_directories(maildir + "/new");
+  std::ofstream(maildir + "/new/1.M1.host") << kFirst;
+  const std::string identifier = cli::maildirIdentifier(maildir + "/new/1.M1.host");
+  cli::MailReader reader;
+  const auto path = [&] {
+    const auto location = reader.locate(identifier);
+    return location ? location->path : "";
+  };
+  EXPECT_EQ(path(), maildir + "/new/1.M1.host");
+  fs::rename(maildir + "/new/1.M1.host", maildir + "/cur/1.M1.host:2,S");
+  // The times of directories go by ticks of the clock.
+  fs::last_write_time(maildir + "/cur", fs::file_time_type::clock::now() + std::chrono::hours(1));
+  EXPECT_EQ(path(), maildir + "/new/1.M1.host");
+  reader.refresh();
+  EXPECT_EQ(path(), maildir + "/cur/1.M1.host:2,S");
 }
 
 }  // namespace

@@ -103,6 +103,20 @@ TEST_F(ProxyTest, PassesOnErrorsOfTheDaemon) {
   EXPECT_TRUE(search.deleteAllItems("me", "c", nullptr));  // the connection stays open
 }
 
+// With twice as many clients as there are places, each call evicts an idle connection, whose client
+// must not notice.
+TEST_F(ProxyTest, AClientDoesNotNoticeThatItsIdleConnectionWasEvicted) {
+  std::vector<std::unique_ptr<client::DebugServiceProxy>> clients;
+  for (size_t i = 0; i < 2 * rpc::kMaxConnections; ++i) {
+    clients.push_back(std::make_unique<client::DebugServiceProxy>(daemon.runtimeDirectory()));
+  }
+  for (int round = 0; round < 3; ++round) {
+    for (const auto& one : clients) {
+      ASSERT_EQ(one->ping("hello", &error), "pong") << platform::printable(error);
+    }
+  }
+}
+
 TEST_F(ProxyTest, RefusesTextThatDBusCannotCarry) {
   const std::vector<std::string> texts{"\xFF"};
   EXPECT_FALSE(search.deleteItemsWithIdentifiers(texts, "me", "c", &error));
@@ -172,4 +186,15 @@ TEST_F(ProxyTest, WaitsForTheSocketUntilPatienceRunsOut) {
   DebugServiceProxy patient(runtime, std::chrono::minutes(1));
   EXPECT_EQ(patient.ping("", &error), "pong");
   starter.join();
+}
+
+TEST_F(ProxyTest, AfterAnInterruptNothingBegins) {
+  EXPECT_FALSE(search.fetchLastClientState("me", "c", &error));
+  ASSERT_FALSE(error.has_value()) << error->message;
+  search.interrupt();
+  EXPECT_FALSE(search.fetchLastClientState("me", "c", &error));
+  EXPECT_TRUE(rpc::isUnreachable(error));
+  EXPECT_FALSE(search.fetchLastClientState("me", "c", &error));
+  EXPECT_TRUE(rpc::isUnreachable(error));
+  EXPECT_EQ(daemon.calls().size(), 1u);
 }

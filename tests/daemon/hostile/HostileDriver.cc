@@ -233,11 +233,12 @@ int conclude(DaemonProcess& daemon, const GoodClient& good, const std::string& l
   const int status = daemon.wait();
   fmt::print("{} {} status={}\n", line, good.report(), status);
   if (!good.wrong.empty()) fmt::print(stderr, "WRONG: {}\n", good.wrong);
-  if (status != 0) {
+  const bool right = status == 0 && good.wrong.empty();
+  if (!right) {
     const std::string log = daemon.log();
     fmt::print(stderr, "{}\n", log.substr(log.size() - std::min<size_t>(log.size(), 3000)));
   }
-  return status == 0 && good.wrong.empty() ? 0 : 1;
+  return right ? 0 : 1;
 }
 
 int runMutations(const Options& options) {

@@ -1,0 +1,32 @@
+#pragma once
+
+#include <functional>
+#include <optional>
+
+#include "cli/MailReader.h"
+#include "cli/Options.h"
+#include "screen/LatestWorker.h"
+#include "screen/Search.h"
+
+namespace mailscreen {
+
+// Reads mails for the screen on a thread of its own ("tallow.preview"), as Searcher searches.
+class MailLoader {
+ public:
+  // Of a mail for a preview, so many bytes are read, and so many of its text are shown.
+  static constexpr size_t kPreviewBytes = size_t{1} << 20;
+  static constexpr size_t kPreviewText = size_t{64} << 10;
+
+  MailLoader(const cli::Options& options, std::function<void()> wake);
+
+  void submit(MailRequest request) { _worker.submit(std::move(request)); }
+  [[nodiscard]] std::optional<Mail> take() { return _worker.take(); }
+
+ private:
+  Mail load(const MailRequest& request);
+
+  cli::MailReader _reader;
+  LatestWorker<MailRequest, Mail> _worker;
+};
+
+}  // namespace mailscreen

@@ -1,0 +1,78 @@
+#include <gtest/gtest.h>
+
+#include <mutex>
+#include <vector>
+
+#include "screen/LatestWorker.h"
+
+namespace {
+
+// A worker that doubles numbers, once the test lets it.
+class LatestWorkerTest : public testing::Test {
+ protected:
+  int work(int job, const std::stop_token& stop) {
+    std::unique_lock lock(mutex);
+    started.push_back(job);
+    changed.notify_all();
+    changed.wait(lock, stop, [this] { return free; });
+    return 2 * job;
+  }
+  void wake() {
+    const std::lock_guard lock(mutex);
+    ++woken;
+    changed.notify_all();
+  }
+  void awaitStart() {
+    std::unique_lock lock(mutex);
+    changed.wait(lock, [this] { return !started.empty(); });
+  }
+  void awaitResult(int number) {
+    std::unique_lock lock(mutex);
+    changed.wait(lock, [&] { return woken == number; });
+  }
+  void letGo() {
+    const std::lock_guard lock(mutex);
+    free = true;
+    changed.notify_all();
+  }
+
+  std::mutex mutex;
+  std::condition_variable_any changed;
+  std::vector<int> started;
+  bool free = false;
+  int woken = 0;  // how often
+  mailscreen::LatestWorker<int, int> worker{
+      "test.latest", [this](int job, const std::stop_token& stop) { return work(job, stop); },
+      [this] { wake(); }};
+};
+
+}  // namespace
+
+TEST_F(LatestWorkerTest, OnlyTheLastJobHasAResult) {
+  EXPECT_EQ(worker.take(), std::nullopt);
+  worker.submit(1);
+  awaitStart();
+  worker.submit(2);  // stops the first, and may begin
+  worker.submit(3);
+  letGo();
+  awaitResult(1);
+  EXPECT_EQ(worker.take(), 6);
+  EXPECT_EQ(worker.take(), std::nullopt);
+  EXPECT_EQ(started.back(), 3);
+}
+
+// The fixture ends although the job was not let go.
+TEST_F(LatestWorkerTest, TheEndStopsTheJobInHand) {
+  worker.submit(1);
+  awaitStart();
+}
+
+TEST_F(LatestWorkerTest, ANewJobDropsTheResultOfTheLast) {
+  letGo();
+  worker.submit(1);
+  awaitResult(1);
+  worker.submit(2);
+  awaitResult(2);
+  EXPECT_EQ(worker.take(), 4);
+  EXPECT_EQ(worker.take(), std::nullopt);
+}

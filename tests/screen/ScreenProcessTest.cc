@@ -1,0 +1,348 @@
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <memory>
+#include <sstream>
+
+#include "cli/Terminal.h"
+#include "platform/Files.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/support/TemporaryDirectory.h"
+
+// The program as a person sees it: in a terminal, with a real daemon and the sample mail. Skipped
+// where there is no tmux, but not where CI=true (scripts/ci-packages.list).
+
+namespace fs = std::filesystem;
+using testing::HasSubstr;
+using testing::Not;
+
+namespace {
+
+constexpr const char* kTerminal = "/usr/bin/tmux";
+constexpr std::chrono::seconds kPatience(60);
+
+std::string outputOf(const std::string& command) {
+  std::string output;
+  FILE* const pipe = popen((command + " 2>/dev/null").c_str(), "r");
+  if (pipe == nullptr) return output;
+  char buffer[4096];
+  for (size_t n = 0; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
+  pclose(pipe);
+  return output;
+}
+
+class ScreenProcessTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    if (!fs::exists(kTerminal)) {
+      const char* const ci = std::getenv("CI");
+      ASSERT_FALSE(ci != nullptr && std::string(ci) == "true") << "tmux is missing";
+      GTEST_SKIP() << "tmux is not installed";
+    }
+    fs::copy(TALLOW_SAMPLE_MAIL, mail, fs::copy_options::recursive);
+    startDaemon();
+  }
+  void TearDown() override { outputOf(tmux("kill-server")); }
+
+  void startDaemon() {
+    daemon.reset();
+    daemon = std::make_unique<testsupport::DaemonProcess>(directory.path());
+    ASSERT_TRUE(daemon->ready());
+  }
+  void index() const {
+    ASSERT_EQ(std::system(fmt::format("{} index {} >/dev/null 2>&1", program(), mail).c_str()), 0);
+  }
+  [[nodiscard]] std::string program() const {
+    return TALLOW_PROGRAM " --runtime-dir " + daemon->runtimeDirectory();
+  }
+
+  [[nodiscard]] std::string tmux(const std::string& arguments) const {
+    return fmt::format(
+        "env -u TMUX -u STATE_DIRECTORY LC_ALL=C.UTF-8 HOME={0} XDG_STATE_HOME={0}/client "
+        "XDG_CONFIG_HOME={0}/config TZ=UTC SHELL=/bin/bash {1} {2} -u -f /dev/null -S {0}/tmux {3}",
+        directory.path(), variables, kTerminal, arguments);
+  }
+  // A shell in a terminal of this size, and the program in it.
+  void open(int columns, int rows) {
+    outputOf(tmux(
+        fmt::format("new-session -d -s t -x {} -y {} "
+                    "\"PS1='ready> ' exec bash --norc --noprofile -i\" \\; set -g set-clipboard on",
+                    columns, rows)));
+    await("ready>");
+    type(program());
+    press("Enter");
+    await("Search:");
+  }
+  void type(const std::string& text) const {
+    outputOf(tmux("send-keys -t t -l -- '" + text + "'"));
+  }
+  void press(const std::string& keys) const { outputOf(tmux("send-keys -t t " + keys)); }
+  [[nodiscard]] std::string screen() const { return outputOf(tmux("capture-pane -p -t t")); }
+  [[nodiscard]] std::vector<std::string> lines() const {
+    std::istringstream text(screen());
+    std::vector<std::string> all;
+    for (std::string line; std::getline(text, line);) all.push_back(line);
+    return all;
+  }
+
+  // Looks at the screen until it is as it should be.
+  void awaitThat(const std::function<bool(const std::string&)>& holds,
+                 const std::string& what) const {
+    const auto end = std::chrono::steady_clock::now() + kPatience;
+    std::string seen;
+    while (std::chrono::steady_clock::now() < end) {
+      seen = screen();
+      if (holds(seen)) return;
+    }
+    FAIL() << what << " is not so:\n" << seen;
+  }
+  void await(const std::string& text) const {
+    awaitThat([&](const std::string& seen) { return seen.find(text) != std::string::npos; },
+              "\"" + text + "\" on the screen");
+  }
+  void awaitGone(const std::string& text) const {
+    awaitThat([&](const std::string& seen) { return seen.find(text) == std::string::npos; },
+              "\"" + text + "\" not on the screen");
+  }
+
+  // The process of the program, a child of the shell.
+  [[nodiscard]] pid_t process() const {
+    const int shell = std::atoi(outputOf(tmux("display-message -p -t t '#{pane_pid}'")).c_str());
+    return std::atoi(outputOf(fmt::format("cat /proc/{0}/task/{0}/children", shell)).c_str());
+  }
+  // The terminal shows again what is typed, line by line, outside of the program.
+  void expectRestored() const {
+    awaitGone("Search:");
+    type("stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"; echo status=$?");
+    press("Enter");
+    await("4\nstatus=0");
+  }
+
+  const testsupport::TemporaryDirectory directory;
+  const std::string mail = directory / "mail";
+  std::string variables;  // of the environment, NAME=VALUE
+  std::unique_ptr<testsupport::DaemonProcess> daemon;
+};
+
+}  // namespace
+
+TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
+  index();
+  open(80, 24);
+  await("F1 help");
+  type("minutes of the row");
+  await("Minutes of the rowing club");
+  await("1-1 of 1");
+  await("Subject:  Minutes of the rowing club");  // the preview
+  press("C-u");
+  awaitGone("Minutes");
+  type("photos");
+  await("Photos from the island");
+  // Letters of any script, moving in the line, and a word taken back.
+  press("C-u");
+  type("京都");
+  await("京都");
+  press("C-w");
+  type("invoice zz");
+  await("no match");
+  press("BSpace BSpace BSpace");
+  await("Your invoice 4471");
+  press("C-a");
+  type("x");
+  await("Search: xinvoice");
+  press("C-a DC");
+  await("Your invoice 4471");
+  // Pasted text is a part of the line, whatever keys its characters are.
+  press("C-e C-u");
+  outputOf(tmux(
+      "set-buffer -- \"$(printf 'photos\\rfrom\\tthe\\033OA\\017')\" \\; paste-buffer -p -t t"));
+  await("Search: photos from the");
+  await("Photos from the island");
+  EXPECT_THAT(screen(), Not(HasSubstr("TALLOW_OPEN")));
+}
+
+TEST_F(ScreenProcessTest, MailsAreReadSortedAndFiltered) {
+  index();
+  open(120, 40);
+  type("invoice");
+  await("Your invoice 4471");
+  press("C-s");
+  await("newest first");
+  press("C-t");
+  await("conversations");
+  await("(4) ");
+  press("C-f");
+  await("Folder:");
+  press("C-u");
+  type("family");
+  press("Enter");
+  await("in family");
+  await("First invoice for the shelves");
+  awaitGone("4471");
+  press("Enter");
+  await("q back");
+  await("Subject:  First invoice for the shelves");
+  press("q");
+  await("Search: invoice");
+  press("F1");
+  await("Ctrl-T");
+  press("Escape");
+  await("Search: invoice");
+  press("C-y");
+  await("copied " + mail + "/family/cur/");
+  EXPECT_THAT(outputOf(tmux("show-buffer")), HasSubstr(mail + "/family/cur/"));
+}
+
+TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
+  index();
+  variables = fmt::format("TALLOW_OPEN='tee {}/opened <'", directory.path());
+  open(80, 24);
+  type("oarlock fixed");
+  await("1-1 of 1");
+  press("C-o");
+  await("Search: oarlock");
+  awaitThat([&](const std::string&) { return fs::exists(directory / "opened"); },
+            "the mail being opened");
+  await("1-1 of 1");
+  EXPECT_THAT(platform::readFile(directory / "opened", 100000, nullptr).value_or(""),
+              HasSubstr("Subject: Oarlock fixed"));
+  press("Escape");
+  expectRestored();
+}
+
+TEST_F(ScreenProcessTest, AnySizeIsDrawn) {
+  index();
+  open(80, 24);
+  type("invoice");
+  await("Your invoice 4471");
+  const auto resize = [&](int columns, int rows) {
+    outputOf(tmux(fmt::format("resize-window -t t -x {} -y {}", columns, rows)));
+  };
+  resize(130, 30);
+  // Beside the list.
+  awaitThat([&](const std::string& seen) { return seen.find("│ From:") != std::string::npos; },
+            "the preview beside");
+  resize(30, 5);
+  awaitGone("│");
+  await("invoice");
+  resize(12, 2);
+  awaitThat([&](const std::string& seen) { return seen.size() < 40; }, "two lines");
+  resize(1, 1);
+  awaitThat([&](const std::string& seen) { return seen.size() < 8; }, "one cell");
+  press("Down Enter PPage q F1 q");
+  resize(80, 24);
+  await("Search: invoice");
+  await("Your invoice 4471");
+  press("Escape");
+  expectRestored();
+}
+
+// Whatever is in a mail: what stands beside and below it is where it was.
+TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
+  fs::remove_all(mail);
+  fs::create_directories(mail);
+  const std::string bad =
+      "\x1b[2J\x1b]0;title\x07\u009B31m\u202Egnp.exe\u2066\u0645\u0631\u062D\u0628\u0627 "
+      "\u05E9\u05DC\u05D5\u05DD "
+      "z\u0301\u0302\u0303\u0304\u0305\u0306\u0307\u0308\u0309 "
+      "\u4EAC\u90FD\u200D\u2764\uFE0F\U0001F44B\U0001F3FD "
+      "\U0001F468\u200D\U0001F469\u200D\U0001F467 \xC3\x28 \xFF";
+  std::ofstream(mail + "/1.eml") << "From: \"" << bad << "\" <a@example.org>\nSubject: hostile "
+                                 << bad << std::string(1000000, 'M')
+                                 << "\nDate: Mon, 08 Jan 2024 08:49:00 +0000\n\n"
+                                 << "hostile\n"
+                                 << bad << "\n\n"
+                                 << std::string(5000, '\t') << bad << "\x0E\x8D\n";
+  std::ofstream(mail + "/2\n\x1b[2J\u202E.eml")
+      << "From: b@example.org\nSubject: hostile but plain\nDate: Mon, 08 Jan 2023 08:49:00 "
+         "+0000\n\nhostile\n";
+  index();
+  open(90, 24);
+  type("hostile");
+  await("1-2 of 2");
+  await("hostile but plain");
+  press("Down");
+  await("Subject:  hostile but plain");
+  press("Up");
+  awaitGone("Subject:  hostile but plain");
+  await("Subject:  hostile");
+  const auto seen = lines();
+  ASSERT_EQ(seen.size(), 24u);
+  EXPECT_THAT(seen[0], testing::StartsWith("Search: hostile"));
+  EXPECT_THAT(seen[1], testing::StartsWith("2024-01-08 08:49"));
+  EXPECT_THAT(seen[2], testing::StartsWith("2023-01-08 08:49 b@example.org"));
+  EXPECT_EQ(seen[9].substr(0, 12), "────");
+  EXPECT_THAT(seen[23], testing::StartsWith("F1 help"));
+  EXPECT_THAT(seen[23], testing::EndsWith("1-2 of 2"));
+  for (const std::string& line : seen) {
+    EXPECT_EQ(cli::cleanForTerminal(line), line);
+    EXPECT_LE(cli::columnsTaken(line), 90u);
+  }
+  EXPECT_EQ(outputOf(tmux("display-message -p -t t '#{pane_title}'")).find("title"),
+            std::string::npos);
+  press("Down C-y");
+  await("copied ");
+  press("Enter");
+  await("q back");
+  press("Escape");
+  await("Search: hostile");
+  press("Escape");
+  expectRestored();
+}
+
+TEST_F(ScreenProcessTest, ADaemonThatGoesIsWaitedFor) {
+  index();
+  daemon->signal(SIGKILL);
+  daemon->wait();
+  open(80, 24);
+  type("oarlock");
+  await("tallowsearchd is not running; trying again");
+  startDaemon();
+  await("Oarlock fixed");
+  awaitGone("not running");
+  // Started anew between two keys, it is as if it had been there.
+  daemon->signal(SIGTERM);
+  daemon->wait();
+  startDaemon();
+  type(" fixed");
+  await("Search: oarlock fixed");
+  awaitGone("not running");
+  await("1-1 of 1");
+}
+
+TEST_F(ScreenProcessTest, TheTerminalIsGivenBack) {
+  index();
+  open(80, 24);
+  type("invoice");
+  await("Your invoice 4471");
+  press("C-z");
+  await("Stopped");
+  await("ready>");
+  press("C-l");
+  type("echo be''tween");
+  press("Enter");
+  await("\nbetween");
+  type("fg");
+  press("Enter");
+  await("Search: invoice");
+  await("Your invoice 4471");
+  press("C-c");
+  expectRestored();
+  for (const int signal : {SIGTERM, SIGHUP, SIGINT}) {
+    press("C-l");
+    type(program());
+    press("Enter");
+    await("Search:");
+    ASSERT_EQ(kill(process(), signal), 0);
+    expectRestored();
+  }
+}

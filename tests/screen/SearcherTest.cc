@@ -1,0 +1,188 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <clocale>
+#include <condition_variable>
+#include <filesystem>
+#include <fstream>
+#include <future>
+#include <mutex>
+
+#include "screen/MailLoader.h"
+#include "screen/Searcher.h"
+#include "tests/client/FakeDaemon.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using mailscreen::Failure;
+using mailscreen::Found;
+using mailscreen::Mail;
+using mailscreen::Search;
+using testing::HasSubstr;
+
+namespace {
+
+// Waits until a thread of the screen has something to take.
+class Bell {
+ public:
+  void ring() {
+    const std::lock_guard lock(_mutex);
+    _rung = true;
+    _changed.notify_one();
+  }
+  void wait() {
+    std::unique_lock lock(_mutex);
+    _changed.wait(lock, [this] { return std::exchange(_rung, false); });
+  }
+
+ private:
+  std::mutex _mutex;
+  std::condition_variable _changed;
+  bool _rung = false;
+};
+
+class SearcherTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    ASSERT_NE(std::setlocale(LC_CTYPE, "C.UTF-8"), nullptr);
+    setenv("XDG_STATE_HOME", (directory / "client").c_str(), 1);
+    setenv("XDG_CONFIG_HOME", (directory / "config").c_str(), 1);
+  }
+
+  [[nodiscard]] cli::Options options(const std::string& runtimeDirectory) const {
+    cli::Options options;
+    options.runtimeDirectory = runtimeDirectory;
+    return options;
+  }
+
+  Found find(mailscreen::Searcher& searcher, const Search& search) {
+    searcher.submit(search);
+    bell.wait();
+    return searcher.take().value_or(Found{});
+  }
+
+  const testsupport::TemporaryDirectory directory;
+  Bell bell;
+};
+
+// The daemon with the sample mail.
+class SampleSearchTest : public SearcherTest {
+ protected:
+  void SetUp() override {
+    SearcherTest::SetUp();
+    ASSERT_TRUE(daemon.ready());
+    std::filesystem::copy(TALLOW_SAMPLE_MAIL, mail, std::filesystem::copy_options::recursive);
+    index();
+  }
+  void index() const {
+    const std::string command = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory() +
+                                " index " + mail + " >/dev/null 2>&1";
+    ASSERT_EQ(std::system(command.c_str()), 0);
+  }
+  Found find(const Search& search) { return SearcherTest::find(searcher, search); }
+
+  const std::string mail = directory / "mail";
+  const testsupport::DaemonProcess daemon{directory.path()};
+  mailscreen::Searcher searcher{options(daemon.runtimeDirectory()), [this] { bell.ring(); }};
+};
+
+constexpr auto kRelevance = cli::SortOrder::relevance;
+
+}  // namespace
+
+TEST_F(SearcherTest, ADaemonThatIsNotThereIsAFailure) {
+  mailscreen::Searcher searcher(options(directory / "none"), [this] { bell.ring(); });
+  const Found found = find(searcher, {"words", "", kRelevance, false, 0, 10});
+  EXPECT_EQ(found.failure, Failure::unreachable);
+  EXPECT_EQ(found.reason, "tallowsearchd is not running");
+}
+
+TEST_F(SearcherTest, RefusalsAndUnreadableLinesHaveTheirReasons) {
+  testsupport::FakeDaemon fake;
+  mailscreen::Searcher searcher(options(fake.runtimeDirectory()), [this] { bell.ring(); });
+  fake.failOnce("SearchItemsForQuery", {"com.quill.tallow.TALIndexerManager", -2, "locked"});
+  Found found = find(searcher, {"words", "", kRelevance, false, 0, 10});
+  EXPECT_EQ(found.failure, Failure::refused);
+  EXPECT_THAT(found.reason, HasSubstr("device is locked"));
+  found = find(searcher, {"@bills", "", kRelevance, false, 0, 10});
+  EXPECT_EQ(found.failure, Failure::query);
+  EXPECT_THAT(found.reason, HasSubstr("there is no saved search \"bills\""));
+}
+
+// A daemon that does not answer does not hold up the end of the program.
+TEST_F(SearcherTest, TheEndDoesNotWaitForAnAnswer) {
+  testsupport::FakeDaemon fake;
+  std::promise<void> called;
+  std::promise<void> ended;
+  fake.answer("SearchItemsForQuery", [&](rpc::Reply& reply) {
+    called.set_value();
+    ended.get_future().wait();
+    reply.send({rpc::BytesArray{}});
+  });
+  {
+    mailscreen::Searcher searcher(options(fake.runtimeDirectory()), [] {});
+    searcher.submit({"words", "", kRelevance, false, 0, 10});
+    called.get_future().wait();
+  }
+  ended.set_value();
+}
+
+TEST_F(SampleSearchTest, RowsAreReadyToBeShown) {
+  const Found found = find({"\"corrected invoice\"", "", cli::SortOrder::date, false, 0, 2});
+  ASSERT_EQ(found.failure, Failure::none) << found.reason;
+  ASSERT_EQ(found.rows.size(), 2u);
+  const auto& row = found.rows[1];
+  EXPECT_EQ(mailscreen::toUTF8(row.date), "2024-01-11 10:03");
+  EXPECT_EQ(mailscreen::toUTF8(row.from), "Nordlys Energy");
+  EXPECT_THAT(mailscreen::toUTF8(row.subject), HasSubstr("\x02invoice\x01"));
+  EXPECT_EQ(row.folder, "archive");
+  EXPECT_EQ(row.path, mail + "/archive.mbox");
+  EXPECT_THAT(row.place, testing::StartsWith(row.path + ":"));
+  EXPECT_THAT(found.words, testing::ElementsAre("corrected", "invoice"));
+}
+
+TEST_F(SampleSearchTest, PagesThreadsFoldersAndSavedSearches) {
+  const Found all = find({"e", "", kRelevance, false, 0, 100});
+  const Found second = find({"e", "", kRelevance, false, 5, 5});
+  ASSERT_GT(all.rows.size(), 10u);
+  EXPECT_TRUE(all.complete);
+  ASSERT_EQ(second.rows.size(), 5u);
+  EXPECT_EQ(second.rows[0].identifier, all.rows[5].identifier);
+
+  const Found threads = find({"invoice 4471 ", "", kRelevance, true, 0, 10});
+  ASSERT_EQ(threads.rows.size(), 4u);
+  EXPECT_EQ(threads.total, 1u);
+  EXPECT_EQ(threads.rows[0].together, 4u);
+  EXPECT_TRUE(threads.rows[3].follows);
+
+  const Found folder = find({"e OR a", "drafts", kRelevance, false, 0, 100});
+  EXPECT_EQ(folder.rows.size(), 1u);
+  for (const auto& row : folder.rows) EXPECT_EQ(row.folder, "drafts");
+  EXPECT_EQ(find({"", "drafts", kRelevance, false, 0, 100}).rows.size(), 2u);
+
+  std::filesystem::create_directories(directory / "config/tallow");
+  std::ofstream(directory / "config/tallow/searches") << "toasts subject:toast\n";
+  EXPECT_EQ(find({"@toasts", "", kRelevance, false, 0, 10}).rows.size(), 1u);
+  EXPECT_EQ(find({"nothingofthekind @toasts", "", kRelevance, false, 0, 10}).rows.size(), 0u);
+}
+
+TEST_F(SampleSearchTest, MailsAreReadWithBounds) {
+  mailscreen::MailLoader loader(options(daemon.runtimeDirectory()), [this] { bell.ring(); });
+  const auto load = [&](const std::string& identifier, bool whole) {
+    loader.submit({identifier, {"lo"}, whole});
+    bell.wait();
+    return loader.take().value_or(Mail{});
+  };
+  const std::string path = mail + "/large.eml";
+  std::ofstream(path) << "Subject: large\n\n" << std::string(200000, 'x') << "\nlost at the end\n";
+  const std::string identifier = "file" + path;
+  const Mail beginning = load(identifier, false);
+  EXPECT_TRUE(beginning.cut);
+  EXPECT_LE(beginning.text.size(), mailscreen::MailLoader::kPreviewText);
+  const Mail whole = load(identifier, true);
+  EXPECT_FALSE(whole.cut);
+  EXPECT_THAT(mailscreen::toUTF8(whole.text), HasSubstr("\x02lost\x01 at the end"));
+  EXPECT_THAT(mailscreen::toUTF8(load(identifier + "-gone", false).text),
+              HasSubstr("No such file"));
+  EXPECT_THAT(mailscreen::toUTF8(load("other:1", false).text), HasSubstr("no message"));
+}
