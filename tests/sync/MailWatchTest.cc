@@ -1,6 +1,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
 
@@ -80,7 +81,7 @@ class MailWatchTest : public testing::Test {
   }
   // Time passes, in which a round that is due is run.
   void pass(std::chrono::milliseconds time) {
-    now += time;
+    now = std::max(now, mailsync::RescanPlan::Clock::now()) + time;
     entered = 0;
     watch->turn(now);
   }
