@@ -17,17 +17,17 @@ class BatchPace {
  public:
   static constexpr std::chrono::milliseconds kWork{50};
   static constexpr size_t kFirst = 20;  // before there is a reply
-  static constexpr size_t kFewest = 5;
-  static constexpr size_t kMost = 500;
+  static constexpr size_t kMin = 5;
+  static constexpr size_t kMax = 500;
 
   [[nodiscard]] size_t items() const {
     if (!_perItem) return kFirst;
-    return std::clamp(static_cast<size_t>(Seconds(kWork) / *_perItem), kFewest, kMost);
+    return std::clamp(static_cast<size_t>(Seconds(kWork) / *_perItem), kMin, kMax);
   }
 
   void replied(size_t items, std::chrono::nanoseconds took) {
     if (items == 0) return;
-    const Seconds seen = std::max<Seconds>(Seconds(took) / static_cast<double>(items), kShortest);
+    const Seconds seen = std::max<Seconds>(Seconds(took) / static_cast<double>(items), kMinPerItem);
     _perItem = _perItem ? std::min(seen, *_perItem * kRise) : seen;
   }
 
@@ -35,7 +35,7 @@ class BatchPace {
   using Seconds = std::chrono::duration<double>;
 
   static constexpr double kRise = 1.1;
-  static constexpr Seconds kShortest{1e-6};
+  static constexpr Seconds kMinPerItem{1e-6};
 
   std::optional<Seconds> _perItem;
 };

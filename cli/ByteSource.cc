@@ -19,7 +19,7 @@ namespace {
 constexpr size_t kBufferBytes = size_t{64} << 10;
 
 // Enough for what xz -9 makes; a file that asks for more is refused.
-constexpr uint64_t kMaximumDecoderBytes = uint64_t{160} << 20;
+constexpr uint64_t kMaxDecoderBytes = uint64_t{160} << 20;
 
 constexpr const char* kCompressionDomain = "compression";
 constexpr const char* kEndsEarly = "the compressed data ends early";
@@ -140,7 +140,7 @@ class GzipSource final : public ByteSource {
 class XzSource final : public ByteSource {
  public:
   explicit XzSource(std::unique_ptr<FileSource> file) : _file(std::move(file)) {
-    _state = lzma_stream_decoder(&_stream, kMaximumDecoderBytes, LZMA_CONCATENATED);
+    _state = lzma_stream_decoder(&_stream, kMaxDecoderBytes, LZMA_CONCATENATED);
   }
   ~XzSource() override { lzma_end(&_stream); }
 

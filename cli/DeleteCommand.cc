@@ -53,7 +53,7 @@ class Deleting {
     for (size_t i = identifiers.size(); i > 0; --i) {
       const auto location = parseIdentifier(identifiers[i - 1]);
       if (!location || !location->offset) continue;
-      const auto message = reader.read(identifiers[i - 1], kMaximumMessageBytes, nullptr);
+      const auto message = reader.read(identifiers[i - 1], kMaxMessageBytes, nullptr);
       if (!message) continue;
       identifiers.push_back(mboxIdentifier(location->path, mailsync::messageDigest(*message)));
     }

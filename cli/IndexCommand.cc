@@ -164,7 +164,7 @@ class Indexing {
 std::optional<std::string> readStandardInput() {
   std::string text;
   std::array<char, 65536> buffer;
-  while (text.size() <= kMaximumMessageBytes) {
+  while (text.size() <= kMaxMessageBytes) {
     const ssize_t count = read(STDIN_FILENO, buffer.data(), buffer.size());
     if (count < 0 && errno == EINTR) continue;
     if (count < 0) return std::nullopt;
@@ -178,8 +178,8 @@ std::optional<std::string> readStandardInput() {
 // named by its content.
 ExitStatus indexStandardInput(const Options& options) {
   const auto text = readStandardInput();
-  if (!text || text->size() > kMaximumMessageBytes) {
-    complain(text ? fmt::format("the message is longer than {} MiB", kMaximumMessageBytes >> 20)
+  if (!text || text->size() > kMaxMessageBytes) {
+    complain(text ? fmt::format("the message is longer than {} MiB", kMaxMessageBytes >> 20)
                   : std::string("the standard input cannot be read"));
     return ExitStatus::failure;
   }

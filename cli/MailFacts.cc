@@ -100,7 +100,7 @@ std::optional<uint64_t> MailFacts::size(const std::string& identifier) {
                      !location->path.ends_with(".xz");
   if (plain && stat(location->path.c_str(), &info) == 0) return static_cast<uint64_t>(info.st_size);
   std::optional<TLError> error;
-  const auto message = _reader.read(identifier, kMaximumMessageBytes, &error);
+  const auto message = _reader.read(identifier, kMaxMessageBytes, &error);
   if (message) return message->size();
   ++_unreadable;
   return std::nullopt;
@@ -108,7 +108,7 @@ std::optional<uint64_t> MailFacts::size(const std::string& identifier) {
 
 std::shared_ptr<TLIndexableItem> MailFacts::item(const std::string& identifier) {
   std::optional<TLError> error;
-  const auto message = _reader.read(identifier, kMaximumMessageBytes, &error);
+  const auto message = _reader.read(identifier, kMaxMessageBytes, &error);
   if (message) {
     auto parsed = _parser.parse(*message, {identifier, "", ""});
     if (auto* const good = std::get_if<ParsedMessage>(&parsed)) return std::move(good->item);

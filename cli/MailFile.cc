@@ -158,7 +158,7 @@ class Reader {
   }
 
   void append(std::string_view bytes) {
-    _tooLong = _tooLong || _message.size() + bytes.size() > kMaximumMessageBytes;
+    _tooLong = _tooLong || _message.size() + bytes.size() > kMaxMessageBytes;
     if (!_tooLong) _message.append(bytes);
   }
 
@@ -167,7 +167,7 @@ class Reader {
   bool finish(const MessageOrigin& origin, const std::string& where, bool last) {
     bool goOn;
     if (_tooLong) {
-      goOn = _sink.failure(where, fmt::format("longer than {} MiB", kMaximumMessageBytes >> 20));
+      goOn = _sink.failure(where, fmt::format("longer than {} MiB", kMaxMessageBytes >> 20));
     } else if (last && _lines.error()) {
       goOn = _sink.failure(where, _lines.error()->message);
     } else {

@@ -11,7 +11,7 @@
 namespace cli {
 
 // The longest message that is read; a longer one is reported and passed over.
-inline constexpr size_t kMaximumMessageBytes = size_t{64} << 20;
+inline constexpr size_t kMaxMessageBytes = size_t{64} << 20;
 
 // Where a message comes from.
 struct MessageOrigin {

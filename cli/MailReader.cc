@@ -147,7 +147,7 @@ std::optional<std::string> MailReader::read(const std::string& identifier, size_
   LineReader lines(std::move(source));
   std::optional<std::string> message;
   if (location->message) {
-    message = readMboxMessage(lines, kMaximumMessageBytes, error);
+    message = readMboxMessage(lines, kMaxMessageBytes, error);
     if (message && !isNamedBy(*message, *location->message)) {
       platform::setError(error, moved("the mailbox has changed since the last sync"));
       return std::nullopt;

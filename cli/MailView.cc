@@ -9,7 +9,7 @@ namespace cli {
 
 namespace {
 
-constexpr size_t kMaxHTMLText = kMaximumBodyBytes;
+constexpr size_t kMaxHTMLText = kMaxBodyBytes;
 
 bool isType(GMimeObject* object, const char* type, const char* subtype) {
   GMimeContentType* const found = g_mime_object_get_content_type(object);
@@ -95,7 +95,7 @@ std::unique_ptr<MailView> MailView::parse(std::string_view bytes) {
 
 MailView::MailView(Object<GMimeMessage> message) : _message(std::move(message)) {
   std::vector<Pending> pending{{g_mime_message_get_mime_part(_message.get()), true}};
-  for (size_t count = 0; !pending.empty() && count < kMaximumParts; ++count) {
+  for (size_t count = 0; !pending.empty() && count < kMaxParts; ++count) {
     const auto [object, read] = pending.back();
     pending.pop_back();
     if (object == nullptr) continue;
@@ -104,7 +104,7 @@ MailView::MailView(Object<GMimeMessage> message) : _message(std::move(message)) 
       const int chosen =
           read && isType(object, "multipart", "alternative") ? chosenOf(multipart) : -1;
       const int children =
-          std::min(g_mime_multipart_get_count(multipart), static_cast<int>(kMaximumParts));
+          std::min(g_mime_multipart_get_count(multipart), static_cast<int>(kMaxParts));
       for (int i = children - 1; i >= 0; --i) {
         pending.push_back(
             {g_mime_multipart_get_part(multipart, i), read && (chosen < 0 || chosen == i)});
@@ -120,8 +120,7 @@ MailView::MailView(Object<GMimeMessage> message) : _message(std::move(message)) 
 
 // The plain text, else the last that is HTML or holds it, else the last.
 int MailView::chosenOf(GMimeMultipart* alternatives) {
-  const int count =
-      std::min(g_mime_multipart_get_count(alternatives), static_cast<int>(kMaximumParts));
+  const int count = std::min(g_mime_multipart_get_count(alternatives), static_cast<int>(kMaxParts));
   int chosen = count - 1;
   bool holdsHTML = false;
   for (int i = count - 1; i >= 0; --i) {
@@ -160,13 +159,13 @@ TLString MailView::readable(GMimePart* part) {
 std::string MailView::text() {
   TLString joined;
   for (GMimePart* const part : _texts) {
-    if (joined.size() > kMaximumBodyBytes) {
+    if (joined.size() > kMaxBodyBytes) {
       _complete = false;
       break;
     }
     if (!joined.empty() && joined.back() != u'\n') joined.push_back(u'\n');
     joined += readable(part);
-    if (contentOf(part).size() > kMaximumBodyBytes) _complete = false;
+    if (contentOf(part).size() > kMaxBodyBytes) _complete = false;
   }
   return platform::toUTF8(joined);
 }

@@ -14,7 +14,7 @@
 namespace cli {
 
 // A message as a person reads it. All texts are as the mail has them, so unfit for a terminal.
-// Parts beyond kMaximumParts are left out; all walks are loops. One thread.
+// Parts beyond kMaxParts are left out; every traversal is a loop. One thread.
 class MailView {
  public:
   // A longer value of a header field is cut, and ends with "…". UTF-16 units.

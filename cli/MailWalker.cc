@@ -63,9 +63,9 @@ bool walkMail(const std::string& path, const WalkVisitor& visitor) {
     const Directory directory = std::move(pending.back());
     pending.pop_back();
     const bool goOn =
-        directory.depth > kMaximumDirectoryDepth
+        directory.depth > kMaxDirectoryDepth
             ? visitor.failure(directory.path,
-                              fmt::format("more than {} directories deep", kMaximumDirectoryDepth))
+                              fmt::format("more than {} directories deep", kMaxDirectoryDepth))
             : visitDirectory(directory, visitor, pending);
     if (!goOn) return false;
   }

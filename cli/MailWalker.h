@@ -7,7 +7,7 @@
 namespace cli {
 
 // How deep directories are entered below the one that was named.
-inline constexpr size_t kMaximumDirectoryDepth = 64;
+inline constexpr size_t kMaxDirectoryDepth = 64;
 
 // What a walk finds. Results are false to stop it.
 struct WalkVisitor {

@@ -62,14 +62,14 @@ void addLeaf(GMimePart* part, Leaves& leaves) {
 Leaves leavesOf(GMimeMessage* message) {
   Leaves leaves;
   std::vector<GMimeObject*> pending{g_mime_message_get_mime_part(message)};
-  for (size_t count = 0; !pending.empty() && count < kMaximumParts; ++count) {
+  for (size_t count = 0; !pending.empty() && count < kMaxParts; ++count) {
     GMimeObject* const object = pending.back();
     pending.pop_back();
     if (object == nullptr) continue;
     if (GMIME_IS_MULTIPART(object)) {
       GMimeMultipart* const multipart = GMIME_MULTIPART(object);
       const int children =
-          std::min(g_mime_multipart_get_count(multipart), static_cast<int>(kMaximumParts));
+          std::min(g_mime_multipart_get_count(multipart), static_cast<int>(kMaxParts));
       for (int i = children; i > 0; --i) {
         pending.push_back(g_mime_multipart_get_part(multipart, i - 1));
       }
@@ -91,7 +91,7 @@ Leaves leavesOf(GMimeMessage* message) {
 TLString joinedText(const std::vector<GMimePart*>& parts, TextDecoder& decoder) {
   TLString joined;
   for (GMimePart* part : parts) {
-    if (joined.size() > kMaximumBodyBytes) break;
+    if (joined.size() > kMaxBodyBytes) break;
     if (!joined.empty() && joined.back() != u'\n') joined.push_back(u'\n');
     joined += textOf(part, decoder);
   }

@@ -12,10 +12,10 @@
 namespace cli {
 
 // How many MIME parts of a message are looked at.
-inline constexpr size_t kMaximumParts = 10000;
+inline constexpr size_t kMaxParts = 10000;
 
 // How much of a body is decoded. More never fits into the index.
-inline constexpr size_t kMaximumBodyBytes = size_t{1} << 20;
+inline constexpr size_t kMaxBodyBytes = size_t{1} << 20;
 
 struct ParsedMessage {
   std::shared_ptr<TLIndexableItem> item;

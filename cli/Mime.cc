@@ -58,7 +58,7 @@ TLString textOf(GMimePart* part, TextDecoder& decoder) {
     return orEmpty(g_mime_object_get_content_type_parameter(GMIME_OBJECT(part), name));
   };
   TLString text =
-      decoder.decode(std::string_view(content).substr(0, kMaximumBodyBytes), parameter("charset"));
+      decoder.decode(std::string_view(content).substr(0, kMaxBodyBytes), parameter("charset"));
   if (!equalIgnoringCase(parameter("format"), "flowed")) return text;
   return unflow(text, equalIgnoringCase(parameter("delsp"), "yes"));
 }

@@ -42,7 +42,7 @@ void initMIME();
 // The content of a part without its transfer encoding.
 [[nodiscard]] std::string contentOf(GMimePart* part);
 
-// The text of a part, of which kMaximumBodyBytes are decoded.
+// The text of a part, of which kMaxBodyBytes are decoded.
 [[nodiscard]] TLString textOf(GMimePart* part, TextDecoder& decoder);
 
 }  // namespace cli

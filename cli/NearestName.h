@@ -10,11 +10,11 @@ namespace cli {
 // more than two mistakes away.
 template <typename Rows>
 [[nodiscard]] const char* nearestName(std::string_view word, const Rows& rows) {
-  constexpr float kMostMistakes = 2;
+  constexpr float kMaxMistakes = 2;
   float least = 0.6F;
   const char* nearest = nullptr;
   for (const auto& row : rows) {
-    const float distance = weightedDistance(word, row.name, kMostMistakes, 1);
+    const float distance = weightedDistance(word, row.name, kMaxMistakes, 1);
     if (distance >= least) continue;
     least = distance;
     nearest = row.name;

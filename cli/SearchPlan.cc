@@ -25,7 +25,7 @@ using NodePointer = std::shared_ptr<TLQueryNode>;
 
 // A search below this score would lose words that stand in addresses only, of which each counts a
 // tenth.
-constexpr float kLowestScore = 1e-37F;
+constexpr float kMinScore = 1e-37F;
 
 constexpr std::array<const char*, 3> kModifications{"queryModification.enableSpellModification",
                                                     "queryModification.enableSynonymModification",
@@ -190,7 +190,7 @@ class BranchBuilder {
     if (root->childsCount() > 0) query->setRoot(root);
     if (_parameters != nullptr) query->setSearchParams(_parameters->copyWithZone());
     addParameterRecord(*query, TLParamsManager::tlParamKeyValueWithKeyFloatValue(
-                                   u"salt.scoreThreshold", kLowestScore));
+                                   u"salt.scoreThreshold", kMinScore));
     for (const char* const key : kModifications) {
       if (_modified) break;
       addParameterRecord(

@@ -21,9 +21,9 @@ namespace cli {
 
 namespace {
 
-constexpr size_t kMaximumFileBytes = size_t{1} << 20;
-constexpr uint64_t kSmallestLimit = 1000;
-constexpr uint64_t kLargestLimit = kMaximumMessageBytes;
+constexpr size_t kMaxFileBytes = size_t{1} << 20;
+constexpr uint64_t kMinLimit = 1000;
+constexpr uint64_t kMaxLimit = kMaxMessageBytes;
 
 // Reads the value of one key. False where it is not one that is allowed.
 class Reader {
@@ -65,7 +65,7 @@ class Reader {
     const auto bytes = number && *number > 0 ? std::optional(static_cast<uint64_t>(*number))
                        : text                ? bytesOf(*text)
                                              : std::nullopt;
-    if (!bytes || *bytes < kSmallestLimit || *bytes > kLargestLimit) return false;
+    if (!bytes || *bytes < kMinLimit || *bytes > kMaxLimit) return false;
     _settings.largestMail = *bytes;
     return true;
   }
@@ -99,7 +99,7 @@ class Reader {
     uint64_t number = 0;
     const char* const end = text.data() + text.size();
     const auto [rest, failure] = std::from_chars(text.data(), end, number);
-    if (failure != std::errc() || number > kLargestLimit) return std::nullopt;
+    if (failure != std::errc() || number > kMaxLimit) return std::nullopt;
     std::string unit(rest, end);
     unit.erase(0, unit.find_first_not_of(' '));
     if (unit == "KB") return number * 1000;
@@ -184,7 +184,7 @@ std::variant<Settings, std::string> parseSettings(std::string_view text, const s
 std::variant<Settings, std::string> readSettings() {
   const std::string path = settingsPath();
   std::optional<TLError> error;
-  const auto text = platform::readFile(path, kMaximumFileBytes, &error);
+  const auto text = platform::readFile(path, kMaxFileBytes, &error);
   if (text) return parseSettings(*text, path, variable("HOME"));
   if (error->code == ENOENT) return Settings();
   return error->message;

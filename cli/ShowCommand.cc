@@ -65,7 +65,7 @@ std::optional<Wanted> wantedMessage(const std::string& argument, ExitStatus& sta
 
 std::optional<std::string> readMessage(const std::string& identifier, MailReader& reader) {
   std::optional<TLError> error;
-  auto message = readSingleMessage(identifier, kMaximumMessageBytes, reader, &error);
+  auto message = readSingleMessage(identifier, kMaxMessageBytes, reader, &error);
   if (!message) complain(fmt::format("{}: {}", identifier, error->message));
   return message;
 }

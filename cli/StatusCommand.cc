@@ -25,7 +25,7 @@ namespace {
 
 constexpr size_t kBarColumns = 20;
 constexpr size_t kShownProblems = 20;  // in text
-constexpr size_t kMostProblems = 10000;
+constexpr size_t kMaxProblems = 10000;
 constexpr size_t kLockStatusBytes = 64;
 constexpr int kSchema = 1;  // of the JSON
 
@@ -150,7 +150,7 @@ nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue, const std::optional<i
                        {"missing", count.missing}});
   }
   nlohmann::json problems = nlohmann::json::array();
-  for (const mailsync::Problem& problem : catalogue.problems(kMostProblems)) {
+  for (const mailsync::Problem& problem : catalogue.problems(kMaxProblems)) {
     problems.push_back({{"path", problem.path}, {"reason", problem.reason}});
   }
   return {{"lastSync", last ? nlohmann::json(timeText(*last)) : nlohmann::json()},

@@ -21,7 +21,7 @@ using Key = TLAttributeKey;
 // What the index keeps of a text from a word on: up to the first space from here on, and never more
 // than the second.
 constexpr size_t kKeptBytes = 32;
-constexpr size_t kMostKeptBytes = 100;
+constexpr size_t kMaxKeptBytes = 100;
 
 const tokenizer::Tokenizer& words() {
   static const auto tokenizer = tokenizer::NewFastLexemonTokenizer(bestLexemonLocale());
@@ -144,7 +144,7 @@ bool mayGoOn(const Node& node) {
 bool isCutInIndex(const Node& node) {
   const std::string text = indexedWords(node);
   const size_t space = text.find(' ', std::min(kKeptBytes, text.size()));
-  return text.size() > kMostKeptBytes || (space != std::string::npos && space + 1 < text.size());
+  return text.size() > kMaxKeptBytes || (space != std::string::npos && space + 1 < text.size());
 }
 
 std::vector<Node> wordlessNodes(const Node& tree) {

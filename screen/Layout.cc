@@ -6,9 +6,9 @@ namespace mailscreen {
 
 namespace {
 
-constexpr size_t kWide = 100;       // columns from which on the preview stands beside the list
-constexpr size_t kHigh = 9;         // rows from which on there is one below it
-constexpr size_t kLeastListed = 4;  // rows
+constexpr size_t kWide = 100;     // columns from which on the preview stands beside the list
+constexpr size_t kHigh = 9;       // rows from which on there is one below it
+constexpr size_t kMinListed = 4;  // rows
 
 }  // namespace
 
@@ -27,7 +27,7 @@ Layout layoutOf(size_t rows, size_t columns) {
     layout.rule = {1, listed, body, 1};
     layout.preview = {1, listed + 2, body, columns - listed - 2};
   } else if (body >= kHigh) {
-    const size_t listed = std::max(kLeastListed, body * 2 / 5);
+    const size_t listed = std::max(kMinListed, body * 2 / 5);
     layout.list.rows = listed;
     layout.rule = {1 + listed, 0, 1, columns};
     layout.preview = {2 + listed, 0, body - listed - 1, columns};

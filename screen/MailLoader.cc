@@ -32,7 +32,7 @@ Mail MailLoader::load(const MailRequest& request) {
   Mail mail{request, {}};
   _reader.refresh();
   std::optional<TLError> error;
-  const size_t most = request.whole ? cli::kMaximumMessageBytes : kPreviewBytes;
+  const size_t most = request.whole ? cli::kMaxMessageBytes : kPreviewBytes;
   const auto bytes = cli::readSingleMessage(request.identifier, most, _reader, &error);
   const auto view = bytes ? cli::MailView::parse(*bytes) : nullptr;
   if (view == nullptr) {

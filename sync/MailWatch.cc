@@ -16,7 +16,7 @@ namespace mailsync {
 
 namespace {
 
-constexpr size_t kMostSaid = 1000;
+constexpr size_t kMaxReported = 1000;
 
 std::string above(const std::string& path) {
   const size_t slash = path.rfind('/');
@@ -217,7 +217,7 @@ void MailWatch::tellFailure(const std::optional<TLError>& error) {
 }
 
 void MailWatch::sayOnce(const std::string& line) {
-  if (_said.size() >= kMostSaid || !_said.insert(line).second) return;
+  if (_said.size() >= kMaxReported || !_said.insert(line).second) return;
   _observer.say(line);
 }
 

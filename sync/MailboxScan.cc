@@ -133,9 +133,9 @@ void MailboxScan::scanDirectory(const Place& place, std::vector<Place>& pending)
   }
   if (!there || !S_ISDIR(info.st_mode)) return noteMissing(place.path);
   ++_counts.directories;
-  if (place.depth > cli::kMaximumDirectoryDepth) {
+  if (place.depth > cli::kMaxDirectoryDepth) {
     _settings.complain(place.path,
-                       fmt::format("more than {} directories deep", cli::kMaximumDirectoryDepth));
+                       fmt::format("more than {} directories deep", cli::kMaxDirectoryDepth));
     ++_counts.unreadable;
     return;
   }

@@ -16,7 +16,7 @@ void RescanPlan::note(Time now) {
 void RescanPlan::changed(const std::string& place, Time now) {
   note(now);
   if (!_pending.everything) _pending.places.insert(place);
-  if (_pending.places.size() > kMostPlaces) lost(now);
+  if (_pending.places.size() > kMaxPlaces) lost(now);
 }
 
 void RescanPlan::lost(Time now) {

@@ -25,7 +25,7 @@ class RescanPlan {
   static constexpr std::chrono::milliseconds kFirstRetry{250};
   static constexpr std::chrono::milliseconds kLastRetry{60000};
   // More places than this are one round over everything.
-  static constexpr size_t kMostPlaces = 10000;
+  static constexpr size_t kMaxPlaces = 10000;
 
   struct Round {
     bool everything = false;

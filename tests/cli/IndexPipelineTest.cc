@@ -79,7 +79,7 @@ TEST(BatchPaceTest, FollowsTheQuickRepliesAndForgetsTheLateOnes) {
   for (int i = 0; i < 20; ++i) pace.replied(100, milliseconds(1000));
   EXPECT_EQ(pace.items(), 15u);  // the mails are larger now
   for (int i = 0; i < 100; ++i) pace.replied(10, milliseconds(5000));
-  EXPECT_EQ(pace.items(), cli::BatchPace::kFewest);
+  EXPECT_EQ(pace.items(), cli::BatchPace::kMin);
   pace.replied(5, milliseconds(0));
-  EXPECT_EQ(pace.items(), cli::BatchPace::kMost);
+  EXPECT_EQ(pace.items(), cli::BatchPace::kMax);
 }

@@ -145,7 +145,7 @@ TEST_F(MailFileTest, LinesLongerThanTheBufferStayWhole) {
 
 TEST_F(MailFileTest, AMessageBeyondTheBoundIsReportedAndTheNextIsRead) {
   std::string big = kFrom + "A: a\n\n";
-  big.append(cli::kMaximumMessageBytes, 'x');
+  big.append(cli::kMaxMessageBytes, 'x');
   readBytes(big + "\n\n" + kFrom + "B: b\n\ntwo\n");
   EXPECT_THAT(failures, ElementsAre("box:0: longer than 64 MiB"));
   EXPECT_THAT(messages, ElementsAre("B: b\n\ntwo\n"));
@@ -263,7 +263,7 @@ TEST_F(MailFileTest, TheWalkVisitsEachFileOnceAndFollowsNoLoop) {
 
 TEST_F(MailFileTest, TheWalkEndsAtItsDepth) {
   std::string deep = directory.path();
-  for (size_t i = 0; i < cli::kMaximumDirectoryDepth + 3; ++i) deep += "/d";
+  for (size_t i = 0; i < cli::kMaxDirectoryDepth + 3; ++i) deep += "/d";
   platform::createDirectories(deep, nullptr);
   int failed = 0;
   cli::walkMail(directory.path(), {[](const std::string&, bool, uint64_t) { return true; },

@@ -44,7 +44,7 @@ class MailServerTest : public testsupport::WatchProcessTest {
     std::ofstream(directory / name) << text;
   }
   [[nodiscard]] std::string textOf(const std::string& name) const {
-    return platform::readFile(directory / name, kMaximumLog, nullptr).value_or("");
+    return platform::readFile(directory / name, kMaxLog, nullptr).value_or("");
   }
   [[nodiscard]] std::string serverCommand() const {
     return fmt::format("{0} -c {1}/server.conf 2>>{1}/server.log", kServer, directory.path());

@@ -98,6 +98,6 @@ TEST_F(RescanPlanTest, WhatIsNotWatchedIsLookedAtInIntervals) {
 }
 
 TEST_F(RescanPlanTest, TooManyPlacesAreEverything) {
-  for (size_t i = 0; i <= RescanPlan::kMostPlaces; ++i) plan.changed(std::to_string(i), at(0));
+  for (size_t i = 0; i <= RescanPlan::kMaxPlaces; ++i) plan.changed(std::to_string(i), at(0));
   EXPECT_EQ(take(50), Places{"*"});
 }

@@ -32,7 +32,7 @@ namespace testsupport {
 // `tallow watch` as a process of its own, beside the daemon, over a mailbox of the test's own.
 class WatchProcessTest : public testing::Test {
  protected:
-  static constexpr size_t kMaximumLog = size_t{16} << 20;
+  static constexpr size_t kMaxLog = size_t{16} << 20;
 
   WatchProcessTest() {
     makeFolder("a");
@@ -99,7 +99,7 @@ class WatchProcessTest : public testing::Test {
     std::filesystem::rename(base + "/tmp/" + name, base + "/new/" + name);
   }
   [[nodiscard]] std::string log() const {
-    return platform::readFile(logPath, kMaximumLog, nullptr).value_or("");
+    return platform::readFile(logPath, kMaxLog, nullptr).value_or("");
   }
   [[nodiscard]] std::set<std::string> indexed() const {
     client::SearchServiceProxy service(daemon->runtimeDirectory());
