@@ -46,7 +46,7 @@ DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS root; DROP TABLE IF EXISTS di
 DROP TABLE IF EXISTS file; DROP TABLE IF EXISTS message; DROP TABLE IF EXISTS deletion;
 )";
 
-// How many acknowledged deletions are remembered, for a daemon that is set back.
+// Acknowledged deletions to keep, in case the daemon's data is restored to an older state.
 constexpr int64_t kKeptDeletions = 100000;
 
 std::string randomName() {
@@ -446,12 +446,12 @@ void Catalogue::adopt(const std::vector<std::string>& identifiersInIndex, int64_
   for (const std::string& identifier : identifiersInIndex) {
     sql("INSERT OR IGNORE INTO present VALUES (?)").bindText(identifier).run();
   }
-  // What went out later is there in one version or another.
+  // Messages sent after that are in the index in some version.
   sql("UPDATE message SET replace = 1 WHERE sequence > ? AND sequence < 9223372036854775807")
       .bind(std::min(trusted, _acknowledged))
       .run();
-  // From here on an older state of the daemon tells nothing: what it had then and what has gone
-  // since is not known any more.
+  // From now on an older state of the daemon cannot be used: what the daemon had then, and what was
+  // deleted since, is no longer known.
   setAcknowledged(highestSequence() + 1);
   setValue("horizon", std::to_string(_acknowledged));
   sql("UPDATE message SET sequence = 9223372036854775807, "
@@ -466,7 +466,7 @@ void Catalogue::adopt(const std::vector<std::string>& identifiersInIndex, int64_
   sql("INSERT INTO deletion SELECT identifier, 9223372036854775807 FROM present "
       "WHERE identifier NOT IN (SELECT identifier FROM message WHERE sequence >= 0)")
       .run();
-  _statements.clear();  // of the table that goes
+  _statements.clear();  // of the table to be dropped
   _database->execute("DROP TABLE present");
 }
 

@@ -12,18 +12,19 @@
 
 namespace mailsync {
 
-// The last batch that a message went out with. Batches are numbered from 1 and never number less
-// than before. A message is in the index when its number is at most the catalogue's `acknowledged`;
-// a larger one is to be sent.
-inline constexpr int64_t kWaiting = std::numeric_limits<int64_t>::max();  // never sent as it is now
-inline constexpr int64_t kFailed = -1;  // not to be sent; `problem` tells why
+// The last batch in which a message was sent. Batches are numbered from 1, and numbers never
+// decrease. A message is in the index if its number is at most the catalogue's `acknowledged`; if
+// it is larger, the message must be sent.
+inline constexpr int64_t kWaiting =
+    std::numeric_limits<int64_t>::max();  // not yet sent in its current version
+inline constexpr int64_t kFailed = -1;    // not to be sent; `problem` says why
 
 enum class FileKind : int64_t {
   maildir = 0,  // one message, identified by folder and name without flags
   single = 1,   // one message, identified by its path
   mbox = 2,
-  other = 3,  // no mail
-  alias = 4,  // another path to a file that the catalogue has
+  other = 3,  // not mail
+  alias = 4,  // another path to a file in the catalogue
 };
 
 struct DirectoryRow {
@@ -31,9 +32,9 @@ struct DirectoryRow {
   int64_t parent = 0;  // 0 for a root
   std::string path;    // canonical
   int64_t inode = 0;
-  int64_t modified = 0;  // nanoseconds since 1970, as of the last look into it
-  bool settled = false;  // that time was old enough to tell the next change
-  bool plain = false;    // has files other than those of a Maildir, which are looked at each time
+  int64_t modified = 0;  // nanoseconds since 1970, when it was last listed
+  bool settled = false;  // `modified` was old enough that the next change will alter it
+  bool plain = false;    // has files outside of a Maildir, which are checked in every run
   bool missing = false;
 };
 
@@ -43,11 +44,11 @@ struct FileRow {
   std::string name;
   int64_t inode = 0;
   int64_t size = 0;
-  int64_t modified = 0;  // nanoseconds since 1970; -1 to have it looked at again
+  int64_t modified = 0;  // nanoseconds since 1970; -1 forces another check
   FileKind kind = FileKind::other;
 };
 
-// Whether a file looks as it did: its content is taken for the same then.
+// Whether a file's metadata is unchanged; its content is then assumed to be unchanged.
 [[nodiscard]] inline bool sameState(const FileRow& a, const FileRow& b) {
   return a.inode == b.inode && a.size == b.size && a.modified == b.modified;
 }
@@ -56,21 +57,21 @@ struct MessageRow {
   int64_t id = 0;
   int64_t file = 0;
   std::string identifier;
-  std::string digest;   // of the content; empty until it was read
+  std::string digest;   // of the content; empty until it has been read
   int64_t offset = -1;  // in an mbox file
-  std::string flags;    // letters of a Maildir, in order
+  std::string flags;    // Maildir letters, sorted
   int64_t sequence = kWaiting;
-  bool replace = false;  // an older version is in the index, or may be
+  bool replace = false;  // an older version is or may be in the index
 };
 
-// A message to send, with the file that holds it.
+// A message to send, and the file that contains it.
 struct WaitingMessage {
   MessageRow message;
   FileKind kind = FileKind::other;
   std::string path;
 };
 
-// What became of a folder's messages.
+// The states of a folder's messages.
 struct FolderCount {
   std::string path;
   int64_t messages = 0;
@@ -86,7 +87,7 @@ struct Problem {
   std::string reason;
 };
 
-// Where a message lies at present.
+// The current place of a message.
 struct MessagePlace {
   std::string path;
   std::optional<int64_t> offset;
@@ -94,34 +95,34 @@ struct MessagePlace {
   bool indexed = false;
 };
 
-// What is known of the mail below some roots: where it lies, how its files looked, and with which
-// batch each message went to the daemon. One process at a time writes (see MailSync); others may
-// read. One thread.
+// The known state of the mail below some roots: where each message is, the metadata of its file,
+// and the batch in which it was sent to the daemon. One process at a time writes (see MailSync);
+// others may read. One thread.
 //
-// The first failure of the database stays in `failure`; everything after it has no effect that
-// counts, since a transaction with a failure is never committed.
+// The first failure of the database is kept in `failure`. Later calls have no lasting effect,
+// because a transaction with a failure is never committed.
 class Catalogue {
  public:
-  // Null with an error where it cannot be opened; of another schema, it starts afresh.
+  // Null with an error if it cannot be opened. A catalogue with another schema is emptied.
   [[nodiscard]] static std::unique_ptr<Catalogue> open(const std::string& path, TLErrorOut error);
 
   [[nodiscard]] const std::optional<TLError>& failure() const { return _database->failure(); }
   void begin() { _database->execute("BEGIN IMMEDIATE"); }
-  // False, with everything since `begin` undone, after a failure.
+  // False after a failure; everything since `begin` is then rolled back.
   bool commit();
   void rollback() { _database->execute("ROLLBACK"); }
 
-  // A random name, made with the catalogue.
+  // A random name, chosen when the catalogue was created.
   [[nodiscard]] const std::string& id() const { return _id; }
   [[nodiscard]] int64_t acknowledged() const { return _acknowledged; }
   void setAcknowledged(int64_t sequence);
-  // The highest number that any row has, at least `acknowledged`.
+  // The highest batch number of any row; at least `acknowledged`.
   [[nodiscard]] int64_t highestSequence();
-  // Deletions up to this number are forgotten.
+  // Deletions up to this batch number have been forgotten.
   [[nodiscard]] int64_t horizon();
   void forgetOldDeletions();
-  // All that the daemon has acknowledged, also in the bytes of the file. Not between `begin` and
-  // `commit`. A daemon that is set back afterwards is asked for what it holds.
+  // Removes all acknowledged deletions, including their bytes in the file. Not between `begin` and
+  // `commit`. If the daemon is later restored to an older state, it must be asked for its contents.
   bool forgetDeletions();
   [[nodiscard]] std::string value(const char* key);
   void setValue(const char* key, const std::string& value);
@@ -142,27 +143,28 @@ class Catalogue {
   [[nodiscard]] std::optional<FileRow> file(int64_t id);
   int64_t addFile(const FileRow& row);
   void updateFile(const FileRow& row);
-  // With its messages, which are noted as deletions where they may be in the index.
+  // Also removes its messages; those that may be in the index become deletions.
   void removeFile(int64_t id);
 
   [[nodiscard]] std::vector<MessageRow> messagesOf(int64_t file);
   [[nodiscard]] std::optional<MessageRow> messageWithIdentifier(const std::string& identifier);
   void addMessage(const MessageRow& row);
-  // Of an mbox file, whose messages move; and flags, which are in a file's name.
+  // Updates the offset in an mbox file and the flags, which may change without the content.
   void setPlace(int64_t message, int64_t offset, const std::string& flags);
   void setDigest(int64_t message, const std::string& digest);
-  // Its content has changed: to be deleted and added.
+  // The content has changed: the message must be deleted and added again.
   void setStale(int64_t message);
-  // Unless it has been deleted, an older version that may be in the index is to go.
+  // An older version that may be in the index is deleted as well, unless `deleted` says that this
+  // is done.
   void setFailed(int64_t message, const std::string& problem, bool deleted = false);
   void removeMessage(int64_t id);
-  // Messages that failed are tried once more.
+  // Messages that failed are tried again.
   void retryFailed();
 
   [[nodiscard]] int64_t waitingCount();
-  // In the order in which they came, so that those of one file mostly stand together.
+  // In order of arrival, so messages of one file are mostly adjacent.
   [[nodiscard]] std::vector<int64_t> waitingIDs(int64_t first = 0);
-  // The number of the message that came last.
+  // The ID of the newest message.
   [[nodiscard]] int64_t lastMessage() { return scalar("SELECT MAX(id) FROM message"); }
   [[nodiscard]] std::optional<WaitingMessage> waitingMessage(int64_t id);
   void setSequence(int64_t message, int64_t sequence);
@@ -172,9 +174,9 @@ class Catalogue {
   void addDeletion(const std::string& identifier);
   void setDeletionSequence(const std::string& identifier, int64_t sequence);
 
-  // Puts everything to what the index holds: of the messages, those that it has count as found, and
-  // all others wait; so do those that went out after `trusted`, as the index may have another
-  // version. What it has and the catalogue does not is to be deleted.
+  // Aligns the catalogue with the index. Messages that the index has count as sent; all others
+  // wait, and so do those sent after `trusted`, because the index may have another version.
+  // Messages that only the index has are deleted.
   void adopt(const std::vector<std::string>& identifiersInIndex, int64_t trusted);
 
   [[nodiscard]] std::vector<FolderCount> folderCounts();
@@ -186,10 +188,10 @@ class Catalogue {
   bool prepare();
   void noteDeletion(int64_t message);
 
-  // The rows of a literal with one parameter.
+  // The rows of a query with one parameter. `text` is a string literal.
   std::vector<FileRow> files(const char* text, int64_t value);
 
-  // The prepared statement of a literal.
+  // The prepared statement for a string literal, cached.
   Statement& sql(const char* text);
   int64_t scalar(const char* text);
 
@@ -199,10 +201,10 @@ class Catalogue {
   int64_t _acknowledged = 0;
 };
 
-// Where the catalogues lie: tallow below $XDG_STATE_HOME, which is ~/.local/state unless set.
+// The directory of the catalogues: tallow in $XDG_STATE_HOME, by default ~/.local/state.
 [[nodiscard]] std::string defaultCatalogueDirectory();
 
-// The file of one runtime directory and protection class in `directory`.
+// The catalogue file in `directory` for a runtime directory and a protection class.
 [[nodiscard]] std::string cataloguePath(const std::string& directory,
                                         const std::string& runtimeDirectory,
                                         const std::string& protectionClass);

@@ -6,41 +6,41 @@
 
 namespace mailsync {
 
-// What has happened to an entry of a watched directory, or to the directory itself.
+// A change of an entry of a watched directory, or of the directory itself.
 struct Change {
   enum class Kind {
-    entry,  // `name` has come, gone or changed
-    self,   // the directory has gone, or is not watched any more
-    lost,   // some changes were not told
+    entry,  // `name` was created, removed or changed
+    self,   // the directory was removed or is no longer watched
+    lost,   // some changes were not reported
   };
   Kind kind = Kind::entry;
-  std::string directory;  // as it was given to `watch`
+  std::string directory;  // as passed to `watch`
   std::string name;
-  bool isDirectory = false;  // the entry
+  bool isDirectory = false;  // about the entry
 };
 
-// Tells of changes in single directories, not in those below them. One thread.
+// Reports changes in single directories, not in their subdirectories. One thread.
 class ChangeSource {
  public:
   enum class Result {
     watched,
-    absent,   // no directory is there
-    refused,  // it cannot be watched; the system has no room for one more, above all
+    absent,   // the directory does not exist
+    refused,  // it cannot be watched, mostly because the system's limit is reached
   };
 
   virtual ~ChangeSource() = default;
 
-  // Also of a directory that is watched already. One that has moved since is told by its new path
-  // from now on; until then, by the old one.
+  // May be called again for a watched directory. If the directory has been moved, its changes are
+  // reported under the new path from then on, and under the old path until then.
   virtual Result watch(const std::string& directory) = 0;
 
   // Ends the watches of all other directories.
   virtual void keepOnly(const std::set<std::string>& directories) = 0;
 
-  // What has happened since the last call; does not wait.
+  // The changes since the last call. Does not wait.
   [[nodiscard]] virtual std::vector<Change> read() = 0;
 
-  // Readable while there is something to read; negative where there can be nothing.
+  // Readable while changes are waiting; negative if there can be none.
   [[nodiscard]] virtual int descriptor() const = 0;
 };
 

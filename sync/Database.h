@@ -17,22 +17,22 @@ class Database;
 
 inline constexpr const char* kCatalogueDomain = "com.quill.tallow.catalogue";
 
-// A prepared statement. A use binds its values in order, steps through the rows and ends with
-// `reset`, which `run` does by itself. The database keeps the first failure of a step.
+// A prepared statement. Bind the values in order, step through the rows, then call `reset`; `run`
+// does the last two. The database keeps the first failure of a step.
 class Statement {
  public:
   Statement() = default;
   Statement(Database& database, const char* text);
 
-  // Bytes are bound as a blob, so that names need not be UTF-8. They are not copied and must live
-  // until the reset.
+  // Bytes are bound as a blob, because names need not be UTF-8. They are not copied and must stay
+  // valid until the reset.
   Statement& bind(int64_t value);
   Statement& bindText(std::string_view value);
   Statement& bindBytes(std::string_view value);
 
   // True at each row.
   bool step();
-  // Steps to the end and resets. False after a failure.
+  // Steps to the end and resets. False on failure.
   bool run();
   void reset();
 
@@ -51,10 +51,10 @@ class Statement {
 
 // One SQLite database with a write-ahead log. One thread at a time.
 //
-// The first failure stays, so that one look after a group of steps tells whether all went well.
+// The first failure is kept, so one check after a group of steps is enough.
 class Database {
  public:
-  // Null with an error where the file cannot be opened or made.
+  // Null with an error if the file cannot be opened or created.
   [[nodiscard]] static std::unique_ptr<Database> open(const std::string& path, TLErrorOut error);
   ~Database();
   Database(const Database&) = delete;

@@ -43,7 +43,7 @@ Delivery::Delivery(Catalogue& catalogue, client::SearchServiceProxy& service, Ta
       _lastState(std::chrono::steady_clock::now()) {}
 
 bool Delivery::run(const std::optional<DeliveredState>& storedState, TLErrorOut error) {
-  // A state that differs although nothing waits: what the index had was found in order.
+  // The state may differ although nothing waits: the index was found to match.
   _open = !storedState || storedState->catalogue != _catalogue.id() ||
           storedState->sequence != _catalogue.acknowledged();
   if (!sendDeletions(error) || !sendMessages(error)) return false;
@@ -63,7 +63,7 @@ bool Delivery::stateIsDue() const {
   return std::chrono::steady_clock::now() - _lastState >= kStateInterval;
 }
 
-// A call with the state ends the batch.
+// A call that stores the state ends the batch.
 bool Delivery::call(std::span<const client::EncodedItem> items,
                     const std::vector<std::string>& deletions, bool withState, TLErrorOut error) {
   _open = true;
@@ -107,7 +107,7 @@ bool Delivery::sendDeletions(TLErrorOut error) {
   return true;
 }
 
-// The list ended at an identifier that the index does not have.
+// For a list that failed at an identifier unknown to the index.
 bool Delivery::deleteSingly(const std::vector<std::string>& identifiers, TLErrorOut error) {
   for (const std::string& identifier : identifiers) {
     std::optional<TLError> failure;
@@ -197,7 +197,7 @@ bool Delivery::sendPiece(Items items, TLErrorOut error) {
   return true;
 }
 
-// The batch stopped at one item; which one shows when each goes alone. The deletions are done.
+// The batch failed at one item. Sends each item alone to find it. The deletions are done already.
 bool Delivery::sendSingly(Items items, TLErrorOut error) {
   for (const ReadBatch::Item& item : items) {
     std::optional<TLError> failure;
@@ -212,7 +212,7 @@ bool Delivery::sendSingly(Items items, TLErrorOut error) {
     const std::string reason = cli::plainText(*failure);
     _observer.complain(item.item.identifier, reason);
     ++_counts.failed;
-    // Parts of it may be in the index.
+    // A part of the message may be in the index.
     if (!deleteSingly({item.item.identifier}, error)) return false;
     if (!note([&] { _catalogue.setFailed(item.message, reason, true); }, error)) {
       return false;

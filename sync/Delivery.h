@@ -15,7 +15,8 @@
 
 namespace mailsync {
 
-// What the daemon keeps for us beside the index: which catalogue's batches it has, and up to which.
+// The client state that the daemon stores: which catalogue's batches it has, and up to which
+// number.
 struct DeliveredState {
   std::string catalogue;
   int64_t sequence = 0;
@@ -32,13 +33,13 @@ struct DeliveryCounts {
   uint64_t cut = 0;
 };
 
-// Sends what waits in a catalogue to the daemon, deletions first.
+// Sends the waiting changes of a catalogue to the daemon, deletions first.
 //
-// Every call is noted in the catalogue before it is made, under the number of the batch that it
-// belongs to, and a batch ends with a call that stores its number as the client state. So whatever
-// is noted with a number above the daemon's state may be in the index or not, and is deleted and
-// sent again; an identifier that the index does not have is no error then. A batch ends when
-// kStateInterval has passed, since the daemon syncs its files for each state.
+// Every call is recorded in the catalogue before it is made, with the number of its batch. A batch
+// ends with a call that stores its number as the client state. So a change whose number is above
+// the daemon's state may or may not be in the index: it is deleted and sent again, and an unknown
+// identifier is not an error then. A batch ends after kStateInterval, because the daemon syncs its
+// files for each state.
 //
 // One thread.
 class Delivery {
@@ -49,7 +50,7 @@ class Delivery {
     std::string name;
     std::string protectionClass;
     uint64_t largestMessage = 0;  // larger ones fail; 0 for no limit
-    int64_t firstMessage = 0;     // of the catalogue; those before it stay waiting
+    int64_t firstMessage = 0;     // its ID in the catalogue; earlier ones keep waiting
   };
   struct Observer {
     std::function<void(const std::string& where, const std::string& reason)> complain;
@@ -60,10 +61,10 @@ class Delivery {
   Delivery(Catalogue& catalogue, client::SearchServiceProxy& service, Target target,
            Observer observer);
 
-  // Sends all of it from `firstMessage` on. False with an error when the daemon or the catalogue
-  // has failed; what the daemon has acknowledged stays. Cancelled, it ends after the call in hand,
-  // in order. `storedState` is what the daemon has now; a state is stored only where it would
-  // differ.
+  // Sends everything from `firstMessage` on. False with an error if the daemon or the catalogue
+  // failed; acknowledged changes are kept. If cancelled, it finishes the current call and returns
+  // in a consistent state. `storedState` is the daemon's current state; a new one is stored only if
+  // it differs.
   bool run(const std::optional<DeliveredState>& storedState, TLErrorOut error);
 
   [[nodiscard]] const DeliveryCounts& counts() const { return _counts; }
@@ -88,8 +89,8 @@ class Delivery {
   const Observer _observer;
   DeliveryCounts _counts;
   cli::BatchPace _pace;
-  int64_t _sequence = 0;  // of the batch in hand
-  bool _open = false;     // something of it has been sent
+  int64_t _sequence = 0;  // of the current batch
+  bool _open = false;     // a part of it has been sent
   std::chrono::steady_clock::time_point _lastState;
 };
 

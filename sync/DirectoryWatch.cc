@@ -69,7 +69,7 @@ void DirectoryWatch::take(const inotify_event& event, std::vector<Change>& chang
     return;
   }
   const auto known = _directories.find(event.wd);
-  if (known == _directories.end()) return;  // of a watch that has ended
+  if (known == _directories.end()) return;  // the event of a watch that has ended
   const std::string directory = known->second;
   const std::string name = event.len > 0 ? event.name : "";
   const bool self = (event.mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_UNMOUNT | IN_IGNORED)) != 0;

@@ -10,9 +10,9 @@ struct inotify_event;
 
 namespace mailsync {
 
-// Changes told by the kernel (inotify). A file counts as changed when it is closed after writing,
-// so that one that is being written is not read again and again. Where the system gives no inotify
-// object, each watch is refused.
+// Changes reported by the kernel (inotify). A file counts as changed when it is closed after
+// writing, so a file is not read again and again while it is being written. If the system provides
+// no inotify object, every watch is refused.
 class DirectoryWatch : public ChangeSource {
  public:
   DirectoryWatch();

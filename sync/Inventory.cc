@@ -42,7 +42,7 @@ std::optional<std::vector<std::string>> readInventory(client::SearchServiceProxy
              return isAtOrBelow(location->path, root);
            });
   };
-  // False where there are more than one answer holds.
+  // False if there are more than fit into one reply.
   const auto take = [&](const std::string& place) -> std::optional<bool> {
     const auto items = itemsAt(service, protectionClass, place, error);
     if (!items) return std::nullopt;

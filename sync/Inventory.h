@@ -8,13 +8,11 @@
 
 namespace mailsync {
 
-// Identifiers of the messages that the index has below each of the roots, files or directories; it
-// can hold more than the mailboxes have, and messages that other clients have sent. None after an
-// error.
+// The identifiers of all messages in the index below the roots, which are files or directories. May
+// include messages that the mailboxes no longer have or that other clients sent. Nullopt on error.
 //
-// One answer holds at most kInventoryItems. Where a root has more, it is asked for by its
-// `folders`, the folders that the catalogue knows; one that has more by itself is taken for absent,
-// so that its mail is sent once more.
+// One reply has at most kInventoryItems. A root with more is queried folder by folder, using the
+// catalogue's `folders`. A single folder with more is treated as absent, so its mail is sent again.
 inline constexpr int64_t kInventoryItems = 50000;
 
 [[nodiscard]] std::optional<std::vector<std::string>> readInventory(
@@ -22,7 +20,7 @@ inline constexpr int64_t kInventoryItems = 50000;
     const std::vector<std::string>& roots, const std::vector<std::string>& folders,
     TLErrorOut error);
 
-// Messages whose folder's path begins with `place`, kInventoryItems at most.
+// Messages whose folder path begins with `place`, at most kInventoryItems.
 [[nodiscard]] std::optional<client::SearchServiceProxy::Items> itemsAt(
     client::SearchServiceProxy& service, const std::string& protectionClass,
     const std::string& place, TLErrorOut error);

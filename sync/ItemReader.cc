@@ -33,12 +33,12 @@ class ItemReader::Reading {
  public:
   explicit Reading(ItemReader& reader) : _reader(reader) {}
 
-  // Messages of one file.
+  // All messages must be from one file.
   bool read(std::span<const WaitingMessage> group) {
     std::map<std::string, const WaitingMessage*> wanted;
     for (const WaitingMessage& waiting : group) wanted[waiting.message.identifier] = &waiting;
     const FileKind kind = group.front().kind;
-    // Its name may have gained a flag since it was seen.
+    // The file may have been renamed for a flag since the scan.
     const std::string path = cli::findMaildirFile(group.front().path);
     std::map<std::string, int> copies;
     bool goOn = true;

@@ -12,7 +12,7 @@
 
 namespace mailsync {
 
-// What the reader hands over in one piece.
+// A batch of items and failures from the reader.
 struct ReadBatch {
   struct Item {
     int64_t message;  // in the catalogue
@@ -24,7 +24,7 @@ struct ReadBatch {
     int64_t message;
     std::string where;
     std::string reason;
-    bool lasting;  // the message is at fault, and not the moment
+    bool lasting;  // caused by the message itself, so a retry would not help
   };
   std::vector<Item> items;
   std::vector<Failure> failures;
@@ -32,22 +32,22 @@ struct ReadBatch {
   uint64_t cut = 0;  // items whose text was too long for the index
 };
 
-// Reads the messages of some waiting rows and makes them items, on a thread of its own, so that
-// reading and sending overlap. What has gone or changed meanwhile is left out and stays waiting.
+// Reads waiting messages and converts them to items on its own thread, so that reading and sending
+// overlap. Messages that were removed or changed since the scan are skipped and keep waiting.
 //
-// Threads: `next` and the destructor belong to the thread that made the reader. The reading thread
-// shares with it only the queue, and is joined by the destructor, which makes it
-// stop at the next message.
+// Threads: call `next` and the destructor on the thread that created the reader. The reading thread
+// shares only the queue with it. The destructor stops the reading thread at the next message and
+// joins it.
 class ItemReader {
  public:
-  // The messages of one mbox file should stand together: it is read once for each such group.
-  // Messages of more than `largestMessage` bytes, where that is not 0, are failures.
+  // Messages of one mbox file should be adjacent, because the file is read once for each such
+  // group. Messages of more than `largestMessage` bytes fail; 0 means no limit.
   ItemReader(std::vector<WaitingMessage> messages, uint64_t largestMessage);
   ~ItemReader();
   ItemReader(const ItemReader&) = delete;
   ItemReader& operator=(const ItemReader&) = delete;
 
-  // Waits for the next batch; none at the end.
+  // Waits for the next batch; nullopt at the end.
   [[nodiscard]] std::optional<ReadBatch> next() { return _queue.next(); }
 
  private:
@@ -57,7 +57,7 @@ class ItemReader {
 
   const std::vector<WaitingMessage> _messages;
   const uint64_t _largestMessage;
-  cli::BatchQueue<ReadBatch> _queue;  // synchronised by itself
+  cli::BatchQueue<ReadBatch> _queue;  // thread-safe
   std::thread _thread;
 };
 

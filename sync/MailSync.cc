@@ -47,20 +47,20 @@ std::string pathOf(const SyncSettings& settings) {
                        settings.protectionClass);
 }
 
-// The time of this file is when the last run has ended. A run without changes writes nothing to the
-// catalogue, since a transaction would wait for the disk several times.
+// The modification time of this file is the end of the last run. A run without changes does not
+// write to the catalogue, because a transaction would wait for the disk several times.
 std::string endPath(const SyncSettings& settings) {
   return pathOf(settings) + ".ended";
 }
 
-// It is only shown, so that a failure changes nothing.
+// Failures are ignored: the time is only shown to the user.
 void noteEnd(const SyncSettings& settings) {
   const platform::FileDescriptor file(
       open(endPath(settings).c_str(), O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
   if (file.get() >= 0) futimens(file.get(), nullptr);
 }
 
-// The lock of one catalogue; waits for another process, up to the bound.
+// Locks one catalogue. Waits for another process for at most `lockPatience`.
 std::unique_ptr<platform::ProcessLock> acquireLock(const SyncSettings& settings,
                                                    const std::function<bool()>& cancelled,
                                                    TLErrorOut error) {
@@ -87,7 +87,7 @@ std::string damagedPath(const std::string& path) {
   return path + ".damaged";
 }
 
-// A file that is no catalogue any more is set aside, and one is made anew.
+// A damaged file is set aside and replaced by a new catalogue.
 std::unique_ptr<Catalogue> openForWriting(const std::string& path, TLErrorOut error) {
   std::optional<TLError> failure;
   auto catalogue = Catalogue::open(path, &failure);
@@ -102,7 +102,7 @@ std::unique_ptr<Catalogue> openForWriting(const std::string& path, TLErrorOut er
   return catalogue;
 }
 
-// What a run looks at: `paths` as of syncMail, or single places.
+// What a run scans: `paths` as in syncMail, or single places.
 struct Scope {
   std::vector<std::string> paths;
   bool onlyPlaces = false;
@@ -134,7 +134,7 @@ class Run {
   }
 
  private:
-  // The catalogue after this tells what is to be done.
+  // After this the catalogue has all changes to send.
   bool update(const Scope& scope, TLErrorOut error) {
     _catalogue->begin();
     const int64_t last = _catalogue->lastMessage();
@@ -160,7 +160,7 @@ class Run {
     return !failed;
   }
 
-  // Only messages from `first` on go out.
+  // Only messages from `first` on will be sent.
   void hold(int64_t first) {
     const uint64_t recent = _catalogue->waitingIDs(first).size();
     const uint64_t sent = recent <= _settings.backlogLimit ? recent : 0;
@@ -211,7 +211,7 @@ class Run {
   }
 
   void scanPlaces(MailboxScan& scanner, std::vector<std::string> places) {
-    // A directory that is new is told by the one above it, which comes first in this order.
+    // A parent directory finds its new subdirectories, so parents come first.
     std::sort(places.begin(), places.end());
     const std::vector<std::string> roots = _catalogue->roots();
     for (const std::string& place : places) {
@@ -226,9 +226,9 @@ class Run {
     }
   }
 
-  // Brings catalogue and index together. By the daemon's state where that is of this catalogue: a
-  // batch that it has and that was not recorded counts as sent, and what it has lost waits again.
-  // In all other cases the index is asked for what it holds.
+  // Brings catalogue and index into agreement. If the daemon's state is from this catalogue, the
+  // state decides: a batch that the daemon has counts as sent even if that was not recorded, and a
+  // lost batch waits again. Otherwise the index is asked for its contents.
   bool reconcile(TLErrorOut error) {
     if (_stored && _stored->catalogue == _catalogue->id() &&
         _stored->sequence <= _catalogue->highestSequence() &&
@@ -282,7 +282,7 @@ class Run {
   client::SearchServiceProxy _service;
   std::unique_ptr<Catalogue> _catalogue;
   std::optional<DeliveredState> _stored;
-  int64_t _firstMessage = 0;  // that goes out
+  int64_t _firstMessage = 0;  // to be sent
 };
 
 }  // namespace

@@ -23,8 +23,8 @@ std::string above(const std::string& path) {
   return slash == 0 || slash == std::string::npos ? "/" : path.substr(0, slash);
 }
 
-// Files that mail programs keep beside mail and write at each access, so that looking each time
-// would be for nothing. Folders and messages may have such names.
+// Files that mail programs keep next to mail and write on each access; a scan for them would be
+// useless. Folders and messages may have such names.
 bool isNoMail(const Change& change) {
   const std::string& name = change.name;
   if (change.isDirectory || cli::isMaildirFile(platform::joinPath(change.directory, name))) {
@@ -92,8 +92,8 @@ void MailWatch::take(const Change& change, Time now) {
   }
 }
 
-// Watches what tells that a root comes or goes, or that a daemon has started: the nearest directory
-// above each root that is there, and that of the daemon's sockets.
+// To notice that a root appears or disappears, or that a daemon starts, watches the nearest
+// existing directory above each root and the directory of the daemon's sockets.
 void MailWatch::watchAround() {
   for (const std::string& root : _settings.roots) {
     std::string gate = above(root);
@@ -111,7 +111,7 @@ void MailWatch::checkPower(Time now) {
   if (!platform::runsOnBattery(_settings.powerDirectory)) _plan.request(now);
 }
 
-// The device has lost power while much is still to be sent.
+// True if the device has switched to battery while many messages are still to be sent.
 bool MailWatch::stopsForPower() {
   const Time now = RescanPlan::Clock::now();
   if (_settings.onBattery || _remaining <= kBatteryBacklog || now < _nextPower) return false;
@@ -156,7 +156,7 @@ void MailWatch::run(const RescanPlan::Round& round) {
   if (!done) return tellFailure(error);
   if (!_failure.empty()) _observer.say("in step again");
   _failure.clear();
-  // The next round has the limit of a battery.
+  // The next round applies the battery limit.
   if (_stoppedForPower) _plan.request(now);
   if (!_stoppedForPower) tellHeld(report.held);
   settle(report, round.everything, now);
@@ -184,7 +184,8 @@ void MailWatch::enter(const std::string& directory) {
   }
 }
 
-// What the round has shown of what can be watched.
+// Updates the plan with what this round found: which directories cannot be watched, and what waits
+// for power.
 void MailWatch::settle(const SyncReport& report, bool everything, Time now) {
   if (everything) {
     std::erase_if(_refused, [&](const std::string& path) { return !_entered.contains(path); });
@@ -207,7 +208,7 @@ void MailWatch::settle(const SyncReport& report, bool everything, Time now) {
   _plan.setUnwatched(std::move(unwatched), now);
 }
 
-// --- What the user hears
+// --- Messages to the user
 
 void MailWatch::tellFailure(const std::optional<TLError>& error) {
   const std::string failure = error ? cli::plainText(*error) : "the daemon gave no answer";

@@ -21,36 +21,36 @@ struct WatchSettings {
   std::vector<std::string> roots;  // canonical paths, none below another
   bool onBattery = false;          // large backlogs do not wait for power
   std::string powerDirectory = platform::kPowerSupplyDirectory;
-  // How often the power is looked at while something waits for it, or a round takes that long.
+  // How often the power state is checked while messages wait for it or a long round runs.
   std::chrono::milliseconds powerInterval{std::chrono::minutes(1)};
 };
 
 struct WatchObserver {
   std::function<void(const std::string& line)> say;
   std::function<void(const SyncReport& report)> finished;  // after each round that succeeded
-  std::function<bool()> cancelled;                         // as of SyncObserver
+  std::function<bool()> cancelled;                         // as in SyncObserver
 };
 
-// Keeps the index of one protection class in step with mailboxes, all the time. Each round is a run
-// of its own (see MailSync.h), so that between two rounds nothing is open or locked but the watches
-// and the lock that says that this class is watched.
+// Continuously keeps the index of one protection class in step with mailboxes. Each round is a
+// separate run (see MailSync.h), so between rounds only the watches and the watch lock of this
+// class are held.
 //
-// A directory is watched from just before it is first listed. Watches of what has moved elsewhere
-// end with the next round over everything. One thread.
+// A directory is watched from just before it is first listed. Watches of directories that have
+// moved away end with the next full round. One thread.
 class MailWatch {
  public:
   using Time = RescanPlan::Time;
 
-  // On battery more messages than this wait for power.
+  // On battery, a backlog above this number of messages waits for power.
   static constexpr uint64_t kBatteryBacklog = 500;
 
-  // Null with an error when the class is watched already, or the lock cannot be made.
+  // Null with an error if the class is watched already or the lock file cannot be created.
   [[nodiscard]] static std::unique_ptr<MailWatch> start(WatchSettings settings,
                                                         std::unique_ptr<ChangeSource> source,
                                                         WatchObserver observer, Time now,
                                                         TLErrorOut error);
 
-  // `turn` has something to do at `next`, and when the descriptor can be read, if there is one.
+  // Call `turn` at `next`, and when the descriptor, if any, becomes readable.
   [[nodiscard]] int descriptor() const { return _source->descriptor(); }
   [[nodiscard]] Time next() const;
   void turn(Time now);
@@ -77,15 +77,15 @@ class MailWatch {
   const std::unique_ptr<platform::ProcessLock> _lock;
   RescanPlan _plan;
 
-  std::map<std::string, std::string> _gates;  // by root, a directory above it that is watched
-  std::set<std::string> _entered;             // directories, of this round
+  std::map<std::string, std::string> _gates;  // by root: the watched directory above it
+  std::set<std::string> _entered;             // directories scanned in this round
   std::set<std::string> _refused;             // directories that cannot be watched
-  std::set<std::string> _said;                // since the last round over everything
-  std::string _failure;                       // of the last round; empty where it succeeded
-  uint64_t _held = 0;                         // messages that wait for power
+  std::set<std::string> _said;                // lines reported since the last full round
+  std::string _failure;                       // of the last round; empty if it succeeded
+  uint64_t _held = 0;                         // messages waiting for power
   Time _nextPower;
-  bool _stoppedForPower = false;  // the round in hand
-  uint64_t _remaining = 0;        // messages of the round in hand
+  bool _stoppedForPower = false;  // the current round
+  uint64_t _remaining = 0;        // messages left in the current round
 };
 
 }  // namespace mailsync

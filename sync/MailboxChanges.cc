@@ -11,12 +11,12 @@
 #include "sync/MailboxScan.h"
 #include "sync/MessageDigest.h"
 
-// What became of files that came, went or changed.
+// Settles files that were added, removed or changed.
 namespace mailsync {
 
 namespace {
 
-// What reading a file outside of Maildirs has shown.
+// The messages found in a file outside of Maildirs.
 struct FileContent {
   struct Message {
     std::string digest;
@@ -27,7 +27,7 @@ struct FileContent {
   FileKind kind = FileKind::other;
   std::vector<Message> messages;
   std::optional<std::string> failure;  // of the file as a whole
-  bool complete = true;                // its end was read
+  bool complete = true;                // it was read to its end
 };
 
 FileContent readContent(const std::string& path) {
@@ -61,7 +61,7 @@ FileContent readContent(const std::string& path) {
 
 void MailboxScan::finish() {
   while (!_settings.cancelled() && (!_arrivals.empty() || !_departures.empty())) {
-    // What was an alias goes first, since its name may be wanted.
+    // Aliases are removed first, because their names may be needed.
     for (auto id = _departures.begin(); id != _departures.end();) {
       const auto row = _catalogue.file(*id);
       if (row && row->kind == FileKind::alias) _catalogue.removeFile(*id);
@@ -83,7 +83,7 @@ void MailboxScan::settle(Arrival& arrival) {
   if (!settleAlias(arrival)) addFile(arrival);
 }
 
-// True where the message is known by another name.
+// True if the message is known by another name.
 bool MailboxScan::settleMaildir(Arrival& arrival) {
   const auto message = _catalogue.messageWithIdentifier(cli::maildirIdentifier(arrival.path));
   const auto before = message ? _catalogue.file(message->file) : std::nullopt;
@@ -108,7 +108,7 @@ bool MailboxScan::settleMaildir(Arrival& arrival) {
   return true;
 }
 
-// True where the same file is known by another path.
+// True if the same file is known by another path.
 bool MailboxScan::settleAlias(Arrival& arrival) {
   for (const FileRow& row : _catalogue.filesWithInode(arrival.row.inode)) {
     if (row.kind == FileKind::alias || _departures.contains(row.id)) continue;
@@ -122,7 +122,7 @@ bool MailboxScan::settleAlias(Arrival& arrival) {
       _catalogue.addFile(arrival.row);
       return true;
     }
-    // It has been moved here, from a directory that is not there any more.
+    // The file was moved here from a directory that no longer exists.
     if (errno == ENOENT && sameState(row, arrival.row)) _departures.insert(row.id);
   }
   return false;
@@ -141,7 +141,7 @@ void MailboxScan::addFile(Arrival& arrival) {
   readPlainFile(arrival.path, arrival.row);
 }
 
-// Another path to the file, or another file of the message's name, takes its place.
+// If there is another path to the file, or another file with the message's name, it takes over.
 void MailboxScan::removeFile(const FileRow& row) {
   std::vector<FileRow> heirs;
   for (FileRow& other : _catalogue.filesWithInode(row.inode)) {
@@ -223,17 +223,17 @@ void MailboxScan::readPlainFile(const std::string& path, FileRow& row) {
       if (added) _catalogue.setFailed(added->id, seen.problem);
     }
   }
-  // After a place that cannot be read there may be messages: none of them is taken for gone.
+  // Messages may follow the place that cannot be read, so none counts as deleted.
   if (content.complete) {
     for (const auto& [identifier, message] : known) _catalogue.removeMessage(message.id);
   }
   row.kind = !content.complete && content.messages.empty() ? row.kind : content.kind;
-  // A file can change within the same step of time, and its rights without any.
+  // A file may change again within the same time step, and its permissions without a new time.
   if (content.failure || row.modified + kTimeStep >= _now) row.modified = -1;
   _catalogue.updateFile(row);
 }
 
-// Of a Maildir's file: has the message changed, or may one that failed be tried again?
+// For a Maildir file: checks whether the message has changed, or may be retried after a failure.
 void MailboxScan::checkContent(const std::string& path, const FileRow& row) {
   const FileContent content = readContent(path);
   for (const MessageRow& message : _catalogue.messagesOf(row.id)) {

@@ -48,7 +48,7 @@ bool isBelow(const std::string& path, const std::string& directory) {
          path[directory.size()] == '/';
 }
 
-// "new" before "cur", so that a message that is moved meanwhile is seen in one of them.
+// "new" before "cur", so that a message moved during the scan is seen in one of them.
 bool visitedBefore(const std::string& a, const std::string& b) {
   const bool aIsCur = nameOf(a) == "cur";
   const bool bIsCur = nameOf(b) == "cur";
@@ -157,7 +157,8 @@ void MailboxScan::scanDirectory(const Place& place, std::vector<Place>& pending)
   }
 }
 
-// Of a directory below one that is looked into alone: it is new, or is not what it was.
+// For a directory below one that is rescanned alone: true if it is new, was missing, or has been
+// replaced.
 bool MailboxScan::isToBeEntered(const std::string& path) const {
   const auto known = _directories.find(path);
   struct stat info {};
@@ -180,7 +181,7 @@ DirectoryRow& MailboxScan::directoryAt(const std::string& path, int64_t parent) 
   return row;
 }
 
-// False where its files cannot be told; then it stays as it was.
+// False if its files cannot be listed; the catalogue then stays unchanged.
 bool MailboxScan::listDirectory(DirectoryRow& row, const struct stat& info,
                                 std::vector<std::string>& below) {
   std::optional<TLError> error;
@@ -191,7 +192,7 @@ bool MailboxScan::listDirectory(DirectoryRow& row, const struct stat& info,
     return false;
   }
   const auto inode = static_cast<int64_t>(info.st_ino);
-  // What is left where a disk was mounted.
+  // The empty mount point of a disk that is no longer mounted.
   if (names->empty() && row.inode != inode && _catalogue.hasContent(row.id)) {
     noteMissing(row.path);
     return false;
@@ -205,7 +206,7 @@ bool MailboxScan::listDirectory(DirectoryRow& row, const struct stat& info,
     const std::string path = platform::joinPath(row.path, name);
     struct stat entry {};
     struct stat target {};
-    // What is gone by now has been moved or deleted meanwhile.
+    // An entry that no longer exists was moved or deleted during the scan.
     if (lstat(path.c_str(), &entry) != 0 || !look(path, target)) continue;
     if (S_ISDIR(entry.st_mode)) {
       if (!(isMaildir && name == "tmp")) below.push_back(path);
@@ -233,7 +234,7 @@ bool MailboxScan::listDirectory(DirectoryRow& row, const struct stat& info,
   return true;
 }
 
-// The directory and all that the catalogue has below it.
+// The directory and all directories of the catalogue below it.
 std::vector<std::string> MailboxScan::treeOf(const std::string& path) const {
   std::vector<std::string> tree;
   for (auto at = _directories.lower_bound(path); at != _directories.end(); ++at) {
@@ -266,7 +267,7 @@ void MailboxScan::removeTree(const std::string& path) {
   }
 }
 
-// A directory that was renamed has nothing left that is its own.
+// Forgets missing directories whose content has all been found elsewhere.
 void MailboxScan::settleMissing() {
   for (const std::string& path : _missing) {
     const int64_t id = _directories.at(path).id;

@@ -15,15 +15,15 @@ struct stat;
 
 namespace mailsync {
 
-// A directory whose time is not older than this when it is looked into may change again without
-// showing it, since file systems count in steps; it is looked into again the next time.
+// File systems store times in steps. A directory that changed less than this before it was listed
+// may change again with the same time, so it is listed again in the next run.
 inline constexpr int64_t kTimeStep = int64_t{2'000'000'000};  // nanoseconds
 
 struct ScanCounts {
   uint64_t directories = 0;
-  uint64_t entered = 0;      // of these
-  uint64_t flagChanges = 0;  // of messages that are otherwise the same
-  uint64_t moves = 0;        // within a folder, "new" to "cur" above all
+  uint64_t entered = 0;      // of the directories
+  uint64_t flagChanges = 0;  // of otherwise unchanged messages
+  uint64_t moves = 0;        // within a folder, mostly "new" to "cur"
   uint64_t unreadable = 0;   // files and directories
   uint64_t missing = 0;      // directories
 };
@@ -31,47 +31,46 @@ struct ScanCounts {
 struct ScanSettings {
   std::vector<std::string> excluded;  // canonical paths of directories
   bool pruneMissing = false;
-  // What the user is to hear.
+  // Reports a problem to the user.
   std::function<void(const std::string& where, const std::string& reason)> complain;
   std::function<bool()> cancelled;
-  // Told of each directory before its time is read, so that a watch that begins here misses
+  // Called for each directory before its time is read, so that a watch that starts here misses
   // nothing; may be empty.
   std::function<void(const std::string& directory)> entering = {};
 };
 
-// Compares roots with the catalogue and writes the difference into it: new messages wait, those
-// that have gone become deletions. The caller has begun a transaction.
+// Compares roots with the catalogue and records the differences in it: new messages wait to be
+// sent, and messages that are gone become deletions. The caller has begun a transaction.
 //
-// A directory is listed only when its time or inode has changed, and then each file's size, time
-// and inode are compared. Files outside of Maildirs, which can change without their directory, are
-// compared each time. Of an mbox file that has changed all messages are read and told by digest.
+// A directory is listed only if its time or inode has changed; then the size, time and inode of
+// each file are compared. Files outside of Maildirs can change without their directory and are
+// compared in every run. All messages of a changed mbox file are read and identified by digest.
 //
-// What has gone from one place and come at another is settled at the end, in `finish`, when all
-// roots have been seen: a message of the same Maildir folder and name is the same, whatever its
-// flags; the same file by two paths counts once.
+// Moves are settled in `finish`, after all roots have been scanned: a message with the same Maildir
+// folder and name is the same message, whatever its flags, and a file with two paths counts once.
 //
-// Symbolic links are followed to files, and for a root itself. Directories are entered up to 64
-// deep. One thread.
+// Symbolic links to files are followed, and a root may be a link. Directories are entered up to 64
+// levels deep. One thread.
 class MailboxScan {
  public:
   MailboxScan(Catalogue& catalogue, ScanSettings settings);
 
-  // `path` is absolute; a file or a directory. False where there is nothing, or nothing readable.
+  // `path` is absolute, a file or a directory. False if it does not exist or cannot be read.
   bool scan(const std::string& path);
 
-  // Looks only into the directory `path`, at or below `root`, whatever its time tells, and into
-  // those below it that are new, have gone or have come back. Of one that the catalogue does not
-  // have, the nearest above it is looked into.
+  // Lists only the directory `path`, at or below `root`, even if its time is unchanged, and
+  // directories below it that are new, gone or back again. If the catalogue does not have `path`,
+  // its nearest known parent is listed.
   void rescan(const std::string& path, const std::string& root);
   void finish();
 
-  // Directories that are not there, without those below them; of the whole catalogue.
+  // Directories of the whole catalogue that do not exist, without their subdirectories.
   [[nodiscard]] std::vector<std::string> missing() const;
 
   [[nodiscard]] const ScanCounts& counts() const { return _counts; }
 
  private:
-  // A file that was not at this place before.
+  // A file that is new at this place.
   struct Arrival {
     int64_t directory;
     std::string path;
@@ -82,7 +81,7 @@ class MailboxScan {
     std::string path;
     int64_t parent;
     size_t depth;
-    bool alone = false;  // as of `rescan`
+    bool alone = false;  // as in `rescan`
   };
 
   void scanFrom(Place place);
@@ -120,7 +119,7 @@ class MailboxScan {
   std::set<std::string> _visited;  // directories; each is listed once
   std::vector<Arrival> _arrivals;
   std::unordered_set<int64_t> _departures;         // file IDs
-  std::set<std::string, std::greater<>> _missing;  // directories, those below others first
+  std::set<std::string, std::greater<>> _missing;  // directories, children before parents
 };
 
 }  // namespace mailsync

@@ -23,8 +23,8 @@ bool isStateField(std::string_view name) {
                      [&](std::string_view field) { return equalIgnoringCase(name, field); });
 }
 
-// Calls `visit` with each line of the header, with its line feed, and the name of the field that it
-// begins or continues. Returns where the body begins, its empty line included.
+// Calls `visit` with each line of the header, including its line feed, and the name of its field.
+// Returns the offset of the empty line before the body.
 size_t eachHeaderLine(
     std::string_view message,
     const std::function<void(std::string_view line, std::string_view name)>& visit) {

@@ -5,12 +5,12 @@
 
 namespace mailsync {
 
-// 32 hexadecimal digits that stand for the content of a message. The header fields in which mail
-// programs keep a message's state and length (Status, X-Status, Content-Length and the like) do not
-// count, so that the digest stays when somebody has read the message.
+// A digest of the content of a message, 32 hexadecimal digits. Header fields in which mail programs
+// store a message's state and length (Status, X-Status, Content-Length and the like) are skipped,
+// so that reading a message does not change its digest.
 [[nodiscard]] std::string messageDigest(std::string_view message);
 
-// The flags in Status and X-Status, as the letters of a Maildir, in order: F, R, S, T.
+// The flags in Status and X-Status as Maildir letters, sorted: F, R, S, T.
 [[nodiscard]] std::string statusFlags(std::string_view message);
 
 }  // namespace mailsync

@@ -8,49 +8,49 @@
 
 namespace mailsync {
 
-// Decides when a watch looks at what: changed directories shortly after the change, everything at
-// the start, once a day and when changes were lost, and what cannot be watched from time to time.
-// Knows the time only from its caller. One thread.
+// Schedules the rounds of a watch: changed directories shortly after the change; everything at the
+// start, once a day and after lost changes; directories that cannot be watched at intervals. The
+// caller passes the time. One thread.
 class RescanPlan {
  public:
   using Clock = std::chrono::steady_clock;
   using Time = Clock::time_point;
 
-  // Changes are taken together until none has come for kQuiet, but for kTogether at most.
+  // Changes are gathered until none has arrived for kQuiet, for at most kTogether.
   static constexpr std::chrono::milliseconds kQuiet{50};
   static constexpr std::chrono::milliseconds kTogether{300};
   static constexpr std::chrono::minutes kUnwatchedInterval{2};
   static constexpr std::chrono::hours kFullInterval{24};
-  // After a round that has failed; doubled each time up to the second.
+  // Pause after a failed round; doubled each time up to the second value.
   static constexpr std::chrono::milliseconds kFirstRetry{250};
   static constexpr std::chrono::milliseconds kLastRetry{60000};
-  // More places than this are one round over everything.
+  // With more places than this, everything is scanned.
   static constexpr size_t kMaxPlaces = 10000;
 
   struct Round {
     bool everything = false;
-    std::set<std::string> places;  // without `everything`
+    std::set<std::string> places;  // if not `everything`
   };
 
-  // A round over everything is due at once.
+  // A full round is due at once.
   explicit RescanPlan(Time now);
 
-  // A directory or root is to be looked at.
+  // A directory or root must be scanned.
   void changed(const std::string& place, Time now);
-  // Nobody knows what has changed.
+  // Changes were lost, so a full round is needed.
   void lost(Time now);
-  // A round is wanted although no place has changed.
+  // Requests a round although no place has changed.
   void request(Time now);
-  // The daemon may be there again: what has failed is tried at once.
+  // The daemon may be running again: retries a failed round at once.
   void retry(Time now);
-  // What is looked at in intervals, in place of what was.
+  // Replaces the set of places that are scanned at intervals.
   void setUnwatched(std::set<std::string> places, Time now);
 
-  // When a round may be due without anything new.
+  // When the next round may be due if nothing else changes.
   [[nodiscard]] Time next() const;
-  // The round that is due, if one is; it is in hand until `finished`.
+  // The round that is due, if any; it is current until `finished`.
   [[nodiscard]] std::optional<Round> take(Time now);
-  // What was in hand is still to be done where it did not succeed.
+  // If the current round failed, its places are scheduled again.
   void finished(bool succeeded, Time now);
 
   // Whether the last round has failed.
