@@ -77,7 +77,7 @@ class SearchServiceProxy {
   // does not support it or the connection has changed since the search.
   [[nodiscard]] std::optional<std::vector<ReplacedWord>> replacedWords(TLErrorOut error);
 
-  // From any thread: ends the operation in hand, and lets no later one begin.
+  // From any thread: ends the current operation and prevents later ones.
   void interrupt() { _channel.interrupt(); }
 
  private:

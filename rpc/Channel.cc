@@ -85,8 +85,8 @@ int onReply(sd_bus_message* reply, void* data, sd_bus_error*) {
   return 1;
 }
 
-// Sends the request and serves the connection until the reply is there, which may be one that the
-// library creates on a timeout or a disconnect. Negative if there is none.
+// Sends the request and serves the connection until the reply arrives. The library creates an error
+// reply on a timeout or a disconnect. Negative if there is no reply.
 int exchange(sd_bus* bus, sd_bus_message* request, std::chrono::microseconds timeout,
              Message& reply) {
   sd_bus_slot* slot = nullptr;
@@ -101,7 +101,7 @@ int exchange(sd_bus* bus, sd_bus_message* request, std::chrono::microseconds tim
   return reply != nullptr ? 0 : result;
 }
 
-// Whether the daemon has closed the connection, for example for want of room.
+// Whether the daemon has closed the connection, for example to make room for another.
 bool hungUp(sd_bus* bus) {
   pollfd socket{sd_bus_get_fd(bus), POLLRDHUP, 0};
   return poll(&socket, 1, 0) > 0;
@@ -110,7 +110,7 @@ bool hungUp(sd_bus* bus) {
 }  // namespace
 
 std::string defaultRuntimeDirectory() {
-  // Root may run a daemon of its own beside the system's.
+  // Root may run its own daemon in addition to the system's.
   const char* const own = std::getenv("XDG_RUNTIME_DIR");
   const char* const given = std::getenv("RUNTIME_DIRECTORY");
   if (geteuid() == 0 && own != nullptr && *own == '/' && (given == nullptr || *given == '\0')) {

@@ -64,7 +64,7 @@ class Channel {
   bool call(const char* interface, const char* member, std::chrono::seconds timeout,
             const Body& append, const Body& read, TLErrorOut error);
 
-  // From any thread: ends the call in hand, and lets no later one begin; they are unreachable.
+  // From any thread: ends the current call and prevents later ones; all fail as unreachable.
   void interrupt() TL_EXCLUDES(_mutex);
 
  private:

@@ -1,5 +1,5 @@
 #pragma once
 
-// The screen library without its macros, which bear names such as clear and timeout.
+// The screen library without its macros, which have names such as clear and timeout.
 #define NCURSES_NOMACROS 1
 #include <curses.h>

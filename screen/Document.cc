@@ -9,7 +9,7 @@ namespace {
 // A place in the text where a line may end.
 struct Place {
   size_t at = 0;
-  size_t columns = 0;  // from the beginning of the line up to there
+  size_t columns = 0;  // from the start of the line
   Style style = Style::plain;
 };
 
@@ -51,7 +51,7 @@ void Document::wrap(size_t columns) {
       if (full && space.at > begin.at) {
         endLine(space, space);
       }
-      // What follows the space may still be too long.
+      // The rest after the space may still be too long.
       if (width > 0 && here.columns > 0 && here.columns + width > columns) endLine(here, here);
       here.columns += width;
       if (glyph == U' ') space = after();

@@ -8,17 +8,17 @@
 
 namespace mailscreen {
 
-// A text of many lines, broken to fit a width. At most 4 GiB of glyphs.
+// A text of many lines, wrapped to a width. At most 4 GiB of glyphs.
 class Document {
  public:
   void set(Glyphs text);
 
-  // Breaks lines between words where it can, so that none takes more columns; a wide glyph in a
-  // single column has a line of its own. Does nothing where the text is broken so.
+  // Wraps lines to the width, between words if possible. A wide glyph in a single column has its
+  // own line. Does nothing if the text is already wrapped to this width.
   void wrap(size_t columns);
 
   [[nodiscard]] size_t lines() const { return _lines.size(); }
-  // A line with its marks, and the style that it begins with.
+  // The glyphs of a line with their marks, and the style at the start of the line.
   [[nodiscard]] GlyphsView line(size_t index) const;
   [[nodiscard]] Style styleOfLine(size_t index) const { return _lines[index].style; }
   // The line of the first match.

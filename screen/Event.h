@@ -4,7 +4,7 @@
 
 namespace mailscreen {
 
-// What a key means, whatever the terminal sends for it.
+// The meaning of a key, independent of the code that the terminal sends.
 enum class Key {
   text,  // typed or pasted
   enter,

@@ -12,8 +12,9 @@ namespace {
 
 constexpr char32_t kReplacement = 0xFFFD;
 constexpr char32_t kEllipsis = 0x2026;
-constexpr char32_t kNonJoiner = 0x200C;  // part of how words are written; takes no column anywhere
-// As many as one cell of the screen library holds.
+constexpr char32_t kNonJoiner =
+    0x200C;  // part of the spelling of words; takes no column in any terminal
+// The screen library's limit for one cell.
 constexpr size_t kMaxCombining = 4;
 
 constexpr bool isVariationSelector(char32_t c) {
@@ -56,7 +57,7 @@ cli::Palette markingPalette() {
 Glyphs glyphsOf(std::string_view text) {
   Glyphs glyphs;
   glyphs.reserve(text.size());
-  size_t combining = kMaxCombining;  // without a base there is no room for any
+  size_t combining = kMaxCombining;  // without a base character none is kept
   forEachCharacter(text, [&](char32_t c) {
     if (isMark(c) || c == U'\n') {
       glyphs.push_back(c);
@@ -104,7 +105,7 @@ size_t columnsOf(GlyphsView glyphs) {
 
 Glyphs fitted(GlyphsView glyphs, size_t columns) {
   size_t used = 0;
-  size_t fits = 0;  // where the mark of the cut would go
+  size_t fits = 0;  // where the ellipsis would go
   for (size_t i = 0; i < glyphs.size(); ++i) {
     const size_t width = columnsOf(glyphs[i]);
     if (used + width > columns) {

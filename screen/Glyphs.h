@@ -7,14 +7,14 @@
 
 #include "cli/Terminal.h"
 
-// Text on its way to the cells of a terminal.
+// Text prepared for the cells of a terminal.
 namespace mailscreen {
 
-// How a part of a text is drawn.
+// The style of a part of a text.
 enum class Style : uint8_t { plain, match, faint };
 
-// Characters that are safe to draw, and marks: a mark is a control character, takes no column, and
-// stands where a style begins.
+// Characters that are safe to draw, and marks. A mark is a control character that takes no column
+// and stands where a style begins.
 using Glyphs = std::u32string;
 using GlyphsView = std::u32string_view;
 
@@ -28,25 +28,26 @@ using GlyphsView = std::u32string_view;
   return static_cast<Style>(mark - 1);
 }
 
-// The marks as the "colours" of a text in UTF-8.
+// A palette whose "colours" are the marks, for texts in UTF-8.
 [[nodiscard]] cli::Palette markingPalette();
 
-// Makes glyphs of a clean text (see cleanForTerminal) with marks; line feeds stay. What terminals
-// disagree about, and would move the cells after it, is left out: format characters such as
-// joiners, variation selectors and skin tones, and combining characters without a base or after
-// four others. What the locale's terminal cannot show becomes U+FFFD.
+// Converts a clean text (see cleanForTerminal) with marks to glyphs. Line feeds are kept.
+// Characters whose width differs between terminals, and so would shift the cells after them, are
+// dropped: format characters such as joiners, variation selectors and skin tones, and combining
+// characters without a base or after four others. Characters that the locale cannot show become
+// U+FFFD.
 [[nodiscard]] Glyphs glyphsOf(std::string_view text);
 
-// Any text on one line, cleaned first.
+// Cleans any text and converts it to one line of glyphs.
 [[nodiscard]] Glyphs lineOfGlyphs(std::string_view text);
 
 [[nodiscard]] std::string toUTF8(GlyphsView glyphs);
 
-// Columns of one glyph (0, 1 or 2), and of several, by the locale.
+// The width in columns of one glyph (0, 1 or 2) or of several, according to the locale.
 [[nodiscard]] size_t columnsOf(char32_t glyph);
 [[nodiscard]] size_t columnsOf(GlyphsView glyphs);
 
-// The beginning that takes at most so many columns, with "…" at its end where something is cut off.
+// The longest prefix that fits into `columns`, ending with "…" if something is cut off.
 [[nodiscard]] Glyphs fitted(GlyphsView glyphs, size_t columns);
 
 }  // namespace mailscreen

@@ -4,7 +4,7 @@
 
 namespace mailscreen {
 
-// The keys, for reading.
+// The help page with all keys.
 [[nodiscard]] Glyphs helpText();
 
 }  // namespace mailscreen

@@ -13,7 +13,7 @@ namespace mailscreen {
 namespace {
 
 constexpr int kEscape = 27;
-// Of what is pasted at once, the bytes beyond are dropped.
+// Maximum bytes of one paste; the rest is dropped.
 constexpr size_t kMaxText = size_t{64} << 10;
 
 constexpr int control(char letter) {
@@ -61,7 +61,7 @@ constexpr Code kCodes[] = {
     {KEY_F(1), Key::help},
 };
 
-// The bytes at the end of a text that begin a character and do not end it.
+// The number of bytes of an incomplete character at the end of a text.
 size_t incompleteBytes(const std::string& text) {
   const size_t most = std::min(text.size(), size_t{3});
   for (size_t count = 1; count <= most; ++count) {
@@ -76,7 +76,7 @@ size_t incompleteBytes(const std::string& text) {
 
 std::vector<Event> Keyboard::read() {
   for (int code = wgetch(stdscr); code != ERR; code = wgetch(stdscr)) take(code);
-  // The rest of a character comes with the next bytes.
+  // The rest of the character arrives with the next bytes.
   const size_t open = incompleteBytes(_text);
   std::string rest = _text.substr(_text.size() - open);
   _text.resize(_text.size() - open);
@@ -85,8 +85,8 @@ std::vector<Event> Keyboard::read() {
   return std::exchange(_events, {});
 }
 
-// What is pasted is text, also where it looks like a key; only Ctrl-C is not, for pastes without
-// end.
+// Pasted input is text, even if it looks like a key. Only Ctrl-C keeps its meaning, to end an
+// endless paste.
 void Keyboard::take(int code) {
   const bool byte = code < 0x100;
   const bool character = byte && code >= 0x20 && code != 0x7F;
@@ -110,8 +110,8 @@ void Keyboard::takeByte(char byte) {
   if (_text.size() < kMaxText) _text.push_back(isControl ? ' ' : byte);
 }
 
-// By itself it is the key; before other characters it is a key that is not known, such as one with
-// Alt, and they belong to it.
+// Escape alone is the escape key. Followed by other characters it is an unknown key, such as one
+// with Alt, and those characters belong to it.
 void Keyboard::takeEscape() {
   constexpr int kMaxCode = 32;
   int code = wgetch(stdscr);

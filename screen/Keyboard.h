@@ -7,10 +7,10 @@
 
 namespace mailscreen {
 
-// What is typed at the terminal of the TerminalSession, as events.
+// Reads the input of the TerminalSession's terminal as events.
 class Keyboard {
  public:
-  // All that has been typed since the last call; does not wait, but for the rest of a key's code.
+  // All events since the last call. Waits only for the rest of a key's code.
   [[nodiscard]] std::vector<Event> read();
 
  private:
@@ -21,7 +21,7 @@ class Keyboard {
   void add(Key key);
 
   std::vector<Event> _events;
-  std::string _text;  // the last bytes typed, of which the last character may be incomplete
+  std::string _text;  // the last bytes typed; the last character may be incomplete
   bool _pasting = false;
 };
 

@@ -13,12 +13,12 @@
 
 namespace mailscreen {
 
-// A thread that does one job at a time, of which only the last matters: a newer job takes the place
-// of one that waits, and stops the one in hand, whose result is dropped.
+// A thread that runs one job at a time, and only the latest matters. A new job replaces a waiting
+// one and stops the current one, whose result is dropped.
 //
-// `submit` and `take` are for one thread, the owner's; none of the two waits. `work` and `wake`,
-// which tells that there is a result, run on the worker's. The destructor stops the job in hand and
-// waits for it.
+// `submit` and `take` belong to the owner's thread and do not wait. `work` and `wake`, which
+// announces a result, run on the worker's thread. The destructor stops the current job and waits
+// for it.
 template <typename Job, typename Result>
 class LatestWorker {
  public:
@@ -90,7 +90,7 @@ class LatestWorker {
   std::condition_variable_any _changed;
   std::optional<Job> _waiting TL_GUARDED_BY(_mutex);
   std::optional<Result> _done TL_GUARDED_BY(_mutex);
-  std::stop_source _stop TL_GUARDED_BY(_mutex);  // of the job in hand
+  std::stop_source _stop TL_GUARDED_BY(_mutex);  // of the current job
   bool _ending TL_GUARDED_BY(_mutex) = false;
   std::thread _thread;  // "tallow.searcher" and the like; joined by the destructor
 };

@@ -6,8 +6,8 @@ namespace mailscreen {
 
 namespace {
 
-constexpr size_t kWide = 100;     // columns from which on the preview stands beside the list
-constexpr size_t kHigh = 9;       // rows from which on there is one below it
+constexpr size_t kWide = 100;     // columns from which the preview is next to the list
+constexpr size_t kHigh = 9;       // rows from which the preview fits below the list
 constexpr size_t kMinListed = 4;  // rows
 
 }  // namespace

@@ -4,7 +4,7 @@
 
 namespace mailscreen {
 
-// A part of the screen, in cells. Without rows or columns it is not shown.
+// A part of the screen, in cells. Not shown if it has no rows or no columns.
 struct Box {
   size_t row = 0;
   size_t column = 0;
@@ -15,17 +15,18 @@ struct Box {
   bool operator==(const Box&) const = default;
 };
 
-// Where everything is.
+// The places of all parts.
 struct Layout {
-  Box line;     // that is typed in
+  Box line;     // the input line
   Box list;     // of results
   Box rule;     // between list and preview
-  Box preview;  // beside the list where the screen is wide, else below it
-  Box page;     // a mail or the help, over all but the status
+  Box preview;  // next to the list on a wide screen, otherwise below it
+  Box page;     // a mail or the help, covering everything except the status
   Box status;
 };
 
-// For a screen of any size, down to nothing. What does not fit goes, the line last.
+// Works for any screen size, including zero. Parts that do not fit are left out, the input line
+// last.
 [[nodiscard]] Layout layoutOf(size_t rows, size_t columns);
 
 }  // namespace mailscreen

@@ -42,7 +42,7 @@ bool LineEditor::press(const Event& event) {
 }
 
 bool LineEditor::insert(std::string_view text) {
-  // The base of what is typed may stand in the line.
+  // The base of a typed combining character may already be in the line.
   const bool hasBase = _cursor > 0;
   Glyphs typed = lineOfGlyphs(hasBase ? '.' + std::string(text) : std::string(text));
   if (hasBase) typed.erase(0, 1);

@@ -7,21 +7,21 @@
 
 namespace mailscreen {
 
-// One line that is typed, with a cursor. Combining characters belong to the one before them.
+// An input line with a cursor. A combining character belongs to the character before it.
 class LineEditor {
  public:
-  // What is typed beyond is dropped.
+  // Further input is dropped.
   static constexpr size_t kMaxGlyphs = 2000;
 
-  // Replaces all; the cursor is at the end.
+  // Replaces the text and puts the cursor at its end.
   void set(std::string_view text);
 
-  // True where the text has changed.
+  // True if the text has changed.
   bool press(const Event& event);
 
   [[nodiscard]] std::string text() const { return toUTF8(_glyphs); }
   [[nodiscard]] const Glyphs& glyphs() const { return _glyphs; }
-  // The glyph that the cursor stands on.
+  // The index of the glyph at the cursor.
   [[nodiscard]] size_t cursor() const { return _cursor; }
   [[nodiscard]] bool empty() const { return _glyphs.empty(); }
 

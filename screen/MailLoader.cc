@@ -9,7 +9,7 @@ namespace mailscreen {
 
 namespace {
 
-// Ends at a whole line, or at a whole character where a line is longer.
+// Cuts after a complete line, or after a complete character if that would lose more than half.
 void cutText(std::string& text, size_t most) {
   size_t end = text.rfind('\n', most);
   if (end == std::string::npos || end < most / 2) {

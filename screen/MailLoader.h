@@ -10,10 +10,10 @@
 
 namespace mailscreen {
 
-// Reads mails for the screen on a thread of its own ("tallow.preview"), as Searcher searches.
+// Reads mails for the screen on its own thread ("tallow.preview"). Same rules as Searcher.
 class MailLoader {
  public:
-  // Of a mail for a preview, so many bytes are read, and so many of its text are shown.
+  // Limits of a preview: the bytes read from the mail and the length of the text shown.
   static constexpr size_t kPreviewBytes = size_t{1} << 20;
   static constexpr size_t kPreviewText = size_t{64} << 10;
 

@@ -17,7 +17,7 @@ bool isBlank(std::string_view text) {
   return text.find_first_not_of(' ') == std::string_view::npos;
 }
 
-// The keys that a mail or the help is read with have letters of their own.
+// Letters that work as keys while a mail or the help is shown.
 Event readingKey(char letter) {
   switch (letter) {
     case 'j':
@@ -118,7 +118,7 @@ void Model::pressSearching(const Event& event) {
     default:
       break;
   }
-  // Nobody searches for a question mark alone.
+  // A question mark alone is not a useful search.
   if (event.key == Key::text && event.text == "?" && _line.empty()) return showHelp();
   if (!pressCommand(event) && _line.press(event)) changeSearch();
 }
@@ -156,7 +156,7 @@ void Model::pressHelp(const Event& event) {
   }
 }
 
-// The keys that mean the same with results and in a mail.
+// Keys with the same meaning in the results and in a mail.
 bool Model::pressCommand(const Event& event) {
   switch (event.key) {
     case Key::help:
@@ -184,7 +184,7 @@ void Model::move(bool down) {
 }
 
 bool Model::turnPage(bool forward) {
-  if (!_shown || !_shown->isLike(search())) return false;  // the page is not there yet
+  if (!_shown || !_shown->isLike(search())) return false;  // the page has not arrived yet
   const size_t next = _offset + results();
   const bool more = !_complete || _total > next;
   if (forward ? _rows.empty() || !more : _offset == 0) return false;
@@ -234,7 +234,7 @@ void Model::select(size_t row) {
   _top = 0;
 }
 
-// The row of a mail, or the one next to where it was.
+// The row of a mail, or the nearest row if the mail is no longer listed.
 size_t Model::rowOf(const std::string& identifier) const {
   const auto found = std::find_if(_rows.begin(), _rows.end(),
                                   [&](const Row& row) { return row.identifier == identifier; });
@@ -266,7 +266,7 @@ void Model::changeSearch() {
   _fromBelow = false;
   const Search wanted = search();
   if (!isBlank(wanted.words) || !wanted.folder.empty()) return;
-  // Nothing is searched for, and what is on its way is not wanted.
+  // Nothing to search for; a pending result is no longer wanted.
   _asked.reset();
   _searching = false;
   _shown.reset();
@@ -296,7 +296,7 @@ void Model::take(Found found) {
   _failure = found.failure;
   _reason = std::move(found.reason);
   _remark = std::move(found.remark);
-  // While the daemon starts again, or a word is typed on, what was found stays.
+  // Keeps the results while the daemon restarts or an incomplete query is typed.
   if (_failure == Failure::unreachable || _failure == Failure::query) return;
   const bool same = _shown && _shown->isLike(found.search);
   const Row* const row = selectedRow();
@@ -360,7 +360,7 @@ Search Model::search() const {
   return {_line.text(), _folder, _order, _threads, _offset, std::max(_layout.list.rows, size_t{1})};
 }
 
-// Of the page: results, or conversations.
+// The number of results, or conversations, on the page.
 size_t Model::results() const {
   return static_cast<size_t>(
       std::count_if(_rows.begin(), _rows.end(), [](const Row& row) { return !row.follows; }));

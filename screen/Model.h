@@ -14,53 +14,53 @@ namespace mailscreen {
 
 enum class Mode {
   searching,
-  folder,   // a folder is typed
+  folder,   // a folder name is typed
   reading,  // a mail fills the screen
   help
 };
 
-// Something that needs the terminal.
+// An action that needs the terminal.
 struct Command {
   enum class Kind { copy, open, suspend, redraw };
   Kind kind;
   std::string place = {};  // of the mail
 };
 
-// All that the screen shows, and what a key does to it. Knows neither terminal nor daemon: what has
-// to be done it hands out, and takes what comes of it. One thread.
+// The state of the screen and the effect of each key. Independent of the terminal and the daemon:
+// it hands out the work to do and takes the results. One thread.
 class Model {
  public:
-  // In.
+  // Input.
   void resize(size_t rows, size_t columns);
   void press(const Event& event);
-  // Results of an earlier search than the last are dropped, and so are mails.
+  // Drops results of any search but the last, and likewise mails.
   void take(Found found);
   void take(Mail mail);
-  // Something to tell until the next key.
+  // A message to show until the next key.
   void tell(std::string message) { _message = std::move(message); }
-  // Lets a search that failed be tried again.
+  // Requests the failed search again.
   void retry();
 
-  // Out: what has to be done, once.
+  // Output: work to do, each handed out once.
   [[nodiscard]] std::optional<Search> nextSearch();
   [[nodiscard]] std::optional<MailRequest> nextMail();
   [[nodiscard]] std::optional<Command> nextCommand();
-  // The last search has failed, and may not the next time.
+  // True if the last search failed and a retry may succeed.
   [[nodiscard]] bool wantsRetry() const {
     return !_searching && (_failure == Failure::unreachable || _failure == Failure::refused);
   }
   [[nodiscard]] bool done() const { return _done; }
 
-  // To be drawn.
+  // State to draw.
   [[nodiscard]] Mode mode() const { return _mode; }
   [[nodiscard]] const Layout& layout() const { return _layout; }
   [[nodiscard]] const LineEditor& line() const { return _line; }
   [[nodiscard]] const LineEditor& folderLine() const { return _folderLine; }
   [[nodiscard]] const std::vector<Row>& rows() const { return _rows; }
   [[nodiscard]] size_t selected() const { return _selected; }
-  // The row at the top of the list.
+  // The first visible row of the list.
   [[nodiscard]] size_t firstRow() const;
-  // The mail or the help, broken for its box, and the line at the top.
+  // The mail or the help, wrapped for its box, and its first visible line.
   [[nodiscard]] const Document& document() const { return _mode == Mode::help ? _help : _mail; }
   [[nodiscard]] size_t firstLine() const;
   // Left: a message, failure, remark or hint. Right: order, threads, folder and place.
@@ -90,19 +90,19 @@ class Model {
 
   Layout _layout;
   Mode _mode = Mode::searching;
-  Mode _before = Mode::searching;  // the help
+  Mode _before = Mode::searching;  // before the help was opened
   LineEditor _line;
   LineEditor _folderLine;
   std::string _folder;
   cli::SortOrder _order = cli::SortOrder::relevance;
   bool _threads = false;
   size_t _offset = 0;
-  bool _fromBelow = false;  // the last result of the page is to be selected
+  bool _fromBelow = false;  // select the last result of the page
   bool _done = false;
 
-  std::optional<Search> _asked;  // the last search that was handed out
-  bool _searching = false;       // it has no answer yet
-  std::optional<Search> _shown;  // the one that the rows are of
+  std::optional<Search> _asked;  // the last search handed out
+  bool _searching = false;       // its result has not arrived
+  std::optional<Search> _shown;  // the search of the current rows
   std::vector<Row> _rows;
   size_t _selected = 0;
   size_t _total = 0;
@@ -119,8 +119,8 @@ class Model {
   bool _mailCut = false;
   Document _mail;
   Document _help;
-  size_t _top = 0;      // of the mail that is read
-  size_t _helpTop = 0;  // of the help
+  size_t _top = 0;      // first visible line of the mail
+  size_t _helpTop = 0;  // first visible line of the help
 };
 
 }  // namespace mailscreen

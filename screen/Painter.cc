@@ -12,7 +12,7 @@ namespace mailscreen {
 
 namespace {
 
-// Terminals that know them show what is between the two at once.
+// Terminals that support them show everything between the two as one update.
 constexpr std::string_view kUpdateBegins = "\x1b[?2026h";
 constexpr std::string_view kUpdateEnds = "\x1b[?2026l";
 
@@ -20,7 +20,7 @@ constexpr short kMatchPair = 1;
 constexpr short kDatePair = 2;
 constexpr short kFromPair = 3;
 
-// The columns of a row; a part without columns is left out.
+// The column widths of a row; a part of width 0 is left out.
 struct RowColumns {
   size_t date = 0;
   size_t from = 0;
@@ -34,7 +34,8 @@ RowColumns rowColumnsOf(size_t columns) {
   return {};
 }
 
-// The part of a line that a box has room for, so that the cursor is seen, and where the cursor is.
+// The visible part of a line that is too long for its box, chosen so that the cursor is inside, and
+// the column of the cursor.
 struct Window {
   GlyphsView glyphs;
   size_t cursor = 0;  // columns
@@ -60,7 +61,7 @@ bool fillsScreen(Mode mode) {
   return mode == Mode::reading || mode == Mode::help;
 }
 
-// The prompt goes where there is little room.
+// The prompt is left out if there is little space.
 size_t promptColumns(size_t columns, Mode mode) {
   const size_t prompt = std::string_view(promptOf(mode)).size();
   return columns >= 3 * prompt ? prompt : 0;
@@ -123,7 +124,7 @@ void Painter::paintRow(const Row& row, bool selected, size_t screenRow, const Bo
     return selection | static_cast<attr_t>(_colored && !selected ? COLOR_PAIR(pair) : A_NORMAL);
   };
   size_t column = box.column;
-  // With a space after each part.
+  // Each part is followed by a space.
   const auto field = [&](size_t width, const Glyphs& glyphs, attr_t base) {
     if (width == 0) return;
     _base = base;
@@ -201,7 +202,7 @@ void Painter::put(size_t row, size_t column, size_t columns, GlyphsView glyphs, 
     const size_t width = columnsOf(glyph);
     if (used + width > columns) break;
     used += width;
-    // A combining character would go to the cell before.
+    // A combining character would be drawn in the cell before.
     if (used > 0) run.push_back(static_cast<wchar_t>(glyph));
   }
   flush();

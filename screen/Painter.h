@@ -4,8 +4,8 @@
 
 namespace mailscreen {
 
-// Draws a model on the terminal of the TerminalSession. Only cells that have changed are written,
-// as one update where the terminal knows how.
+// Draws a model on the terminal of the TerminalSession. Writes only changed cells, as one update if
+// the terminal supports it.
 class Painter {
  public:
   explicit Painter(bool colored);
@@ -20,13 +20,13 @@ class Painter {
   void paintDocument(const Model& model, const Box& box);
   void paintStatus(const Model& model);
   void placeCursor(const Model& model);
-  // Draws glyphs with their marks into so many columns of a row, and spaces after them.
+  // Draws glyphs with their marks into `columns` columns of a row, padded with spaces.
   void put(size_t row, size_t column, size_t columns, GlyphsView glyphs,
            Style style = Style::plain) const;
   void setStyle(Style style) const;
 
   const bool _colored;
-  // What the glyphs of a part have in common, as attributes of the library.
+  // The attributes that all glyphs of a part share, in the library's form.
   unsigned long _base = 0;
 };
 

@@ -30,10 +30,10 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-// How long a search that failed waits until it is tried again.
+// Pause before a failed search is retried.
 constexpr std::chrono::milliseconds kRetryAfter(1000);
 
-// Waits for keys, signals and the threads that work for the screen, and has the model draw itself.
+// The event loop: waits for keys, signals and the worker threads, and draws the model.
 class Loop {
  public:
   Loop(const cli::Options& options, const SignalQueue& signals, TerminalSession& terminal)
@@ -44,7 +44,7 @@ class Loop {
         _searcher(options, [this] { wake(); }),
         _loader(options, [this] { wake(); }) {}
 
-  // Until the end; the signal that asked for it, or 0.
+  // Runs until the end. Returns the signal that ended it, or 0.
   int run() {
     _model.resize(_terminal.rows(), _terminal.columns());
     while (!_model.done() && _endedBy == 0 && !_hungUp) {
@@ -85,7 +85,7 @@ class Loop {
     _hungUp = (events[0].revents & (POLLHUP | POLLERR | POLLNVAL)) != 0;
   }
 
-  // As poll takes it: -1 where there is nothing to try again.
+  // A timeout for poll; -1 if there is nothing to retry.
   int millisecondsToRetry() {
     if (!_model.wantsRetry()) _retryAt.reset();
     if (_model.wantsRetry() && !_retryAt) _retryAt = Clock::now() + kRetryAfter;
@@ -157,7 +157,8 @@ class Loop {
     if (failure != 0) _model.tell("$TALLOW_OPEN: " + platform::posixError(failure, "sh").message);
   }
 
-  // The program has the terminal. It may take as long as it likes, but not longer than this one.
+  // The program owns the terminal. It may run as long as it likes, but not longer than this
+  // process.
   void waitFor(pid_t process) {
     const platform::FileDescriptor ended(static_cast<int>(syscall(SYS_pidfd_open, process, 0)));
     int status = 0;
@@ -165,7 +166,7 @@ class Loop {
       std::array<pollfd, 2> events{{{ended.get(), POLLIN, 0}, {_signals.descriptor(), POLLIN, 0}}};
       poll(events.data(), events.size(), static_cast<int>(kRetryAfter.count()));
       while (const auto signal = _signals.next()) {
-        // Ctrl-C and Ctrl-\ are the program's own.
+        // Ctrl-C and Ctrl-\ are for the program.
         if (*signal == SIGTERM || *signal == SIGHUP) _endedBy = *signal;
         if (*signal == SIGTSTP) SignalQueue::surrenderTo(SIGTSTP);
       }
@@ -201,7 +202,7 @@ cli::ExitStatus runScreen(const cli::Options& options) {
     }
     endedBy = Loop(options, signals, *terminal).run();
   }
-  // As Ctrl-C leaves, so does its signal.
+  // SIGINT ends the screen normally, as Ctrl-C does.
   if (endedBy != 0 && endedBy != SIGINT) SignalQueue::surrenderTo(endedBy);
   return cli::ExitStatus::done;
 }

@@ -5,8 +5,8 @@
 // Search as you type, on a terminal.
 namespace mailscreen {
 
-// Runs until the user leaves, or a signal asks for the end; then the terminal is as it was before.
-// A daemon that is not there is waited for.
+// Runs until the user leaves or a signal ends it, then restores the terminal. Waits for a daemon
+// that is not running.
 [[nodiscard]] cli::ExitStatus runScreen(const cli::Options& options);
 
 }  // namespace mailscreen

@@ -20,7 +20,8 @@ namespace mailscreen {
 
 namespace {
 
-// As a shell would hand it over: cut at spaces, but not in quotes. Joined by spaces it is the line.
+// Splits the line as a shell does: at spaces outside of quotes. Joined by spaces, the parts give
+// the line again.
 std::vector<std::string> argumentsOf(const std::string& line) {
   std::vector<std::string> arguments(1);
   bool quoted = false;
@@ -44,7 +45,7 @@ void fail(Found& found, Failure failure, std::string reason) {
   found.reason = std::move(reason);
 }
 
-// A part of a list that begins at `offset`, as far as there is one.
+// The part of a list from `offset` on, if the list is that long.
 template <typename T>
 std::span<const T> pageOf(const std::vector<T>& all, const Search& search) {
   const auto rest = std::span(all).subspan(std::min(all.size(), search.offset));
@@ -93,7 +94,7 @@ void Searcher::searchFor(const cli::QueryInput& input, const cli::Options& optio
   std::optional<TLError> error;
   auto outcome = cli::findHits(options, input.plan, _service, _facts, &error, stop);
   if (!outcome && rpc::isUnreachable(error)) {
-    // The daemon that was there may have been started anew.
+    // The daemon may have been restarted.
     outcome = cli::findHits(options, input.plan, _service, _facts, &error, stop);
   }
   if (!outcome && rpc::isUnreachable(error)) {

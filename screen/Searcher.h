@@ -17,12 +17,12 @@ struct QueryInput;
 
 namespace mailscreen {
 
-// Searches on a thread of its own ("tallow.searcher") over a connection of its own. `wake` is
-// called there when there is something to take. One thread uses it; no call waits, but for the
-// destructor, which ends the call in hand.
+// Searches on its own thread ("tallow.searcher") and connection. `wake` is called on that thread
+// when a result is ready. Used by one thread. No call waits, except the destructor, which
+// interrupts the current call.
 class Searcher {
  public:
-  // Runtime directory, class and name of the options count.
+  // Uses the runtime directory, class and name of the options.
   Searcher(const cli::Options& options, std::function<void()> wake);
   ~Searcher() { _service.interrupt(); }
   Searcher(const Searcher&) = delete;
@@ -32,7 +32,7 @@ class Searcher {
   [[nodiscard]] std::optional<Found> take() { return _worker.take(); }
 
  private:
-  // On the worker's thread, as are those below.
+  // Runs on the worker's thread, like the following functions.
   Found run(const Search& search, const std::stop_token& stop);
   void searchFor(const cli::QueryInput& input, const cli::Options& options,
                  const std::stop_token& stop, Found& found);
@@ -43,7 +43,8 @@ class Searcher {
   const cli::Options _options;
   client::SearchServiceProxy _service;
   cli::MailFacts _facts;
-  LatestWorker<Search, Found> _worker;  // the last, so that its thread ends before what it uses
+  LatestWorker<Search, Found>
+      _worker;  // last member: its thread ends before the members that it uses
 };
 
 }  // namespace mailscreen

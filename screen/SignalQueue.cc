@@ -41,7 +41,7 @@ void SignalQueue::surrenderTo(int signal) {
   sigaction(signal, &usual, &own);
   raise(signal);
   pthread_sigmask(SIG_UNBLOCK, &one, &before);
-  // Here it has ended or stopped; stopped, it goes on.
+  // If the default action only stopped the process, it continues here.
   pthread_sigmask(SIG_SETMASK, &before, nullptr);
   sigaction(signal, &own, nullptr);
 }

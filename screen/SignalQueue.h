@@ -8,8 +8,8 @@
 
 namespace mailscreen {
 
-// The signals that concern a screen, as events of a descriptor. While it lives they are blocked, in
-// this thread and in those that it starts meanwhile.
+// Delivers the signals that concern a screen through a descriptor. During its lifetime they are
+// blocked in this thread and in threads started from it.
 class SignalQueue {
  public:
   SignalQueue();
@@ -17,12 +17,12 @@ class SignalQueue {
   SignalQueue(const SignalQueue&) = delete;
   SignalQueue& operator=(const SignalQueue&) = delete;
 
-  // Readable where a signal has come.
+  // Readable when a signal has arrived.
   [[nodiscard]] int descriptor() const { return _descriptor.get(); }
-  // The next that has come, if any.
+  // The next signal, if one has arrived.
   [[nodiscard]] std::optional<int> next() const;
 
-  // Lets a signal do what it does by default, now.
+  // Performs the default action of a signal now.
   static void surrenderTo(int signal);
 
  private:

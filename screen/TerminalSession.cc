@@ -17,7 +17,7 @@ namespace mailscreen {
 
 namespace {
 
-// How long an escape key waits for the rest of what may be the code of another one.
+// How long to wait after an escape byte for the rest of a key's code.
 constexpr int kEscapeMilliseconds = 25;
 
 constexpr std::string_view kMarkPastes = "\x1b[?2004h";

@@ -8,31 +8,30 @@ struct screen;
 
 namespace mailscreen {
 
-// The terminal of the standard input and output while a screen is drawn on it: raw, with keys as
-// codes and pasted text told apart. What it was before is restored at the end. At most one at a
-// time; one thread.
+// The terminal of the standard input and output while a screen is drawn on it: in raw mode, with
+// keys as codes and pasted text marked. Restored at the end. At most one at a time; one thread.
 class TerminalSession {
  public:
-  // Codes of the keys that stand around pasted text.
+  // Codes of the virtual keys before and after pasted text.
   static constexpr int kPasteBegins = 0x1000;
   static constexpr int kPasteEnds = 0x1001;
 
-  // Null where nothing is known of a terminal of this kind ($TERM).
+  // Null if the type of the terminal ($TERM) is unknown.
   [[nodiscard]] static std::unique_ptr<TerminalSession> open();
   ~TerminalSession();
   TerminalSession(const TerminalSession&) = delete;
   TerminalSession& operator=(const TerminalSession&) = delete;
 
-  // Gives the terminal back for a while, and takes it again.
+  // Releases the terminal temporarily, and takes it back.
   void leave();
   void comeBack();
 
-  // The size may have changed.
+  // Reads the size again, after it may have changed.
   void measure();
   [[nodiscard]] size_t rows() const;
   [[nodiscard]] size_t columns() const;
 
-  // Asks the terminal to put a text on the clipboard, of at most kMaxCopied bytes.
+  // Asks the terminal to copy a text of at most kMaxCopied bytes to the clipboard.
   static constexpr size_t kMaxCopied = 8192;
   void copy(std::string_view text);
 
@@ -44,7 +43,7 @@ class TerminalSession {
   bool _away = false;
 };
 
-// Writes control sequences past the screen library, between two of its updates.
+// Writes a control sequence directly, bypassing the screen library, between two of its updates.
 void writeToTerminal(std::string_view sequence);
 
 }  // namespace mailscreen
