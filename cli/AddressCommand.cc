@@ -24,16 +24,16 @@ using usersyntax::Kind;
 using usersyntax::Node;
 using Key = TLAttributeKey;
 
-// Mails that are looked at for senders, and as many for recipients.
+// The number of mails searched for senders, and again for recipients.
 constexpr size_t kMails = 1000;
 
-// A mail of that age counts half as much as one of today, which counts 1.
+// A mail of this age counts half as much as one of today, which counts 1.
 constexpr double kHalfLifeSeconds = 180 * 86400.0;
 constexpr double kUndatedWeight = 0.01;
 
 // A sender or a recipient.
 struct Contact {
-  std::string address;                       // as in the newest mail
+  std::string address;                       // as spelled in the newest mail
   std::map<std::string, double> names = {};  // with their weight
   double weight = 0;
   size_t mails = 0;
@@ -47,7 +47,7 @@ struct Contact {
   }
 };
 
-// All of the words, each of which may go on, in one field.
+// All words as prefixes in one field.
 Node wordsIn(Field field, const std::vector<std::string>& words) {
   Node all;
   all.kind = Kind::conjunction;
@@ -83,7 +83,7 @@ class AddressBook {
     }
   }
 
-  // The most likely first: by how often and how recently.
+  // Most likely first, by how often and how recently.
   [[nodiscard]] std::vector<Contact> ranked() const {
     std::vector<Contact> list;
     for (const auto& [key, contact] : _contacts) list.push_back(contact);
@@ -106,7 +106,7 @@ class AddressBook {
     ++contact.mails;
   }
 
-  // Remembered by text, since the same persons come again and again.
+  // Cached by text, because the same people appear again and again.
   bool isMeant(const std::string& name, const std::string& address) {
     const std::string text = name + ' ' + address;
     const auto [at, added] = _meant.try_emplace(text, false);
@@ -120,11 +120,11 @@ class AddressBook {
 
   const std::vector<std::string> _words;
   const double _now;
-  std::map<std::string, Contact> _contacts;  // by address in small letters
+  std::map<std::string, Contact> _contacts;  // by address in lower case
   std::map<std::string, bool> _meant;
 };
 
-// ADDRESS <tab> NAME <tab> what else is known, as mutt and aerc take it.
+// ADDRESS <tab> NAME <tab> more information, the format that mutt and aerc read.
 std::string linesOf(const std::vector<Contact>& contacts) {
   std::string out;
   for (const Contact& contact : contacts) {
@@ -145,7 +145,7 @@ std::string jsonOf(const std::vector<Contact>& contacts) {
   return jsonText(list);
 }
 
-// Those who have sent or got the mails that the daemon finds by the words.
+// Adds the senders and recipients of the mails that the daemon finds for the words.
 bool findContacts(const Options& options, const std::vector<std::string>& words, AddressBook& book,
                   TLErrorOut error) {
   Node tree;

@@ -23,8 +23,8 @@ bool isOption(const std::string& argument) {
   return argument.size() > 1 && argument[0] == '-';
 }
 
-// After `search` and the like, a word that begins with one minus is not an option unless it is one
-// of the short options.
+// After `search` and similar commands, a word that begins with one minus is an option only if it is
+// one of the short options.
 void markWords(std::vector<std::string>& arguments) {
   const std::string& command = arguments.front();
   if (command != "search" && command != "explain" && command != "save") return;

@@ -6,9 +6,9 @@
 
 namespace cli {
 
-// The command line, of which the first is the program, with the command in front, so that its
-// options may stand before it as well. The minus of a word to search for, such as -draft, is
-// replaced by a control character, since it would be taken for options; see restoreWords.
+// The arguments after the program's name, with the command moved to the front, because options may
+// also stand before it. The minus of a word such as -draft is replaced by a control character,
+// because it would be read as options; see restoreWords.
 [[nodiscard]] std::vector<std::string> commandFirst(int argc, const char* const* argv,
                                                     const CLI::App& app);
 void restoreWords(std::vector<std::string>& words);

@@ -7,16 +7,16 @@
 
 namespace cli {
 
-// How many items a call brings, so that the daemon has some 50 ms of work with it: a search that
-// comes meanwhile waits for that long.
+// Chooses the number of items per call so that a call keeps the daemon busy for about 50 ms, which
+// is how long a search may have to wait for it.
 //
-// A reply may also be late because the daemon has waited for something else, a merge above all. So
-// the time of an item is taken from the quickest replies: a quicker one counts at once, a slower
-// one raises it by a tenth.
+// A reply may also be late because the daemon waited for something else, mostly a merge. So the
+// time per item follows the quickest replies: a quicker reply counts at once, a slower one raises
+// the estimate by a tenth.
 class BatchPace {
  public:
   static constexpr std::chrono::milliseconds kWork{50};
-  static constexpr size_t kFirst = 20;  // before there is a reply
+  static constexpr size_t kFirst = 20;  // before the first reply
   static constexpr size_t kMin = 5;
   static constexpr size_t kMax = 500;
 

@@ -10,16 +10,16 @@
 
 namespace cli {
 
-// How many batches wait at most for the thread that sends them, so that reading never runs far
+// Maximum number of batches that wait for the sending thread, so that reading does not run far
 // ahead.
 inline constexpr size_t kQueuedBatches = 2;
 
-// Hands batches from a thread that reads mail to the thread that sends it. One thread calls `push`
+// Passes batches from a thread that reads mail to the thread that sends it. One thread calls `push`
 // and `end`, another `next` and `cancel`.
 template <typename Batch>
 class BatchQueue {
  public:
-  // Waits for room; false once the queue is cancelled.
+  // Waits for space; false if the queue has been cancelled.
   bool push(Batch batch) TL_EXCLUDES(_mutex) {
     {
       const platform::MutexLock lock(_mutex);
@@ -31,7 +31,7 @@ class BatchQueue {
     return true;
   }
 
-  // No batch follows.
+  // Call after the last batch.
   void end() TL_EXCLUDES(_mutex) {
     {
       const platform::MutexLock lock(_mutex);
@@ -40,7 +40,7 @@ class BatchQueue {
     _changed.notify_all();
   }
 
-  // Waits for the next batch; none after the last.
+  // Waits for the next batch; nullopt after the last.
   [[nodiscard]] std::optional<Batch> next() TL_EXCLUDES(_mutex) {
     std::optional<Batch> batch;
     {
@@ -54,7 +54,7 @@ class BatchQueue {
     return batch;
   }
 
-  // No batch is wanted any more.
+  // The consumer wants no more batches.
   void cancel() TL_EXCLUDES(_mutex) {
     {
       const platform::MutexLock lock(_mutex);

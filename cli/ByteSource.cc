@@ -18,7 +18,7 @@ namespace {
 
 constexpr size_t kBufferBytes = size_t{64} << 10;
 
-// Enough for what xz -9 makes; a file that asks for more is refused.
+// Enough for files from xz -9; a file that needs more is refused.
 constexpr uint64_t kMaxDecoderBytes = uint64_t{160} << 20;
 
 constexpr const char* kCompressionDomain = "compression";
@@ -33,14 +33,14 @@ std::nullopt_t fail(TLErrorOut error, int code, const char* message) {
   return std::nullopt;
 }
 
-// The file as it is, through a buffer that the decoders read in place.
+// The file without decoding, with a buffer that decoders read in place.
 class FileSource final : public ByteSource {
  public:
   explicit FileSource(int descriptor)
       : _descriptor(descriptor), _buffer(std::make_unique_for_overwrite<char[]>(kBufferBytes)) {}
   ~FileSource() override { close(_descriptor); }
 
-  // The bytes in the buffer, at least one unless the file has ended.
+  // The buffered bytes; empty only at the end of the file.
   std::optional<std::string_view> peek(TLErrorOut error) {
     if (_begin == _end) {
       ssize_t n;
@@ -70,7 +70,7 @@ class FileSource final : public ByteSource {
   }
   uint64_t consumed() const override { return _consumed; }
 
-  // Does not read what it passes over.
+  // Seeks instead of reading.
   bool advance(uint64_t count, TLErrorOut error) override {
     const size_t buffered = static_cast<size_t>(std::min<uint64_t>(count, _end - _begin));
     skip(buffered);
@@ -92,8 +92,8 @@ class FileSource final : public ByteSource {
   uint64_t _consumed = 0;
 };
 
-// gzip, also several members in a row. What follows the last one and is no member is ignored, as
-// gzip does.
+// gzip, possibly with several members. Trailing bytes that are not a member are ignored, as gzip
+// does.
 class GzipSource final : public ByteSource {
  public:
   explicit GzipSource(std::unique_ptr<FileSource> file) : _file(std::move(file)) {
@@ -185,7 +185,7 @@ bool ByteSource::advance(uint64_t count, TLErrorOut error) {
 }
 
 std::unique_ptr<ByteSource> openByteSource(const std::string& path, TLErrorOut error) {
-  // O_NONBLOCK, so that a pipe in the place of a file does not hold us up.
+  // O_NONBLOCK, so that opening a pipe does not block.
   const int descriptor = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
   struct stat info;
   if (descriptor < 0 || fstat(descriptor, &info) != 0) {

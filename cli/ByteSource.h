@@ -10,24 +10,24 @@
 
 namespace cli {
 
-// The bytes of a mail file, decompressed as they are read, in memory that does not grow with the
-// file. One thread.
+// Reads the bytes of a mail file and decompresses them on the fly. Memory use does not grow with
+// the file. One thread.
 class ByteSource {
  public:
   virtual ~ByteSource() = default;
 
-  // Puts at most `size` bytes into `buffer` and returns their number, 0 at the end; none, with an
-  // error, when the file cannot be read or decompressed any further.
+  // Reads at most `size` bytes into `buffer` and returns their number, 0 at the end. Nullopt with
+  // an error if the file cannot be read or decompressed further.
   [[nodiscard]] virtual std::optional<size_t> read(char* buffer, size_t size, TLErrorOut error) = 0;
 
-  // Passes over so many bytes, as far as there are any; false, with an error, as for `read`.
+  // Skips up to `count` bytes; stops at the end of the file. False with an error, as for `read`.
   [[nodiscard]] virtual bool advance(uint64_t count, TLErrorOut error);
 
-  // How much of the file itself has been read.
+  // Bytes read from the file itself, before decompression.
   [[nodiscard]] virtual uint64_t consumed() const = 0;
 };
 
-// Opens a regular file, which may be compressed with gzip or xz; its first bytes tell.
+// Opens a regular file, which may be compressed with gzip or xz, detected by its first bytes.
 [[nodiscard]] std::unique_ptr<ByteSource> openByteSource(const std::string& path, TLErrorOut error);
 
 }  // namespace cli

@@ -68,7 +68,7 @@ ExitStatus runStats(const Options& options) {
     if (key == TLDebugServiceDocStoreNumOfItems) unsearchable += *count;
     if (key == TLDebugServiceTextStoreNumOfItems) unsearchable -= *count;
   }
-  // A batch that was never acknowledged, since the daemon was killed in its midst, say.
+  // From a batch that was never acknowledged, for example because the daemon was killed.
   if (unsearchable > 0) {
     text += fmt::format("{} stored and not searchable: index the mail again\n", unsearchable);
   }
@@ -76,7 +76,7 @@ ExitStatus runStats(const Options& options) {
                                                     : text);
 }
 
-// A text of the daemon: as it is, or as the value of one key.
+// Prints a text from the daemon, as it is or as the value of one JSON key.
 ExitStatus printText(const Options& options, const char* key,
                      const std::optional<std::string>& text, const std::optional<TLError>& error) {
   if (!text) return complain(error);

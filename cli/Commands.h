@@ -8,39 +8,39 @@
 
 namespace cli {
 
-// Carries out one command: its result goes to the standard output, all else to the standard error.
+// Runs one command. Its result goes to the standard output, everything else to the standard error.
 [[nodiscard]] ExitStatus runCommand(const Options& options);
 
-// Of runCommand, the one that reads mail.
+// Parts of runCommand: the command that reads mail.
 [[nodiscard]] ExitStatus runIndex(const Options& options);
 
-// Of runCommand, those that keep the index in step with mailboxes.
+// The commands that keep the index in step with mailboxes.
 [[nodiscard]] ExitStatus runSync(const Options& options);
 [[nodiscard]] ExitStatus runWatch(const Options& options);
 [[nodiscard]] ExitStatus runStatus(const Options& options);
 
-// Of runCommand, those that search.
+// The commands that search.
 [[nodiscard]] ExitStatus runSearch(const Options& options);
 [[nodiscard]] ExitStatus runExplain(const Options& options);
 
-// Of runCommand, those for single mails, people, and searches that are kept.
+// The commands for single mails, people and saved searches.
 [[nodiscard]] ExitStatus runShow(const Options& options);
 [[nodiscard]] ExitStatus runDelete(const Options& options);
 [[nodiscard]] ExitStatus runAddress(const Options& options);
 [[nodiscard]] ExitStatus runSave(const Options& options);
 
-// Of runCommand, those that look at an index without the daemon.
+// The commands that read an index without the daemon.
 [[nodiscard]] ExitStatus runDump(const Options& options);
 [[nodiscard]] ExitStatus runValidate(const Options& options);
 [[nodiscard]] ExitStatus runPurge(const Options& options);
 
-// Writes the result of a command, or a piece of it; a full disk or a closed pipe is a failure.
+// Writes the result of a command, or a part of it. Fails on a full disk or a closed pipe.
 [[nodiscard]] ExitStatus print(std::string_view text, ExitStatus status = ExitStatus::done);
 
-// Says "tallow: MESSAGE" on the standard error.
+// Writes "tallow: MESSAGE" to the standard error.
 void complain(const std::string& message);
 
-// The same for an error; the status that goes with it.
+// The same for an error. Returns the matching exit status.
 ExitStatus complain(const std::optional<TLError>& error);
 
 }  // namespace cli

@@ -20,16 +20,16 @@ namespace cli {
 
 namespace {
 
-// Answers that are asked for to delete one folder with all below it.
+// Maximum number of searches to delete one folder and everything below it.
 constexpr int kMaxRounds = 1000;
 
-// What became of one argument.
+// The result for one argument.
 struct Deletion {
   uint64_t messages = 0;
   std::optional<TLError> error = {};
 };
 
-// Deletes from the index what the arguments name, one after the other.
+// Deletes the messages and folders that the arguments name, one argument after another.
 class Deleting {
  public:
   explicit Deleting(const Options& options)
@@ -47,7 +47,7 @@ class Deleting {
   }
 
  private:
-  // `sync` names a message of an mbox file by its content, where a user names it by its place.
+  // `sync` identifies a message of an mbox file by its content, but users name it by its place.
   static void addNamesByContent(std::vector<std::string>& identifiers) {
     MailReader reader;
     for (size_t i = identifiers.size(); i > 0; --i) {
@@ -59,7 +59,7 @@ class Deleting {
     }
   }
 
-  // The first of the identifiers that the index knows.
+  // Deletes the first of the identifiers that the index knows.
   Deletion deleteFirst(const std::vector<std::string>& identifiers) {
     Deletion deletion;
     for (const std::string& identifier : identifiers) {
@@ -73,8 +73,8 @@ class Deleting {
     return deletion;
   }
 
-  // All folders at a path or below it. An answer of the daemon's is bounded, so there may be
-  // several; each takes at least one folder out of the next.
+  // Deletes all folders at a path or below it. A reply is bounded, so several may be needed; each
+  // removes at least one folder from the next.
   Deletion deleteFolder(const std::string& path) {
     Deletion deletion;
     for (int round = 0; round < kMaxRounds; ++round) {
@@ -112,7 +112,7 @@ std::string lineOf(const std::string& argument, const Deletion& deletion) {
 
 }  // namespace
 
-// Each argument on its own, so that one that fails does not stop the others.
+// Handles each argument separately, so that a failure does not stop the others.
 ExitStatus runDelete(const Options& options) {
   if (isUnknownClass(options)) return complainOfUnknownClass(options);
   Deleting deleting(options);

@@ -35,7 +35,7 @@ constexpr Row kRows[] = {
     {kDocStoreErrorDomain, static_cast<int>(TALDocStoreError::notFound), "not in the index"},
 };
 
-// The name of a D-Bus error stands in parentheses at the end.
+// The name of a D-Bus error is in parentheses at the end.
 std::string withoutName(const std::string& message) {
   const size_t name = message.rfind(" (");
   return name == std::string::npos ? message : message.substr(0, name);

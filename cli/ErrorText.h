@@ -6,13 +6,13 @@
 
 namespace cli {
 
-// What an error of the daemon or on the way to it means to a person: no URL, domain or number.
+// Explains an error from the daemon or the connection to a user, without URLs, domains or numbers.
 [[nodiscard]] std::string plainText(const TLError& error);
 
-// Whether the daemon says that the index has no such message.
+// Whether the error says that the index has no such message.
 [[nodiscard]] bool isNotIndexed(const TLError& error);
 
-// Whether it refused one message, which then ended its batch.
+// Whether the daemon refused one message, which ends the batch.
 [[nodiscard]] bool isRefusedMessage(const TLError& error);
 
 }  // namespace cli

@@ -6,7 +6,7 @@
 
 namespace cli {
 
-// What stands at the end of a command's help; empty where the synopsis says it all.
+// The examples at the end of a command's help; empty if the synopsis is enough.
 [[nodiscard]] std::string examplesOf(Command command);
 
 }  // namespace cli

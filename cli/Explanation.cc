@@ -17,7 +17,7 @@ namespace {
 
 constexpr const char* kSynonymsInFirstPass = "queryModification.enableSynonymModificationFirstPass";
 
-// A heading, and the text below it, indented.
+// A heading with indented text below it.
 std::string section(const std::string& heading, const std::string& text, const Palette& palette) {
   std::string out = fmt::format("{}{}{}\n", palette.faint, heading, palette.end);
   for (size_t at = 0; at < text.size();) {
@@ -28,7 +28,7 @@ std::string section(const std::string& heading, const std::string& text, const P
   return out;
 }
 
-// As the log has it, but in clear, and with indents that the terminal keeps.
+// The tree as in the log, but with its texts readable and indented for a terminal.
 std::string treeText(const TLQueryNode* tree) {
   if (tree == nullptr) return "(nothing)";
   std::string out;
@@ -111,7 +111,7 @@ std::string explanationText(const QueryInput& input, const std::vector<TALTerm>&
                           : stepsText(input.main, "query", palette);
   if (input.filter) out += stepsText(*input.filter, "filter", palette);
   if (!input.plan.asTyped) out += section("plan", planText(input.plan), palette);
-  // Between marks, since a blank at the end means that the last word is whole.
+  // Quoted, because a space at the end means that the last word is complete.
   const std::string text = platform::toUTF8(platform::orEmpty(input.query->originalQuery()));
   if (!typed) out += section("original query", "->" + text + "<-", palette);
   std::string lines;

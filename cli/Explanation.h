@@ -10,13 +10,13 @@
 
 namespace cli {
 
-// The terms that the daemon makes of the query, under its parameters over the defaults. None where
-// there is no tokenizer.
+// The terms that the daemon derives from the query, with the query's parameters over the defaults.
+// Empty if there is no tokenizer.
 [[nodiscard]] std::vector<TALTerm> termsOf(const TLQuery& query);
-// The same for the queries of all branches, but for what they leave out.
+// The same for the queries of all branches, without their exclusions.
 [[nodiscard]] std::vector<TALTerm> termsOf(const SearchPlan& plan);
 
-// The output of explain, but for the results: each step from the expression to the terms.
+// The output of `explain` without the results: each step from the expression to the terms.
 [[nodiscard]] std::string explanationText(const QueryInput& input,
                                           const std::vector<TALTerm>& terms,
                                           const Palette& palette);

@@ -8,7 +8,7 @@ TLString unflow(TLStringView text, bool delSp) {
   constexpr TLStringView kSignature = u"-- ";
   TLString out;
   out.reserve(text.size());
-  size_t openDepth = TLStringView::npos;  // of the line that goes on, if any
+  size_t openDepth = TLStringView::npos;  // quote depth of the line that continues, if any
   while (!text.empty()) {
     const size_t feed = text.find(u'\n');
     TLStringView line = text.substr(0, feed);

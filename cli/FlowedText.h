@@ -4,9 +4,9 @@
 
 namespace cli {
 
-// The text of a format=flowed part (RFC 3676) with its soft line breaks taken out: a line that ends
-// in a blank goes on in the next of the same quote depth. With `delSp` that blank goes too. Space
-// stuffing is undone; quote marks stay.
+// Removes the soft line breaks of a format=flowed part (RFC 3676). A line that ends with a space
+// continues on the next line of the same quote depth. With `delSp` that space is removed as well.
+// Space stuffing is undone; quote marks are kept.
 [[nodiscard]] TLString unflow(TLStringView text, bool delSp);
 
 }  // namespace cli

@@ -17,7 +17,7 @@ bool isWordCharacter(UChar32 c) {
   return u_isalnum(c) || (U_GET_GC_MASK(c) & U_GC_M_MASK) != 0;
 }
 
-// Case and accents off: compatibility decomposition, folded, without marks.
+// Removes case and accents: compatibility decomposition, case folding, marks dropped.
 icu::UnicodeString fold(TLStringView word) {
   UErrorCode status = U_ZERO_ERROR;
   const icu::Normalizer2* folding = icu::Normalizer2::getNFKCCasefoldInstance(status);
@@ -34,7 +34,7 @@ icu::UnicodeString fold(TLStringView word) {
   return bare;
 }
 
-// Calls body(text, isWord) for each run of word characters and each run of others.
+// Calls body(text, isWord) for each run of word characters and each run of other characters.
 template <typename Body>
 void forEachRun(TLStringView text, const Body& body) {
   size_t begin = 0;
@@ -71,8 +71,8 @@ std::vector<icu::UnicodeString> foldedWords(const std::vector<std::string>& word
   return all;
 }
 
-// The first of the words that a run begins with; the number of words where there is none. Scripts
-// without spaces between words match anywhere in a run.
+// The index of the first word that is a prefix of the run; the number of words if there is none. In
+// scripts without spaces between words, a match may be anywhere in the run.
 size_t matchOf(TLStringView run, const std::vector<icu::UnicodeString>& words) {
   const icu::UnicodeString bare = fold(run);
   const auto found = std::find_if(words.begin(), words.end(), [&](const auto& wanted) {
@@ -82,14 +82,14 @@ size_t matchOf(TLStringView run, const std::vector<icu::UnicodeString>& words) {
   return static_cast<size_t>(found - words.begin());
 }
 
-// A place of a word in a text, and which one it is.
+// The place of a match in a text, and the index of its word.
 struct Place {
   size_t at;
   size_t word;
 };
 
-// The first of the places from which on, in so many characters, there are the most different words.
-// The window slides, with a count of each word in it.
+// The first place after which the given number of characters contains the most different words. A
+// sliding window with a count for each word.
 size_t bestPlace(const std::vector<Place>& places, size_t words, size_t characters) {
   std::vector<size_t> counts(words);
   size_t best = 0;
@@ -110,7 +110,7 @@ bool isSpace(char16_t c) {
   return u_isUWhiteSpace(c) != 0;
 }
 
-// With runs of white space replaced by one space.
+// Replaces each run of white space by one space.
 std::string oneLine(TLStringView text) {
   TLString line;
   for (const char16_t c : text) {
@@ -145,7 +145,7 @@ std::string passageOf(std::string_view text, const std::vector<std::string>& wor
   });
   if (places.empty()) return {};
   const size_t hit = bestPlace(places, wanted.size(), characters / 2);
-  // A quarter goes before it; neither end cuts a word.
+  // A quarter of the passage precedes the match; words at both ends stay complete.
   size_t begin = hit - std::min(hit, characters / 4);
   size_t end = std::min(units.size(), begin + characters);
   while (begin > 0 && begin < hit && !isSpace(units[begin - 1])) ++begin;

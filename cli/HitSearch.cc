@@ -8,9 +8,9 @@ namespace cli {
 
 namespace {
 
-// How many results the daemon is asked for, when `shown` of them are.
+// The number of results to request in order to show `shown`.
 size_t wantedFor(const Options& options, size_t shown) {
-  constexpr size_t kCounted = 1000;  // also what makes threads, unless more are shown
+  constexpr size_t kCounted = 1000;  // also for threads, unless more are shown
   // Copies of the last message shown rank directly after it.
   constexpr size_t kCopies = 30;
   if (options.threads) return std::clamp(shown, kCounted, kMaxThreadedHits);

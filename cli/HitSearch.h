@@ -13,19 +13,20 @@
 
 namespace cli {
 
-// What has been found, with what is known of it.
+// The hits of a search and what is known about their number.
 struct Outcome {
   Hits hits;
   ResultItems items;
   bool complete = true;
   std::vector<client::ReplacedWord> replaced = {};
-  // As many candidates were looked at where that is why there are fewer than were wanted, else 0.
+  // The number of candidates checked, if this limit is why there are fewer hits than requested;
+  // otherwise 0.
   size_t lookedAt = 0;
   size_t unreadable = 0;  // messages that could not be read to check them
 };
 
-// Searches for as many results as the options ask for, and for more as long as copies of messages
-// leave fewer. None, with the error, where the daemon answers with one, or after a stop.
+// Searches for the number of results that the options request, and for more while duplicates of
+// messages leave too few. Nullopt with an error if the daemon fails or the search is stopped.
 [[nodiscard]] std::optional<Outcome> findHits(const Options& options, const SearchPlan& plan,
                                               client::SearchServiceProxy& service, MailFacts& facts,
                                               TLErrorOut error, const std::stop_token& stop = {});

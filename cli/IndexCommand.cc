@@ -34,7 +34,7 @@ uint64_t totalBytes(const std::vector<std::string>& paths) {
   return total;
 }
 
-// One run of `index`: sends the batches and keeps the account.
+// One run of `index`: sends the batches and counts the results.
 class Indexing {
  public:
   explicit Indexing(const Options& options)
@@ -88,7 +88,7 @@ class Indexing {
     _cut += batch.cut.size();
   }
 
-  // Both are false only where going on makes no sense.
+  // Both return false only if continuing makes no sense.
   bool sendInPieces(std::span<const client::EncodedItem> items, TLErrorOut error) {
     while (!items.empty() && !interrupted()) {
       const auto piece = items.first(std::min(_pace.items(), items.size()));
@@ -114,7 +114,7 @@ class Indexing {
       ++_refused;
       return true;
     }
-    // The batch stopped at one item; which one shows when each goes alone.
+    // The batch failed at one item. Sends each item alone to find it.
     for (const client::EncodedItem& item : items) {
       if (!send(std::span(&item, 1), error)) return false;
     }
@@ -160,7 +160,7 @@ class Indexing {
   uint64_t _ignored = 0;
 };
 
-// The standard input to its end, up to one byte more than a message may have.
+// Reads the standard input to its end, up to one byte over the limit of a message.
 std::optional<std::string> readStandardInput() {
   std::string text;
   std::array<char, 65536> buffer;
@@ -174,8 +174,8 @@ std::optional<std::string> readStandardInput() {
   return text;
 }
 
-// One message from the standard input, for delivery agents. It has no place to be named by, and is
-// named by its content.
+// Indexes one message from the standard input, for delivery agents. It has no place, so its
+// identifier comes from its content.
 ExitStatus indexStandardInput(const Options& options) {
   const auto text = readStandardInput();
   if (!text || text->size() > kMaxMessageBytes) {

@@ -12,33 +12,33 @@
 
 namespace cli {
 
-// What the reader of mail hands over in one piece: items to send, and what there is to tell.
+// A batch from the reading thread: items to send, and messages for the user.
 struct MailBatch {
   std::vector<client::EncodedItem> items;
   size_t itemBytes = 0;
-  uint64_t inputBytes = 0;  // read from files since the batch before
+  uint64_t inputBytes = 0;  // read from files since the previous batch
 
   struct Failure {
     std::string where;
     std::string reason;
   };
-  std::vector<Failure> messageFailures;  // passed over, the rest goes on
-  std::vector<Failure> pathFailures;     // a path that was named cannot be read
-  std::vector<std::string> cut;          // messages whose text was too long for the index
+  std::vector<Failure> messageFailures;  // these messages were skipped
+  std::vector<Failure> pathFailures;     // paths on the command line that cannot be read
+  std::vector<std::string> cut;          // messages whose text was truncated for the index
   std::vector<std::string> ignored;      // files of a directory that are no mail
 };
 
-// Bounds of a batch; one goes out when any is reached. The last bounds what a batch without items
-// can gather.
+// Limits of a batch; it is sent when any is reached. The last one limits what a batch without items
+// can collect.
 inline constexpr size_t kBatchBytes = size_t{4} << 20;
 inline constexpr size_t kBatchItems = 500;
 inline constexpr size_t kBatchReports = 1000;
 
-// Reads mail and makes it items on a thread of its own, so that reading and sending overlap.
+// Reads mail and converts it to items on its own thread, so that reading and sending overlap.
 //
-// Threads: `next` and the destructor belong to the thread that made the pipeline. The reading
-// thread shares with it only the queue, and is joined by the destructor, which
-// makes it stop at the next message.
+// Threads: call `next` and the destructor on the thread that created the pipeline. The reading
+// thread shares only the queue with it. The destructor stops the reading thread at the next message
+// and joins it.
 class IndexPipeline {
  public:
   explicit IndexPipeline(std::vector<std::string> paths);
@@ -46,7 +46,7 @@ class IndexPipeline {
   IndexPipeline(const IndexPipeline&) = delete;
   IndexPipeline& operator=(const IndexPipeline&) = delete;
 
-  // Waits for the next batch; none at the end.
+  // Waits for the next batch; nullopt at the end.
   [[nodiscard]] std::optional<MailBatch> next() { return _queue.next(); }
 
  private:
@@ -55,7 +55,7 @@ class IndexPipeline {
   void run();
 
   const std::vector<std::string> _paths;
-  BatchQueue<MailBatch> _queue;  // synchronised by itself
+  BatchQueue<MailBatch> _queue;  // thread-safe
   std::thread _thread;
 };
 

@@ -20,8 +20,8 @@
 #include "cli/SyncCommand.h"
 #include "platform/FileDescriptor.h"
 
-// Dump, validate and purge. The text index is the daemon's, so a program of its own reads it,
-// tallow-inspect; here it is run, and what it writes is made fit to be shown.
+// Dump, validate and purge. The daemon's text index is read by a separate program, tallow-inspect.
+// These commands run it and clean its output for the terminal.
 namespace cli {
 
 namespace {
@@ -29,7 +29,7 @@ namespace {
 constexpr const char* kProgram = "tallow-inspect";
 constexpr size_t kPieceBytes = 64 * 1024;
 
-// Beside this program, as it is built, or where it is installed.
+// In the directory of this program, as in a build, or where it is installed.
 std::string programPath() {
   std::error_code ignored;
   const auto bin = std::filesystem::read_symlink("/proc/self/exe", ignored).parent_path();
@@ -38,7 +38,7 @@ std::string programPath() {
                                                   : bin.parent_path() / "libexec/tallow" / kProgram;
 }
 
-// The program at work; ends before this object does.
+// The running program; ends before this object.
 class Inspector {
  public:
   Inspector() = default;
@@ -46,13 +46,13 @@ class Inspector {
   Inspector(const Inspector&) = delete;
   Inspector& operator=(const Inspector&) = delete;
 
-  // False, with a word, when it cannot be run.
+  // False, after a message, if it cannot be run.
   [[nodiscard]] bool start(const char* command, const Options& options);
 
-  // Hands out what it writes, in pieces, until its end or until `take` returns false.
+  // Passes its output to `take` in pieces, until it ends or `take` returns false.
   void read(const std::function<bool(std::string_view)>& take);
 
-  // How it ended, as of waitpid. If it still writes, it ends by SIGPIPE.
+  // Its wait status, as from waitpid. If it is still writing, it ends by SIGPIPE.
   int end();
 
  private:
@@ -109,7 +109,7 @@ int Inspector::end() {
   return status;
 }
 
-// A corrupt index can end the program by an assertion, which has been told.
+// A corrupt index can make the program fail an assertion, which it has then reported.
 bool metAssertion(int status) {
   return WIFSIGNALED(status) && WTERMSIG(status) == SIGABRT;
 }

@@ -28,8 +28,8 @@ std::string variable(const char* name) {
   return value == nullptr ? "" : value;
 }
 
-// The number of ticks after the start of the system at which a process began; empty where that
-// cannot be told. It is the 20th field after the name of the program, which stands in parentheses.
+// The start time of a process, in ticks since boot; empty if unknown. It is the 20th field after
+// the program's name, which is in parentheses.
 std::string startOf(pid_t process) {
   const auto status = platform::readFile(fmt::format("/proc/{}/stat", process), 4096, nullptr);
   if (!status) return "";
@@ -41,7 +41,7 @@ std::string startOf(pid_t process) {
   return status->substr(at + 1, status->find(' ', at + 1) - at - 1);
 }
 
-// The name of the file of this session; empty where there is none.
+// The file name for this session; empty if there is no session.
 std::string sessionName() {
   const std::string named = variable("TALLOW_SESSION");
   if (!named.empty()) {
@@ -55,7 +55,7 @@ std::string sessionName() {
   return fmt::format("terminal-{}-{}", leader, startOf(leader));
 }
 
-// The daemon's directory of that name is used where it is there, and never made here.
+// Uses the daemon's directory of that name if it exists, and never creates it.
 std::string directory() {
   const std::string runtime = variable("XDG_RUNTIME_DIR");
   if (runtime.starts_with('/')) {

@@ -7,7 +7,7 @@ namespace cli {
 LineReader::LineReader(std::unique_ptr<ByteSource> source)
     : _source(std::move(source)), _buffer(kBufferBytes) {}
 
-// Moves what is left to the front and reads until the buffer is full or the source has ended.
+// Moves the remaining bytes to the front and fills the buffer, unless the source has ended.
 void LineReader::fill() {
   std::memmove(_buffer.data(), _buffer.data() + _begin, _end - _begin);
   _end -= _begin;

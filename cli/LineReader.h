@@ -23,10 +23,10 @@ class LineReader {
     bool startsLine;
   };
 
-  // Lives until the next call. None at the end, and after a failure, which `error` then tells.
+  // Valid until the next call. Nullopt at the end and after a failure; see `error`.
   [[nodiscard]] std::optional<Piece> next();
 
-  // What is next, up to the size of the buffer, without consuming it.
+  // The next bytes, up to the size of the buffer, without consuming them.
   [[nodiscard]] std::string_view peek();
 
   [[nodiscard]] const std::optional<TLError>& error() const { return _error; }

@@ -10,9 +10,9 @@ namespace cli {
 
 namespace {
 
-// Header fields beyond this are not looked at.
+// Header fields beyond this are ignored.
 constexpr size_t kMaxHeadBytes = size_t{64} << 10;
-// Heads that are remembered at most.
+// Maximum number of cached heads.
 constexpr size_t kMaxHeads = 200000;
 
 std::string_view withoutBrackets(std::string_view id) {
@@ -34,7 +34,7 @@ MailHead headOf(std::string_view message) {
   return head;
 }
 
-// The letter of a flag in the name of a Maildir file, and in the status fields of an mbox file.
+// The letters of a flag in Maildir file names and in the status fields of mbox files.
 struct FlagLetters {
   usersyntax::Flag flag;
   char inName;
@@ -118,7 +118,7 @@ std::shared_ptr<TLIndexableItem> MailFacts::item(const std::string& identifier) 
 }
 
 std::string folderPath(const TLIndexableItem& item) {
-  // Percent-encoded as an identifier is.
+  // Percent-encoded like an identifier.
   const auto location = parseIdentifier("file" + textOf(item.domainIdentifier()));
   return location ? location->path : std::string();
 }

@@ -11,9 +11,9 @@
 
 namespace cli {
 
-// What the head of a message says that the index does not keep.
+// Facts from the head of a message that the index does not keep.
 struct MailHead {
-  std::string messageID;  // without < >; empty where there is none
+  std::string messageID;  // without < >; empty if there is none
   std::string inReplyTo;
   std::string references;
   std::string listID;
@@ -21,17 +21,17 @@ struct MailHead {
   bool spam = false;
 };
 
-// What is known of a message beyond the copy that the index keeps: it is looked up in the mail
-// itself, when it is asked for, and heads are kept. One thread.
+// Facts about a message beyond the copy in the index. They are read from the mail itself when
+// requested, and heads are cached. One thread.
 class MailFacts {
  public:
   explicit MailFacts(MailReader::OffsetOf offsetOf = nullptr) : _reader(std::move(offsetOf)) {}
 
-  // None where the message cannot be read; `unreadable` counts these.
+  // Nullopt if the message cannot be read; `unreadable` counts these.
   [[nodiscard]] std::optional<MailHead> head(const std::string& identifier);
   [[nodiscard]] std::optional<bool> flag(const std::string& identifier, usersyntax::Flag flag);
   [[nodiscard]] std::optional<uint64_t> size(const std::string& identifier);
-  // The message as it is indexed, with its text.
+  // The message as an item for indexing, with its text.
   [[nodiscard]] std::shared_ptr<TLIndexableItem> item(const std::string& identifier);
 
   [[nodiscard]] MailReader& reader() { return _reader; }
@@ -44,10 +44,10 @@ class MailFacts {
   size_t _unreadable = 0;
 };
 
-// The folder of an item as it is shown: the last part of its path, without the dot of a Maildir++
-// folder and the endings of mbox files.
+// The display name of an item's folder: the last part of its path, without the dot of a Maildir++
+// folder and the extensions of mbox files.
 [[nodiscard]] std::string folderName(const TLIndexableItem& item);
-// Its path; empty for an item of another client that is in none.
+// The path of the folder; empty for an item from another client without one.
 [[nodiscard]] std::string folderPath(const TLIndexableItem& item);
 
 }  // namespace cli

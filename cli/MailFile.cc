@@ -34,7 +34,7 @@ bool isBlankLine(std::string_view line) {
   return line == "\n" || line == "\r\n";
 }
 
-// True for a line "From " behind at least one ">".
+// True for a line with "From " after at least one ">".
 bool isQuotedFromLine(std::string_view line) {
   const size_t quotes = line.find_first_not_of('>');
   return quotes != 0 && quotes != std::string_view::npos && line.substr(quotes).starts_with(kFrom);
@@ -59,7 +59,7 @@ MessageOrigin originOfFile(const std::string& path) {
   std::string folder = directoryOf(path);
   if (isMaildirFile(path)) folder = directoryOf(folder);
   std::string name = lastComponent(folder);
-  // Sub-folders of a Maildir++ begin with a dot.
+  // The names of Maildir++ subfolders begin with a dot.
   if (isMaildirFile(path) && name.size() > 1 && name[0] == '.') name.erase(0, 1);
   return {fileIdentifier(path), std::move(folder), std::move(name)};
 }
@@ -71,7 +71,7 @@ MessageOrigin originOfMbox(const std::string& path) {
   return {"", path, std::string(name)};
 }
 
-// A header field at the start, and a field that every message has among what follows.
+// True if the text starts with a header field and contains a field that every message has.
 bool looksLikeMessage(std::string_view head) {
   const size_t colon = head.find(':');
   if (colon == 0 || colon == std::string_view::npos) return false;
@@ -93,7 +93,7 @@ bool looksLikeMessage(std::string_view head) {
   });
 }
 
-// Reads one file. The message in hand is gathered in `_message`.
+// Reads one file. Collects the current message in `_message`.
 class Reader {
  public:
   Reader(const std::string& path, bool named, const MailSink& sink, LineReader& lines)
@@ -127,7 +127,7 @@ class Reader {
     const auto deliver = [&](bool last) {
       origin.identifier = mboxIdentifier(_path, start);
       origin.offset = start;
-      // The empty line in front of the next message is no part of this one.
+      // The empty line before the next message does not belong to this one.
       if (_message.ends_with("\n\r\n")) {
         _message.resize(_message.size() - 2);
       } else if (_message.ends_with("\n\n")) {
@@ -162,8 +162,8 @@ class Reader {
     if (!_tooLong) _message.append(bytes);
   }
 
-  // Hands out the message and makes room for the next. The last one of a file that could not be
-  // read to its end is not complete.
+  // Passes on the current message and resets for the next one. The last message of a file that
+  // could not be read to its end is incomplete.
   bool finish(const MessageOrigin& origin, const std::string& where, bool last) {
     bool goOn;
     if (_tooLong) {

@@ -10,7 +10,7 @@
 
 namespace cli {
 
-// The longest message that is read; a longer one is reported and passed over.
+// The longest message that is read; a longer one is reported and skipped.
 inline constexpr size_t kMaxMessageBytes = size_t{64} << 20;
 
 // Where a message comes from.
@@ -21,27 +21,27 @@ struct MessageOrigin {
   std::optional<uint64_t> offset = std::nullopt;  // in an mbox file
 };
 
-// What a reader of mail files reports to. Results are false to stop reading.
+// Receives the results of reading mail files. Return false to stop reading.
 struct MailSink {
-  // The bytes live for the call.
+  // The bytes are valid during the call.
   std::function<bool(std::string_view bytes, const MessageOrigin& origin)> message;
   // A message, or the rest of a file, that cannot be read; `where` is a path, or path:offset.
   std::function<bool(const std::string& where, const std::string& reason)> failure;
-  // A file of a directory that is no mail.
+  // A file in a directory that is not mail.
   std::function<void(const std::string& path)> ignored;
   // Bytes of the file itself read since the last call.
   std::function<void(uint64_t bytes)> progress;
 };
 
-// Reads the messages of one file: an mbox file or a single message, which may be compressed. `path`
-// is absolute. With `named`, the user has named the file, so that one without mail is a failure; in
-// a directory it is ignored. False once the sink has said stop.
+// Reads the messages of one file: an mbox file or a single message, possibly compressed. `path` is
+// absolute. With `named`, the user named the file, so a file without mail is a failure; in a
+// directory it is ignored. False if the sink has stopped the reading.
 //
-// In an mbox file a message begins at a line "From " with a time and a year, at the start or behind
-// an empty line. Behind ">From " lines (with any number of ">") one ">" is taken off.
+// In an mbox file a message begins at a "From " line with a time and a year, at the start of the
+// file or after an empty line. One ">" is removed from lines with one or more ">" before "From ".
 bool readMailFile(const std::string& path, bool named, const MailSink& sink);
 
-// True for a line that begins a message in an mbox file.
+// True for a line that starts a message in an mbox file.
 [[nodiscard]] bool isFromLine(std::string_view line);
 
 }  // namespace cli

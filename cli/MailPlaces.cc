@@ -14,7 +14,7 @@ namespace cli {
 
 namespace {
 
-// PATH:OFFSET, as `tallow search --format=files` writes it; none for a file of that name.
+// Splits PATH:OFFSET as written by `tallow search --format=files`; nullopt if a file has that name.
 std::optional<std::pair<std::string, uint64_t>> messageInFile(const std::string& path) {
   const size_t colon = path.rfind(':');
   if (colon == std::string::npos || platform::fileExists(path)) return std::nullopt;

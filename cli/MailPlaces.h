@@ -7,21 +7,20 @@
 #include "cli/MailReader.h"
 #include "cli/Options.h"
 
-// From what a user names to what the index calls it.
+// Translates the paths that users name into the identifiers of the index.
 namespace cli {
 
-// By the catalogue of `tallow sync`, which is opened when the first message is asked for.
+// Looks offsets up in the catalogue of `tallow sync`, which is opened for the first message.
 [[nodiscard]] MailReader::OffsetOf offsetsOfSync(const Options& options);
 
-// Whether an argument names a place on the disk, not an identifier: it begins as a path does, or
-// there is such a file.
+// Whether an argument is a path, not an identifier: it begins like a path, or such a file exists.
 [[nodiscard]] bool namesPath(const std::string& argument);
 
-// As it is written and as it is without symbolic links, absolute; one path where they are the same.
+// The absolute path as written, and with symbolic links resolved; only one if both are the same.
 [[nodiscard]] std::vector<std::string> spellingsOf(const std::string& path);
 
-// The identifiers that a message file may have, as `index` and `sync` name it, the likeliest first;
-// for PATH:OFFSET those of a message of an mbox file.
+// The identifiers that `index` and `sync` may have given to a message file, most likely first; for
+// PATH:OFFSET those of a message in an mbox file.
 [[nodiscard]] std::vector<std::string> identifiersOf(const std::string& path);
 
 }  // namespace cli

@@ -17,7 +17,7 @@ namespace {
 constexpr std::string_view kFlags = ":2,";
 constexpr std::array<const char*, 2> kMailDirectories{"new", "cur"};
 
-// Of a directory that is not there, 0.
+// 0 for a directory that does not exist.
 std::vector<timespec> changeTimesOf(const std::string& maildir) {
   std::vector<timespec> times;
   for (const char* const sub : kMailDirectories) {
@@ -55,7 +55,7 @@ TLError moved(const std::string& what) {
   return {"tallow", ENOENT, what};
 }
 
-// What follows the From line that the reader stands at, up to the next.
+// Reads the message after the current From line, up to the next one.
 std::optional<std::string> readMboxMessage(LineReader& lines, size_t most, TLErrorOut error) {
   const auto first = lines.next();
   if (!first || !first->bytes.starts_with("From ")) {
@@ -70,7 +70,7 @@ std::optional<std::string> readMboxMessage(LineReader& lines, size_t most, TLErr
     afterEmpty = piece->startsLine && isEmptyLine(piece->bytes);
     message += piece->bytes.substr(piece->startsLine && isQuotedFrom(piece->bytes) ? 1 : 0);
   }
-  // The empty line in front of the next message is no part of this one.
+  // The empty line before the next message does not belong to this one.
   if (message.ends_with("\n\r\n")) {
     message.resize(message.size() - 2);
   } else if (message.ends_with("\n\n")) {
@@ -79,7 +79,7 @@ std::optional<std::string> readMboxMessage(LineReader& lines, size_t most, TLErr
   return message;
 }
 
-// `name` is the digest of the content, with ".N" for a further copy.
+// `name` is the digest of the content, with ".N" for a duplicate.
 bool isNamedBy(std::string_view message, std::string_view name) {
   return mailsync::messageDigest(message) == name.substr(0, name.find('.'));
 }

@@ -15,35 +15,34 @@
 
 namespace cli {
 
-// Reads single messages again where the index says that they lie. Remembers the directories of
-// Maildirs that it has listed, so that a thousand messages of one folder cost one listing. One
-// thread.
+// Reads single messages from the places named in the index. Caches the listings of Maildirs, so
+// that a thousand messages of one folder need only one listing. One thread.
 class MailReader {
  public:
-  // Where a message of an mbox file that is named by its content was seen last; none for one that
-  // nobody knows.
+  // The last known offset of a message in an mbox file that is identified by its content; nullopt
+  // if unknown.
   using OffsetOf = std::function<std::optional<uint64_t>(const std::string& identifier)>;
 
   explicit MailReader(OffsetOf offsetOf = nullptr) : _offsetOf(std::move(offsetOf)) {}
 
-  // The place of the message as it is now, with the flags of a Maildir in its name; none for an
-  // identifier of another client, for a Maildir file that is gone, and for a message whose offset
-  // is not known.
+  // The current place of the message, including the flags in a Maildir file name. Nullopt for an
+  // identifier of another client, a Maildir file that no longer exists, and a message with an
+  // unknown offset.
   [[nodiscard]] std::optional<MailLocation> locate(const std::string& identifier);
 
   // The first bytes of the message, at most `most`, without the From line of an mbox file and its
-  // quoting. An error where something else lies there by now.
+  // quoting. An error if something else is in that place now.
   [[nodiscard]] std::optional<std::string> read(const std::string& identifier, size_t most,
                                                 TLErrorOut error);
 
-  // Forgets what has changed since it was listed, for programs that go on for long.
+  // Drops cached listings that are out of date; for long-running programs.
   void refresh();
 
  private:
   struct Listing {
-    // By name without flags: the path.
+    // The path, by name without flags.
     std::map<std::string, std::string, std::less<>> paths;
-    std::vector<timespec> times;  // when "new" and "cur" were changed last
+    std::vector<timespec> times;  // modification times of "new" and "cur"
   };
 
   const Listing& listingOf(const std::string& maildir);
@@ -53,8 +52,8 @@ class MailReader {
   std::map<std::string, Listing> _listings;
 };
 
-// The value of a header field of a message, unfolded and trimmed; empty where it
-// has none. The name is in small letters.
+// The value of a header field, unfolded and trimmed; empty if the message does not have the field.
+// `name` is in lower case.
 [[nodiscard]] std::string headerValue(std::string_view message, std::string_view name);
 
 }  // namespace cli

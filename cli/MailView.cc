@@ -24,7 +24,7 @@ bool isHTML(GMimeObject* object) {
   return isType(object, "text", "html");
 }
 
-// Without spaces at both ends of lines, and with one empty line where there are several.
+// Trims lines and reduces several empty lines to one.
 TLString tidied(TLStringView text) {
   constexpr TLStringView kBlanks = u" \t\r\u00A0";
   TLString tidy;
@@ -55,7 +55,7 @@ std::string cutField(std::string_view value) {
 
 struct Field {
   const char* name;
-  int addresses;  // as GMimeAddressType; -1 for a field of text
+  int addresses;  // a GMimeAddressType; -1 for a text field
 };
 constexpr Field kFields[] = {{"From", GMIME_ADDRESS_TYPE_FROM},
                              {"To", GMIME_ADDRESS_TYPE_TO},
@@ -65,7 +65,7 @@ constexpr Field kFields[] = {{"From", GMIME_ADDRESS_TYPE_FROM},
                              {"Date", -1},
                              {"Subject", -1}};
 
-// Names that hold what looks like an address stand in quotes, which the text of the field may lack.
+// Quotes names that look like an address, because the field itself may lack the quotes.
 std::string valueOf(GMimeMessage* message, const Field& field) {
   if (field.addresses >= 0) {
     InternetAddressList* const list =
@@ -118,7 +118,7 @@ MailView::MailView(Object<GMimeMessage> message) : _message(std::move(message)) 
   }
 }
 
-// The plain text, else the last that is HTML or holds it, else the last.
+// Prefers plain text, then the last alternative that is or contains HTML, then the last one.
 int MailView::chosenOf(GMimeMultipart* alternatives) {
   const int count = std::min(g_mime_multipart_get_count(alternatives), static_cast<int>(kMaxParts));
   int chosen = count - 1;

@@ -13,32 +13,32 @@
 
 namespace cli {
 
-// A message as a person reads it. All texts are as the mail has them, so unfit for a terminal.
-// Parts beyond kMaxParts are left out; every traversal is a loop. One thread.
+// A message in readable form. All texts are as in the mail and must be cleaned before they go to a
+// terminal. Parts beyond kMaxParts are left out; no function recurses. One thread.
 class MailView {
  public:
-  // A longer value of a header field is cut, and ends with "…". UTF-16 units.
+  // In UTF-16 units. A longer header value is cut and ends with "…".
   static constexpr size_t kMaxFieldUnits = 4000;
 
   struct Attachment {
-    std::string name;  // empty where the mail gives none
+    std::string name;  // empty if the mail has none
     std::string type;  // such as image/png
     uint64_t bytes = 0;
   };
 
-  // Null where the bytes are no message.
+  // Null if the bytes are not a message.
   [[nodiscard]] static std::unique_ptr<MailView> parse(std::string_view bytes);
 
-  // From, To, Cc, Bcc, Reply-To, Date and Subject, as far as there are, decoded.
+  // The decoded fields From, To, Cc, Bcc, Reply-To, Date and Subject, if present.
   [[nodiscard]] std::vector<std::pair<std::string, std::string>> fields() const;
 
-  // The inline text parts in their order, each HTML part as the text that it holds. Of alternatives
-  // the plain text, unless that is only white space.
+  // The inline text parts in order; HTML parts are converted to text. Of alternatives, the plain
+  // text is used unless it is only white space.
   [[nodiscard]] std::string text();
-  // False where a part was too long to be decoded to its end.
+  // False if a part was too long to be decoded completely.
   [[nodiscard]] bool complete() const { return _complete; }
 
-  // All parts that are not text of the message, in their order.
+  // All parts that are not text of the message, in order.
   [[nodiscard]] std::vector<Attachment> attachments() const;
   // The content of the attachment with this index.
   [[nodiscard]] std::string attachment(size_t index) const;

@@ -20,7 +20,7 @@ struct Directory {
   size_t depth;
 };
 
-// Visits the files of one directory and adds its directories to `pending`, the last first.
+// Visits the files of one directory and adds its subdirectories to `pending` in reverse order.
 bool visitDirectory(const Directory& directory, const WalkVisitor& visitor,
                     std::vector<Directory>& pending) {
   std::optional<TLError> error;
@@ -33,7 +33,7 @@ bool visitDirectory(const Directory& directory, const WalkVisitor& visitor,
     const std::string path = platform::joinPath(directory.path, name);
     struct stat info;
     struct stat target;
-    // What is gone by now has been moved or deleted in the meantime.
+    // An entry that no longer exists was moved or deleted since the listing.
     if (lstat(path.c_str(), &info) != 0 || stat(path.c_str(), &target) != 0) continue;
     if (S_ISDIR(info.st_mode)) {
       if (!(maildir && name == "tmp")) below.push_back({path, directory.depth + 1});

@@ -29,7 +29,7 @@ std::vector<std::string> excludedOf(const Settings& settings,
   return excluded;
 }
 
-// Of the last time, or the usual ones.
+// The mailboxes of the last run, or else the usual ones.
 std::vector<std::string> knownMailboxes(const Options& options) {
   const auto catalogue = mailsync::openCatalogue(syncSettings(options), nullptr);
   std::vector<std::string> known;
@@ -40,7 +40,7 @@ std::vector<std::string> knownMailboxes(const Options& options) {
   return known;
 }
 
-// Of folders with a class: what is wrong where one lies in another.
+// An error if a folder with a class is inside another such folder.
 std::optional<std::string> nestedFolders(const std::map<std::string, std::string>& classes) {
   for (auto row = classes.begin(); row != classes.end(); ++row) {
     for (auto below = std::next(row); below != classes.end(); ++below) {
@@ -107,7 +107,8 @@ std::optional<std::vector<MailboxGroup>> mailboxGroups(const Options& options) {
   std::vector<std::string> paths = options.arguments;
   const bool named = !paths.empty();
   if (!named) paths = settings.roots.empty() ? knownMailboxes(options) : settings.roots;
-  // The settings are about the default class; a class of the command line is for what it names.
+  // The settings are for the default class. A class on the command line applies only to paths on
+  // the command line.
   const std::string protectionClass =
       named || settings.roots.empty() ? options.protectionClass : Options().protectionClass;
   auto grouped = groupMailboxes(settings, paths, protectionClass, !named);

@@ -34,7 +34,7 @@ std::optional<double> receivedDate(GMimeMessage* message) {
   return seconds;
 }
 
-// The leaves of a message that matter.
+// The parts of a message that are indexed.
 struct Leaves {
   std::vector<GMimePart*> plain;
   std::vector<GMimePart*> html;
@@ -58,7 +58,7 @@ void addLeaf(GMimePart* part, Leaves& leaves) {
   }
 }
 
-// In the order of the message. Messages inside the message belong to it unless they are attached.
+// In the order of the message. Embedded messages are included unless they are attachments.
 Leaves leavesOf(GMimeMessage* message) {
   Leaves leaves;
   std::vector<GMimeObject*> pending{g_mime_message_get_mime_part(message)};
@@ -87,7 +87,7 @@ Leaves leavesOf(GMimeMessage* message) {
   return leaves;
 }
 
-// The parts one after the other. Stops once there is more than the index takes.
+// Joins the parts in order. Stops when there is more than the index accepts.
 TLString joinedText(const std::vector<GMimePart*>& parts, TextDecoder& decoder) {
   TLString joined;
   for (GMimePart* part : parts) {
@@ -131,7 +131,7 @@ class ItemBuilder {
     addTexts(key, {platform::fromUTF8(text)}, true);
   }
 
-  // As one text or as a list, within the budget of one zone.
+  // Adds the texts as one text or as a list, within the budget of one zone.
   void addTexts(Key key, const std::vector<TLString>& texts, bool single = false) {
     TextBudget budget;
     std::vector<TLString> kept;
@@ -149,7 +149,7 @@ class ItemBuilder {
     }
   }
 
-  // A header that holds text but no address that can be read gives one person of that name.
+  // A header with text but without a valid address becomes one person with that name.
   void addPersons(Key key, GMimeAddressType type, const char* header) {
     TextBudget names;
     TextBudget addresses;

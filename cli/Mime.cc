@@ -30,7 +30,7 @@ Object<GMimeMessage> parseMIME(std::string_view bytes) {
   const Object<GMimeStream> stream(g_mime_stream_mem_new_with_buffer(bytes.data(), bytes.size()));
   const Object<GMimeParser> parser(g_mime_parser_new_with_stream(stream.get()));
   g_mime_parser_set_format(parser.get(), GMIME_FORMAT_MESSAGE);
-  // Parts are kept as places in the stream, not copied.
+  // Parts refer to the stream and are not copied.
   g_mime_parser_set_persist_stream(parser.get(), TRUE);
   return Object<GMimeMessage>(g_mime_parser_construct_message(parser.get(), nullptr));
 }

@@ -9,7 +9,7 @@
 #include "cli/TextDecoder.h"
 #include "platform/Text.h"
 
-// What all that takes mail apart needs of GMime.
+// GMime helpers for all code that parses mail.
 namespace cli {
 
 struct Unref {
@@ -23,26 +23,26 @@ struct Free {
 };
 using CString = std::unique_ptr<char, Free>;
 
-// Has to come before anything else of GMime; any thread, any number of times.
+// Call before any other GMime function. Any thread; may be called repeatedly.
 void initMIME();
 
 [[nodiscard]] std::string_view orEmpty(const char* text);
 [[nodiscard]] bool equalIgnoringCase(std::string_view a, std::string_view b);
-// Whether a text has nothing but white space.
+// Whether a text is only white space.
 [[nodiscard]] bool isBlank(TLStringView text);
 
-// Null where the bytes are no message. GMime nests parts at most 1024 deep.
+// Null if the bytes are not a message. GMime nests parts at most 1024 deep.
 [[nodiscard]] Object<GMimeMessage> parseMIME(std::string_view bytes);
 
 [[nodiscard]] bool isAttached(GMimeObject* object);
 
-// What was written to a stream in memory.
+// The bytes written to a memory stream.
 [[nodiscard]] std::string bytesIn(GMimeStream* memory);
 
 // The content of a part without its transfer encoding.
 [[nodiscard]] std::string contentOf(GMimePart* part);
 
-// The text of a part, of which kMaxBodyBytes are decoded.
+// The text of a part. Decodes at most kMaxBodyBytes.
 [[nodiscard]] TLString textOf(GMimePart* part, TextDecoder& decoder);
 
 }  // namespace cli

@@ -6,8 +6,8 @@
 
 namespace cli {
 
-// The name of the row of a table that a mistyped word most likely meant; null when each of them is
-// more than two mistakes away.
+// The name in a table that a mistyped word most likely meant; null if every name is more than two
+// mistakes away.
 template <typename Rows>
 [[nodiscard]] const char* nearestName(std::string_view word, const Rows& rows) {
   constexpr float kMaxMistakes = 2;

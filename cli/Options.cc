@@ -21,7 +21,7 @@ namespace {
 
 constexpr const char* kVersion = "tallow " TALLOW_VERSION;
 
-// One command. `operands` is how its arguments are called in the help, null for none.
+// One command. `operands` names its arguments in the help; null if it has none.
 struct CommandRow {
   Command command;
   const char* name;
@@ -70,7 +70,7 @@ const std::map<std::string, SortOrder> kSortOrders{{"relevance", SortOrder::rele
 const std::map<std::string, ColorMode> kColors{
     {"auto", ColorMode::automatic}, {"always", ColorMode::always}, {"never", ColorMode::never}};
 
-// Takes one of some names; the text becomes the number of its value.
+// Accepts one of several names and replaces it by the number of its value.
 template <typename Value>
 CLI::Validator oneOf(const std::map<std::string, Value>& values) {
   return CLI::Validator(
@@ -209,7 +209,7 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   sub->callback([&options, command = row.command] { options.command = command; });
 }
 
-// A word where the command should be; empty when something else is wrong.
+// The word in place of a command; empty if something else is wrong.
 std::string unknownCommand(const CLI::App& app) {
   if (!app.get_subcommands().empty()) return "";
   for (const std::string& word : app.remaining()) {
@@ -225,7 +225,7 @@ void complainOfCommand(const std::string& word) {
   std::cerr << "\nRun `tallow help` for the list.\n";
 }
 
-// What is wrong with a command line, in our own words.
+// Explains what is wrong with a command line.
 std::string reasonOf(const CLI::App& app, const CLI::Error& error) {
   const auto is = [code = error.get_exit_code()](CLI::ExitCodes one) {
     return code == static_cast<int>(one);
@@ -255,7 +255,7 @@ std::string misuseText(const CLI::App* app, const CLI::Error& error) {
                      commands.empty() ? "" : ' ' + commands.front()->get_name());
 }
 
-// Of the command `help`: the help of the command with that name, or the list of all.
+// For the command `help`: the help of the named command, or the list of all commands.
 ExitStatus showHelp(CLI::App& app, const std::string& command) {
   if (command.empty()) {
     std::cout << app.help();
@@ -271,7 +271,7 @@ ExitStatus showHelp(CLI::App& app, const std::string& command) {
   return ExitStatus::done;
 }
 
-// Whether a person looks at a screen that can be drawn on.
+// Whether input and output are a terminal that a screen can be drawn on.
 bool isScreen() {
   const char* const terminal = std::getenv("TERM");
   return isatty(STDIN_FILENO) == 1 && isatty(STDOUT_FILENO) == 1 && terminal != nullptr &&
@@ -287,7 +287,7 @@ const char* misuseOfShow(const Options& options) {
   return nullptr;
 }
 
-// What is wrong with options that do not go together, or null.
+// An error about options that cannot be combined, or null.
 const char* misuse(const Options& options) {
   const bool list =
       options.format == OutputFormat::files || options.format == OutputFormat::messageIDs;

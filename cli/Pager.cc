@@ -18,7 +18,7 @@ namespace cli {
 
 namespace {
 
-// How a shell says that there is no such program.
+// The exit status of a shell if a program does not exist.
 constexpr int kNotFound = 127;
 
 std::string pagerCommand() {
@@ -26,7 +26,7 @@ std::string pagerCommand() {
   return pager == nullptr ? "less -R" : pager;
 }
 
-// While a pager has the terminal, Ctrl-C and Ctrl-\ are its own: this process outlives them.
+// While a pager uses the terminal, Ctrl-C and Ctrl-\ are for the pager: this process ignores them.
 class IgnoredSignals {
  public:
   IgnoredSignals()
@@ -43,7 +43,7 @@ class IgnoredSignals {
   void (*const _quit)(int);
 };
 
-// Stops where the reader has gone.
+// Stops when the reader has closed the pipe.
 void writeAll(int output, std::string_view text) {
   while (!text.empty()) {
     const ssize_t count = ::write(output, text.data(), text.size());
@@ -63,7 +63,7 @@ ExitStatus page(std::string_view text) {
   platform::FileDescriptor output(pipe[1]);
   platform::FileDescriptor input(pipe[0]);
   const IgnoredSignals ignored;
-  // A pager that is "less" alone would show escape sequences as text.
+  // Without R, less shows escape sequences as text.
   setenv("LESS", "R", 0);
   pid_t process = -1;
   if (startShell(command, {}, input.get(), process) != 0) return print(text);

@@ -6,9 +6,9 @@
 
 namespace cli {
 
-// Writes a text through the user's pager where the standard output is a terminal: by $PAGER, else
-// less -R. Plain where it is none, where $PAGER is empty or cat, and where there is no such
-// program. The text is clean. A pager that is left before the end is no failure.
+// Writes a text through the user's pager if the standard output is a terminal: $PAGER, by default
+// less -R. Writes it directly if it is not a terminal, if $PAGER is empty or cat, or if the pager
+// does not exist. The text must be clean. Leaving the pager before the end is not a failure.
 [[nodiscard]] ExitStatus page(std::string_view text);
 
 }  // namespace cli

@@ -6,8 +6,8 @@
 
 namespace cli {
 
-// A line on the standard error that shows how far the work has come, its rate and the time that
-// remains. Silent unless the standard error is a terminal. One thread.
+// A line on the standard error that shows the progress of the work, its rate and the remaining
+// time. Silent unless the standard error is a terminal. One thread.
 class ProgressBar {
  public:
   // `total` is in bytes.
@@ -20,7 +20,7 @@ class ProgressBar {
 
   void update(uint64_t bytes, uint64_t messages);
 
-  // Takes the line away, so that another may be written.
+  // Erases the line, so that other text can be written.
   void clear();
 
  private:
@@ -31,7 +31,7 @@ class ProgressBar {
   bool _onScreen = false;
 };
 
-// The text of the bar, of at most `columns` columns.
+// The text of the bar, at most `columns` wide.
 [[nodiscard]] std::string progressText(uint64_t bytes, uint64_t total, uint64_t messages,
                                        double seconds, size_t columns);
 

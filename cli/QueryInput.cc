@@ -17,7 +17,8 @@ constexpr const char* kErrorDomain = "tallow";
 constexpr int kUnreadable = 1;
 constexpr size_t kShownText = 60;
 
-// What free text is looked for in. More than four, so that optimising knows them for free text.
+// The attributes that free text is searched in. More than four, so that the optimiser recognises
+// free text.
 constexpr std::array<const char*, 6> kTextAttributes{
     "kTLItemSubject",    "kTLItemTextContent",
     "kTLItemAuthors",    "kTLItemAuthorEmailAddresses",
@@ -27,7 +28,7 @@ std::string joinedWords(const std::vector<std::string>& arguments) {
   return fmt::format("{}", fmt::join(arguments, " "));
 }
 
-// Optimising takes one asterisk off each end; what the user typed stays as it is.
+// The optimiser removes one asterisk at each end, so the user's own asterisks are kept.
 std::string disjunctionOf(const std::string& words) {
   std::string out = "(";
   for (const char* const attribute : kTextAttributes) {
@@ -61,7 +62,7 @@ void remarkUnknownNames(const sq::node& tree, std::vector<std::string>& remarks)
   }
 }
 
-// Reads an expression only to tell what is wrong with it. None after an error.
+// Parses an expression only to report what is wrong with it. Empty after an error.
 sq::Tree checked(const std::string& expression, std::vector<std::string>& remarks,
                  TLErrorOut error) {
   sq::Tree tree;
@@ -83,7 +84,7 @@ sq::Tree checked(const std::string& expression, std::vector<std::string>& remark
   return tree;
 }
 
-// The tree that was built for a text that can be read; null, with an error, where it is too high.
+// The tree built for a valid text; null with an error if it is too high.
 std::shared_ptr<TLQueryNode> builtTree(const TLQuery& query, TLErrorOut error) {
   if (query.hasRoot()) return query.root()->copyWithZone();
   platform::setError(error, {kErrorDomain, kUnreadable,
@@ -103,7 +104,7 @@ bool readMain(const std::string& expression, QueryInput& input, TLErrorOut error
   return true;
 }
 
-// Each filter stands for itself, whatever it looks like beside the others.
+// Each filter is parsed separately, so it cannot change the meaning of another.
 bool readFilters(const std::vector<std::string>& filters, QueryInput& input, TLErrorOut error) {
   if (filters.empty()) return true;
   std::vector<std::string> texts;
@@ -138,7 +139,7 @@ bool readParameters(const std::string& text, TLQuery& query, TLErrorOut error) {
   return true;
 }
 
-// What was typed is not only words: there is no expression to show.
+// The input is not only words, so there is no expression to show.
 void readTyped(QueryInput& input) {
   input.query = std::make_shared<TLQuery>();
   input.query->setRawQuery(platform::fromUTF8(input.words));
@@ -146,7 +147,7 @@ void readTyped(QueryInput& input) {
   input.main = {input.words, usersyntax::printed(input.typed.root), nullptr, nullptr};
 }
 
-// What was typed, in one folder only.
+// Restricts the typed query to one folder.
 void limitToFolder(const std::string& folder, usersyntax::Query& typed) {
   usersyntax::Node place;
   place.kind = usersyntax::Kind::text;
@@ -158,7 +159,7 @@ void limitToFolder(const std::string& folder, usersyntax::Query& typed) {
   typed.plain = false;
 }
 
-// As one query of the daemon's where that tells all, else as a plan.
+// Makes one query if the daemon can decide everything, otherwise a plan.
 bool makePlan(QueryInput& input, bool typed, TLErrorOut error) {
   const TLQuery& query = *input.query;
   if (!typed && !hasCheckedConditions(query.root().get())) {

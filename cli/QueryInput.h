@@ -12,33 +12,33 @@
 
 namespace cli {
 
-// How one text of the query language is understood, step by step.
+// The interpretation of one text of the query language, step by step.
 struct Understanding {
   std::string expression;               // the text
-  std::string parseTree;                // as the parser groups it
-  std::shared_ptr<TLQueryNode> before;  // the tree before it is optimised
-  std::shared_ptr<TLQueryNode> after;   // null where nothing is left
+  std::string parseTree;                // as grouped by the parser
+  std::shared_ptr<TLQueryNode> before;  // the tree before optimisation
+  std::shared_ptr<TLQueryNode> after;   // after optimisation; null if nothing is left
 };
 
-// The query that a command line asks for.
+// The query of a command line.
 struct QueryInput {
-  std::string words;  // as they were typed, joined by single blanks; empty with --query
+  std::string words;  // as typed, joined by single spaces; empty with --query
   std::shared_ptr<TLQuery> query;
   Understanding main;
   std::optional<Understanding> filter;  // all filters together
-  usersyntax::Query typed;              // what the words are in a person's syntax
+  usersyntax::Query typed;              // the words, parsed in the user syntax
   SearchPlan plan;
-  // What the user should know: what of an expression is not read, or not known.
+  // Notes for the user about parts of an expression that are ignored or unknown.
   std::vector<std::string> remarks;
 
   // The words to mark in results, as one text.
   [[nodiscard]] std::string markedWords() const;
 };
 
-// Nothing but words goes the way of the query of a mail client: one disjunction over the attributes
-// that hold text, out of which optimising makes free text again. All else, and conditions that the
-// daemon does not look up, becomes a plan of several queries and checks. None, with an error, for
-// expressions or parameters that cannot be read. `now` is in seconds since 1970.
+// Plain words become a query like that of a mail client: one disjunction over the text attributes,
+// which the optimiser turns into free text again. Anything else, and conditions that the daemon
+// does not look up, becomes a plan of several queries and checks. Nullopt with an error for invalid
+// expressions or parameters. `now` is in seconds since 1970.
 [[nodiscard]] std::optional<QueryInput> queryInput(const Options& options, double now,
                                                    TLErrorOut error);
 
