@@ -62,7 +62,7 @@ void remarkUnknownNames(const sq::node& tree, std::vector<std::string>& remarks)
   }
 }
 
-// Parses an expression only to report what is wrong with it. Empty after an error.
+// Parses an expression only to report what is wrong with it. Null after an error.
 sq::Tree checked(const std::string& expression, std::vector<std::string>& remarks,
                  TLErrorOut error) {
   sq::Tree tree;

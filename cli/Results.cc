@@ -21,7 +21,7 @@ namespace {
 
 using Key = TLAttributeKey;
 
-// A longer mail is not read to show where the words are.
+// Longer mails are not read to find a passage.
 constexpr uint64_t kMaxContextBytes = uint64_t{1} << 20;
 
 constexpr double kYear9999 = 253402300799;
@@ -70,7 +70,7 @@ nlohmann::json flagsJSON(const std::string& identifier, MailFacts& facts) {
   return list;
 }
 
-// Where a message is: as it is for programs, its path and offset.
+// The path and offset of a message, unescaped for programs.
 std::string placeText(const TLIndexableItem& item, MailFacts& facts) {
   const std::string identifier = textOf(item.identifier());
   auto location = facts.reader().locate(identifier);
@@ -180,12 +180,12 @@ Hits joinCopies(const ResultItems& items, MailFacts& facts) {
   return hits;
 }
 
-// The snippet where it shows a word, else the place in the mail that has the most of them. Only as
-// much as the columns show counts, 0 for no limit.
+// The snippet if it contains a word, otherwise the passage of the mail with the most words. Only
+// what fits into the columns counts; 0 for no limit.
 std::string contextOf(const TLIndexableItem& item, const std::vector<std::string>& words,
                       size_t columns, MailFacts& facts) {
   constexpr size_t kMaxCharacters = 200;
-  constexpr size_t kMarks = 4;  // for what is left out at both ends
+  constexpr size_t kMarks = 4;  // for an ellipsis at each end
   std::string snippet = textOf(item.stringValueForKey(Key::CONTENT_SNIPPET));
   if (words.empty() || holdsWord(fitted(snippet, columns), words)) return snippet;
   const std::string identifier = textOf(item.identifier());
@@ -205,7 +205,7 @@ std::string resultsText(const Page& page, const std::string& query, MailFacts& f
   const auto words = queryWords(query);
   const size_t width = columns > 2 * kIndent ? columns - kIndent : 0;
   const auto marked = [&](const std::string& text, const char* base) {
-    // Behind a match the colour around it goes on.
+    // After a match the surrounding colour continues.
     return highlight(fitted(cleanForTerminal(text), width), words, palette.match,
                      std::string(palette.end) + base);
   };
@@ -224,7 +224,7 @@ std::string resultsText(const Page& page, const std::string& query, MailFacts& f
                        subject.empty() ? "(no subject)" : marked(subject, palette.subject),
                        palette.end);
     if (!snippet.empty()) out += fmt::format("     {}\n", marked(snippet, ""));
-    // Identifiers are not cut, so that they can be copied.
+    // Identifiers are not cut, because users copy them.
     out += fmt::format("     {}{}{}\n", palette.faint, cleanForTerminal(textOf(item.identifier())),
                        palette.end);
     for (const auto& copy : hit.copies) {

@@ -14,7 +14,7 @@ namespace cli {
 
 namespace {
 
-// With or without the @ that a search is called by.
+// The name of a search, given with or without "@".
 std::string nameOf(const std::string& argument) {
   return argument.starts_with('@') ? argument.substr(1) : argument;
 }

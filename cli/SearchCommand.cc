@@ -57,7 +57,7 @@ std::optional<Outcome> search(const Options& options, const QueryInput& input, M
   return outcome;
 }
 
-// Where ranks are shown, they are known to `tallow show` afterwards.
+// Stores the ranks for `tallow show`, if they are shown.
 void keepRanks(const Options& options, const QueryInput& input, const Hits& hits,
                const std::vector<size_t>& shown) {
   const bool ranked = options.format == OutputFormat::text || options.format == OutputFormat::json;
@@ -93,7 +93,7 @@ ExitStatus printCount(size_t count) {
   return print(fmt::format("{}\n", count), count > 0 ? ExitStatus::done : ExitStatus::nothingFound);
 }
 
-// The part of a list that the options ask for.
+// The part of a list that the options select.
 template <typename T>
 std::span<const T> pageOf(const Options& options, std::span<const T> all) {
   if (options.count) return {};
@@ -141,7 +141,7 @@ ExitStatus showThreads(const Options& options, const QueryInput& input, Outcome&
                     columnsOf(STDOUT_FILENO)),
         status);
   }
-  // As lists of files or Message-IDs, thread by thread.
+  // As a list of files or Message-IDs, thread by thread.
   Hits ordered;
   for (const size_t hit : ranks) ordered.push_back(all[hit]);
   return print(outputOf(options, input,
@@ -169,7 +169,7 @@ ExitStatus runSearch(const Options& options) {
                          : showHits(options, *input, *outcome, facts);
 }
 
-// How the query is understood does not need the daemon, and is shown without it as well.
+// The interpretation of the query does not need the daemon, so it is shown even without one.
 ExitStatus runExplain(const Options& options) {
   const auto input = readQuery(options);
   if (!input) return ExitStatus::failure;

@@ -23,20 +23,20 @@ using usersyntax::Node;
 using Key = TLAttributeKey;
 using NodePointer = std::shared_ptr<TLQueryNode>;
 
-// A search below this score would lose words that stand in addresses only, of which each counts a
-// tenth.
+// A low threshold, so that words that occur only in addresses, which count a tenth each, are not
+// lost.
 constexpr float kMinScore = 1e-37F;
 
 constexpr std::array<const char*, 3> kModifications{"queryModification.enableSpellModification",
                                                     "queryModification.enableSynonymModification",
                                                     "queryModification.enableStemModification"};
 
-// Every attachment has one of them.
+// Every attachment has one of these types.
 constexpr std::array<const char*, 11> kMediaTypes{"application", "audio", "example", "font",
                                                   "haptics",     "image", "message", "model",
                                                   "multipart",   "text",  "video"};
 
-// A leaf of the tree, or alternatives of one field; or a condition of the query language.
+// A leaf of the tree, alternatives of one field, or a condition of the query language.
 struct Literal {
   std::vector<Node> anyOf;
   NodePointer condition;
@@ -76,7 +76,7 @@ NodePointer group(TLQueryNodeMergeOp op) {
   return node;
 }
 
-// Names of folders are compared from their beginning, as they stand.
+// Folder names are compared literally, as prefixes.
 NodePointer folderCondition(const Node& node) {
   NodePointer any = group(TLQueryNodeMergeOp::OR);
   for (const std::string& name : folderSpellings(node.text)) {
@@ -99,7 +99,7 @@ bool isSearchedText(const Node& node) {
   return node.kind == Kind::text && !zonesOf(node.field).empty();
 }
 
-// What the daemon can tell of a literal; null where it can tell nothing.
+// The part of a literal that the daemon can evaluate; null if none.
 NodePointer conditionOf(const Literal& literal) {
   const Node& first = literal.anyOf.front();
   if (first.kind == Kind::flag && first.flag == Flag::hasAttachment) return attachmentCondition();
@@ -110,7 +110,7 @@ NodePointer conditionOf(const Literal& literal) {
   return any;
 }
 
-// Whether that is all there is to it.
+// Whether the daemon can evaluate the literal completely.
 bool daemonDecides(const Literal& literal) {
   return std::all_of(literal.anyOf.begin(), literal.anyOf.end(), [](const Node& node) {
     if (node.kind == Kind::flag) return node.flag == Flag::hasAttachment;
@@ -125,7 +125,7 @@ void addParameterRecord(TLQuery& query, std::shared_ptr<TLParamKeyValue> record)
   query.searchParams()->addKeyvalue(std::move(record));
 }
 
-// Makes the queries of one alternative.
+// Builds the queries of one alternative.
 class BranchBuilder {
  public:
   BranchBuilder(const Literals& literals, const TLParameters* parameters, bool modified)
@@ -170,7 +170,7 @@ class BranchBuilder {
     if (!single) _conditions.push_back(std::move(condition));
   }
 
-  // Words that rank the results. The last one typed stays last, since it may go on.
+  // Words that rank the results. The last word typed stays last, because it may be a prefix.
   void addFreeText(const Node& node) {
     const TLString text = platform::fromUTF8(node.text);
     if (mayGoOn(node)) {
@@ -208,7 +208,8 @@ class BranchBuilder {
   bool _modified = false;
 };
 
-// A tree as alternatives of literals. At most 3 * kMaxDepth calls deep; none for too many.
+// Expands a tree into alternatives of literals. Recursion depth at most 3 * kMaxDepth. Nullopt if
+// there are too many alternatives.
 class Expansion {
  public:
   std::optional<Alternatives> of(const Node& node, bool negated, bool inside) {
@@ -225,7 +226,7 @@ class Expansion {
     }
   }
 
-  // The same for conditions of the query language, which are at most kMaxRecordDepth high.
+  // The same for conditions of the query language. Recursion depth at most kMaxRecordDepth.
   std::optional<Alternatives> of(const TLQueryNode& node) {
     if (node.mergeOp() == TLQueryNodeMergeOp::LEAF) return ofLeaf(node);
     const bool isAnd = node.mergeOp() == TLQueryNodeMergeOp::AND;
@@ -307,7 +308,7 @@ class Expansion {
     return {{{{}, node.copyWithZone(), {}, false}}};
   }
 
-  // Times of a tree count from the reference date.
+  // Times in a tree are relative to the reference date.
   static Alternatives dateLiteral(const TLQueryNode& node) {
     Node date;
     date.kind = Kind::date;

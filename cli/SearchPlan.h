@@ -11,46 +11,46 @@
 
 namespace cli {
 
-// How many alternatives a search is taken apart into at most, each a query of the daemon's.
+// Maximum number of alternatives of a search. Each is one query to the daemon.
 inline constexpr size_t kMaxBranches = 64;
 
-// A condition that is decided here, on each result.
+// A condition that the client checks on each result.
 struct Check {
-  usersyntax::Node node;  // no conjunction, disjunction or negation
+  usersyntax::Node node;  // not a conjunction, disjunction or negation
   bool negated = false;
 };
 
-// One alternative of a search: what `query` finds, without what any of `without` finds, as far as
-// all checks hold. The queries find each mail that can be a result.
+// One alternative of a search: the results of `query` minus those of each `without`, if all checks
+// hold. The query finds every mail that can be a result.
 struct Branch {
   std::shared_ptr<TLQuery> query;
   std::vector<std::shared_ptr<TLQuery>> without;
   std::vector<Check> checks;
-  bool modifiable = true;  // the daemon may replace words that find nothing
+  bool modifiable = true;  // the daemon may replace words without results
 };
 
-// What was typed, as searches of the daemon's and checks of their results. The results of all
-// branches together are those of the search.
+// A typed search as queries to the daemon and checks of their results. The union of all branches is
+// the result of the search.
 struct SearchPlan {
   std::vector<Branch> branches;
-  // The search goes to the daemon as it stands: it is the only branch.
+  // The search is sent to the daemon as typed; there is only one branch.
   bool asTyped = false;
   std::vector<std::string> remarks;
 };
 
-// Plans a search for a tree, of which `conditions` (null for none) hold as well, and `freeText` as
-// a search for words has it. An error for more than kMaxBranches alternatives. `parameters` of the
-// user's, null for none, are kept.
+// Plans a search for mails that match `tree` and `conditions` (null for none). `freeText` is the
+// text of a search for plain words. An error if there are more than kMaxBranches alternatives. The
+// user's `parameters` (null for none) are kept.
 [[nodiscard]] std::optional<SearchPlan> planSearch(const usersyntax::Node& tree,
                                                    const TLString& freeText,
                                                    const TLQueryNode* conditions,
                                                    const TLParameters* parameters,
                                                    TLErrorOut error);
 
-// Whether the tree holds conditions that the daemon carries and does not look up.
+// Whether the tree has conditions that the daemon accepts but does not evaluate.
 [[nodiscard]] bool hasCheckedConditions(const TLQueryNode* tree);
 
-// The plan for people: for each branch its query, what is taken out, and the checks.
+// The plan in readable form: the query, exclusions and checks of each branch.
 [[nodiscard]] std::string planText(const SearchPlan& plan);
 
 // Sets a parameter of a query unless it is there.

@@ -15,15 +15,15 @@ namespace {
 using usersyntax::Field;
 using usersyntax::Kind;
 
-// What the daemon looks at unless a query says more.
+// The daemon's default number of candidates.
 constexpr size_t kDaemonCandidates = 1000;
 
 std::string identifierOf(const TLIndexableItem& item) {
   return platform::toUTF8(platform::orEmpty(item.identifier()));
 }
 
-// The daemon's answer to a query that makes no terms, such as the first quote mark of a phrase that
-// is being typed: it finds nothing.
+// The daemon's error for a query without terms, such as a single quote mark at the start of a
+// phrase; such a query has no results.
 bool asksForNothing(const std::optional<TLError>& error) {
   constexpr int kNoTerms = 3;
   return error && error->domain == "TALIndexer" && error->code == kNoTerms;
@@ -31,14 +31,14 @@ bool asksForNothing(const std::optional<TLError>& error) {
 
 struct Candidate {
   std::shared_ptr<TLIndexableItem> item;
-  std::vector<const Branch*> branches;  // that found it
+  std::vector<const Branch*> branches;  // branches that found it
 };
 
 float scoreOf(const TLIndexableItem& item) {
   return item.hasCard() ? item.card()->lightScore() : 0.0F;
 }
 
-// As the daemon ranks: by score, then date, then identifier, all descending.
+// The daemon's order: score, then date, then identifier, all descending.
 bool ranksBefore(const Candidate& a, const Candidate& b) {
   const float left = scoreOf(*a.item);
   const float right = scoreOf(*b.item);
@@ -83,7 +83,7 @@ class Run {
   }
 
  private:
-  // What is truncated is the worst of the ranking, which may be the best of another order.
+  // A truncated list lacks the lowest scores, which may come first in another order.
   [[nodiscard]] bool needsAll() const {
     return _request.complete || _request.order != SortOrder::relevance;
   }
@@ -94,7 +94,7 @@ class Run {
       return std::nullopt;
     }
     const auto sent = query.copyWithZone();
-    // Words as they are typed go to the daemon as they are, unless that is not enough.
+    // Plain words are sent as typed, unless more candidates are needed.
     const bool raised = !_plan.asTyped || needsAll();
     if (raised) addParameter(*sent, "salt.maxTopK", static_cast<int32_t>(_step));
     const auto limit = sent->hasSearchParams()
@@ -119,7 +119,7 @@ class Run {
     return items;
   }
 
-  // A daemon that cannot tell is no failure of the search.
+  // If the daemon does not support this, the search does not fail.
   void noteReplacedWords() {
     auto words = _service.replacedWords(nullptr);
     if (!words) return;
@@ -130,7 +130,7 @@ class Run {
     }
   }
 
-  // What a branch finds, in the daemon's order.
+  // The results of a branch, in the daemon's order.
   std::optional<ResultItems> resultsOf(const Branch& branch, TLErrorOut error) {
     auto items = ask(*branch.query, error);
     if (!items || items->empty()) return items;
@@ -183,8 +183,7 @@ class Run {
     return results;
   }
 
-  // What cannot be told of a mail, since it cannot be read, does not hold, and nor does its
-  // opposite.
+  // If the mail cannot be read, neither the condition nor its negation holds.
   bool passes(const TLIndexableItem& item, const Check& check) {
     const auto holds = value(item, check.node);
     return holds && *holds != check.negated;
@@ -242,11 +241,11 @@ class Run {
   const SearchRequest& _request;
   client::SearchServiceProxy& _service;
   MailFacts& _facts;
-  size_t _step = 0;      // candidates that are asked for
-  size_t _lookedAt = 0;  // that the daemon gives at most
+  size_t _step = 0;      // number of candidates requested
+  size_t _lookedAt = 0;  // the daemon's maximum number of candidates
   std::vector<client::ReplacedWord> _replaced;
   bool _truncated = false;
-  bool _fixed = false;  // asking for more candidates changes nothing
+  bool _fixed = false;  // requesting more candidates changes nothing
 };
 
 }  // namespace

@@ -25,7 +25,7 @@ constexpr size_t kMaxFileBytes = size_t{1} << 20;
 constexpr uint64_t kMinLimit = 1000;
 constexpr uint64_t kMaxLimit = kMaxMessageBytes;
 
-// Reads the value of one key. False where it is not one that is allowed.
+// Reads the value of one key. False if the value is not allowed.
 class Reader {
  public:
   Reader(Settings& settings, const std::string& home) : _settings(settings), _home(home) {}
@@ -94,7 +94,7 @@ class Reader {
     return std::nullopt;
   }
 
-  // Of a text such as "20 MB".
+  // The bytes in a text such as "20 MB".
   static std::optional<uint64_t> bytesOf(const std::string& text) {
     uint64_t number = 0;
     const char* const end = text.data() + text.size();

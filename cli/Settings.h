@@ -9,26 +9,26 @@
 
 namespace cli {
 
-// What the user has set for `sync` and `watch` in config.toml. Paths are absolute.
+// The user's settings for `sync` and `watch` from config.toml. Paths are absolute.
 struct Settings {
   std::vector<std::string> roots;
   std::vector<std::string> excluded;           // directories
-  std::vector<std::string> excludedNames;      // the same, below each root
+  std::vector<std::string> excludedNames;      // directories, relative to each root
   std::map<std::string, std::string> classes;  // protection class by folder
-  uint64_t largestMail = 0;                    // in bytes; 0 for no limit of the user's own
+  uint64_t largestMail = 0;                    // in bytes; 0 if the user set no limit
   bool onBattery = false;
 };
 
-// config.toml in tallow below $XDG_CONFIG_HOME, which is ~/.config unless set.
+// tallow/config.toml in $XDG_CONFIG_HOME, by default ~/.config.
 [[nodiscard]] std::string settingsPath();
 
-// The settings of a TOML text; those that it does not name keep their default. Or what is wrong
-// with it, for the user: file, line, key and what is allowed. `home` stands for "~".
+// Parses settings from a TOML text; missing keys keep their defaults. Or an error message for the
+// user with file, line, key and allowed values. `home` replaces "~".
 [[nodiscard]] std::variant<Settings, std::string> parseSettings(std::string_view text,
                                                                 const std::string& file,
                                                                 const std::string& home);
 
-// Those of the user's file; without one, the defaults.
+// The settings from the user's file; the defaults if there is none.
 [[nodiscard]] std::variant<Settings, std::string> readSettings();
 
 }  // namespace cli

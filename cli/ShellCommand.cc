@@ -10,7 +10,7 @@ namespace cli {
 int startShell(const std::string& command, const std::vector<std::string>& arguments, int input,
                pid_t& process) {
   std::vector<const char*> words{"sh", "-c", command.c_str()};
-  if (!arguments.empty()) words.push_back("sh");  // what stands as "$0"
+  if (!arguments.empty()) words.push_back("sh");  // "$0"
   for (const std::string& argument : arguments) words.push_back(argument.c_str());
   words.push_back(nullptr);
   posix_spawn_file_actions_t actions;

@@ -32,13 +32,13 @@ std::optional<size_t> rankOf(const std::string& argument) {
   return rank;
 }
 
-// A message that was asked for: by its identifier, and the words to mark in it.
+// A requested message: its identifier and the words to mark.
 struct Wanted {
   std::string identifier;
   std::vector<std::string> words;
 };
 
-// None after a complaint, with the status that goes with it.
+// Nullopt after an error message, with the exit status in `status`.
 std::optional<Wanted> wantedMessage(const std::string& argument, ExitStatus& status) {
   const auto search = lastSearch();
   Wanted wanted;
@@ -98,7 +98,7 @@ bool writeAll(int file, std::string_view bytes) {
   return true;
 }
 
-// A new file that is not there yet; links are not followed. A part of one does not stay.
+// Creates a new file and does not follow links. Removes the file if the write fails.
 bool writeNewFile(const std::string& path, std::string_view bytes) {
   constexpr int kNew = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
   const platform::FileDescriptor file(open(path.c_str(), kNew, 0600));
@@ -110,7 +110,7 @@ bool writeNewFile(const std::string& path, std::string_view bytes) {
   return false;
 }
 
-// In place of a file, by one rename. What is no plain file stays.
+// Replaces a regular file with one rename. Anything else is left alone.
 bool replaceFile(const std::string& path, std::string_view bytes) {
   struct stat info;
   if (lstat(path.c_str(), &info) == 0 && !S_ISREG(info.st_mode)) {
@@ -166,7 +166,7 @@ ExitStatus runShow(const Options& options) {
   const auto message = readMessage(wanted->identifier, reader);
   if (!message) return ExitStatus::failure;
   if (options.raw) {
-    // Other programs get it as it is.
+    // Other programs receive the original bytes.
     return isatty(STDOUT_FILENO) == 1 ? page(cleanLinesForTerminal(*message)) : print(*message);
   }
   const auto view = MailView::parse(*message);

@@ -22,7 +22,7 @@ std::string variable(const char* name) {
   return value == nullptr ? "" : value;
 }
 
-// Files may go while this looks.
+// Files may be removed during the scan.
 std::optional<uint64_t> bytesIn(const std::filesystem::path& directory) {
   std::error_code failure;
   uint64_t bytes = 0;
@@ -35,7 +35,7 @@ std::optional<uint64_t> bytesIn(const std::filesystem::path& directory) {
   return failure ? std::nullopt : std::optional(bytes);
 }
 
-// The data root of the daemon that is asked; none where that is not known.
+// The data root of the daemon in use; nullopt if unknown.
 std::optional<std::string> knownDataRoot(const Options& options) {
   const bool told = !options.stateDirectory.empty() || !variable("STATE_DIRECTORY").empty();
   if (!told && options.runtimeDirectory != rpc::defaultRuntimeDirectory()) return std::nullopt;

@@ -9,33 +9,33 @@
 
 namespace cli {
 
-// Where the daemon has its data: as the command line or $STATE_DIRECTORY says; else, when it is the
-// user's own service, where systemd puts its state, of new and of old; else as the system's
-// service.
+// The daemon's data directory: from the command line or $STATE_DIRECTORY; otherwise, for the user's
+// own service, the directory that current or older versions of systemd use for state; otherwise
+// that of the system service.
 [[nodiscard]] std::string stateDirectory(const Options& options);
 
-// Whether the client can see that nothing was ever indexed for the class: a daemon has worked in
-// the state directory, and the class has no directory there. False where the state directory is not
-// known to be that of the daemon, or cannot be read.
+// Whether the client can see that nothing was ever indexed for the class: a daemon has used the
+// state directory, and the class has no directory there. False if the state directory is not known
+// to be the daemon's or cannot be read.
 [[nodiscard]] bool isUnknownClass(const Options& options);
 
-// What to tell the user then.
+// The message for an unknown class.
 [[nodiscard]] std::string unknownClassText(const Options& options);
 
-// Says so; the status that goes with it.
+// Prints that message and returns the matching exit status.
 [[nodiscard]] ExitStatus complainOfUnknownClass(const Options& options);
 
-// The classes that have a directory, in order; none where the state directory is not known to be
-// that of the daemon, or cannot be read.
+// The sorted classes that have a directory; empty if the state directory is not known to be the
+// daemon's or cannot be read.
 [[nodiscard]] std::vector<std::string> classesOnDisk(const Options& options);
 
-// Bytes of the files of one protection class.
+// The size in bytes of the files of one protection class.
 struct DiskUse {
   uint64_t index = 0;
   uint64_t store = 0;
 };
 
-// None where this process does not see them.
+// Nullopt if this process cannot see the files.
 [[nodiscard]] std::optional<DiskUse> diskUse(const Options& options);
 
 }  // namespace cli

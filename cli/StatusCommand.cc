@@ -27,28 +27,29 @@ constexpr size_t kBarColumns = 20;
 constexpr size_t kShownProblems = 20;  // in text
 constexpr size_t kMaxProblems = 10000;
 constexpr size_t kLockStatusBytes = 64;
-constexpr int kSchema = 1;  // of the JSON
+constexpr int kSchema = 1;  // of the JSON output
 
-// What the daemon tells of one class.
+// The daemon's statistics for one class.
 struct IndexStatus {
   int64_t stored = 0;      // items
   int64_t searchable = 0;  // of these
   int64_t textBytes = 0;
   int64_t suffixes = 0;
-  int64_t hotSuffixes = 0;  // not sorted in yet
+  int64_t hotSuffixes = 0;  // not yet merged into a shard
   int64_t merges = 0;       // since the index was opened
-  double mergeSeconds = 0;  // of these together
+  double mergeSeconds = 0;  // total duration of the merges
   bool merging = false;
   int64_t deleted = 0;  // documents whose text is still in the files
 
-  // How much of the files belongs to deleted mail, from 0 to 1; mails are taken for equally long.
+  // The share of the files that belongs to deleted mail, from 0 to 1, assuming mails of equal
+  // length.
   [[nodiscard]] double deletedShare() const {
     const int64_t all = searchable + deleted;
     return all <= 0 ? 0.0 : static_cast<double>(deleted) / static_cast<double>(all);
   }
 };
 
-// The number after a name in the daemon's metrics; 0 where it has none.
+// The value of a name in the daemon's metrics; 0 if missing.
 int64_t metric(const std::string& metrics, const char* name) {
   const size_t at = metrics.find(name);
   return at == std::string::npos
@@ -111,7 +112,7 @@ std::string barOf(const mailsync::FolderCount& count) {
   return fmt::format("[{:=>{}}{:>{}}]", "", filled, "", kBarColumns - filled);
 }
 
-// Whether a watch keeps the mailboxes in step at present.
+// Whether a watch is running for the mailboxes.
 bool isWatched(const Options& options) {
   std::optional<TLError> failure;
   const std::string path = mailsync::watchLockPath(syncSettings(options));
@@ -195,16 +196,16 @@ std::string diskText(const DiskUse& disk, const std::optional<IndexStatus>& inde
   return text + '\n';
 }
 
-// All that there is to tell of one class.
+// All information about one class.
 struct ClassStatus {
   std::string name;
   std::unique_ptr<mailsync::Catalogue> catalogue;
   std::optional<int64_t> lastSync;
-  bool isNew = false;  // nothing was ever indexed, and the daemon is not asked
+  bool isNew = false;  // nothing was ever indexed, so the daemon is not asked
   std::optional<IndexStatus> index;
   std::optional<DiskUse> disk;
   bool watched = false;
-  std::optional<TLError> error;  // of catalogue or index
+  std::optional<TLError> error;  // from the catalogue or the index
 };
 
 Options withClass(Options options, const std::string& name) {
@@ -248,8 +249,8 @@ nlohmann::json classJSON(const ClassStatus& status) {
           {"watched", status.watched}};
 }
 
-// The class of the command line; else all that have an index or a catalogue, as far as the state
-// directory and the settings tell, and the default one where there is none.
+// The class of the command line; otherwise all classes with an index or mailboxes, as far as the
+// state directory and the settings show, or the default class if there are none.
 std::vector<std::string> classesOf(const Options& options) {
   if (options.classGiven) return {options.protectionClass};
   const std::vector<std::string> onDisk = classesOnDisk(options);
@@ -285,7 +286,7 @@ std::string statusJSON(const std::vector<ClassStatus>& classes, const std::strin
 
 }  // namespace
 
-// What the catalogue knows is shown without the daemon as well.
+// The catalogue's part is shown even without the daemon.
 ExitStatus runStatus(const Options& options) {
   std::vector<ClassStatus> classes;
   for (const std::string& name : classesOf(options)) {

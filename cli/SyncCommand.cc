@@ -21,7 +21,7 @@ void takeInterrupt(int signal) {
   std::signal(signal, SIG_DFL);
 }
 
-// The bar of a run, whose length is known once the mailboxes have been looked through.
+// The progress bar of a run. Its total is known after the scan of the mailboxes.
 class SyncProgress {
  public:
   void update(uint64_t messages, uint64_t deletions, const mailsync::DeliveryCounts& done) {
@@ -57,7 +57,7 @@ nlohmann::json jsonOf(const mailsync::SyncReport& report) {
 
 // The run of one class.
 struct GroupRun {
-  bool done = false;  // to its end; else the error has been told
+  bool done = false;  // the run was completed; otherwise its error has been printed
   ExitStatus status = ExitStatus::done;
   mailsync::SyncReport report;
   std::string plan;
@@ -148,7 +148,7 @@ std::string summaryOf(const mailsync::SyncReport& report, bool dryRun) {
   return report.cancelled ? text + ", interrupted" : text;
 }
 
-// The classes one after the other; a daemon that is not there ends it.
+// Syncs one class after another; stops if the daemon is not running.
 ExitStatus runSync(const Options& options) {
   const auto groups = mailboxGroups(options);
   if (!groups || interrupted()) return ExitStatus::failure;

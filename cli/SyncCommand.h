@@ -9,15 +9,15 @@
 
 namespace cli {
 
-// What `sync`, `status` and searches have in common, from the command line.
+// The settings that `sync`, `status` and searches share, from the command line.
 [[nodiscard]] mailsync::SyncSettings syncSettings(const Options& options);
 
 // The same for the mailboxes of one class.
 [[nodiscard]] mailsync::SyncSettings syncSettings(const Options& options,
                                                   const MailboxGroup& group);
 
-// True once SIGINT or SIGTERM has come; a second signal ends the process at once. The first call
-// takes over the signals.
+// True after SIGINT or SIGTERM; a second signal ends the process at once. The first call installs
+// the signal handlers.
 [[nodiscard]] bool interrupted();
 
 // One line, such as "3 added, 1 deleted".

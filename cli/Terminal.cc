@@ -67,7 +67,7 @@ std::string escapeJSONForTerminal(std::string_view json) {
   out.reserve(json.size());
   size_t done = 0;
   for (size_t i = 0; i < units.size(); ++i) {
-    // The line feeds of the layout stay; those inside strings are escaped already.
+    // Keeps the line feeds of the layout; those in strings are already escaped.
     const char16_t c = units[i];
     if (c == '\n' || !(isControl(c) || changesDirection(c))) continue;
     platform::appendUTF8(TLStringView(units).substr(done, i - done), out);
@@ -82,7 +82,7 @@ std::string fitted(std::string_view text, size_t columns) {
   if (columns == 0) return std::string(text);
   const TLString units = platform::fromUTF8(text);
   size_t used = 0;
-  size_t fits = 0;  // where the mark would go
+  size_t fits = 0;  // where the ellipsis would go
   for (size_t i = 0; i < units.size();) {
     UChar32 c;
     const size_t at = i;

@@ -5,32 +5,32 @@
 
 namespace cli {
 
-// Text from outside made fit to be shown on one line of a terminal, as valid UTF-8: white space of
-// any kind becomes a blank, other control characters (C0, DEL, C1) become U+FFFD, and characters
-// that change the direction of the text around them (bidi embeddings, overrides and isolates) go.
+// Makes untrusted text safe for one line of a terminal, as valid UTF-8: any white space becomes a
+// space, other control characters (C0, DEL, C1) become U+FFFD, and characters that change the
+// direction of the surrounding text (bidi embeddings, overrides and isolates) are removed.
 [[nodiscard]] std::string cleanForTerminal(std::string_view text);
 
-// As above, for text of several lines: line feeds stay.
+// As above for text of several lines: line feeds are kept.
 [[nodiscard]] std::string cleanLinesForTerminal(std::string_view text);
 
-// A JSON text whose strings hold any characters, with those that cleanForTerminal would not let
-// through written as \u escapes. Invalid UTF-8 becomes U+FFFD.
+// Makes a JSON text safe for a terminal: characters in its strings that cleanForTerminal would
+// change are written as \u escapes. Invalid UTF-8 becomes U+FFFD.
 [[nodiscard]] std::string escapeJSONForTerminal(std::string_view json);
 
-// The beginning of a clean text that takes at most so many columns, with "…" at its end where
-// something is cut off: wide characters take two, combining ones none. 0 columns are no limit.
+// The longest prefix of a clean text that fits into `columns`, ending with "…" if something is cut
+// off. Wide characters take two columns, combining ones none. 0 columns mean no limit.
 [[nodiscard]] std::string fitted(std::string_view text, size_t columns);
 
-// The columns that a clean text takes.
+// The width of a clean text in columns.
 [[nodiscard]] size_t columnsTaken(std::string_view text);
 
-// The columns of a terminal; 0 where the descriptor is none.
+// The width of a terminal in columns; 0 if the descriptor is not a terminal.
 [[nodiscard]] size_t columnsOf(int descriptor);
 
 enum class ColorMode { automatic, always, never };
 
-// Whether to colour what goes to `descriptor`: by the mode, else on a terminal unless NO_COLOR is
-// set and not empty, or TERM is "dumb".
+// Whether to use colours on `descriptor`: according to the mode; in automatic mode, if it is a
+// terminal, unless NO_COLOR is set and not empty, or TERM is "dumb".
 [[nodiscard]] bool colorAllowed(ColorMode mode, int descriptor);
 
 // Escape sequences, empty when colours are off.

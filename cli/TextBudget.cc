@@ -18,7 +18,7 @@ namespace {
 
 constexpr size_t kCharacters = 0x110000;
 
-// The end of one text and the separator to the next.
+// The terminator of one text and the separator before the next.
 constexpr size_t kTextOverhead = 2;
 
 size_t computeCost(char32_t character) {
@@ -33,7 +33,7 @@ size_t computeCost(char32_t character) {
     last = folded.char32At(i);
     cost += static_cast<size_t>(U8_LENGTH(last)) + (last < 0x80 ? 0 : 1);
   }
-  // One that folds to ASCII can still end a word.
+  // A character that folds to ASCII can still end a word.
   if (last < 0x80) ++cost;
   return std::max(cost, static_cast<size_t>(U8_LENGTH(original)) + 1);
 }
@@ -41,7 +41,7 @@ size_t computeCost(char32_t character) {
 }  // namespace
 
 size_t zoneCostOf(char32_t character) {
-  // Filled as characters come up. One a thread, so that no lock is needed.
+  // Filled on demand. One per thread, so no lock is needed.
   thread_local const std::unique_ptr<uint8_t[]> known = std::make_unique<uint8_t[]>(kCharacters);
   if (character < 0x80) return 1;
   if (character >= kCharacters) return 4;
@@ -57,7 +57,7 @@ TLStringView TextBudget::take(TLStringView text) {
   size_t i = 0;
   while (i < text.size()) {
     if (const size_t run = std::min(platform::asciiPrefixLength(text.substr(i)), left); run > 0) {
-      left -= run;  // each costs 1
+      left -= run;  // each character costs 1
       i += run;
       afterASCII = true;
       continue;

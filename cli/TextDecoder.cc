@@ -12,7 +12,7 @@ namespace {
 
 constexpr const char* kWestern = "windows-1252";
 
-// Names under which mail is sent in something else, mostly a superset.
+// Charset names that mail often uses for another charset, mostly a superset.
 constexpr std::array<std::pair<std::string_view, const char*>, 6> kMeant{{
     {"iso-8859-1", kWestern},
     {"latin1", kWestern},

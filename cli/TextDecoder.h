@@ -10,10 +10,9 @@ struct UConverter;
 
 namespace cli {
 
-// Turns the bytes of mail bodies into text, by the name of a character set. What is no valid
-// sequence comes out as U+FFFD, and CR LF as LF. Bytes of an unknown, missing or plain ASCII
-// charset are read as UTF-8 when they are valid UTF-8, else as windows-1252, which is also what
-// mail that says ISO-8859-1 is written in. One thread.
+// Decodes mail bodies by charset name. Invalid sequences become U+FFFD, and CR LF becomes LF. An
+// unknown, missing or plain ASCII charset is decoded as UTF-8 if the bytes are valid UTF-8,
+// otherwise as windows-1252, which is also used for ISO-8859-1. One thread.
 class TextDecoder {
  public:
   [[nodiscard]] TLString decode(std::string_view bytes, std::string_view charset);
@@ -25,7 +24,7 @@ class TextDecoder {
 
   [[nodiscard]] UConverter* converterNamed(const std::string& name);
 
-  // The converter used last; mail tends to come in runs of one charset.
+  // The last converter, kept because consecutive mails often have the same charset.
   std::unique_ptr<UConverter, Close> _converter;
   std::string _converterName;
 };

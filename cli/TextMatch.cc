@@ -18,8 +18,8 @@ using usersyntax::Kind;
 using usersyntax::Node;
 using Key = TLAttributeKey;
 
-// What the index keeps of a text from a word on: up to the first space from here on, and never more
-// than the second.
+// How much of a text the index keeps from a word on: up to the first space after this many bytes,
+// and never more than kMaxKeptBytes.
 constexpr size_t kKeptBytes = 32;
 constexpr size_t kMaxKeptBytes = 100;
 
@@ -39,7 +39,7 @@ bool isWordless(const Node& node) {
   return node.kind == Kind::text && !zonesOf(node.field).empty() && wordCount(node) == 0;
 }
 
-// Calls body(key, text) for each text of an item, under the key where the index has it.
+// Calls body(key, text) for each text of an item, with the key that the index uses.
 template <typename Body>
 void forEachText(const TLIndexableItem& item, const Body& body) {
   static constexpr std::pair<Key, Key> kPersons[] = {
@@ -89,7 +89,7 @@ const std::vector<Key>& zonesOf(Field field) {
                                       ADDITIONAL_RECIPIENT_EMAIL_ADDRESSES,
                                       HIDDEN_ADDITIONAL_RECIPIENTS,
                                       HIDDEN_RECIPIENT_EMAIL_ADDRESSES};
-  // As a search for words, which gives hidden recipients no weight.
+  // Like a search for words, which ignores hidden recipients.
   static const std::vector<Key> kAny{SUBJECT,
                                      TEXT_CONTENT,
                                      HTML_CONTENT_DATA,

@@ -17,10 +17,10 @@ namespace {
 
 constexpr size_t kSendersColumns = 20;
 constexpr size_t kMaxShownRanks = 8;
-// A longer one is none that a mail program has made.
+// No mail program creates longer ones.
 constexpr size_t kMaxMessageID = 250;
 
-// Sets that are joined one by one; a set is known by one of its members.
+// Union-find: each set is represented by one of its members.
 class DisjointSets {
  public:
   explicit DisjointSets(size_t members) : _parents(members) {
@@ -39,8 +39,7 @@ class DisjointSets {
   std::vector<size_t> _parents;
 };
 
-// What stands in < > in a header field. Other text there, such as "Your message of Monday", is
-// none.
+// Adds the IDs in < > from a header field and ignores other text, such as "Your message of Monday".
 void addMessageIDs(const std::string& field, std::vector<std::string>& ids) {
   for (size_t begin = field.find('<'); begin != std::string::npos; begin = field.find('<', begin)) {
     const size_t end = field.find('>', begin);
@@ -51,7 +50,7 @@ void addMessageIDs(const std::string& field, std::vector<std::string>& ids) {
   }
 }
 
-// The messages that the mail is or refers to.
+// The IDs of the mail itself and of the messages that it refers to.
 std::vector<std::string> messagesOf(const MailHead& head) {
   std::vector<std::string> ids;
   addMessageIDs(head.references, ids);
@@ -70,7 +69,7 @@ const TLIndexableItem& newestOf(const Hits& hits, const Thread& thread) {
   return *hits[*newest].item;
 }
 
-// Each once, in the order of the hits.
+// Each sender once, in the order of the hits.
 std::string sendersOf(const Hits& hits, const Thread& thread) {
   std::vector<std::string> senders;
   for (const size_t hit : thread) {
@@ -95,7 +94,7 @@ std::string ranksOf(const Thread& thread) {
 
 std::vector<Thread> threadsOf(const Hits& hits, MailFacts& facts) {
   DisjointSets sets(hits.size());
-  std::unordered_map<std::string, size_t> known;  // by Message-ID: a hit that names it
+  std::unordered_map<std::string, size_t> known;  // by Message-ID: a hit that mentions it
   for (size_t hit = 0; hit < hits.size(); ++hit) {
     const auto head = facts.head(platform::toUTF8(platform::orEmpty(hits[hit].item->identifier())));
     if (!head) continue;
@@ -105,7 +104,7 @@ std::vector<Thread> threadsOf(const Hits& hits, MailFacts& facts) {
     }
   }
   std::vector<Thread> threads;
-  std::unordered_map<size_t, size_t> places;  // by the set: which thread
+  std::unordered_map<size_t, size_t> places;  // by set: the index of the thread
   for (size_t hit = 0; hit < hits.size(); ++hit) {
     const auto [at, added] = places.try_emplace(sets.find(hit), threads.size());
     if (added) threads.emplace_back();

@@ -8,24 +8,24 @@
 #include "cli/MailFacts.h"
 #include "cli/Results.h"
 
-// Results by conversation.
+// Groups results by conversation.
 namespace cli {
 
-// More results than these are not put into threads: their mails have to be read.
+// Maximum number of results to group, because each mail must be read.
 inline constexpr size_t kMaxThreadedHits = 10000;
 
-// Message-IDs of the References of one mail that count: the first, and the last of the rest.
+// Maximum number of References of one mail that count: the first, and the last of the others.
 inline constexpr size_t kMaxReferences = 100;
 
-// The hits of one conversation, by their place among all hits, best first.
+// The hits of one conversation as indexes into all hits, best first.
 using Thread = std::vector<size_t>;
 
-// Hits are in one thread where one refers to the other by its Message-ID, in References or
-// In-Reply-To, or both refer to one message, be it found or not. Threads are in the order of their
-// best hits. A mail that cannot be read is a thread of its own.
+// Hits are in one thread if one refers to the other by Message-ID, in References or In-Reply-To, or
+// if both refer to the same message, found or not. Threads are ordered by their best hit. A mail
+// that cannot be read is its own thread.
 [[nodiscard]] std::vector<Thread> threadsOf(const Hits& hits, MailFacts& facts);
 
-// What is shown: a part of the threads of these hits.
+// The part of the threads to show.
 struct ThreadPage {
   const Hits& hits;
   std::span<const Thread> threads;
@@ -33,11 +33,11 @@ struct ThreadPage {
   bool complete = true;  // false: there may be more
 };
 
-// A line for each thread: the rank of its best hit, the date of its newest, their senders, the
-// subject of the best, and the ranks of all where there are several. As resultsText is.
+// One line per thread: the rank of its best hit, the date of its newest hit, all senders, the
+// subject of the best hit, and all ranks if there are several. Otherwise as resultsText.
 [[nodiscard]] std::string threadsText(const ThreadPage& page, const std::string& words,
                                       const Palette& palette, size_t columns);
-// An object as of resultsJSON, with "threads", each with "subject" and "results", in place of
+// An object as from resultsJSON, with "threads" instead of "results"; each thread has "subject" and
 // "results".
 [[nodiscard]] std::string threadsJSON(const ThreadPage& page, MailFacts& facts);
 

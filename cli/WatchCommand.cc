@@ -36,7 +36,7 @@ void takeStop(int signal) {
   eventfd_write(stopDescriptor, 1);
 }
 
-// Tells systemd, where it has started the program, how it is.
+// Reports the state of the program to systemd, if systemd has started it.
 class Supervisor {
  public:
   Supervisor() {
@@ -46,7 +46,7 @@ class Supervisor {
     }
   }
   void tell(const std::string& state) { sd_notify(0, state.c_str()); }
-  // Says that the program is alive, where that is due.
+  // Sends the watchdog message when it is due.
   void touch(Clock::time_point now) {
     if (!_interval || now < _next) return;
     _next = now + *_interval;
@@ -102,7 +102,7 @@ class WatchLoop {
   }
 
  private:
-  // Until something has changed, something is due or the program is to end.
+  // Waits for a change, a due time or the end of the program.
   void wait() {
     auto due = _supervisor.next();
     std::vector<pollfd> descriptors{{stopDescriptor, POLLIN, 0}};

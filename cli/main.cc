@@ -6,9 +6,9 @@
 
 // The command-line client of tallowsearchd.
 int main(int argc, char** argv) {
-  // A reader of our output that goes away shows as a failed write.
+  // If the reader of our output closes the pipe, the write fails instead.
   std::signal(SIGPIPE, SIG_IGN);
-  // The commands tell what users need to know.
+  // The commands report what users need to know.
   platform::setProcessLogThreshold(platform::LogLevel::error);
   cli::ExitStatus status = cli::ExitStatus::failure;
   const auto options = cli::parseCommandLine(argc, argv, status);
