@@ -28,7 +28,7 @@ namespace {
 
 class CommandsTest : public testing::Test {
  protected:
-  // What the client keeps for its user goes into a directory of the test.
+  // The client's user files go into a directory of the test.
   CommandsTest() {
     for (const char* const name : {"XDG_STATE_HOME", "XDG_RUNTIME_DIR", "XDG_CONFIG_HOME"}) {
       setenv(name, (home / name).c_str(), 1);
@@ -36,7 +36,7 @@ class CommandsTest : public testing::Test {
     setenv("TALLOW_SESSION", "test", 1);
   }
 
-  // Runs the program with the arguments, and keeps its output.
+  // Runs the program with the arguments and captures its output.
   ExitStatus run(std::vector<std::string> arguments) {
     arguments.insert(arguments.begin(), {"tallow", "--runtime-dir", daemon.runtimeDirectory()});
     std::vector<const char*> argv;
@@ -98,7 +98,7 @@ class CommandsTest : public testing::Test {
 
 }  // namespace
 
-// What is sent is the text that was typed, without conditions, whatever it holds.
+// The typed text is sent without conditions, whatever it contains.
 TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
   const std::vector<std::pair<std::vector<std::string>, TLString>> cases{
       {{"invoice", "li"}, u"invoice li"},
@@ -128,8 +128,7 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
   EXPECT_THAT(daemon.calls().back(), testing::EndsWith(", 0, work, 9223372036854775807)"));
 }
 
-// Each alternative is a search of its own; what it leaves out is asked for where it finds
-// something.
+// Each alternative is a separate search; its exclusions are searched for only if it has results.
 TEST_F(CommandsTest, WhatIsNotOnlyWordsBecomesSearches) {
   const size_t before = daemon.calls().size();
   EXPECT_EQ(run({"search", "tea", "-milk", "OR", "from:tom"}), ExitStatus::nothingFound);
@@ -156,7 +155,7 @@ TEST_F(CommandsTest, ExpressionsFiltersAndParameters) {
             ExitStatus::nothingFound);
   EXPECT_EQ(printed(*lastQuery()), "a\nLEAF, STRING_NOT_EQUAL, AUTHORS, b");
   EXPECT_EQ(lastQuery()->rawQuery(), u"** == \"*a\" && kTLItemAuthors != b");
-  // Each filter is a condition of its own.
+  // Each filter is a separate condition.
   EXPECT_EQ(
       run({"search", "x", "--filter", "kTLItemAuthors = a || kTLItemAuthors = b", "y",
            "--filter=kTLItemSubject = c", "--param", "salt.maxTopK=5,ranking.freshnessWeight=1"}),
@@ -233,7 +232,7 @@ TEST_F(CommandsTest, ExplainShowsEachStep) {
   EXPECT_EQ(run({"explain", "--query", "false"}), ExitStatus::nothingFound);
   EXPECT_THAT(output, HasSubstr("terms\n  (none)\n"));
   EXPECT_THAT(errors, HasSubstr("nothing in the expression can be looked up"));
-  // Without the daemon the steps are shown as well.
+  // The steps are shown even without the daemon.
   daemon.stop();
   EXPECT_EQ(run({"explain", "x"}), ExitStatus::unreachable);
   EXPECT_THAT(output, HasSubstr("->x<-"));
@@ -319,7 +318,7 @@ TEST_F(CommandsTest, CopiesOfAMessageAreOneResult) {
   EXPECT_EQ(lastQuery()->searchParams()->intValueForKey("salt.maxTopK"), 1000);
 }
 
-// A value before the command that is called like one is not it.
+// An option value that equals a command name is not taken for the command.
 TEST_F(CommandsTest, OptionsStandBeforeAndAfterTheCommand) {
   const std::vector<std::vector<std::string>> same{
       {"search", "--class=index", "--limit", "3", "--offset=1", "tea", "-milk"},
@@ -373,7 +372,7 @@ TEST_F(CommandsTest, DeleteGoesOnBehindAFailure) {
                                           "DeleteItemsWithIdentifiers([file/b], tallow, default)"));
 }
 
-// Folders are asked for, since the daemon deletes only folders that it is told by name.
+// The client searches for the folders first, because the daemon deletes folders only by exact name.
 TEST_F(CommandsTest, DeleteTakesPathsAndFolders) {
   const std::string folder = home / "Mail dir";
   std::filesystem::create_directories(folder + "/cur");
@@ -504,7 +503,7 @@ TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
   EXPECT_EQ(run({"index", TALLOW_SAMPLE_MAIL}), ExitStatus::unreachable);
 }
 
-// The catalogue's part is shown with and without a daemon that answers.
+// The catalogue's part is shown with and without a running daemon.
 TEST_F(CommandsTest, SyncAndStatus) {
   const std::string mail = home / "mail";
   std::filesystem::create_directories(mail + "/cur");
@@ -515,7 +514,7 @@ TEST_F(CommandsTest, SyncAndStatus) {
   EXPECT_EQ(run({"sync", mail, "-n", "-v"}), ExitStatus::done);
   EXPECT_THAT(output, HasSubstr("send file" + mail + "/cur/1\n"));
   EXPECT_THAT(daemon.indexedItems(), testing::IsEmpty());
-  // One message has nothing in it: all but that is done.
+  // One message is empty; all others are indexed.
   EXPECT_EQ(run({"sync", mail}), ExitStatus::failure);
   EXPECT_EQ(output, "1 added, 1 failed\n");
   EXPECT_EQ(daemon.indexedItems().size(), 1U);

@@ -16,7 +16,7 @@
 using testing::HasSubstr;
 using testing::StartsWith;
 
-// What a person does with mail that is indexed, by the program and a real daemon.
+// Everyday use of indexed mail, with the program and a real daemon.
 namespace {
 
 class EverydayTest : public testing::Test {
@@ -27,7 +27,7 @@ class EverydayTest : public testing::Test {
     ASSERT_EQ(run("index " + mail), 0) << errors;
   }
 
-  // The exit status of `tallow ARGUMENTS`, as a shell reads them.
+  // Runs `tallow ARGUMENTS` in a shell and returns the exit status.
   int run(const std::string& arguments, const std::string& environment = "") {
     const std::string command = fmt::format(
         "cd {0} && env -u PAGER -u STATE_DIRECTORY XDG_RUNTIME_DIR={0}/run "
@@ -69,7 +69,7 @@ TEST_F(EverydayTest, ShowsWhatTheLastSearchFound) {
   EXPECT_THAT(output, HasSubstr("the \x1b[1;33mcorrected\x1b[0m \x1b[1;33minvoice\x1b[0m 4502"));
   EXPECT_EQ(run("show 1"), 1);
   EXPECT_EQ(run("show 2", "TALLOW_SESSION=other"), 2);
-  // A search without results has no ranks either; lists for other programs change none.
+  // A search without results clears the ranks; output for other programs does not change them.
   EXPECT_EQ(run("search --format=files harbour"), 0);
   EXPECT_EQ(run("show 2"), 0);
   EXPECT_EQ(run("search nothingofthekind"), 1);
@@ -156,7 +156,7 @@ TEST_F(EverydayTest, DeletesFoldersAndFiles) {
   EXPECT_EQ(count("folder:" + mail), 0);
 }
 
-// `index` names them by their place, `sync` by their content.
+// `index` identifies messages by place, `sync` by content.
 TEST_F(EverydayTest, DeletesAMessageOfAMailboxByItsPlace) {
   const std::string message = mail + "/archive.mbox:736";
   EXPECT_EQ(run("delete " + message), 0);
@@ -178,7 +178,7 @@ TEST_F(EverydayTest, SavedSearches) {
   EXPECT_EQ(count("invoice -@bills"), count("'invoice -(subject:invoice -corrected)'"));
   EXPECT_EQ(run("search @nothing"), 2);
   EXPECT_THAT(errors, HasSubstr("there is no saved search \"nothing\""));
-  // Lines that are none stay as they are.
+  // Lines that are not searches are kept.
   const std::string file = directory / "config/tallow/searches";
   platform::writeFileAtomically(file, "# mine\n\nodd\nbills " + std::string("x\n"), nullptr);
   EXPECT_EQ(run("save bills harbour"), 0);
@@ -235,7 +235,7 @@ TEST_F(EverydayTest, StatusOfAllClassesAndOfDeletedMail) {
   const auto one = classes(state + " --class work");
   ASSERT_EQ(one.size(), 1U);
   EXPECT_EQ(one[0].at("index").at("messages"), all[1].at("index").at("messages"));
-  // One that the settings name counts once it has been synced, and is not made by the look.
+  // A class from the settings counts after its first sync; showing the status does not create it.
   platform::createDirectories(directory / "config/tallow", nullptr);
   platform::writeFileAtomically(
       directory / "config/tallow/config.toml",

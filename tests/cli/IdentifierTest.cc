@@ -16,7 +16,7 @@ TEST(Identifier, NamesThePlaceOfAMessage) {
   EXPECT_EQ(fileIdentifier("/m/Entwürfe/a b#1?.eml"), "file/m/Entw%C3%BCrfe/a%20b%231%3F.eml");
   EXPECT_EQ(fileIdentifier("/m/\xFF%:@"), "file/m/%FF%25%3A%40");
   EXPECT_EQ(mboxIdentifier("/m/in box", 12), "mbox/m/in%20box?offset=12");
-  // Flags go from the names of Maildir files only.
+  // Flags are removed only from the names of Maildir files.
   EXPECT_EQ(fileIdentifier("/m/cur/17.M1.host:2,FS"), "file/m/cur/17.M1.host");
   EXPECT_EQ(fileIdentifier("/m/new/17.M1.host"), "file/m/new/17.M1.host");
   EXPECT_EQ(fileIdentifier("/m/cur:2,S/a/x:2,S"), "file/m/cur%3A2%2CS/a/x%3A2%2CS");

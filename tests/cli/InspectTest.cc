@@ -18,7 +18,7 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// The client and the program that it runs, on an index that the test has made.
+// The client and the program that it runs, on an index made by the test.
 namespace {
 
 namespace fs = std::filesystem;
@@ -28,12 +28,12 @@ using testing::StartsWith;
 class InspectTest : public testing::Test {
  protected:
   InspectTest() {
-    // What a daemon that ran here has left.
+    // The lock file that a daemon leaves.
     static_cast<void>(platform::ProcessLock::acquire(platform::processLockPath(state), nullptr));
     platform::createDirectories(platform::joinPath(platform::dataRoot(state), "default"), nullptr);
   }
 
-  // Runs `command` on the state with the client before it; keeps the output.
+  // Runs `tallow COMMAND` on the state and captures the output.
   int run(const std::string& command) { return shell(client + command); }
   int shell(const std::string& command) {
     const std::string redirected =
@@ -57,7 +57,7 @@ class InspectTest : public testing::Test {
     return all;
   }
 
-  // One zone of 8 words and one page, of the given suffixes of it.
+  // An index with one zone of 8 words and one page of the given suffixes.
   void makeIndex(const std::vector<salt::SuffixMeta>& page) const {
     auto made = salttest::newIndex(index);
     ASSERT_TRUE(salttest::addZone(*made, 1, 1, "aa ab ba abcd", {}));
@@ -225,8 +225,7 @@ TEST_F(InspectTest, ALiveIndexIsRefused) {
   EXPECT_EQ(run("validate"), 0);
 }
 
-// A look in progress holds nothing up: a daemon may start, and what it does to the index is not
-// seen.
+// A daemon may start while the index is inspected; its changes are not visible.
 TEST_F(InspectTest, ADaemonThatStartsMeanwhileIsNotHeldUpNorSeen) {
   makeLargeIndex();
   const std::string dump = salttest::loadIndex(index)->Dump();

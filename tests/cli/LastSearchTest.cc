@@ -42,7 +42,7 @@ TEST_F(LastSearchTest, EachSessionHasItsOwn) {
   for (const auto& entry : fs::directory_iterator(place)) {
     EXPECT_EQ(entry.status().permissions(), fs::perms::owner_read | fs::perms::owner_write);
   }
-  // The daemon's directory is used where it is there, and not made.
+  // The daemon's directory is used if it exists, and not created.
   EXPECT_FALSE(fs::exists(home / "run"));
   fs::create_directories(home / "run/tallow");
   EXPECT_FALSE(cli::lastSearch());

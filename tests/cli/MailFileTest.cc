@@ -42,7 +42,7 @@ std::string xz(const std::string& bytes) {
   return out;
 }
 
-// Reads one file and keeps what comes.
+// Reads one file and records what the sink receives.
 class MailFileTest : public testing::Test {
  protected:
   std::string write(const std::string& name, const std::string& bytes) {
@@ -100,7 +100,7 @@ TEST_F(MailFileTest, AnMboxComesApartAtItsFromLines) {
       {kFrom + "A: a\n\nno line feed at the end", {"A: a\n\nno line feed at the end"}},
       {kFrom + "A: a\n\n>From me\n>>From you\n> From us\n>Fromage\n",
        {"A: a\n\nFrom me\n>From you\n> From us\n>Fromage\n"}},
-      // Neither behind text nor without a date does a line begin a message.
+      // A From line does not begin a message after text or without a date.
       {kFrom + "A: a\n\ntext\n" + kFrom + "\nFrom now on it is 2024.\n\nFrom 9:15 we eat.\n",
        {"A: a\n\ntext\n" + kFrom + "\nFrom now on it is 2024.\n\nFrom 9:15 we eat.\n"}},
       {"From whoever\nA: a\n\none\n", {"A: a\n\none\n"}},
@@ -133,7 +133,7 @@ TEST_F(MailFileTest, FromLines) {
 TEST_F(MailFileTest, LinesLongerThanTheBufferStayWhole) {
   constexpr size_t kBuffer = cli::LineReader::kBufferBytes;
   for (const size_t size : {kBuffer - 1, kBuffer, kBuffer + 1, 3 * kBuffer + 7}) {
-    // Where the buffer ends inside the line, "From " at its start means nothing.
+    // "From " inside a long line has no meaning, even at the start of a buffer.
     std::string line(size, 'x');
     for (size_t at = 0; at + kFrom.size() < size; at += kBuffer / 2) line.replace(at, 5, "From ");
     const std::string first = "A: a\n\n" + line + "\n";
@@ -164,7 +164,7 @@ TEST_F(MailFileTest, CompressedFilesReadLikePlainOnes) {
   }
 }
 
-// Cut anywhere: what is whole is read, the rest is reported, and nothing else happens.
+// Truncated at any place: complete messages are read and the rest is reported.
 TEST_F(MailFileTest, TruncatedCompressionIsReported) {
   for (const std::string& bytes : {gzip(kTwo), xz(kTwo)}) {
     for (size_t size = 6; size < bytes.size(); ++size) {

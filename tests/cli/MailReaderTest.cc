@@ -30,7 +30,7 @@ class MailReaderTest : public testing::Test {
   std::optional<TLError> _error;
 };
 
-// The catalogue may be older than the mailbox: another message can begin where this one did.
+// The catalogue may be older than the mailbox: another message may be at the old offset.
 TEST_F(MailReaderTest, AMessageNamedByItsContentIsThatMessageOrNone) {
   const std::string unquoted = "Subject: two\n\nsecond\nFrom here on\n";
   const std::string name =
@@ -54,7 +54,7 @@ TEST_F(MailReaderTest, AMessageNamedByItsContentIsThatMessageOrNone) {
   EXPECT_FALSE(read(name));
 }
 
-// Directories are listed once, and again after a change that is told of.
+// Directories are listed once, and again only after `refresh`, if they have changed.
 TEST_F(MailReaderTest, AMaildirThatHasChangedIsListedAgain) {
   namespace fs = std::filesystem;
   const std::string maildir = _directory / "Mail";
@@ -69,7 +69,7 @@ TEST_F(MailReaderTest, AMaildirThatHasChangedIsListedAgain) {
   };
   EXPECT_EQ(path(), maildir + "/new/1.M1.host");
   fs::rename(maildir + "/new/1.M1.host", maildir + "/cur/1.M1.host:2,S");
-  // The times of directories go by ticks of the clock.
+  // Directory times have the resolution of clock ticks.
   fs::last_write_time(maildir + "/cur", fs::file_time_type::clock::now() + std::chrono::hours(1));
   EXPECT_EQ(path(), maildir + "/new/1.M1.host");
   reader.refresh();

@@ -14,7 +14,7 @@ std::string textOf(const std::string& mail) {
   return view == nullptr ? "(none)" : view->text();
 }
 
-// A multipart of parts that begin with their type.
+// A multipart; each part begins with its type.
 std::string multipart(const std::string& subtype, const std::vector<std::string>& parts) {
   const std::string boundary = "b-" + subtype;
   std::string text = "Content-Type: multipart/" + subtype + "; boundary=" + boundary + "\n\n";
@@ -81,7 +81,7 @@ TEST(MailView, AttachmentsAreAllThatIsNotRead) {
   EXPECT_EQ(view->text(), "read\nnotes\n");
 }
 
-// Neither many parts nor deep nesting costs the stack or much time.
+// Many parts or deep nesting must not exhaust the stack or take long.
 TEST(MailView, HostileMailHasBounds) {
   std::string deep = kHead;
   std::string messages = kHead;

@@ -24,13 +24,13 @@ std::shared_ptr<TLIndexableItem> parse(const std::string& bytes, std::string* re
   }
   const auto& message = std::get<cli::ParsedMessage>(result);
   if (cut != nullptr) *cut = message.cut;
-  // What goes over the wire is what counts.
+  // Compare the item as it is after encoding and decoding.
   auto item = std::make_shared<TLIndexableItem>();
   EXPECT_TRUE(item->initWithData(message.item->data()));
   return item;
 }
 
-// One attribute in few words.
+// One attribute as short text.
 std::string show(const TLAttribute& attribute) {
   std::string out = TLAttributeKeyAsString(attribute.key()) + "=";
   const auto text = [](const std::optional<TLString>& s) {
@@ -46,7 +46,7 @@ std::string show(const TLAttribute& attribute) {
   return out;
 }
 
-// All attributes but the three that every item has.
+// All attributes except the three that every item has.
 std::vector<std::string> attributesOf(const std::string& message) {
   std::vector<std::string> lines;
   const auto item = parse(message);
@@ -117,7 +117,7 @@ TEST(MessageParser, Bodies) {
       {"A: a\nContent-Type: text/plain; format=flowed\n\none \ntwo\n", {"TEXT_CONTENT=one two\n"}},
       {alternative + part + "text/plain\n\nplain\n" + part + "text/html\n\n<p>html\n--b--\n",
        {"TEXT_CONTENT=plain"}},
-      // A text part without text is as good as none.
+      // A text part without text is ignored.
       {alternative + part + "text/plain\n\n \n" + part + "text/html\n\n<p>html\n--b--\n",
        {"HTML_CONTENT_DATA=<<p>html>"}},
       {mixed + part + "text/plain\n\none\n" + part + "text/plain\n\ntwo\n--b--\n",
@@ -133,12 +133,12 @@ TEST(MessageParser, Bodies) {
       {mixed + part + "application/pdf\n\nx\n" + part +
            "image/png; name=\"=?utf-8?q?=C3=A4?=\"\n\ny\n--b--\n",
        {"ATTACHMENT_NAMES=[ä]", "ATTACHMENT_TYPES=[application/pdf][image/png]"}},
-      // A message inside the message belongs to it, unless it is attached.
+      // An embedded message is included unless it is an attachment.
       {mixed + part + "message/rfc822\n\nSubject: in\n\ninner\n--b--\n", {"TEXT_CONTENT=inner"}},
       {mixed + part +
            "message/rfc822\nContent-Disposition: attachment\n\nSubject: in\n\ninner\n--b--\n",
        {"ATTACHMENT_TYPES=[message/rfc822]"}},
-      // Without the boundary that it names, and without its end.
+      // Without its boundary, and without the closing boundary.
       {"A: a\nContent-Type: multipart/mixed; boundary=b\n\nlost\n", {}},
       {mixed + part + "text/plain\n\nopen end\n", {"TEXT_CONTENT=open end\n"}},
       {"A: a\nContent-Type: nonsense\n\nx\n", {"ATTACHMENT_TYPES=[application/octet-stream]"}},
@@ -229,7 +229,7 @@ TEST(MessageParser, TooLongTextsAreCut) {
   EXPECT_FALSE(cut);
 }
 
-// Bounds: none of these may crash, hang or exhaust the stack.
+// None of these may crash, hang or exhaust the stack.
 TEST(MessageParser, MonstersAreSurvived) {
   std::string nested = "A: a\n";
   for (int i = 0; i < 100000; ++i) {

@@ -9,14 +9,14 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// What tallow-query(7) and tallow-search(7) promise holds.
+// The statements of tallow-query(7) and tallow-search(7) are true.
 namespace {
 
 std::string readAll(const std::string& path) {
   return platform::readFile(path, size_t{1} << 20, nullptr).value_or("");
 }
 
-// A line of the page as it is shown.
+// A line of the page as displayed.
 std::string shown(std::string line) {
   for (const auto& [escape, text] : {std::pair("\\-", "-"), {"\\(aq", "'"}, {"\\e", "\\"}}) {
     for (size_t at; (at = line.find(escape)) != std::string::npos;) {

@@ -117,7 +117,7 @@ TEST_F(SampleMail, HeadersAndAttachmentsArrive) {
       "Priya Nair <priya.nair@example.org>");
   EXPECT_EQ(text(named("京都旅行の予定").personValuesForKey(Key::AUTHORS)->at(0)->name()),
             "佐藤 由紀");
-  // Received is 14 seconds after Date; a draft was never received.
+  // Received is 14 seconds after Date; a draft has no date of receipt.
   const TLIndexableItem& keys = named("Keys for the boat shed");
   EXPECT_EQ(keys.doubleValueForKey(Key::MAIL_DATE_RECEIVED),
             keys.doubleValueForKey(Key::CONTENT_CREATION_DATE) + 14);

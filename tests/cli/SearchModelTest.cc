@@ -17,7 +17,7 @@
 #include "tokenizer/TLLexemonAssetManager.h"
 #include "tokenizer/Tokenizer.h"
 
-// Random searches find the same mails as a look at each mail of the sample does.
+// Random searches find the same mails as a scan of all sample mails.
 namespace {
 
 using Key = TLAttributeKey;
@@ -29,7 +29,7 @@ using Words = std::vector<std::string>;
 
 constexpr double kNow = 1707955200;  // 2024-02-15
 
-// A mail as the model sees it: the words of each text of each attribute, and what its bytes say.
+// A mail in the model: the words of each text of each attribute, and facts from its bytes.
 struct Mail {
   std::multimap<Key, Words> texts;
   std::string identifier;
@@ -132,7 +132,7 @@ class SearchModel : public testing::Test {
     return list[below(list.size())];
   }
 
-  // A run of words that stand in some mail, mostly.
+  // A sequence of words, mostly from a sample mail.
   std::string words(size_t count) {
     const Words& text = oneOf(texts).second;
     const size_t begin = below(text.size());
@@ -184,7 +184,7 @@ class SearchModel : public testing::Test {
   static bool holdsWords(const Mail& mail, const Node& node) {
     Words wanted = wordsOf(platform::fromUTF8(node.text));
     for (Key key : cli::zonesOf(node.field)) {
-      if (key == Key::HTML_CONTENT_DATA) continue;  // among the text
+      if (key == Key::HTML_CONTENT_DATA) continue;  // included in the text
       const auto [begin, end] = mail.texts.equal_range(key);
       for (auto text = begin; text != end; ++text) {
         const Words& words = text->second;
@@ -304,7 +304,7 @@ TEST_F(SearchModel, RandomSearchesFindWhatALookAtEachMailFinds) {
   EXPECT_LT(refused, 100u);
 }
 
-// Conditions of the query language on times, numbers and flags hold as well.
+// Conditions of the query language on times, numbers and flags apply as well.
 TEST_F(SearchModel, FiltersMeanWhatTheySay) {
   const std::string date = "com_quill_mail_dateReceived";
   const struct {

@@ -91,7 +91,7 @@ TEST(Settings, MailboxesByClass) {
   EXPECT_EQ(groups[1].protectionClass, "work");
   EXPECT_THAT(groups[1].roots, ElementsAre(mail + "/work"));
   EXPECT_THAT(groups[1].excluded, ElementsAre(mail + "/work/.Trash"));
-  // A path that lies in such a folder has its class.
+  // A path in such a folder has the folder's class.
   groups = groupsOf({mail + "/work/plans"}, false);
   ASSERT_EQ(groups.size(), 1U);
   EXPECT_EQ(groups[0].protectionClass, "work");

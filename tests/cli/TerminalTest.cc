@@ -28,7 +28,7 @@ TEST(Terminal, TextIsCleaned) {
   EXPECT_EQ(cli::cleanLinesForTerminal("a\nb\x1b\n"), "a\nb\uFFFD\n");
 }
 
-// Whatever goes in: valid UTF-8 without controls comes out.
+// Any input gives valid UTF-8 without control characters.
 TEST(Terminal, RandomBytesComeOutHarmless) {
   std::mt19937 random(11);
   for (int round = 0; round < 3000; ++round) {
@@ -49,7 +49,7 @@ TEST(Terminal, RandomBytesComeOutHarmless) {
         EXPECT_FALSE((c >= 0x202A && c <= 0x202E) || (c >= 0x2066 && c <= 0x2069));
       }
     }
-    // What JSON says is still what went in.
+    // The JSON value still equals the input.
     EXPECT_EQ(nlohmann::json::parse(cli::jsonText(json))["key"],
               platform::toUTF8(platform::fromUTF8(bytes)));
   }

@@ -9,8 +9,8 @@
 using cli::TextBudget;
 using cli::TextDecoder;
 
-// What the text index makes of a character: its folded form, accents included, and a blank behind
-// every character that is no ASCII.
+// The size of a character in the text index: its folded form, including accents, and a space after
+// each non-ASCII character.
 TEST(TextBudget, ACharacterCostsAtLeastWhatItsFoldedFormTakes) {
   UErrorCode status = U_ZERO_ERROR;
   const icu::Normalizer2* folding = icu::Normalizer2::getNFKCCasefoldInstance(status);
@@ -36,7 +36,7 @@ TEST(TextBudget, TakesWholeCharactersWhileThereIsRoom) {
                 {u"abc", 4, 2, true},        {u"abc", 1, 0, true},
                 {u"яя", 8, 2, false},        {u"яя", 7, 1, true},
                 {u"京都", 10, 2, false},     {u"a京", 8, 2, false},
-                {u"a京", 7, 1, true},  // a blank between
+                {u"a京", 7, 1, true},  // a space in between
                 {u"\U0001F600", 6, 0, true}, {u"\U0001F600", 7, 2, false}};
   for (const auto& c : kCases) {
     TextBudget budget(c.budget);

@@ -43,7 +43,7 @@ TEST_F(ThreadsTest, MailsThatReferToTheSameAreOneThread) {
   add("Message-ID: <last@x>\nReferences: <reply@x>\nIn-Reply-To: <other@x", 8);
   const auto threads = threadsOf(hits, facts);
   EXPECT_THAT(threads, ElementsAre(Thread{0, 3, 7}, Thread{1}, Thread{2, 4}, Thread{5}, Thread{6}));
-  // Of too many references the first counts, and the last.
+  // Of too many references, the first and the last ones count.
   std::string middle;
   for (size_t i = 0; i < 2 * cli::kMaxReferences; ++i) middle += fmt::format(" <m{}@z>", i);
   add("References: <root@z>" + middle + " <end@z>", 9);
@@ -65,7 +65,7 @@ TEST_F(ThreadsTest, ALineAThread) {
       threadsText(page, "boats", plain, 0),
       "  1  2024-01-08 08:01  a@example.org         Boats\uFFFD of \u4EAC\u90FD  (2 results: 1 3)\n"
       "  2  2024-01-08 08:00  a@example.org         Boats\uFFFD of \u4EAC\u90FD\n");
-  // The subject is cut so that the line fits.
+  // The subject is shortened so that the line fits.
   const std::string narrow = threadsText(page, "", plain, 68);
   EXPECT_EQ(narrow.substr(0, narrow.find('\n')),
             "  1  2024-01-08 08:01  a@example.org         Boat…  (2 results: 1 3)");

@@ -7,7 +7,7 @@
 
 namespace {
 
-// A worker that doubles numbers, once the test lets it.
+// A worker that doubles numbers when the test allows it.
 class LatestWorkerTest : public testing::Test {
  protected:
   int work(int job, const std::stop_token& stop) {
@@ -52,7 +52,7 @@ TEST_F(LatestWorkerTest, OnlyTheLastJobHasAResult) {
   EXPECT_EQ(worker.take(), std::nullopt);
   worker.submit(1);
   awaitStart();
-  worker.submit(2);  // stops the first, and may begin
+  worker.submit(2);  // stops the first job and may begin
   worker.submit(3);
   letGo();
   awaitResult(1);
@@ -61,7 +61,7 @@ TEST_F(LatestWorkerTest, OnlyTheLastJobHasAResult) {
   EXPECT_EQ(started.back(), 3);
 }
 
-// The fixture ends although the job was not let go.
+// The worker is destroyed although the job was never allowed to finish.
 TEST_F(LatestWorkerTest, TheEndStopsTheJobInHand) {
   worker.submit(1);
   awaitStart();

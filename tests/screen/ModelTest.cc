@@ -41,7 +41,7 @@ class ModelTest : public testing::Test {
     return row;
   }
 
-  // Answers the search that the model hands out next with a page of `total` results.
+  // Answers the model's next search with a page of `total` results.
   Search answer(size_t total, bool complete = true) {
     const auto search = model.nextSearch();
     EXPECT_TRUE(search.has_value());
@@ -56,7 +56,7 @@ class ModelTest : public testing::Test {
     model.take(found);
     return *search;
   }
-  // Loads the mail that the model asks for next.
+  // Answers the model's next mail request.
   MailRequest load(const mailscreen::Glyphs& text, bool cut = false) {
     const auto request = model.nextMail();
     EXPECT_TRUE(request.has_value());
@@ -123,7 +123,7 @@ TEST_F(ModelTest, PagesGoOnAtBothEndsOfTheList) {
   press(Key::pageUp);
   EXPECT_FALSE(model.nextSearch());
   press(Key::pageDown);
-  press(Key::pageDown);  // the first is not there yet
+  press(Key::pageDown);  // the first page has not arrived yet
   EXPECT_EQ(answer(20).offset, page);
   EXPECT_EQ(selected(), "mail8");
   press(Key::up);
@@ -191,7 +191,7 @@ TEST_F(ModelTest, TheSelectedMailIsPreviewed) {
   const auto request = load(text);
   EXPECT_EQ(request, (MailRequest{"mail0", {"a"}, false}));
   EXPECT_FALSE(model.nextMail());
-  // So far down that the first hit is seen.
+  // Scrolled so that the first match is visible.
   EXPECT_LE(model.firstLine(), 60u);
   EXPECT_GT(model.firstLine() + model.layout().preview.rows, 60u);
   press(Key::down);
@@ -204,7 +204,7 @@ TEST_F(ModelTest, TheSelectedMailIsPreviewed) {
   model.take(Mail{*third, U"short"});
   EXPECT_EQ(model.document().lines(), 1u);
   EXPECT_EQ(model.firstLine(), 0u);
-  // Without room for a preview no mail is read.
+  // Without space for a preview, no mail is read.
   model.resize(5, 40);
   answer(3);
   press(Key::up);
@@ -332,7 +332,7 @@ TEST_F(ModelTest, FailuresAreToldAndTriedAgain) {
   EXPECT_EQ(model.rows().size(), 2u);
 }
 
-// Any keys, sizes and answers in any order leave what can be drawn.
+// The model can always be drawn after random keys, sizes and answers.
 TEST_F(ModelTest, RandomHistoriesStaySound) {
   std::mt19937 random(5);
   std::optional<Search> search;

@@ -18,8 +18,8 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// The program as a person sees it: in a terminal, with a real daemon and the sample mail. Skipped
-// where there is no tmux, but not where CI=true (scripts/ci-packages.list).
+// The program in a real terminal, with a real daemon and the sample mail. Skipped if tmux is
+// missing, except with CI=true (scripts/ci-packages.list).
 
 namespace fs = std::filesystem;
 using testing::HasSubstr;
@@ -71,7 +71,7 @@ class ScreenProcessTest : public testing::Test {
         "XDG_CONFIG_HOME={0}/config TZ=UTC SHELL=/bin/bash {1} {2} -u -f /dev/null -S {0}/tmux {3}",
         directory.path(), variables, kTerminal, arguments);
   }
-  // A shell in a terminal of this size, and the program in it.
+  // Starts a shell in a terminal of this size, and the program in it.
   void open(int columns, int rows) {
     outputOf(tmux(
         fmt::format("new-session -d -s t -x {} -y {} "
@@ -94,7 +94,7 @@ class ScreenProcessTest : public testing::Test {
     return all;
   }
 
-  // Looks at the screen until it is as it should be.
+  // Polls the screen until the condition holds.
   void awaitThat(const std::function<bool(const std::string&)>& holds,
                  const std::string& what) const {
     const auto end = std::chrono::steady_clock::now() + kPatience;
@@ -114,12 +114,13 @@ class ScreenProcessTest : public testing::Test {
               "\"" + text + "\" not on the screen");
   }
 
-  // The process of the program, a child of the shell.
+  // The process ID of the program, a child of the shell.
   [[nodiscard]] pid_t process() const {
     const int shell = std::atoi(outputOf(tmux("display-message -p -t t '#{pane_pid}'")).c_str());
     return std::atoi(outputOf(fmt::format("cat /proc/{0}/task/{0}/children", shell)).c_str());
   }
-  // The program has ended with this status, and the terminal is a line at a time again, with echo.
+  // Expects that the program has ended with this status, and that the terminal is in line mode with
+  // echo again.
   void expectRestored(int status = 0) const {
     awaitGone("Search:");
     type("echo left=$?; stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"");
@@ -129,7 +130,7 @@ class ScreenProcessTest : public testing::Test {
 
   const testsupport::TemporaryDirectory directory;
   const std::string mail = directory / "mail";
-  std::string variables;  // of the environment, NAME=VALUE
+  std::string variables;  // environment variables, NAME=VALUE
   std::unique_ptr<testsupport::DaemonProcess> daemon;
 };
 
@@ -147,7 +148,7 @@ TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
   awaitGone("Minutes");
   type("photos");
   await("Photos from the island");
-  // Letters of any script, moving in the line, and a word taken back.
+  // Letters of any script, cursor movement, and deleting a word.
   press("C-u");
   type("京都");
   await("京都");
@@ -161,7 +162,7 @@ TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
   await("Search: xinvoice");
   press("C-a DC");
   await("Your invoice 4471");
-  // Pasted text is a part of the line, whatever keys its characters are.
+  // Pasted text goes into the line, even if its characters are keys.
   press("C-e C-u");
   outputOf(tmux(
       "set-buffer -- \"$(printf 'photos\\rfrom\\tthe\\033OA\\017')\" \\; paste-buffer -p -t t"));
@@ -228,7 +229,7 @@ TEST_F(ScreenProcessTest, AnySizeIsDrawn) {
     outputOf(tmux(fmt::format("resize-window -t t -x {} -y {}", columns, rows)));
   };
   resize(130, 30);
-  // Beside the list.
+  // The preview is next to the list.
   awaitThat([&](const std::string& seen) { return seen.find("│ From:") != std::string::npos; },
             "the preview beside");
   resize(30, 5);
@@ -246,7 +247,7 @@ TEST_F(ScreenProcessTest, AnySizeIsDrawn) {
   expectRestored();
 }
 
-// Whatever is in a mail: what stands beside and below it is where it was.
+// No mail text may move what is shown next to it or below it.
 TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
   fs::remove_all(mail);
   fs::create_directories(mail);
@@ -309,7 +310,7 @@ TEST_F(ScreenProcessTest, ADaemonThatGoesIsWaitedFor) {
   startDaemon();
   await("Oarlock fixed");
   awaitGone("not running");
-  // Started anew between two keys, it is as if it had been there.
+  // A restart between two keys is not noticed.
   daemon->signal(SIGTERM);
   daemon->wait();
   startDaemon();
@@ -337,7 +338,7 @@ TEST_F(ScreenProcessTest, TheTerminalIsGivenBack) {
   await("Your invoice 4471");
   press("C-c");
   expectRestored();
-  // As a shell tells of them; the last is Ctrl-C from elsewhere.
+  // The exit statuses that a shell reports; SIGINT has the effect of Ctrl-C.
   for (const auto& [signal, status] : {std::pair(SIGTERM, 143), {SIGHUP, 129}, {SIGINT, 0}}) {
     press("C-l");
     type(program());

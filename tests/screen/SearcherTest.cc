@@ -22,7 +22,7 @@ using testing::HasSubstr;
 
 namespace {
 
-// Waits until a thread of the screen has something to take.
+// Waits until a worker thread has a result.
 class Bell {
  public:
   void ring() {
@@ -109,7 +109,7 @@ TEST_F(SearcherTest, RefusalsAndUnreadableLinesHaveTheirReasons) {
   EXPECT_THAT(found.reason, HasSubstr("there is no saved search \"bills\""));
 }
 
-// A daemon that does not answer does not hold up the end of the program.
+// A daemon that does not answer does not delay the end of the program.
 TEST_F(SearcherTest, TheEndDoesNotWaitForAnAnswer) {
   testsupport::FakeDaemon fake;
   std::promise<void> called;

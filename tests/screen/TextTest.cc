@@ -18,7 +18,7 @@ using testing::ElementsAre;
 
 namespace {
 
-// Columns are those of the locale.
+// Column widths depend on the locale.
 class ScreenTextTest : public testing::Test {
  protected:
   void SetUp() override { ASSERT_NE(std::setlocale(LC_CTYPE, "C.UTF-8"), nullptr); }
@@ -73,7 +73,7 @@ TEST_F(ScreenTextTest, LinesAreBrokenBetweenWords) {
   EXPECT_THAT(wrapped("", 10), ElementsAre());
 }
 
-// Whatever the text and the width: nothing but a space at an end is lost, and all lines fit.
+// For any text and width, all lines fit, and only spaces at line ends are lost.
 TEST_F(ScreenTextTest, BrokenLinesHoldTheText) {
   static constexpr const char* kPieces[] = {"a", "bc ", " ", "\n", "京", "e\u0301", "\x02", "\x01"};
   std::mt19937 random(3);
@@ -122,7 +122,7 @@ TEST_F(ScreenTextTest, ALineIsEdited) {
   EXPECT_EQ(line.text(), "three lo\u0308ans ");
   EXPECT_TRUE(press(Key::deleteBefore));
   for (int i = 0; i < 3; ++i) EXPECT_FALSE(press(Key::left));
-  EXPECT_TRUE(press(Key::deleteBefore));  // with what is above it
+  EXPECT_TRUE(press(Key::deleteBefore));  // with the combining character on it
   EXPECT_EQ(line.text(), "three lans");
   EXPECT_TRUE(line.press({Key::text, "o"}));
   EXPECT_FALSE(press(Key::end));

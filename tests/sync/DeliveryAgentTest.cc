@@ -5,7 +5,7 @@
 #include "records/TLParamsManager.h"
 #include "tests/sync/WatchProcessSupport.h"
 
-// The watch beside a delivery agent that sorts mail into two folders, while somebody searches.
+// The watch with a delivery agent that sorts mail into two folders, during searches.
 
 namespace {
 
@@ -31,7 +31,7 @@ class DeliveryAgentTest : public testsupport::WatchProcessTest {
     EXPECT_EQ(pclose(agent), 0);
   }
 
-  // Subjects of the mail that is found.
+  // The subjects of the mails found.
   [[nodiscard]] std::multiset<std::string> found() const {
     TLQuery query;
     query.setRawQuery(u"parcel");

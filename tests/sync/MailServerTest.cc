@@ -1,7 +1,6 @@
 #include "tests/sync/WatchProcessSupport.h"
 
-// The watch beside what people use: an IMAP server, and a program that copies its mail into a
-// Maildir.
+// The watch in a usual setup: an IMAP server, and a program that copies its mail into a Maildir.
 
 namespace fs = std::filesystem;
 
@@ -11,7 +10,7 @@ constexpr const char* kServer = "/usr/lib/dovecot/imap";
 constexpr const char* kCopier = "/usr/bin/mbsync";
 constexpr int kFolders = 20;
 constexpr int kMails = 500;
-constexpr uid_t kNobody = 65534;  // the server does not serve root
+constexpr uid_t kNobody = 65534;  // the server refuses root
 
 class MailServerTest : public testsupport::WatchProcessTest {
  protected:
@@ -55,7 +54,7 @@ class MailServerTest : public testsupport::WatchProcessTest {
         directory.path(), command);
     EXPECT_EQ(std::system(whole.c_str()), 0) << textOf("run.log") << textOf("server.log");
   }
-  // Commands of a session, each a line.
+  // Runs the commands of one session, one per line.
   void serve(const std::vector<std::string>& commands) const {
     std::string session;
     for (const std::string& command : commands) session += "x " + command + "\r\n";
@@ -72,7 +71,7 @@ class MailServerTest : public testsupport::WatchProcessTest {
         number);
     return fmt::format("APPEND folder{} {{{}+}}\r\n{}", folder, text.size(), text);
   }
-  // What the index holds once it is in step with what has been copied.
+  // The number of indexed messages, once the index matches the copied mail.
   size_t copied() {
     run(fmt::format("{} -c copier.conf -a", kCopier));
     waitUntilInStep();

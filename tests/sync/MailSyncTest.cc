@@ -28,8 +28,8 @@ using testsupport::StoringDaemon;
 
 namespace {
 
-// One sync after the other over a mailbox of the test's own. Times of files and directories are set
-// back, each to one that was not there before, where `age` is called, so that they tell changes.
+// Repeated syncs of a mailbox of the test. `age` sets the times of files and directories back, each
+// to a value not used before, so that changes can be detected.
 class MailSyncTest : public testing::Test {
  protected:
   MailSyncTest() {
@@ -97,7 +97,7 @@ class MailSyncTest : public testing::Test {
                               &error);
   }
 
-  // "FOLDER: SUBJECT" of what the index holds.
+  // "FOLDER: SUBJECT" of each message in the index.
   [[nodiscard]] std::multiset<std::string> indexed() const {
     std::multiset<std::string> found;
     for (const auto& [identifier, item] : daemon.content().items) {
@@ -137,7 +137,7 @@ TEST_F(MailSyncTest, SendsOnlyWhatHasChanged) {
   EXPECT_EQ(daemon.received(), 2U);
   ASSERT_TRUE(sync());
   EXPECT_EQ(report.scan.entered, 0U);
-  // Neither a move nor a flag sends anything, and the identifier stays.
+  // Moves and flag changes send nothing, and the identifier stays the same.
   move("a/new/1", "a/cur/1:2,");
   move("a/cur/2:2,S", "a/cur/2:2,FRS");
   age();
@@ -151,9 +151,9 @@ TEST_F(MailSyncTest, SendsOnlyWhatHasChanged) {
   EXPECT_EQ(place->path, mail + "/a/cur/2:2,FRS");
   EXPECT_EQ(place->flags, "FRS");
   EXPECT_TRUE(place->indexed);
-  // To another folder it does.
+  // A move to another folder sends the message again.
   move("a/cur/1:2,", "b/cur/1:2,");
-  // Other content under the same name.
+  // New content under the same name.
   fs::remove(mail + "/a/cur/2:2,FRS");
   add("a/cur/2:2,FRS", "rewritten");
   age();
@@ -173,7 +173,7 @@ TEST_F(MailSyncTest, MessagesOfAnMboxKeepTheirIdentity) {
   EXPECT_EQ(indexed(),
             (Lines{"box.mbox: two", "box.mbox: same", "box.mbox: three", "box.mbox: four"}));
   EXPECT_EQ(daemon.received(), 6U);
-  // A mail program notes a state in the header.
+  // A mail program stores its state in the header.
   std::string text = mboxOf({"two", "same", "three", "four"});
   text.insert(text.find("Subject: two"), "Status: RO\nX-Status: F\n");
   put("box.mbox", text);
@@ -199,7 +199,7 @@ TEST_F(MailSyncTest, OneFileByTwoPathsCountsOnce) {
   fs::create_symlink(mail + "/a/cur/1:2,", mail + "/link.eml");
   ASSERT_TRUE(sync({mail, mail + "/a/../a", mail + "/a"}));
   EXPECT_EQ(daemon.content().items.size(), 1U);
-  // Each of the names can be the last.
+  // Either name can be the last one left.
   const auto first = cli::parseIdentifier(daemon.content().items.begin()->first)->path;
   fs::remove(mail + "/a/cur/1:2,");
   ASSERT_TRUE(sync());
@@ -214,17 +214,17 @@ TEST_F(MailSyncTest, WhatIsNotThereDeletesNothing) {
   ASSERT_TRUE(sync());
   EXPECT_THAT(complaints, ElementsAre(HasSubstr("is not there")));
   EXPECT_EQ(indexed().size(), 2U);
-  // Where a disk was mounted there is an empty directory.
+  // An empty directory is left where a disk was mounted.
   fs::create_directories(mail + "/b/cur");
   ASSERT_TRUE(sync());
   EXPECT_EQ(indexed().size(), 2U);
   fs::remove_all(mail + "/b");
-  // It comes back.
+  // The folder comes back.
   fs::rename(directory / "elsewhere", mail + "/b");
   ASSERT_TRUE(sync());
   EXPECT_THAT(complaints, ElementsAre());
   EXPECT_EQ(daemon.received(), 2U);
-  // Under another name nothing is left over.
+  // After a rename nothing of the old name is left.
   fs::rename(mail + "/b", mail + "/c");
   ASSERT_TRUE(sync());
   EXPECT_THAT(complaints, ElementsAre());
@@ -273,7 +273,7 @@ TEST_F(MailSyncTest, WhatCannotBeIndexedIsToldAndNotTakenForSent) {
   EXPECT_EQ(indexed(), (Lines{"a: one", "a: poison"}));
 }
 
-// Neither does it wait for the disk.
+// It does not wait for the disk either.
 TEST_F(MailSyncTest, WithoutChangesTheCatalogueIsNotWritten) {
   EXPECT_EQ(mailsync::lastSync(settings), std::nullopt);
   add("a/cur/1", "one");
@@ -330,7 +330,7 @@ TEST_F(MailSyncTest, ACatalogueThatIsLostOrDamagedSendsNothingAgain) {
   EXPECT_EQ(daemon.received(), 4U);
 }
 
-// After a purge. A daemon that was set back to before the deletion is asked for what it holds.
+// After a purge. A daemon restored to a state before the deletion is asked for its contents.
 TEST_F(MailSyncTest, NamesOfDeletedMessagesCanBeForgotten) {
   add("a/cur/departed", "one");
   add("a/cur/2", "two");
@@ -354,7 +354,7 @@ TEST_F(MailSyncTest, NamesOfDeletedMessagesCanBeForgotten) {
   EXPECT_EQ(daemon.received(), 2U);
 }
 
-// A time that is not past tells nothing: the clock may have been set back since.
+// A time in the future proves nothing, because the clock may have been set back.
 TEST_F(MailSyncTest, ATimeInTheFutureIsNotTrusted) {
   add("a/cur/1", "one");
   const timespec future{std::time(nullptr) + 3600, 0};
@@ -376,7 +376,7 @@ TEST_F(MailSyncTest, AFullDiskUnderTheCatalogueLosesNothing) {
     add(fmt::format("b/cur/{}", i), fmt::format("s{}", i));
     expected.insert(fmt::format("b: s{}", i));
   }
-  // Files of this process cannot grow: for the catalogue, as if the disk were full.
+  // Files of this process cannot grow, which has the effect of a full disk.
   std::signal(SIGXFSZ, SIG_IGN);
   rlimit before{};
   getrlimit(RLIMIT_FSIZE, &before);
@@ -392,19 +392,19 @@ TEST_F(MailSyncTest, AFullDiskUnderTheCatalogueLosesNothing) {
   EXPECT_EQ(indexed(), expected);
 }
 
-// Random histories of a mailbox, of the daemon and of the catalogue. After each sync that succeeds
-// the index holds what the mailbox holds.
+// Random histories of mailbox, daemon and catalogue. After each successful sync the index matches
+// the mailbox.
 TEST_F(MailSyncTest, AfterAnyHistoryTheIndexHoldsWhatIsThere) {
   const uint32_t begin = testsupport::firstSeed();
   for (uint32_t seed = begin; seed < begin + 12; ++seed) {
     std::mt19937 random(seed);
-    // Without a catalogue nothing tells that a file has other content under the same name.
+    // Without a catalogue, new content under the same file name cannot be noticed.
     const bool losesCatalogue = seed % 2 == 0;
     const auto below = [&](size_t count) { return static_cast<size_t>(random() % count); };
     std::vector<std::string> history;
     std::map<std::string, std::string> files;    // Maildir files: path and subject
-    std::vector<std::string> box{"b0"};          // of the mbox file
-    std::vector<StoringDaemon::Content> copies;  // of the daemon
+    std::vector<std::string> box{"b0"};          // messages in the mbox file
+    std::vector<StoringDaemon::Content> copies;  // saved states of the daemon
     int count = 0;
     fs::remove_all(mail);
     fs::remove_all(settings.catalogueDirectory);

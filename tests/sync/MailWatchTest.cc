@@ -19,7 +19,7 @@ using testing::HasSubstr;
 
 namespace {
 
-// Tells what the test says, and remembers what was to be watched.
+// Reports the changes given by the test, and records the watched directories.
 class ScriptedSource : public mailsync::ChangeSource {
  public:
   Result watch(const std::string& directory) override {
@@ -79,7 +79,7 @@ class MailWatchTest : public testing::Test {
     ASSERT_TRUE(watch);
     watch->turn(now);
   }
-  // Time passes, in which a round that is due is run.
+  // Advances the time and runs a round that is due.
   void pass(std::chrono::milliseconds time) {
     now = std::max(now, mailsync::RescanPlan::Clock::now()) + time;
     entered = 0;
@@ -101,7 +101,7 @@ class MailWatchTest : public testing::Test {
   std::unique_ptr<mailsync::MailWatch> watch;
   mailsync::MailWatch::Time now = mailsync::RescanPlan::Clock::now();
   std::vector<std::string> said;
-  uint64_t entered = 0;  // directories, by the last round
+  uint64_t entered = 0;  // directories listed by the last round
 };
 
 }  // namespace
@@ -115,7 +115,7 @@ TEST_F(MailWatchTest, LooksOnlyIntoWhatHasChanged) {
   tell(mail + "/a/new", "1");
   EXPECT_EQ(indexed(), 1U);
   EXPECT_EQ(entered, 1U);
-  // What programs keep beside mail wakes nobody; a folder of such a name does.
+  // Files that programs keep next to mail start no round; a folder with such a name does.
   makeFolder("dovecot");
   add("dovecot/new/3.lock");
   tell(mail, "dovecot-uidlist.lock");
@@ -127,7 +127,7 @@ TEST_F(MailWatchTest, LooksOnlyIntoWhatHasChanged) {
   fs::remove(mail + "/dovecot/new/3.lock");
   tell(mail + "/dovecot/new", "3.lock");
   EXPECT_EQ(indexed(), 1U);
-  // A folder that is new, from the inside out.
+  // A new folder, created from the inside out.
   makeFolder("b/c");
   add("b/c/cur/3:2,S");
   source->changes.push_back({Change::Kind::entry, mail + "/b/c", "cur", true});
@@ -194,7 +194,7 @@ TEST_F(MailWatchTest, ALargeBacklogWaitsForPowerAndNewMailDoesNot) {
   EXPECT_EQ(said.size(), 2U);
 }
 
-// What is lost while a round sends.
+// Power is lost while a round sends.
 TEST_F(MailWatchTest, ARoundStopsForPowerWhereMuchIsLeft) {
   settings.powerInterval = std::chrono::milliseconds(0);
   setPower(true);
@@ -216,7 +216,7 @@ TEST_F(MailWatchTest, ARoundStopsForPowerWhereMuchIsLeft) {
   pass(std::chrono::seconds(1));
   EXPECT_EQ(indexed(), many + 1);
   EXPECT_EQ(daemon.received(), many + 1);
-  // What a person waits for is sent to its end.
+  // New mail within the limit is sent completely.
   for (size_t i = 0; i < limit; ++i) add("b/cur/more" + std::to_string(i) + ":2,");
   daemon.whenReceived(many + 2, [this] { setPower(false); });
   tell(mail + "/b/cur", "more0:2,");

@@ -10,7 +10,7 @@ using Places = std::set<std::string>;
 
 namespace {
 
-// Begins after the first round over everything. Times are in milliseconds from there.
+// Starts after the first full round. Times are in milliseconds from there.
 class RescanPlanTest : public testing::Test {
  protected:
   RescanPlanTest() {
@@ -18,7 +18,7 @@ class RescanPlanTest : public testing::Test {
     plan.finished(true, start);
   }
   [[nodiscard]] RescanPlan::Time at(int64_t time) const { return start + milliseconds(time); }
-  // The places of the round that is due, "*" for everything; none where there is no round.
+  // The places of the round that is due, "*" for everything; nullopt if no round is due.
   std::optional<Places> take(int64_t time, bool succeeds = true) {
     const auto round = plan.take(at(time));
     if (!round) return std::nullopt;
@@ -52,7 +52,7 @@ TEST_F(RescanPlanTest, ChangesAreTakenTogetherButNotForLong) {
   plan.changed("/b", at(40));
   EXPECT_EQ(plan.next(), at(90));
   EXPECT_EQ(take(90), (Places{"/a", "/b"}));
-  // Changes without an end.
+  // Changes that never stop.
   int64_t time = 1000;
   for (; time < 1300; time += 20) {
     plan.changed("/c", at(time));
@@ -75,11 +75,11 @@ TEST_F(RescanPlanTest, ARoundThatFailsIsRepeatedLessAndLessOften) {
   }
   ASSERT_TRUE(take(time, false));
   EXPECT_EQ(plan.next(), at(time) + RescanPlan::kLastRetry);
-  // The daemon is there again.
+  // The daemon is running again.
   plan.retry(at(time + 10));
   EXPECT_EQ(take(time + 60), (Places{"/a", "/b"}));
   EXPECT_EQ(plan.next(), start + hours(24));
-  // A round over everything stays one.
+  // A full round stays a full round.
   plan.lost(at(time + 100));
   ASSERT_EQ(take(time + 150, false), Places{"*"});
   EXPECT_EQ(take(time + 500), Places{"*"});

@@ -91,7 +91,7 @@ void StoringDaemon::change(const std::vector<std::string>& identifiers,
   reply.send({});
 }
 
-// Of what an inventory asks for: items whose folder's path begins with a text.
+// Supports only the search of an inventory: items whose folder path begins with a text.
 void StoringDaemon::search(const std::string& bytes, rpc::Reply& reply) {
   TLQuery query;
   EXPECT_TRUE(query.initWithData(bytes));

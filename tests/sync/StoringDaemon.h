@@ -16,16 +16,17 @@
 
 namespace testsupport {
 
-// The search service of the daemon in this process, as far as a sync needs it: it holds items by
-// identifier and a client state, in memory. An unknown identifier ends a list of deletions with an
-// error, as in the daemon.
+// A search service in this process, as far as a sync needs it. Keeps items by identifier and a
+// client state in memory. An unknown identifier ends a list of deletions with an error, as in the
+// daemon.
 class StoringDaemon {
  public:
   struct Content {
     std::map<std::string, std::shared_ptr<TLIndexableItem>> items;
     std::optional<std::string> state;
   };
-  // What happens to a call that indexes or deletes: it is carried out this far, and fails.
+  // Fault injection for a call that indexes or deletes: it is executed up to this point, then
+  // fails.
   enum class Fault { none, before, afterDeletions, afterItems, afterState };
 
   StoringDaemon();
@@ -36,14 +37,14 @@ class StoringDaemon {
   [[nodiscard]] const std::string& runtimeDirectory() const { return _directory.path(); }
   [[nodiscard]] Content content() const;
   void setContent(Content content);
-  // Of the call after the next `calls`.
+  // Injects the fault into the call after the next `calls`.
   void failAfter(size_t calls, Fault fault);
-  // Items whose subject holds the text stop their batch.
+  // Items whose subject contains the text make their batch fail.
   void refuse(const std::string& subject);
-  // How many items have come, since the start.
+  // The number of items received since the start.
   [[nodiscard]] size_t received() const;
-  // `action` runs once, on the daemon's thread, before the reply to the call that brings so many
-  // items.
+  // Runs `action` once, on the daemon's thread, before the reply to the call in which the number of
+  // received items reaches `items`.
   void whenReceived(size_t items, std::function<void()> action);
 
  private:

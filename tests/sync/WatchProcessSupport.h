@@ -29,7 +29,7 @@
 
 namespace testsupport {
 
-// `tallow watch` as a process of its own, beside the daemon, over a mailbox of the test's own.
+// `tallow watch` as its own process, with a daemon and a mailbox of the test.
 class WatchProcessTest : public testing::Test {
  protected:
   static constexpr size_t kMaxLog = size_t{16} << 20;
@@ -44,7 +44,7 @@ class WatchProcessTest : public testing::Test {
     if (pid > 0) end(SIGKILL);
   }
 
-  // Whether the programs are there. Without them the test is skipped, but fails where CI=true;
+  // Whether the programs are installed. Without them the test is skipped, but fails with CI=true;
   // scripts/ci-packages.list has them.
   static bool hasPrograms(const std::vector<std::string>& paths) {
     for (const std::string& path : paths) {
@@ -77,7 +77,7 @@ class WatchProcessTest : public testing::Test {
     }
     close(log);
   }
-  // The exit status, or 128 and the number of the signal that ended it.
+  // The exit status, or 128 plus the number of the signal that ended it.
   int end(int signal) {
     kill(pid, signal);
     int status = 0;
@@ -91,7 +91,7 @@ class WatchProcessTest : public testing::Test {
       std::filesystem::create_directories(mail + '/' + folder + '/' + sub);
     }
   }
-  // As a delivery agent does.
+  // Delivers as a delivery agent does.
   void deliver(const std::string& folder, const std::string& name) const {
     const std::string base = mail + '/' + folder;
     std::ofstream(base + "/tmp/" + name)
@@ -114,8 +114,8 @@ class WatchProcessTest : public testing::Test {
     }
     return found;
   }
-  // Waits, from one line of the watch's log to the next, until `holds`. A watch that does not get
-  // there is ended by the time limit of the test.
+  // Waits until `holds`, checking after each line of the watch's log. The time limit of the test
+  // ends a wait that never succeeds.
   template <typename Condition>
   void waitUntil(const Condition& holds) const {
     while (!holds()) {

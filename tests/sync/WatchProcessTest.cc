@@ -6,11 +6,11 @@ using testsupport::WatchProcessTest;
 TEST_F(WatchProcessTest, FollowsMailAndFolders) {
   deliver("a", "1");
   waitUntilInStep();
-  // Read, flagged, and to another folder.
+  // Marked read, flagged, and moved to another folder.
   fs::rename(mail + "/a/new/1", mail + "/b/cur/1:2,FS");
   deliver("a", "2");
   waitUntilInStep();
-  // A folder with a name of any bytes, made with its mail and renamed.
+  // A folder with arbitrary bytes in its name, created with its mail and renamed.
   makeFolder("c");
   deliver("c", "\xfc\xff");
   fs::rename(mail + "/c", mail + "/\xe9t\xe9");
@@ -20,7 +20,7 @@ TEST_F(WatchProcessTest, FollowsMailAndFolders) {
   fs::remove(mail + "/b/cur/1:2,FS");
   waitUntilInStep();
   EXPECT_EQ(indexed().size(), 3U);
-  // One that vanishes and comes back.
+  // A folder that disappears and comes back.
   fs::rename(mail + "/a", directory / "elsewhere");
   waitUntilSaid("is not there");
   EXPECT_EQ(indexed().size(), 3U);
