@@ -11,10 +11,10 @@
 
 namespace cli {
 
-// How many MIME parts of a message are looked at.
+// Maximum number of MIME parts of a message that are read.
 inline constexpr size_t kMaxParts = 10000;
 
-// How much of a body is decoded. More never fits into the index.
+// Maximum number of bytes of a body that are decoded; the index never holds more.
 inline constexpr size_t kMaxBodyBytes = size_t{1} << 20;
 
 struct ParsedMessage {
@@ -22,13 +22,13 @@ struct ParsedMessage {
   bool cut = false;  // some text was too long for the index
 };
 
-// Why a message cannot be made an item.
+// The reason why a message cannot become an item.
 struct UnparsableMessage {
   std::string reason;
 };
 
-// Turns mail into items of the index. The parser bounds the nesting of MIME parts (1024), and all
-// walks over them are loops. One thread.
+// Converts mail to items for the index. Limits the nesting of MIME parts (1024) and iterates over
+// them without recursion. One thread.
 class MessageParser {
  public:
   MessageParser();

@@ -36,7 +36,7 @@ constexpr CommandRow kCommands[] = {
     {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
      "PATH", false},
     {Command::watch, "watch", "Keep the index in step with mailboxes all the time", "PATH", false},
-    {Command::status, "status", "Show mailboxes and index: what is indexed, waits or has failed",
+    {Command::status, "status", "Show mailboxes and index: indexed, waiting and failed messages",
      nullptr, false},
     {Command::search, "search", "Search; the last word matches as a prefix unless a space follows",
      "WORDS", false},
@@ -47,18 +47,18 @@ constexpr CommandRow kCommands[] = {
     {Command::reset, "reset", "Delete everything that is indexed", nullptr, false},
     {Command::stats, "stats", "Show the statistics of store and index", nullptr, false},
     {Command::metrics, "metrics", "Show the metrics of the text index", nullptr, false},
-    {Command::ping, "ping", "Ask the daemon whether it is there", "TEXT", false},
-    {Command::vacuum, "vacuum", "Sort what is new into the index and compact it", nullptr, false},
+    {Command::ping, "ping", "Check whether the daemon is running", "TEXT", false},
+    {Command::vacuum, "vacuum", "Merge new mail into the index and compact it", nullptr, false},
     {Command::state, "state", "Show the state that a client has stored", nullptr, false},
     {Command::dump, "dump", "Print the text index, while no daemon runs", nullptr, false},
     {Command::validate, "validate", "Check the text index, while no daemon runs", nullptr, false},
-    {Command::purge, "purge", "Remove what was deleted from the disk, while no daemon runs",
-     nullptr, false},
-    {Command::show, "show", "Show a message for reading", "RANK|ID|PATH", true},
+    {Command::purge, "purge", "Remove deleted mail from the disk, while no daemon runs", nullptr,
+     false},
+    {Command::show, "show", "Show a message", "RANK|ID|PATH", true},
     {Command::address, "address", "Complete names and addresses from the indexed mail", "WORD",
      true},
-    {Command::save, "save", "Save a search under a name, for search @NAME, or list what is saved",
-     "NAME WORDS", false},
+    {Command::save, "save", "Save a search as @NAME, or list the saved searches", "NAME WORDS",
+     false},
 };
 
 const std::map<std::string, OutputFormat> kFormats{{"text", OutputFormat::text},
@@ -123,17 +123,17 @@ void addGlobalOptions(CLI::App& app, Options& options) {
                  "Output: text, json, or for search also files or message-ids")
       ->transform(oneOf(kFormats))
       ->type_name("FORMAT");
-  app.add_option("--limit", options.limit, "Most results of a search, 0 for all (default: 20)")
+  app.add_option("--limit", options.limit, "Maximum number of results, 0 for all (default: 20)")
       ->check(wholeNumber(0))
       ->type_name("N");
   app.add_option("--color", options.color, "Colours: auto, always or never")
       ->transform(oneOf(kColors))
       ->type_name("WHEN");
-  app.add_option("--wait", options.waitSeconds, "Wait so long for the daemon to come up")
+  app.add_option("--wait", options.waitSeconds, "How long to wait for the daemon to start")
       ->check(seconds(3600))
       ->type_name("SECONDS");
   app.add_flag("-y,--yes", options.yes, "Do not ask before a reset");
-  app.add_flag("-v,--verbose", options.verbose, "Name what was cut or ignored");
+  app.add_flag("-v,--verbose", options.verbose, "List cut messages and ignored files");
 }
 
 bool isSearch(Command command) {
@@ -144,7 +144,8 @@ void addQueryOptions(CLI::App& sub, Options& options) {
   sub.add_option("--query", options.query,
                  "Search by an expression instead of words; see tallow-query(7)")
       ->type_name("EXPR");
-  sub.add_option("--filter", options.filters, "Only what the expression holds for; may be repeated")
+  sub.add_option("--filter", options.filters,
+                 "Only messages that match the expression; may be repeated")
       ->allow_extra_args(false)
       ->type_name("EXPR");
   sub.add_option("--param", options.parameters, "Parameters of this search")
@@ -155,29 +156,29 @@ void addResultOptions(CLI::App& sub, Options& options) {
   sub.add_option("--sort", options.sort, "Order: relevance, or date for the newest first")
       ->transform(oneOf(kSortOrders))
       ->type_name("ORDER");
-  sub.add_option("--offset", options.offset, "Results to pass over")
+  sub.add_option("--offset", options.offset, "Number of results to skip")
       ->check(wholeNumber(0))
       ->type_name("N");
   sub.add_flag("--count", options.count, "Show only how many results there are");
   sub.add_flag("--threads", options.threads, "A line for each conversation, with its results");
-  sub.add_flag("--print0", options.print0, "Of files and message-ids: NUL in place of line feeds");
+  sub.add_flag("--print0", options.print0, "With files and message-ids: end each entry with NUL");
 }
 
 void addShowOptions(CLI::App& sub, Options& options) {
-  sub.add_flag("--raw", options.raw, "The message as it is on the disk");
+  sub.add_flag("--raw", options.raw, "The original message");
   sub.add_option("--attachment", options.attachment, "Save the attachment with this number")
       ->check(wholeNumber(1))
       ->type_name("N");
-  sub.add_option("-o,--output", options.output, "Where to, or - for the standard output")
+  sub.add_option("-o,--output", options.output, "File to write, or - for the standard output")
       ->type_name("FILE");
   sub.add_flag("--force", options.force, "Replace the file if there is one");
 }
 
 void addSyncOptions(CLI::App& sub, Options& options) {
-  sub.add_flag("-n,--dry-run", options.dryRun, "Only tell what would be done");
+  sub.add_flag("-n,--dry-run", options.dryRun, "Only show what would be done");
   sub.add_flag("--prune-missing", options.pruneMissing,
-               "Delete the mail of directories that are not there any more");
-  sub.add_flag("--retry", options.retryFailed, "Try once more what could not be indexed");
+               "Delete the mail of directories that no longer exist");
+  sub.add_flag("--retry", options.retryFailed, "Retry messages that could not be indexed");
 }
 
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
@@ -193,17 +194,17 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (row.command == Command::search) addResultOptions(*sub, options);
   if (row.command == Command::sync) addSyncOptions(*sub, options);
   if (row.command == Command::purge) {
-    sub->add_flag("-n,--dry-run", options.dryRun, "Only tell how much it would give back");
+    sub->add_flag("-n,--dry-run", options.dryRun, "Only show how much space it would free");
   }
   if (row.command == Command::watch) {
-    sub->add_flag("--on-battery", options.onBattery, "Do not wait for power with much mail");
+    sub->add_flag("--on-battery", options.onBattery, "Send large backlogs on battery, too");
   }
   if (row.command == Command::show) addShowOptions(*sub, options);
   if (row.command == Command::address) {
     sub->add_flag("--mutt", options.mutt, "Begin with the line that mutt's query_command skips");
   }
   if (row.command == Command::save) {
-    sub->add_flag("--delete", options.removeSaved, "Forget the search with this name");
+    sub->add_flag("--delete", options.removeSaved, "Delete the saved search with this name");
   }
   sub->footer(examplesOf(row.command));
   sub->callback([&options, command = row.command] { options.command = command; });

@@ -249,8 +249,9 @@ nlohmann::json classJSON(const ClassStatus& status) {
           {"watched", status.watched}};
 }
 
-// The class of the command line; otherwise all classes with an index or mailboxes, as far as the
-// state directory and the settings show, or the default class if there are none.
+// The class of the command line; otherwise the default class and those known from the state
+// directory and the settings, as far as they have an index or a catalogue; the default class if
+// none has.
 std::vector<std::string> classesOf(const Options& options) {
   if (options.classGiven) return {options.protectionClass};
   const std::vector<std::string> onDisk = classesOnDisk(options);
