@@ -129,7 +129,7 @@ TEST_F(CommandsTest, WordsBecomeFreeTextAgain) {
 }
 
 // Each alternative is a separate search; its exclusions are searched for only if it has results.
-TEST_F(CommandsTest, WhatIsNotOnlyWordsBecomesSearches) {
+TEST_F(CommandsTest, OperatorsBecomeSeveralSearches) {
   const size_t before = daemon.calls().size();
   EXPECT_EQ(run({"search", "tea", "-milk", "OR", "from:tom"}), ExitStatus::nothingFound);
   EXPECT_EQ(daemon.calls().size(), before + 2);
@@ -173,7 +173,7 @@ TEST_F(CommandsTest, ExpressionsFiltersAndParameters) {
   EXPECT_THAT(errors, HasSubstr("tallow: there is no attribute none\n"));
 }
 
-TEST_F(CommandsTest, WhatCannotBeReadIsNotSent) {
+TEST_F(CommandsTest, InvalidExpressionsAreNotSent) {
   std::string deep;
   for (int i = 0; i < 200; ++i) deep += "kTLItemSubject = a || kTLItemAuthors = b && ";
   const std::vector<std::pair<std::vector<std::string>, std::string>> cases{
@@ -319,7 +319,7 @@ TEST_F(CommandsTest, CopiesOfAMessageAreOneResult) {
 }
 
 // An option value that equals a command name is not taken for the command.
-TEST_F(CommandsTest, OptionsStandBeforeAndAfterTheCommand) {
+TEST_F(CommandsTest, OptionsMayPrecedeOrFollowTheCommand) {
   const std::vector<std::vector<std::string>> same{
       {"search", "--class=index", "--limit", "3", "--offset=1", "tea", "-milk"},
       {"--class", "index", "--offset", "1", "--limit", "3", "search", "tea", "-milk"},
@@ -363,7 +363,7 @@ TEST_F(CommandsTest, IndexStopsAtAnErrorThatConcernsAll) {
   EXPECT_EQ(nlohmann::json::parse(output)["indexed"], 0);
 }
 
-TEST_F(CommandsTest, DeleteGoesOnBehindAFailure) {
+TEST_F(CommandsTest, DeleteContinuesAfterAFailure) {
   daemon.failOnce("DeleteItemsWithIdentifiers", {"DocStore", 5, "unknown"});
   EXPECT_EQ(run({"delete", "file/a", "file/b"}), ExitStatus::failure);
   EXPECT_EQ(output, "deleted file/b\n");
@@ -450,7 +450,7 @@ TEST_F(CommandsTest, State) {
   EXPECT_EQ(nlohmann::json::parse(output)["hex"], "00ff");
 }
 
-TEST_F(CommandsTest, WrongUseAndAnAbsentDaemonHaveTheirStatus) {
+TEST_F(CommandsTest, ExitStatusOfIncorrectUsageAndOfAnAbsentDaemon) {
   const std::vector<std::vector<std::string>> kWrong{{},
                                                      {"search"},
                                                      {"index"},

@@ -82,7 +82,7 @@ TEST_F(EverydayTest, ShowsWhatTheLastSearchFound) {
   EXPECT_EQ(run("show other:1"), 2);
 }
 
-TEST_F(EverydayTest, SavesAttachmentsWhereItIsTold) {
+TEST_F(EverydayTest, SavesAttachments) {
   platform::writeFileAtomically(directory / "a.eml",
                                 "Subject: s\nMIME-Version: 1.0\nContent-Type: image/png; "
                                 "name=\"../../evil.png\"\n\n\x1b[31m",
@@ -203,7 +203,7 @@ TEST_F(EverydayTest, CompletesAddresses) {
   EXPECT_EQ(run("address @"), 2);
 }
 
-TEST_F(EverydayTest, AClassWithoutMailIsNotMade) {
+TEST_F(EverydayTest, DoesNotCreateAClassWithoutMail) {
   const std::string state = " --state-dir " + directory / "state --class work";
   for (const char* const command : {"search x", "explain x", "address x", "delete x"}) {
     EXPECT_EQ(run(command + state), 1) << command;

@@ -45,7 +45,7 @@ TEST(Identifier, MakesAStrictURLOfAnyPathAndReadsBack) {
   }
 }
 
-TEST(Identifier, OfAnotherFormIsNone) {
+TEST(Identifier, RejectsOtherForms) {
   for (const char* identifier :
        {"", "file", "x-apple/1", "mbox/a", "mbox/a?offset=", "mbox/a?offset=1x", "file/a%2",
         "file/a%zz", "mbox/a?offset=99999999999999999999999"}) {

@@ -44,7 +44,7 @@ TEST(IndexPipeline, BatchesAreBoundedAndKeepTheOrder) {
   }
 }
 
-TEST(IndexPipeline, TellsMessagesFromPathsThatFail) {
+TEST(IndexPipeline, SeparatesFailedMessagesFromFailedPaths) {
   const testsupport::TemporaryDirectory directory;
   ASSERT_TRUE(platform::writeFileAtomically(directory / "bad.eml", "\n\nno header", nullptr));
   ASSERT_TRUE(platform::writeFileAtomically(directory / "notes", "hello", nullptr));
@@ -59,7 +59,7 @@ TEST(IndexPipeline, TellsMessagesFromPathsThatFail) {
   EXPECT_EQ(batch->ignored.size(), 1u);
 }
 
-TEST(IndexPipeline, CanBeLeftInTheMiddle) {
+TEST(IndexPipeline, CanBeDestroyedEarly) {
   const testsupport::TemporaryDirectory directory;
   ASSERT_TRUE(platform::writeFileAtomically(directory / "box", mboxOf(5000, 10), nullptr));
   cli::IndexPipeline pipeline({directory / "box"});

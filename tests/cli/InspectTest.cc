@@ -87,7 +87,7 @@ const salt::SuffixMeta kSecond{1, 3, 1, 1, {'b', ' '}};
 
 }  // namespace
 
-TEST_F(InspectTest, DumpsWhatTheIndexDumpsAndChangesNothing) {
+TEST_F(InspectTest, DumpMatchesTheIndexAndChangesNothing) {
   makeIndex({kFirst, kSecond});
   std::string dump;
   {
@@ -108,7 +108,7 @@ TEST_F(InspectTest, DumpsWhatTheIndexDumpsAndChangesNothing) {
   EXPECT_EQ(files(), before);
 }
 
-TEST_F(InspectTest, ValidateTellsOfTheLatestIndexThatWasSetAside) {
+TEST_F(InspectTest, ValidateReportsTheLatestIndexSetAside) {
   makeIndex({kFirst, kSecond});
   EXPECT_EQ(run("validate"), 0);
   EXPECT_EQ(errors, "");
@@ -133,14 +133,14 @@ TEST_F(InspectTest, TwoCrashesOfOneHourAreOneTooMany) {
   }
 }
 
-TEST_F(InspectTest, AReaderThatGoesAwayEndsTheDump) {
+TEST_F(InspectTest, ClosedPipeEndsTheDump) {
   makeLargeIndex();
   EXPECT_EQ(shell("{ " + client + "dump; echo $? >&2; } | head -n 1"), 0);
   EXPECT_EQ(output, "SALT INDEX METRICS\n");
   EXPECT_EQ(errors, "2\n");
 }
 
-TEST_F(InspectTest, ValidateTellsEachFault) {
+TEST_F(InspectTest, ValidateReportsEachFault) {
   const auto page = [this] { makeIndex({kFirst, kSecond}); };
   const std::string pageKey(
       "\x01"
@@ -207,7 +207,7 @@ TEST_F(InspectTest, CountsWhatItFinds) {
                 "shards": 1})"));
 }
 
-TEST_F(InspectTest, ALiveIndexIsRefused) {
+TEST_F(InspectTest, RefusesAnIndexInUse) {
   makeIndex({kFirst});
   {
     testsupport::DaemonProcess daemon(directory.path());
@@ -226,7 +226,7 @@ TEST_F(InspectTest, ALiveIndexIsRefused) {
 }
 
 // A daemon may start while the index is inspected; its changes are not visible.
-TEST_F(InspectTest, ADaemonThatStartsMeanwhileIsNotHeldUpNorSeen) {
+TEST_F(InspectTest, DaemonCanStartDuringADump) {
   makeLargeIndex();
   const std::string dump = salttest::loadIndex(index)->Dump();
   FILE* const pipe = popen((TALLOW_INSPECT_PROGRAM " dump " + state + " default").c_str(), "r");
@@ -263,7 +263,7 @@ TEST_F(InspectTest, FindsTheStateOfTheDaemonByItself) {
   }
 }
 
-TEST_F(InspectTest, NothingIsMadeWhereNothingIs) {
+TEST_F(InspectTest, CreatesNothingWithoutAnIndex) {
   makeIndex({kFirst});
   const auto before = files();
   for (const char* command : {"validate", "dump"}) {

@@ -88,7 +88,7 @@ const std::string kTwo = kFrom + "Subject: a\n\none\n\n" + kFrom + "Subject: b\n
 
 }  // namespace
 
-TEST_F(MailFileTest, AnMboxComesApartAtItsFromLines) {
+TEST_F(MailFileTest, SplitsAnMboxAtItsFromLines) {
   const std::string crlf = "From m@example.org Mon Jan  8 08:49:00 2024\r\n";
   const struct {
     std::string bytes;
@@ -143,7 +143,7 @@ TEST_F(MailFileTest, LinesLongerThanTheBufferStayWhole) {
   }
 }
 
-TEST_F(MailFileTest, AMessageBeyondTheBoundIsReportedAndTheNextIsRead) {
+TEST_F(MailFileTest, ReportsATooLongMessageAndReadsTheNext) {
   std::string big = kFrom + "A: a\n\n";
   big.append(cli::kMaxMessageBytes, 'x');
   readBytes(big + "\n\n" + kFrom + "B: b\n\ntwo\n");
@@ -180,7 +180,7 @@ TEST_F(MailFileTest, TruncatedCompressionIsReported) {
   }
 }
 
-TEST_F(MailFileTest, WhatAFileIs) {
+TEST_F(MailFileTest, DetectsTheKindOfAFile) {
   const std::string message = "Subject: a\nfrom: b\n\ntext\n";
   const struct {
     const char* name;
@@ -228,7 +228,7 @@ TEST_F(MailFileTest, ASinkCanStop) {
   EXPECT_FALSE(finished);
 }
 
-TEST_F(MailFileTest, TheWalkVisitsEachFileOnceAndFollowsNoLoop) {
+TEST_F(MailFileTest, VisitsEachFileOnceDespiteLoops) {
   platform::createDirectories(directory / "b/cur", nullptr);
   platform::createDirectories(directory / "b/tmp", nullptr);
   platform::createDirectories(directory / "tmp", nullptr);
@@ -261,7 +261,7 @@ TEST_F(MailFileTest, TheWalkVisitsEachFileOnceAndFollowsNoLoop) {
   EXPECT_THAT(visited, ElementsAre("cannot open: No such file or directory"));
 }
 
-TEST_F(MailFileTest, TheWalkEndsAtItsDepth) {
+TEST_F(MailFileTest, StopsAtTheMaximumDepth) {
   std::string deep = directory.path();
   for (size_t i = 0; i < cli::kMaxDirectoryDepth + 3; ++i) deep += "/d";
   platform::createDirectories(deep, nullptr);

@@ -31,7 +31,7 @@ class MailReaderTest : public testing::Test {
 };
 
 // The catalogue may be older than the mailbox: another message may be at the old offset.
-TEST_F(MailReaderTest, AMessageNamedByItsContentIsThatMessageOrNone) {
+TEST_F(MailReaderTest, FindsAMessageByContentOrNotAtAll) {
   const std::string unquoted = "Subject: two\n\nsecond\nFrom here on\n";
   const std::string name =
       cli::mboxIdentifier(_path, std::string_view(mailsync::messageDigest(unquoted)));
@@ -55,7 +55,7 @@ TEST_F(MailReaderTest, AMessageNamedByItsContentIsThatMessageOrNone) {
 }
 
 // Directories are listed once, and again only after `refresh`, if they have changed.
-TEST_F(MailReaderTest, AMaildirThatHasChangedIsListedAgain) {
+TEST_F(MailReaderTest, ListsAChangedMaildirAgain) {
   namespace fs = std::filesystem;
   const std::string maildir = _directory / "Mail";
   fs::create_directories(maildir + "/cur");

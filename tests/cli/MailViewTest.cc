@@ -26,7 +26,7 @@ const std::string kHead = "From: a@b\nMIME-Version: 1.0\n";
 
 }  // namespace
 
-TEST(MailView, FieldsAreDecodedAndCannotPassForOthers) {
+TEST(MailView, DecodesFieldsThatCannotImitateOthers) {
   const auto view = MailView::parse(
       "Subject: =?utf-8?q?caf=C3=A9?=\n"
       "From: =?utf-8?q?boss=40corp=2Eorg?= <evil@example.org>\n"
@@ -39,7 +39,7 @@ TEST(MailView, FieldsAreDecodedAndCannotPassForOthers) {
   EXPECT_EQ(fields[1].second.size(), MailView::kMaxFieldUnits + std::string("…").size());
 }
 
-TEST(MailView, OfAlternativesTheOneThatCanBeRead) {
+TEST(MailView, PrefersTheReadableAlternative) {
   const std::string plain = "text/plain\n\nplain\n";
   const std::string blank = "text/plain\n\n \n";
   const std::string html =
@@ -61,7 +61,7 @@ TEST(MailView, OfAlternativesTheOneThatCanBeRead) {
   for (const auto& [body, text] : cases) EXPECT_EQ(textOf(kHead + body), text) << body;
 }
 
-TEST(MailView, AttachmentsAreAllThatIsNotRead) {
+TEST(MailView, AttachmentsAreAllPartsThatAreNotText) {
   const auto view = MailView::parse(
       kHead + multipart("mixed", {"text/plain\n\nread\n", "text/calendar\n\nBEGIN\n",
                                   "text/plain; name=notes.txt\n\nnotes\n",
@@ -82,7 +82,7 @@ TEST(MailView, AttachmentsAreAllThatIsNotRead) {
 }
 
 // Many parts or deep nesting must not exhaust the stack or take long.
-TEST(MailView, HostileMailHasBounds) {
+TEST(MailView, LimitsHostileMail) {
   std::string deep = kHead;
   std::string messages = kHead;
   for (int i = 0; i < 5000; ++i) {

@@ -63,7 +63,7 @@ std::vector<std::string> attributesOf(const std::string& message) {
 
 }  // namespace
 
-TEST(MessageParser, EveryFieldHasItsPlace) {
+TEST(MessageParser, StoresEveryField) {
   const auto item = parse(
       "Received: by b; Tue, 9 Jan 2024 10:00:00 +0000\n"
       "Received: by a; Mon, 8 Jan 2024 10:00:00 +0000\n"
@@ -167,19 +167,19 @@ TEST(MessageParser, Dates) {
   for (const auto& c : kCases) EXPECT_EQ(attributesOf(c.headers + "\n"), c.attributes) << c.headers;
 }
 
-TEST(MessageParser, SenderStandsInForXFrom) {
+TEST(MessageParser, UsesSenderWithoutXFrom) {
   EXPECT_EQ(attributesOf("Sender: list@example.org\n\n"),
             std::vector<std::string>{"X_FROM=list@example.org"});
 }
 
-TEST(MessageParser, AnAddressThatCannotBeReadBecomesAName) {
+TEST(MessageParser, InvalidAddressBecomesAName) {
   EXPECT_EQ(attributesOf("From: @ar@ @ending from example@org (Mara)\n"
                          "To: undisclosed-recipients:;\nCc: a@example.org\nBcc:\n\n"),
             (std::vector<std::string>{"AUTHORS={@ar@ @ending from example@org (Mara)|}",
                                       "ADDITIONAL_RECIPIENTS={|a@example.org}"}));
 }
 
-TEST(MessageParser, WhatIsNoMessageIsNamed) {
+TEST(MessageParser, ExplainsWhyBytesAreNotAMessage) {
   const struct {
     std::string bytes;
     const char* reason;
@@ -197,7 +197,7 @@ TEST(MessageParser, WhatIsNoMessageIsNamed) {
   }
 }
 
-TEST(MessageParser, TooLongTextsAreCut) {
+TEST(MessageParser, CutsLongTexts) {
   bool cut = false;
   const std::string words = [] {
     std::string text;
@@ -230,7 +230,7 @@ TEST(MessageParser, TooLongTextsAreCut) {
 }
 
 // None of these may crash, hang or exhaust the stack.
-TEST(MessageParser, MonstersAreSurvived) {
+TEST(MessageParser, SurvivesExtremeMail) {
   std::string nested = "A: a\n";
   for (int i = 0; i < 100000; ++i) {
     nested += fmt::format("Content-Type: multipart/mixed; boundary=\"b{}\"\n\n--b{}\n", i, i);
@@ -254,7 +254,7 @@ TEST(MessageParser, MonstersAreSurvived) {
   EXPECT_NE(parse(headers + "\n"), nullptr);
 }
 
-TEST(MessageParser, RandomDamageIsSurvived) {
+TEST(MessageParser, SurvivesRandomDamage) {
   const std::string message =
       "Received: by a; Mon, 8 Jan 2024 10:00:00 +0000\nFrom: M <m@example.org>\n"
       "To: a: b@example.org;\nSubject: =?iso-2022-jp?b?GyRCNX5FVBsoQg==?=\n"

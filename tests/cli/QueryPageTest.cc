@@ -50,7 +50,7 @@ INSTANTIATE_TEST_SUITE_P(Query, Pages,
                          testing::Values(std::pair(TALLOW_QUERY_PAGE, 10u),
                                          std::pair(TALLOW_SEARCH_PAGE, 21u)));
 
-TEST_P(Pages, TheirExamplesFindWhatTheyAreFor) {
+TEST_P(Pages, ExamplesFindTheStatedNumberOfMails) {
   const testsupport::TemporaryDirectory directory;
   const testsupport::DaemonProcess daemon(directory.path());
   ASSERT_TRUE(daemon.ready());

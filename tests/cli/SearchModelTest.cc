@@ -283,7 +283,7 @@ class SearchModel : public testing::Test {
 
 }  // namespace
 
-TEST_F(SearchModel, RandomSearchesFindWhatALookAtEachMailFinds) {
+TEST_F(SearchModel, RandomSearchesMatchAScanOfAllMails) {
   ASSERT_EQ(mails.size(), 41u);
   size_t some = 0;
   size_t refused = 0;
@@ -305,7 +305,7 @@ TEST_F(SearchModel, RandomSearchesFindWhatALookAtEachMailFinds) {
 }
 
 // Conditions of the query language on times, numbers and flags apply as well.
-TEST_F(SearchModel, FiltersMeanWhatTheySay) {
+TEST_F(SearchModel, FiltersMatchAScanOfAllMails) {
   const std::string date = "com_quill_mail_dateReceived";
   const struct {
     std::vector<std::string> filters;

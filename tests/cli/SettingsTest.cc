@@ -48,7 +48,7 @@ on_battery = true
   EXPECT_EQ(settingsOf("").largestMail, 0U);
 }
 
-TEST(Settings, WhatIsWrongIsNamedWithFileLineKeyAndWhatIsAllowed) {
+TEST(Settings, ErrorsNameFileLineKeyAndAllowedValues) {
   EXPECT_EQ(complaintOf("\nrots = []"),
             "config.toml:2: there is no key \"rots\"; did you mean \"roots\"?");
   EXPECT_EQ(complaintOf("colour = 1"),

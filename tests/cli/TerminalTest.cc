@@ -29,7 +29,7 @@ TEST(Terminal, TextIsCleaned) {
 }
 
 // Any input gives valid UTF-8 without control characters.
-TEST(Terminal, RandomBytesComeOutHarmless) {
+TEST(Terminal, CleansRandomBytes) {
   std::mt19937 random(11);
   for (int round = 0; round < 3000; ++round) {
     std::string bytes;
@@ -55,7 +55,7 @@ TEST(Terminal, RandomBytesComeOutHarmless) {
   }
 }
 
-TEST(Terminal, HighlightFindsWordsWithoutCaseAndAccents) {
+TEST(Terminal, HighlightIgnoresCaseAndAccents) {
   const struct {
     const char* text;
     const char* query;

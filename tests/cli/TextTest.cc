@@ -26,7 +26,7 @@ TEST(TextBudget, ACharacterCostsAtLeastWhatItsFoldedFormTakes) {
   EXPECT_EQ(cli::zoneCostOf(U'京'), 4u);
 }
 
-TEST(TextBudget, TakesWholeCharactersWhileThereIsRoom) {
+TEST(TextBudget, TakesWholeCharactersUpToTheLimit) {
   const struct {
     TLStringView text;
     size_t budget;
@@ -95,7 +95,7 @@ TEST(TextDecoder, ReadsCharsetsAndNeverFails) {
   }
 }
 
-TEST(FlowedText, SoftBreaksGoAndHardOnesStay) {
+TEST(FlowedText, RemovesSoftBreaksOnly) {
   using cli::unflow;
   EXPECT_EQ(unflow(u"one \ntwo\nthree\n", false), u"one two\nthree\n");
   EXPECT_EQ(unflow(u"京 \n都\n", true), u"京都\n");

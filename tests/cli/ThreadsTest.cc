@@ -32,7 +32,7 @@ class ThreadsTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(ThreadsTest, MailsThatReferToTheSameAreOneThread) {
+TEST_F(ThreadsTest, GroupsMailsThatReferToTheSameMessage) {
   add("Message-ID: <reply@x>\nIn-Reply-To: Your message of Monday <first@x>", 1);
   add("Message-ID: <other@x>\nReferences: <>", 2);
   add("Message-ID: <a@y>\nReferences: <gone@y> <b@y>", 3);
@@ -53,7 +53,7 @@ TEST_F(ThreadsTest, MailsThatReferToTheSameAreOneThread) {
   EXPECT_EQ(threadsOf(hits, facts)[5], (Thread{8, 9, 11}));
 }
 
-TEST_F(ThreadsTest, ALineAThread) {
+TEST_F(ThreadsTest, PrintsOneLinePerThread) {
   setenv("TZ", "UTC", 1);
   add("Message-ID: <a@x>", 1704700800);
   add("Message-ID: <b@x>", 1704700800);

@@ -222,7 +222,7 @@ TEST_F(PurgeTest, RemovesDocumentsThatOnlyTheIndexHas) {
   EXPECT_TRUE(salttest::scan(*salttest::loadIndex(classPath + "/salt"), "orphaned").empty());
 }
 
-TEST_F(PurgeTest, AKillLeavesTheOldClassOrTheNew) {
+TEST_F(PurgeTest, KillLeavesTheOldOrTheNewClass) {
   int kills = 0;
   for (;; ++kills) {
     const int status = purgeInChild([kills](int number, std::string_view) {
@@ -273,7 +273,7 @@ TEST_F(PurgeTest, TheDaemonRemovesTheRemainsOfAKilledPurge) {
 }
 
 // A failed write ends the purge, or the process, and leaves the old class.
-TEST_F(PurgeTest, AFullDiskChangesNothing) {
+TEST_F(PurgeTest, FullDiskChangesNothing) {
   for (const uint64_t bytes : {0, 1000, 20000, 60000, 150000}) {
     const int status = purgeInChild([bytes](int number, std::string_view) {
       if (number == 0) new salttest::FileSizeLimit(bytes);
@@ -286,7 +286,7 @@ TEST_F(PurgeTest, AFullDiskChangesNothing) {
   EXPECT_EQ(answersNow(), answersBefore);
 }
 
-TEST_F(PurgeTest, RefusesWhatItCannotReplace) {
+TEST_F(PurgeTest, RefusesClassesThatItCannotReplace) {
   const std::string file = classPath + "/notes.txt";
   const std::string moved = directory / "salt";
   const struct {

@@ -62,7 +62,7 @@ TEST_F(LatestWorkerTest, OnlyTheLastJobHasAResult) {
 }
 
 // The worker is destroyed although the job was never allowed to finish.
-TEST_F(LatestWorkerTest, TheEndStopsTheJobInHand) {
+TEST_F(LatestWorkerTest, DestructorStopsTheCurrentJob) {
   worker.submit(1);
   awaitStart();
 }

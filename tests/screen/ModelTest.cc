@@ -72,7 +72,7 @@ class ModelTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(ModelTest, EachKeyThatChangesTheLineIsASearch) {
+TEST_F(ModelTest, EachChangeOfTheLineIsASearch) {
   EXPECT_FALSE(model.nextSearch());
   type("inv");
   EXPECT_EQ(answer(3).words, "inv");
@@ -97,7 +97,7 @@ TEST_F(ModelTest, EachKeyThatChangesTheLineIsASearch) {
   EXPECT_THAT(model.statusText(), HasSubstr("F1"));
 }
 
-TEST_F(ModelTest, ResultsThatWereOvertakenAreDropped) {
+TEST_F(ModelTest, DropsOutdatedResults) {
   type("a");
   const auto first = model.nextSearch();
   type("b");
@@ -115,7 +115,7 @@ TEST_F(ModelTest, ResultsThatWereOvertakenAreDropped) {
   EXPECT_TRUE(model.rows().empty()) << "the line is empty";
 }
 
-TEST_F(ModelTest, PagesGoOnAtBothEndsOfTheList) {
+TEST_F(ModelTest, PagesContinueAtBothEndsOfTheList) {
   type("a");
   const size_t page = answer(20).limit;
   ASSERT_EQ(page, model.layout().list.rows);
@@ -251,7 +251,7 @@ TEST_F(ModelTest, AMailIsReadAndScrolled) {
   EXPECT_TRUE(model.done());
 }
 
-TEST_F(ModelTest, CommandsAreAboutTheSelectedMail) {
+TEST_F(ModelTest, CommandsApplyToTheSelectedMail) {
   press(Key::copy);
   EXPECT_FALSE(model.nextCommand());
   EXPECT_EQ(model.statusText(), "no mail is selected");
@@ -293,7 +293,7 @@ TEST_F(ModelTest, AQuestionMarkIsHelpOnlyInAnEmptyLine) {
   EXPECT_EQ(model.mode(), Mode::help);
 }
 
-TEST_F(ModelTest, FailuresAreToldAndTriedAgain) {
+TEST_F(ModelTest, ReportsAndRetriesFailures) {
   type("a");
   answer(3);
   type("b");
@@ -333,7 +333,7 @@ TEST_F(ModelTest, FailuresAreToldAndTriedAgain) {
 }
 
 // The model can always be drawn after random keys, sizes and answers.
-TEST_F(ModelTest, RandomHistoriesStaySound) {
+TEST_F(ModelTest, SurvivesRandomHistories) {
   std::mt19937 random(5);
   std::optional<Search> search;
   std::optional<MailRequest> request;

@@ -220,7 +220,7 @@ TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
   expectRestored();
 }
 
-TEST_F(ScreenProcessTest, AnySizeIsDrawn) {
+TEST_F(ScreenProcessTest, DrawsAnySize) {
   index();
   open(80, 24);
   type("invoice");
@@ -300,7 +300,7 @@ TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
   expectRestored();
 }
 
-TEST_F(ScreenProcessTest, ADaemonThatGoesIsWaitedFor) {
+TEST_F(ScreenProcessTest, WaitsForADaemonThatEnds) {
   index();
   daemon->signal(SIGKILL);
   daemon->wait();
@@ -320,7 +320,7 @@ TEST_F(ScreenProcessTest, ADaemonThatGoesIsWaitedFor) {
   await("1-1 of 1");
 }
 
-TEST_F(ScreenProcessTest, TheTerminalIsGivenBack) {
+TEST_F(ScreenProcessTest, RestoresTheTerminal) {
   index();
   open(80, 24);
   type("invoice");

@@ -90,14 +90,14 @@ constexpr auto kRelevance = cli::SortOrder::relevance;
 
 }  // namespace
 
-TEST_F(SearcherTest, ADaemonThatIsNotThereIsAFailure) {
+TEST_F(SearcherTest, AbsentDaemonIsAFailure) {
   mailscreen::Searcher searcher(options(directory / "none"), [this] { bell.ring(); });
   const Found found = find(searcher, {"words", "", kRelevance, false, 0, 10});
   EXPECT_EQ(found.failure, Failure::unreachable);
   EXPECT_EQ(found.reason, "tallowsearchd is not running");
 }
 
-TEST_F(SearcherTest, RefusalsAndUnreadableLinesHaveTheirReasons) {
+TEST_F(SearcherTest, ReportsReasonsOfFailures) {
   testsupport::FakeDaemon fake;
   mailscreen::Searcher searcher(options(fake.runtimeDirectory()), [this] { bell.ring(); });
   fake.failOnce("SearchItemsForQuery", {"com.quill.tallow.TALIndexerManager", -2, "locked"});
@@ -110,7 +110,7 @@ TEST_F(SearcherTest, RefusalsAndUnreadableLinesHaveTheirReasons) {
 }
 
 // A daemon that does not answer does not delay the end of the program.
-TEST_F(SearcherTest, TheEndDoesNotWaitForAnAnswer) {
+TEST_F(SearcherTest, DestructorDoesNotWaitForAReply) {
   testsupport::FakeDaemon fake;
   std::promise<void> called;
   std::promise<void> ended;
@@ -166,7 +166,7 @@ TEST_F(SampleSearchTest, PagesThreadsFoldersAndSavedSearches) {
   EXPECT_EQ(find({"nothingofthekind @toasts", "", kRelevance, false, 0, 10}).rows.size(), 0u);
 }
 
-TEST_F(SampleSearchTest, MailsAreReadWithBounds) {
+TEST_F(SampleSearchTest, LimitsMailsToRead) {
   mailscreen::MailLoader loader(options(daemon.runtimeDirectory()), [this] { bell.ring(); });
   const auto load = [&](const std::string& identifier, bool whole) {
     loader.submit({identifier, {"lo"}, whole});

@@ -63,7 +63,7 @@ TEST_F(ScreenTextTest, GlyphsAreSafeToDraw) {
   EXPECT_EQ(mailscreen::toUTF8(mailscreen::fitted(U"京", 1)), "…");
 }
 
-TEST_F(ScreenTextTest, LinesAreBrokenBetweenWords) {
+TEST_F(ScreenTextTest, WrapsLinesBetweenWords) {
   EXPECT_THAT(wrapped("one two three\n\nfour\n\n", 8),
               ElementsAre("one two ", "three", "", "four"));
   EXPECT_THAT(wrapped("abcdefgh ij", 4), ElementsAre("abcd", "efgh", "ij"));
@@ -74,7 +74,7 @@ TEST_F(ScreenTextTest, LinesAreBrokenBetweenWords) {
 }
 
 // For any text and width, all lines fit, and only spaces at line ends are lost.
-TEST_F(ScreenTextTest, BrokenLinesHoldTheText) {
+TEST_F(ScreenTextTest, WrappedLinesKeepTheText) {
   static constexpr const char* kPieces[] = {"a", "bc ", " ", "\n", "京", "e\u0301", "\x02", "\x01"};
   std::mt19937 random(3);
   for (int round = 0; round < 2000; ++round) {
@@ -104,7 +104,7 @@ TEST_F(ScreenTextTest, BrokenLinesHoldTheText) {
   }
 }
 
-TEST_F(ScreenTextTest, StylesGoOnInTheNextLine) {
+TEST_F(ScreenTextTest, StylesContinueInTheNextLine) {
   Document document;
   document.set(mailscreen::glyphsOf(std::string("a ") + kMatch + "long word" + kPlain + " b"));
   document.wrap(5);
@@ -115,7 +115,7 @@ TEST_F(ScreenTextTest, StylesGoOnInTheNextLine) {
   EXPECT_EQ(document.firstMatch(), 1u);
 }
 
-TEST_F(ScreenTextTest, ALineIsEdited) {
+TEST_F(ScreenTextTest, EditsALine) {
   LineEditor line;
   const auto press = [&line](Key key) { return line.press({key}); };
   EXPECT_TRUE(line.press({Key::text, "three lo\u0308ans\n\u202E\x1b"}));
@@ -146,7 +146,7 @@ TEST_F(ScreenTextTest, ALineIsEdited) {
 }
 
 // At any size, nothing is outside of the screen and nothing covers something else.
-TEST_F(ScreenTextTest, TheLayoutFitsAnyScreen) {
+TEST_F(ScreenTextTest, LayoutFitsAnyScreen) {
   for (size_t rows = 0; rows < 40; ++rows) {
     for (size_t columns = 0; columns < 140; ++columns) {
       const auto layout = mailscreen::layoutOf(rows, columns);

@@ -52,7 +52,7 @@ class DeliveryAgentTest : public testsupport::WatchProcessTest {
 
 }  // namespace
 
-TEST_F(DeliveryAgentTest, AllIsFoundAndNothingTwice) {
+TEST_F(DeliveryAgentTest, FindsEveryMailExactlyOnce) {
   std::atomic<int> next{0};
   std::atomic<bool> ended{false};
   std::vector<std::thread> deliverers;

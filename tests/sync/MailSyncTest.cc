@@ -182,7 +182,7 @@ TEST_F(MailSyncTest, MessagesOfAnMboxKeepTheirIdentity) {
   EXPECT_EQ(report.scan.flagChanges, 1U);
 }
 
-TEST_F(MailSyncTest, DigestsLeaveOutWhatMailProgramsNote) {
+TEST_F(MailSyncTest, DigestsIgnoreStateFieldsOfMailPrograms) {
   const std::string plain = "Subject: a\nX: b\n\nStatus: R\n";
   EXPECT_EQ(
       mailsync::messageDigest(plain),
@@ -193,7 +193,7 @@ TEST_F(MailSyncTest, DigestsLeaveOutWhatMailProgramsNote) {
   EXPECT_EQ(mailsync::statusFlags("Statu"), "");
 }
 
-TEST_F(MailSyncTest, OneFileByTwoPathsCountsOnce) {
+TEST_F(MailSyncTest, FileWithTwoPathsCountsOnce) {
   add("a/cur/1:2,", "one");
   fs::create_hard_link(mail + "/a/cur/1:2,", mail + "/b/cur/9:2,");
   fs::create_symlink(mail + "/a/cur/1:2,", mail + "/link.eml");
@@ -206,7 +206,7 @@ TEST_F(MailSyncTest, OneFileByTwoPathsCountsOnce) {
   EXPECT_EQ(indexed(), (Lines{"b: one"})) << first;
 }
 
-TEST_F(MailSyncTest, WhatIsNotThereDeletesNothing) {
+TEST_F(MailSyncTest, MissingDirectoriesDeleteNothing) {
   add("a/cur/1", "one");
   add("b/cur/2", "two");
   ASSERT_TRUE(sync());
@@ -249,7 +249,7 @@ TEST_F(MailSyncTest, NamesOfAnyBytesAndTenThousandRenames) {
   EXPECT_EQ(report.toSend + report.toDelete, 0U);
 }
 
-TEST_F(MailSyncTest, WhatCannotBeIndexedIsToldAndNotTakenForSent) {
+TEST_F(MailSyncTest, ReportsFailedMessagesAndDoesNotCountThemAsSent) {
   add("a/cur/1", "one");
   add("a/cur/2", "poison");
   put("a/cur/3", "\n\n");
@@ -305,7 +305,7 @@ TEST_F(MailSyncTest, ADryRunChangesNothing) {
   }
 }
 
-TEST_F(MailSyncTest, ASecondSyncSaysSo) {
+TEST_F(MailSyncTest, RefusesASecondSync) {
   ASSERT_TRUE(sync());
   const auto lock = platform::ProcessLock::acquire(cataloguePath() + ".lock", &error);
   ASSERT_TRUE(lock);
@@ -313,7 +313,7 @@ TEST_F(MailSyncTest, ASecondSyncSaysSo) {
   EXPECT_EQ(error->domain, mailsync::kBusyDomain);
 }
 
-TEST_F(MailSyncTest, ACatalogueThatIsLostOrDamagedSendsNothingAgain) {
+TEST_F(MailSyncTest, LostOrDamagedCatalogueSendsNothingAgain) {
   add("a/new/1", "one");
   put("box", mboxOf({"two", "three"}));
   ASSERT_TRUE(sync());
@@ -368,7 +368,7 @@ TEST_F(MailSyncTest, ATimeInTheFutureIsNotTrusted) {
   EXPECT_EQ(indexed(), (Lines{"a: one", "a: two"}));
 }
 
-TEST_F(MailSyncTest, AFullDiskUnderTheCatalogueLosesNothing) {
+TEST_F(MailSyncTest, FullDiskLosesNothing) {
   add("a/cur/1", "one");
   ASSERT_TRUE(sync());
   Lines expected{"a: one"};
@@ -394,7 +394,7 @@ TEST_F(MailSyncTest, AFullDiskUnderTheCatalogueLosesNothing) {
 
 // Random histories of mailbox, daemon and catalogue. After each successful sync the index matches
 // the mailbox.
-TEST_F(MailSyncTest, AfterAnyHistoryTheIndexHoldsWhatIsThere) {
+TEST_F(MailSyncTest, IndexMatchesTheMailboxAfterRandomHistories) {
   const uint32_t begin = testsupport::firstSeed();
   for (uint32_t seed = begin; seed < begin + 12; ++seed) {
     std::mt19937 random(seed);

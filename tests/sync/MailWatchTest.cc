@@ -106,7 +106,7 @@ class MailWatchTest : public testing::Test {
 
 }  // namespace
 
-TEST_F(MailWatchTest, LooksOnlyIntoWhatHasChanged) {
+TEST_F(MailWatchTest, ScansOnlyChangedDirectories) {
   start(mail);
   EXPECT_THAT(source->watched, Contains(mail + "/a/new"));
   EXPECT_THAT(source->watched, Contains(directory.path()));
@@ -140,7 +140,7 @@ TEST_F(MailWatchTest, LooksOnlyIntoWhatHasChanged) {
   EXPECT_EQ(indexed(), 3U);
 }
 
-TEST_F(MailWatchTest, WhatCannotBeWatchedIsLookedAtFromTimeToTime) {
+TEST_F(MailWatchTest, ScansUnwatchableDirectoriesAtIntervals) {
   refused = {mail + "/a/new"};
   start(mail);
   EXPECT_THAT(said, ElementsAre(HasSubstr("cannot be watched")));
@@ -152,7 +152,7 @@ TEST_F(MailWatchTest, WhatCannotBeWatchedIsLookedAtFromTimeToTime) {
   EXPECT_EQ(said.size(), 1U);
 }
 
-TEST_F(MailWatchTest, ARootMayComeAndGo) {
+TEST_F(MailWatchTest, RootsMayAppearAndDisappear) {
   const std::string root = directory / "later/mail";
   start(root);
   fs::create_directories(directory / "later");
@@ -195,7 +195,7 @@ TEST_F(MailWatchTest, ALargeBacklogWaitsForPowerAndNewMailDoesNot) {
 }
 
 // Power is lost while a round sends.
-TEST_F(MailWatchTest, ARoundStopsForPowerWhereMuchIsLeft) {
+TEST_F(MailWatchTest, RoundStopsForPowerWithALargeBacklog) {
   settings.powerInterval = std::chrono::milliseconds(0);
   setPower(true);
   const size_t limit = mailsync::MailWatch::kBatteryBacklog;
@@ -223,7 +223,7 @@ TEST_F(MailWatchTest, ARoundStopsForPowerWhereMuchIsLeft) {
   EXPECT_EQ(indexed(), many + 1 + limit);
 }
 
-TEST_F(MailWatchTest, ASecondWatchOfTheClassSaysSo) {
+TEST_F(MailWatchTest, RefusesASecondWatchOfTheClass) {
   start(mail);
   std::optional<TLError> error;
   EXPECT_EQ(
@@ -232,7 +232,7 @@ TEST_F(MailWatchTest, ASecondWatchOfTheClassSaysSo) {
   EXPECT_EQ(error->domain, mailsync::kBusyDomain);
 }
 
-TEST_F(MailWatchTest, TheKernelTellsOfADirectoryByItsLatestPath) {
+TEST_F(MailWatchTest, KernelReportsTheLatestPathOfADirectory) {
   mailsync::DirectoryWatch kernel;
   using Result = mailsync::ChangeSource::Result;
   ASSERT_EQ(kernel.watch(mail + "/a/new"), Result::watched);

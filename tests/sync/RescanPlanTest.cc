@@ -61,7 +61,7 @@ TEST_F(RescanPlanTest, ChangesAreTakenTogetherButNotForLong) {
   EXPECT_EQ(take(1300), Places{"/c"});
 }
 
-TEST_F(RescanPlanTest, ARoundThatFailsIsRepeatedLessAndLessOften) {
+TEST_F(RescanPlanTest, RetriesAFailedRoundWithGrowingPauses) {
   plan.changed("/a", at(0));
   ASSERT_EQ(take(50, false), Places{"/a"});
   plan.changed("/b", at(60));
@@ -85,7 +85,7 @@ TEST_F(RescanPlanTest, ARoundThatFailsIsRepeatedLessAndLessOften) {
   EXPECT_EQ(take(time + 500), Places{"*"});
 }
 
-TEST_F(RescanPlanTest, WhatIsNotWatchedIsLookedAtInIntervals) {
+TEST_F(RescanPlanTest, ScansUnwatchedPlacesAtIntervals) {
   plan.setUnwatched({"/a"}, at(0));
   EXPECT_EQ(plan.next(), start + minutes(2));
   plan.changed("/b", at(1000));
@@ -97,7 +97,7 @@ TEST_F(RescanPlanTest, WhatIsNotWatchedIsLookedAtInIntervals) {
   EXPECT_EQ(plan.next(), start + hours(24));
 }
 
-TEST_F(RescanPlanTest, TooManyPlacesAreEverything) {
+TEST_F(RescanPlanTest, TooManyPlacesCauseAFullRound) {
   for (size_t i = 0; i <= RescanPlan::kMaxPlaces; ++i) plan.changed(std::to_string(i), at(0));
   EXPECT_EQ(take(50), Places{"*"});
 }

@@ -31,7 +31,7 @@ TEST_F(WatchProcessTest, FollowsMailAndFolders) {
   EXPECT_EQ(end(SIGTERM), 0);
 }
 
-TEST_F(WatchProcessTest, FindsWhatTheKernelCouldNotTell) {
+TEST_F(WatchProcessTest, FindsChangesThatTheKernelDropped) {
   const auto text = platform::readFile("/proc/sys/fs/inotify/max_queued_events", 100, nullptr);
   const int queued = std::atoi(text.value_or("0").c_str());
   if (queued <= 0 || queued > 200000) GTEST_SKIP() << "a queue of " << queued << " events";
