@@ -2,8 +2,6 @@
 
 #include <utility>
 
-using rpc::Arguments;
-using rpc::Interface;
 using rpc::Values;
 using Reply = std::shared_ptr<rpc::Reply>;
 

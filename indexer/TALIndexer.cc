@@ -190,7 +190,7 @@ TLError TALIndexer::noIndexError() const {
 
 void TALIndexer::makeQueryObjects() {
   if (tk == nullptr) {
-    const std::string locale = bestLexemonLocale();
+    const std::string& locale = bestLexemonLocale();
     log().info("Creating Lexemon tokenizer for locale: {}", locale);
     tk = tokenizer::NewFastLexemonTokenizer(locale);
     if (tk == nullptr) log().error("Failed to create lexemon tokenizer for locale: {}", locale);

@@ -69,7 +69,7 @@ const std::array<TLAttributeKey, 14>& TALQueryProcessor::queryTermEnumKeyAttribs
 
 std::unique_ptr<TALQueryProcessor> TALQueryProcessor::initWithZoneManager(
     const TALZoneManager& zoneManager, const TALSynonyms* synonymModel) {
-  const std::string locale = bestLexemonLocale();
+  const std::string& locale = bestLexemonLocale();
   log().info("Creating Lexemon tokenizer for locale: {}", locale);
   auto tokenizer = tokenizer::NewFastLexemonTokenizer(locale);
   if (tokenizer == nullptr) {
