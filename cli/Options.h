@@ -46,11 +46,10 @@ enum class SortOrder { relevance, date };
 
 struct Options {
   Command command = Command::ping;
-  std::vector<std::string>
-      arguments;      // arguments of the command: paths, words, identifiers or a text
-  std::string query;  // an expression instead of words
-  std::vector<std::string> filters;  // expressions in addition to words
-  std::string parameters;            // key=value,...
+  std::vector<std::string> arguments;  // paths, words, identifiers or a text
+  std::string query;                   // an expression instead of words
+  std::vector<std::string> filters;    // expressions in addition to words
+  std::string parameters;              // key=value,...
 
   std::string runtimeDirectory;
   std::string stateDirectory;  // empty: the daemon's default
@@ -69,8 +68,7 @@ struct Options {
   bool verbose = false;
 
   bool threads = false;  // results by conversation
-  std::string
-      folder;  // in addition to words: only mail in this folder, as folder:NAME; empty for all
+  std::string folder;    // only mail in this folder, in addition to words; empty for all
 
   // For show.
   bool raw = false;

@@ -12,8 +12,7 @@ namespace {
 
 constexpr char32_t kReplacement = 0xFFFD;
 constexpr char32_t kEllipsis = 0x2026;
-constexpr char32_t kNonJoiner =
-    0x200C;  // part of the spelling of words; takes no column in any terminal
+constexpr char32_t kNonJoiner = 0x200C;  // part of the spelling; takes no column
 // The screen library's limit for one cell.
 constexpr size_t kMaxCombining = 4;
 

@@ -43,8 +43,7 @@ class Searcher {
   const cli::Options _options;
   client::SearchServiceProxy _service;
   cli::MailFacts _facts;
-  LatestWorker<Search, Found>
-      _worker;  // last member: its thread ends before the members that it uses
+  LatestWorker<Search, Found> _worker;  // last member: its thread uses the others
 };
 
 }  // namespace mailscreen

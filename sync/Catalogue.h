@@ -15,9 +15,8 @@ namespace mailsync {
 // The last batch in which a message was sent. Batches are numbered from 1, and numbers never
 // decrease. A message is in the index if its number is at most the catalogue's `acknowledged`; if
 // it is larger, the message must be sent.
-inline constexpr int64_t kWaiting =
-    std::numeric_limits<int64_t>::max();  // not yet sent in its current version
-inline constexpr int64_t kFailed = -1;    // not to be sent; `problem` says why
+inline constexpr int64_t kWaiting = std::numeric_limits<int64_t>::max();  // current version unsent
+inline constexpr int64_t kFailed = -1;  // not to be sent; `problem` says why
 
 enum class FileKind : int64_t {
   maildir = 0,  // one message, identified by folder and name without flags
