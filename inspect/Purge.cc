@@ -140,7 +140,7 @@ class Purge {
     _progress(what);
   }
 
-  // Files in the class that are not the daemon's own would be lost or left behind.
+  // A purge would lose files in the class that are not the daemon's own.
   bool mayReplace(TLErrorOut error) {
     struct stat state {};
     if (stat(_state.c_str(), &state) != 0) return failSystem(_state, error);

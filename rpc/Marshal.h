@@ -28,7 +28,7 @@ int buildFailure(sd_bus_message* call, const char* name, const std::string& mess
                  sd_bus_message** reply);
 int buildError(sd_bus_message* call, const TLError& error, sd_bus_message** reply);
 
-// A stub for a call with its cookie and no content, which is all that a reply needs. Null when
+// A message with the header of a call and no content, which is all that a reply needs. Null when
 // memory is short.
 [[nodiscard]] sd_bus_message* standInFor(sd_bus* bus, sd_bus_message* call);
 

@@ -146,8 +146,7 @@ class ServerConnection : public Connection {
   uint64_t _receivedBefore = 0;  // at the last progress check, like the next
   uint64_t _messagesBefore = 0;
 
-  // Calls whose reply is outstanding: by number, a stub message with the cookie of the call and no
-  // content.
+  // Calls whose reply is outstanding, by number; of each only the header is kept.
   std::unordered_map<uint64_t, sd_bus_message*> _calls;
   uint64_t _nextCall = 0;
   size_t _queuedBytes = 0;  // replies in the bus's write queue, an upper bound

@@ -37,8 +37,8 @@ struct Database {
   leveldb::Status status;           // of opening
 };
 
-// The system failure behind a status: too few descriptors, memory, space, an unreadable disk.
-// Nullopt for a database that is absent or damaged.
+// The error of the system that caused a status, such as a lack of descriptors, memory or space, or
+// an unreadable disk. Nullopt for a database that is absent or damaged.
 [[nodiscard]] std::optional<TLError> systemError(const leveldb::Status& status);
 
 enum class OpenMode { create, existing };

@@ -13,7 +13,7 @@ namespace peers {
 
 namespace {
 
-// The words but the last one, quoted, so that none is an operator, and a blank behind each.
+// All words except the last, each in quotes, so that none is an operator, and followed by a space.
 std::string quotedWords(const std::vector<std::string>& words) {
   std::string text;
   for (size_t i = 0; i + 1 < words.size(); ++i) text += '"' + words[i] + "\" ";
