@@ -195,9 +195,13 @@ class TALIndexer {
   // that is repeated, because it is gone by then.
   std::vector<uint32_t> storedIDs(std::span<const TLString> identifiers,
                                   const std::string& bundleID, TLErrorOut error);
-  // Deletes documents from the store and hides them in the text index, some at a time. Those before
-  // a failure stay deleted.
-  bool deleteDocs(std::span<const uint32_t> docIDs, TLErrorOut error) TL_REQUIRES(_indexMutex);
+  // Deletes documents from the store and hides them in the text index, in order, up to the first
+  // that fails. Returns that one; nullopt when all are deleted.
+  std::optional<uint32_t> deleteDocs(std::span<const uint32_t> docIDs, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
+  // The same for as many as go into one transaction.
+  std::optional<uint32_t> deleteTogether(std::vector<uint32_t> docIDs, TLErrorOut error)
+      TL_REQUIRES(_indexMutex);
   bool _deleteItemsByDomainIdentifier(const Strings& domains, TLErrorOut error)
       TL_REQUIRES(_indexMutex);
 

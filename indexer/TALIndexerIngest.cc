@@ -347,9 +347,15 @@ bool TALIndexer::_deleteItemsByIdentifiers(const Strings& identifiers, const std
     std::optional<TLError> unknown;
     const auto docIDs =
         storedIDs(all.subspan(at, std::min(kDeletedAtATime, all.size() - at)), bundleID, &unknown);
-    if (!deleteDocs(docIDs, error)) return false;
-    if (unknown) {
-      platform::setError(error, *unknown);
+    std::optional<TLError> failure;
+    if (const auto failed = deleteDocs(docIDs, &failure)) {
+      log().error("Failed to delete document with ID {} in docstore: {}", *failed,
+                  platform::printable(failure));
+    } else {
+      failure = unknown;
+    }
+    if (failure) {
+      platform::setError(error, *failure);
       return false;
     }
   }
@@ -380,23 +386,31 @@ std::vector<uint32_t> TALIndexer::storedIDs(std::span<const TLString> identifier
   return docIDs;
 }
 
-bool TALIndexer::deleteDocs(std::span<const uint32_t> docIDs, TLErrorOut error) {
-  const auto text = _text.get();
-  for (; !docIDs.empty(); docIDs = docIDs.subspan(std::min(kDeletedAtATime, docIDs.size()))) {
+std::optional<uint32_t> TALIndexer::deleteDocs(std::span<const uint32_t> docIDs, TLErrorOut error) {
+  while (!docIDs.empty()) {
     const auto piece = docIDs.first(std::min(kDeletedAtATime, docIDs.size()));
-    const std::vector<uint32_t> deleted(piece.begin(), piece.end());
-    for (const uint32_t docID : deleted) _docDates.forget(docID);
-    std::optional<TLError> failure;
-    if (!docStore()->deleteDocuments(deleted, &failure)) {
-      log().error("Failed to delete document with doc ID {} in docstore: {}", deleted.front(),
-                  platform::printable(failure));
-      platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
-      return false;
-    }
-    // A document that is still in the index but no longer in the store is not a result.
-    if (text != nullptr) text->index->DeleteDocs(deleted);
+    if (const auto failed = deleteTogether({piece.begin(), piece.end()}, error)) return failed;
+    docIDs = docIDs.subspan(piece.size());
   }
-  return true;
+  return std::nullopt;
+}
+
+std::optional<uint32_t> TALIndexer::deleteTogether(std::vector<uint32_t> docIDs, TLErrorOut error) {
+  const auto store = docStore();
+  for (const uint32_t docID : docIDs) _docDates.forget(docID);
+  std::optional<uint32_t> failed;
+  if (!store->deleteDocuments(docIDs, nullptr)) {
+    // One by one, so that those before the one that fails are deleted.
+    const auto end = std::find_if_not(docIDs.begin(), docIDs.end(), [&](uint32_t docID) {
+      return store->deleteDocument(docID, error);
+    });
+    if (end != docIDs.end()) failed = *end;
+    docIDs.erase(end, docIDs.end());
+  }
+  // A document that is still in the index but no longer in the store is not a result.
+  const auto text = _text.get();
+  if (text != nullptr && !docIDs.empty()) text->index->DeleteDocs(docIDs);
+  return failed;
 }
 
 void TALIndexer::deleteItemsByDomainIdentifiers(Strings domainIdentifiers,
@@ -426,5 +440,11 @@ bool TALIndexer::_deleteItemsByDomainIdentifier(const Strings& domains, TLErrorO
     if (doc == nullptr || !doc->domainIdentifier()) return;
     if (wanted.contains(*doc->domainIdentifier())) found.push_back(docID);
   });
-  return deleteDocs(found, error);
+  std::optional<TLError> failure;
+  const auto failed = deleteDocs(found, &failure);
+  if (!failed) return true;
+  log().error("Failed to delete document with doc ID {} in docstore: {}", *failed,
+              platform::printable(failure));
+  if (failure) platform::setError(error, *failure);
+  return false;
 }

@@ -5,86 +5,23 @@
 #include <random>
 #include <thread>
 
-#include "docstore/TALSqliteDocStore.h"
-#include "indexer/TALIndexer.h"
 #include "platform/Files.h"
 #include "platform/StateCapture.h"
 #include "records/TLParamsManager.h"
+#include "tests/indexer/IndexerSupport.h"
 #include "tests/salt/SaltSupport.h"
-#include "tests/support/LogCapture.h"
-#include "tests/support/Outcome.h"
-#include "tests/support/TemporaryDirectory.h"
 
 namespace {
 
 using enum TLAttributeKey;
+using testsupport::IndexerTest;
+using testsupport::mail;
 using testsupport::Outcome;
 using testsupport::outcomeOf;
-
-std::shared_ptr<TLIndexableItem> mail(const std::string& identifier, const std::string& subject,
-                                      const std::string& body = "", double date = 0) {
-  auto item = std::make_shared<TLIndexableItem>();
-  item->setIdentifier(platform::fromUTF8(identifier));
-  item->addAttributeWithKeyStringValue(SUBJECT, platform::fromUTF8(subject));
-  if (!body.empty()) item->addAttributeWithKeyStringValue(TEXT_CONTENT, platform::fromUTF8(body));
-  if (date != 0) item->addAttributeWithKeyDoubleValue(MAIL_DATE_RECEIVED, date);
-  return item;
-}
 
 std::shared_ptr<TLParameters> parameters(TLStringView text) {
   return TLParamsManager::paramsFromString(text);
 }
-
-class IndexerTest : public testing::Test {
- protected:
-  IndexerTest() { open(); }
-  ~IndexerTest() override {
-    if (indexer != nullptr) indexer->shutdown();
-  }
-
-  void open() {
-    store = std::make_shared<TALSqliteDocStore>(directory / "docstore/docstore.db");
-    ASSERT_TRUE(store->openWithError(nullptr));
-    indexer = std::make_unique<TALIndexer>(directory / "salt", "testing", store,
-                                           directory / "synonyms.txt");
-  }
-  void reopen() {
-    indexer->shutdown();
-    indexer.reset();
-    open();
-  }
-
-  Outcome add(TALIndexer::Items items) {
-    return outcomeOf(
-        [&](auto done) { indexer->addDocs(std::move(items), "mail_bundle_id", done); });
-  }
-  Outcome remove(TALIndexer::Strings identifiers) {
-    return outcomeOf([&](auto done) {
-      indexer->deleteItemsByIdentifiers(std::move(identifiers), "mail_bundle_id", done);
-    });
-  }
-
-  // Identifiers of the results, in order, separated by spaces; on failure the error message.
-  std::string search(const std::string& text, std::shared_ptr<TLParameters> overrides = nullptr) {
-    TLQuery query;
-    query.setOriginalQuery(platform::fromUTF8(text));
-    query.setSearchParams(std::move(overrides));
-    Outcome error;
-    const auto items = indexer->search(query, &error);
-    if (error) return error->message;
-    std::string out;
-    for (const auto& item : items) {
-      if (!out.empty()) out += ' ';
-      out += platform::printable(item->identifier());
-    }
-    return out;
-  }
-
-  testsupport::LogCapture log;
-  testsupport::TemporaryDirectory directory;
-  std::shared_ptr<TALSqliteDocStore> store;
-  std::unique_ptr<TALIndexer> indexer;
-};
 
 }  // namespace
 
@@ -240,55 +177,6 @@ TEST_F(IndexerTest, HTMLPersonsAndListsGoToTheirZones) {
   EXPECT_EQ(search("inbox"), "");  // the zone is not searched for free text
   EXPECT_EQ(*store->documentWithID(1, nullptr)->stringValueForKey(CONTENT_SNIPPET),
             u"Gr\u00fc\u00dfe aus Bern");
-}
-
-TEST_F(IndexerTest, DeletedDocumentsStayGoneAcrossARestart) {
-  ASSERT_EQ(add({mail("a", "word"), mail("b", "word"), mail("c", "word")}), std::nullopt);
-  EXPECT_EQ(remove({u"b"}), std::nullopt);
-  EXPECT_EQ(search("word"), "c a");
-  reopen();
-  EXPECT_EQ(search("word"), "c a");
-  ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
-  EXPECT_EQ(search("word"), "c b a");
-}
-
-TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
-  TALIndexer::Items items{mail("b", "word")};
-  TALIndexer::Strings identifiers;
-  for (int i = 0; i < 150; ++i) {
-    items.push_back(mail(std::to_string(i), "word"));
-    identifiers.push_back(*items.back()->identifier());
-  }
-  ASSERT_EQ(add(items), std::nullopt);
-  identifiers.insert(identifiers.end(), {u"nobody", u"b"});
-  const Outcome error = remove(identifiers);
-  ASSERT_TRUE(error);
-  EXPECT_EQ(error->domain, "DocStore");
-  EXPECT_TRUE(
-      log.contains("Failed to fetch document ID in docstore for URL tlw://mail_bundle_id/nobody"));
-  EXPECT_EQ(search("word"), "b");
-  EXPECT_TRUE(remove({u""}));
-  // The second time it is not there any more.
-  EXPECT_TRUE(remove({u"b", u"b"}));
-  EXPECT_EQ(store->count(nullptr), 0);
-}
-
-TEST_F(IndexerTest, DeletesByDomain) {
-  TALIndexer::Items items;
-  for (int i = 0; i < 206; ++i) {
-    items.push_back(mail(std::to_string(i), "word"));
-    items.back()->setDomainIdentifier(i % 2 == 0 || i > 5 ? u"even" : u"odd");
-  }
-  items.push_back(mail("other", "word"));
-  items.back()->setDomainIdentifier(u"third");
-  items.push_back(mail("none", "word"));
-  ASSERT_EQ(add(items), std::nullopt);
-  EXPECT_EQ(outcomeOf([&](auto done) {
-              indexer->deleteItemsByDomainIdentifiers({u"even", u"nothing", u"third"}, done);
-            }),
-            std::nullopt);
-  EXPECT_EQ(search("word"), "none 5 3 1");
-  EXPECT_EQ(store->count(nullptr), 4);
 }
 
 TEST_F(IndexerTest, AnItemWithoutIdentifierStoresNothingOfTheBatch) {
