@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <list>
+#include <tuple>
 #include <vector>
 
 #include "platform/Files.h"
@@ -51,24 +52,20 @@ class ConnectionTable {
   }
 
  private:
-  // A connection whose peer has hung up leaves by itself, and so makes room without an eviction.
-  // Next come connections that have never made a call, so that many silent peers cannot push out a
-  // working one.
+  // A connection whose peer has hung up leaves by itself, and so makes room without harm. Next come
+  // connections that have never made a call, so that many silent peers cannot push out a working
+  // one. Among equals, the one that has been idle longest.
   bool evictOne() TL_REQUIRES(_mutex) {
+    using Rank = std::tuple<bool, bool, uint64_t>;  // the lowest is evicted
     ServerConnection* chosen = nullptr;
-    ServerConnection::Idleness least;
+    Rank lowest;
     for (ServerConnection* connection : _connections) {
       const auto idle = connection->idleness();
-      if (idle.gone && !connection->evicted()) {
-        chosen = connection;
-        break;
-      }
-      if (idle.calling) continue;
-      const bool longer = chosen == nullptr || (least.called && !idle.called) ||
-                          (least.called == idle.called && idle.since < least.since);
-      if (!longer) continue;
+      if (connection->evicted() || (idle.calling && !idle.gone)) continue;
+      const Rank rank(!idle.gone, idle.called, idle.since);
+      if (chosen != nullptr && rank >= lowest) continue;
       chosen = connection;
-      least = idle;
+      lowest = rank;
     }
     if (chosen != nullptr) chosen->evict();
     return chosen != nullptr;

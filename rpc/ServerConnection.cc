@@ -230,41 +230,15 @@ bool ServerConnection::openBus() {
 }
 
 bool ServerConnection::exportInterfaces() {
+  const std::string path = objectPath(_serviceName);
   return addGreeting(_bus) &&
-         std::all_of(_interfaces.begin(), _interfaces.end(),
-                     [this](const Interface& interface) { return exportInterface(interface); });
-}
-
-bool ServerConnection::exportInterface(const Interface& interface) {
-  std::vector<sd_bus_vtable> vtable;
-  sd_bus_vtable start{};
-  start.type = _SD_BUS_VTABLE_START;
-  start.x.start.element_size = sizeof(sd_bus_vtable);
-  start.x.start.features = _SD_BUS_VTABLE_PARAM_NAMES;
-  start.x.start.vtable_format_reference = &sd_bus_object_vtable_format;
-  vtable.push_back(start);
-  for (const Method& method : interface.methods) {
-    std::string names;
-    for (const char* name : method.argumentNames) names.append(name).push_back('\0');
-    _vtableNames.push_back(std::move(names));
-    sd_bus_vtable entry{};
-    entry.type = _SD_BUS_VTABLE_METHOD;
-    entry.flags = SD_BUS_VTABLE_UNPRIVILEGED;
-    entry.x.method.member = method.member;
-    entry.x.method.signature = method.inputSignature;
-    entry.x.method.result = method.outputSignature;
-    entry.x.method.handler = onMessage;
-    entry.x.method.names = _vtableNames.back().c_str();
-    vtable.push_back(entry);
-  }
-  sd_bus_vtable end{};
-  end.type = _SD_BUS_VTABLE_END;
-  vtable.push_back(end);
-  _vtables.push_back(std::move(vtable));
-  const int result = sd_bus_add_object_vtable(_bus, nullptr, objectPath(_serviceName).c_str(),
-                                              interface.name.c_str(), _vtables.back().data(), this);
-  if (result < 0) log().error("Could not export {}: {}", interface.name, std::strerror(-result));
-  return result >= 0;
+         std::all_of(_interfaces.begin(), _interfaces.end(), [&](const Interface& interface) {
+           const int result = _exports.add(_bus, path, interface, {onMessage, this});
+           if (result < 0) {
+             log().error("Could not export {}: {}", interface.name, std::strerror(-result));
+           }
+           return result >= 0;
+         });
 }
 
 void ServerConnection::onSocket(bool peerGone) {

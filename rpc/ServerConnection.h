@@ -3,7 +3,6 @@
 #include <systemd/sd-bus.h>
 
 #include <atomic>
-#include <deque>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -13,6 +12,7 @@
 
 #include "platform/FileDescriptor.h"
 #include "platform/Mutex.h"
+#include "rpc/Exports.h"
 #include "rpc/Inlet.h"
 #include "rpc/Server.h"
 
@@ -86,7 +86,6 @@ class ServerConnection : public Connection {
 
   bool openBus();
   bool exportInterfaces();
-  bool exportInterface(const Interface& interface);
   // The method that a message calls; null if unknown.
   [[nodiscard]] const Method* methodOf(sd_bus_message* message) const;
 
@@ -127,8 +126,7 @@ class ServerConnection : public Connection {
   std::unique_ptr<platform::RunLoop> _loop;
   const std::shared_ptr<Outbox> _outbox = std::make_shared<Outbox>();  // thread-safe
   sd_bus* _bus = nullptr;
-  std::vector<std::vector<sd_bus_vtable>> _vtables;  // the bus points into these and the names
-  std::deque<std::string> _vtableNames;
+  Exports _exports;
   std::unique_ptr<platform::RunLoop::Socket> _source;
   std::unique_ptr<platform::RunLoop::Source> _authenticationTimer;
   std::unique_ptr<platform::RunLoop::Source> _progressTimer;
