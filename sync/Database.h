@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "platform/TLError.h"
 
@@ -48,6 +49,24 @@ class Statement {
   std::unique_ptr<sqlite3_stmt, Finalizer> _statement;
   int _bound = 0;
 };
+
+// What `make` makes of each remaining row.
+template <typename Make>
+auto all(Statement& statement, const Make& make) {
+  std::vector<decltype(make(statement))> rows;
+  while (statement.step()) rows.push_back(make(statement));
+  statement.reset();
+  return rows;
+}
+
+// What `make` makes of the next row; nullopt if there is none.
+template <typename Make>
+auto first(Statement& statement, const Make& make) {
+  std::optional<decltype(make(statement))> row;
+  if (statement.step()) row = make(statement);
+  statement.reset();
+  return row;
+}
 
 // One SQLite database with a write-ahead log. One thread at a time.
 //
