@@ -1,7 +1,7 @@
 #include "client/Batches.h"
 
 #include "rpc/Channel.h"
-#include "rpc/Server.h"
+#include "rpc/Names.h"
 
 namespace client {
 

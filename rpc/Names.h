@@ -1,6 +1,7 @@
 #pragma once
 
 #include <algorithm>
+#include <cstddef>
 #include <string>
 
 // What the two ends of the RPC must agree on.
@@ -16,6 +17,10 @@ inline constexpr const char* kSearchExplanationName = "com.quill.tallowsearch.Se
 // The D-Bus error name for error objects; the body has message, domain and code.
 inline constexpr const char* kErrorName = "com.quill.tallow.Error";
 inline constexpr const char* kInvalidArgs = "org.freedesktop.DBus.Error.InvalidArgs";
+
+// Maximum number of elements of an array argument. Eight bytes on the wire become an object in
+// memory, so a longer array is refused, and the client sends several calls.
+inline constexpr size_t kMaxArrayElements = 262144;
 
 // The path of a service's only object.
 [[nodiscard]] inline std::string objectPath(const std::string& serviceName) {

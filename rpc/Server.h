@@ -35,7 +35,6 @@ inline constexpr size_t kMaxQueuedBytes = size_t{256} << 20;
 // Calls of a connection whose reply is outstanding; at this number it stops reading.
 inline constexpr size_t kMaxPendingCalls = 4;
 inline constexpr size_t kMaxMessageBytes = size_t{128} << 20;  // the protocol's limit
-inline constexpr size_t kMaxArrayElements = 262144;            // per argument
 // Total size of the requests, over all connections, that are being received or whose reply is
 // outstanding. A larger request waits until there is no other. Small ones may use as much again, so
 // that searches do not wait for large batches.
