@@ -9,6 +9,7 @@
 
 #include "platform/CrashNote.h"
 #include "platform/Files.h"
+#include "platform/Memory.h"
 
 namespace salt {
 
@@ -62,7 +63,6 @@ BatchWriter::~BatchWriter() {
     _ending = true;
   }
   _ended.notify_all();
-  _compacted.notify_all();
 }
 
 bool BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end) {
@@ -119,26 +119,30 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch, bool sync) {
   return status;
 }
 
+// A compaction of the range after the last key flushes the memtable and does nothing else.
+bool BatchWriter::flush() {
+  const leveldb::Slice behind("\xFF\xFF", 2);
+  return compact(&behind, &behind);
+}
+
 void BatchWriter::wrote(size_t bytes) {
   _unflushed += bytes;
   _lastWrite = std::chrono::steady_clock::now();
   if (_flushPlanned || _unflushed < kSmallMemtable) return;
   // If no thread is available, the next write tries again.
-  _flushPlanned = _flushing.async([this] { flushWhenIdle(); });
+  _flushPlanned = _flushing.async([this] {
+    if (waitUntilIdle() && flush()) platform::returnFreeMemory();
+  });
 }
 
-void BatchWriter::flushWhenIdle() {
+bool BatchWriter::waitUntilIdle() {
   platform::MutexLock lock(_mutex);
   while (!_ending && _lastWrite + _idle > std::chrono::steady_clock::now()) {
     _ended.wait_until(_mutex, _lastWrite + _idle);
   }
-  while (!_ending && _compacts) _compacted.wait(_mutex);
   _flushPlanned = false;
-  if (_ending || platform::freeBytes(_database.path) < kCompactionRoom) return;
-  // leveldb starts a new log and a new memtable, and writes the old one on its own thread. A
-  // failure shows at the next write.
-  (void)_database.db->Write(leveldb::WriteOptions(), nullptr);
   _unflushed = 0;
+  return !_ending;
 }
 
 // leveldb passes on the text of an errno but not its number. All of its I/O errors come from the

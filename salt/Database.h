@@ -86,13 +86,16 @@ class BatchWriter {
   // and returns false, with a log line, with less than 128 MiB free.
   bool compact(const leveldb::Slice* begin, const leveldb::Slice* end) TL_EXCLUDES(_mutex);
 
+  // Writes the memtable to a table, after which leveldb removes obsolete files. Fails like compact.
+  bool flush() TL_EXCLUDES(_mutex);
+
  private:
   // False on timeout.
   [[nodiscard]] bool waitForCompaction(size_t bytes) TL_REQUIRES(_mutex);
   [[nodiscard]] leveldb::Status write(leveldb::WriteBatch* batch, bool sync) TL_EXCLUDES(_mutex);
   void wrote(size_t bytes) TL_REQUIRES(_mutex);
-  // Runs on the queue.
-  void flushWhenIdle() TL_EXCLUDES(_mutex);
+  // False when the object ends first.
+  bool waitUntilIdle() TL_EXCLUDES(_mutex);
 
   const Database& _database;
   const std::chrono::milliseconds _idle;

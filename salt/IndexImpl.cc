@@ -48,7 +48,6 @@ bool index::readRecords(TLErrorOut error) {
   if (status.IsIOError()) return false;
   if (!status.ok() || !parseRecord(bytes, &metrics)) return true;
   if (metrics.CodeVersion != CODE_VERSION) return true;
-  if (metrics.Suffixes == 0) _starts.beginEmpty();
   status = read(kOptionsKey, &bytes);
   if (status.IsIOError()) return false;
   TL_ASSERT(status.ok());
@@ -229,18 +228,11 @@ bool index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end)
   return true;
 }
 
-// leveldb removes obsolete files after each flush of the memtable. A compaction of the range after
-// the last key does nothing else.
-void index::removeObsoleteFiles() const {
-  const leveldb::Slice behind("\xFF\xFF", 2);
-  (void)_writer.compact(&behind, &behind);
-}
-
 // Not on the calling thread: it takes as long as a memtable flush, and waits for a running
 // compaction.
 void index::removeObsoleteFilesLater() const {
   (void)_fileCleanup.async([this] {
-    if (!interrupted()) removeObsoleteFiles();
+    if (!interrupted()) (void)_writer.flush();
   });
 }
 

@@ -120,6 +120,9 @@ class index final : public Index {
   // Its thread reads the index.
   [[nodiscard]] SuffixStarts& starts() const { return _starts; }
 
+  // Waits until each zone that is being added can be read.
+  void waitForZoneInHand() const { _zoneWriter.waitForZoneInHand(); }
+
   // State, for one moment.
 
   [[nodiscard]] MetricsBlock counters() const TL_EXCLUDES(_metricsMutex);
@@ -182,7 +185,6 @@ class index final : public Index {
   // Restores everything except the scan counts.
   void restore(const MetricsBlock& before) TL_REQUIRES(_metricsMutex);
   void takeNow(IndexView* view, size_t iteratorCount) const TL_EXCLUDES(_metricsMutex);
-  void removeObsoleteFiles() const;
 
   // Reads options, metrics and deleted documents. False, with an error, when the system fails to
   // read. A missing metrics record leaves the metrics unchanged.
@@ -221,7 +223,7 @@ class index final : public Index {
 
   std::atomic<uint64_t> _compactionsEnded{0};  // on demand
 
-  ZoneWriter _zoneWriter{*this};
+  mutable ZoneWriter _zoneWriter{*this};
   Scanner _scanner{*this};
   mutable MergeScheduler _merges{*this};
   // Removes the files that long reads kept alive.

@@ -104,6 +104,7 @@ std::vector<std::vector<SuffixMeta>> firstOfEach(const std::vector<std::vector<F
 
 void Scanner::learnStarts() const {
   _idx.starts().beginWith([this](const std::function<bool(std::string_view)>& enter) {
+    _idx.waitForZoneInHand();
     const IndexView view(_idx, false);
     bool all = true;
     view.forEachZone([&](uint32_t, uint16_t, std::string_view text) { return all = enter(text); });

@@ -35,6 +35,8 @@ class ZoneWriter {
       TL_EXCLUDES(_writeMutex);
   [[nodiscard]] bool deleteDocs(const std::vector<uint32_t>& docIDs) TL_EXCLUDES(_writeMutex);
 
+  void waitForZoneInHand() TL_EXCLUDES(_writeMutex) { platform::MutexLock lock(_writeMutex); }
+
  private:
   using Clock = std::chrono::steady_clock;
 
