@@ -41,7 +41,9 @@ class Loop {
         _wake(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
         _painter(cli::colorAllowed(options.color, STDOUT_FILENO)),
         _searcher(options, [this] { wake(); }),
-        _loader(options, [this] { wake(); }) {}
+        _loader(options, [this] { wake(); }) {
+    _model.type(options.arguments);
+  }
 
   // Runs until the end. Returns the signal that ended it, or 0.
   int run() {
