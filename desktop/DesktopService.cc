@@ -24,8 +24,6 @@ constexpr const char* kRunner = "org.kde.krunner1";
 // Desktops ask for the metas of the results that they were given last.
 constexpr size_t kMaxRecent = 16;
 
-constexpr uint32_t kUnlocked[] = {0, 3};  // lock states of the device
-
 const platform::Log& log() {
   static const platform::Log handle(platform::kSubsystem, "Desktop");
   return handle;
@@ -88,8 +86,7 @@ const sd_bus_vtable DesktopService::Tables::runner[] = {
 std::unique_ptr<DesktopService> DesktopService::start(platform::RunLoop& loop, TLErrorOut error) {
   std::unique_ptr<DesktopService> service(new DesktopService(loop));
   std::optional<TLError> failure;
-  service->_screen = ScreenLock::follow(
-      loop, false, [] {}, &failure);
+  service->_screen = ScreenLock::follow(loop, false, nullptr, &failure);
   if (failure) log().standard("Only the lock status is followed: {}", failure->message);
   const int result = service->connect();
   if (result >= 0) return service;
@@ -130,8 +127,8 @@ int DesktopService::connect() {
 
 bool DesktopService::isClosed() const {
   const uint32_t state = _lockStatus->DVLGetDeviceLockState(0);
-  const bool locked = state != kUnlocked[0] && state != kUnlocked[1];
-  return locked || (_screen != nullptr && _screen->screen() == Screen::locked);
+  const bool unlocked = state == 0 || state == 3;
+  return !unlocked || (_screen != nullptr && _screen->screen() == Screen::locked);
 }
 
 int DesktopService::search(sd_bus_message* call, Form form, const std::string& words) {

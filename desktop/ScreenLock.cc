@@ -21,6 +21,7 @@ constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
 constexpr const char* kHint = "LockedHint";
 
 constexpr uint64_t kTimeout = 5'000'000;  // of a question, in microseconds
+constexpr int kNoAnswer = -EHOSTUNREACH;
 
 // Reads changed properties up to the hint. Positive if the hint is there.
 int readHint(sd_bus_message* signal, int& locked) {
@@ -49,7 +50,7 @@ std::unique_ptr<ScreenLock> ScreenLock::follow(platform::RunLoop& loop, bool del
   if (result >= 0) result = sd_bus_attach_event(lock->_bus, loop.event(), 0);
   if (result >= 0) result = sd_bus_set_exit_on_disconnect(lock->_bus, 1);
   if (result < 0) {
-    const std::string reason = lock->_failure.empty() ? std::strerror(-result) : lock->_failure;
+    const std::string reason = result == kNoAnswer ? lock->_failure : std::strerror(-result);
     platform::setError(error,
                        {kPOSIXErrorDomain, -result,
                         fmt::format("logind does not answer on the system bus: {}", reason)});
@@ -114,11 +115,11 @@ int ScreenLock::awaitFirstAnswer() {
     if (result == 0) result = sd_bus_wait(_bus, UINT64_MAX);
     if (result == -EINTR) result = 0;
   }
-  return result >= 0 && !_failure.empty() ? -EHOSTUNREACH : result;
+  return result >= 0 && !_failure.empty() ? kNoAnswer : result;
 }
 
 void ScreenLock::findSession() {
-  sd_bus_slot_unref(_sessionCall);
+  _sessionCall = sd_bus_slot_unref(_sessionCall);
   sd_bus_call_method_async(_bus, &_sessionCall, kLogind, kManagerPath, kManager, "GetSession",
                            call<&ScreenLock::takeSession>, this, "s", "auto");
 }
@@ -143,7 +144,7 @@ void ScreenLock::takeSession(sd_bus_message* reply) {
 }
 
 void ScreenLock::askHint() {
-  sd_bus_slot_unref(_hintCall);
+  _hintCall = sd_bus_slot_unref(_hintCall);
   sd_bus_call_method_async(_bus, &_hintCall, kLogind, _session.c_str(), kProperties, "Get",
                            call<&ScreenLock::takeHint>, this, "ss", kSession, kHint);
 }

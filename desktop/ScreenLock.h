@@ -27,7 +27,8 @@ enum class Screen {
 class ScreenLock {
  public:
   // Waits for logind's first answer, a few seconds at most for each question. Later changes call
-  // `changed` in the loop. Null with an error if there is no system bus or no logind.
+  // `changed`, which may be null, in the loop. Null with an error if there is no system bus or no
+  // logind.
   //
   // With `delaySleep`, the device goes to sleep only after `changed` has returned, or logind has
   // lost its patience (InhibitDelayMaxSec in logind.conf).
@@ -80,11 +81,11 @@ class ScreenLock {
   sd_bus* _bus = nullptr;
   sd_bus_slot* _sessionCall = nullptr;  // not null while its reply is awaited
   sd_bus_slot* _hintCall = nullptr;
-  std::function<void()> _changed;  // empty until the first answer
-  std::string _failure;            // of the last call
-  std::string _logind;             // its unique name on the bus
-  std::string _session;            // its object path; empty for none
-  bool _locked = false;            // by signal or hint
+  std::function<void()> _changed;      // empty until the first answer
+  std::string _failure = "no answer";  // to the last call; empty if there was one
+  std::string _logind;                 // its unique name on the bus
+  std::string _session;                // its object path; empty for none
+  bool _locked = false;                // by signal or hint
   bool _sleeping = false;
   bool _delaysSleep = false;
   platform::FileDescriptor _delay;  // while it is open, the device does not go to sleep
