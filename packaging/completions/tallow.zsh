@@ -8,6 +8,7 @@ commands=(
   'watch:keep the index in step all the time'
   'status:show mailboxes and index'
   'search:search for messages'
+  'screen:search as you type, on a terminal'
   'explain:search and show how the query is understood'
   'delete:delete messages and folders from the index'
   'reset:delete everything that is indexed'
