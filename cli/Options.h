@@ -39,7 +39,8 @@ enum class Command {
   show,
   address,
   save,
-  screen
+  screen,
+  mcp  // tools for a language model
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };
@@ -68,7 +69,8 @@ struct Options {
   bool verbose = false;
 
   bool threads = false;  // results by conversation
-  std::string folder;    // only mail in this folder, in addition to words; empty for all
+  // Only mail in one of these folders, in addition to words; empty for all.
+  std::vector<std::string> folders;
 
   // For show.
   bool raw = false;

@@ -3,9 +3,8 @@
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <array>
-#include <set>
 
+#include "querylang/Expressions.h"
 #include "querylang/TLQueryAdditions.h"
 #include "records/TLParamsManager.h"
 
@@ -17,49 +16,13 @@ constexpr const char* kErrorDomain = "tallow";
 constexpr int kUnreadable = 1;
 constexpr size_t kShownText = 60;
 
-// The attributes that free text is searched in. More than four, so that the optimiser recognises
-// free text.
-constexpr std::array<const char*, 6> kTextAttributes{
-    "kTLItemSubject",    "kTLItemTextContent",
-    "kTLItemAuthors",    "kTLItemAuthorEmailAddresses",
-    "kTLItemRecipients", "kTLItemRecipientEmailAddresses"};
-
 std::string joinedWords(const std::vector<std::string>& arguments) {
   return fmt::format("{}", fmt::join(arguments, " "));
-}
-
-// The optimiser removes one asterisk at each end, so the user's own asterisks are kept.
-std::string disjunctionOf(const std::string& words) {
-  std::string out = "(";
-  for (const char* const attribute : kTextAttributes) {
-    if (out.size() > 1) out += " || ";
-    out += fmt::format("{} == \"*{}*\"", attribute, sq::escaped(words));
-  }
-  return out + ')';
 }
 
 std::string shown(std::string_view text) {
   if (text.size() <= kShownText) return std::string(text);
   return platform::toUTF8(platform::fromUTF8(text.substr(0, kShownText))) + "...";
-}
-
-void remarkUnknownNames(const sq::node& tree, std::vector<std::string>& remarks) {
-  std::set<std::string> unknown;
-  std::vector<const sq::node*> open{&tree};
-  while (!open.empty()) {
-    const sq::node& node = *open.back();
-    open.pop_back();
-    if (node.left == nullptr) continue;
-    if (node.type == sq::kTokenAnd || node.type == sq::kTokenOr) {
-      open.push_back(node.right.get());
-      open.push_back(node.left.get());
-    } else if (!TLAttributeKeyForQueryName(node.left->text)) {
-      unknown.insert(shown(node.left->text));
-    }
-  }
-  for (const std::string& name : unknown) {
-    remarks.push_back(fmt::format("there is no attribute {}", name));
-  }
 }
 
 // Parses an expression only to report what is wrong with it. Null after an error.
@@ -80,7 +43,9 @@ sq::Tree checked(const std::string& expression, std::vector<std::string>& remark
     remarks.push_back(
         fmt::format("the expression ends before \"{}\", the rest is ignored", shown(rest)));
   }
-  remarkUnknownNames(*tree, remarks);
+  for (const std::string& name : sq::unknownAttributes(*tree)) {
+    remarks.push_back(fmt::format("there is no attribute {}", shown(name)));
+  }
   return tree;
 }
 
@@ -147,14 +112,18 @@ void readTyped(QueryInput& input) {
   input.main = {input.words, usersyntax::printed(input.typed.root), nullptr, nullptr};
 }
 
-// Restricts the typed query to one folder.
-void limitToFolder(const std::string& folder, usersyntax::Query& typed) {
-  usersyntax::Node place;
-  place.kind = usersyntax::Kind::text;
-  place.field = usersyntax::Field::folder;
-  place.text = folder;
+// Restricts the typed query to mail in one of the folders.
+void limitToFolders(const std::vector<std::string>& folders, usersyntax::Query& typed) {
+  usersyntax::Node places;
+  places.kind = usersyntax::Kind::disjunction;
+  for (const std::string& folder : folders) {
+    usersyntax::Node& place = places.children.emplace_back();
+    place.kind = usersyntax::Kind::text;
+    place.field = usersyntax::Field::folder;
+    place.text = folder;
+  }
   usersyntax::Node both;
-  both.children = {std::move(typed.root), std::move(place)};
+  both.children = {std::move(typed.root), std::move(places)};
   typed.root = std::move(both);
   typed.plain = false;
 }
@@ -200,9 +169,10 @@ std::optional<QueryInput> queryInput(const Options& options, double now, TLError
   input.words = joinedWords(options.arguments);
   if (options.query.empty()) input.typed = usersyntax::parse(input.words, now);
   input.remarks = input.typed.remarks;
-  if (!options.folder.empty()) limitToFolder(options.folder, input.typed);
+  if (!options.folders.empty()) limitToFolders(options.folders, input.typed);
   const bool typed = !input.typed.plain;
-  const std::string expression = options.query.empty() ? disjunctionOf(input.words) : options.query;
+  const std::string expression =
+      options.query.empty() ? sq::expressionForWords(input.words) : options.query;
   if (typed) {
     readTyped(input);
   } else if (!readMain(expression, input, error)) {

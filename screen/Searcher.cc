@@ -51,7 +51,7 @@ Found Searcher::run(const Search& search, const std::stop_token& stop) {
   Found found{search};
   cli::Options options = _options;
   options.arguments = cli::argumentsOf(search.words);
-  options.folder = search.folder;
+  if (!search.folder.empty()) options.folders = {search.folder};
   options.sort = search.order;
   options.threads = search.threads;
   options.limit = static_cast<int64_t>(search.limit);
