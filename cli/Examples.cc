@@ -57,6 +57,7 @@ constexpr Row kRows[] = {
      "  tallow save bills subject:invoice OR subject:bill\n"
      "  tallow search @bills date:2010..\n"
      "  tallow save --delete bills"},
+    {Command::mcp, "  tallow mcp --folder ~/Mail/lists --folder ~/Mail/work"},
 };
 
 }  // namespace

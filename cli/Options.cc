@@ -60,6 +60,8 @@ constexpr CommandRow kCommands[] = {
      true},
     {Command::save, "save", "Save a search as @NAME, or list the saved searches", "NAME WORDS",
      false},
+    {Command::mcp, "mcp", "Let a language model search and read the mail of some folders", nullptr,
+     false},
 };
 
 const std::map<std::string, OutputFormat> kFormats{{"text", OutputFormat::text},
@@ -206,6 +208,11 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   }
   if (row.command == Command::save) {
     sub->add_flag("--delete", options.removeSaved, "Delete the saved search with this name");
+  }
+  if (row.command == Command::mcp) {
+    sub->add_option("--folder", options.folders, "Folder whose mail may be shown; may be repeated")
+        ->allow_extra_args(false)
+        ->type_name("DIR");
   }
   sub->footer(examplesOf(row.command));
   sub->callback([&options, command = row.command] { options.command = command; });

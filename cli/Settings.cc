@@ -30,13 +30,8 @@ class Reader {
  public:
   Reader(Settings& settings, const std::string& home) : _settings(settings), _home(home) {}
 
-  bool readRoots(const toml::node& value) {
-    return readTexts(value, [this](const std::string& text) {
-      const auto path = absolute(text);
-      if (path) _settings.roots.push_back(*path);
-      return path.has_value();
-    });
-  }
+  bool readRoots(const toml::node& value) { return readPaths(value, _settings.roots); }
+  bool readMCPFolders(const toml::node& value) { return readPaths(value, _settings.mcpFolders); }
   bool readExcluded(const toml::node& value) {
     return readTexts(value, [this](const std::string& text) {
       const auto path = absolute(text);
@@ -98,6 +93,14 @@ class Reader {
     return true;
   }
 
+  bool readPaths(const toml::node& value, std::vector<std::string>& paths) const {
+    return readTexts(value, [&](const std::string& text) {
+      const auto path = absolute(text);
+      if (path) paths.push_back(*path);
+      return path.has_value();
+    });
+  }
+
   [[nodiscard]] std::optional<std::string> absolute(const std::string& text) const {
     if (text.starts_with('/')) return text;
     if (text == "~") return _home;
@@ -128,7 +131,7 @@ struct Key {
   const char* allowed;
 };
 
-constexpr std::array<Key, 7> kKeys{{
+constexpr std::array<Key, 8> kKeys{{
     {"roots", &Reader::readRoots, "a list of paths, each from / or ~/ on"},
     {"exclude", &Reader::readExcluded,
      "a list of folders, from / or ~/ on, or below each root: [\".Trash\", \"~/Mail/old\"]"},
@@ -140,6 +143,7 @@ constexpr std::array<Key, 7> kKeys{{
     {"on_battery", &Reader::readOnBattery, "true or false"},
     {"desktop_search", &Reader::readDesktopSearch, "true or false"},
     {"desktop_class", &Reader::readDesktopClass, "the name of a protection class"},
+    {"mcp_folders", &Reader::readMCPFolders, "a list of paths, each from / or ~/ on"},
 }};
 
 std::string quoted(std::string_view text) {

@@ -9,7 +9,8 @@
 
 namespace cli {
 
-// The user's settings from config.toml, for `sync`, `watch` and the desktop. Paths are absolute.
+// The user's settings from config.toml, for `sync`, `watch`, the desktop and `mcp`. Paths are
+// absolute.
 struct Settings {
   std::vector<std::string> roots;
   std::vector<std::string> excluded;           // directories
@@ -19,6 +20,7 @@ struct Settings {
   bool onBattery = false;
   bool desktopSearch = false;
   std::string desktopClass = "default";  // the protection class that the desktop searches
+  std::vector<std::string> mcpFolders;  // whose mail `mcp` may show
 };
 
 // tallow/config.toml in $XDG_CONFIG_HOME, by default ~/.config.

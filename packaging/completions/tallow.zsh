@@ -23,6 +23,7 @@ commands=(
   'show:show a message for reading'
   'address:complete names and addresses'
   'save:save a search under a name'
+  'mcp:let a language model search and read mail'
   'help:show how a command is used'
 )
 options=(
@@ -45,6 +46,7 @@ options=(
   '--force[replace the file]'
   '--mutt[begin with the line that mutt skips]'
   '--delete[forget a saved search]'
+  '*--folder=[folder whose mail mcp may show]:directory:_files'
   '--print0[end each entry with NUL]'
   '*--filter=[only what it holds for]:expression:'
   '--param=[parameters of this search]:KEY=VALUE,...:'

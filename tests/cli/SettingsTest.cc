@@ -36,6 +36,7 @@ largest_mail = "20 MB"
 on_battery = true
 desktop_search = true
 desktop_class = "work"
+mcp_folders = ["~/Mail/lists"]
 [class]
 "~/Mail/work" = "work"
 )");
@@ -49,6 +50,7 @@ desktop_class = "work"
   EXPECT_EQ(settings.desktopClass, "work");
   EXPECT_FALSE(settingsOf("").desktopSearch);
   EXPECT_EQ(settingsOf("").desktopClass, "default");
+  EXPECT_THAT(settings.mcpFolders, ElementsAre("/home/mara/Mail/lists"));
   EXPECT_EQ(settingsOf("largest_mail = 5000").largestMail, 5000U);
   EXPECT_EQ(settingsOf("largest_mail = '500KB'").largestMail, 500'000U);
   EXPECT_EQ(settingsOf("").largestMail, 0U);
@@ -59,7 +61,7 @@ TEST(Settings, ErrorsNameFileLineKeyAndAllowedValues) {
             "config.toml:2: there is no key \"rots\"; did you mean \"roots\"?");
   EXPECT_EQ(complaintOf("colour = 1"),
             "config.toml:1: there is no key \"colour\"; the keys are roots, exclude, class, "
-            "largest_mail, on_battery, desktop_search, desktop_class");
+            "largest_mail, on_battery, desktop_search, desktop_class, mcp_folders");
   EXPECT_EQ(complaintOf("# a\n\non_battery = \"yes\""),
             "config.toml:3: on_battery takes true or false");
   for (const char* const bad :
