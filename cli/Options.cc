@@ -267,7 +267,8 @@ std::string misuseText(const CLI::App* app, const CLI::Error& error) {
 // For the command `help`: the help of the named command, or the list of all commands.
 ExitStatus showHelp(CLI::App& app, const std::string& command) {
   if (command.empty()) {
-    std::cout << app.help();
+    // app.help() would be that of `help`.
+    std::cout << app.get_formatter()->make_help(&app, app.get_name(), CLI::AppFormatMode::Normal);
     return ExitStatus::done;
   }
   const auto isMeant = [&command](const CLI::App* sub) { return sub->get_name() == command; };
