@@ -2,13 +2,18 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <nlohmann/json.hpp>
+#include <random>
 #include <thread>
 
 #include "mcp/FolderLimit.h"
 #include "mcp/LineInput.h"
+#include "mcp/Session.h"
 #include "mcp/ShownText.h"
+#include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
 // The parts of `tallow mcp` that keep its limits.
@@ -109,4 +114,41 @@ TEST(McpListedMailTest, ForgetsTheOldest) {
   EXPECT_FALSE(listed.holds("0"));
   EXPECT_TRUE(listed.holds("1"));
   EXPECT_TRUE(listed.holds(std::to_string(mcp::ListedMail::kMaxListed)));
+}
+
+// Whatever a client sends, the reply is one line of JSON, or nothing, and the session goes on.
+TEST(McpSessionTest, DamagedMessagesEndNothing) {
+  const testsupport::TemporaryDirectory directory;
+  setenv("XDG_STATE_HOME", directory.path().c_str(), 1);
+  cli::Options options;
+  options.runtimeDirectory = directory / "run";
+  mcp::MailTools tools(options,
+                       std::get<mcp::FolderLimit>(mcp::FolderLimit::of({directory.path()})));
+  mcp::Session session(tools, "0");
+  const std::string messages[] = {
+      R"({"jsonrpc":"2.0","id":1,"method":"initialize","params":{"protocolVersion":"2025-03-26"}})",
+      R"([{"jsonrpc":"2.0","id":2,"method":"ping"},{"jsonrpc":"2.0","id":3,"method":"tools/list"}])",
+      R"({"jsonrpc":"2.0","id":"4","method":"tools/call","params":{"name":"search","arguments":)"
+      R"({"query":"from:mara \"a b\" OR (c -d","limit":5}}})",
+      R"({"jsonrpc":"2.0","id":5,"method":"tools/call","params":{"name":"show","arguments":)"
+      R"({"id":"file/a%2Fb","from":7}}})",
+      R"({"jsonrpc":"2.0","id":6,"method":"tools/call","params":{"name":"status"}})"};
+  std::mt19937 random(testsupport::firstSeed());
+  const auto below = [&random](size_t end) { return random() % end; };
+  for (int round = 0; round < 5000; ++round) {
+    std::string line = messages[below(std::size(messages))];
+    for (size_t damage = below(4); damage > 0; --damage) {
+      const size_t at = below(line.size());
+      if (below(2) == 0) {
+        line[at] = static_cast<char>(below(256));
+      } else {
+        line.insert(at, line.substr(below(line.size()), below(20)));
+      }
+    }
+    const std::string reply = session.answer(line);
+    EXPECT_EQ(reply.find('\n'), std::string::npos) << line;
+    EXPECT_TRUE(reply.empty() || nlohmann::json::accept(reply)) << line << '\n' << reply;
+  }
+  EXPECT_EQ(session.answer(R"({"jsonrpc":"2.0","id":7,"method":"ping"})"),
+            R"({"jsonrpc":"2.0","id":7,"result":{}})");
 }
