@@ -69,6 +69,7 @@ class PackageTest : public testing::Test {
 
 }  // namespace
 
+// The list has the types of a 64-bit system.
 TEST_F(PackageTest, ExportsNothingButTheInterface) {
   ASSERT_EQ(run("nm --dynamic --defined-only --demangle " + libraries +
                 "/libtallow.so | sed 's/^[0-9a-f]* //' | LC_ALL=C sort -u"),

@@ -37,6 +37,14 @@ class InstalledTest(DaemonTest):
         self.assertEqual(with_daemon.stdout, "example/1: Harbour fees for March\n")
 
 
+class VersionTest(unittest.TestCase):
+    def test_the_package_has_the_version_of_the_project(self) -> None:
+        project = (SOURCE / "CMakeLists.txt").read_text()
+        (version,) = re.findall(r"project\(tallowsearchd VERSION ([0-9.]+)", project)
+        package = (SOURCE / "python" / "pyproject.toml").read_text()
+        self.assertIn(f'version = "{version}"', package)
+
+
 class TypesTest(unittest.TestCase):
     def test_type_hints_are_consistent(self) -> None:
         if importlib.util.find_spec("mypy") is None and os.environ.get("CI") != "true":
