@@ -58,9 +58,7 @@ struct Client::Impl {
            isSendable(protectionClass, "the protection class", error);
   }
 
-  // Not part of the interface, although its name looks like it to the linker.
-  [[nodiscard, gnu::visibility("hidden")]] static std::vector<client::EncodedItem> encoded(
-      std::span<const Item> items) {
+  [[nodiscard]] static std::vector<client::EncodedItem> encoded(std::span<const Item> items) {
     std::vector<client::EncodedItem> list;
     list.reserve(items.size());
     for (const Item& item : items) list.push_back(client::encode(*item._impl->record));
