@@ -20,7 +20,7 @@ struct Settings {
   bool onBattery = false;
   bool desktopSearch = false;
   std::string desktopClass = "default";  // the protection class that the desktop searches
-  std::vector<std::string> mcpFolders;  // whose mail `mcp` may show
+  std::vector<std::string> mcpFolders;   // whose mail `mcp` may show
 };
 
 // tallow/config.toml in $XDG_CONFIG_HOME, by default ~/.config.
