@@ -160,6 +160,9 @@ void addResultOptions(CLI::App& sub, Options& options) {
       ->check(wholeNumber(0))
       ->type_name("N");
   sub.add_flag("--count", options.count, "Show only how many results there are");
+  sub.add_option("--maildir", options.maildir,
+                 "Make this Maildir of links to the results; without WORDS, empty it")
+      ->type_name("DIR");
   sub.add_flag("--threads", options.threads, "A line for each conversation, with its results");
   sub.add_flag("--print0", options.print0, "With files and message-ids: end each entry with NUL");
 }
@@ -259,6 +262,7 @@ std::string misuseText(const CLI::App* app, const CLI::Error& error) {
 // For the command `help`: the help of the named command, or the list of all commands.
 ExitStatus showHelp(CLI::App& app, const std::string& command) {
   if (command.empty()) {
+    app.clear();  // otherwise this is the help of the command that was given
     std::cout << app.help();
     return ExitStatus::done;
   }
@@ -301,6 +305,10 @@ const char* misuse(const Options& options) {
   }
   if (options.command == Command::show) return misuseOfShow(options);
   if (!isSearch(options.command)) return nullptr;
+  if (!options.maildir.empty() && (list || options.count || options.threads)) {
+    return "--maildir shows no list; it goes with --format=text or json only";
+  }
+  if (emptiesMaildir(options)) return nullptr;
   if (options.arguments.empty() == options.query.empty()) {
     return "a search is for WORDS, or for the expression of --query";
   }
@@ -330,6 +338,8 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
     app.parse(std::move(arguments));
     restoreWords(options.arguments);
     options.classGiven = app.count("--class") > 0;
+    // A folder is for all that is found.
+    if (!options.maildir.empty() && app.count("--limit") == 0) options.limit = 0;
     if (app.get_subcommands().empty()) options.command = Command::screen;
   } catch (const CLI::ParseError& error) {
     const std::string word = unknownCommand(app);

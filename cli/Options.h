@@ -68,6 +68,7 @@ struct Options {
   bool verbose = false;
 
   bool threads = false;  // results by conversation
+  std::string maildir;   // the folder for links to the results; empty for none
   std::string folder;    // only mail in this folder, in addition to words; empty for all
 
   // For show.
@@ -92,6 +93,11 @@ struct Options {
     return std::chrono::milliseconds(static_cast<int64_t>(waitSeconds * 1000));
   }
 };
+
+// Whether a search is only to remove the links of an earlier one.
+[[nodiscard]] inline bool emptiesMaildir(const Options& options) {
+  return !options.maildir.empty() && options.arguments.empty() && options.query.empty();
+}
 
 // Parses the command line. Without a command on a terminal, the command is Command::screen. Nullopt
 // if there is nothing more to do, after --help, --version or incorrect usage; the text has then
