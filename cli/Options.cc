@@ -196,6 +196,10 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (isSearch(row.command)) addQueryOptions(*sub, options);
   if (row.command == Command::search) addResultOptions(*sub, options);
   if (row.command == Command::sync) addSyncOptions(*sub, options);
+  if (row.command == Command::status) {
+    sub->add_option("--html", options.page, "Write it as a page for browsers, with charts")
+        ->type_name("FILE");
+  }
   if (row.command == Command::purge) {
     sub->add_flag("-n,--dry-run", options.dryRun, "Only show how much space it would free");
   }
@@ -302,6 +306,9 @@ const char* misuse(const Options& options) {
   if (options.print0 && !list) return "--print0 goes with --format=files or --format=message-ids";
   if (options.format == OutputFormat::json && options.command == Command::dump) {
     return "a dump is text only";
+  }
+  if (!options.page.empty() && options.format != OutputFormat::text) {
+    return "--html and --format are two forms of one output";
   }
   if (options.command == Command::show) return misuseOfShow(options);
   if (!isSearch(options.command)) return nullptr;

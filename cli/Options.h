@@ -81,6 +81,9 @@ struct Options {
   bool mutt = false;
   bool removeSaved = false;
 
+  // For status.
+  std::string page;  // the file for the HTML page
+
   // For sync.
   bool dryRun = false;
   bool pruneMissing = false;

@@ -303,6 +303,28 @@ TEST_F(EverydayTest, LinksTheResultsForMailPrograms) {
   EXPECT_THAT(errors, HasSubstr("is not from a search"));
 }
 
+TEST_F(EverydayTest, WritesTheStatusAsAPage) {
+  ASSERT_EQ(run("sync " + mail), 0) << errors;
+  EXPECT_EQ(run("status --html page.html", "STATE_DIRECTORY=" + directory / "state"), 0) << errors;
+  EXPECT_EQ(output, "wrote page.html\n");
+  const std::string page = read("page.html");
+  for (const std::string& text :
+       {"<span class=\"path\">" + mail + "/family</span><span class=\"count\">10</span>",
+        std::string("<title>2024-02: "), std::string("A sync adds one entry a day"),
+        std::string("device unlocked")}) {
+    EXPECT_THAT(page, HasSubstr(text));
+  }
+  // The former page is replaced; nothing else is.
+  EXPECT_EQ(run("status --html page.html"), 0);
+  fs::create_symlink("page.html", directory / "link");
+  EXPECT_EQ(run("status --html link"), 2);
+  EXPECT_THAT(errors, HasSubstr("link: this is not a plain file, and stays"));
+  EXPECT_EQ(run("status --html ."), 2);
+  EXPECT_EQ(run("status --html none/page.html"), 2);
+  EXPECT_EQ(run("status --html page.html --format=json"), 2);
+  EXPECT_NE(std::system(("ls " + directory / "page.html.* 2>/dev/null").c_str()), 0);
+}
+
 // What `tallow help` lists is in the manual and in the completions of both shells.
 TEST_F(EverydayTest, OptionsAreDocumented) {
   const auto words = [](const std::string& text, const std::regex& pattern) {
@@ -317,7 +339,7 @@ TEST_F(EverydayTest, OptionsAreDocumented) {
     ASSERT_EQ(run("help " + command), 0);
     options.merge(words(output, std::regex("\n  (?:-.,)?(--[a-z0-9-]+)")));
   }
-  EXPECT_THAT(options, testing::IsSupersetOf({"--threads", "--class", "--output"}));
+  EXPECT_THAT(options, testing::IsSupersetOf({"--threads", "--class", "--output", "--html"}));
   for (const char* const page :
        {"man/tallow.1", "completions/tallow.bash", "completions/tallow.zsh"}) {
     std::string text =
