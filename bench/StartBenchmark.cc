@@ -18,8 +18,8 @@ namespace {
 
 using Queries = std::vector<std::string>;
 
-// The threads of queues end after two idle seconds.
-constexpr std::chrono::seconds kUntilIdle(5);
+// The threads of queues end after two idle seconds; a memtable is flushed after ten.
+constexpr std::chrono::seconds kUntilIdle(15);
 
 // Evicts the files in `path` from the page cache. Each is synced first, because the kernel keeps
 // pages that are not on disk yet.

@@ -1,7 +1,5 @@
 #include "salt/Database.h"
 
-#include <leveldb/cache.h>
-
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
@@ -11,27 +9,22 @@
 
 #include "platform/CrashNote.h"
 #include "platform/Files.h"
+#include "platform/Memory.h"
 
 namespace salt {
 
 namespace {
 
 constexpr size_t kWriteBufferBytes = 6 * 1024 * 1024;  // leveldb flushes a memtable of this size
-constexpr size_t kBlockCacheBytes = 8 * 1024 * 1024;   // of all databases together
+constexpr size_t kBlockCacheBytes = 1024 * 1024;
 constexpr size_t kBlockBytes = 32 * 1024;
 constexpr size_t kFileBytes = 4 * 1024 * 1024;
 constexpr size_t kLogLineBytes = 100;
 constexpr uint64_t kCompactionRoom = 128 * 1024 * 1024;  // more than one compaction needs at a time
 // A batch takes up to three times its size in a memtable.
 constexpr size_t kBatchesBesideCompaction = kWriteBufferBytes / 4;
-constexpr std::chrono::seconds kMaxWait{1};  // with locks held that searches need
-
-// One for the process, so that its size does not grow with the number of classes; never destroyed.
-// A search reads some hundred blocks, most of which the search for the next letter reads again.
-leveldb::Cache* blockCache() {
-  static leveldb::Cache* const cache = leveldb::NewLRUCache(kBlockCacheBytes);
-  return cache;
-}
+constexpr size_t kSmallMemtable = 128 * 1024;  // as bytes of batches; not flushed
+constexpr std::chrono::seconds kMaxWait{1};    // with locks held that searches need
 
 leveldb::Status open(const leveldb::Options& options, const std::string& path,
                      std::unique_ptr<leveldb::DB>* db) {
@@ -62,6 +55,14 @@ void LeveldbLogger::Logv(const char* format, va_list arguments) {
   char line[kLogLineBytes];
   std::vsnprintf(line, sizeof line, format, arguments);
   log.debug("{}", static_cast<const char*>(line));
+}
+
+BatchWriter::~BatchWriter() {
+  {
+    platform::MutexLock lock(_mutex);
+    _ending = true;
+  }
+  _ended.notify_all();
 }
 
 bool BatchWriter::compact(const leveldb::Slice* begin, const leveldb::Slice* end) {
@@ -114,7 +115,34 @@ leveldb::Status BatchWriter::write(leveldb::WriteBatch* batch, bool sync) {
   options.sync = sync;
   status = _database.db->Write(options, batch);
   _logTorn = !status.ok();
+  wrote(bytes);
   return status;
+}
+
+// A compaction of the range after the last key flushes the memtable and does nothing else.
+bool BatchWriter::flush() {
+  const leveldb::Slice behind("\xFF\xFF", 2);
+  return compact(&behind, &behind);
+}
+
+void BatchWriter::wrote(size_t bytes) {
+  _unflushed += bytes;
+  _lastWrite = std::chrono::steady_clock::now();
+  if (_flushPlanned || _unflushed < kSmallMemtable) return;
+  // If no thread is available, the next write tries again.
+  _flushPlanned = _flushing.async([this] {
+    if (waitUntilIdle() && flush()) platform::returnFreeMemory();
+  });
+}
+
+bool BatchWriter::waitUntilIdle() {
+  platform::MutexLock lock(_mutex);
+  while (!_ending && _lastWrite + _idle > std::chrono::steady_clock::now()) {
+    _ended.wait_until(_mutex, _lastWrite + _idle);
+  }
+  _flushPlanned = false;
+  _unflushed = 0;
+  return !_ending;
 }
 
 // leveldb passes on the text of an errno but not its number. All of its I/O errors come from the
@@ -134,13 +162,14 @@ Database openDatabase(const std::string& path, OpenMode mode, leveldb::Env* env)
   result.path = path;
   result.comparator = std::make_unique<BytewiseComparator>();
   result.logger = std::make_unique<LeveldbLogger>();
+  result.cache.reset(leveldb::NewLRUCache(kBlockCacheBytes));
   result.env = std::make_unique<OrderedSyncEnv>(path, env);
   const platform::CrashNote note(result.env->crashNotes());
   leveldb::Options options;
   options.env = result.env.get();
   options.comparator = result.comparator.get();
   options.write_buffer_size = kWriteBufferBytes;
-  options.block_cache = blockCache();
+  options.block_cache = result.cache.get();
   options.block_size = kBlockBytes;
   options.max_file_size = kFileBytes;
   options.reuse_logs = true;

@@ -5,6 +5,8 @@
 #include <cstring>
 #include <ctime>
 #include <sstream>
+#include <system_error>
+#include <thread>
 
 #include "platform/Assert.h"
 
@@ -31,11 +33,7 @@ bool parseRecord(const std::string& bytes, Record* record) {
 }  // namespace
 
 index::index(Database opened)
-    : _database(std::move(opened)),
-      _writer(_database),
-      db(_database.db.get()),
-      _batch(std::in_place),
-      _deleted(std::make_shared<const DocSet>()) {}
+    : _database(std::move(opened)), _writer(_database), db(_database.db.get()) {}
 
 // Damaged records end the process; failures of the system to read them do not.
 bool index::readRecords(TLErrorOut error) {
@@ -50,7 +48,6 @@ bool index::readRecords(TLErrorOut error) {
   if (status.IsIOError()) return false;
   if (!status.ok() || !parseRecord(bytes, &metrics)) return true;
   if (metrics.CodeVersion != CODE_VERSION) return true;
-  if (metrics.Suffixes == 0) _starts.beginEmpty();
   status = read(kOptionsKey, &bytes);
   if (status.IsIOError()) return false;
   TL_ASSERT(status.ok());
@@ -190,9 +187,33 @@ std::string index::GetSuffixText(const SuffixMeta& meta) const {
   return std::string(fullText(meta, leveldb::ReadOptions(), &zoneText, &readable));
 }
 
+Index::MetricsBlock index::counters() const {
+  platform::MutexLock lock(_metricsMutex);
+  return metrics;
+}
+
 std::shared_ptr<const DocSet> index::deletedDocs() const {
   platform::MutexLock lock(_metricsMutex);
   return _deleted;
+}
+
+std::shared_ptr<const ShardPostings> index::postings() const {
+  platform::MutexLock lock(_metricsMutex);
+  return _postings;
+}
+
+bool index::AddZone(uint32_t docID, uint16_t zoneID, std::string_view text,
+                    std::vector<uint32_t>& offsets, bool merge) {
+  const auto aftermath = _zoneWriter.addZone(docID, zoneID, text, offsets, merge);
+  if (!aftermath) return false;
+  try {
+    if (aftermath->vacuumDue) _merges.mergeIfDue();
+  } catch (const std::system_error& error) {
+    // The zone is stored; the next one tries again.
+    Log.error("Error starting vacuum: {}", error.what());
+  }
+  if (aftermath->delay.count() != 0) std::this_thread::sleep_for(aftermath->delay);
+  return true;
 }
 
 bool index::Sync() {
@@ -201,35 +222,18 @@ bool index::Sync() {
   return status.ok();
 }
 
-bool index::Compact() {
-  _schedule.waitForMerge();
-  if (interrupted()) return true;
-  const Activity::Work compaction(_schedule.maintenance());
-  const bool done = compactRange(nullptr, nullptr);
-  _database.env->waitForDisk();
-  if (done) makeMissingPostings();
-  return done;
-}
-
 bool index::compactRange(const leveldb::Slice* begin, const leveldb::Slice* end) {
   if (!_writer.compact(begin, end)) return false;
   ++_compactionsEnded;
   return true;
 }
 
-// leveldb removes obsolete files after each flush of the memtable. A compaction of the range after
-// the last key does nothing else.
-void index::removeObsoleteFiles() const {
-  const leveldb::Slice behind("\xFF\xFF", 2);
-  (void)_writer.compact(&behind, &behind);
-}
-
-void index::WaitForMaintenance() {
-  _schedule.waitForMaintenance();
-}
-
-void index::Interrupt() {
-  _schedule.interrupt();
+// Not on the calling thread: it takes as long as a memtable flush, and waits for a running
+// compaction.
+void index::removeObsoleteFilesLater() const {
+  (void)_fileCleanup.async([this] {
+    if (!interrupted()) (void)_writer.flush();
+  });
 }
 
 Index::Metrics index::GetMetrics() const {
@@ -238,7 +242,7 @@ Index::Metrics index::GetMetrics() const {
   result.Docs = result.Zones = result.TextBytes = 0;
   result.DeletedDocs = view.deleted->size();
   uint32_t previous = 0;
-  forEachZone(view, [&](uint32_t docID, uint16_t zoneID, std::string_view text) {
+  view.forEachZone([&](uint32_t docID, uint16_t zoneID, std::string_view text) {
     if (docID != previous) ++result.Docs;
     previous = docID;
     ++result.ZoneCounts[zoneID];
@@ -263,6 +267,33 @@ void putMetrics(const Index::MetricsBlock& metrics, leveldb::WriteBatch* batch) 
   batch->Put(kMetricsKey, {reinterpret_cast<const char*>(&metrics), sizeof metrics});
 }
 
+bool index::commitMerge(leveldb::WriteBatch* batch, uint64_t hotMerged, int64_t pageDelta) {
+  platform::MutexLock lock(_commitMutex);
+  return commitLocked(batch, true, [&](MetricsBlock& counters) {
+    if (counters.LastShardVacuumed == counters.Shards) counters.LastShardSuffixes += hotMerged;
+    counters.HotSuffixes -= std::min(hotMerged, counters.HotSuffixes);
+    counters.Pages += static_cast<uint64_t>(pageDelta);
+  });
+}
+
+bool index::commitDeleted(leveldb::WriteBatch* batch, DocSet deleted) {
+  if (!write(batch)) return false;
+  platform::MutexLock lock(_metricsMutex);
+  _deleted = std::make_shared<const DocSet>(std::move(deleted));
+  ++_pageGeneration;
+  return true;
+}
+
+void index::countScan(std::chrono::nanoseconds time, const Scanner::Counts& counts) const {
+  platform::MutexLock lock(_metricsMutex);
+  metrics.Scans += 1;
+  metrics.ScanSeconds += static_cast<double>(time.count()) / 1000000000;
+  metrics.ScanResults += counts.results;
+  metrics.ScanTextFetches += counts.fetches;
+  metrics.ScanHotReads += counts.hotReads;
+  metrics.ScanPageReads += counts.pageReads;
+}
+
 bool index::write(leveldb::WriteBatch* batch) {
   const leveldb::Status status = _writer.write(batch);
   batch->Clear();
@@ -281,42 +312,20 @@ void index::restore(const MetricsBlock& before) {
   static_cast<MetricsBlock&>(metrics) = block;
 }
 
-IndexView::IndexView(const index& owner, bool fillCache, size_t iteratorCount)
-    : idx(owner),
-      options(readOptions(fillCache)),
-      _compactionsEnded(fillCache ? 0 : owner._compactionsEnded.load()),
-      _note(owner.crashNotes()) {
-  if (fillCache) {
-    take(iteratorCount);
-  } else {
-    platform::MutexLock lock(owner._commitMutex);
-    take(iteratorCount);
-  }
+void index::take(IndexView* view, size_t iteratorCount, bool amidBatches) const {
+  if (amidBatches) return takeNow(view, iteratorCount);
+  platform::MutexLock lock(_commitMutex);
+  takeNow(view, iteratorCount);
 }
 
-// A compaction on demand, which may be the last work for a long time, does not remove files that an
-// open iterator reads. Scans are too short to matter.
-IndexView::~IndexView() {
-  iterators.clear();
-  if (options.fill_cache || idx._compactionsEnded == _compactionsEnded) return;
-  // Not on this thread: it takes as long as a memtable flush, and waits for a running compaction.
-  (void)idx._fileCleanup.async([&owner = idx] {
-    if (!owner.interrupted()) owner.removeObsoleteFiles();
-  });
-}
-
-void IndexView::take(size_t iteratorCount) {
-  platform::MutexLock lock(idx._metricsMutex);
-  iterators.resize(idx._suffixesMove ? 1 : iteratorCount);
-  for (auto& iterator : iterators) iterator.reset(idx.db->NewIterator(options));
-  metrics = idx.metrics;
-  deleted = idx._deleted;
-  postings = idx._postings;
-  pageGeneration = idx._suffixesMove ? 0 : idx._pageGeneration;
-}
-
-uint8_t IndexView::lastShard() const {
-  return static_cast<uint8_t>(std::min<uint64_t>(metrics.Shards, kMaxShardNumber));
+void index::takeNow(IndexView* view, size_t iteratorCount) const {
+  platform::MutexLock lock(_metricsMutex);
+  view->iterators.resize(_suffixesMove ? 1 : iteratorCount);
+  for (auto& iterator : view->iterators) iterator.reset(db->NewIterator(view->options));
+  view->metrics = metrics;
+  view->deleted = _deleted;
+  view->postings = _postings;
+  view->pageGeneration = _suffixesMove ? 0 : _pageGeneration;
 }
 
 }  // namespace salt

@@ -6,16 +6,13 @@
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
+#include "salt/Scanner.h"
 #include "salt/Suffix.h"
 
-// Probes for many prefixes at once.
+// Scans for many prefixes at once.
 namespace salt {
 
 namespace {
-
-// The threads of a probe, as for ScanPlaces.
-constexpr size_t kProbeThreads = 2;
-constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // A suffix that begins with the prefix of this index.
 struct Find {
@@ -53,7 +50,7 @@ class PrefixProbe {
     return status.ok();
   }
 
-  ScanCounts counts;
+  Scanner::Counts counts;
 
  private:
   // Moves on from a position at or before the first match: stepping to the next page is much
@@ -105,58 +102,50 @@ std::vector<std::vector<SuffixMeta>> firstOfEach(const std::vector<std::vector<F
 
 }  // namespace
 
-void index::learnStarts() const {
-  _starts.beginWith([this](const std::function<bool(std::string_view)>& enter) {
-    const IndexView view(*this, false);
+void Scanner::learnStarts() const {
+  _idx.starts().beginWith([this](const std::function<bool(std::string_view)>& enter) {
+    _idx.waitForZoneInHand();
+    const IndexView view(_idx, false);
     bool all = true;
-    forEachZone(view, [&](uint32_t, uint16_t, std::string_view text) { return all = enter(text); });
+    view.forEachZone([&](uint32_t, uint16_t, std::string_view text) { return all = enter(text); });
     return all && view.iterators.front()->status().ok();
   });
 }
 
-std::vector<std::vector<SuffixMeta>> index::ScanPrefixes(const std::vector<std::string>& prefixes,
-                                                         size_t limit) const {
+std::vector<std::vector<SuffixMeta>> Scanner::scanPrefixes(const std::vector<std::string>& prefixes,
+                                                           size_t limit) const {
   const auto start = Clock::now();
-  const Activity::Work running(_schedule.scans());
-  if (!_starts.complete()) learnStarts();
-  const IndexView view(*this, true, kProbeThreads);
+  const Activity::Work running(_idx.scans());
+  if (!_idx.starts().complete()) learnStarts();
+  const IndexView view(_idx, true, kThreads);
   const auto cut = [this](const std::string& prefix) {
-    return std::string_view(prefix).substr(0, suffixLength(prefix, op));
+    return std::string_view(prefix).substr(0, suffixLength(prefix, _idx.op));
   };
   std::vector<std::string_view> sorted;
   sorted.reserve(prefixes.size());
   for (const std::string& prefix : prefixes) {
-    if (_starts.mayBegin(cut(prefix))) sorted.push_back(cut(prefix));
+    if (_idx.starts().mayBegin(cut(prefix))) sorted.push_back(cut(prefix));
   }
   std::sort(sorted.begin(), sorted.end());
   sorted.erase(std::unique(sorted.begin(), sorted.end()), sorted.end());
 
   std::vector<std::vector<Find>> byShard(view.lastShard() + size_t{1});
   std::atomic<size_t> next{0};
-  std::array<ScanCounts, kProbeThreads> counts;
-  const auto probePart = [&](size_t number) {
-    PrefixProbe probe(view, sorted, limit, number);
+  std::array<Counts, kThreads> counts;
+  runParts(view, view.lastShard() + 1U, [&](size_t part) {
+    PrefixProbe probe(view, sorted, limit, part);
     bool good = true;
     for (size_t shard = next++; good && shard < byShard.size(); shard = next++) {
       good = probe.visit(static_cast<unsigned>(shard), &byShard[shard]);
     }
-    counts[number] = probe.counts;
-  };
-  if (byShard.size() <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
-    probePart(0);
-  } else {
-    _scanRunner.run(probePart);
-  }
+    counts[part] = probe.counts;
+  });
 
   const auto found = firstOfEach(byShard, sorted.size(), limit);
-  ScanCounts all;
-  for (const ScanCounts& one : counts) {
-    all.fetches += one.fetches;
-    all.hotReads += one.hotReads;
-    all.pageReads += one.pageReads;
-  }
+  Counts all;
+  for (const Counts& one : counts) all += one;
   for (const auto& metas : found) all.results += metas.size();
-  countScan(start, all);
+  _idx.countScan(Clock::now() - start, all);
 
   std::vector<std::vector<SuffixMeta>> result;
   result.reserve(prefixes.size());

@@ -13,18 +13,28 @@
 namespace salt {
 
 // Decides when the background work of an index runs and which work waits for which. Scans have
-// priority and never wait here; ingest comes next; merges and compactions take the remaining time.
+// priority and never wait; ingest comes next; merges and compactions take the remaining time.
 //
-//   this waits                       for this                                    at most
-//   a merge, before it begins        more mail, while much comes in              60 s
-//   a merge, between two pages       running scans (MergePace)                   3 times its work
-//   a batch of mail, before it       a running merge or compaction on demand;    10 s
-//   begins                           holding no lock
-//   a compaction on demand           the running merge                           its end
-//   the end of the index             the running merge                           its next page
+//   this waits                        for this                                   at most
+//   a merge, before it begins         more mail, while much comes in             60 s
+//   a merge, between two pages        running scans (MergePace)                  3 times its work
+//   a batch of mail, before it        a running merge or compaction on demand    10 s
+//   begins (waitForMaintenance)
+//   a compaction on demand            the running merge                          its end
+//   the end of the index              the running merge                          its next page
 //
-// An interruption ends all of these waits at once. Below this level, BatchWriter separates writes
-// from compactions on demand, and LogSync and OrderedSyncEnv wait for the disk.
+// None of these holds a lock meanwhile, and an interruption ends them at once. Below this level,
+// with locks that no scan needs:
+//
+//   a write that would fill the       a compaction on demand (BatchWriter)       1 s
+//   memtable or needs a new log
+//   a write into a new log            the previous log on the disk (LogSync)     a sync of 1 MiB
+//   leveldb, after writing a table    four tables not yet on the disk            their syncs
+//                                     (OrderedSyncEnv)
+//   a flush of an idle memtable       10 s without a write (BatchWriter)         a compaction's end
+//
+// docs/decisions.md gives the reasons. An interruption cannot end a compaction of leveldb that has
+// begun.
 //
 // Any thread. The schedule owns the merge thread, which must be joined before anything that the
 // merge uses is destroyed.

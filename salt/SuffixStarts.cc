@@ -15,7 +15,8 @@ SuffixStarts::~SuffixStarts() {
 
 void SuffixStarts::beginWith(ForEachText forEachText) {
   platform::MutexLock lock(_mutex);
-  if (_complete || _thread.joinable()) return;
+  if (_thread.joinable()) return;
+  _begun = true;
   const auto body = [this, forEachText = std::move(forEachText)] {
     platform::setThreadName("tallow-starts");
     platform::lowerThreadPriority();

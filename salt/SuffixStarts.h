@@ -18,11 +18,10 @@ namespace salt {
 // that no suffix begins with, it says so without a look at the index. Bits are never cleared:
 // merges change no suffix, and a deleted suffix costs only an unnecessary look.
 //
-// Suffixes added to the index are entered as they come. Those that were there before are entered by
-// a scan over the stored texts on a thread of its own, which the first query starts; until it ends,
-// every prefix may be present. The scan enters every position of a text, because only the pages
-// know which positions begin a suffix. With a hundred thousand mails about ten percent of the bits
-// are set.
+// It is built when the first query asks: by a scan over the stored texts on a thread of its own,
+// while suffixes added to the index are entered as they come. Until the scan ends, every prefix may
+// be present. The scan enters every position of a text, because only the pages know which positions
+// begin a suffix. With a hundred thousand mails about ten percent of the bits are set.
 //
 // Any thread. `add` must be called before the suffix becomes readable.
 class SuffixStarts {
@@ -39,16 +38,15 @@ class SuffixStarts {
   SuffixStarts(const SuffixStarts&) = delete;
   SuffixStarts& operator=(const SuffixStarts&) = delete;
 
-  // The index was empty when opened.
-  void beginEmpty() { _complete = true; }
   // Starts the scan unless it has started; a later call tries again if the system could not create
-  // a thread.
+  // a thread. `forEachText` must begin with a wait for the additions in hand, which may have found
+  // the scan not begun.
   void beginWith(ForEachText forEachText) TL_EXCLUDES(_mutex);
   [[nodiscard]] bool complete() const { return _complete; }
 
   // A suffix begins with `text`; it may end sooner.
   void add(std::string_view text) {
-    if (text.size() < kBytes) return;
+    if (!_begun || text.size() < kBytes) return;
     const uint64_t hash = hashOf(text.data());
     const std::atomic_ref<uint64_t> bits(_bits.get()[hash / 64]);
     const uint64_t bit = uint64_t{1} << hash % 64;
@@ -81,6 +79,7 @@ class SuffixStarts {
   };
   // The kernel allocates its pages at the first bit, so an unused index costs no memory.
   const std::unique_ptr<uint64_t, Free> _bits;
+  std::atomic<bool> _begun{false};
   std::atomic<bool> _complete{false};
   std::atomic<bool> _ending{false};
   platform::Mutex _mutex;

@@ -71,6 +71,10 @@ std::vector<std::string> randomTokens(std::mt19937& random) {
   return tokens;
 }
 
+void waitForBloomFilter(const salt::Index& index) {
+  while (!dynamic_cast<const salt::index&>(index).starts().complete()) std::this_thread::yield();
+}
+
 class Alternatives : public testing::Test {
  protected:
   std::mt19937 random{testsupport::firstSeed()};
@@ -86,7 +90,7 @@ TEST_F(Alternatives, ManyPrefixesFindTheSameAsEachAlone) {
   size_t found = 0;
   for (int round = 0; round < 200; ++round) {
     if (round == 100) {  // from now on the Bloom filter rejects most prefixes
-      while (!dynamic_cast<const salt::index&>(*index).knowsStarts()) std::this_thread::yield();
+      waitForBloomFilter(*index);
       EXPECT_TRUE(salttest::addZone(*index, 1000, 1, "cabbaca bbbbbb ", {0, 8}));
     }
     std::vector<std::string> prefixes = randomTokens(random);
@@ -110,6 +114,31 @@ TEST_F(Alternatives, ManyPrefixesFindTheSameAsEachAlone) {
     }
   }
   EXPECT_GT(found, 500U);
+}
+
+// The filter is built from a view and from what is added meanwhile; nothing may fall in between.
+TEST(BloomFilter, HasWhatIsAddedWhileItIsBuilt) {
+  constexpr uint32_t kDocs = 60;
+  const testsupport::TemporaryDirectory directory;
+  for (int round = 0; round < 20; ++round) {
+    const auto index = salttest::newIndex(directory / std::to_string(round));
+    std::vector<std::string> words;
+    for (uint32_t docID = 1; docID <= kDocs; ++docID)
+      words.push_back("word" + std::to_string(docID * 7919));
+    std::atomic<uint32_t> added{0};
+    std::thread adding([&] {
+      for (uint32_t docID = 1; docID <= kDocs; ++docID) {
+        EXPECT_TRUE(salttest::addZone(*index, docID, 1, words[docID - 1] + ' ', {0}));
+        added = docID;
+      }
+    });
+    while (added < kDocs / 3) std::this_thread::yield();
+    (void)index->ScanPrefixes({"absent"}, 1);
+    waitForBloomFilter(*index);
+    adding.join();
+    const auto found = index->ScanPrefixes(words, 10);
+    for (size_t i = 0; i < words.size(); ++i) EXPECT_FALSE(found[i].empty()) << words[i];
+  }
 }
 
 TEST_F(Alternatives, AnyDocumentAgreesWithSearch) {

@@ -40,6 +40,10 @@ class WriteBlockingEnv final : public salttest::FaultInjectionEnv {
     platform::MutexLock lock(_mutex);
     while (!_waiting) _changed.wait(_mutex);
   }
+  [[nodiscard]] bool hasWriter() {
+    platform::MutexLock lock(_mutex);
+    return _waiting;
+  }
 
  private:
   class File final : public salttest::FaultInjectionFile {
@@ -233,6 +237,31 @@ TEST(BlockedDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   write(1);
   expectWaiting(&disk, [&write] { write(2 << 20); });
   compacting.join();
+}
+
+// The memtable of a class at rest is written to a table, unless it is small.
+TEST(BlockedDisk, AnIdleWriterFlushesItsMemtable) {
+  const testsupport::TemporaryDirectory directory;
+  WriteBlockingEnv disk(".ldb");
+  const salt::Database database =
+      salt::openDatabase(directory / "i", salt::OpenMode::create, &disk);
+  ASSERT_NE(database.db, nullptr);
+  disk.blockAfter(0);
+  const auto write = [](salt::BatchWriter* writer, size_t bytes) {
+    leveldb::WriteBatch batch;
+    batch.Put("a", std::string(bytes, 'a'));
+    EXPECT_TRUE(writer->write(&batch).ok());
+  };
+  {
+    salt::BatchWriter patient(database);  // its end does not wait for the idle time
+    write(&patient, 1 << 20);
+  }
+  salt::BatchWriter writer(database, std::chrono::milliseconds(0));
+  write(&writer, 1 << 10);
+  EXPECT_FALSE(disk.hasWriter());
+  write(&writer, 1 << 20);
+  disk.waitForWriter();
+  disk.release();
 }
 
 namespace {

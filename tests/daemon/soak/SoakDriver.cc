@@ -1,14 +1,20 @@
 // Runs clients of all kinds against one daemon for any length of time, while it is locked and
 // unlocked, asked for its state, and killed and restarted. Each client knows what it must find; a
-// wrong answer exits with 1. Reports the memory of the daemon for each third of the time.
+// wrong answer exits with 1. Reports the memory of the daemon for each third of the time after
+// warming up.
+//
+// Deleted mail stays in the index until it is purged. The clients delete and add all the time, so
+// without purges the index and with it the daemon's memory would grow.
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <map>
 #include <mutex>
@@ -17,10 +23,13 @@
 #include <set>
 #include <stop_token>
 #include <thread>
+#include <vector>
 
 #include "client/DebugServiceProxy.h"
 #include "client/SearchServiceProxy.h"
+#include "inspect/Purge.h"
 #include "platform/Files.h"
+#include "platform/Paths.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -34,7 +43,8 @@ using std::chrono::milliseconds;
 using std::chrono::seconds;
 
 constexpr const char* kUsage =
-    "Usage: soak_driver [--seconds N] [--clients N] [--kill-every SECONDS] [--seed N]\n";
+    "Usage: soak_driver [--seconds N] [--warm-up SECONDS] [--clients N] [--kill-every SECONDS]\n"
+    "                   [--purge-every KILLS] [--seed N]\n";
 
 // The classes of clients by number; the first is refused while the device is locked.
 constexpr const char* kClasses[] = {"SysFileProtectionComplete", "default", "other"};
@@ -44,9 +54,11 @@ constexpr milliseconds kPause{20};  // maximum, between two calls of a client
 constexpr rpc::Patience kPatience{20000};
 
 struct Options {
-  seconds length{1800};
+  seconds length{1800};  // without the warming up
+  seconds warmUp{0};
   int clients = 16;
   seconds killEvery{60};
+  int purgeEvery = 5;  // kills
   uint32_t seed = std::random_device()();
 };
 
@@ -245,13 +257,11 @@ class Supervisor {
 
   // Runs until the end of the time or a wrong answer. False if the daemon ended unexpectedly.
   bool supervise(const Tally& tally) {
-    const auto start = Clock::now();
-    auto nextKill = start + _options.killEvery;
+    const auto start = Clock::now() + _options.warmUp;
+    auto nextKill = Clock::now() + _options.killEvery;
     while (Clock::now() - start < _options.length && !tally.wrong) {
       std::this_thread::sleep_for(milliseconds(200));
-      const auto third = static_cast<size_t>(3 * (Clock::now() - start) / _options.length);
-      size_t& most = _memory[std::min<size_t>(third, 2)];
-      most = std::max(most, anonymousMemory(_daemon->pid()));
+      if (Clock::now() >= start) measure(Clock::now() - start);
       if (_random() % 25 == 0) _daemon->signal(SIGUSR1);
       if (_random() % 25 == 0) {
         platform::writeFileAtomically(runtimeDirectory() + "/lock_status",
@@ -263,6 +273,7 @@ class Supervisor {
       const int status = _daemon->wait();
       if (status != 128 + SIGKILL) return ended(status);
       ++_kills;
+      if (_kills % _options.purgeEvery == 0 && !purge()) return false;
       _daemon.emplace(_directory);
       if (!_daemon->ready()) return ended(_daemon->wait());
     }
@@ -278,15 +289,46 @@ class Supervisor {
 
   void report(const Tally& tally) const {
     fmt::print(
-        "calls={} searches={} refused_while_locked={} failed_by_kills={} kills={} wrong={:d} "
-        "rss_anon_mb={:.1f},{:.1f},{:.1f} seed={}\n",
+        "calls={} searches={} refused_while_locked={} failed_by_kills={} kills={} purges={} "
+        "wrong={:d} rss_anon_median_mb={:.1f},{:.1f},{:.1f} rss_anon_max_mb={:.1f},{:.1f},{:.1f} "
+        "seed={}\n",
         tally.calls.load(), tally.searches.load(), tally.refused.load(), tally.failed.load(),
-        _kills, tally.wrong.load(), static_cast<double>(_memory[0]) / 1024,
-        static_cast<double>(_memory[1]) / 1024, static_cast<double>(_memory[2]) / 1024,
+        _kills, _purges, tally.wrong.load(), percentile(0, 50), percentile(1, 50),
+        percentile(2, 50), percentile(0, 100), percentile(1, 100), percentile(2, 100),
         _options.seed);
   }
 
  private:
+  void measure(Clock::duration time) {
+    const auto third = static_cast<size_t>(3 * time / _options.length);
+    const size_t memory = anonymousMemory(_daemon->pid());
+    if (memory != 0) _memory[std::min<size_t>(third, 2)].push_back(memory);
+  }
+
+  // Of the measured values of a third, in megabytes; 0 if there are none.
+  [[nodiscard]] double percentile(size_t third, size_t percent) const {
+    std::vector<size_t> sorted = _memory[third];
+    if (sorted.empty()) return 0;
+    std::ranges::sort(sorted);
+    return static_cast<double>(sorted[(sorted.size() - 1) * percent / 100]) / 1024;
+  }
+
+  // Removes the remains of deleted mail from all classes, while no daemon runs.
+  bool purge() {
+    const std::string state = _directory + "/state";
+    for (const char* protectionClass : kClasses) {
+      if (!std::filesystem::exists(platform::dataRoot(state) + "/" + protectionClass)) continue;
+      std::optional<TLError> error;
+      if (!inspect::purge(
+              state, protectionClass, [](const char*) {}, &error)) {
+        fmt::print(stderr, "no purge of {}: {}\n", protectionClass, platform::printable(error));
+        return false;
+      }
+      ++_purges;
+    }
+    return true;
+  }
+
   bool ended(int status) const {
     fmt::print(stderr, "the daemon ended with status {}\n{}\n", status,
                _daemon->log().substr(0, 4000));
@@ -297,8 +339,9 @@ class Supervisor {
   const std::string _directory;
   std::mt19937 _random;
   std::optional<DaemonProcess> _daemon;
-  size_t _memory[3] = {0, 0, 0};  // peak of each third, in kilobytes
+  std::vector<size_t> _memory[3];  // for each third, in kilobytes
   int _kills = 0;
+  int _purges = 0;
 };
 
 int soak(const Options& options) {
@@ -330,6 +373,10 @@ int main(int argc, char** argv) {
     const int value = i + 1 < argc ? std::atoi(argv[i + 1]) : -1;
     if (name == "--seconds" && value > 0) {
       options.length = seconds(value);
+    } else if (name == "--warm-up" && value >= 0) {
+      options.warmUp = seconds(value);
+    } else if (name == "--purge-every" && value > 0) {
+      options.purgeEvery = value;
     } else if (name == "--clients" && value > 0) {
       options.clients = value;
     } else if (name == "--kill-every" && value > 0) {

@@ -1,3 +1,5 @@
+#include "salt/Scanner.h"
+
 #include <algorithm>
 #include <array>
 #include <atomic>
@@ -7,7 +9,6 @@
 #include "salt/PostingSet.h"
 #include "salt/Suffix.h"
 
-// Prefix scans and iteration over stored texts.
 namespace salt {
 
 namespace {
@@ -33,7 +34,7 @@ class PrefixScan {
     return visitShard(shard, [&] { return visitPagePlaces(places); });
   }
 
-  ScanCounts counts;
+  Scanner::Counts counts;
 
  private:
   // Calls visit() with the cursor at the first suffix not less than the prefix. False when that
@@ -123,9 +124,6 @@ class PrefixScan {
   std::string _page;
 };
 
-// Threads of one scan through the pages. A device has more processors, but during a search it also
-// indexes, and displays what was found.
-constexpr size_t kScanThreads = 2;
 constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // The result of a scan for places.
@@ -133,15 +131,13 @@ struct FoundPlaces {
   PostingSet hot;
   PostingSet pages;
   bool complete = true;  // no read has failed
-  ScanCounts counts;
+  Scanner::Counts counts;
 
   void add(FoundPlaces&& other) {
     hot.add(std::move(other.hot));
     pages.add(std::move(other.pages));
     complete = complete && other.complete;
-    counts.fetches += other.counts.fetches;
-    counts.hotReads += other.counts.hotReads;
-    counts.pageReads += other.counts.pageReads;
+    counts += other.counts;
   }
 };
 
@@ -170,7 +166,7 @@ class PlacesScan {
   }
 
   [[nodiscard]] FoundPlaces take() {
-    for (size_t number = 1; number < kScanThreads; ++number) {
+    for (size_t number = 1; number < Scanner::kThreads; ++number) {
       _found.front().add(std::move(_found[number]));
     }
     return std::move(_found.front());
@@ -187,40 +183,43 @@ class PlacesScan {
   const std::string_view _prefix;
   const unsigned _last;
   std::atomic<unsigned> _next{0};
-  std::array<FoundPlaces, kScanThreads> _found;
+  std::array<FoundPlaces, Scanner::kThreads> _found;
 };
 
 }  // namespace
 
-bool index::ScanPrefix(std::string_view prefix,
-                       std::function<bool(const SuffixMeta&)> callback) const {
-  const auto start = Clock::now();
-  const Activity::Work running(_schedule.scans());
-  const IndexView view(*this, true);
-  PrefixScan scan(view, prefix.substr(0, suffixLength(prefix, op)));
-  scan.suffixes(callback);
-  countScan(start, scan.counts);
-  return true;
+Scanner::Counts& Scanner::Counts::operator+=(const Counts& other) {
+  results += other.results;
+  fetches += other.fetches;
+  hotReads += other.hotReads;
+  pageReads += other.pageReads;
+  return *this;
 }
 
-std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limit,
-                                          const PlacesCallback& callback) const {
+void Scanner::scanPrefix(std::string_view prefix,
+                         const std::function<bool(const SuffixMeta&)>& callback) const {
   const auto start = Clock::now();
-  const Activity::Work running(_schedule.scans());
-  const IndexView view(*this, true, kScanThreads);
-  prefix = prefix.substr(0, suffixLength(prefix, op));
+  const Activity::Work running(_idx.scans());
+  const IndexView view(_idx, true);
+  PrefixScan scan(view, prefix.substr(0, suffixLength(prefix, _idx.op)));
+  scan.suffixes(callback);
+  _idx.countScan(Clock::now() - start, scan.counts);
+}
+
+std::optional<uint64_t> Scanner::scanPlaces(std::string_view prefix, uint64_t limit,
+                                            const PlacesCallback& callback) const {
+  const auto start = Clock::now();
+  const Activity::Work running(_idx.scans());
+  const IndexView view(_idx, true, kThreads);
+  prefix = prefix.substr(0, suffixLength(prefix, _idx.op));
   const auto known = _scanCache.find(prefix, view.pageGeneration);
   const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
   if (most > limit) return std::nullopt;
   PlacesScan scan(view, prefix, !known);
-  if (scan.shards() <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
-    scan.scanPart(0);
-  } else {
-    _scanRunner.run([&scan](size_t part) { scan.scanPart(part); });
-  }
+  runParts(view, scan.shards(), [&scan](size_t part) { scan.scanPart(part); });
   const FoundPlaces found = scan.take();
   found.hot.deliver(callback);
-  ScanCounts counts = found.counts;
+  Counts counts = found.counts;
   counts.results = found.hot.suffixes();
   if (known) {
     PostingSet::deliver(known->places, callback);
@@ -232,45 +231,25 @@ std::optional<uint64_t> index::ScanPlaces(std::string_view prefix, uint64_t limi
       remember(prefix, view, found.pages);
     }
   }
-  countScan(start, counts);
+  _idx.countScan(Clock::now() - start, counts);
   return counts.results;
 }
 
-void index::remember(std::string_view prefix, const IndexView& view,
-                     const PostingSet& pages) const {
+void Scanner::runParts(const IndexView& view, unsigned shards,
+                       const std::function<void(size_t part)>& part) const {
+  if (shards <= kMaxShardsOnOneThread || view.iterators.size() == 1) {
+    part(0);
+  } else {
+    _runner.run(part);
+  }
+}
+
+void Scanner::remember(std::string_view prefix, const IndexView& view,
+                       const PostingSet& pages) const {
   ScanCache::Found found{pages.suffixes(), pages.encode()};
   if (found.places.empty()) return;
   _scanCache.keep(prefix, view.pageGeneration,
                   std::make_shared<const ScanCache::Found>(std::move(found)));
-}
-
-void index::countScan(Clock::time_point start, const ScanCounts& counts) const {
-  const std::chrono::nanoseconds elapsed = Clock::now() - start;
-  platform::MutexLock lock(_metricsMutex);
-  metrics.Scans += 1;
-  metrics.ScanSeconds += static_cast<double>(elapsed.count()) / 1000000000;
-  metrics.ScanResults += counts.results;
-  metrics.ScanTextFetches += counts.fetches;
-  metrics.ScanHotReads += counts.hotReads;
-  metrics.ScanPageReads += counts.pageReads;
-}
-
-void index::ForEachZone(
-    std::function<bool(uint32_t docID, uint16_t zoneID, std::string_view text)> callback) const {
-  forEachZone(IndexView(*this, false), callback);
-}
-
-void index::forEachZone(
-    const IndexView& view,
-    const std::function<bool(uint32_t, uint16_t, std::string_view)>& callback) const {
-  leveldb::Iterator* const iterator = view.iterators.front().get();
-  for (iterator->Seek(slice(textKey(0, 0).view())); iterator->Valid(); iterator->Next()) {
-    uint32_t docID = 0;
-    uint16_t zoneID = 0;
-    if (!parseTextKey(salt::view(iterator->key()), &docID, &zoneID)) continue;
-    if (view.deleted->contains(docID)) continue;
-    if (!callback(docID, zoneID, salt::view(iterator->value()))) return;
-  }
 }
 
 }  // namespace salt
