@@ -205,4 +205,10 @@ std::unique_ptr<ByteSource> openByteSource(const std::string& path, TLErrorOut e
   return file;
 }
 
+std::optional<bool> isCompressed(const std::string& path) {
+  const auto source = openByteSource(path, nullptr);
+  if (source == nullptr) return std::nullopt;
+  return dynamic_cast<const FileSource*>(source.get()) == nullptr;
+}
+
 }  // namespace cli

@@ -30,4 +30,7 @@ class ByteSource {
 // Opens a regular file, which may be compressed with gzip or xz, detected by its first bytes.
 [[nodiscard]] std::unique_ptr<ByteSource> openByteSource(const std::string& path, TLErrorOut error);
 
+// Whether that would decompress the file. Nullopt if it cannot be read.
+[[nodiscard]] std::optional<bool> isCompressed(const std::string& path);
+
 }  // namespace cli

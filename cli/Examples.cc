@@ -26,6 +26,7 @@ constexpr Row kRows[] = {
      "  tallow search from:mara date:2010.. -draft\n"
      "  tallow search '\"three loans\" OR subject:invoice' --sort=date\n"
      "  tallow search harbour --threads\n"
+     "  tallow search --maildir ~/.cache/tallow/folders/search harbour\n"
      "  tallow search @bills --count"},
     {Command::screen,
      "  tallow\n"

@@ -36,7 +36,8 @@ bool visitDirectory(const Directory& directory, const WalkVisitor& visitor,
     // An entry that no longer exists was moved or deleted since the listing.
     if (lstat(path.c_str(), &info) != 0 || stat(path.c_str(), &target) != 0) continue;
     if (S_ISDIR(info.st_mode)) {
-      if (!(maildir && name == "tmp")) below.push_back({path, directory.depth + 1});
+      if (!(maildir && name == "tmp") && !isLinkFolder(path))
+        below.push_back({path, directory.depth + 1});
     } else if (S_ISREG(target.st_mode)) {
       if (!visitor.file(path, false, static_cast<uint64_t>(target.st_size))) return false;
     }
@@ -46,6 +47,12 @@ bool visitDirectory(const Directory& directory, const WalkVisitor& visitor,
 }
 
 }  // namespace
+
+bool isLinkFolder(const std::string& directory) {
+  struct stat info;
+  return lstat(platform::joinPath(directory, kLinkFolderMark).c_str(), &info) == 0 &&
+         S_ISDIR(info.st_mode);
+}
 
 bool walkMail(const std::string& path, const WalkVisitor& visitor) {
   std::error_code failure;
@@ -57,6 +64,9 @@ bool walkMail(const std::string& path, const WalkVisitor& visitor) {
   }
   if (!S_ISDIR(info.st_mode)) {
     return visitor.file(root, true, static_cast<uint64_t>(info.st_size));
+  }
+  if (isLinkFolder(root)) {
+    return visitor.failure(root, "these are links of a search; their mail is indexed elsewhere");
   }
   std::vector<Directory> pending{{root, 0}};
   while (!pending.empty()) {

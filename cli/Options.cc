@@ -163,6 +163,9 @@ void addResultOptions(CLI::App& sub, Options& options) {
       ->check(wholeNumber(0))
       ->type_name("N");
   sub.add_flag("--count", options.count, "Show only how many results there are");
+  sub.add_option("--maildir", options.maildir,
+                 "Make this Maildir of links to the results; without WORDS, empty it")
+      ->type_name("DIR");
   sub.add_flag("--threads", options.threads, "A line for each conversation, with its results");
   sub.add_flag("--print0", options.print0, "With files and message-ids: end each entry with NUL");
 }
@@ -196,6 +199,10 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (isSearch(row.command)) addQueryOptions(*sub, options);
   if (row.command == Command::search) addResultOptions(*sub, options);
   if (row.command == Command::sync) addSyncOptions(*sub, options);
+  if (row.command == Command::status) {
+    sub->add_option("--html", options.page, "Write it as a page for browsers, with charts")
+        ->type_name("FILE");
+  }
   if (row.command == Command::purge) {
     sub->add_flag("-n,--dry-run", options.dryRun, "Only show how much space it would free");
   }
@@ -308,9 +315,16 @@ const char* misuse(const Options& options) {
   if (options.format == OutputFormat::json && options.command == Command::dump) {
     return "a dump is text only";
   }
+  if (!options.page.empty() && options.format != OutputFormat::text) {
+    return "--html and --format are two forms of one output";
+  }
   if (options.command == Command::show) return misuseOfShow(options);
   if (options.command == Command::screen && !isScreen()) return "a screen needs a terminal";
   if (!isSearch(options.command)) return nullptr;
+  if (!options.maildir.empty() && (list || options.count || options.threads)) {
+    return "--maildir shows no list; it goes with --format=text or json only";
+  }
+  if (emptiesMaildir(options)) return nullptr;
   if (options.arguments.empty() == options.query.empty()) {
     return "a search is for WORDS, or for the expression of --query";
   }
@@ -340,6 +354,8 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
     app.parse(std::move(arguments));
     restoreWords(options.arguments);
     options.classGiven = app.count("--class") > 0;
+    // A folder is for all that is found.
+    if (!options.maildir.empty() && app.count("--limit") == 0) options.limit = 0;
     if (app.get_subcommands().empty()) options.command = Command::screen;
   } catch (const CLI::ParseError& error) {
     const std::string word = unknownCommand(app);

@@ -69,6 +69,7 @@ struct Options {
   bool verbose = false;
 
   bool threads = false;  // results by conversation
+  std::string maildir;   // the folder for links to the results; empty for none
   // Only mail in one of these folders, in addition to words; empty for all.
   std::vector<std::string> folders;
 
@@ -82,6 +83,9 @@ struct Options {
   bool mutt = false;
   bool removeSaved = false;
 
+  // For status.
+  std::string page;  // the file for the HTML page
+
   // For sync.
   bool dryRun = false;
   bool pruneMissing = false;
@@ -94,6 +98,11 @@ struct Options {
     return std::chrono::milliseconds(static_cast<int64_t>(waitSeconds * 1000));
   }
 };
+
+// Whether a search is only to remove the links of an earlier one.
+[[nodiscard]] inline bool emptiesMaildir(const Options& options) {
+  return !options.maildir.empty() && options.arguments.empty() && options.query.empty();
+}
 
 // Parses the command line. Without a command on a terminal, the command is Command::screen. Nullopt
 // if there is nothing more to do, after --help, --version or incorrect usage; the text has then

@@ -37,7 +37,8 @@ std::optional<std::string> readSingleMessage(const std::string& identifier, size
 std::string sizeText(uint64_t bytes) {
   if (bytes < 1000) return fmt::format("{} B", bytes);
   if (bytes < 1000000) return fmt::format("{:.1f} kB", static_cast<double>(bytes) / 1e3);
-  return fmt::format("{:.1f} MB", static_cast<double>(bytes) / 1e6);
+  if (bytes < 1000000000) return fmt::format("{:.1f} MB", static_cast<double>(bytes) / 1e6);
+  return fmt::format("{:.1f} GB", static_cast<double>(bytes) / 1e9);
 }
 
 std::string readingText(MailView& view, const std::string& path,

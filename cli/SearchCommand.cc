@@ -12,6 +12,7 @@
 #include "cli/HitSearch.h"
 #include "cli/LastSearch.h"
 #include "cli/MailPlaces.h"
+#include "cli/MaildirResults.h"
 #include "cli/QueryInput.h"
 #include "cli/Results.h"
 #include "cli/SavedSearches.h"
@@ -152,6 +153,7 @@ ExitStatus showThreads(const Options& options, const QueryInput& input, Outcome&
 }  // namespace
 
 ExitStatus runSearch(const Options& options) {
+  if (emptiesMaildir(options)) return emptyMaildir(options);
   const auto input = readQuery(options);
   if (!input) return ExitStatus::failure;
   std::optional<TLError> error;
@@ -165,6 +167,9 @@ ExitStatus runSearch(const Options& options) {
                                  : "no match"));
   }
   if (!outcome->replaced.empty()) complain(replacedText(outcome->replaced));
+  if (!options.maildir.empty()) {
+    return showMaildir(options, pageOf<Hit>(options, outcome->hits), facts);
+  }
   return options.threads ? showThreads(options, *input, *outcome, facts)
                          : showHits(options, *input, *outcome, facts);
 }

@@ -250,15 +250,6 @@ class Run {
 
 }  // namespace
 
-std::optional<double> dateOf(const TLIndexableItem& item) {
-  for (const auto key :
-       {TLAttributeKey::MAIL_DATE_RECEIVED, TLAttributeKey::CONTENT_CREATION_DATE}) {
-    const auto& attribute = item.attributeForKey(key);
-    if (attribute != nullptr && attribute->hasDoubleValue()) return attribute->doubleValue();
-  }
-  return std::nullopt;
-}
-
 std::optional<SearchResults> runPlan(const SearchPlan& plan, const SearchRequest& request,
                                      client::SearchServiceProxy& service, MailFacts& facts,
                                      TLErrorOut error) {

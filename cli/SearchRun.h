@@ -4,6 +4,7 @@
 #include <string>
 #include <vector>
 
+#include "cli/MailDate.h"
 #include "cli/MailFacts.h"
 #include "cli/Results.h"
 #include "cli/SearchPlan.h"
@@ -40,8 +41,5 @@ inline constexpr size_t kCandidateSteps[] = {1000, 10000, 100000};
                                                    const SearchRequest& request,
                                                    client::SearchServiceProxy& service,
                                                    MailFacts& facts, TLErrorOut error);
-
-// The displayed date of an item, in seconds since 1970: the date of receipt, otherwise of sending.
-[[nodiscard]] std::optional<double> dateOf(const TLIndexableItem& item);
 
 }  // namespace cli

@@ -1,6 +1,4 @@
-#include <fcntl.h>
 #include <fmt/format.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -14,10 +12,10 @@
 #include "cli/MailFile.h"
 #include "cli/MailPlaces.h"
 #include "cli/MailView.h"
+#include "cli/OutputFile.h"
 #include "cli/Pager.h"
 #include "cli/Reading.h"
 #include "cli/Results.h"
-#include "platform/FileDescriptor.h"
 #include "platform/Files.h"
 
 namespace cli {
@@ -86,45 +84,6 @@ std::string readingJSON(MailView& view, const std::string& identifier, const std
                    {"text", text},
                    {"complete", view.complete()},
                    {"attachments", std::move(attachments)}});
-}
-
-bool writeAll(int file, std::string_view bytes) {
-  while (!bytes.empty()) {
-    const ssize_t count = write(file, bytes.data(), bytes.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return false;
-    bytes.remove_prefix(static_cast<size_t>(count));
-  }
-  return true;
-}
-
-// Creates a new file and does not follow links. Removes the file if the write fails.
-bool writeNewFile(const std::string& path, std::string_view bytes) {
-  constexpr int kNew = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
-  const platform::FileDescriptor file(open(path.c_str(), kNew, 0600));
-  if (file.get() < 0) return false;
-  if (writeAll(file.get(), bytes)) return true;
-  const int failure = errno;
-  unlink(path.c_str());
-  errno = failure;
-  return false;
-}
-
-// Replaces a regular file with one rename. Anything else is left alone.
-bool replaceFile(const std::string& path, std::string_view bytes) {
-  struct stat info;
-  if (lstat(path.c_str(), &info) == 0 && !S_ISREG(info.st_mode)) {
-    errno = S_ISDIR(info.st_mode) ? EISDIR : EEXIST;
-    return false;
-  }
-  std::string temporary = path + ".XXXXXX";
-  const platform::FileDescriptor file(mkostemp(temporary.data(), O_CLOEXEC));
-  if (file.get() < 0) return false;
-  if (writeAll(file.get(), bytes) && rename(temporary.c_str(), path.c_str()) == 0) return true;
-  const int failure = errno;
-  unlink(temporary.c_str());
-  errno = failure;
-  return false;
 }
 
 ExitStatus saveAttachment(const Options& options, const MailView& view) {

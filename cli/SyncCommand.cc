@@ -9,6 +9,7 @@
 #include "cli/Commands.h"
 #include "cli/ProgressBar.h"
 #include "cli/Results.h"
+#include "cli/StatusFacts.h"
 
 namespace cli {
 
@@ -113,6 +114,9 @@ mailsync::SyncSettings syncSettings(const Options& options, const MailboxGroup& 
   settings.protectionClass = group.protectionClass;
   settings.excluded = group.excluded;
   settings.largestMessage = group.largestMail;
+  Options ofGroup = options;
+  ofGroup.protectionClass = group.protectionClass;
+  settings.measure = [ofGroup] { return measureIndex(ofGroup); };
   return settings;
 }
 

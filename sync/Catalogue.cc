@@ -14,7 +14,8 @@ namespace mailsync {
 
 namespace {
 
-constexpr const char* kSchemaVersion = "1";
+constexpr const char* kSchemaVersion = "2";
+constexpr const char* kSchemaWithoutDates = "1";
 
 constexpr const char* kSchema = R"(
 CREATE TABLE IF NOT EXISTS setting (key TEXT PRIMARY KEY, value BLOB) WITHOUT ROWID;
@@ -32,17 +33,22 @@ CREATE INDEX IF NOT EXISTS file_alias ON file (directory) WHERE kind = 4;
 CREATE TABLE IF NOT EXISTS message (
   id INTEGER PRIMARY KEY, file INTEGER NOT NULL, identifier TEXT NOT NULL UNIQUE,
   digest TEXT NOT NULL, position INTEGER NOT NULL, flags TEXT NOT NULL,
-  sequence INTEGER NOT NULL, replace INTEGER NOT NULL, problem TEXT);
+  sequence INTEGER NOT NULL, replace INTEGER NOT NULL, problem TEXT, date INTEGER);
 CREATE INDEX IF NOT EXISTS message_file ON message (file);
 CREATE INDEX IF NOT EXISTS message_sequence ON message (sequence);
 CREATE TABLE IF NOT EXISTS deletion (identifier TEXT PRIMARY KEY, sequence INTEGER NOT NULL)
   WITHOUT ROWID;
 CREATE INDEX IF NOT EXISTS deletion_sequence ON deletion (sequence);
+CREATE TABLE IF NOT EXISTS measurement (
+  day INTEGER PRIMARY KEY, messages INTEGER NOT NULL, index_bytes INTEGER NOT NULL,
+  store_bytes INTEGER NOT NULL, scans INTEGER NOT NULL, scan_microseconds INTEGER NOT NULL,
+  merges INTEGER NOT NULL, merge_microseconds INTEGER NOT NULL);
 )";
 
 constexpr const char* kDropAll = R"(
 DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS root; DROP TABLE IF EXISTS directory;
 DROP TABLE IF EXISTS file; DROP TABLE IF EXISTS message; DROP TABLE IF EXISTS deletion;
+DROP TABLE IF EXISTS measurement;
 )";
 
 // Acknowledged deletions to keep, in case the daemon's data is restored to an older state.
@@ -91,15 +97,16 @@ bool Catalogue::prepare() {
       "CREATE TABLE IF NOT EXISTS setting (key TEXT PRIMARY KEY, value BLOB) "
       "WITHOUT ROWID");
   const std::string version = value("schema");
-  if (version != kSchemaVersion) {
+  const bool kept = version == kSchemaVersion ||
+                    (version == kSchemaWithoutDates &&
+                     _database->execute("ALTER TABLE message ADD COLUMN date INTEGER"));
+  if (!kept) {
     _statements.clear();
     _database->execute(kDropAll);
   }
   _database->execute(kSchema);
-  if (version != kSchemaVersion) {
-    setValue("schema", kSchemaVersion);
-    setValue("id", randomName());
-  }
+  if (version != kSchemaVersion) setValue("schema", kSchemaVersion);
+  if (!kept) setValue("id", randomName());
   _id = value("id");
   _acknowledged = toNumber(value("acknowledged"));
   return commit();

@@ -80,10 +80,38 @@ struct FolderCount {
   bool missing = false;
 };
 
+// The number of messages of one month.
+struct MonthCount {
+  std::string month;  // such as 2024-02; empty for messages whose date is not known
+  int64_t messages = 0;
+};
+
+// What the index held at the end of a run, for the history. Counters grow from one measurement to
+// the next, unless the daemon has lost them.
+struct Measurement {
+  int64_t day = 0;         // such as 20240206, in the user's time zone
+  int64_t messages = 0;    // in the index
+  int64_t indexBytes = 0;  // on the disk; 0 if not known
+  int64_t storeBytes = 0;
+  int64_t scans = 0;  // for prefixes, of searches
+  double scanSeconds = 0;
+  int64_t merges = 0;
+  double mergeSeconds = 0;
+};
+
+// The days of the history that are kept.
+inline constexpr int64_t kMaxMeasurements = 1000;
+
 struct Problem {
   std::string identifier;
   std::string path;
   std::string reason;
+};
+
+// A message that the index has, and its date there.
+struct IndexedMessage {
+  std::string identifier;
+  std::optional<int64_t> date;  // seconds since 1970
 };
 
 // The current place of a message.
@@ -166,7 +194,9 @@ class Catalogue {
   // The ID of the newest message.
   [[nodiscard]] int64_t lastMessage() { return scalar("SELECT MAX(id) FROM message"); }
   [[nodiscard]] std::optional<WaitingMessage> waitingMessage(int64_t id);
-  void setSequence(int64_t message, int64_t sequence);
+  // `date` is that of the message in the index, in seconds since 1970.
+  void setSent(int64_t message, int64_t sequence, const std::string& digest,
+               std::optional<int64_t> date);
 
   [[nodiscard]] int64_t waitingDeletionCount();
   [[nodiscard]] std::vector<std::string> waitingDeletions();
@@ -176,11 +206,18 @@ class Catalogue {
   // Aligns the catalogue with the index. Messages that the index has count as sent; all others
   // wait, and so do those sent after `trusted`, because the index may have another version.
   // Messages that only the index has are deleted.
-  void adopt(const std::vector<std::string>& identifiersInIndex, int64_t trusted);
+  void adopt(const std::vector<IndexedMessage>& inIndex, int64_t trusted);
 
   [[nodiscard]] std::vector<FolderCount> folderCounts();
+  // By month, in the user's time zone, of the messages that are in the index.
+  [[nodiscard]] std::vector<MonthCount> monthCounts();
   [[nodiscard]] std::vector<Problem> problems(size_t most);
   [[nodiscard]] std::optional<MessagePlace> find(const std::string& identifier);
+
+  // The measurements of the last days, oldest first. A day has at most one.
+  [[nodiscard]] std::vector<Measurement> measurements();
+  [[nodiscard]] bool isMeasured(int64_t day);
+  void addMeasurement(const Measurement& measurement);
 
  private:
   explicit Catalogue(std::unique_ptr<Database> database) : _database(std::move(database)) {}

@@ -9,6 +9,15 @@ namespace mailsync {
 
 namespace {
 
+constexpr double kMicroseconds = 1e6;  // of a second
+
+// The date to store: -1 for none, and for those that are no dates of mail, such as 1970-01-01.
+int64_t usableDate(const std::optional<int64_t>& date) {
+  constexpr int64_t kYear1980 = 315532800;
+  constexpr int64_t kYear2100 = 4102444800;
+  return date && *date >= kYear1980 && *date < kYear2100 ? *date : -1;
+}
+
 MessageRow messageOf(const Statement& row) {
   return {row.number(0), row.number(1), row.text(2),   row.text(3),
           row.number(4), row.text(5),   row.number(6), row.number(7) != 0};
@@ -117,9 +126,13 @@ std::optional<WaitingMessage> Catalogue::waitingMessage(int64_t id) {
   });
 }
 
-void Catalogue::setSequence(int64_t message, int64_t sequence) {
-  sql("UPDATE message SET sequence = ?, replace = 0, problem = NULL WHERE id = ?")
+void Catalogue::setSent(int64_t message, int64_t sequence, const std::string& digest,
+                        std::optional<int64_t> date) {
+  sql("UPDATE message SET sequence = ?, digest = ?, date = NULLIF(?, -1), replace = 0, "
+      "problem = NULL WHERE id = ?")
       .bind(sequence)
+      .bindText(digest)
+      .bind(usableDate(date))
       .bind(message)
       .run();
 }
@@ -144,10 +157,14 @@ void Catalogue::setDeletionSequence(const std::string& identifier, int64_t seque
   sql("INSERT OR REPLACE INTO deletion VALUES (?, ?)").bindText(identifier).bind(sequence).run();
 }
 
-void Catalogue::adopt(const std::vector<std::string>& identifiersInIndex, int64_t trusted) {
-  _database->execute("CREATE TEMP TABLE present (identifier TEXT PRIMARY KEY) WITHOUT ROWID");
-  for (const std::string& identifier : identifiersInIndex) {
-    sql("INSERT OR IGNORE INTO present VALUES (?)").bindText(identifier).run();
+void Catalogue::adopt(const std::vector<IndexedMessage>& inIndex, int64_t trusted) {
+  _database->execute(
+      "CREATE TEMP TABLE present (identifier TEXT PRIMARY KEY, date INTEGER) WITHOUT ROWID");
+  for (const IndexedMessage& message : inIndex) {
+    sql("INSERT OR IGNORE INTO present VALUES (?, NULLIF(?, -1))")
+        .bindText(message.identifier)
+        .bind(usableDate(message.date))
+        .run();
   }
   // Messages sent after that are in the index in some version.
   sql("UPDATE message SET replace = 1 WHERE sequence > ? AND sequence < 9223372036854775807")
@@ -158,12 +175,15 @@ void Catalogue::adopt(const std::vector<std::string>& identifiersInIndex, int64_
   setAcknowledged(highestSequence() + 1);
   setValue("horizon", std::to_string(_acknowledged));
   sql("UPDATE message SET sequence = 9223372036854775807, "
-      "replace = (replace AND identifier IN present) WHERE sequence >= 0 "
-      "AND (replace OR identifier NOT IN present)")
+      "replace = (replace AND identifier IN (SELECT identifier FROM present)) WHERE sequence >= 0 "
+      "AND (replace OR identifier NOT IN (SELECT identifier FROM present))")
       .run();
   sql("UPDATE message SET sequence = ? WHERE sequence >= 0 AND NOT replace "
-      "AND identifier IN present")
+      "AND identifier IN (SELECT identifier FROM present)")
       .bind(_acknowledged)
+      .run();
+  sql("UPDATE message SET date = present.date FROM present "
+      "WHERE present.identifier = message.identifier AND message.date IS NULL")
       .run();
   _database->execute("DELETE FROM deletion");
   sql("INSERT INTO deletion SELECT identifier, 9223372036854775807 FROM present "
@@ -204,6 +224,16 @@ std::vector<FolderCount> Catalogue::folderCounts() {
   return counts;
 }
 
+std::vector<MonthCount> Catalogue::monthCounts() {
+  Statement& statement =
+      sql("SELECT COALESCE(strftime('%Y-%m', date, 'unixepoch', 'localtime'), ''), COUNT(*) "
+          "FROM message WHERE sequence BETWEEN 0 AND ? GROUP BY 1 ORDER BY 1");
+  statement.bind(_acknowledged);
+  return all(statement, [](const Statement& row) {
+    return MonthCount{row.text(0), row.number(1)};
+  });
+}
+
 std::vector<Problem> Catalogue::problems(size_t most) {
   Statement& statement = sql(
       "SELECT m.identifier, d.path, f.name, m.problem FROM message m JOIN file f ON f.id = m.file "
@@ -228,6 +258,38 @@ std::optional<MessagePlace> Catalogue::find(const std::string& identifier) {
   });
 }
 
-// --- Places
+// --- History
+
+std::vector<Measurement> Catalogue::measurements() {
+  return all(sql("SELECT * FROM measurement ORDER BY day"), [](const Statement& row) {
+    return Measurement{row.number(0), row.number(1),
+                       row.number(2), row.number(3),
+                       row.number(4), static_cast<double>(row.number(5)) / kMicroseconds,
+                       row.number(6), static_cast<double>(row.number(7)) / kMicroseconds};
+  });
+}
+
+bool Catalogue::isMeasured(int64_t day) {
+  Statement& statement = sql("SELECT 1 FROM measurement WHERE day = ?");
+  statement.bind(day);
+  return first(statement, [](const Statement& row) { return row.number(0); }).has_value();
+}
+
+void Catalogue::addMeasurement(const Measurement& measurement) {
+  sql("INSERT OR REPLACE INTO measurement VALUES (?, ?, ?, ?, ?, ?, ?, ?)")
+      .bind(measurement.day)
+      .bind(measurement.messages)
+      .bind(measurement.indexBytes)
+      .bind(measurement.storeBytes)
+      .bind(measurement.scans)
+      .bind(static_cast<int64_t>(measurement.scanSeconds * kMicroseconds))
+      .bind(measurement.merges)
+      .bind(static_cast<int64_t>(measurement.mergeSeconds * kMicroseconds))
+      .run();
+  sql("DELETE FROM measurement WHERE day NOT IN "
+      "(SELECT day FROM measurement ORDER BY day DESC LIMIT ?)")
+      .bind(kMaxMeasurements)
+      .run();
+}
 
 }  // namespace mailsync

@@ -174,8 +174,7 @@ bool Delivery::sendPiece(Items items, TLErrorOut error) {
   const bool noted = note(
       [&] {
         for (const ReadBatch::Item& item : items) {
-          _catalogue.setSequence(item.message, _sequence);
-          _catalogue.setDigest(item.message, item.digest);
+          _catalogue.setSent(item.message, _sequence, item.digest, item.date);
         }
       },
       error);

@@ -5,6 +5,7 @@
 #include <algorithm>
 
 #include "cli/Identifier.h"
+#include "cli/MailDate.h"
 #include "records/TLParamsManager.h"
 
 namespace mailsync {
@@ -30,12 +31,12 @@ std::optional<client::SearchServiceProxy::Items> itemsAt(client::SearchServicePr
   return service.searchItems(query, 0, protectionClass, kInventoryItems, error);
 }
 
-std::optional<std::vector<std::string>> readInventory(client::SearchServiceProxy& service,
-                                                      const std::string& protectionClass,
-                                                      const std::vector<std::string>& roots,
-                                                      const std::vector<std::string>& folders,
-                                                      TLErrorOut error) {
-  std::vector<std::string> identifiers;
+std::optional<std::vector<IndexedMessage>> readInventory(client::SearchServiceProxy& service,
+                                                         const std::string& protectionClass,
+                                                         const std::vector<std::string>& roots,
+                                                         const std::vector<std::string>& folders,
+                                                         TLErrorOut error) {
+  std::vector<IndexedMessage> messages;
   const auto isWanted = [&](const std::string& identifier) {
     const auto location = cli::parseIdentifier(identifier);
     return location && std::any_of(roots.begin(), roots.end(), [&](const std::string& root) {
@@ -49,7 +50,8 @@ std::optional<std::vector<std::string>> readInventory(client::SearchServiceProxy
     if (items->size() >= static_cast<size_t>(kInventoryItems)) return false;
     for (const auto& item : *items) {
       std::string identifier = platform::toUTF8(platform::orEmpty(item->identifier()));
-      if (isWanted(identifier)) identifiers.push_back(std::move(identifier));
+      if (!isWanted(identifier)) continue;
+      messages.push_back({std::move(identifier), cli::wholeSeconds(cli::dateOf(*item))});
     }
     return true;
   };
@@ -65,7 +67,7 @@ std::optional<std::vector<std::string>> readInventory(client::SearchServiceProxy
       if (isAtOrBelow(folder, root) && !take(folder)) return std::nullopt;
     }
   }
-  return identifiers;
+  return messages;
 }
 
 }  // namespace mailsync

@@ -8,6 +8,7 @@
 
 #include "cli/Identifier.h"
 #include "cli/IndexPipeline.h"
+#include "cli/MailDate.h"
 #include "cli/MailFile.h"
 #include "cli/MessageParser.h"
 #include "platform/Queue.h"
@@ -91,7 +92,8 @@ class ItemReader::Reading {
     _batch.bytes += item.bytes.size();
     _batch.cut += parsed.cut ? 1 : 0;
     const bool replace = waiting.message.replace || waiting.message.sequence != kWaiting;
-    _batch.items.push_back({waiting.message.id, replace, digest, std::move(item)});
+    _batch.items.push_back({waiting.message.id, replace, digest,
+                            cli::wholeSeconds(cli::dateOf(*parsed.item)), std::move(item)});
     return flushIfFull();
   }
 

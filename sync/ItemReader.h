@@ -18,6 +18,7 @@ struct ReadBatch {
     int64_t message;  // in the catalogue
     bool replace;     // an older version may be in the index
     std::string digest;
+    std::optional<int64_t> date;  // seconds since 1970
     client::EncodedItem item;
   };
   struct Failure {

@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
+#include <ctime>
 #include <filesystem>
 #include <thread>
 
@@ -58,6 +59,14 @@ void noteEnd(const SyncSettings& settings) {
   const platform::FileDescriptor file(
       open(endPath(settings).c_str(), O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
   if (file.get() >= 0) futimens(file.get(), nullptr);
+}
+
+// Such as 20240206.
+int64_t today() {
+  const std::time_t now = std::time(nullptr);
+  std::tm parts{};
+  localtime_r(&now, &parts);
+  return (parts.tm_year + 1900) * 10000 + (parts.tm_mon + 1) * 100 + parts.tm_mday;
 }
 
 // Locks one catalogue. Waits for another process for at most `lockPatience`.
@@ -272,8 +281,22 @@ class Run {
     const bool done = delivery.run(_stored, error);
     _report.delivery = delivery.counts();
     _report.cancelled = _observer.cancelled();
-    if (done && !_report.cancelled) noteEnd(_settings);
-    return done;
+    if (!done || _report.cancelled) return done;
+    noteEnd(_settings);
+    return measure(error);
+  }
+
+  bool measure(TLErrorOut error) {
+    const int64_t day = today();
+    if (!_settings.measure || _catalogue->isMeasured(day)) return true;
+    auto measurement = _settings.measure();
+    if (!measurement) return true;
+    measurement->day = day;
+    _catalogue->begin();
+    _catalogue->addMeasurement(*measurement);
+    if (_catalogue->commit()) return true;
+    platform::setError(error, *_catalogue->failure());
+    return false;
   }
 
   const SyncSettings& _settings;

@@ -34,6 +34,9 @@ struct SyncSettings {
   // The number of messages that may wait. If more wait, only those found by this run are sent, and
   // only if they do not exceed the limit either. 0 means no limit.
   uint64_t backlogLimit = 0;
+  // The figures for the history; called at most once a day, at the end of a complete run. Nullopt
+  // if they are not known now; may be empty.
+  std::function<std::optional<Measurement>()> measure = {};
   bool pruneMissing = false;
   bool retryFailed = false;
   bool dryRun = false;

@@ -336,7 +336,8 @@ std::string MailboxScan::pathOf(const FileRow& row) const {
 
 bool MailboxScan::excluded(const std::string& path) const {
   return std::find(_settings.excluded.begin(), _settings.excluded.end(), path) !=
-         _settings.excluded.end();
+             _settings.excluded.end() ||
+         cli::isLinkFolder(path);
 }
 
 FileRow MailboxScan::rowOf(const struct stat& info) const {

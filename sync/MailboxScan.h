@@ -50,7 +50,7 @@ struct ScanSettings {
 // folder and name is the same message, whatever its flags, and a file with two paths counts once.
 //
 // Symbolic links to files are followed, and a root may be a link. Directories are entered up to 64
-// levels deep. One thread.
+// levels deep; link folders of searches are not. One thread.
 class MailboxScan {
  public:
   MailboxScan(Catalogue& catalogue, ScanSettings settings);

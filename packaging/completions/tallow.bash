@@ -11,7 +11,7 @@ _tallow() {
     vacuum state dump validate purge help'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
     --verbose --dry-run --prune-missing --retry --on-battery --query --filter --param --offset --sort --count
-    --print0 --threads --raw --attachment --output --force --mutt --delete --folder --help --version'
+    --print0 --threads --maildir --html --raw --attachment --output --force --mutt --delete --folder --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
     prev=${COMP_WORDS[COMP_CWORD - 2]}
@@ -23,8 +23,8 @@ _tallow() {
     --format) mapfile -t COMPREPLY < <(compgen -W 'text json files message-ids' -- "$cur"); return ;;
     --color) mapfile -t COMPREPLY < <(compgen -W 'auto always never' -- "$cur"); return ;;
     --sort) mapfile -t COMPREPLY < <(compgen -W 'relevance date' -- "$cur"); return ;;
-    --runtime-dir | --state-dir | --folder) compopt -o dirnames; return ;;
-    -o | --output) compopt -o default; return ;;
+    --runtime-dir | --state-dir | --folder | --maildir) compopt -o dirnames; return ;;
+    -o | --output | --html) compopt -o default; return ;;
     --class | --name | --limit | --offset | --wait | --attachment | --query | --filter | --param) return ;;
   esac
   if [[ $cur == -* ]]; then

@@ -40,6 +40,8 @@ options=(
   '--sort=[order]:order:(relevance date)'
   '--count[only how many results]'
   '--threads[results by conversation]'
+  '--maildir=[a Maildir of links to the results]:directory:_files -/'
+  '--html=[write a page for browsers]:file:_files'
   '--raw[the message as it is on the disk]'
   '--attachment=[save this attachment]:number:'
   '(-o --output)'{-o+,--output=}'[where to]:file:_files'

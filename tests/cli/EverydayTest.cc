@@ -7,12 +7,15 @@
 #include <cstdlib>
 #include <filesystem>
 #include <nlohmann/json.hpp>
+#include <regex>
+#include <set>
 
 #include "platform/Files.h"
 #include "tests/client/FakeDaemon.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 
+namespace fs = std::filesystem;
 using testing::HasSubstr;
 using testing::StartsWith;
 
@@ -245,6 +248,108 @@ TEST_F(EverydayTest, StatusOfAllClassesAndOfDeletedMail) {
   EXPECT_FALSE(std::filesystem::exists(directory / "state/TallowSearch/private"));
   EXPECT_EQ(run("sync"), 0) << errors;
   EXPECT_EQ(classes(state).size(), 3U);
+}
+
+TEST_F(EverydayTest, LinksTheResultsForMailPrograms) {
+  const std::string place = directory / "folders/found";
+  const std::string search = "search --maildir=" + place + ' ';
+  const auto targets = [&] {
+    std::vector<std::string> found;
+    for (const char* const part : {"cur", "new"}) {
+      for (const auto& entry : fs::directory_iterator(place + '/' + part)) {
+        found.push_back(fs::read_symlink(entry.path()).string() + " " +
+                        entry.path().extension().string());
+      }
+    }
+    return found;
+  };
+  EXPECT_EQ(run(search + "folder:family"), 0) << errors;
+  EXPECT_EQ(output, "10 messages in " + place + '\n');
+  EXPECT_THAT(targets(),
+              testing::IsSupersetOf({mail + "/family/cur/1707297540.M002.harbour:2,RS .tallow:2,RS",
+                                     mail + "/family/new/1707831480.M009.harbour .tallow"}));
+  // Of a mailbox there are copies; those of compressed mail are not compressed.
+  ASSERT_EQ(std::system(("gzip " + mail + "/drafts/harvest-toast.eml").c_str()), 0);
+  ASSERT_EQ(run("index " + mail), 0);
+  std::filesystem::remove(mail + "/family/new/1707831480.M009.harbour");
+  EXPECT_EQ(run(search + "--format=json invoice OR toast OR folder:family"), 0) << errors;
+  const auto counts = nlohmann::json::parse(output);
+  EXPECT_EQ(counts["maildir"], place);
+  EXPECT_EQ(counts["linked"], 9);
+  EXPECT_EQ(counts["leftOut"], 2);  // the one that was removed, and the one that was compressed
+  const std::string copies = directory / "copies";
+  ASSERT_EQ(std::system(("cat " + place + "/.tallow-folder/* >" + copies).c_str()), 0);
+  EXPECT_THAT(read("copies"), StartsWith("X-Tallow-Copy-Of: "));
+  EXPECT_THAT(read("copies"), HasSubstr("X-Tallow-Copy-Of: mbox" + mail +
+                                        "/archive.mbox?offset=0\nReceived: from"));
+  EXPECT_THAT(read("copies"), HasSubstr("harvest-toast.eml.gz\nFrom: "));
+  // The folder is not mail, whoever looks into it.
+  EXPECT_EQ(run("sync --format=json " + directory / "folders"), 0) << errors;
+  EXPECT_EQ(nlohmann::json::parse(output)["toSend"], 0);
+  EXPECT_EQ(run("index " + place), 2);
+  // Each search takes the links of the one before; one that fails takes nothing.
+  EXPECT_EQ(run(search + "--limit=2 invoice"), 0);
+  EXPECT_EQ(targets().size(), 2U);
+  EXPECT_EQ(run(search + "@nothing"), 2);
+  EXPECT_EQ(run(search + "--count x"), 2);
+  EXPECT_EQ(targets().size(), 2U);
+  EXPECT_EQ(run(search + "nothingofthekind"), 1);
+  EXPECT_TRUE(targets().empty());
+  EXPECT_EQ(run(search + "folder:family"), 0);
+  EXPECT_EQ(run(search), 0);
+  EXPECT_EQ(output, "0 messages in " + place + '\n');
+  EXPECT_TRUE(targets().empty());
+  EXPECT_EQ(run("search --maildir=" + mail + " invoice"), 2);
+  EXPECT_THAT(errors, HasSubstr("is not from a search"));
+}
+
+TEST_F(EverydayTest, WritesTheStatusAsAPage) {
+  ASSERT_EQ(run("sync " + mail), 0) << errors;
+  EXPECT_EQ(run("status --html page.html", "STATE_DIRECTORY=" + directory / "state"), 0) << errors;
+  EXPECT_EQ(output, "wrote page.html\n");
+  const std::string page = read("page.html");
+  for (const std::string& text :
+       {"<span class=\"path\">" + mail + "/family</span><span class=\"count\">10</span>",
+        std::string("<title>2024-02: "), std::string("A sync adds one entry a day"),
+        std::string("device unlocked")}) {
+    EXPECT_THAT(page, HasSubstr(text));
+  }
+  // The former page is replaced; nothing else is.
+  EXPECT_EQ(run("status --html page.html"), 0);
+  fs::create_symlink("page.html", directory / "link");
+  EXPECT_EQ(run("status --html link"), 2);
+  EXPECT_THAT(errors, HasSubstr("link: this is not a plain file, and stays"));
+  EXPECT_EQ(run("status --html ."), 2);
+  EXPECT_EQ(run("status --html none/page.html"), 2);
+  EXPECT_EQ(run("status --html page.html --format=json"), 2);
+  EXPECT_NE(std::system(("ls " + directory / "page.html.* 2>/dev/null").c_str()), 0);
+}
+
+// What `tallow help` lists is in the manual and in the completions of both shells.
+TEST_F(EverydayTest, OptionsAreDocumented) {
+  const auto words = [](const std::string& text, const std::regex& pattern) {
+    return std::set<std::string>(std::sregex_token_iterator(text.begin(), text.end(), pattern, 1),
+                                 std::sregex_token_iterator());
+  };
+  ASSERT_EQ(run("help"), 0);
+  const auto commands = words(output, std::regex("\n  ([a-z]+) +[A-Z]"));
+  EXPECT_THAT(commands, testing::Contains("search"));
+  std::set<std::string> options = words(output, std::regex("(--[a-z0-9-]+)"));
+  for (const std::string& command : commands) {
+    ASSERT_EQ(run("help " + command), 0);
+    options.merge(words(output, std::regex("\n  (?:-.,)?(--[a-z0-9-]+)")));
+  }
+  EXPECT_THAT(options, testing::IsSupersetOf({"--threads", "--class", "--output", "--html"}));
+  for (const char* const page :
+       {"man/tallow.1", "completions/tallow.bash", "completions/tallow.zsh"}) {
+    std::string text =
+        platform::readFile(std::string(TALLOW_PACKAGING) + '/' + page, size_t{1} << 20, nullptr)
+            .value_or("");
+    std::erase(text, '\\');
+    for (const std::string& option : options) {
+      EXPECT_TRUE(std::regex_search(text, std::regex(option + "([^a-z-]|$)"))) << page << option;
+    }
+  }
 }
 
 // The signal comes while the daemon has the first batch.

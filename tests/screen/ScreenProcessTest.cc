@@ -16,7 +16,7 @@
 #include "cli/Terminal.h"
 #include "platform/Files.h"
 #include "tests/daemon/DaemonProcess.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/TmuxTest.h"
 
 // The program in a real terminal, with a real daemon and the sample mail. Skipped if tmux is
 // missing, except with CI=true (scripts/ci-packages.list).
@@ -27,31 +27,18 @@ using testing::Not;
 
 namespace {
 
-constexpr const char* kTerminal = "/usr/bin/tmux";
-constexpr std::chrono::seconds kPatience(60);
+using testsupport::outputOf;
 
-std::string outputOf(const std::string& command) {
-  std::string output;
-  FILE* const pipe = popen((command + " 2>/dev/null").c_str(), "r");
-  if (pipe == nullptr) return output;
-  char buffer[4096];
-  for (size_t n = 0; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
-  pclose(pipe);
-  return output;
-}
-
-class ScreenProcessTest : public testing::Test {
+class ScreenProcessTest : public testsupport::TmuxTest {
  protected:
   void SetUp() override {
-    if (!fs::exists(kTerminal)) {
-      const char* const ci = std::getenv("CI");
-      ASSERT_FALSE(ci != nullptr && std::string(ci) == "true") << "tmux is missing";
+    if (!testsupport::missingProgram({"tmux"}).empty()) {
+      ASSERT_FALSE(testsupport::isCI()) << "tmux is missing";
       GTEST_SKIP() << "tmux is not installed";
     }
     fs::copy(TALLOW_SAMPLE_MAIL, mail, fs::copy_options::recursive);
     startDaemon();
   }
-  void TearDown() override { outputOf(tmux("kill-server")); }
 
   void startDaemon() {
     daemon.reset();
@@ -65,58 +52,17 @@ class ScreenProcessTest : public testing::Test {
     return TALLOW_PROGRAM " --runtime-dir " + daemon->runtimeDirectory();
   }
 
-  [[nodiscard]] std::string tmux(const std::string& arguments) const {
-    return fmt::format(
-        "env -u TMUX -u STATE_DIRECTORY LC_ALL=C.UTF-8 HOME={0} XDG_STATE_HOME={0}/client "
-        "XDG_CONFIG_HOME={0}/config TZ=UTC SHELL=/bin/bash {1} {2} -u -f /dev/null -S {0}/tmux {3}",
-        directory.path(), variables, kTerminal, arguments);
-  }
   // Starts a shell in a terminal of this size, and the program in it.
   void open(int columns, int rows, const std::string& arguments = "") {
-    outputOf(tmux(
-        fmt::format("new-session -d -s t -x {} -y {} "
-                    "\"PS1='ready> ' exec bash --norc --noprofile -i\" \\; set -g set-clipboard on",
-                    columns, rows)));
+    start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
     await("ready>");
     type(program() + arguments);
     press("Enter");
     await("Search:");
   }
-  void type(const std::string& text) const {
-    outputOf(tmux("send-keys -t t -l -- '" + text + "'"));
-  }
-  void press(const std::string& keys) const { outputOf(tmux("send-keys -t t " + keys)); }
-  [[nodiscard]] std::string screen() const { return outputOf(tmux("capture-pane -p -t t")); }
-  [[nodiscard]] std::vector<std::string> lines() const {
-    std::istringstream text(screen());
-    std::vector<std::string> all;
-    for (std::string line; std::getline(text, line);) all.push_back(line);
-    return all;
-  }
-
-  // Polls the screen until the condition holds.
-  void awaitThat(const std::function<bool(const std::string&)>& holds,
-                 const std::string& what) const {
-    const auto end = std::chrono::steady_clock::now() + kPatience;
-    std::string seen;
-    while (std::chrono::steady_clock::now() < end) {
-      seen = screen();
-      if (holds(seen)) return;
-    }
-    FAIL() << what << " is not so:\n" << seen;
-  }
-  void await(const std::string& text) const {
-    awaitThat([&](const std::string& seen) { return seen.find(text) != std::string::npos; },
-              "\"" + text + "\" on the screen");
-  }
-  void awaitGone(const std::string& text) const {
-    awaitThat([&](const std::string& seen) { return seen.find(text) == std::string::npos; },
-              "\"" + text + "\" not on the screen");
-  }
-
   // The process ID of the program, a child of the shell.
   [[nodiscard]] pid_t process() const {
-    const int shell = std::atoi(outputOf(tmux("display-message -p -t t '#{pane_pid}'")).c_str());
+    const int shell = std::atoi(tmux("display-message -p -t t '#{pane_pid}'").c_str());
     return std::atoi(outputOf(fmt::format("cat /proc/{0}/task/{0}/children", shell)).c_str());
   }
   // Expects that the program has ended with this status, and that the terminal is in line mode with
@@ -128,9 +74,7 @@ class ScreenProcessTest : public testing::Test {
     await(fmt::format("left={}\n4\n", status));
   }
 
-  const testsupport::TemporaryDirectory directory;
   const std::string mail = directory / "mail";
-  std::string variables;  // environment variables, NAME=VALUE
   std::unique_ptr<testsupport::DaemonProcess> daemon;
 };
 
@@ -164,8 +108,7 @@ TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
   await("Your invoice 4471");
   // Pasted text goes into the line, even if its characters are keys.
   press("C-e C-u");
-  outputOf(tmux(
-      "set-buffer -- \"$(printf 'photos\\rfrom\\tthe\\033OA\\017')\" \\; paste-buffer -p -t t"));
+  tmux("set-buffer -- \"$(printf 'photos\\rfrom\\tthe\\033OA\\017')\" \\; paste-buffer -p -t t");
   await("Search: photos from the");
   await("Photos from the island");
   EXPECT_THAT(screen(), Not(HasSubstr("TALLOW_OPEN")));
@@ -200,7 +143,7 @@ TEST_F(ScreenProcessTest, MailsAreReadSortedAndFiltered) {
   await("Search: invoice");
   press("C-y");
   await("copied " + mail + "/family/cur/");
-  EXPECT_THAT(outputOf(tmux("show-buffer")), HasSubstr(mail + "/family/cur/"));
+  EXPECT_THAT(tmux("show-buffer"), HasSubstr(mail + "/family/cur/"));
 }
 
 TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
@@ -225,7 +168,7 @@ TEST_F(ScreenProcessTest, DrawsAnySize) {
   type("invoice");
   await("Your invoice 4471");
   const auto resize = [&](int columns, int rows) {
-    outputOf(tmux(fmt::format("resize-window -t t -x {} -y {}", columns, rows)));
+    tmux(fmt::format("resize-window -t t -x {} -y {}", columns, rows));
   };
   resize(130, 30);
   // The preview is next to the list.
@@ -287,8 +230,7 @@ TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
     EXPECT_EQ(cli::cleanForTerminal(line), line);
     EXPECT_LE(cli::columnsTaken(line), 90u);
   }
-  EXPECT_EQ(outputOf(tmux("display-message -p -t t '#{pane_title}'")).find("title"),
-            std::string::npos);
+  EXPECT_EQ(tmux("display-message -p -t t '#{pane_title}'").find("title"), std::string::npos);
   press("Down C-y");
   await("copied ");
   press("Enter");

@@ -392,6 +392,28 @@ TEST_F(MailSyncTest, FullDiskLosesNothing) {
   EXPECT_EQ(indexed(), expected);
 }
 
+// The dates are known even if another catalogue has sent the mail.
+TEST_F(MailSyncTest, KeepsAHistory) {
+  bool known = false;
+  mailsync::Measurement one;
+  settings.measure = [&] { return known ? std::optional(one) : std::nullopt; };
+  for (const char* const name : {"1", "2", "3"}) {
+    add(std::string("a/cur/") + name, name);
+    ASSERT_TRUE(sync());
+    known = true;
+    ++one.messages;
+    const auto catalogue = mailsync::openCatalogue(settings, nullptr);
+    const auto days = catalogue->measurements();
+    ASSERT_EQ(days.size(), *name == '1' ? 0U : 1U);
+    for (const auto& day : days) EXPECT_EQ(day.messages, 1);
+  }
+  fs::remove_all(settings.catalogueDirectory);
+  ASSERT_TRUE(sync());
+  const auto months = mailsync::openCatalogue(settings, nullptr)->monthCounts();
+  ASSERT_EQ(months.size(), 1U);
+  EXPECT_EQ(months.front().month + fmt::format(": {}", months.front().messages), "2024-01: 3");
+}
+
 // Random histories of mailbox, daemon and catalogue. After each successful sync the index matches
 // the mailbox.
 TEST_F(MailSyncTest, IndexMatchesTheMailboxAfterRandomHistories) {

@@ -104,7 +104,10 @@ class WatchProcessTest : public testing::Test {
   [[nodiscard]] std::set<std::string> indexed() const {
     client::SearchServiceProxy service(daemon->runtimeDirectory());
     const auto found = mailsync::readInventory(service, "default", {mail}, {mail}, nullptr);
-    return found ? std::set(found->begin(), found->end()) : std::set<std::string>{"no answer"};
+    if (!found) return {"no answer"};
+    std::set<std::string> identifiers;
+    for (const auto& message : *found) identifiers.insert(message.identifier);
+    return identifiers;
   }
   [[nodiscard]] std::set<std::string> onDisk() const {
     std::set<std::string> found;

@@ -1,0 +1,214 @@
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <regex>
+
+#include "platform/Files.h"
+#include "tests/daemon/DaemonProcess.h"
+#include "tests/support/TmuxTest.h"
+
+// The settings of packaging/mail-programs in the programs that they are for: search, read, reply
+// without sending, and search again. Skipped where a program is missing, but not where CI=true
+// (scripts/ci-packages.list).
+
+namespace fs = std::filesystem;
+using testing::HasSubstr;
+using testing::Not;
+using testsupport::missingProgram;
+
+namespace {
+
+class MailProgramsTest : public testsupport::TmuxTest {
+ protected:
+  // Indexes the sample mail. The program finds `tallow`, and an editor that only keeps its file.
+  void prepare() {
+    ASSERT_TRUE(daemon.ready());
+    if (!fs::exists(mail)) fs::copy(TALLOW_SAMPLE_MAIL, mail, fs::copy_options::recursive);
+    fs::create_directories(directory / "bin");
+    fs::create_symlink(TALLOW_PROGRAM, directory / "bin/tallow");
+    write("bin/editor", "#!/bin/sh\ncp \"$1\" \"$HOME/reply\"\n");
+    fs::permissions(directory / "bin/editor", fs::perms::owner_all);
+    variables = fmt::format(
+        "PATH={0}/bin:$PATH RUNTIME_DIRECTORY={1} STATE_DIRECTORY={0}/state TERM=xterm-256color",
+        directory.path(), daemon.runtimeDirectory());
+    ASSERT_EQ(std::system(fmt::format("{} --runtime-dir {} index {} >/dev/null 2>&1",
+                                      TALLOW_PROGRAM, daemon.runtimeDirectory(), mail)
+                              .c_str()),
+              0);
+  }
+
+  void write(const std::string& name, const std::string& text) const {
+    fs::create_directories(fs::path(directory / name).parent_path());
+    std::ofstream(directory / name) << text;
+  }
+  [[nodiscard]] std::string read(const std::string& name) const {
+    return platform::readFile(directory / name, 100000, nullptr).value_or("");
+  }
+  // One of the files that are tested.
+  [[nodiscard]] static std::string settings(const std::string& name) {
+    return platform::readFile(std::string(TALLOW_MAIL_PROGRAMS) + '/' + name, 100000, nullptr)
+        .value_or("");
+  }
+  // What the editor was given, once it has the text.
+  [[nodiscard]] std::string awaitReply(const std::string& text) const {
+    awaitThat([&](const std::string&) { return read("reply").find(text) != std::string::npos; },
+              "a reply with " + text);
+    return read("reply");
+  }
+  [[nodiscard]] size_t links() const {
+    size_t count = 0;
+    for (const char* const part : {"cur", "new"}) {
+      const auto names = platform::listDirectory(folder + '/' + part, nullptr);
+      count += names ? names->size() : 0;
+    }
+    return count;
+  }
+
+  const std::string mail = directory / "mail";
+  const std::string folder = directory / ".cache/tallow/folders/search";
+  const testsupport::DaemonProcess daemon{directory.path()};
+};
+
+// Skips or fails the test without these programs.
+#define NEED_PROGRAMS(...)                                                           \
+  if (const std::string missing = missingProgram({__VA_ARGS__}); !missing.empty()) { \
+    ASSERT_FALSE(testsupport::isCI()) << missing << " is missing";                   \
+    GTEST_SKIP() << missing << " is not installed";                                  \
+  }
+
+}  // namespace
+
+TEST_F(MailProgramsTest, Neomutt) {
+  NEED_PROGRAMS("tmux", "neomutt")
+  prepare();
+  write("muttrc",
+        fmt::format("set from=mara.lindqvist@example.org realname=Mara sendmail=/bin/false\n"
+                    "set folder={0} spoolfile={0}/family editor={1}/bin/editor edit_headers=yes "
+                    "include=yes fast_reply=yes sleep_time=0\nsource {2}/tallow.muttrc\n",
+                    mail, directory.path(), TALLOW_MAIL_PROGRAMS));
+  start("neomutt -F " + directory / "muttrc", 110, 30);
+  await("[Msgs:10 ");
+  // In the open folder.
+  press("M-s");
+  await("Limit to messages matching: ~I");
+  type("first invoice");
+  press("Enter");
+  await("[Msgs:1/10 ");
+  await("First invoice for the shelves");
+  // In all folders.
+  press("S");
+  await("Search:");
+  type("invoice for");
+  press("Enter");
+  await("search [Msgs:7 ");
+  await("Your invoice 4471");
+  EXPECT_EQ(links(), 7U);
+  // The links are gone with the next search, and neomutt asks nothing about them.
+  press("S");
+  await("Search:");
+  type("brackets brass");
+  press("Enter");
+  await("search [Msgs:1 ");
+  EXPECT_EQ(links(), 1U);
+  press("Enter");
+  await("Dear Mara,");
+  press("r");
+  EXPECT_THAT(awaitReply("> Dear Mara"), HasSubstr("\nTo: Samir Haddad <samir@example.com>\n"));
+  await("Aborted unmodified message");
+}
+
+TEST_F(MailProgramsTest, Aerc) {
+  NEED_PROGRAMS("tmux", "aerc")
+  prepare();
+  fs::create_directory(mail + "/family/tmp");
+  write("config/aerc/accounts.conf",
+        fmt::format("[Mail]\nsource = maildir://{}\ndefault = family\n"
+                    "from = Mara <mara.lindqvist@example.org>\noutgoing = /bin/false\n",
+                    mail) +
+            settings("aerc-accounts.conf"));
+  fs::permissions(directory / "config/aerc/accounts.conf",
+                  fs::perms::owner_read | fs::perms::owner_write);
+  write("config/aerc/aerc.conf",
+        fmt::format("[general]\nunsafe-accounts-conf=true\n[compose]\neditor={}/bin/editor\n{}",
+                    directory.path(), settings("aerc.conf")));
+  write("config/aerc/binds.conf", settings("aerc-binds.conf") +
+                                      "n = :next-tab<Enter>\n<Enter> = :view<Enter>\n"
+                                      "g = :select 0<Enter>\n[view]\nr = :reply -q<Enter>\n");
+  ASSERT_EQ(std::system((variables + " HOME=" + directory.path() +
+                         " tallow search --maildir=" + folder + " >/dev/null")
+                            .c_str()),
+            0);
+  start("aerc", 120, 30);
+  await("Elena Ruiz");
+  press("n");
+  await("(no messages)");
+  // The open folder shows the results of each search.
+  for (const auto& [words, found] : {std::pair("oarlock fixed", "Oarlock fixed"),
+                                     {"harbour", "Minutes of the rowing club"},
+                                     {"nothingofthekind", "(no messages)"},
+                                     {"brackets brass", "First invoice for the shelves"}}) {
+    press("S");
+    await("Search:");
+    type(words);
+    press("Enter");
+    await(found);
+  }
+  awaitThat([&](const std::string&) { return links() == 1; }, "one link");
+  press("g Enter");
+  await("From: \"Samir Haddad\"");
+  press("r");
+  EXPECT_THAT(awaitReply("> Dear Mara"), HasSubstr("Samir Haddad wrote"));
+  await("Send this email?");
+  EXPECT_THAT(screen(), HasSubstr("To: \"Samir Haddad\" <samir@example.com>"));
+}
+
+TEST_F(MailProgramsTest, Emacs) {
+  NEED_PROGRAMS("tmux", "emacs")
+  prepare();
+  start(fmt::format("emacs -nw -Q -l {}/tallow.el -f tallow-search", TALLOW_MAIL_PROGRAMS), 110,
+        40);
+  await("Search mail:");
+  type("randonn\u00E9e");
+  press("Enter");
+  await("2024-02-09 11:10 Ren\u00E9 Dufour");
+  press("Enter");
+  await("Bonjour,");
+  await("From:     Ren\u00E9 Dufour <rene.dufour@example.com>");
+  press("r");
+  await("To: Ren\u00E9 Dufour <rene.dufour@example.com>");
+  await("Subject: Re: Randonn\u00E9e dimanche");
+  await("> Bonjour,");
+}
+
+// Nothing of a mail changes the list, and the file compiles without a warning.
+TEST_F(MailProgramsTest, EmacsWithHostileMail) {
+  NEED_PROGRAMS("tmux", "emacs")
+  fs::create_directories(mail);
+  write("mail/a.eml",
+        "From: \"a\x1b[2J\u202E\" <a@example.org>\nSubject: hostile\x07\u202E\u2066 " +
+            std::string(100000, 'm') + "\nReply-To: b@example.org\n\nhostile\n");
+  prepare();
+  EXPECT_EQ(std::system(fmt::format("cp {1}/tallow.el {0} && cd {0} && emacs -Q --batch --eval "
+                                    "'(setq byte-compile-error-on-warn t)' -f batch-byte-compile "
+                                    "tallow.el >{0}/compiled 2>&1",
+                                    directory.path(), TALLOW_MAIL_PROGRAMS)
+                            .c_str()),
+            0)
+      << read("compiled");
+  start("emacs -nw -Q -l " + directory / "tallow.elc -f tallow-search", 110, 40);
+  await("Search mail:");
+  type("hostile");
+  press("Enter");
+  await("1 of 1 mails");
+  awaitThat(
+      [](const std::string& seen) {
+        return std::regex_search(seen, std::regex("\n +a \\[2J +hostile +m+[$]\n"));
+      },
+      "the row of the mail");
+  press("r");
+  await("To: b@example.org");
+}

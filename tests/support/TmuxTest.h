@@ -1,0 +1,47 @@
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <initializer_list>
+#include <string>
+#include <vector>
+
+#include "tests/support/TemporaryDirectory.h"
+
+namespace testsupport {
+
+// What a shell command writes to its standard output.
+[[nodiscard]] std::string outputOf(const std::string& command);
+
+// The first of these programs that is not installed; empty if all are. A test that lacks one is
+// skipped, but fails with CI=true (scripts/ci-packages.list).
+[[nodiscard]] std::string missingProgram(std::initializer_list<const char*> names);
+[[nodiscard]] bool isCI();
+
+// A test of programs in a real terminal, which tmux provides. The home directory is `directory`.
+class TmuxTest : public testing::Test {
+ protected:
+  void TearDown() override { tmux("kill-server"); }
+
+  // Starts `command` in a terminal of this size.
+  void start(const std::string& command, int columns, int rows) const;
+  // The output of a tmux command; the terminal is called t.
+  std::string tmux(const std::string& arguments) const;
+
+  void type(const std::string& text) const;  // without single quotes
+  void press(const std::string& keys) const;
+  [[nodiscard]] std::string screen() const;
+  [[nodiscard]] std::vector<std::string> lines() const;
+
+  // Poll the screen until the condition holds; a failure of the test after a minute.
+  void awaitThat(const std::function<bool(const std::string&)>& holds,
+                 const std::string& what) const;
+  void await(const std::string& text) const;
+  void awaitGone(const std::string& text) const;
+
+  const TemporaryDirectory directory;
+  std::string variables;  // environment variables of the programs, NAME=VALUE
+};
+
+}  // namespace testsupport
