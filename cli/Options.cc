@@ -140,6 +140,10 @@ bool isSearch(Command command) {
   return command == Command::search || command == Command::explain;
 }
 
+bool sendsMail(Command command) {
+  return command == Command::index || command == Command::sync || command == Command::watch;
+}
+
 void addQueryOptions(CLI::App& sub, Options& options) {
   sub.add_option("--query", options.query,
                  "Search by an expression instead of words; see tallow-query(7)")
@@ -179,6 +183,7 @@ void addSyncOptions(CLI::App& sub, Options& options) {
   sub.add_flag("--prune-missing", options.pruneMissing,
                "Delete the mail of directories that no longer exist");
   sub.add_flag("--retry", options.retryFailed, "Retry messages that could not be indexed");
+  sub.add_flag("--reread", options.reread, "Read and send everything again");
 }
 
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
@@ -193,6 +198,10 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (isSearch(row.command)) addQueryOptions(*sub, options);
   if (row.command == Command::search) addResultOptions(*sub, options);
   if (row.command == Command::sync) addSyncOptions(*sub, options);
+  if (sendsMail(row.command)) {
+    sub->add_flag("--attachments,!--no-attachments", options.attachments,
+                  "Index the text of attachments, or do not");
+  }
   if (row.command == Command::purge) {
     sub->add_flag("-n,--dry-run", options.dryRun, "Only show how much space it would free");
   }

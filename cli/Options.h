@@ -80,10 +80,14 @@ struct Options {
   bool mutt = false;
   bool removeSaved = false;
 
+  // For index, sync and watch: whether the text of attachments is indexed, by the user.
+  std::optional<bool> attachments;
+
   // For sync.
   bool dryRun = false;
   bool pruneMissing = false;
   bool retryFailed = false;
+  bool reread = false;
 
   // For watch.
   bool onBattery = false;  // large backlogs do not wait for power

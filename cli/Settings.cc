@@ -69,13 +69,16 @@ class Reader {
     _settings.largestMail = *bytes;
     return true;
   }
-  bool readOnBattery(const toml::node& value) {
-    const auto flag = value.value_exact<bool>();
-    if (flag) _settings.onBattery = *flag;
-    return flag.has_value();
-  }
+  bool readOnBattery(const toml::node& value) { return readFlag(value, _settings.onBattery); }
+  bool readAttachments(const toml::node& value) { return readFlag(value, _settings.attachments); }
 
  private:
+  static bool readFlag(const toml::node& value, bool& flag) {
+    const auto given = value.value_exact<bool>();
+    if (given) flag = *given;
+    return given.has_value();
+  }
+
   template <typename Take>
   static bool readTexts(const toml::node& value, const Take& take) {
     const toml::array* const list = value.as_array();
@@ -117,7 +120,7 @@ struct Key {
   const char* allowed;
 };
 
-constexpr std::array<Key, 5> kKeys{{
+constexpr std::array<Key, 6> kKeys{{
     {"roots", &Reader::readRoots, "a list of paths, each from / or ~/ on"},
     {"exclude", &Reader::readExcluded,
      "a list of folders, from / or ~/ on, or below each root: [\".Trash\", \"~/Mail/old\"]"},
@@ -127,6 +130,7 @@ constexpr std::array<Key, 5> kKeys{{
     {"largest_mail", &Reader::readLargestMail,
      "a number of bytes or a text such as \"500 KB\" or \"20 MB\", from 1 KB to 67 MB"},
     {"on_battery", &Reader::readOnBattery, "true or false"},
+    {"attachments", &Reader::readAttachments, "true or false"},
 }};
 
 std::string quoted(std::string_view text) {

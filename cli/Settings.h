@@ -17,6 +17,7 @@ struct Settings {
   std::map<std::string, std::string> classes;  // protection class by folder
   uint64_t largestMail = 0;                    // in bytes; 0 if the user set no limit
   bool onBattery = false;
+  bool attachments = true;  // their text is indexed
 };
 
 // tallow/config.toml in $XDG_CONFIG_HOME, by default ~/.config.

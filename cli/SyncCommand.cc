@@ -7,6 +7,7 @@
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
+#include "cli/HelperProgram.h"
 #include "cli/ProgressBar.h"
 #include "cli/Results.h"
 
@@ -104,6 +105,7 @@ mailsync::SyncSettings syncSettings(const Options& options) {
   settings.patience = options.patience();
   settings.pruneMissing = options.pruneMissing;
   settings.retryFailed = options.retryFailed;
+  settings.reread = options.reread;
   settings.dryRun = options.dryRun;
   return settings;
 }
@@ -113,6 +115,7 @@ mailsync::SyncSettings syncSettings(const Options& options, const MailboxGroup& 
   settings.protectionClass = group.protectionClass;
   settings.excluded = group.excluded;
   settings.largestMessage = group.largestMail;
+  settings.extractProgram = extractProgram(options, group.attachments);
   return settings;
 }
 

@@ -80,18 +80,17 @@ bool waitFor(int socket, ExtractProcess::Clock::time_point until) {
 
 }  // namespace
 
-std::optional<ExtractProcess::Text> ExtractProcess::text(Kind kind, std::string_view file,
-                                                         size_t limit,
-                                                         std::chrono::milliseconds patience) {
-  if (file.size() > kMaxFileBytes) return Text{Outcome::tooLarge, {}};
-  if (file.empty()) return Text{Outcome::empty, {}};
+ExtractProcess::Text ExtractProcess::text(Kind kind, std::string_view file, size_t limit,
+                                          std::chrono::milliseconds patience) {
+  if (file.size() > kMaxFileBytes) return {Outcome::tooLarge, {}};
+  if (file.empty()) return {Outcome::empty, {}};
   const auto most = static_cast<uint32_t>(std::clamp<size_t>(limit, 1, kMaxTextBytes));
-  if (_process < 0 && !start()) return std::nullopt;
+  if (_process < 0 && !start()) return {Outcome::notRun, {}};
   const auto until = Clock::now() + std::min<std::chrono::milliseconds>(patience, kPatience);
   auto answer = request(kind, file, most) ? reply(most, until) : std::nullopt;
-  if (answer) return answer;
+  if (answer) return std::move(*answer);
   end();
-  return Text{Clock::now() >= until ? Outcome::timedOut : Outcome::crashed, {}};
+  return {Clock::now() >= until ? Outcome::timedOut : Outcome::crashed, {}};
 }
 
 bool ExtractProcess::start() {

@@ -37,9 +37,9 @@ class ExtractProcess {
   ExtractProcess& operator=(const ExtractProcess&) = delete;
 
   // The text of a file, at most `limit` bytes and after at most `patience`, besides a start of the
-  // program. Nullopt if the program cannot be run.
-  [[nodiscard]] std::optional<Text> text(Kind kind, std::string_view file, size_t limit,
-                                         std::chrono::milliseconds patience = kPatience);
+  // program.
+  [[nodiscard]] Text text(Kind kind, std::string_view file, size_t limit,
+                          std::chrono::milliseconds patience = kPatience);
 
  private:
   [[nodiscard]] bool start();

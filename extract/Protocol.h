@@ -31,11 +31,12 @@ enum class Outcome : uint32_t {
   tooLarge,  // the file is not looked at
   timedOut,
   crashed,
+  notRun,  // the program cannot be run
   noRoom,  // the limit of the mail's text, of its attachments or of its time was reached before
 };
-inline constexpr std::array kOutcomeNames{"extracted", "cut",     "empty",
-                                          "encrypted", "damaged", "too-large",
-                                          "timed-out", "crashed", "no-room"};
+inline constexpr std::array kOutcomeNames{"extracted", "cut",       "empty",     "encrypted",
+                                          "damaged",   "too-large", "timed-out", "crashed",
+                                          "not-run",   "no-room"};
 
 [[nodiscard]] inline const char* nameOf(Kind kind) {
   return kKindNames[static_cast<size_t>(kind)];

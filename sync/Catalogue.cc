@@ -38,11 +38,15 @@ CREATE INDEX IF NOT EXISTS message_sequence ON message (sequence);
 CREATE TABLE IF NOT EXISTS deletion (identifier TEXT PRIMARY KEY, sequence INTEGER NOT NULL)
   WITHOUT ROWID;
 CREATE INDEX IF NOT EXISTS deletion_sequence ON deletion (sequence);
+CREATE TABLE IF NOT EXISTS attachment (
+  type TEXT NOT NULL, outcome TEXT NOT NULL, count INTEGER NOT NULL, PRIMARY KEY (type, outcome))
+  WITHOUT ROWID;
 )";
 
 constexpr const char* kDropAll = R"(
 DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS root; DROP TABLE IF EXISTS directory;
 DROP TABLE IF EXISTS file; DROP TABLE IF EXISTS message; DROP TABLE IF EXISTS deletion;
+DROP TABLE IF EXISTS attachment;
 )";
 
 // Acknowledged deletions to keep, in case the daemon's data is restored to an older state.

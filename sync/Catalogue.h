@@ -8,6 +8,7 @@
 #include <unordered_map>
 #include <vector>
 
+#include "extract/Protocol.h"
 #include "sync/Database.h"
 
 namespace mailsync {
@@ -156,6 +157,8 @@ class Catalogue {
   // An older version that may be in the index is deleted as well, unless `deleted` says that this
   // is done.
   void setFailed(int64_t message, const std::string& problem, bool deleted = false);
+  // As setStale, for all messages but those that failed.
+  void setAllStale();
   void removeMessage(int64_t id);
   // Messages that failed are tried again.
   void retryFailed();
@@ -177,6 +180,10 @@ class Catalogue {
   // wait, and so do those sent after `trusted`, because the index may have another version.
   // Messages that only the index has are deleted.
   void adopt(const std::vector<std::string>& identifiersInIndex, int64_t trusted);
+
+  // What became of attachments, each time that a message was read.
+  void addAttachments(const extract::Counts& counts);
+  [[nodiscard]] extract::Counts attachments();
 
   [[nodiscard]] std::vector<FolderCount> folderCounts();
   [[nodiscard]] std::vector<Problem> problems(size_t most);
