@@ -186,6 +186,14 @@ void addSyncOptions(CLI::App& sub, Options& options) {
   sub.add_flag("--reread", options.reread, "Read and send everything again");
 }
 
+void addAttachmentOptions(CLI::App& sub, Options& options) {
+  sub.add_flag_callback(
+      "--attachments", [&options] { options.attachments = true; },
+      "Index the text of attachments, whatever the settings say");
+  sub.add_flag_callback(
+      "--no-attachments", [&options] { options.attachments = false; }, "Do not index it");
+}
+
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   CLI::App* const sub = app.add_subcommand(row.name, row.help);
   sub->fallthrough();
@@ -198,10 +206,7 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
   if (isSearch(row.command)) addQueryOptions(*sub, options);
   if (row.command == Command::search) addResultOptions(*sub, options);
   if (row.command == Command::sync) addSyncOptions(*sub, options);
-  if (sendsMail(row.command)) {
-    sub->add_flag("--attachments,!--no-attachments", options.attachments,
-                  "Index the text of attachments, or do not");
-  }
+  if (sendsMail(row.command)) addAttachmentOptions(*sub, options);
   if (row.command == Command::purge) {
     sub->add_flag("-n,--dry-run", options.dryRun, "Only show how much space it would free");
   }

@@ -53,7 +53,7 @@ TEST(Settings, ErrorsNameFileLineKeyAndAllowedValues) {
             "config.toml:2: there is no key \"rots\"; did you mean \"roots\"?");
   EXPECT_EQ(complaintOf("colour = 1"),
             "config.toml:1: there is no key \"colour\"; the keys are roots, exclude, class, "
-            "largest_mail, on_battery");
+            "largest_mail, on_battery, attachments");
   EXPECT_EQ(complaintOf("# a\n\non_battery = \"yes\""),
             "config.toml:3: on_battery takes true or false");
   for (const char* const bad :
