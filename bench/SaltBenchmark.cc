@@ -9,6 +9,7 @@
 
 #include "salt/Coding.h"
 #include "salt/Database.h"
+#include "salt/PostingSet.h"
 #include "salt/Search.h"
 
 namespace {
@@ -187,8 +188,9 @@ void ScanPlaces(benchmark::State& state) {
       data.index->DeleteDoc(++unused);  // empties the cache
       state.ResumeTiming();
     }
-    results += *data.index->ScanPlaces(
-        prefix, SIZE_MAX, [&places](const auto&, const auto*, size_t count) { places += count; });
+    const auto found = data.index->ScanPlaces({prefix}, SIZE_MAX);
+    found.front()->deliver([&places](const auto&, const auto*, size_t count) { places += count; });
+    results += found.front()->suffixes();
   }
   benchmark::DoNotOptimize(places);
   state.SetItemsProcessed(static_cast<int64_t>(results));

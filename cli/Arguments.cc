@@ -1,6 +1,7 @@
 #include "cli/Arguments.h"
 
 #include <algorithm>
+#include <array>
 
 namespace cli {
 
@@ -27,7 +28,8 @@ bool isOption(const std::string& argument) {
 // one of the short options.
 void markWords(std::vector<std::string>& arguments) {
   const std::string& command = arguments.front();
-  if (command != "search" && command != "explain" && command != "save") return;
+  constexpr std::array<std::string_view, 4> kWithWords{"search", "explain", "save", "screen"};
+  if (std::ranges::find(kWithWords, command) == kWithWords.end()) return;
   for (std::string& argument : arguments) {
     if (argument == "--") break;
     const bool isShort = argument == "-h" || argument == "-v" || argument == "-y";

@@ -27,6 +27,9 @@ constexpr Row kRows[] = {
      "  tallow search '\"three loans\" OR subject:invoice' --sort=date\n"
      "  tallow search harbour --threads\n"
      "  tallow search @bills --count"},
+    {Command::screen,
+     "  tallow\n"
+     "  tallow screen from:mara invoice"},
     {Command::explain, "  tallow explain from:mara invoice"},
     {Command::remove,
      "  tallow delete ~/Mail/cur/1707208920.M001:2,S\n"

@@ -40,6 +40,7 @@ constexpr CommandRow kCommands[] = {
      nullptr, false},
     {Command::search, "search", "Search; the last word matches as a prefix unless a space follows",
      "WORDS", false},
+    {Command::screen, "screen", "Search as you type, on a terminal", "WORDS", false},
     {Command::explain, "explain", "Search, and show how the query was understood and the scores",
      "WORDS", false},
     {Command::remove, "delete", "Delete messages and folders from the index, not from the disk",
@@ -314,6 +315,7 @@ const char* misuse(const Options& options) {
     return "a dump is text only";
   }
   if (options.command == Command::show) return misuseOfShow(options);
+  if (options.command == Command::screen && !isScreen()) return "a screen needs a terminal";
   if (!isSearch(options.command)) return nullptr;
   if (options.arguments.empty() == options.query.empty()) {
     return "a search is for WORDS, or for the expression of --query";
@@ -330,7 +332,7 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
   Options options;
   CLI::App app("Full-text search of personal mail; a client of tallowsearchd.", "tallow");
   app.require_subcommand(isScreen() ? 0 : 1, 1);
-  app.footer("Without a command, on a terminal: search as you type.");
+  app.footer("Without a command, on a terminal: tallow screen.");
   app.failure_message(misuseText);
   addGlobalOptions(app, options);
   for (const CommandRow& row : kCommands) addCommand(app, row, options);

@@ -39,7 +39,7 @@ enum class Command {
   show,
   address,
   save,
-  screen  // search as you type
+  screen
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };

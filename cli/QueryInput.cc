@@ -215,4 +215,18 @@ std::optional<QueryInput> queryInput(const Options& options, double now, TLError
   return input;
 }
 
+std::vector<std::string> argumentsOf(const std::string& line) {
+  std::vector<std::string> arguments(1);
+  bool quoted = false;
+  for (const char c : line) {
+    if (c == '"') quoted = !quoted;
+    if (c == ' ' && !quoted) {
+      arguments.emplace_back();
+    } else {
+      arguments.back().push_back(c);
+    }
+  }
+  return arguments;
+}
+
 }  // namespace cli

@@ -42,4 +42,8 @@ struct QueryInput {
 [[nodiscard]] std::optional<QueryInput> queryInput(const Options& options, double now,
                                                    TLErrorOut error);
 
+// The arguments of a search that was typed as one line, split as a shell does: at spaces outside of
+// quotes. Joined by spaces, they give the line again.
+[[nodiscard]] std::vector<std::string> argumentsOf(const std::string& line);
+
 }  // namespace cli

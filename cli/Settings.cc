@@ -71,6 +71,15 @@ class Reader {
   }
   bool readOnBattery(const toml::node& value) { return readFlag(value, _settings.onBattery); }
   bool readAttachments(const toml::node& value) { return readFlag(value, _settings.attachments); }
+  bool readDesktopSearch(const toml::node& value) {
+    return readFlag(value, _settings.desktopSearch);
+  }
+  bool readDesktopClass(const toml::node& value) {
+    const auto text = value.value_exact<std::string>();
+    if (!text || !platform::namesOneDirectory(*text)) return false;
+    _settings.desktopClass = *text;
+    return true;
+  }
 
  private:
   static bool readFlag(const toml::node& value, bool& flag) {
@@ -120,7 +129,7 @@ struct Key {
   const char* allowed;
 };
 
-constexpr std::array<Key, 6> kKeys{{
+constexpr std::array<Key, 8> kKeys{{
     {"roots", &Reader::readRoots, "a list of paths, each from / or ~/ on"},
     {"exclude", &Reader::readExcluded,
      "a list of folders, from / or ~/ on, or below each root: [\".Trash\", \"~/Mail/old\"]"},
@@ -131,6 +140,8 @@ constexpr std::array<Key, 6> kKeys{{
      "a number of bytes or a text such as \"500 KB\" or \"20 MB\", from 1 KB to 67 MB"},
     {"on_battery", &Reader::readOnBattery, "true or false"},
     {"attachments", &Reader::readAttachments, "true or false"},
+    {"desktop_search", &Reader::readDesktopSearch, "true or false"},
+    {"desktop_class", &Reader::readDesktopClass, "the name of a protection class"},
 }};
 
 std::string quoted(std::string_view text) {

@@ -9,7 +9,7 @@
 
 namespace cli {
 
-// The user's settings for `sync` and `watch` from config.toml. Paths are absolute.
+// The user's settings from config.toml, for `sync`, `watch` and the desktop. Paths are absolute.
 struct Settings {
   std::vector<std::string> roots;
   std::vector<std::string> excluded;           // directories
@@ -18,6 +18,8 @@ struct Settings {
   uint64_t largestMail = 0;                    // in bytes; 0 if the user set no limit
   bool onBattery = false;
   bool attachments = true;  // their text is indexed
+  bool desktopSearch = false;
+  std::string desktopClass = "default";  // the protection class that the desktop searches
 };
 
 // tallow/config.toml in $XDG_CONFIG_HOME, by default ~/.config.

@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <cstdlib>
 
 namespace cli {
 
@@ -29,6 +30,12 @@ int startShell(const std::string& command, const std::vector<std::string>& argum
   posix_spawnattr_destroy(&attributes);
   posix_spawn_file_actions_destroy(&actions);
   return result;
+}
+
+std::optional<std::string> openingCommand() {
+  const char* const program = std::getenv("TALLOW_OPEN");
+  if (program == nullptr || *program == '\0') return std::nullopt;
+  return std::string(program) + " \"$1\"";
 }
 
 }  // namespace cli

@@ -1,5 +1,6 @@
 #include "platform/DeviceVault.h"
 
+#include <fmt/format.h>
 #include <poll.h>
 #include <sys/eventfd.h>
 #include <sys/inotify.h>
@@ -147,6 +148,10 @@ class FileDeviceVault : public DeviceVault {
 
 std::unique_ptr<DeviceVault> makeFileDeviceVault(std::string path) {
   return std::make_unique<FileDeviceVault>(std::move(path));
+}
+
+bool writeLockStatus(const std::string& path, bool locked, TLErrorOut error) {
+  return writeFileAtomically(path, fmt::format("{} 1\n", locked ? kLocked : kUnlocked), error);
 }
 
 DeviceVault& deviceVault() {

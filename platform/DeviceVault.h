@@ -6,6 +6,7 @@
 #include <string>
 
 #include "platform/Queue.h"
+#include "platform/TLError.h"
 
 // The device's key store: whether the device is locked, and whether it has been unlocked since
 // boot.
@@ -41,5 +42,8 @@ namespace platform {
 // not yet unlocked. The vault owns and joins a thread that watches the directory with inotify, also
 // after the directory has been replaced.
 [[nodiscard]] std::unique_ptr<DeviceVault> makeFileDeviceVault(std::string path);
+
+// Replaces that file in one step. The device counts as unlocked since boot.
+bool writeLockStatus(const std::string& path, bool locked, TLErrorOut error);
 
 }  // namespace platform

@@ -11,6 +11,8 @@
 #include <cerrno>
 #include <cstdlib>
 #include <memory>
+#include <optional>
+#include <utility>
 
 #include "platform/Files.h"
 #include "platform/Paths.h"
@@ -23,6 +25,11 @@ namespace {
 // Maximum pause between two attempts: the directory may not exist yet, and the socket may exist
 // before the daemon listens.
 constexpr std::chrono::milliseconds kWaitStep(50);
+
+// The daemon closes an idle connection to make room for another, and may do so just as a call is
+// sent. Such a call is made again, which does no harm: no call has another effect the second time.
+constexpr int kMaxAttempts = 3;
+constexpr std::chrono::seconds kLostAtOnce(1);
 
 struct MessageUnref {
   void operator()(sd_bus_message* message) const { sd_bus_message_unref(message); }
@@ -177,6 +184,21 @@ void Channel::disconnect() {
 
 bool Channel::call(const char* interface, const char* member, std::chrono::seconds timeout,
                    const Body& append, const Body& read, TLErrorOut error) {
+  for (int attempt = 1;; ++attempt) {
+    const auto start = std::chrono::steady_clock::now();
+    std::optional<TLError> failure;
+    if (callOnce(interface, member, timeout, append, read, &failure)) return true;
+    const bool lost = failure->domain == kUnreachableDomain &&
+                      (failure->code == ECONNRESET || failure->code == EPIPE) &&
+                      std::chrono::steady_clock::now() - start < kLostAtOnce;
+    if (lost && attempt < kMaxAttempts) continue;
+    platform::setError(error, std::move(*failure));
+    return false;
+  }
+}
+
+bool Channel::callOnce(const char* interface, const char* member, std::chrono::seconds timeout,
+                       const Body& append, const Body& read, TLErrorOut error) {
   if (!connect(error)) return false;
   sd_bus_message* raw = nullptr;
   int result =

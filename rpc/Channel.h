@@ -55,7 +55,8 @@ class Channel {
   // is a failure.
   using Body = std::function<int(sd_bus_message*)>;
 
-  // Calls `member` and waits for the reply. False with an error if there is none.
+  // Calls `member` and waits for the reply. False with an error if there is none. A call whose
+  // connection is lost within a second is made again, up to twice.
   bool call(const char* member, std::chrono::seconds timeout, const Body& append, const Body& read,
             TLErrorOut error) {
     return call(_serviceName.c_str(), member, timeout, append, read, error);
@@ -68,6 +69,8 @@ class Channel {
   void interrupt() TL_EXCLUDES(_mutex);
 
  private:
+  bool callOnce(const char* interface, const char* member, std::chrono::seconds timeout,
+                const Body& append, const Body& read, TLErrorOut error);
   bool connect(TLErrorOut error);
   void disconnect();
   bool adopt(int descriptor) TL_EXCLUDES(_mutex);

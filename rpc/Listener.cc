@@ -22,6 +22,8 @@ namespace rpc {
 namespace {
 
 constexpr int kBacklog = 64;
+constexpr size_t kMaxNewcomers =
+    kMaxConnections / 4;  // connections without a call, before they give way
 // Pause before retrying to accept a peer that cannot even be refused.
 constexpr useconds_t kNoDescriptorsMicroseconds = 10000;
 
@@ -53,22 +55,32 @@ class ConnectionTable {
 
  private:
   // A connection whose peer has hung up leaves by itself, and so makes room without harm. Next come
-  // connections that have never made a call, so that many silent peers cannot push out a working
-  // one. Among equals, the one that has been idle longest.
+  // connections that have never made a call, if they are many, so that silent peers cannot push out
+  // working ones; then idle ones; then new ones, which are about to call. Among equals, the one
+  // that has been idle longest.
   bool evictOne() TL_REQUIRES(_mutex) {
-    using Rank = std::tuple<bool, bool, uint64_t>;  // the lowest is evicted
+    using Rank = std::tuple<int, uint64_t>;  // the lowest is evicted
+    const bool manySilent = silent() > kMaxNewcomers;
     ServerConnection* chosen = nullptr;
     Rank lowest;
     for (ServerConnection* connection : _connections) {
       const auto idle = connection->idleness();
       if (connection->evicted() || (idle.calling && !idle.gone)) continue;
-      const Rank rank(!idle.gone, idle.called, idle.since);
+      const int order = idle.gone ? 0 : idle.called ? 2 : manySilent ? 1 : 3;
+      const Rank rank(order, idle.since);
       if (chosen != nullptr && rank >= lowest) continue;
       chosen = connection;
       lowest = rank;
     }
     if (chosen != nullptr) chosen->evict();
     return chosen != nullptr;
+  }
+
+  // The number of connections that have not made a call.
+  [[nodiscard]] size_t silent() const TL_REQUIRES(_mutex) {
+    return static_cast<size_t>(
+        std::count_if(_connections.begin(), _connections.end(),
+                      [](const auto* one) { return !one->evicted() && !one->idleness().called; }));
   }
 
   platform::Mutex _mutex;

@@ -4,7 +4,6 @@
 #include <limits>
 #include <utility>
 
-#include "salt/DocPages.h"
 #include "salt/TermMatches.h"
 #include "salt/TermRules.h"
 
@@ -44,7 +43,6 @@ class SharedSearch {
       }
       _byToken.clear();
       _standings = 0;
-      _wanted = {};
     }
     return result;
   }
@@ -58,12 +56,11 @@ class SharedSearch {
 
   void add(const std::string& token) {
     _terms[_position].tokens[0] = token;
-    const TermMatches found(_index, _terms[_position], _options.maxSuffixes, nullptr);
+    const TermMatches found(_index, _terms[_position], _options.maxSuffixes);
     Matches& matches = _byToken.emplace_back();
     found.forEach([&](uint32_t docID, uint32_t mask) {
       matches.docs.push_back({docID});
       matches.masks.push_back(mask);
-      _wanted[docID] = true;
     });
     _standings += matches.docs.size();
   }
@@ -75,7 +72,7 @@ class SharedSearch {
         applyToken();
         continue;
       }
-      const TermMatches found(_index, _terms[u], _options.maxSuffixes, &_wanted);
+      const TermMatches found(_index, _terms[u], _options.maxSuffixes);
       for (auto& [docs, masks] : _byToken) {
         const auto maskOf = [&found, &docs = docs](size_t token, size_t i) {
           return found.mask(token, docs[i].docID);
@@ -102,7 +99,6 @@ class SharedSearch {
   const Options& _options;
   std::vector<Matches> _byToken;
   size_t _standings = 0;
-  salt::DocPages<bool> _wanted;
 };
 
 bool oneTokenEach(const std::vector<Term>& terms) {

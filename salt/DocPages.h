@@ -1,8 +1,10 @@
 #pragma once
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <utility>
 #include <vector>
 
 namespace salt {
@@ -24,6 +26,24 @@ class DocPages {
     const size_t page = docID / kPageDocs;
     if (page >= _pages.size() || _pages[page] == nullptr) return T();
     return _pages[page][docID % kPageDocs];
+  }
+
+  // Combines with the values of `other` by |=.
+  void unite(DocPages&& other) {
+    if (other._pages.size() > _pages.size()) _pages.resize(other._pages.size());
+    for (size_t page = 0; page < other._pages.size(); ++page) {
+      if (_pages[page] == nullptr) {
+        _pages[page] = std::move(other._pages[page]);
+      } else if (other._pages[page] != nullptr) {
+        for (uint32_t i = 0; i < kPageDocs; ++i) _pages[page][i] |= other._pages[page][i];
+      }
+    }
+  }
+
+  [[nodiscard]] size_t bytes() const {
+    const auto used = static_cast<size_t>(std::count_if(
+        _pages.begin(), _pages.end(), [](const auto& page) { return page != nullptr; }));
+    return used * kPageDocs * sizeof(T) + _pages.size() * sizeof(_pages[0]);
   }
 
   // Calls visit(docID, value) in DocID order for each document of an allocated page.

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <functional>
 #include <iosfwd>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -63,6 +64,8 @@ struct DocZones {
 // during the call only.
 using PlacesCallback =
     std::function<void(const std::vector<uint16_t>& zones, const DocZones* docs, size_t count)>;
+
+class FoundPlaces;  // what a scan has found for one prefix; salt/PostingSet.h
 
 // Threads: every operation may run on any thread, concurrently with the others. Readers work on a
 // snapshot and block nobody; they do not see what is added or deleted while they run.
@@ -198,12 +201,12 @@ class Index {
   // The stored metrics and one line per suffix, including those of deleted documents.
   [[nodiscard]] virtual std::string Dump() const = 0;
 
-  // ScanPrefix for callers that need only documents and zones: calls `callback` with batches of
-  // places, in any order, each place at least once. Returns the number of matching suffixes.
-  // Returns nullopt, without a call, when there might be more than `limit`: only ScanPrefix can
-  // then tell which come first.
-  virtual std::optional<uint64_t> ScanPlaces(std::string_view prefix, uint64_t limit,
-                                             const PlacesCallback& callback) const = 0;
+  // ScanPrefix for callers that need only documents and zones, for several prefixes in one pass.
+  // Memory: 4 bytes for each prefix and matching document and its neighbours. Null for a prefix
+  // with which more than `limit` suffixes might begin: only ScanPrefix can then tell which come
+  // first.
+  [[nodiscard]] virtual std::vector<std::shared_ptr<const FoundPlaces>> ScanPlaces(
+      const std::vector<std::string_view>& prefixes, uint64_t limit) const = 0;
 
   // For each prefix, the first `limit` suffixes that ScanPrefix would deliver, at a fraction of its
   // cost for many similar prefixes of which most match nothing. The first call starts the

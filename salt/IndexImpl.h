@@ -79,9 +79,9 @@ class index final : public Index {
   void ResetScanMetrics() override TL_EXCLUDES(_metricsMutex);
   [[nodiscard]] bool Validate() const override;
   [[nodiscard]] std::string Dump() const override;
-  std::optional<uint64_t> ScanPlaces(std::string_view prefix, uint64_t limit,
-                                     const PlacesCallback& callback) const override {
-    return _scanner.scanPlaces(prefix, limit, callback);
+  [[nodiscard]] std::vector<std::shared_ptr<const FoundPlaces>> ScanPlaces(
+      const std::vector<std::string_view>& prefixes, uint64_t limit) const override {
+    return _scanner.scanPlaces(prefixes, limit);
   }
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> ScanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const override {

@@ -1,5 +1,6 @@
 #include "salt/PostingSet.h"
 
+#include <algorithm>
 #include <bit>
 
 #include "salt/Coding.h"
@@ -41,22 +42,31 @@ void appendVarint(std::string* out, uint32_t value) {
 
 }  // namespace
 
+uint32_t ZoneBitTable::bitOf(uint16_t zoneID) {
+  platform::MutexLock lock(_mutex);
+  const auto known = std::find(_zones.begin(), _zones.end(), zoneID);
+  const auto at = static_cast<size_t>(known - _zones.begin());
+  if (at == kMaxZones) return 0;
+  if (known == _zones.end()) _zones.push_back(zoneID);
+  return uint32_t{1} << at;
+}
+
+std::vector<uint16_t> ZoneBitTable::zones() const {
+  platform::MutexLock lock(_mutex);
+  return _zones;
+}
+
 uint32_t PostingSet::newBit(uint16_t zoneID) {
-  if (_zones.size() == kMaxZones) return 0;
+  const uint32_t bit = _table->bitOf(zoneID);
+  if (bit == 0) return 0;
   if (zoneID >= _bits.size()) _bits.resize(zoneID + size_t{1});
-  _bits[zoneID] = uint32_t{1} << _zones.size();
-  _zones.push_back(zoneID);
-  return _bits[zoneID];
+  return _bits[zoneID] = bit;
 }
 
 void PostingSet::add(PostingSet&& other) {
-  if (_suffixes == 0) std::swap(*this, other);
-  if (other._suffixes == 0) return;
-  other.deliver([this](const std::vector<uint16_t>& zones, const DocZones* docs, size_t count) {
-    Adder adder(this, zones);
-    for (const DocZones* doc = docs; doc != docs + count; ++doc) adder.add(*doc);
-  });
-  addSuffixes(other._suffixes);
+  _suffixes += other._suffixes;
+  _masks.unite(std::move(other._masks));
+  _others.insert(_others.end(), other._others.begin(), other._others.end());
 }
 
 PostingSet::Adder::Adder(PostingSet* set, const std::vector<uint16_t>& zones)
@@ -77,15 +87,11 @@ void PostingSet::Adder::addOneByOne(const DocZones& doc) {
   }
 }
 
-// Number of zones, the zones, then for each document the delta of its DocID and its mask.
+// For each document the delta of its DocID and its mask.
 std::string PostingSet::encode() const {
   std::string out;
-  if (!_others.empty()) return out;
-  appendVarint(&out, static_cast<uint32_t>(_zones.size()));
-  for (const uint16_t zone : _zones) appendVarint(&out, zone);
   uint32_t before = 0;
-  _masks.forEach([&](uint32_t docID, uint32_t mask) {
-    if (mask == 0) return;
+  forEach([&](uint32_t docID, uint32_t mask) {
     appendVarint(&out, docID - before);
     appendVarint(&out, mask);
     before = docID;
@@ -93,27 +99,24 @@ std::string PostingSet::encode() const {
   return out;
 }
 
-void PostingSet::deliver(const PlacesCallback& callback) const {
-  for (const Place& place : _others) {
-    const DocZones doc{place.DocID, 1};
-    callback({place.ZoneID}, &doc, 1);
-  }
-  Runs runs(_zones, callback);
-  _masks.forEach([&](uint32_t docID, uint32_t mask) {
-    if (mask != 0) runs.add({docID, mask});
-  });
-  runs.flush();
-}
-
-void PostingSet::deliver(std::string_view encoded, const PlacesCallback& callback) {
-  std::vector<uint16_t> zones(readVarint(encoded));
-  for (uint16_t& zone : zones) zone = static_cast<uint16_t>(readVarint(encoded));
-  Runs runs(zones, callback);
+void PostingSet::addEncoded(std::string_view encoded) {
   uint32_t docID = 0;
   while (!encoded.empty()) {
     docID += readVarint(encoded);
-    runs.add({docID, readVarint(encoded)});
+    _masks[docID] |= readVarint(encoded);
   }
+}
+
+void FoundPlaces::deliver(const PlacesCallback& callback) const {
+  for (const auto& set : {_hot, _pages}) {
+    for (const Place& place : set->others()) {
+      const DocZones doc{place.DocID, 1};
+      callback({place.ZoneID}, &doc, 1);
+    }
+  }
+  const std::vector<uint16_t> list = zones();
+  Runs runs(list, callback);
+  forEach([&](uint32_t docID, uint32_t mask) { runs.add({docID, mask}); });
   runs.flush();
 }
 

@@ -1,22 +1,43 @@
 #pragma once
 
+#include <array>
 #include <cstdint>
-#include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include "platform/Mutex.h"
 #include "salt/DocPages.h"
 #include "salt/Index.h"
 #include "salt/ZoneMask.h"
 
 namespace salt {
 
-// The distinct places of many suffixes, and the number of suffixes. A mail has about ten zones, so
-// the zones of a document are stored as the bits of one number. One thread.
+// Assigns bits to the first 32 zones that the scans of an index meet, so that the zone masks of all
+// its posting sets mean the same. A mail has about ten zones. Any thread.
+class ZoneBitTable {
+ public:
+  // The bit of a zone; 0 when none is left.
+  [[nodiscard]] uint32_t bitOf(uint16_t zoneID) TL_EXCLUDES(_mutex);
+  // By bit.
+  [[nodiscard]] std::vector<uint16_t> zones() const TL_EXCLUDES(_mutex);
+
+ private:
+  static constexpr size_t kMaxZones = 32;
+
+  mutable platform::Mutex _mutex;
+  std::vector<uint16_t> _zones TL_GUARDED_BY(_mutex);
+};
+
+// The distinct places of many suffixes, as zone masks by document, and the number of suffixes.
+// Built by one thread; then any thread may read it.
 class PostingSet {
  public:
+  // The table outlives it.
+  explicit PostingSet(ZoneBitTable& table) : _table(&table) {}
+
   void add(const Place& place) {
     ++_suffixes;
     const uint32_t bit = bitOf(place.ZoneID);
@@ -27,7 +48,7 @@ class PostingSet {
     }
   }
 
-  // The two sets must not count the same suffix.
+  // The two sets must have the same table and not count the same suffix.
   void add(PostingSet&& other);
 
   // Adds documents whose zone bits index one list. Their suffixes are counted separately, by
@@ -49,37 +70,78 @@ class PostingSet {
 
     PostingSet& _set;
     const std::vector<uint16_t>& _zones;
-    std::optional<ZoneMaskMap> _bits;  // nullopt when the set has no bit left for one of them
+    std::optional<ZoneMaskMap> _bits;  // nullopt when no bit is left for one of them
   };
   void addSuffixes(uint64_t count) { _suffixes += count; }
 
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
 
-  // The places in compact form, documents in ascending order; empty when there are more zones than
-  // bits.
+  // The zones of a document as bits of the table, 0 for none.
+  [[nodiscard]] uint32_t mask(uint32_t docID) const { return _masks.at(docID); }
+  // Calls visit(docID, mask) in DocID order for each document with a mask.
+  template <typename Visit>
+  void forEach(const Visit& visit) const {
+    _masks.forEach([&visit](uint32_t docID, uint32_t mask) {
+      if (mask != 0) visit(docID, mask);
+    });
+  }
+  // The places in zones without a bit, as often as they were added.
+  [[nodiscard]] const std::vector<Place>& others() const { return _others; }
+  [[nodiscard]] ZoneBitTable& table() const { return *_table; }
+
+  [[nodiscard]] size_t bytes() const { return _masks.bytes() + sizeof *this; }
+
+  // The masks in compact form, and back; without suffixes and others.
   [[nodiscard]] std::string encode() const;
-
-  // Delivers all places; those in zones without a bit as often as they were added.
-  void deliver(const PlacesCallback& callback) const;
-
-  // Delivers the places of an encoded set.
-  static void deliver(std::string_view encoded, const PlacesCallback& callback);
+  void addEncoded(std::string_view encoded);
 
  private:
-  static constexpr size_t kMaxZones = 32;
-
   [[nodiscard]] uint32_t bitOf(uint16_t zoneID) {
     const uint32_t bit = zoneID < _bits.size() ? _bits[zoneID] : 0;
     return bit != 0 ? bit : newBit(zoneID);
   }
-  // Assigns a bit to the zone; 0 when none is left.
   uint32_t newBit(uint16_t zoneID);
 
+  ZoneBitTable* _table;
   uint64_t _suffixes = 0;
   DocPages<uint32_t> _masks;
-  std::vector<uint32_t> _bits;   // by zone
-  std::vector<uint16_t> _zones;  // by bit
+  std::vector<uint32_t> _bits;  // by zone, as far as the set has met it
   std::vector<Place> _others;
+};
+
+// What a scan has found for one prefix. Any thread; the index outlives it.
+class FoundPlaces {
+ public:
+  FoundPlaces(std::shared_ptr<const PostingSet> hot, std::shared_ptr<const PostingSet> pages)
+      : _hot(std::move(hot)), _pages(std::move(pages)) {}
+
+  // The number of matching suffixes.
+  [[nodiscard]] uint64_t suffixes() const { return _hot->suffixes() + _pages->suffixes(); }
+
+  // Calls `callback` with batches of places, in any order, each place at least once.
+  void deliver(const PlacesCallback& callback) const;
+
+  // Whether each place is in a mask.
+  [[nodiscard]] bool hasAllInMasks() const {
+    return _hot->others().empty() && _pages->others().empty();
+  }
+  // The zones that the bits of masks stand for.
+  [[nodiscard]] std::vector<uint16_t> zones() const { return _hot->table().zones(); }
+  [[nodiscard]] uint32_t mask(uint32_t docID) const {
+    return _hot->mask(docID) | _pages->mask(docID);
+  }
+  // Calls visit(docID, mask) once for each document with a mask.
+  template <typename Visit>
+  void forEach(const Visit& visit) const {
+    _pages->forEach([&](uint32_t docID, uint32_t mask) { visit(docID, mask | _hot->mask(docID)); });
+    _hot->forEach([&](uint32_t docID, uint32_t mask) {
+      if (_pages->mask(docID) == 0) visit(docID, mask);
+    });
+  }
+
+ private:
+  std::shared_ptr<const PostingSet> _hot;
+  std::shared_ptr<const PostingSet> _pages;
 };
 
 }  // namespace salt

@@ -2,6 +2,30 @@
 
 namespace salt {
 
+namespace {
+
+// A set is kept as it is up to this size, and else as about three bytes a document.
+constexpr size_t kMaxBytesPerSuffix = 16;
+
+}  // namespace
+
+ScanCache::Found::Found(std::shared_ptr<const PostingSet> set)
+    : _table(set->table()), _suffixes(set->suffixes()) {
+  if (set->bytes() <= kMaxBytesPerSuffix * _suffixes) {
+    _set = std::move(set);
+  } else {
+    _encoded = set->encode();
+  }
+}
+
+std::shared_ptr<const PostingSet> ScanCache::Found::set() const {
+  if (_set) return _set;
+  const auto decoded = std::make_shared<PostingSet>(_table);
+  decoded->addEncoded(_encoded);
+  decoded->addSuffixes(_suffixes);
+  return decoded;
+}
+
 bool ScanCache::enter(uint64_t generation) {
   if (generation > _generation) {
     _byPrefix.clear();

@@ -8,6 +8,7 @@
 #include <unordered_map>
 
 #include "platform/Mutex.h"
+#include "salt/PostingSet.h"
 
 namespace salt {
 
@@ -19,9 +20,20 @@ namespace salt {
 // Memory: kMaxBytes. Any thread.
 class ScanCache {
  public:
-  struct Found {
-    uint64_t suffixes = 0;  // of live documents
-    std::string places;     // see PostingSet::encode
+  // Of live documents. Where documents are few and far between, the set is kept encoded.
+  class Found {
+   public:
+    explicit Found(std::shared_ptr<const PostingSet> set);
+
+    [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
+    [[nodiscard]] std::shared_ptr<const PostingSet> set() const;
+    [[nodiscard]] size_t bytes() const { return _set ? _set->bytes() : _encoded.size(); }
+
+   private:
+    ZoneBitTable& _table;
+    uint64_t _suffixes;
+    std::shared_ptr<const PostingSet> _set;
+    std::string _encoded;
   };
 
   // Null when the prefix is not cached for this generation.
@@ -37,7 +49,7 @@ class ScanCache {
     std::string prefix;
     std::shared_ptr<const Found> found;
 
-    [[nodiscard]] size_t bytes() const { return kOverhead + prefix.size() + found->places.size(); }
+    [[nodiscard]] size_t bytes() const { return kOverhead + prefix.size() + found->bytes(); }
   };
   using Entries = std::list<Entry>;
 

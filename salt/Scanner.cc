@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <atomic>
+#include <utility>
 
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
@@ -13,34 +14,35 @@ namespace salt {
 
 namespace {
 
-// Scans the hot part and the shards for one prefix, which is truncated already.
+// Scans the hot part and the shards with one iterator. Prefixes are truncated already.
 class PrefixScan {
  public:
-  PrefixScan(const IndexView& view, std::string_view prefix, size_t iterator = 0)
-      : _view(view), _prefix(prefix), _cursor(view, 0, nullptr, iterator) {}
+  explicit PrefixScan(const IndexView& view, size_t iterator = 0)
+      : _view(view), _cursor(view, 0, nullptr, iterator) {}
 
   // Calls `callback` for each suffix until it returns false or a read fails.
-  void suffixes(const std::function<bool(const SuffixMeta&)>& callback) {
+  void suffixes(std::string_view prefix, const std::function<bool(const SuffixMeta&)>& callback) {
     for (unsigned shard = 0; shard <= _view.lastShard(); ++shard) {
-      if (!visitShard(shard, [&] { return visitSuffixes(callback); })) return;
+      if (!visitShard(shard, prefix, [&] { return visitSuffixes(callback); })) return;
     }
   }
 
   // False when a read has failed, which ends the scan.
-  bool hotPlaces(PostingSet* places) {
-    return visitShard(0, [&] { return visitHotPlaces(places); });
+  bool hotPlaces(std::string_view prefix, PostingSet* places) {
+    return visitShard(0, prefix, [&] { return visitHotPlaces(places); });
   }
-  bool pagePlaces(unsigned shard, PostingSet* places) {
-    return visitShard(shard, [&] { return visitPagePlaces(places); });
+  bool pagePlaces(unsigned shard, std::string_view prefix, PostingSet* places) {
+    return visitShard(shard, prefix, [&] { return visitPagePlaces(places); });
   }
 
-  Scanner::Counts counts;
+  [[nodiscard]] Scanner::Counts takeCounts() { return std::exchange(_counts, {}); }
 
  private:
   // Calls visit() with the cursor at the first suffix not less than the prefix. False when that
   // returns false or a read fails.
   template <typename Visit>
-  bool visitShard(unsigned shard, const Visit& visit) {
+  bool visitShard(unsigned shard, std::string_view prefix, const Visit& visit) {
+    _prefix = prefix;
     _cursor.moveTo(static_cast<uint8_t>(shard));
     _cursor.seek(_prefix);
     const bool goOn = visit();
@@ -48,15 +50,15 @@ class PrefixScan {
       Log.error("Error scanning index: {}", status.ToString());
       return false;
     }
-    (shard == 0 ? counts.hotReads : counts.pageReads) += _cursor.loads;
-    counts.fetches += _cursor.suffix.fetches;
+    (shard == 0 ? _counts.hotReads : _counts.pageReads) += _cursor.loads;
+    _counts.fetches += _cursor.suffix.fetches;
     return goOn;
   }
 
   bool visitSuffixes(const std::function<bool(const SuffixMeta&)>& callback) {
     for (; matches(); _cursor.next()) {
       if (_view.deleted->contains(_cursor.suffix.meta.DocID)) continue;
-      ++counts.results;
+      ++_counts.results;
       if (!callback(_cursor.suffix.meta)) return false;
     }
     return true;
@@ -118,72 +120,87 @@ class PrefixScan {
   }
 
   const IndexView& _view;
-  const std::string_view _prefix;
+  std::string_view _prefix;
   ShardCursor _cursor;
+  Scanner::Counts _counts;
   std::vector<Place> _places;
   std::string _page;
 };
 
 constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
-// The result of a scan for places.
-struct FoundPlaces {
+// What one thread has found for a prefix.
+struct Share {
+  explicit Share(ZoneBitTable& table) : hot(table), pages(table) {}
+
   PostingSet hot;
   PostingSet pages;
-  bool complete = true;  // no read has failed
   Scanner::Counts counts;
 
-  void add(FoundPlaces&& other) {
+  void add(Share&& other) {
     hot.add(std::move(other.hot));
     pages.add(std::move(other.pages));
-    complete = complete && other.complete;
     counts += other.counts;
   }
 };
 
+// A prefix to scan for. What is known of the pages comes from the cache.
+struct Request {
+  size_t number;  // in the caller's list
+  std::string_view prefix;
+  std::shared_ptr<const ScanCache::Found> known;
+  std::vector<Share> shares;  // by thread
+};
+
 // The parallel parts of one scan, hot part first. Each part takes the next shard that none has
-// taken.
+// taken, and scans it for all prefixes.
 class PlacesScan {
  public:
-  PlacesScan(const IndexView& view, std::string_view prefix, bool withPages)
-      : _view(view), _prefix(prefix), _last(withPages ? view.lastShard() : 0) {}
+  // The requests are sorted by prefix, so that an iterator mostly moves on within a block.
+  PlacesScan(const IndexView& view, std::vector<Request>& requests)
+      : _view(view), _requests(requests) {
+    const bool pages = std::any_of(requests.begin(), requests.end(),
+                                   [](const Request& request) { return !request.known; });
+    _last = pages ? view.lastShard() : 0;
+  }
 
   [[nodiscard]] unsigned shards() const { return _last + 1; }
 
   // Each part runs on a thread of its own.
-  void scanPart(size_t number) {
+  void scanPart(size_t part) {
     const platform::CrashNote note(_view.idx.crashNotes());
-    FoundPlaces& found = _found[number];
-    PrefixScan scan(_view, _prefix, number);
-    for (unsigned shard = _next++; shard <= _last && found.complete; shard = _next++) {
-      if (shard == 0) {
-        found.complete = scan.hotPlaces(&found.hot);
-      } else if (!addPostings(shard, &found.pages)) {
-        found.complete = scan.pagePlaces(shard, &found.pages);
+    PrefixScan scan(_view, part);
+    for (unsigned shard = _next++; shard <= _last && _complete; shard = _next++) {
+      for (Request& request : _requests) {
+        Share& share = request.shares[part];
+        if (!scanShard(shard, request, &scan, &share)) _complete = false;
+        share.counts += scan.takeCounts();
       }
     }
-    found.counts = scan.counts;
   }
 
-  [[nodiscard]] FoundPlaces take() {
-    for (size_t number = 1; number < Scanner::kThreads; ++number) {
-      _found.front().add(std::move(_found[number]));
-    }
-    return std::move(_found.front());
-  }
+  // Whether no read has failed.
+  [[nodiscard]] bool complete() const { return _complete; }
 
  private:
-  [[nodiscard]] bool addPostings(unsigned shard, PostingSet* places) const {
+  bool scanShard(unsigned shard, const Request& request, PrefixScan* scan, Share* share) const {
+    if (shard == 0) return scan->hotPlaces(request.prefix, &share->hot);
+    return request.known || addPostings(shard, request.prefix, &share->pages) ||
+           scan->pagePlaces(shard, request.prefix, &share->pages);
+  }
+
+  [[nodiscard]] bool addPostings(unsigned shard, std::string_view prefix,
+                                 PostingSet* places) const {
     const auto& postings = *_view.postings;
     return shard < postings.size() && postings[shard] != nullptr &&
-           postings[shard]->add(_prefix, *_view.deleted, places);
+           postings[shard]->add(prefix, *_view.deleted, places);
   }
 
   const IndexView& _view;
-  const std::string_view _prefix;
-  const unsigned _last;
+  std::vector<Request>& _requests;
+  unsigned _last = 0;
   std::atomic<unsigned> _next{0};
-  std::array<FoundPlaces, Scanner::kThreads> _found;
+  std::atomic<bool> _complete{true};
 };
 
 }  // namespace
@@ -201,38 +218,46 @@ void Scanner::scanPrefix(std::string_view prefix,
   const auto start = Clock::now();
   const Activity::Work running(_idx.scans());
   const IndexView view(_idx, true);
-  PrefixScan scan(view, prefix.substr(0, suffixLength(prefix, _idx.op)));
-  scan.suffixes(callback);
-  _idx.countScan(Clock::now() - start, scan.counts);
+  PrefixScan scan(view);
+  scan.suffixes(prefix.substr(0, suffixLength(prefix, _idx.op)), callback);
+  _idx.countScan(Clock::now() - start, scan.takeCounts());
 }
 
-std::optional<uint64_t> Scanner::scanPlaces(std::string_view prefix, uint64_t limit,
-                                            const PlacesCallback& callback) const {
+std::vector<std::shared_ptr<const FoundPlaces>> Scanner::scanPlaces(
+    const std::vector<std::string_view>& prefixes, uint64_t limit) const {
   const auto start = Clock::now();
   const Activity::Work running(_idx.scans());
   const IndexView view(_idx, true, kThreads);
-  prefix = prefix.substr(0, suffixLength(prefix, _idx.op));
-  const auto known = _scanCache.find(prefix, view.pageGeneration);
-  const uint64_t most = known ? known->suffixes + view.metrics.HotSuffixes : view.metrics.Suffixes;
-  if (most > limit) return std::nullopt;
-  PlacesScan scan(view, prefix, !known);
-  runParts(view, scan.shards(), [&scan](size_t part) { scan.scanPart(part); });
-  const FoundPlaces found = scan.take();
-  found.hot.deliver(callback);
-  Counts counts = found.counts;
-  counts.results = found.hot.suffixes();
-  if (known) {
-    PostingSet::deliver(known->places, callback);
-    counts.results += known->suffixes;
-  } else {
-    found.pages.deliver(callback);
-    counts.results += found.pages.suffixes();
-    if (found.complete && view.pageGeneration != 0 && !view.metrics.VacuumInProgress) {
-      remember(prefix, view, found.pages);
-    }
+  std::vector<Request> requests;
+  for (size_t i = 0; i < prefixes.size(); ++i) {
+    const std::string_view prefix = prefixes[i].substr(0, suffixLength(prefixes[i], _idx.op));
+    auto known = _scanCache.find(prefix, view.pageGeneration);
+    const uint64_t most =
+        known ? known->suffixes() + view.metrics.HotSuffixes : view.metrics.Suffixes;
+    if (most > limit) continue;
+    requests.push_back({i, prefix, std::move(known), {}});
+    while (requests.back().shares.size() < kThreads) requests.back().shares.emplace_back(_zones);
   }
-  _idx.countScan(Clock::now() - start, counts);
-  return counts.results;
+  std::sort(requests.begin(), requests.end(),
+            [](const Request& left, const Request& right) { return left.prefix < right.prefix; });
+  PlacesScan scan(view, requests);
+  runParts(view, scan.shards(), [&scan](size_t part) { scan.scanPart(part); });
+
+  const bool keep = scan.complete() && view.pageGeneration != 0 && !view.metrics.VacuumInProgress;
+  std::vector<std::shared_ptr<const FoundPlaces>> result(prefixes.size());
+  for (Request& request : requests) {
+    Share& share = request.shares.front();
+    for (size_t part = 1; part < kThreads; ++part) share.add(std::move(request.shares[part]));
+    auto pages = request.known ? request.known->set()
+                               : std::make_shared<const PostingSet>(std::move(share.pages));
+    if (keep && !request.known) remember(request.prefix, view, pages);
+    auto found = std::make_shared<const FoundPlaces>(
+        std::make_shared<const PostingSet>(std::move(share.hot)), std::move(pages));
+    share.counts.results = found->suffixes();
+    _idx.countScan((Clock::now() - start) / requests.size(), share.counts);
+    result[request.number] = std::move(found);
+  }
+  return result;
 }
 
 void Scanner::runParts(const IndexView& view, unsigned shards,
@@ -245,11 +270,9 @@ void Scanner::runParts(const IndexView& view, unsigned shards,
 }
 
 void Scanner::remember(std::string_view prefix, const IndexView& view,
-                       const PostingSet& pages) const {
-  ScanCache::Found found{pages.suffixes(), pages.encode()};
-  if (found.places.empty()) return;
-  _scanCache.keep(prefix, view.pageGeneration,
-                  std::make_shared<const ScanCache::Found>(std::move(found)));
+                       const std::shared_ptr<const PostingSet>& pages) const {
+  if (!pages->others().empty()) return;
+  _scanCache.keep(prefix, view.pageGeneration, std::make_shared<const ScanCache::Found>(pages));
 }
 
 }  // namespace salt

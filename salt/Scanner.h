@@ -3,12 +3,13 @@
 #include <chrono>
 #include <cstdint>
 #include <functional>
-#include <optional>
+#include <memory>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "salt/Index.h"
+#include "salt/PostingSet.h"
 #include "salt/ScanCache.h"
 #include "salt/TwoThreadRunner.h"
 
@@ -16,7 +17,6 @@ namespace salt {
 
 class index;
 class IndexView;
-class PostingSet;
 
 // Prefix scans over an index, each on a view of its own. Any thread. The index outlives it.
 class Scanner {
@@ -40,15 +40,16 @@ class Scanner {
   // See the operations of Index with these names.
   void scanPrefix(std::string_view prefix,
                   const std::function<bool(const SuffixMeta&)>& callback) const;
-  std::optional<uint64_t> scanPlaces(std::string_view prefix, uint64_t limit,
-                                     const PlacesCallback& callback) const;
+  [[nodiscard]] std::vector<std::shared_ptr<const FoundPlaces>> scanPlaces(
+      const std::vector<std::string_view>& prefixes, uint64_t limit) const;
   [[nodiscard]] std::vector<std::vector<SuffixMeta>> scanPrefixes(
       const std::vector<std::string>& prefixes, size_t limit) const;
 
  private:
   using Clock = std::chrono::steady_clock;
 
-  void remember(std::string_view prefix, const IndexView& view, const PostingSet& pages) const;
+  void remember(std::string_view prefix, const IndexView& view,
+                const std::shared_ptr<const PostingSet>& pages) const;
   // Runs part(0) and, where a second thread is worth waking, part(1) concurrently.
   void runParts(const IndexView& view, unsigned shards,
                 const std::function<void(size_t part)>& part) const;
@@ -56,7 +57,8 @@ class Scanner {
   void learnStarts() const;
 
   const index& _idx;
-  mutable ScanCache _scanCache;  // thread-safe, as is the next
+  mutable ZoneBitTable _zones;  // thread-safe, as are the next two
+  mutable ScanCache _scanCache;
   mutable TwoThreadRunner _runner;
 };
 

@@ -4,7 +4,9 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <iterator>
 #include <optional>
+#include <string_view>
 #include <utility>
 
 #include "salt/DocPages.h"
@@ -15,11 +17,13 @@ namespace saltsearch {
 
 namespace {
 
-// Bounds the memory for matches: how many required terms are scanned before the others.
+// Bound the memory for matches: how many required terms are evaluated before the others, and how
+// many tokens one scan looks for.
 constexpr size_t kMaxTermsAhead = 8;
+constexpr size_t kMaxTokensTogether = 8;
 
 // One search. Required terms are scanned first: only documents that match all of them can be
-// results, so the scans of the other terms skip all other documents, usually the great majority.
+// results, so of the other terms all other documents are skipped, usually the great majority.
 class Searching {
  public:
   Searching(const salt::Index& index, std::vector<Term>& terms, const Options& options)
@@ -27,10 +31,11 @@ class Searching {
         _terms(terms),
         _options(options),
         _evaluation(terms, options),
+        _found(terms.size()),
         _matches(terms.size()) {}
 
   std::vector<Standing> run() {
-    scanAhead();
+    matchRequired();
     for (size_t u = 0; u < _terms.size(); ++u) {
       if (!_evaluation.skips(u)) evaluate(u);
     }
@@ -40,37 +45,69 @@ class Searching {
   [[nodiscard]] bool accepts(const Standing& doc) const { return _evaluation.accepts(doc); }
 
  private:
-  void scanAhead() {
-    const TermMatches* latest = nullptr;
-    size_t ahead = 0;
-    for (size_t u = 0; u < _terms.size() && ahead < kMaxTermsAhead; ++u) {
-      if (_evaluation.skips(u) || !_evaluation.demandsMatch(u)) continue;
-      if (latest != nullptr) restrictTo(*latest);
-      _matches[u] = scan(u);
-      latest = &*_matches[u];
-      ++ahead;
+  // Only documents that match all required terms can be results. They are among those of the rarest
+  // one, which is looked through.
+  void matchRequired() {
+    std::vector<size_t> required;
+    for (size_t u = 0; u < _terms.size() && required.size() < kMaxTermsAhead; ++u) {
+      if (_evaluation.demandsMatch(u) && !_evaluation.skips(u)) required.push_back(u);
     }
-    if (latest == nullptr) return;
-    _admitted = {};
-    admit(*latest);
+    if (required.empty()) return;
+    for (const size_t u : required) {
+      if (_found[u].empty()) scanFrom(u, [this](size_t v) { return _evaluation.demandsMatch(v); });
+      _matches[u] = matches(u);
+    }
+    const size_t rarest = *std::min_element(
+        required.begin(), required.end(),
+        [this](size_t u, size_t v) { return _matches[u]->suffixes() < _matches[v]->suffixes(); });
+    std::erase(required, rarest);
+    admit(*_matches[rarest], [&](uint32_t docID) {
+      return std::all_of(required.begin(), required.end(),
+                         [&](size_t u) { return _matches[u]->contains(docID); });
+    });
     _selective = true;
   }
 
-  void restrictTo(const TermMatches& matches) {
-    _admitted = {};
-    matches.forEach([this](uint32_t docID, uint32_t) { _admitted[docID] = true; });
-    _selective = true;
+  // Scans for the tokens of term u, and in the same pass for those of later terms that are wanted
+  // and not scanned yet, as far as they are few.
+  template <typename Wanted>
+  void scanFrom(size_t u, const Wanted& wanted) {
+    std::vector<size_t> together{u};
+    size_t tokens = _terms[u].tokens.size();
+    for (size_t v = u + 1; v < _terms.size() && tokens < kMaxTokensTogether; ++v) {
+      const size_t more = _terms[v].tokens.size();
+      if (_evaluation.skips(v) || _matches[v] || !_found[v].empty() || !wanted(v) ||
+          tokens + more > kMaxTokensTogether) {
+        continue;
+      }
+      together.push_back(v);
+      tokens += more;
+    }
+    std::vector<std::string_view> prefixes;
+    for (const size_t v : together) {
+      prefixes.insert(prefixes.end(), _terms[v].tokens.begin(), _terms[v].tokens.end());
+    }
+    auto found = _index.ScanPlaces(prefixes, _options.maxSuffixes);
+    auto next = std::make_move_iterator(found.begin());
+    for (const size_t v : together) {
+      const auto end = next + static_cast<ptrdiff_t>(_terms[v].tokens.size());
+      _found[v].assign(next, end);
+      next = end;
+    }
   }
 
-  TermMatches scan(size_t u) {
-    return {_index, _terms[u], _options.maxSuffixes, _selective ? &_admitted : nullptr};
+  TermMatches matches(size_t u) {
+    TermMatches::Found found = std::move(_found[u]);
+    _found[u].clear();
+    return {_index, _terms[u], std::move(found), _options.maxSuffixes};
   }
 
   void evaluate(size_t u) {
     if (!_matches[u]) {
       if (nothingCanChange(u)) return setFound(_index, _terms[u]);
-      _matches[u] = scan(u);
-      if (!_selective) admit(*_matches[u]);
+      if (_found[u].empty()) scanFrom(u, [](size_t) { return true; });
+      _matches[u] = matches(u);
+      if (!_selective) admit(*_matches[u], [](uint32_t) { return true; });
     }
     const TermMatches& matches = *_matches[u];
     const auto maskOf = [&](size_t token, size_t i) { return matches.mask(token, _docs[i].docID); };
@@ -85,10 +122,11 @@ class Searching {
            std::none_of(_docs.begin(), _docs.end(), [](const Standing& doc) { return doc.in; });
   }
 
-  // Adds the documents of the matches that are not yet in _docs.
-  void admit(const TermMatches& matches) {
-    matches.forEach([this](uint32_t docID, uint32_t) {
-      if (!std::exchange(_admitted[docID], true)) _docs.push_back({docID});
+  // Adds the documents of the matches that are not yet in _docs and are wanted.
+  template <typename Wanted>
+  void admit(const TermMatches& matches, const Wanted& wanted) {
+    matches.forEach([&](uint32_t docID, uint32_t) {
+      if (wanted(docID) && !std::exchange(_admitted[docID], true)) _docs.push_back({docID});
     });
   }
 
@@ -96,6 +134,7 @@ class Searching {
   std::vector<Term>& _terms;
   const Options& _options;
   const Evaluation _evaluation;
+  std::vector<TermMatches::Found> _found;            // of terms not yet matched
   std::vector<std::optional<TermMatches>> _matches;  // of terms not yet evaluated
   std::vector<Standing> _docs;
   salt::DocPages<bool> _admitted;  // documents in _docs

@@ -1,42 +1,50 @@
 #include "salt/TermMatches.h"
 
-#include <algorithm>
+#include <utility>
 
 #include "salt/TermRules.h"
-#include "salt/ZoneMask.h"
 
 namespace saltsearch {
 
-TermMatches::TermMatches(const salt::Index& index, Term& term, size_t maxSuffixes,
-                         const salt::DocPages<bool>* wanted)
-    : _masks(term.tokens.size()) {
+namespace {
+
+// The bits of the zones of a term for those of masks that were found.
+salt::ZoneMaskMap zoneMap(const ZoneBits& bits, const TermMatches::Found& found) {
+  std::vector<uint16_t> zones;
+  for (const auto& places : found) {
+    if (places != nullptr) zones = places->zones();  // the table only grows
+  }
+  return {zones, [&bits](uint16_t zone) { return bits.of(zone); }};
+}
+
+}  // namespace
+
+TermMatches::TermMatches(const salt::Index& index, Term& term, size_t maxSuffixes)
+    : TermMatches(index, term,
+                  index.ScanPlaces({term.tokens.begin(), term.tokens.end()}, maxSuffixes),
+                  maxSuffixes) {}
+
+TermMatches::TermMatches(const salt::Index& index, Term& term, Found found, size_t maxSuffixes)
+    : _tokens(term.tokens.size()), _zones(zoneMap(ZoneBits(term.zones), found)) {
   const ZoneBits zoneBits(term.zones);
-  size_t suffixes = 0;
   for (size_t t = 0; t < term.tokens.size(); ++t) {
-    Masks& masks = _masks[t];
-    const auto take = [&](uint32_t docID, uint32_t bits) {
-      if (bits != 0 && (wanted == nullptr || wanted->at(docID))) masks[docID] |= bits;
-    };
-    const size_t left = maxSuffixes - std::min(maxSuffixes, suffixes);
-    const auto count = index.ScanPlaces(
-        term.tokens[t], left, [&](const auto& zones, const auto* docs, size_t size) {
-          salt::ZoneMaskMap bits(zones, [&](uint16_t zone) { return zoneBits.of(zone); });
-          for (const salt::DocZones* doc = docs; doc != docs + size; ++doc) {
-            take(doc->DocID, bits.of(doc->zones));
-          }
-        });
-    if (count) {
-      term.found = term.found || *count != 0;
-      suffixes += *count;
+    Token& token = _tokens[t];
+    const size_t left = maxSuffixes - _suffixes;
+    if (found[t] != nullptr && found[t]->hasAllInMasks() && found[t]->suffixes() <= left) {
+      token.found = std::move(found[t]);
+      _suffixes += token.found->suffixes();
       continue;
     }
     index.ScanPrefix(term.tokens[t], [&](const salt::SuffixMeta& meta) {
       term.found = true;
-      if (++suffixes > maxSuffixes) return false;
-      take(meta.DocID, zoneBits.of(meta.ZoneID));
+      if (_suffixes == maxSuffixes) return false;
+      ++_suffixes;
+      const uint32_t bits = zoneBits.of(meta.ZoneID);
+      if (bits != 0) token.masks[meta.DocID] |= bits;
       return true;
     });
   }
+  term.found = term.found || _suffixes != 0;
 }
 
 void setFound(const salt::Index& index, Term& term) {

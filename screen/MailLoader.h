@@ -5,7 +5,7 @@
 
 #include "cli/MailReader.h"
 #include "cli/Options.h"
-#include "screen/LatestWorker.h"
+#include "platform/LatestWorker.h"
 #include "screen/Search.h"
 
 namespace mailscreen {
@@ -26,7 +26,7 @@ class MailLoader {
   Mail load(const MailRequest& request);
 
   cli::MailReader _reader;
-  LatestWorker<MailRequest, Mail> _worker;
+  platform::LatestWorker<MailRequest, Mail> _worker;
 };
 
 }  // namespace mailscreen

@@ -261,6 +261,11 @@ void Model::showHelp() {
   wrap();
 }
 
+void Model::type(const std::vector<std::string>& words) {
+  _line.set(fmt::format("{}", fmt::join(words, " ")));
+  changeSearch();
+}
+
 void Model::changeSearch() {
   _offset = 0;
   _fromBelow = false;

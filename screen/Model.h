@@ -31,6 +31,7 @@ struct Command {
 class Model {
  public:
   // Input.
+  void type(const std::vector<std::string>& words);
   void resize(size_t rows, size_t columns);
   void press(const Event& event);
   // Drops results of any search but the last, and likewise mails.

@@ -10,7 +10,6 @@
 #include <algorithm>
 #include <array>
 #include <chrono>
-#include <cstdlib>
 
 #include "cli/Commands.h"
 #include "cli/Identifier.h"
@@ -42,7 +41,9 @@ class Loop {
         _wake(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
         _painter(cli::colorAllowed(options.color, STDOUT_FILENO)),
         _searcher(options, [this] { wake(); }),
-        _loader(options, [this] { wake(); }) {}
+        _loader(options, [this] { wake(); }) {
+    _model.type(options.arguments);
+  }
 
   // Runs until the end. Returns the signal that ended it, or 0.
   int run() {
@@ -144,14 +145,11 @@ class Loop {
   }
 
   void open(const std::string& path) {
-    const char* const program = std::getenv("TALLOW_OPEN");
-    if (program == nullptr || *program == '\0') {
-      return _model.tell("$TALLOW_OPEN names no program to open mail with");
-    }
+    const auto command = cli::openingCommand();
+    if (!command) return _model.tell("$TALLOW_OPEN names no program to open mail with");
     _terminal.leave();
     pid_t process = -1;
-    const int failure =
-        cli::startShell(std::string(program) + " \"$1\"", {path}, STDIN_FILENO, process);
+    const int failure = cli::startShell(*command, {path}, STDIN_FILENO, process);
     if (failure == 0) waitFor(process);
     comeBack();
     if (failure != 0) _model.tell("$TALLOW_OPEN: " + platform::posixError(failure, "sh").message);

@@ -20,22 +20,6 @@ namespace mailscreen {
 
 namespace {
 
-// Splits the line as a shell does: at spaces outside of quotes. Joined by spaces, the parts give
-// the line again.
-std::vector<std::string> argumentsOf(const std::string& line) {
-  std::vector<std::string> arguments(1);
-  bool quoted = false;
-  for (const char c : line) {
-    if (c == '"') quoted = !quoted;
-    if (c == ' ' && !quoted) {
-      arguments.emplace_back();
-    } else {
-      arguments.back().push_back(c);
-    }
-  }
-  return arguments;
-}
-
 std::string joined(const std::vector<std::string>& remarks) {
   return fmt::format("{}", fmt::join(remarks, "; "));
 }
@@ -66,7 +50,7 @@ Searcher::Searcher(const cli::Options& options, std::function<void()> wake)
 Found Searcher::run(const Search& search, const std::stop_token& stop) {
   Found found{search};
   cli::Options options = _options;
-  options.arguments = argumentsOf(search.words);
+  options.arguments = cli::argumentsOf(search.words);
   options.folder = search.folder;
   options.sort = search.order;
   options.threads = search.threads;

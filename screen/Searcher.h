@@ -7,7 +7,7 @@
 #include "cli/MailFacts.h"
 #include "cli/Options.h"
 #include "client/SearchServiceProxy.h"
-#include "screen/LatestWorker.h"
+#include "platform/LatestWorker.h"
 #include "screen/Search.h"
 
 namespace cli {
@@ -43,7 +43,7 @@ class Searcher {
   const cli::Options _options;
   client::SearchServiceProxy _service;
   cli::MailFacts _facts;
-  LatestWorker<Search, Found> _worker;  // last member: its thread uses the others
+  platform::LatestWorker<Search, Found> _worker;  // last member: its thread uses the others
 };
 
 }  // namespace mailscreen

@@ -7,10 +7,10 @@ _tallow_saved() {
 
 _tallow() {
   local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='index sync watch status search explain show address save delete reset stats metrics ping
+  local commands='index sync watch status search screen explain show address save delete reset stats metrics ping
     vacuum state dump validate purge help'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
-    --verbose --dry-run --prune-missing --retry --on-battery --query --filter --param --offset --sort --count
+    --verbose --dry-run --prune-missing --retry --reread --attachments --no-attachments --on-battery --query --filter --param --offset --sort --count
     --print0 --threads --raw --attachment --output --force --mutt --delete --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
@@ -36,7 +36,7 @@ _tallow() {
     if [[ " $commands " == *" $word "* ]]; then
       case $word in
         index | sync | watch | show | delete) compopt -o default ;;
-        search | explain | save)
+        search | screen | explain | save)
           # Bash takes @NAME apart as well, and yet replaces all of it.
           [[ $prev == @ || $cur == @* ]] &&
             mapfile -t COMPREPLY < <(compgen -P @ -W "$(_tallow_saved)" -- "${cur#@}")

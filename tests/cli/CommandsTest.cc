@@ -472,6 +472,7 @@ TEST_F(CommandsTest, ExitStatusOfIncorrectUsageAndOfAnAbsentDaemon) {
       {{"--format=xml", "ping"}, "\"xml\" is not one of files, json, message-ids, text\n"},
       {{"search", "x", "--sort", "size"}, "\"size\" is not one of date, relevance\n"},
       {{"search", "x", "--limit=2.5"}, "\"2.5\" is not a whole number from 0 on\n"},
+      {{"screen", "x"}, "tallow: a screen needs a terminal\n"},
       {{"ping", "--wait=long"}, "\"long\" is not a number from 0 to 3600\n"},
       {{"show", "1", "--attachment=0"}, "\"0\" is not a whole number from 1 on\n"},
       {{"show", "1", "--attachment=1"}, "--attachment N and -o FILE go together\n"},

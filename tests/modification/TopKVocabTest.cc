@@ -48,9 +48,9 @@ class WatchedIndex final : public salt::Index {
   bool ScanPrefix(std::string_view, std::function<bool(const salt::SuffixMeta&)>) const override {
     return true;
   }
-  std::optional<uint64_t> ScanPlaces(std::string_view, uint64_t,
-                                     const salt::PlacesCallback&) const override {
-    return 0;
+  std::vector<std::shared_ptr<const salt::FoundPlaces>> ScanPlaces(
+      const std::vector<std::string_view>&, uint64_t) const override {
+    return {};
   }
   std::vector<std::vector<salt::SuffixMeta>> ScanPrefixes(const std::vector<std::string>&,
                                                           size_t) const override {

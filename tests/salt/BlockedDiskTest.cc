@@ -85,7 +85,7 @@ std::vector<std::string> sortedScan(const Index& index) {
 }
 
 std::optional<uint64_t> countOfPlaces(const Index& index) {
-  return index.ScanPlaces("a", 1000, [](const auto&, const auto*, size_t) {});
+  return salttest::scanPlaces(index, "a", 1000, [](const auto&, const auto*, size_t) {});
 }
 
 std::unique_ptr<salt::index> openOn(WriteBlockingEnv* disk, const std::string& path) {

@@ -211,8 +211,8 @@ class Run {
     for (const std::string& suffix : suffixes) expected.insert(suffix.substr(0, suffix.find(':')));
     for (int time = 0; time < 2; ++time) {
       std::set<std::string> found;
-      const auto count = _index->ScanPlaces(
-          prefix, SIZE_MAX, [&](const auto& zones, const auto* docs, size_t run) {
+      const auto count = salttest::scanPlaces(
+          *_index, prefix, SIZE_MAX, [&](const auto& zones, const auto* docs, size_t run) {
             if (run == 0) found.insert("an empty run");
             for (const auto& [doc, zone] : salttest::placesOf(zones, docs, run)) {
               found.insert(fmt::format("{},{}", doc, zone));

@@ -29,8 +29,8 @@ struct Answer {
 // The result of ScanPlaces, which may use posting lists.
 Answer placesOf(const Index& index, const std::string& prefix) {
   Answer answer;
-  const auto suffixes =
-      index.ScanPlaces(prefix, UINT64_MAX, [&](const auto& zones, const auto* docs, size_t count) {
+  const auto suffixes = salttest::scanPlaces(
+      index, prefix, UINT64_MAX, [&](const auto& zones, const auto* docs, size_t count) {
         const auto places = salttest::placesOf(zones, docs, count);
         answer.places.insert(places.begin(), places.end());
       });

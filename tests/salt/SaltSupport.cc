@@ -10,6 +10,7 @@
 #include "platform/Assert.h"
 #include "salt/Coding.h"
 #include "salt/Database.h"
+#include "salt/PostingSet.h"
 
 namespace salttest {
 
@@ -119,6 +120,14 @@ std::vector<std::pair<uint32_t, uint16_t>> placesOf(const std::vector<uint16_t>&
     }
   }
   return places;
+}
+
+std::optional<uint64_t> scanPlaces(const salt::Index& index, std::string_view prefix,
+                                   uint64_t limit, const salt::PlacesCallback& callback) {
+  const auto found = index.ScanPlaces({prefix}, limit);
+  if (found.front() == nullptr) return std::nullopt;
+  found.front()->deliver(callback);
+  return found.front()->suffixes();
 }
 
 }  // namespace salttest

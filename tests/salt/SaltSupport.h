@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <utility>
 #include <vector>
@@ -53,6 +54,10 @@ bool addZone(salt::Index& index, uint32_t docID, uint16_t zoneID, const std::str
 
 // The suffixes of a scan: "docID,zoneID:offset" in order.
 [[nodiscard]] std::vector<std::string> scan(const salt::Index& index, std::string_view prefix);
+
+// ScanPlaces for one prefix: the number of suffixes, or nullopt.
+std::optional<uint64_t> scanPlaces(const salt::Index& index, std::string_view prefix,
+                                   uint64_t limit, const salt::PlacesCallback& callback);
 
 // The places of a batch as (docID, zoneID).
 [[nodiscard]] std::vector<std::pair<uint32_t, uint16_t>> placesOf(

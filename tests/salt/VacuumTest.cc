@@ -58,8 +58,8 @@ TEST(Vacuum, CachedScansDecideWhetherALimitHolds) {
   ASSERT_EQ(index->GetMetrics().HotSuffixes, 0u);
   const auto places = [&index](uint64_t limit) {
     size_t delivered = 0;
-    const auto count = index->ScanPlaces(
-        "two", limit, [&](const auto&, const auto*, size_t run) { delivered += run; });
+    const auto count = salttest::scanPlaces(
+        *index, "two", limit, [&](const auto&, const auto*, size_t run) { delivered += run; });
     EXPECT_EQ(delivered, count.value_or(0)) << limit;
     return count;
   };

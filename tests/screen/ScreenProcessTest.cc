@@ -72,13 +72,13 @@ class ScreenProcessTest : public testing::Test {
         directory.path(), variables, kTerminal, arguments);
   }
   // Starts a shell in a terminal of this size, and the program in it.
-  void open(int columns, int rows) {
+  void open(int columns, int rows, const std::string& arguments = "") {
     outputOf(tmux(
         fmt::format("new-session -d -s t -x {} -y {} "
                     "\"PS1='ready> ' exec bash --norc --noprofile -i\" \\; set -g set-clipboard on",
                     columns, rows)));
     await("ready>");
-    type(program());
+    type(program() + arguments);
     press("Enter");
     await("Search:");
   }
@@ -206,8 +206,7 @@ TEST_F(ScreenProcessTest, MailsAreReadSortedAndFiltered) {
 TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
   index();
   variables = fmt::format("TALLOW_OPEN='tee {}/opened <'", directory.path());
-  open(80, 24);
-  type("oarlock fixed");
+  open(80, 24, " screen oarlock fixed");
   await("1-1 of 1");
   press("C-o");
   await("Search: oarlock");

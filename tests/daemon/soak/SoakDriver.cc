@@ -44,13 +44,12 @@ using std::chrono::seconds;
 
 constexpr const char* kUsage =
     "Usage: soak_driver [--seconds N] [--warm-up SECONDS] [--clients N] [--kill-every SECONDS]\n"
-    "                   [--purge-every KILLS] [--seed N]\n";
+    "                   [--purge-every KILLS] [--pause MILLISECONDS] [--seed N]\n";
 
 // The classes of clients by number; the first is refused while the device is locked.
 constexpr const char* kClasses[] = {"SysFileProtectionComplete", "default", "other"};
 constexpr const char* kName = "soak";
-constexpr size_t kMaxMails = 200;   // per client
-constexpr milliseconds kPause{20};  // maximum, between two calls of a client
+constexpr size_t kMaxMails = 200;  // per client
 constexpr rpc::Patience kPatience{20000};
 
 struct Options {
@@ -58,7 +57,8 @@ struct Options {
   seconds warmUp{0};
   int clients = 16;
   seconds killEvery{60};
-  int purgeEvery = 5;  // kills
+  int purgeEvery = 5;      // kills
+  milliseconds pause{20};  // maximum, between two calls of a client; a long one makes a steady load
   uint32_t seed = std::random_device()();
 };
 
@@ -87,11 +87,12 @@ class Client {
       : _prefix(fmt::format("c{}m", number)),
         _class(kClasses[static_cast<size_t>(number) % std::size(kClasses)]),
         _directory(std::move(directory)),
+        _pause(options.pause),
         _random(options.seed + static_cast<uint32_t>(number)),
         _tally(tally) {}
 
   void work(const std::stop_token& stop) {
-    while (!_tally.wrong && pauseFor(stop, milliseconds(_random() % (kPause.count() + 1)))) {
+    while (!_tally.wrong && pauseFor(stop, milliseconds(_random() % (_pause.count() + 1)))) {
       if (!_service) _service.emplace(_directory, kPatience);
       ++_tally.calls;
       switch (_random() % 10) {
@@ -226,6 +227,7 @@ class Client {
   const std::string _prefix;
   const std::string _class;
   const std::string _directory;
+  const milliseconds _pause;
   std::mt19937 _random;
   Tally& _tally;
   std::optional<SearchServiceProxy> _service;
@@ -377,6 +379,8 @@ int main(int argc, char** argv) {
       options.warmUp = seconds(value);
     } else if (name == "--purge-every" && value > 0) {
       options.purgeEvery = value;
+    } else if (name == "--pause" && value >= 0) {
+      options.pause = milliseconds(value);
     } else if (name == "--clients" && value > 0) {
       options.clients = value;
     } else if (name == "--kill-every" && value > 0) {

@@ -3,7 +3,7 @@
 #include <mutex>
 #include <vector>
 
-#include "screen/LatestWorker.h"
+#include "platform/LatestWorker.h"
 
 namespace {
 
@@ -41,7 +41,7 @@ class LatestWorkerTest : public testing::Test {
   std::vector<int> started;
   bool free = false;
   int woken = 0;  // how often
-  mailscreen::LatestWorker<int, int> worker{
+  platform::LatestWorker<int, int> worker{
       "test.latest", [this](int job, const std::stop_token& stop) { return work(job, stop); },
       [this] { wake(); }};
 };

@@ -11,7 +11,7 @@
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
 
-namespace mailscreen {
+namespace platform {
 
 // A thread that runs one job at a time, and only the latest matters. A new job replaces a waiting
 // one and stops the current one, whose result is dropped.
@@ -27,13 +27,13 @@ class LatestWorker {
   LatestWorker(std::string threadName, Work work, std::function<void()> wake)
       : _work(std::move(work)), _wake(std::move(wake)) {
     _thread = std::thread([this, name = std::move(threadName)] {
-      platform::setThreadName(name);
+      setThreadName(name);
       run();
     });
   }
   ~LatestWorker() {
     {
-      const platform::MutexLock lock(_mutex);
+      const MutexLock lock(_mutex);
       _ending = true;
       _stop.request_stop();
     }
@@ -45,7 +45,7 @@ class LatestWorker {
 
   void submit(Job job) TL_EXCLUDES(_mutex) {
     {
-      const platform::MutexLock lock(_mutex);
+      const MutexLock lock(_mutex);
       _waiting = std::move(job);
       _done.reset();
       _stop.request_stop();
@@ -55,7 +55,7 @@ class LatestWorker {
 
   // The result of the last job, once.
   [[nodiscard]] std::optional<Result> take() TL_EXCLUDES(_mutex) {
-    const platform::MutexLock lock(_mutex);
+    const MutexLock lock(_mutex);
     return std::exchange(_done, std::nullopt);
   }
 
@@ -69,7 +69,7 @@ class LatestWorker {
   }
 
   std::optional<Job> next(std::stop_token& stop) TL_EXCLUDES(_mutex) {
-    const platform::MutexLock lock(_mutex);
+    const MutexLock lock(_mutex);
     while (!_waiting && !_ending) _changed.wait(_mutex);
     if (_ending) return std::nullopt;
     _stop = std::stop_source();
@@ -78,7 +78,7 @@ class LatestWorker {
   }
 
   bool keep(Result result, const std::stop_token& stop) TL_EXCLUDES(_mutex) {
-    const platform::MutexLock lock(_mutex);
+    const MutexLock lock(_mutex);
     if (stop.stop_requested()) return false;
     _done = std::move(result);
     return true;
@@ -86,7 +86,7 @@ class LatestWorker {
 
   const Work _work;
   const std::function<void()> _wake;
-  platform::Mutex _mutex;
+  Mutex _mutex;
   std::condition_variable_any _changed;
   std::optional<Job> _waiting TL_GUARDED_BY(_mutex);
   std::optional<Result> _done TL_GUARDED_BY(_mutex);
@@ -95,4 +95,4 @@ class LatestWorker {
   std::thread _thread;  // "tallow.searcher" and the like; joined by the destructor
 };
 
-}  // namespace mailscreen
+}  // namespace platform

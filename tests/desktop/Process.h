@@ -1,0 +1,50 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <map>
+#include <string>
+#include <vector>
+
+namespace testsupport {
+
+// A program that the test runs. It ends at the latest with the test.
+class Process {
+ public:
+  using Variables = std::map<std::string, std::string>;
+
+  // Adds to the environment. Standard error goes to the file `log`.
+  Process(const std::vector<std::string>& arguments, const Variables& environment, std::string log);
+  ~Process();
+  Process(const Process&) = delete;
+  Process& operator=(const Process&) = delete;
+
+  // Waits until it reports by NOTIFY_SOCKET that it is ready; false if it ended first.
+  [[nodiscard]] bool awaitReady();
+  // Waits for a line on the standard output, and returns it; empty if it ended first.
+  [[nodiscard]] std::string readLine() const;
+  // Ends it by the signal, if given, and waits for its end. The exit status, or 128 plus the number
+  // of the signal that ended it.
+  int end(int signal = 0);
+  // Its standard error so far.
+  [[nodiscard]] std::string log() const;
+
+ private:
+  void run(const std::vector<std::string>& arguments, const Variables& environment, int output);
+
+  const std::string _log;
+  const std::string _notifyPath;
+  pid_t _pid = -1;
+  int _notify = -1;
+  int _output = -1;
+  int _ended = -1;  // pidfd
+};
+
+// Waits until the file, which is replaced in one step, has this content.
+void awaitFile(const std::string& directory, const std::string& name, const std::string& content);
+
+// Whether the programs are installed. Without them a test is skipped, but fails where CI=true;
+// scripts/ci-packages.list has them.
+[[nodiscard]] bool hasPrograms(const std::vector<std::string>& names);
+
+}  // namespace testsupport
