@@ -7,14 +7,17 @@
 #include <chrono>
 #include <nlohmann/json.hpp>
 
+#include "cli/AttachmentCounts.h"
 #include "cli/BatchPace.h"
 #include "cli/Commands.h"
 #include "cli/ErrorText.h"
+#include "cli/HelperProgram.h"
 #include "cli/IndexPipeline.h"
 #include "cli/MailWalker.h"
 #include "cli/MessageParser.h"
 #include "cli/ProgressBar.h"
 #include "cli/Results.h"
+#include "cli/Settings.h"
 #include "cli/SyncCommand.h"
 #include "client/SearchServiceProxy.h"
 #include "sync/MessageDigest.h"
@@ -34,6 +37,13 @@ uint64_t totalBytes(const std::vector<std::string>& paths) {
   return total;
 }
 
+// Settings that are wrong do not keep mail out: `index` uses no other setting.
+std::string programFor(const Options& options) {
+  const auto settings = readSettings();
+  const auto* const read = std::get_if<Settings>(&settings);
+  return extractProgram(options, read == nullptr || read->attachments);
+}
+
 // One run of `index`: sends the batches and counts the results.
 class Indexing {
  public:
@@ -43,7 +53,7 @@ class Indexing {
         _progress(ProgressBar::shown() ? totalBytes(options.arguments) : 0) {}
 
   ExitStatus run() {
-    IndexPipeline pipeline(_options.arguments);
+    IndexPipeline pipeline(_options.arguments, programFor(_options));
     while (!interrupted()) {
       auto batch = pipeline.next();
       if (!batch) break;
@@ -86,6 +96,7 @@ class Indexing {
     _messageFailures += batch.messageFailures.size();
     _ignored += batch.ignored.size();
     _cut += batch.cut.size();
+    _attachments.add(batch.attachments);
   }
 
   // Both return false only if continuing makes no sense.
@@ -130,6 +141,7 @@ class Indexing {
                        {"refused", _refused},
                        {"cut", _cut},
                        {"ignoredFiles", _ignored},
+                       {"attachments", attachmentJSON(_attachments)},
                        {"interrupted", interrupted()}});
     } else {
       text = fmt::format("{} messages indexed", _indexed);
@@ -142,6 +154,7 @@ class Indexing {
       add(_cut, "too long and cut");
       add(_ignored, "other files ignored");
       text += interrupted() ? ", interrupted\n" : "\n";
+      if (_options.verbose) text += attachmentText(_attachments, "attachments: ", "attachments: ");
     }
     return std::fwrite(text.data(), 1, text.size(), stdout) == text.size() &&
            std::fflush(stdout) == 0;
@@ -158,6 +171,7 @@ class Indexing {
   uint64_t _refused = 0;
   uint64_t _cut = 0;
   uint64_t _ignored = 0;
+  extract::Counts _attachments;
 };
 
 // Reads the standard input to its end, up to one byte over the limit of a message.
@@ -187,7 +201,7 @@ ExitStatus indexStandardInput(const Options& options) {
   if (message.starts_with("From ")) {
     message.remove_prefix(std::min(message.find('\n'), message.size() - 1) + 1);
   }
-  MessageParser parser;
+  MessageParser parser(programFor(options));
   auto result = parser.parse(message, {"message/" + mailsync::messageDigest(message), "", ""});
   if (const auto* bad = std::get_if<UnparsableMessage>(&result)) {
     complain("the standard input: " + bad->reason);

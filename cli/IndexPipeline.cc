@@ -9,7 +9,8 @@ namespace cli {
 // The work of the reading thread: gathers a batch and pushes it when it is full.
 class IndexPipeline::Reading {
  public:
-  explicit Reading(IndexPipeline& pipeline) : _pipeline(pipeline) {}
+  explicit Reading(IndexPipeline& pipeline)
+      : _pipeline(pipeline), _parser(pipeline._extractProgram) {}
 
   bool walk(const std::string& path) {
     const MailSink sink{
@@ -42,6 +43,7 @@ class IndexPipeline::Reading {
     }
     const auto& message = std::get<ParsedMessage>(result);
     if (message.cut) _batch.cut.push_back(origin.identifier);
+    _batch.attachments.add(message.attachments);
     client::EncodedItem item = client::encode(*message.item);
     if (!_batch.items.empty() && _batch.itemBytes + item.bytes.size() > kBatchBytes && !flush()) {
       return false;
@@ -65,8 +67,10 @@ class IndexPipeline::Reading {
   std::string _named;
 };
 
-IndexPipeline::IndexPipeline(std::vector<std::string> paths)
-    : _paths(std::move(paths)), _thread([this] { run(); }) {}
+IndexPipeline::IndexPipeline(std::vector<std::string> paths, std::string extractProgram)
+    : _paths(std::move(paths)),
+      _extractProgram(std::move(extractProgram)),
+      _thread([this] { run(); }) {}
 
 IndexPipeline::~IndexPipeline() {
   _queue.cancel();

@@ -9,6 +9,7 @@
 #include "cli/BatchQueue.h"
 #include "cli/MailFile.h"
 #include "client/Batches.h"
+#include "extract/Protocol.h"
 
 namespace cli {
 
@@ -26,6 +27,7 @@ struct MailBatch {
   std::vector<Failure> pathFailures;     // paths on the command line that cannot be read
   std::vector<std::string> cut;          // messages whose text was truncated for the index
   std::vector<std::string> ignored;      // files of a directory that are no mail
+  extract::Counts attachments;
 };
 
 // Limits of a batch; it is sent when any is reached. The last one limits what a batch without items
@@ -41,7 +43,8 @@ inline constexpr size_t kBatchReports = 1000;
 // and joins it.
 class IndexPipeline {
  public:
-  explicit IndexPipeline(std::vector<std::string> paths);
+  // `extractProgram` is the path of tallow-extract, for the text of attachments, or empty.
+  explicit IndexPipeline(std::vector<std::string> paths, std::string extractProgram = {});
   ~IndexPipeline();
   IndexPipeline(const IndexPipeline&) = delete;
   IndexPipeline& operator=(const IndexPipeline&) = delete;
@@ -55,6 +58,7 @@ class IndexPipeline {
   void run();
 
   const std::vector<std::string> _paths;
+  const std::string _extractProgram;
   BatchQueue<MailBatch> _queue;  // thread-safe
   std::thread _thread;
 };

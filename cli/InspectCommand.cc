@@ -9,12 +9,12 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
-#include <filesystem>
 #include <functional>
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
 #include "cli/ErrorText.h"
+#include "cli/HelperProgram.h"
 #include "cli/Results.h"
 #include "cli/StateDirectory.h"
 #include "cli/SyncCommand.h"
@@ -28,15 +28,6 @@ namespace {
 
 constexpr const char* kProgram = "tallow-inspect";
 constexpr size_t kPieceBytes = 64 * 1024;
-
-// In the directory of this program, as in a build, or where it is installed.
-std::string programPath() {
-  std::error_code ignored;
-  const auto bin = std::filesystem::read_symlink("/proc/self/exe", ignored).parent_path();
-  const auto beside = bin / kProgram;
-  return std::filesystem::exists(beside, ignored) ? beside
-                                                  : bin.parent_path() / "libexec/tallow" / kProgram;
-}
 
 // The running program; ends before this object.
 class Inspector {
@@ -61,7 +52,7 @@ class Inspector {
 };
 
 bool Inspector::start(const char* command, const Options& options) {
-  const std::string program = programPath();
+  const std::string program = helperProgramPath(kProgram);
   const std::string state = stateDirectory(options);
   const std::array<const char*, 5> arguments{program.c_str(), command, state.c_str(),
                                              options.protectionClass.c_str(), nullptr};

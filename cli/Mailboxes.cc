@@ -89,8 +89,12 @@ std::variant<std::vector<MailboxGroup>, std::string> groupMailboxes(
   }
   std::vector<MailboxGroup> groups;
   for (auto& [name, places] : roots) {
-    MailboxGroup group{
-        name, mailsync::outermost(std::move(places)), {}, settings.largestMail, settings.onBattery};
+    MailboxGroup group{name,
+                       mailsync::outermost(std::move(places)),
+                       {},
+                       settings.largestMail,
+                       settings.onBattery,
+                       settings.attachments};
     group.excluded = excludedOf(settings, group.roots);
     for (const auto& [folder, other] : classes) {
       if (other != name) group.excluded.push_back(folder);

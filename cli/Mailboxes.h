@@ -18,6 +18,7 @@ struct MailboxGroup {
   std::vector<std::string> excluded;  // directories; folders of other classes are among them
   uint64_t largestMail = 0;           // in bytes; 0 if the user set no limit
   bool onBattery = false;
+  bool attachments = true;
 };
 
 // Those of ~/Maildir, ~/Mail and ~/.mail that exist.

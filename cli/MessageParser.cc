@@ -1,10 +1,11 @@
 #include "cli/MessageParser.h"
 
-#include <algorithm>
 #include <optional>
 #include <vector>
 
+#include "cli/AttachmentText.h"
 #include "cli/Identifier.h"
+#include "cli/MessageParts.h"
 #include "cli/Mime.h"
 #include "cli/TextBudget.h"
 
@@ -34,75 +35,12 @@ std::optional<double> receivedDate(GMimeMessage* message) {
   return seconds;
 }
 
-// The parts of a message that are indexed.
-struct Leaves {
-  std::vector<GMimePart*> plain;
-  std::vector<GMimePart*> html;
-  std::vector<GMimeObject*> attachments;
-};
-
-void addLeaf(GMimePart* part, Leaves& leaves) {
-  GMimeObject* const object = GMIME_OBJECT(part);
-  GMimeContentType* const type = g_mime_object_get_content_type(object);
-  const bool attached = isAttached(object);
-  const bool text = type == nullptr || g_mime_content_type_is_type(type, "text", "*");
-  if (!attached && text) {
-    if (type == nullptr || g_mime_content_type_is_type(type, "text", "plain")) {
-      leaves.plain.push_back(part);
-    } else if (g_mime_content_type_is_type(type, "text", "html")) {
-      leaves.html.push_back(part);
-    }
-  }
-  if (attached || !text || g_mime_part_get_filename(part) != nullptr) {
-    leaves.attachments.push_back(object);
-  }
-}
-
-// In the order of the message. Embedded messages are included unless they are attachments.
-Leaves leavesOf(GMimeMessage* message) {
-  Leaves leaves;
-  std::vector<GMimeObject*> pending{g_mime_message_get_mime_part(message)};
-  for (size_t count = 0; !pending.empty() && count < kMaxParts; ++count) {
-    GMimeObject* const object = pending.back();
-    pending.pop_back();
-    if (object == nullptr) continue;
-    if (GMIME_IS_MULTIPART(object)) {
-      GMimeMultipart* const multipart = GMIME_MULTIPART(object);
-      const int children =
-          std::min(g_mime_multipart_get_count(multipart), static_cast<int>(kMaxParts));
-      for (int i = children; i > 0; --i) {
-        pending.push_back(g_mime_multipart_get_part(multipart, i - 1));
-      }
-    } else if (GMIME_IS_MESSAGE_PART(object)) {
-      GMimeMessage* const inner = g_mime_message_part_get_message(GMIME_MESSAGE_PART(object));
-      if (isAttached(object)) {
-        leaves.attachments.push_back(object);
-      } else if (inner != nullptr) {
-        pending.push_back(g_mime_message_get_mime_part(inner));
-      }
-    } else if (GMIME_IS_PART(object)) {
-      addLeaf(GMIME_PART(object), leaves);
-    }
-  }
-  return leaves;
-}
-
-// Joins the parts in order. Stops when there is more than the index accepts.
-TLString joinedText(const std::vector<GMimePart*>& parts, TextDecoder& decoder) {
-  TLString joined;
-  for (GMimePart* part : parts) {
-    if (joined.size() > kMaxBodyBytes) break;
-    if (!joined.empty() && joined.back() != u'\n') joined.push_back(u'\n');
-    joined += textOf(part, decoder);
-  }
-  return joined;
-}
-
 // Fills one item from one message.
 class ItemBuilder {
  public:
-  ItemBuilder(GMimeMessage* message, const MessageOrigin& origin, TextDecoder& decoder)
-      : _message(message), _origin(origin), _decoder(decoder) {}
+  ItemBuilder(GMimeMessage* message, const MessageOrigin& origin, TextDecoder& decoder,
+              extract::ExtractProcess* process)
+      : _message(message), _origin(origin), _decoder(decoder), _process(process) {}
 
   ParsedMessage build() {
     _item->setIdentifier(platform::fromUTF8(_origin.identifier));
@@ -122,7 +60,7 @@ class ItemBuilder {
     addTexts(Key::MAILBOXES, {platform::fromUTF8(_origin.folderName)});
     addTexts(Key::MAILBOX_IDENTIFIERS, {platform::fromUTF8(_origin.folderPath)});
     addText(Key::CONTENT_TYPE, "message/rfc822");
-    return {_item, _cut};
+    return {_item, _cut, _counts};
   }
 
  private:
@@ -204,18 +142,30 @@ class ItemBuilder {
 
   void addBody(const Leaves& leaves) {
     TextBudget budget;
-    const TLString text = joinedText(leaves.plain, _decoder);
-    if (leaves.html.empty() || !isBlank(text)) {
-      const TLStringView taken = budget.take(text);
-      if (!taken.empty()) _item->addAttributeWithKeyStringValue(Key::TEXT_CONTENT, TLString(taken));
-    } else {
+    const TLString plain = joinedText(leaves.plain, _decoder);
+    TLString text(budget.take(plain));
+    if (!leaves.html.empty() && isBlank(plain)) {
+      text.clear();
+      budget = TextBudget();
       const TLString html = joinedText(leaves.html, _decoder);
       const TLStringView taken = budget.takeMarkup(html);
       if (!taken.empty()) {
         _item->addAttributeWithKeyBytesValue(Key::HTML_CONTENT_DATA, platform::toUTF8(taken));
       }
+      _cut = _cut || budget.exhausted();
+      budget = TextBudget();  // plain text is a zone of its own
     }
     _cut = _cut || budget.exhausted();
+    addAttachmentTexts(leaves, budget, text);
+    if (!text.empty()) _item->addAttributeWithKeyStringValue(Key::TEXT_CONTENT, std::move(text));
+  }
+
+  // Appends what is left of the budget can hold. Attachments that do not fit do not count as cut.
+  void addAttachmentTexts(const Leaves& leaves, TextBudget& budget, TLString& text) {
+    if (_process == nullptr) return;
+    const TLString added = AttachmentText(*_process, _decoder, budget, _counts).of(leaves.files);
+    if (!text.empty() && !added.empty() && text.back() != u'\n') text.push_back(u'\n');
+    text += added;
   }
 
   void addAttachments(const std::vector<GMimeObject*>& attachments) {
@@ -237,13 +187,16 @@ class ItemBuilder {
   GMimeMessage* const _message;
   const MessageOrigin& _origin;
   TextDecoder& _decoder;
+  extract::ExtractProcess* const _process;  // null without attachments
+  extract::Counts _counts;
   const std::shared_ptr<TLIndexableItem> _item = std::make_shared<TLIndexableItem>();
   bool _cut = false;
 };
 
 }  // namespace
 
-MessageParser::MessageParser() {
+MessageParser::MessageParser(const std::string& extractProgram) {
+  if (!extractProgram.empty()) _process.emplace(extractProgram);
   initMIME();
 }
 
@@ -258,7 +211,7 @@ std::variant<ParsedMessage, UnparsableMessage> MessageParser::parse(std::string_
   if (g_mime_header_list_get_count(headers) == 0) {
     return UnparsableMessage{"the message has no header"};
   }
-  return ItemBuilder(message.get(), origin, _decoder).build();
+  return ItemBuilder(message.get(), origin, _decoder, _process ? &*_process : nullptr).build();
 }
 
 }  // namespace cli

@@ -1,12 +1,14 @@
 #pragma once
 
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <variant>
 
 #include "cli/MailFile.h"
 #include "cli/TextDecoder.h"
+#include "extract/ExtractProcess.h"
 #include "records/TLIndexableItem.h"
 
 namespace cli {
@@ -19,7 +21,8 @@ inline constexpr size_t kMaxBodyBytes = size_t{1} << 20;
 
 struct ParsedMessage {
   std::shared_ptr<TLIndexableItem> item;
-  bool cut = false;  // some text was too long for the index
+  bool cut = false;  // some text was too long for the index; attachments do not count
+  extract::Counts attachments = {};
 };
 
 // The reason why a message cannot become an item.
@@ -31,7 +34,8 @@ struct UnparsableMessage {
 // them without recursion. One thread.
 class MessageParser {
  public:
-  MessageParser();
+  // With the path of tallow-extract, the text of attachments is added.
+  explicit MessageParser(const std::string& extractProgram = {});
 
   // The item has
   //   identifier, domainIdentifier          from the origin
@@ -42,6 +46,7 @@ class MessageParser {
   //   CONTENT_CREATION_DATE                 Date
   //   TEXT_CONTENT                          all inline text/plain parts, or where they hold no text
   //   HTML_CONTENT_DATA                     the text/html parts as UTF-8
+  //   TEXT_CONTENT                          in either case, the text of attachments at its end
   //   ATTACHMENT_NAMES, ATTACHMENT_TYPES, MAIL_MESSAGE_ID, MAILBOXES, MAILBOX_IDENTIFIERS,
   //   CONTENT_TYPE
   // and lacks what the message lacks. Dates are seconds since 1970.
@@ -50,6 +55,7 @@ class MessageParser {
 
  private:
   TextDecoder _decoder;
+  std::optional<extract::ExtractProcess> _process;
 };
 
 }  // namespace cli

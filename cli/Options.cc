@@ -143,6 +143,10 @@ bool isSearch(Command command) {
   return command == Command::search || command == Command::explain;
 }
 
+bool sendsMail(Command command) {
+  return command == Command::index || command == Command::sync || command == Command::watch;
+}
+
 void addQueryOptions(CLI::App& sub, Options& options) {
   sub.add_option("--query", options.query,
                  "Search by an expression instead of words; see tallow-query(7)")
@@ -185,6 +189,15 @@ void addSyncOptions(CLI::App& sub, Options& options) {
   sub.add_flag("--prune-missing", options.pruneMissing,
                "Delete the mail of directories that no longer exist");
   sub.add_flag("--retry", options.retryFailed, "Retry messages that could not be indexed");
+  sub.add_flag("--reread", options.reread, "Read and send everything again");
+}
+
+void addAttachmentOptions(CLI::App& sub, Options& options) {
+  sub.add_flag_callback(
+      "--attachments", [&options] { options.attachments = true; },
+      "Index the text of attachments, whatever the settings say");
+  sub.add_flag_callback(
+      "--no-attachments", [&options] { options.attachments = false; }, "Do not index it");
 }
 
 void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
@@ -203,6 +216,7 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
     sub->add_option("--html", options.page, "Write it as a page for browsers, with charts")
         ->type_name("FILE");
   }
+  if (sendsMail(row.command)) addAttachmentOptions(*sub, options);
   if (row.command == Command::purge) {
     sub->add_flag("-n,--dry-run", options.dryRun, "Only show how much space it would free");
   }

@@ -86,10 +86,14 @@ struct Options {
   // For status.
   std::string page;  // the file for the HTML page
 
+  // For index, sync and watch: whether the text of attachments is indexed, by the user.
+  std::optional<bool> attachments;
+
   // For sync.
   bool dryRun = false;
   bool pruneMissing = false;
   bool retryFailed = false;
+  bool reread = false;
 
   // For watch.
   bool onBattery = false;  // large backlogs do not wait for power

@@ -65,6 +65,7 @@ class Reader {
     return true;
   }
   bool readOnBattery(const toml::node& value) { return readFlag(value, _settings.onBattery); }
+  bool readAttachments(const toml::node& value) { return readFlag(value, _settings.attachments); }
   bool readDesktopSearch(const toml::node& value) {
     return readFlag(value, _settings.desktopSearch);
   }
@@ -131,7 +132,7 @@ struct Key {
   const char* allowed;
 };
 
-constexpr std::array<Key, 8> kKeys{{
+constexpr std::array<Key, 9> kKeys{{
     {"roots", &Reader::readRoots, "a list of paths, each from / or ~/ on"},
     {"exclude", &Reader::readExcluded,
      "a list of folders, from / or ~/ on, or below each root: [\".Trash\", \"~/Mail/old\"]"},
@@ -141,6 +142,7 @@ constexpr std::array<Key, 8> kKeys{{
     {"largest_mail", &Reader::readLargestMail,
      "a number of bytes or a text such as \"500 KB\" or \"20 MB\", from 1 KB to 67 MB"},
     {"on_battery", &Reader::readOnBattery, "true or false"},
+    {"attachments", &Reader::readAttachments, "true or false"},
     {"desktop_search", &Reader::readDesktopSearch, "true or false"},
     {"desktop_class", &Reader::readDesktopClass, "the name of a protection class"},
     {"mcp_folders", &Reader::readMCPFolders, "a list of paths, each from / or ~/ on"},

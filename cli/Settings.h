@@ -18,6 +18,7 @@ struct Settings {
   std::map<std::string, std::string> classes;  // protection class by folder
   uint64_t largestMail = 0;                    // in bytes; 0 if the user set no limit
   bool onBattery = false;
+  bool attachments = true;  // their text is indexed
   bool desktopSearch = false;
   std::string desktopClass = "default";  // the protection class that the desktop searches
   std::vector<std::string> mcpFolders;   // whose mail `mcp` may show

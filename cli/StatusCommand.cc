@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <nlohmann/json.hpp>
 
+#include "cli/AttachmentCounts.h"
 #include "cli/Commands.h"
 #include "cli/OutputFile.h"
 #include "cli/Results.h"
@@ -44,7 +45,7 @@ std::string mailboxText(mailsync::Catalogue& catalogue, const std::optional<int6
                         cleanForTerminal(problem.reason));
   }
   if (failed > 0) text += fmt::format("failed: {} more; see --format=json\n", failed);
-  return text;
+  return text + attachmentText(catalogue.attachments(), "Attached   ", "           ");
 }
 
 nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue, const std::optional<int64_t>& last) {
@@ -64,7 +65,8 @@ nlohmann::json mailboxJSON(mailsync::Catalogue& catalogue, const std::optional<i
   return {{"lastSync", last ? nlohmann::json(timeText(*last)) : nlohmann::json()},
           {"roots", catalogue.roots()},
           {"folders", std::move(folders)},
-          {"problems", std::move(problems)}};
+          {"problems", std::move(problems)},
+          {"attachments", attachmentJSON(catalogue.attachments())}};
 }
 
 std::string indexText(const IndexStatus& index) {

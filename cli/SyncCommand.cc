@@ -7,6 +7,7 @@
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
+#include "cli/HelperProgram.h"
 #include "cli/ProgressBar.h"
 #include "cli/Results.h"
 #include "cli/StatusFacts.h"
@@ -105,6 +106,7 @@ mailsync::SyncSettings syncSettings(const Options& options) {
   settings.patience = options.patience();
   settings.pruneMissing = options.pruneMissing;
   settings.retryFailed = options.retryFailed;
+  settings.reread = options.reread;
   settings.dryRun = options.dryRun;
   return settings;
 }
@@ -117,6 +119,7 @@ mailsync::SyncSettings syncSettings(const Options& options, const MailboxGroup& 
   Options ofGroup = options;
   ofGroup.protectionClass = group.protectionClass;
   settings.measure = [ofGroup] { return measureIndex(ofGroup); };
+  settings.extractProgram = extractProgram(options, group.attachments);
   return settings;
 }
 

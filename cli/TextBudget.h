@@ -26,6 +26,9 @@ class TextBudget {
   // As `take`, for markup, which counts as text. Does not cut inside a tag.
   [[nodiscard]] TLStringView takeMarkup(TLStringView text);
 
+  // An upper bound of the UTF-8 bytes that it can still pay for.
+  [[nodiscard]] size_t left() const { return _left; }
+
   // True if any text has been cut.
   [[nodiscard]] bool exhausted() const { return _exhausted; }
 

@@ -43,12 +43,16 @@ CREATE TABLE IF NOT EXISTS measurement (
   day INTEGER PRIMARY KEY, messages INTEGER NOT NULL, index_bytes INTEGER NOT NULL,
   store_bytes INTEGER NOT NULL, scans INTEGER NOT NULL, scan_microseconds INTEGER NOT NULL,
   merges INTEGER NOT NULL, merge_microseconds INTEGER NOT NULL);
+CREATE TABLE IF NOT EXISTS attachment (
+  type TEXT NOT NULL, outcome TEXT NOT NULL, count INTEGER NOT NULL, PRIMARY KEY (type, outcome))
+  WITHOUT ROWID;
 )";
 
 constexpr const char* kDropAll = R"(
 DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS root; DROP TABLE IF EXISTS directory;
 DROP TABLE IF EXISTS file; DROP TABLE IF EXISTS message; DROP TABLE IF EXISTS deletion;
 DROP TABLE IF EXISTS measurement;
+DROP TABLE IF EXISTS attachment;
 )";
 
 // Acknowledged deletions to keep, in case the daemon's data is restored to an older state.

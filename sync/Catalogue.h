@@ -8,6 +8,7 @@
 #include <unordered_map>
 #include <vector>
 
+#include "extract/Protocol.h"
 #include "sync/Database.h"
 
 namespace mailsync {
@@ -184,6 +185,8 @@ class Catalogue {
   // An older version that may be in the index is deleted as well, unless `deleted` says that this
   // is done.
   void setFailed(int64_t message, const std::string& problem, bool deleted = false);
+  // As setStale, for all messages but those that failed.
+  void setAllStale();
   void removeMessage(int64_t id);
   // Messages that failed are tried again.
   void retryFailed();
@@ -207,6 +210,10 @@ class Catalogue {
   // wait, and so do those sent after `trusted`, because the index may have another version.
   // Messages that only the index has are deleted.
   void adopt(const std::vector<IndexedMessage>& inIndex, int64_t trusted);
+
+  // What became of attachments, each time that a message was read.
+  void addAttachments(const extract::Counts& counts);
+  [[nodiscard]] extract::Counts attachments();
 
   [[nodiscard]] std::vector<FolderCount> folderCounts();
   // By month, in the user's time zone, of the messages that are in the index.

@@ -73,6 +73,12 @@ void Catalogue::setStale(int64_t message) {
       .run();
 }
 
+void Catalogue::setAllStale() {
+  sql("UPDATE message SET replace = (replace OR sequence != 9223372036854775807), "
+      "sequence = 9223372036854775807 WHERE sequence != -1")
+      .run();
+}
+
 void Catalogue::setFailed(int64_t message, const std::string& problem, bool deleted) {
   if (!deleted) noteDeletion(message);
   sql("UPDATE message SET sequence = -1, replace = 0, problem = ? WHERE id = ?")
@@ -194,6 +200,30 @@ void Catalogue::adopt(const std::vector<IndexedMessage>& inIndex, int64_t truste
 }
 
 // --- What there is to tell
+
+void Catalogue::addAttachments(const extract::Counts& counts) {
+  Statement& statement =
+      sql("INSERT INTO attachment VALUES (?, ?, ?) ON CONFLICT (type, outcome) "
+          "DO UPDATE SET count = count + excluded.count");
+  counts.forEach([&](extract::Kind kind, extract::Outcome outcome, uint64_t count) {
+    statement.bindText(nameOf(kind)).bindText(nameOf(outcome));
+    statement.bind(static_cast<int64_t>(count)).run();
+  });
+}
+
+// Rows of another version, with other names, are left out.
+extract::Counts Catalogue::attachments() {
+  extract::Counts counts;
+  Statement& statement = sql("SELECT count FROM attachment WHERE type = ? AND outcome = ?");
+  for (size_t kind = 0; kind < counts.rows.size(); ++kind) {
+    for (size_t outcome = 0; outcome < counts.rows[kind].size(); ++outcome) {
+      statement.bindText(extract::kKindNames[kind]).bindText(extract::kOutcomeNames[outcome]);
+      const auto count = first(statement, [](const Statement& row) { return row.number(0); });
+      counts.rows[kind][outcome] = static_cast<uint64_t>(count.value_or(0));
+    }
+  }
+  return counts;
+}
 
 std::vector<FolderCount> Catalogue::folderCounts() {
   Statement& statement =

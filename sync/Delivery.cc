@@ -130,7 +130,7 @@ bool Delivery::sendMessages(TLErrorOut error) {
         messages.push_back(std::move(*message));
       }
     }
-    ItemReader reader(std::move(messages), _target.largestMessage);
+    ItemReader reader(std::move(messages), _target.largestMessage, _target.extractProgram);
     while (const auto batch = reader.next()) {
       if (_observer.cancelled()) return true;
       if (!sendBatch(*batch, error)) return false;
@@ -146,6 +146,7 @@ bool Delivery::sendBatch(const ReadBatch& batch, TLErrorOut error) {
         for (const ReadBatch::Failure& failure : batch.failures) {
           if (failure.lasting) _catalogue.setFailed(failure.message, failure.reason);
         }
+        _catalogue.addAttachments(batch.attachments);
       },
       error);
   if (!noted) return false;

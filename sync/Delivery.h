@@ -49,8 +49,9 @@ class Delivery {
   struct Target {
     std::string name;
     std::string protectionClass;
-    uint64_t largestMessage = 0;  // larger ones fail; 0 for no limit
-    int64_t firstMessage = 0;     // its ID in the catalogue; earlier ones keep waiting
+    uint64_t largestMessage = 0;      // larger ones fail; 0 for no limit
+    int64_t firstMessage = 0;         // its ID in the catalogue; earlier ones keep waiting
+    std::string extractProgram = {};  // see ItemReader
   };
   struct Observer {
     std::function<void(const std::string& where, const std::string& reason)> complain;

@@ -32,7 +32,7 @@ void addFlags(TLIndexableItem& item, const std::string& flags) {
 // The work of the reading thread: gathers a batch and pushes it when it is full.
 class ItemReader::Reading {
  public:
-  explicit Reading(ItemReader& reader) : _reader(reader) {}
+  explicit Reading(ItemReader& reader) : _reader(reader), _parser(reader._extractProgram) {}
 
   // All messages must be from one file.
   bool read(std::span<const WaitingMessage> group) {
@@ -91,6 +91,7 @@ class ItemReader::Reading {
     }
     _batch.bytes += item.bytes.size();
     _batch.cut += parsed.cut ? 1 : 0;
+    _batch.attachments.add(parsed.attachments);
     const bool replace = waiting.message.replace || waiting.message.sequence != kWaiting;
     _batch.items.push_back({waiting.message.id, replace, digest,
                             cli::wholeSeconds(cli::dateOf(*parsed.item)), std::move(item)});
@@ -114,8 +115,12 @@ class ItemReader::Reading {
   ReadBatch _batch;
 };
 
-ItemReader::ItemReader(std::vector<WaitingMessage> messages, uint64_t largestMessage)
-    : _messages(std::move(messages)), _largestMessage(largestMessage), _thread([this] { run(); }) {}
+ItemReader::ItemReader(std::vector<WaitingMessage> messages, uint64_t largestMessage,
+                       std::string extractProgram)
+    : _messages(std::move(messages)),
+      _largestMessage(largestMessage),
+      _extractProgram(std::move(extractProgram)),
+      _thread([this] { run(); }) {}
 
 ItemReader::~ItemReader() {
   _queue.cancel();

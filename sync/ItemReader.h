@@ -8,6 +8,7 @@
 
 #include "cli/BatchQueue.h"
 #include "client/Batches.h"
+#include "extract/Protocol.h"
 #include "sync/Catalogue.h"
 
 namespace mailsync {
@@ -31,6 +32,7 @@ struct ReadBatch {
   std::vector<Failure> failures;
   size_t bytes = 0;
   uint64_t cut = 0;  // items whose text was too long for the index
+  extract::Counts attachments;
 };
 
 // Reads waiting messages and converts them to items on its own thread, so that reading and sending
@@ -42,8 +44,10 @@ struct ReadBatch {
 class ItemReader {
  public:
   // Messages of one mbox file should be adjacent, because the file is read once for each such
-  // group. Messages of more than `largestMessage` bytes fail; 0 means no limit.
-  ItemReader(std::vector<WaitingMessage> messages, uint64_t largestMessage);
+  // group. Messages of more than `largestMessage` bytes fail; 0 means no limit. `extractProgram` is
+  // the path of tallow-extract, for the text of attachments, or empty.
+  ItemReader(std::vector<WaitingMessage> messages, uint64_t largestMessage,
+             std::string extractProgram);
   ~ItemReader();
   ItemReader(const ItemReader&) = delete;
   ItemReader& operator=(const ItemReader&) = delete;
@@ -58,6 +62,7 @@ class ItemReader {
 
   const std::vector<WaitingMessage> _messages;
   const uint64_t _largestMessage;
+  const std::string _extractProgram;
   cli::BatchQueue<ReadBatch> _queue;  // thread-safe
   std::thread _thread;
 };

@@ -154,6 +154,7 @@ class Run {
       return _report.cancelled;
     }
     if (_settings.retryFailed) _catalogue->retryFailed();
+    if (_settings.reread) _catalogue->setAllStale();
     _report.toSend = static_cast<uint64_t>(_catalogue->waitingCount());
     if (_settings.backlogLimit > 0 && _report.toSend > _settings.backlogLimit) hold(last + 1);
     _report.toDelete = static_cast<uint64_t>(_catalogue->waitingDeletionCount());
@@ -274,10 +275,10 @@ class Run {
       _observer.progress(_report.toSend, _report.toDelete, done);
     };
     if (_report.toSend + _report.toDelete > 0) progress({});
-    Delivery delivery(
-        *_catalogue, _service,
-        {_settings.name, _settings.protectionClass, _settings.largestMessage, _firstMessage},
-        {_observer.complain, progress, _observer.cancelled});
+    Delivery delivery(*_catalogue, _service,
+                      {_settings.name, _settings.protectionClass, _settings.largestMessage,
+                       _firstMessage, _settings.extractProgram},
+                      {_observer.complain, progress, _observer.cancelled});
     const bool done = delivery.run(_stored, error);
     _report.delivery = delivery.counts();
     _report.cancelled = _observer.cancelled();

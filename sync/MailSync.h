@@ -31,6 +31,7 @@ struct SyncSettings {
 
   std::vector<std::string> excluded;  // directories
   uint64_t largestMessage = 0;        // in bytes; larger ones fail; 0 for no limit
+  std::string extractProgram;         // see ItemReader
   // The number of messages that may wait. If more wait, only those found by this run are sent, and
   // only if they do not exceed the limit either. 0 means no limit.
   uint64_t backlogLimit = 0;
@@ -39,6 +40,7 @@ struct SyncSettings {
   std::function<std::optional<Measurement>()> measure = {};
   bool pruneMissing = false;
   bool retryFailed = false;
+  bool reread = false;  // all messages are sent again
   bool dryRun = false;
 };
 

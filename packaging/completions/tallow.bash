@@ -10,8 +10,9 @@ _tallow() {
   local commands='index sync watch status search screen explain show address save mcp delete reset stats metrics ping
     vacuum state dump validate purge help'
   local options='--runtime-dir --state-dir --class --name --format --limit --color --wait --yes
-    --verbose --dry-run --prune-missing --retry --on-battery --query --filter --param --offset --sort --count
-    --print0 --threads --maildir --html --raw --attachment --output --force --mutt --delete --folder --help --version'
+    --verbose --dry-run --prune-missing --retry --reread --attachments --no-attachments --on-battery --query --filter
+    --param --offset --sort --count --print0 --threads --maildir --html --raw --attachment --output --force --mutt
+    --delete --folder --help --version'
   # Bash takes --option=value apart.
   if [[ $prev == = ]]; then
     prev=${COMP_WORDS[COMP_CWORD - 2]}

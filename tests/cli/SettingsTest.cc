@@ -34,6 +34,7 @@ roots = ["~/Mail", "/srv/mail.mbox", "~"]
 exclude = [".Trash", "~/Mail/old", "Lists/noise"]
 largest_mail = "20 MB"
 on_battery = true
+attachments = false
 desktop_search = true
 desktop_class = "work"
 mcp_folders = ["~/Mail/lists"]
@@ -46,6 +47,8 @@ mcp_folders = ["~/Mail/lists"]
   EXPECT_THAT(settings.classes, ElementsAre(Pair("/home/mara/Mail/work", "work")));
   EXPECT_EQ(settings.largestMail, 20'000'000U);
   EXPECT_TRUE(settings.onBattery);
+  EXPECT_FALSE(settings.attachments);
+  EXPECT_TRUE(settingsOf("").attachments);
   EXPECT_TRUE(settings.desktopSearch);
   EXPECT_EQ(settings.desktopClass, "work");
   EXPECT_FALSE(settingsOf("").desktopSearch);
@@ -61,16 +64,29 @@ TEST(Settings, ErrorsNameFileLineKeyAndAllowedValues) {
             "config.toml:2: there is no key \"rots\"; did you mean \"roots\"?");
   EXPECT_EQ(complaintOf("colour = 1"),
             "config.toml:1: there is no key \"colour\"; the keys are roots, exclude, class, "
-            "largest_mail, on_battery, desktop_search, desktop_class, mcp_folders");
+            "largest_mail, on_battery, attachments, desktop_search, desktop_class, mcp_folders");
   EXPECT_EQ(complaintOf("# a\n\non_battery = \"yes\""),
             "config.toml:3: on_battery takes true or false");
-  for (const char* const bad :
-       {"roots = 1", "roots = [1]", "roots = ['Mail']", "roots = [\"/a\\u0000b\"]",
-        "exclude = ['']", "exclude = 'a'", "largest_mail = 10", "largest_mail = -1",
-        "largest_mail = '1 GB'", "largest_mail = '99999999999999999999 KB'",
-        "largest_mail = 99999999999", "on_battery = 1", "desktop_search = 1",
-        "desktop_class = 'a/b'", "class = 1", "class = {'work' = 'a'}", "class = {'/work' = ''}",
-        "class = {'/work' = '../a'}", "class = {'/work' = 1}"}) {
+  for (const char* const bad : {"roots = 1",
+                                "roots = [1]",
+                                "roots = ['Mail']",
+                                "roots = [\"/a\\u0000b\"]",
+                                "exclude = ['']",
+                                "exclude = 'a'",
+                                "largest_mail = 10",
+                                "largest_mail = -1",
+                                "largest_mail = '1 GB'",
+                                "largest_mail = '99999999999999999999 KB'",
+                                "largest_mail = 99999999999",
+                                "on_battery = 1",
+                                "attachments = 1",
+                                "desktop_search = 1",
+                                "desktop_class = 'a/b'",
+                                "class = 1",
+                                "class = {'work' = 'a'}",
+                                "class = {'/work' = ''}",
+                                "class = {'/work' = '../a'}",
+                                "class = {'/work' = 1}"}) {
     EXPECT_THAT(complaintOf(bad), HasSubstr(" takes ")) << bad;
   }
   for (const std::string& bad :

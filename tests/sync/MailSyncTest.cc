@@ -273,6 +273,42 @@ TEST_F(MailSyncTest, ReportsFailedMessagesAndDoesNotCountThemAsSent) {
   EXPECT_EQ(indexed(), (Lines{"a: one", "a: poison"}));
 }
 
+// Attachments are read when a message is sent, and counted; messages sent before are read again on
+// request only.
+TEST_F(MailSyncTest, AttachmentsOfMessagesThatAreSent) {
+  const auto text = [this] {
+    const auto& item = daemon.content().items.begin()->second;
+    return platform::toUTF8(*item->stringValueForKey(TLAttributeKey::TEXT_CONTENT));
+  };
+  const auto counted = [this] {
+    std::vector<std::string> lines;
+    const auto counts = mailsync::openCatalogue(settings, nullptr)->attachments();
+    counts.forEach([&](auto kind, auto outcome, uint64_t count) {
+      lines.push_back(fmt::format("{} {} {}", nameOf(kind), nameOf(outcome), count));
+    });
+    return lines;
+  };
+  put("a/cur/1",
+      "Subject: s\nContent-Type: multipart/mixed; boundary=b\n\n--b\n\nBody\n"
+      "--b\nContent-Type: text/html\nContent-Disposition: attachment\n\n<p>Attached\n"
+      "--b\nContent-Type: application/pdf\n\nno PDF\n--b--\n");
+  ASSERT_TRUE(sync());
+  EXPECT_EQ(text(), "Body");
+  EXPECT_THAT(counted(), testing::IsEmpty());
+  settings.extractProgram = TALLOW_EXTRACT_PROGRAM;
+  ASSERT_TRUE(sync());
+  EXPECT_EQ(text(), "Body");
+  settings.reread = true;
+  for (int i = 1; i <= 2; ++i) {
+    ASSERT_TRUE(sync());
+    EXPECT_EQ(report.delivery.replaced, 1U);
+    EXPECT_EQ(daemon.content().items.size(), 1U);
+    EXPECT_THAT(text(), testing::StartsWith("Body\nAttached"));
+    EXPECT_THAT(counted(),
+                ElementsAre(fmt::format("pdf damaged {}", i), fmt::format("html extracted {}", i)));
+  }
+}
+
 // It does not wait for the disk either.
 TEST_F(MailSyncTest, WithoutChangesTheCatalogueIsNotWritten) {
   EXPECT_EQ(mailsync::lastSync(settings), std::nullopt);

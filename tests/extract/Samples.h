@@ -1,0 +1,33 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+// Small files of the kinds that attachments have, made by the tests themselves.
+namespace samples {
+
+struct ZipEntry {
+  std::string name;
+  std::string content;
+};
+
+// A zip file; `deflated` compresses its entries.
+[[nodiscard]] std::string zip(const std::vector<ZipEntry>& entries, bool deflated = true);
+
+// An office document with these paragraphs.
+[[nodiscard]] std::string docx(const std::vector<std::string>& paragraphs);
+[[nodiscard]] std::string odt(const std::vector<std::string>& paragraphs);
+
+// A PDF file with one line of Latin text on each page. `font` is the font's dictionary.
+[[nodiscard]] std::string pdf(const std::vector<std::string>& pages,
+                              std::string_view font = "/Subtype/Type1/BaseFont/Helvetica");
+
+// A PDF file whose page tree promises `count` pages with the same content.
+[[nodiscard]] std::string pdfOfManyPages(size_t count);
+
+// A PDF file that cannot be read without a password, but for the stream that it lacks.
+[[nodiscard]] std::string encryptedPDF();
+
+}  // namespace samples
