@@ -53,6 +53,24 @@ class MailProgramsTest : public testsupport::TmuxTest {
     return platform::readFile(std::string(TALLOW_MAIL_PROGRAMS) + '/' + name, 100000, nullptr)
         .value_or("");
   }
+  void configureAerc(const std::string& editor) const {
+    fs::create_directory(mail + "/family/tmp");
+    write("config/aerc/accounts.conf",
+          fmt::format("[Mail]\nsource = maildir://{}\ndefault = family\n"
+                      "from = Mara <mara.lindqvist@example.org>\noutgoing = /bin/false\n",
+                      mail) +
+              settings("aerc-accounts.conf"));
+    fs::permissions(directory / "config/aerc/accounts.conf",
+                    fs::perms::owner_read | fs::perms::owner_write);
+    write("config/aerc/aerc.conf",
+          fmt::format("[general]\nunsafe-accounts-conf=true\n[compose]\neditor={}\n{}", editor,
+                      settings("aerc.conf")));
+    write("config/aerc/binds.conf",
+          settings("aerc-binds.conf") +
+              "n = :next-tab<Enter>\n<Enter> = :view<Enter>\n"
+              "g = :select 0<Enter>\nc = :compose<Enter>\n[view]\nr = :reply -q<Enter>\n");
+  }
+
   // What the editor was given, once it has the text.
   [[nodiscard]] std::string awaitReply(const std::string& text) const {
     awaitThat([&](const std::string&) { return read("reply").find(text) != std::string::npos; },
@@ -124,20 +142,7 @@ TEST_F(MailProgramsTest, Neomutt) {
 TEST_F(MailProgramsTest, Aerc) {
   NEED_PROGRAMS("tmux", "aerc")
   prepare();
-  fs::create_directory(mail + "/family/tmp");
-  write("config/aerc/accounts.conf",
-        fmt::format("[Mail]\nsource = maildir://{}\ndefault = family\n"
-                    "from = Mara <mara.lindqvist@example.org>\noutgoing = /bin/false\n",
-                    mail) +
-            settings("aerc-accounts.conf"));
-  fs::permissions(directory / "config/aerc/accounts.conf",
-                  fs::perms::owner_read | fs::perms::owner_write);
-  write("config/aerc/aerc.conf",
-        fmt::format("[general]\nunsafe-accounts-conf=true\n[compose]\neditor={}/bin/editor\n{}",
-                    directory.path(), settings("aerc.conf")));
-  write("config/aerc/binds.conf", settings("aerc-binds.conf") +
-                                      "n = :next-tab<Enter>\n<Enter> = :view<Enter>\n"
-                                      "g = :select 0<Enter>\n[view]\nr = :reply -q<Enter>\n");
+  configureAerc(directory / "bin/editor");
   ASSERT_EQ(std::system((variables + " HOME=" + directory.path() +
                          " tallow search --maildir=" + folder + " >/dev/null")
                             .c_str()),
@@ -164,6 +169,21 @@ TEST_F(MailProgramsTest, Aerc) {
   EXPECT_THAT(awaitReply("> Dear Mara"), HasSubstr("Samir Haddad wrote"));
   await("Send this email?");
   EXPECT_THAT(screen(), HasSubstr("To: \"Samir Haddad\" <samir@example.com>"));
+}
+
+// Who is written to is completed from the mail.
+TEST_F(MailProgramsTest, AercCompletesAddresses) {
+  NEED_PROGRAMS("tmux", "aerc")
+  prepare();
+  write("bin/waiting", "#!/bin/sh\nexec sleep 1000\n");
+  fs::permissions(directory / "bin/waiting", fs::perms::owner_all);
+  configureAerc(directory / "bin/waiting");
+  start("aerc", 120, 30);
+  await("Elena Ruiz");
+  press("c");
+  await("To:");
+  type("sami");
+  await("samir@example.com");
 }
 
 TEST_F(MailProgramsTest, Emacs) {
