@@ -277,7 +277,7 @@ TEST_F(MailSyncTest, ReportsFailedMessagesAndDoesNotCountThemAsSent) {
 // request only.
 TEST_F(MailSyncTest, AttachmentsOfMessagesThatAreSent) {
   const auto text = [this] {
-    const auto& item = daemon.content().items.begin()->second;
+    const auto item = daemon.content().items.begin()->second;
     return platform::toUTF8(*item->stringValueForKey(TLAttributeKey::TEXT_CONTENT));
   };
   const auto counted = [this] {
