@@ -58,7 +58,7 @@ sd_bus_message* SearchClient::newCall(const char* member) {
 
 sd_bus_message* SearchClient::callAndWait(sd_bus_message* call) {
   sd_bus_message* reply = nullptr;
-  sd_bus_error error = SD_BUS_ERROR_NULL;
+  sd_bus_error error = {};
   TL_ASSERT(sd_bus_call(_bus, call, 0, &error, &reply) >= 0);
   sd_bus_error_free(&error);
   sd_bus_message_unref(call);

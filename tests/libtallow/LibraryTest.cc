@@ -154,9 +154,10 @@ TEST(LibraryWithoutDaemonTest, IsUnreachableUntilADaemonStarts) {
 }
 
 TEST(LibraryWithoutDaemonTest, AnInterruptEndsACall) {
-  testsupport::FakeDaemon daemon;
+  // Before the daemon, whose thread may still look at them when the test has seen enough.
   std::promise<void> asked;
   std::promise<void> released;
+  testsupport::FakeDaemon daemon;
   daemon.answer("DeleteAllItems", [&](rpc::Reply&) {
     asked.set_value();
     released.get_future().wait();
