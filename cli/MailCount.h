@@ -23,7 +23,7 @@ class MailCounter {
  public:
   static constexpr size_t kMaxDepth = 16;           // of directories below a place
   static constexpr size_t kMaxDirectories = 20000;  // in all places
-  static constexpr uint64_t kReadOfMbox = uint64_t{1} << 20;
+  static constexpr uint64_t kReadOfMbox = uint64_t{4} << 20;
   static constexpr std::chrono::seconds kPatience{10};
 
   // `path` is canonical. Links are not followed.
