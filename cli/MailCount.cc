@@ -15,16 +15,13 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// The entries of a Maildir's cur or new.
-uint64_t filesIn(const fs::path& directory) {
-  std::error_code failure;
-  uint64_t files = 0;
-  for (fs::directory_iterator at(directory, failure), end; !failure && at != end;
-       at.increment(failure)) {
-    std::error_code gone;
-    if (at->symlink_status(gone).type() == fs::file_type::regular) ++files;
-  }
-  return files;
+// The kind that the directory itself tells, so that most entries need no look of their own. Links
+// are none.
+fs::file_type typeOf(const fs::directory_entry& entry) {
+  std::error_code gone;
+  if (entry.is_symlink(gone)) return fs::file_type::symlink;
+  if (entry.is_directory(gone)) return fs::file_type::directory;
+  return entry.is_regular_file(gone) ? fs::file_type::regular : fs::file_type::unknown;
 }
 
 bool isMaildir(const fs::path& directory) {
@@ -72,6 +69,17 @@ MailCounter::FileKind MailCounter::countFile(const std::string& path, uint64_t s
   return kind;
 }
 
+// Each file in a Maildir's cur or new is a mail.
+void MailCounter::countMaildirFiles(const fs::path& directory, MailCount& count) {
+  std::error_code failure;
+  fs::directory_iterator at(directory, failure);
+  for (const fs::directory_iterator end; !failure && at != end && take(count);
+       at.increment(failure)) {
+    if (typeOf(*at) == fs::file_type::regular) ++count.mails;
+  }
+  noteFailure(count, directory, failure);
+}
+
 void MailCounter::countDirectory(const Directory& directory, MailCount& count,
                                  std::vector<Directory>& pending) {
   const bool maildir = isMaildir(directory.path);
@@ -80,18 +88,21 @@ void MailCounter::countDirectory(const Directory& directory, MailCount& count,
   fs::directory_iterator at(directory.path, failure);
   for (const fs::directory_iterator end; !failure && at != end && take(count);
        at.increment(failure)) {
-    std::error_code gone;
-    const auto type = at->symlink_status(gone).type();
+    const auto type = typeOf(*at);
     if (type == fs::file_type::directory && !(maildir && isPartOfMaildir(at->path().filename()))) {
       pending.push_back({at->path(), directory.depth + 1});
     } else if (type == fs::file_type::regular && !maildir) {
+      std::error_code gone;
       const FileKind kind = countFile(at->path(), at->file_size(gone), count);
       count.boxes += kind == FileKind::mbox ? 1 : 0;
       messages = messages || kind == FileKind::message;
     }
   }
   noteFailure(count, directory.path, failure);
-  if (maildir) count.mails += filesIn(directory.path / "cur") + filesIn(directory.path / "new");
+  if (maildir) {
+    countMaildirFiles(directory.path / "cur", count);
+    countMaildirFiles(directory.path / "new", count);
+  }
   if (maildir || messages) ++count.boxes;
 }
 

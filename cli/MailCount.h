@@ -38,6 +38,7 @@ class MailCounter {
 
   bool take(MailCount& count);
   static FileKind countFile(const std::string& path, uint64_t size, MailCount& count);
+  void countMaildirFiles(const std::filesystem::path& directory, MailCount& count);
   void countDirectory(const Directory& directory, MailCount& count,
                       std::vector<Directory>& pending);
 

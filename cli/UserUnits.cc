@@ -16,8 +16,8 @@ namespace {
 
 using Words = std::vector<std::string>;
 
-// A watch ends after the batch in hand, so that stopping it may take a while.
-constexpr std::chrono::seconds kUnitPatience{60};
+// A watch ends after the batch in hand; systemd kills it after 90 seconds unless configured.
+constexpr std::chrono::seconds kUnitPatience{120};
 
 const Words kSockets{"tallowsearchd.socket", "tallowsearchd-debug.socket"};
 const Words kWatch{"tallow-watch.service"};

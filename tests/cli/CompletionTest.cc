@@ -132,13 +132,13 @@ TEST_F(CompletionTest, Zsh) {
 
 TEST_F(CompletionTest, Fish) {
   if (lacks({"fish"})) return;
-  writeScript("fish", "fish/completions/tallow.fish");
+  writeScript("fish", "config/fish/completions/tallow.fish");
   saveSearch();
   // The words that `complete -C` offers for a line, without their descriptions.
   const auto offered = [&](const std::string& line) {
     std::istringstream lines(testsupport::outputOf(fmt::format(
         "cd {0}/work && HOME={0} XDG_CONFIG_HOME={0}/config XDG_DATA_HOME={0} PATH={0}/bin:$PATH "
-        "fish -N -c 'source {0}/fish/completions/tallow.fish; complete -C \"{1}\"'",
+        "fish -c 'complete -C \"{1}\"'",
         directory.path(), line)));
     std::vector<std::string> words;
     for (std::string one; std::getline(lines, one);) words.push_back(one.substr(0, one.find('\t')));
