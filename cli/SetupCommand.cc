@@ -61,8 +61,8 @@ bool isTerminal() {
 
 class Setup {
  public:
-  Setup(const Options& options, Settings settings)
-      : _options(options), _settings(std::move(settings)), _home(variable("HOME")) {}
+  Setup(Options options, Settings settings)
+      : _options(std::move(options)), _settings(std::move(settings)), _home(variable("HOME")) {}
 
   ExitStatus run() {
     _found = look();
@@ -161,7 +161,7 @@ class Setup {
   }
 
   // Starts daemon, first sync and watch, as far as they are not at work.
-  [[nodiscard]] ExitStatus start(bool changed) const {
+  [[nodiscard]] ExitStatus start(bool changed) {
     if (_options.runtimeDirectory != rpc::defaultRuntimeDirectory()) {
       say("The units of systemd stay as they are, because of --runtime-dir.");
       return syncAlone(changed);
@@ -171,6 +171,8 @@ class Setup {
       complain("the units of systemd cannot be used: " + *failure);
       return syncAlone(changed);
     }
+    // For root it depends on the sockets, which may be new.
+    _options.runtimeDirectory = rpc::defaultRuntimeDirectory();
     say("The daemon and tallow-watch.service start by themselves from now on.");
     return syncWithUnits();
   }
@@ -232,7 +234,7 @@ class Setup {
     return runSync(ofSettings);
   }
 
-  const Options& _options;
+  Options _options;
   const Settings _settings;
   const std::string _home;
   FoundMail _found;

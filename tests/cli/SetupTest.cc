@@ -28,24 +28,28 @@ using testing::UnorderedElementsAre;
 // and a real daemon.
 namespace {
 
-// Units are running or enabled while a file of their name exists. An empty or missing file `mode`
-// is a systemd that works.
-constexpr const char* kSystemctl = R"(#!/bin/sh
-echo "$*" >>{0}/systemctl.log
-[ -e {0}/fails ] && {{ printf 'Failed to connect to bus: \033[31mNo medium found\nmore\n' >&2; exit 1; }}
+// Units are running or enabled while a file of their name exists. With a file `fails`, no manager
+// answers; with a file `runtime`, that directory of sockets is there once a unit is started.
+constexpr const char* kSystemctl = R"shell(#!/bin/sh
+d=$(dirname "$0")/..
+echo "$*" >>$d/systemctl.log
+[ -e $d/fails ] && { printf 'Failed to connect to bus: \033[31mNo medium found\nmore\n' >&2; exit 1; }
 verb=$2 status=0
 shift 2
 for unit; do
   case $verb in
-    start) touch "{0}/active.$unit" ;;
-    stop) rm -f "{0}/active.$unit" ;;
-    enable) touch "{0}/enabled.$unit" ;;
-    is-active) [ -e "{0}/active.$unit" ] && echo active || {{ echo inactive; status=3; }} ;;
-    is-enabled) [ -e "{0}/enabled.$unit" ] && echo enabled || {{ echo disabled; status=1; }} ;;
+    start)
+      touch "$d/active.$unit"
+      [ -e $d/runtime ] && ln -sfn "$(cat $d/runtime)" $d/xdg/tallow
+      ;;
+    stop) rm -f "$d/active.$unit" ;;
+    enable) touch "$d/enabled.$unit" ;;
+    is-active) [ -e "$d/active.$unit" ] && echo active || { echo inactive; status=3; } ;;
+    is-enabled) [ -e "$d/enabled.$unit" ] && echo enabled || { echo disabled; status=1; } ;;
   esac
 done
 exit $status
-)";
+)shell";
 
 constexpr const char* kSockets = "tallowsearchd.socket tallowsearchd-debug.socket";
 
@@ -54,7 +58,7 @@ class SetupTest : public testsupport::TmuxTest {
   SetupTest() {
     fs::create_directories(directory / "bin");
     fs::create_directories(directory / "xdg");
-    write("bin/systemctl", fmt::format(kSystemctl, directory.path()));
+    write("bin/systemctl", kSystemctl);
     fs::permissions(directory / "bin/systemctl", fs::perms::owner_all);
     fs::create_directory(home);
     variables = environment();
@@ -156,10 +160,10 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
   write("home/mail/2010/notes.txt", "no mail\n");
   fs::create_directory_symlink(directory / "elsewhere", home + "/Mail");
   fs::create_directory_symlink(directory / "elsewhere", home + "/mail/link");
-  write(
-      "home/.mbsyncrc",
-      "IMAPStore far\nPath ~/not-mine\n\n# a comment\nMaildirStore near\n  path \"~/by-mbsync/\"\n"
-      "Inbox ~/by-mbsync/inbox\n\nChannel c\nFar :far:\n");
+  write("home/.mbsyncrc",
+        "IMAPStore far\nPath ~/not-mine\n\n# a comment\nMaildirStore near\n  path "
+        "\"~/by-mbsync/\"\n"
+        "Inbox ~/by-mbsync/inbox\n\nChannel c\nFar :far:\n");
   write("home/.offlineimaprc",
         "[Repository Local]\ntype = Maildir\nlocalfolders = ~/by-offlineimap\n");
   write("home/.config/neomutt/neomuttrc",
@@ -209,6 +213,8 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
 TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
   makeMaildir(home + "/Maildir", 2);
   startDaemon();
+  fs::remove(directory / "xdg/tallow");
+  write("runtime", daemon->runtimeDirectory());
   EXPECT_EQ(run("setup --yes"), 0) << errors;
   EXPECT_THAT(roots(), ElementsAre(home + "/Maildir"));
   struct stat info;
