@@ -170,6 +170,8 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
         "set realname=\"x\" folder = '$HOME/by-mutt' # set folder=~/not-mine-either\n"
         "set folder=imaps://example.org/\nset spoolfile=+folder=~/not-mine\n");
   write("home/.muttrc", "set folder=~\n");
+  makeMaildir(directory / "outside", 1);
+  write("home/.mutt/muttrc", "set folder=~/../outside\n");
   write("home/.config/aerc/accounts.conf",
         "[a]\nsource = maildir://~/by-aerc\n[b]\nsource = imaps://x\n");
   ASSERT_EQ(mkfifo((home + "/.neomuttrc").c_str(), 0600), 0);
@@ -196,6 +198,7 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
     EXPECT_THAT(output + errors, Not(HasSubstr(no)));
   }
   EXPECT_THAT(errors, HasSubstr("/elsewhere is outside of your home directory"));
+  EXPECT_THAT(errors, HasSubstr("/outside is outside of your home directory"));
   EXPECT_THAT(errors, HasSubstr("/home holds your whole home directory"));
   EXPECT_THAT(errors, HasSubstr("is skipped: its name is not UTF-8"));
 
