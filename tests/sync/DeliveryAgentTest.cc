@@ -2,7 +2,7 @@
 #include <cstdio>
 #include <thread>
 
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 #include "tests/sync/WatchProcessSupport.h"
 
 // The watch with a delivery agent that sorts mail into two folders, during searches.
