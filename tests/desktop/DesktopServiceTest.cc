@@ -14,6 +14,7 @@
 #include "tests/desktop/DesktopSession.h"
 #include "tests/desktop/MockLogind.h"
 #include "tests/desktop/SearchClient.h"
+#include "tests/support/Programs.h"
 
 using testing::ElementsAre;
 using testing::HasSubstr;
@@ -28,7 +29,7 @@ namespace {
 class DesktopServiceTest : public testing::Test {
  protected:
   void SetUp() override {
-    if (!testsupport::hasPrograms({"dbus-daemon"})) GTEST_SKIP() << "dbus-daemon is missing";
+    NEED_PROGRAMS("dbus-daemon")
     session = std::make_unique<testsupport::DesktopSession>(daemon.runtimeDirectory(), true);
     client = std::make_unique<testsupport::SearchClient>(session->address());
     find({mail("file/mail/a", "harbour")});
