@@ -26,6 +26,7 @@ class DaemonProcess {
   // Waits for the end. Returns the exit status, or 128 plus the number of the signal that ended it.
   int wait() { return _process->end(); }
   [[nodiscard]] std::string log() const { return _process->log(); }
+  [[nodiscard]] size_t anonymousKilobytes() const { return _process->anonymousKilobytes(); }
   bool waitForLog(const std::string& text) const { return _process->waitForLog(text); }
 
  private:

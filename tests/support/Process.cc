@@ -13,6 +13,7 @@
 #include <array>
 #include <csignal>
 #include <cstdlib>
+#include <fstream>
 #include <utility>
 
 #include "platform/Assert.h"
@@ -112,6 +113,16 @@ int Process::end(int signal) {
   waitpid(_pid, &status, 0);
   _pid = -1;
   return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
+
+size_t Process::anonymousKilobytes() const {
+  std::ifstream status("/proc/" + std::to_string(_pid) + "/status");
+  std::string name;
+  size_t value = 0;
+  while (status >> name) {
+    if (name == "RssAnon:" && status >> value) return value;
+  }
+  return 0;
 }
 
 std::string Process::log() const {

@@ -30,6 +30,8 @@ class Process {
   // Sends the signal, if given, and waits for the end. The exit status, or 128 plus the number of
   // the signal that ended it.
   int end(int signal = 0);
+  // RssAnon; 0 if it has ended.
+  [[nodiscard]] size_t anonymousKilobytes() const;
   // Its standard error so far.
   [[nodiscard]] std::string log() const;
   // Waits until the log contains `text`; false if the process ended first.
