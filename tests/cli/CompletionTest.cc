@@ -8,6 +8,7 @@
 #include <fstream>
 #include <sstream>
 
+#include "tests/support/Programs.h"
 #include "tests/support/TmuxTest.h"
 
 namespace fs = std::filesystem;
@@ -32,14 +33,6 @@ class CompletionTest : public testsupport::TmuxTest {
   }
   void TearDown() override {
     if (fs::exists(directory / "tmux")) TmuxTest::TearDown();
-  }
-
-  static bool lacks(std::initializer_list<const char*> programs) {
-    const std::string missing = testsupport::missingProgram(programs);
-    if (missing.empty()) return false;
-    if (testsupport::isCI()) ADD_FAILURE() << missing << " is missing";
-    [&missing] { GTEST_SKIP() << missing << " is not installed"; }();
-    return true;
   }
 
   void writeScript(const char* shell, const std::string& name) const {
@@ -88,7 +81,7 @@ class CompletionTest : public testsupport::TmuxTest {
 }  // namespace
 
 TEST_F(CompletionTest, Bash) {
-  if (lacks({"bash", "tmux"})) return;
+  NEED_PROGRAMS("bash", "tmux")
   writeScript("bash", "share/completions/tallow");
   saveSearch();
   variables += fmt::format(" BASH_COMPLETION_USER_DIR={}/share", directory.path());
@@ -112,7 +105,7 @@ TEST_F(CompletionTest, Bash) {
 }
 
 TEST_F(CompletionTest, Zsh) {
-  if (lacks({"zsh", "tmux"})) return;
+  NEED_PROGRAMS("zsh", "tmux")
   writeScript("zsh", "functions/_tallow");
   saveSearch();
   start("exec zsh -f -i", 100, 20);
@@ -131,7 +124,7 @@ TEST_F(CompletionTest, Zsh) {
 }
 
 TEST_F(CompletionTest, Fish) {
-  if (lacks({"fish"})) return;
+  NEED_PROGRAMS("fish")
   writeScript("fish", "config/fish/completions/tallow.fish");
   saveSearch();
   // The words that `complete -C` offers for a line, without their descriptions.

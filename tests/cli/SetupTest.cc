@@ -15,6 +15,7 @@
 #include "platform/Files.h"
 #include "tests/client/FakeDaemon.h"
 #include "tests/daemon/DaemonProcess.h"
+#include "tests/support/Programs.h"
 #include "tests/support/TmuxTest.h"
 
 namespace fs = std::filesystem;
@@ -355,10 +356,7 @@ TEST_F(SetupTest, AnInterruptLeavesTheRestToTheWatch) {
 }
 
 TEST_F(SetupTest, AsksOnATerminal) {
-  if (!testsupport::missingProgram({"tmux"}).empty()) {
-    ASSERT_FALSE(testsupport::isCI()) << "tmux is missing";
-    GTEST_SKIP() << "tmux is not installed";
-  }
+  NEED_PROGRAMS("tmux")
   makeMaildir(home + "/Mail", 1);
   makeMaildir(home + "/Maildir", 1);
   startDaemon();

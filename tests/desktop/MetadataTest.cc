@@ -4,14 +4,12 @@
 #include <cstdlib>
 #include <filesystem>
 
-#include "tests/desktop/DesktopSession.h"
+#include "tests/support/Programs.h"
 
 // What software centres and desktops read, checked by their own programs. Skipped without these,
 // except with CI=true (scripts/ci-packages.list).
 TEST(MetadataTest, IsValid) {
-  if (!testsupport::hasPrograms({"appstreamcli", "desktop-file-validate"})) {
-    GTEST_SKIP() << "appstreamcli or desktop-file-validate is missing";
-  }
+  NEED_PROGRAMS("appstreamcli", "desktop-file-validate")
   const std::string packaging = TALLOW_PACKAGING;
   EXPECT_EQ(std::system(fmt::format("appstreamcli validate --no-net --pedantic --strict "
                                     "{}/appstream/com.quill.tallow.metainfo.xml",
