@@ -148,6 +148,10 @@ class Setup {
 
   [[nodiscard]] ExitStatus showPlan() const {
     const auto paths = allPaths();
+    if (paths.empty() && unitsAreOn()) {
+      say("All is set up.");
+      return ExitStatus::done;
+    }
     say("A setup would:");
     if (!paths.empty()) {
       (void)print(fmt::format("  add to {}: {}", cleanForTerminal(settingsPath()),

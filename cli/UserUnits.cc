@@ -18,6 +18,7 @@ using Words = std::vector<std::string>;
 
 // A watch ends after the batch in hand; systemd kills it after 90 seconds unless configured.
 constexpr std::chrono::seconds kUnitPatience{120};
+constexpr std::chrono::seconds kQuestionPatience{10};
 
 const Words kSockets{"tallowsearchd.socket", "tallowsearchd-debug.socket"};
 const Words kWatch{"tallow-watch.service"};
@@ -28,10 +29,10 @@ Words allUnits() {
   return all;
 }
 
-ProgramRun systemctl(const char* verb, const Words& units) {
+ProgramRun systemctl(const char* verb, const Words& units, std::chrono::seconds patience) {
   Words words{"systemctl", "--user", verb};
   words.insert(words.end(), units.begin(), units.end());
-  return runProgram(words, kUnitPatience);
+  return runProgram(words, patience);
 }
 
 // The first line of what it wrote.
@@ -42,7 +43,7 @@ std::string complaint(const ProgramRun& run, const char* verb) {
 }
 
 std::optional<std::string> failureOf(const char* verb, const Words& units) {
-  const ProgramRun run = systemctl(verb, units);
+  const ProgramRun run = systemctl(verb, units, kUnitPatience);
   if (run.succeeded()) return std::nullopt;
   if (run.end == ProgramRun::End::timedOut) {
     return fmt::format("systemctl --user {} gave no answer for {} seconds", verb,
@@ -56,7 +57,7 @@ std::optional<std::string> failureOf(const char* verb, const Words& units) {
 // Whether systemctl answers `verb` with this word for each unit.
 bool allAre(const char* verb, const char* word) {
   const Words units = allUnits();
-  const ProgramRun run = systemctl(verb, units);
+  const ProgramRun run = systemctl(verb, units, kQuestionPatience);
   std::string expected;
   for (size_t i = 0; i < units.size(); ++i) expected += std::string(word) + '\n';
   return run.succeeded() && run.output == expected;

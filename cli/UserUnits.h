@@ -4,7 +4,7 @@
 #include <string>
 
 // The units of the user's systemd that run the daemon and `tallow watch`. Each call runs systemctl
-// and waits for it, at most kUnitPatience for each step. Errors are texts for the user.
+// and waits for it, within bounds. Errors are texts for the user.
 namespace cli {
 
 // Whether the sockets and the watch are enabled and running.

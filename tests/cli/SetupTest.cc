@@ -241,6 +241,8 @@ TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
   EXPECT_THAT(output, HasSubstr("All is set up and at work"));
   EXPECT_THAT(unitCalls(), IsEmpty());
   EXPECT_EQ(read("config/tallow/config.toml"), before);
+  EXPECT_EQ(run("setup"), 0) << errors;
+  EXPECT_THAT(output, HasSubstr("All is set up."));
   // New mail is added; a watch that runs gets the new settings.
   makeMaildir(home + "/mail/lists", 1);
   EXPECT_EQ(run("setup --yes " + home + "/mail/../mail"), 0) << errors;
