@@ -5,7 +5,7 @@
 #include <sstream>
 #include <stdexcept>
 
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 
 namespace bench {
 

@@ -3,8 +3,8 @@
 #include <memory>
 #include <vector>
 
+#include "parameters/TLParamsManager.h"
 #include "records/TLIndexableItem.h"
-#include "records/TLParamsManager.h"
 
 namespace {
 

@@ -12,8 +12,8 @@
 #include "bench/DaemonRun.h"
 #include "bench/Percentiles.h"
 #include "bench/Queries.h"
+#include "parameters/TLParamsManager.h"
 #include "querylang/TLQueryAdditions.h"
-#include "records/TLParamsManager.h"
 
 // Measures how long the daemon takes to answer verification queries, through its index and by
 // reading all messages, and checks the answers.

@@ -146,7 +146,7 @@ constexpr CommandFunction kFunctions[] = {
     {Command::metrics, runMetrics}, {Command::ping, runPing},
     {Command::vacuum, runVacuum},   {Command::state, runState},
     {Command::dump, runDump},       {Command::validate, runValidate},
-    {Command::purge, runPurge},
+    {Command::purge, runPurge},     {Command::setup, runSetup},
 };
 
 }  // namespace

@@ -11,7 +11,10 @@ namespace cli {
 // Runs one command. Its result goes to the standard output, everything else to the standard error.
 [[nodiscard]] ExitStatus runCommand(const Options& options);
 
-// Parts of runCommand: the command that reads mail.
+// Parts of runCommand: from nothing to the first search.
+[[nodiscard]] ExitStatus runSetup(const Options& options);
+
+// The command that reads mail.
 [[nodiscard]] ExitStatus runIndex(const Options& options);
 
 // The commands that keep the index in step with mailboxes.

@@ -10,6 +10,10 @@ struct Row {
 };
 
 constexpr Row kRows[] = {
+    {Command::setup,
+     "  tallow setup\n"
+     "  tallow setup --dry-run\n"
+     "  tallow setup --yes ~/Mail /srv/archive/2010.mbox"},
     {Command::index,
      "  tallow index ~/Mail\n"
      "  tallow index archive.mbox.gz\n"

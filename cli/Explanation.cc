@@ -6,10 +6,10 @@
 #include <nlohmann/json.hpp>
 
 #include "modification/TALSynonyms.h"
+#include "parameters/TLParamsManager.h"
 #include "platform/Paths.h"
 #include "query/TALQueryProcessor.h"
 #include "querylang/TLQueryAdditions.h"
-#include "records/TLParamsManager.h"
 
 namespace cli {
 

@@ -7,16 +7,15 @@
 
 #include "cli/Identifier.h"
 #include "cli/LineReader.h"
+#include "platform/Text.h"
 
 namespace cli {
 
 namespace {
 
-constexpr std::string_view kFrom = "From ";
+using platform::isDigit;
 
-bool isDigit(char c) {
-  return c >= '0' && c <= '9';
-}
+constexpr std::string_view kFrom = "From ";
 
 // 9:05, 09:05, 09:05:59
 bool isTime(std::string_view word) {

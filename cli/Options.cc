@@ -11,6 +11,7 @@
 #include <map>
 
 #include "cli/Arguments.h"
+#include "cli/Completion.h"
 #include "cli/Examples.h"
 #include "cli/NearestName.h"
 #include "rpc/Channel.h"
@@ -31,6 +32,8 @@ struct CommandRow {
 };
 
 constexpr CommandRow kCommands[] = {
+    {Command::setup, "setup", "Find your mail, keep it indexed from now on, and index it now",
+     "PATH", false},
     {Command::index, "index", "Index mail: Maildirs, mbox files, messages, directories of these",
      "PATH", true},
     {Command::sync, "sync", "Bring the index in step with mailboxes: new, changed, moved, deleted",
@@ -73,21 +76,22 @@ const std::map<std::string, SortOrder> kSortOrders{{"relevance", SortOrder::rele
 const std::map<std::string, ColorMode> kColors{
     {"auto", ColorMode::automatic}, {"always", ColorMode::always}, {"never", ColorMode::never}};
 
-// Accepts one of several names and replaces it by the number of its value.
+// Accepts one of several names and replaces it by the number of its value. The validator's own name
+// lists them, for completions.
 template <typename Value>
 CLI::Validator oneOf(const std::map<std::string, Value>& values) {
+  std::vector<std::string> names;
+  for (const auto& [name, value] : values) names.push_back(name);
   return CLI::Validator(
-      [values](std::string& text) -> std::string {
+      [values, names](std::string& text) -> std::string {
         const auto found = values.find(text);
-        if (found != values.end()) {
-          text = std::to_string(static_cast<int>(found->second));
-          return {};
+        if (found == values.end()) {
+          return fmt::format("\"{}\" is not one of {}", text, fmt::join(names, ", "));
         }
-        std::vector<std::string> names;
-        for (const auto& [name, value] : values) names.push_back(name);
-        return fmt::format("\"{}\" is not one of {}", text, fmt::join(names, ", "));
+        text = std::to_string(static_cast<int>(found->second));
+        return {};
       },
-      "");
+      "", fmt::format("{}", fmt::join(names, " ")));
 }
 
 CLI::Validator wholeNumber(int64_t least) {
@@ -135,7 +139,7 @@ void addGlobalOptions(CLI::App& app, Options& options) {
   app.add_option("--wait", options.waitSeconds, "How long to wait for the daemon to start")
       ->check(seconds(3600))
       ->type_name("SECONDS");
-  app.add_flag("-y,--yes", options.yes, "Do not ask before a reset");
+  app.add_flag("-y,--yes", options.yes, "Do not ask: setup takes all mail it finds, reset deletes");
   app.add_flag("-v,--verbose", options.verbose, "List cut messages and ignored files");
 }
 
@@ -217,6 +221,9 @@ void addCommand(CLI::App& app, const CommandRow& row, Options& options) {
         ->type_name("FILE");
   }
   if (sendsMail(row.command)) addAttachmentOptions(*sub, options);
+  if (row.command == Command::setup) {
+    sub->add_flag("-n,--dry-run", options.dryRun, "Only show what would be done");
+  }
   if (row.command == Command::purge) {
     sub->add_flag("-n,--dry-run", options.dryRun, "Only show how much space it would free");
   }
@@ -302,6 +309,14 @@ ExitStatus showHelp(CLI::App& app, const std::string& command) {
   return ExitStatus::done;
 }
 
+// For the hidden command `completion`, which the build runs.
+ExitStatus showCompletion(CLI::App& app, const std::string& shell) {
+  const auto script = completionScript(completionTable(app), shell);
+  if (script) return std::cout << *script << std::flush ? ExitStatus::done : ExitStatus::failure;
+  std::cerr << "tallow: there are completions for bash, zsh and fish\n";
+  return ExitStatus::failure;
+}
+
 // Whether input and output are a terminal that a screen can be drawn on.
 bool isScreen() {
   const char* const terminal = std::getenv("TERM");
@@ -328,6 +343,9 @@ const char* misuse(const Options& options) {
   if (options.print0 && !list) return "--print0 goes with --format=files or --format=message-ids";
   if (options.format == OutputFormat::json && options.command == Command::dump) {
     return "a dump is text only";
+  }
+  if (options.format == OutputFormat::json && options.command == Command::setup) {
+    return "a setup is text only";
   }
   if (!options.page.empty() && options.format != OutputFormat::text) {
     return "--html and --format are two forms of one output";
@@ -362,6 +380,9 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
   CLI::App* const help = app.add_subcommand("help", "Show how a command is used");
   help->fallthrough();
   help->add_option("COMMAND", helpOn)->type_name(" ");
+  std::string shell;
+  CLI::App* const completion = app.add_subcommand("completion", "Complete commands in a shell");
+  completion->group("")->add_option("SHELL", shell)->type_name(" ");
   try {
     std::vector<std::string> arguments = commandFirst(argc, argv, app);
     std::reverse(arguments.begin(), arguments.end());
@@ -383,6 +404,10 @@ std::optional<Options> parseCommandLine(int argc, const char* const* argv, ExitS
   }
   if (help->parsed()) {
     status = showHelp(app, helpOn);
+    return std::nullopt;
+  }
+  if (completion->parsed()) {
+    status = showCompletion(app, shell);
     return std::nullopt;
   }
   if (const char* const misused = misuse(options)) {

@@ -40,6 +40,7 @@ enum class Command {
   address,
   save,
   screen,
+  setup,
   mcp  // tools for a language model
 };
 enum class OutputFormat { text, json, files, messageIDs };
@@ -89,7 +90,7 @@ struct Options {
   // For index, sync and watch: whether the text of attachments is indexed, by the user.
   std::optional<bool> attachments;
 
-  // For sync.
+  // For sync; the first also for setup and purge.
   bool dryRun = false;
   bool pruneMissing = false;
   bool retryFailed = false;

@@ -4,9 +4,9 @@
 
 #include <algorithm>
 
+#include "parameters/TLParamsManager.h"
 #include "querylang/Expressions.h"
 #include "querylang/TLQueryAdditions.h"
-#include "records/TLParamsManager.h"
 
 namespace cli {
 

@@ -7,9 +7,9 @@
 #include <cmath>
 
 #include "cli/TextMatch.h"
+#include "parameters/TLParamsManager.h"
 #include "platform/Calendar.h"
 #include "querylang/TLQueryAdditions.h"
-#include "records/TLParamsManager.h"
 #include "tokenizer/Tokenizer.h"
 
 namespace cli {

@@ -200,6 +200,19 @@ std::variant<Settings, std::string> parseSettings(std::string_view text, const s
   return settings;
 }
 
+std::optional<size_t> startOfRoots(std::string_view text) {
+  const toml::parse_result result = toml::parse(text);
+  const toml::array* const roots = result ? result.table()["roots"].as_array() : nullptr;
+  if (roots == nullptr) return std::nullopt;
+  // Only a key stands before the list in its line, so that its columns are bytes.
+  const toml::source_position begin = roots->source().begin;
+  size_t line = 0;
+  for (size_t i = 1; i < begin.line && line < text.size(); ++i) {
+    line = std::min(text.find('\n', line), text.size() - 1) + 1;
+  }
+  return line + begin.column;
+}
+
 std::variant<Settings, std::string> readSettings() {
   const std::string path = settingsPath();
   std::optional<TLError> error;

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <map>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -22,6 +23,8 @@ struct Settings {
   bool desktopSearch = false;
   std::string desktopClass = "default";  // the protection class that the desktop searches
   std::vector<std::string> mcpFolders;   // whose mail `mcp` may show
+
+  [[nodiscard]] bool operator==(const Settings&) const = default;
 };
 
 // tallow/config.toml in $XDG_CONFIG_HOME, by default ~/.config.
@@ -32,6 +35,9 @@ struct Settings {
 [[nodiscard]] std::variant<Settings, std::string> parseSettings(std::string_view text,
                                                                 const std::string& file,
                                                                 const std::string& home);
+
+// The byte after the bracket that opens the list of roots in a TOML text; nullopt if there is none.
+[[nodiscard]] std::optional<size_t> startOfRoots(std::string_view text);
 
 // The settings from the user's file; the defaults if there is none.
 [[nodiscard]] std::variant<Settings, std::string> readSettings();

@@ -70,7 +70,7 @@ bool isUnknownClass(const Options& options) {
 
 std::string unknownClassText(const Options& options) {
   return options.protectionClass == "default"
-             ? "nothing has been indexed yet; `tallow sync ~/Mail` does that"
+             ? "nothing has been indexed yet; `tallow setup` does that"
              : fmt::format("nothing has been indexed for class \"{}\" yet",
                            options.protectionClass);
 }

@@ -67,14 +67,6 @@ std::optional<IndexStatus> readIndexStatus(const Options& options, TLErrorOut er
   return status;
 }
 
-// Whether a watch is running for the mailboxes.
-bool isWatched(const Options& options) {
-  std::optional<TLError> failure;
-  const std::string path = mailsync::watchLockPath(syncSettings(options));
-  const auto lock = platform::ProcessLock::acquireShared(path, &failure);
-  return lock == nullptr && failure->code == EWOULDBLOCK;
-}
-
 Options withClass(Options options, const std::string& name) {
   options.protectionClass = name;
   return options;
@@ -110,6 +102,13 @@ std::vector<std::string> classesOf(const Options& options) {
 }
 
 }  // namespace
+
+bool isWatched(const Options& options) {
+  std::optional<TLError> failure;
+  const std::string path = mailsync::watchLockPath(syncSettings(options));
+  const auto lock = platform::ProcessLock::acquireShared(path, &failure);
+  return lock == nullptr && failure->code == EWOULDBLOCK;
+}
 
 std::vector<ClassStatus> readClasses(const Options& options) {
   std::vector<ClassStatus> classes;

@@ -53,6 +53,9 @@ struct ClassStatus {
 // catalogue; the default class if none has.
 [[nodiscard]] std::vector<ClassStatus> readClasses(const Options& options);
 
+// Whether a watch is running for the mailboxes of the class.
+[[nodiscard]] bool isWatched(const Options& options);
+
 // The lock state of the device: locked, unlocked or unknown.
 [[nodiscard]] std::string lockStatus(const Options& options);
 

@@ -127,6 +127,8 @@ bool interrupted() {
   static const bool taken = [] {
     std::signal(SIGINT, takeInterrupt);
     std::signal(SIGTERM, takeInterrupt);
+    // The terminal was closed; `nohup` ignores that.
+    if (std::signal(SIGHUP, takeInterrupt) == SIG_IGN) std::signal(SIGHUP, SIG_IGN);
     return true;
   }();
   return taken && wasInterrupted;

@@ -16,8 +16,8 @@ namespace cli {
 [[nodiscard]] mailsync::SyncSettings syncSettings(const Options& options,
                                                   const MailboxGroup& group);
 
-// True after SIGINT or SIGTERM; a second signal ends the process at once. The first call installs
-// the signal handlers.
+// True after SIGINT, SIGTERM or SIGHUP; a second signal ends the process at once. The first call
+// installs the signal handlers.
 [[nodiscard]] bool interrupted();
 
 // One line, such as "3 added, 1 deleted".

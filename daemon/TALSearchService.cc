@@ -7,6 +7,7 @@
 #include <limits>
 #include <utility>
 
+#include "daemon/VerificationQuery.h"
 #include "platform/Clock.h"
 #include "platform/Redaction.h"
 #include "platform/Signpost.h"

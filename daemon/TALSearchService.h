@@ -18,8 +18,7 @@ using TLErrorReply = std::function<void(const std::optional<TLError>&)>;
 // calls it, and passes the outcome to the reply. It creates no errors of its own.
 //
 // The indexer name that clients pass does not select an indexer: it is logged, and it is the name
-// of the client state. A verification query, which only asks whether messages with given subjects
-// exist (an OR of at least five equality comparisons of the subject), is answered by exact
+// of the client state. A verification query (daemon/VerificationQuery.h) is answered by exact
 // comparison.
 //
 // Threads: every operation runs on the caller's thread, and several may run at once. Item
@@ -79,12 +78,6 @@ class TALSearchService {
   [[nodiscard]] static std::string _searchDescriptionWithOptions(uint64_t options,
                                                                  int64_t maxResults);
 
-  [[nodiscard]] static bool isMailVerificationQuery(const TLQuery* query);
-  // The subjects in the text of a verification query, in order.
-  [[nodiscard]] static Strings subjectsFromRawQuery(TLStringView rawQuery);
-  // Undoes the escapes, one kind after another, each on the result of the previous step.
-  [[nodiscard]] static TLString _stringFromEscapedString(TLString text);
-
   static const platform::Log& log();
 
  private:
@@ -94,9 +87,6 @@ class TALSearchService {
   void runItemOperation(const std::string& description, const std::string& protectionClass,
                         TLErrorReply reply,
                         const std::function<void(TALIndexer&, TALIndexer::Completion)>& operation);
-  std::optional<Items> handleVerificationQueryWithIndexer(TALIndexer& indexer, TLQuery& query,
-                                                          const Strings& subjects,
-                                                          TLErrorOut error);
 
   mutable platform::Mutex _mutex;
   std::shared_ptr<TALIndexerManager> _indexerManager TL_GUARDED_BY(_mutex);

@@ -1,3 +1,5 @@
+#include "daemon/VerificationQuery.h"
+
 #include <algorithm>
 #include <unordered_set>
 
@@ -11,6 +13,10 @@ constexpr size_t kMinSubjects = 5;
 constexpr TLStringView kClause = u"kTLItemSubject = ";
 constexpr TLStringView kClauseStart = u"kTLItemSubject = '";
 constexpr TLStringView kSeparator = u"' || ";
+
+const platform::Log& log() {
+  return TALSearchService::log();
+}
 
 bool isSubjectClause(const TLQueryNode& node) {
   return node.mergeOp() == TLQueryNodeMergeOp::LEAF && node.op() == TLQueryNodeOp::STRING_EQUAL &&
@@ -30,6 +36,14 @@ TLString replaceAll(TLStringView text, TLStringView from, TLStringView to) {
   }
 }
 
+// Undoes the escapes, one kind after another, each on the result of the previous step.
+TLString _stringFromEscapedString(TLString text) {
+  text = replaceAll(text, u"\\\\", u"\\");
+  text = replaceAll(text, u"\\\"", u"\"");
+  text = replaceAll(text, u"\\'", u"'");
+  return replaceAll(text, u"\\*", u"*");
+}
+
 TLStringView trim(TLStringView text, TLStringView characters) {
   const size_t first = text.find_first_not_of(characters);
   if (first == TLStringView::npos) return {};
@@ -38,7 +52,7 @@ TLStringView trim(TLStringView text, TLStringView characters) {
 
 }  // namespace
 
-bool TALSearchService::isMailVerificationQuery(const TLQuery* query) {
+bool isMailVerificationQuery(const TLQuery* query) {
   if (query == nullptr || !query->hasRoot()) return false;
   const TLQueryNode& root = *query->root();
   return root.mergeOp() == TLQueryNodeMergeOp::OR && root.childsCount() >= kMinSubjects &&
@@ -46,15 +60,8 @@ bool TALSearchService::isMailVerificationQuery(const TLQuery* query) {
                      [](const auto& child) { return isSubjectClause(*child); });
 }
 
-TLString TALSearchService::_stringFromEscapedString(TLString text) {
-  text = replaceAll(text, u"\\\\", u"\\");
-  text = replaceAll(text, u"\\\"", u"\"");
-  text = replaceAll(text, u"\\'", u"'");
-  return replaceAll(text, u"\\*", u"*");
-}
-
-TALSearchService::Strings TALSearchService::subjectsFromRawQuery(TLStringView rawQuery) {
-  Strings subjects;
+TALIndexer::Strings subjectsFromRawQuery(TLStringView rawQuery) {
+  TALIndexer::Strings subjects;
   const auto pieces = platform::split(trim(rawQuery, u" ()"), kSeparator);
   for (size_t i = 0; i < pieces.size(); ++i) {
     if (pieces[i].find(kClause) == TLStringView::npos) continue;
@@ -70,13 +77,13 @@ TALSearchService::Strings TALSearchService::subjectsFromRawQuery(TLStringView ra
   return subjects;
 }
 
-std::optional<TALSearchService::Items> TALSearchService::handleVerificationQueryWithIndexer(
-    TALIndexer& indexer, TLQuery& query, const Strings& subjects, TLErrorOut error) {
+std::optional<TALIndexer::Items> handleVerificationQueryWithIndexer(
+    TALIndexer& indexer, TLQuery& query, const TALIndexer::Strings& subjects, TLErrorOut error) {
   log().standard("[Verification Query] Starting Search for Verification Query with {} subjects",
                  subjects.size());
   std::unordered_set<TLString> remaining(subjects.begin(), subjects.end());
   std::optional<TLError> failure;
-  const Items results = indexer.search(query, &failure);
+  const TALIndexer::Items results = indexer.search(query, &failure);
   if (failure) {
     platform::setError(error, *failure);
     return std::nullopt;
@@ -85,13 +92,12 @@ std::optional<TALSearchService::Items> TALSearchService::handleVerificationQuery
   if (results.size() >= maxTopK || results.size() < subjects.size()) {
     log().standard(
         "[Verification Query] Query contains {} subjects but search retrieved {} docs (max_limit = "
-        "{}), "
-        "will use a slow linear search for finding the subjects",
+        "{}), will use a slow linear search for finding the subjects",
         subjects.size(), results.size(), maxTopK);
     return indexer.iterateAllDocsToFindMatchingSubjects(subjects, error);
   }
   std::unordered_set<TLString> found;
-  Items matched;
+  TALIndexer::Items matched;
   for (const auto& item : results) {
     const auto& subject = item->stringValueForKey(TLAttributeKey::SUBJECT);
     if (subject && remaining.contains(*subject)) {
@@ -113,8 +119,7 @@ std::optional<TALSearchService::Items> TALSearchService::handleVerificationQuery
   }
   log().standard(
       "[Verification Query] Couldn't find results for {} subjects, will use a slow linear search "
-      "for "
-      "finding the subjects",
+      "for finding the subjects",
       remaining.size());
   return indexer.iterateAllDocsToFindMatchingSubjects(subjects, error);
 }

@@ -3,14 +3,14 @@
 #include <algorithm>
 #include <string_view>
 
+#include "platform/Text.h"
+
 // HTML comparison of bytes: ASCII letters case-insensitively, ASCII white space only.
 namespace htmltext {
 
 inline constexpr std::string_view kWhiteSpace = " \t\n\v\f\r";
 
-[[nodiscard]] inline bool isWhiteSpace(char c) {
-  return c == ' ' || (c >= '\t' && c <= '\r');
-}
+using platform::isWhiteSpace;
 
 [[nodiscard]] inline char lower(char c) {
   return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c;

@@ -16,17 +16,17 @@
 using platform::MutexLock;
 using platform::Signpost;
 
-struct TALIndexer::Batch {
-  std::vector<TLURL> docURLs;  // one per input item, in the same order
-  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>>
-      oldDocs;  // versions already in the store
-  std::unordered_map<TLURL, uint32_t> oldDocIDs;
-  std::unordered_map<TLURL, std::shared_ptr<TLIndexableItem>> mergedDocs;  // as they will be stored
-  std::unordered_set<TLURL> urlsToIndex;  // documents whose text must be indexed
-  std::unordered_map<TLURL, uint32_t> newDocIDs;
-};
-
 namespace {
+
+// A document of a batch.
+struct PendingDoc {
+  TLURL url;
+  // The version in the store; then, what will be stored.
+  std::shared_ptr<TLIndexableItem> item = nullptr;
+  uint32_t docID = 0;
+  bool isStored = false;   // a version is in the store
+  bool mustIndex = false;  // its text has to be indexed
+};
 
 // The store syncs its file for each transaction, and the index rewrites the whole set of deleted
 // documents, so this many are deleted together. If the process is killed in between, as many may
@@ -57,6 +57,19 @@ std::string describe(const TLIndexableItem& doc, const std::string& bundleID,
 }
 
 }  // namespace
+
+struct TALIndexer::Batch {
+  std::vector<PendingDoc> docs;   // each URL once, in the order of its first item
+  std::vector<size_t> docOfItem;  // for each item, its place in `docs`
+  TLDocumentIDs oldDocIDs;
+
+  [[nodiscard]] std::vector<TLURL> urls() const {
+    std::vector<TLURL> result;
+    result.reserve(docs.size());
+    for (const auto& doc : docs) result.push_back(doc.url);
+    return result;
+  }
+};
 
 std::optional<TLURL> TALIndexer::documentURLForIdentifier(const std::optional<TLString>& identifier,
                                                           const std::string& bundleID) {
@@ -161,7 +174,9 @@ bool TALIndexer::_addDocs(const Items& docs, const std::string& bundleID, TLErro
 
 bool TALIndexer::makeDocURLs(const Items& docs, const std::string& bundleID, Batch& batch,
                              TLErrorOut error) {
-  batch.docURLs.reserve(docs.size());
+  std::unordered_map<TLURL, size_t> places;
+  batch.docs.reserve(docs.size());
+  batch.docOfItem.reserve(docs.size());
   for (const auto& doc : docs) {
     auto url = documentURLForIdentifier(doc->identifier(), bundleID);
     if (!url) {
@@ -170,7 +185,9 @@ bool TALIndexer::makeDocURLs(const Items& docs, const std::string& bundleID, Bat
       _errorWithCode(TALIndexerError::document, "document has no identifier", error);
       return false;
     }
-    batch.docURLs.push_back(std::move(*url));
+    const auto [place, isNew] = places.emplace(*url, batch.docs.size());
+    if (isNew) batch.docs.push_back({.url = std::move(*url)});
+    batch.docOfItem.push_back(place->second);
   }
   return true;
 }
@@ -178,17 +195,23 @@ bool TALIndexer::makeDocURLs(const Items& docs, const std::string& bundleID, Bat
 bool TALIndexer::fetchOldDocs(Batch& batch, TLErrorOut error) {
   const uint64_t start = platform::monotonicTicks();
   std::optional<TLError> failure;
-  batch.oldDocs = docStore()->documentsWithURLs(batch.docURLs, &failure, &batch.oldDocIDs);
+  auto stored = docStore()->documentsWithURLs(batch.urls(), &failure, &batch.oldDocIDs);
   if (failure) {
     log().error(
         "Aborting indexing of {} docs as failed to fetch old documents from docstore with error: "
         "{}",
-        batch.docURLs.size(), platform::printable(failure));
+        batch.docOfItem.size(), platform::printable(failure));
     platform::setError(error, *failure);
     return false;
   }
-  log().debug("Fetched {} old docs, queried {} docURLs in docstore in time: {} ms",
-              batch.oldDocs.size(), batch.docURLs.size(), elapsedMillisSinceMonotonicTime(start));
+  for (auto& doc : batch.docs) {
+    const auto found = stored.find(doc.url);
+    if (found == stored.end()) continue;
+    doc.isStored = true;
+    doc.item = std::move(found->second);
+  }
+  log().debug("Fetched {} old docs, queried {} docURLs in docstore in time: {} ms", stored.size(),
+              batch.docOfItem.size(), elapsedMillisSinceMonotonicTime(start));
   return true;
 }
 
@@ -196,18 +219,15 @@ void TALIndexer::mergeDocs(const Items& docs, Batch& batch) {
   const uint64_t start = platform::monotonicTicks();
   int merges = 0;
   for (size_t i = 0; i < docs.size(); ++i) {
-    const TLURL& url = batch.docURLs[i];
-    const auto prior = batch.mergedDocs.find(url);
-    const auto stored = batch.oldDocs.find(url);
-    if (prior == batch.mergedDocs.end() && stored == batch.oldDocs.end()) {
-      batch.mergedDocs.emplace(url, docs[i]);
-      batch.urlsToIndex.insert(url);
+    PendingDoc& doc = batch.docs[batch.docOfItem[i]];
+    if (doc.item == nullptr && !doc.isStored) {
+      doc.item = docs[i];
+      doc.mustIndex = true;
       continue;
     }
-    const auto old = prior != batch.mergedDocs.end() ? prior->second : stored->second;
     bool shouldIndexNewDoc = false;
-    batch.mergedDocs[url] = _zoneManager.mergeNewDoc(*docs[i], old.get(), &shouldIndexNewDoc);
-    if (shouldIndexNewDoc) batch.urlsToIndex.insert(url);
+    doc.item = _zoneManager.mergeNewDoc(*docs[i], doc.item.get(), &shouldIndexNewDoc);
+    if (shouldIndexNewDoc) doc.mustIndex = true;
     ++merges;
   }
   log().debug("Checked merging for {} docs and merged {} docs in time: {} ms", docs.size(), merges,
@@ -219,9 +239,9 @@ bool TALIndexer::storeDocs(Batch& batch, TLErrorOut error) {
     _docDates.forgetAll();
     return false;
   }
-  for (const auto& [url, docID] : batch.newDocIDs) {
-    _docDates.set(docID,
-                  batch.mergedDocs[url]->doubleValueForKey(TLAttributeKey::MAIL_DATE_RECEIVED));
+  for (const auto& doc : batch.docs) {
+    if (doc.docID == 0) continue;
+    _docDates.set(doc.docID, doc.item->doubleValueForKey(TLAttributeKey::MAIL_DATE_RECEIVED));
   }
   return true;
 }
@@ -230,32 +250,34 @@ bool TALIndexer::writeDocs(Batch& batch, TLErrorOut error) {
   const uint64_t start = platform::monotonicTicks();
   TLDocumentBatch docsToUpdate;
   TLDocumentBatch docsToInsert;
-  std::unordered_set<TLURL> seen;
-  for (const TLURL& url : batch.docURLs) {
-    if (!seen.insert(url).second) continue;
-    auto& docs = batch.oldDocs.contains(url) ? docsToUpdate : docsToInsert;
-    docs.emplace_back(url, batch.mergedDocs[url]);
+  TLDocumentIDs newDocIDs;
+  for (const auto& doc : batch.docs) {
+    (doc.isStored ? docsToUpdate : docsToInsert).emplace_back(doc.url, doc.item);
   }
   // A failed commit is reported through the error only.
   std::optional<TLError> failure;
   const bool updated =
       docsToUpdate.empty() ||
-      docStore()->storeOrUpdateDocuments(docsToUpdate, batch.oldDocIDs, &batch.newDocIDs, &failure);
+      docStore()->storeOrUpdateDocuments(docsToUpdate, batch.oldDocIDs, &newDocIDs, &failure);
   if (!updated || failure) {
     log().error(
         "Aborting indexing of {} docs as failed to update {} docs in docstore with error: {}",
-        batch.docURLs.size(), docsToUpdate.size(), platform::printable(failure));
+        batch.docOfItem.size(), docsToUpdate.size(), platform::printable(failure));
     platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
     return false;
   }
-  const bool inserted = docsToInsert.empty() || docStore()->storeOrUpdateDocuments(
-                                                    docsToInsert, &batch.newDocIDs, &failure);
+  const bool inserted = docsToInsert.empty() ||
+                        docStore()->storeOrUpdateDocuments(docsToInsert, &newDocIDs, &failure);
   if (!inserted || failure) {
     log().error(
         "Aborting indexing of {} docs as failed to store {} new docs in docstore with error: {}",
-        batch.docURLs.size(), docsToInsert.size(), platform::printable(failure));
+        batch.docOfItem.size(), docsToInsert.size(), platform::printable(failure));
     platform::setError(error, failure.value_or(TLError{kDocStoreErrorDomain, 0, ""}));
     return false;
+  }
+  for (auto& doc : batch.docs) {
+    if (const auto found = newDocIDs.find(doc.url); found != newDocIDs.end())
+      doc.docID = found->second;
   }
   log().debug("Inserted {} new docs and updated {} old docs in docstore in time: {} ms",
               docsToInsert.size(), docsToUpdate.size(), elapsedMillisSinceMonotonicTime(start));
@@ -266,36 +288,35 @@ bool TALIndexer::indexDocs(const OpenText& text, const std::string& bundleID, Ba
                            uint64_t batchStart, TLErrorOut error) {
   const uint64_t start = platform::monotonicTicks();
   uint64_t textStoreMillis = 0;
-  int indexed = 0;
-  for (const TLURL& url : batch.docURLs) {
-    if (batch.urlsToIndex.erase(url) == 0) continue;
-    const auto docID = batch.newDocIDs.find(url);
-    if (docID == batch.newDocIDs.end() || docID->second == 0) {
+  int64_t indexed = 0;
+  auto remaining = std::ranges::count_if(batch.docs, &PendingDoc::mustIndex);
+  for (auto& doc : batch.docs) {
+    if (!doc.mustIndex) continue;
+    --remaining;
+    if (doc.docID == 0) {
       log().fault(
           "Skipping indexing of doc with docURL: {} as failed to retrieve its internal docID",
-          url.absoluteString());
+          doc.url.absoluteString());
       continue;
     }
-    const auto merged = batch.mergedDocs.find(url);
-    if (merged == batch.mergedDocs.end() || merged->second == nullptr) {
+    if (doc.item == nullptr) {
       log().fault("Skipping indexing of doc with docURL: {} as failed to retrieve merged doc",
-                  url.absoluteString());
+                  doc.url.absoluteString());
       continue;
     }
     uint64_t docParsingTime = 0;
-    if (!_indexDoc(*text.index, *merged->second, docID->second, &docParsingTime)) {
-      log().error("Failed to index document in salt {}", describe(*merged->second, bundleID, url));
+    if (!_indexDoc(*text.index, *doc.item, doc.docID, &docParsingTime)) {
+      log().error("Failed to index document in salt {}", describe(*doc.item, bundleID, doc.url));
       const TLError failure = _errorWithCode(TALIndexerError::document, "index failed", error);
       log().error(
           "Indexed {} docs in SALT, aborting indexing of remaining {} docs due to error: {}",
-          indexed, static_cast<int64_t>(batch.urlsToIndex.size()) - indexed,
-          platform::printable(failure));
+          indexed, remaining - indexed, platform::printable(failure));
       return false;
     }
-    if (text.vocab != nullptr && text.vocab->maxDocID() < docID->second) {
-      text.vocab->setMaxDocID(docID->second);
+    if (text.vocab != nullptr && text.vocab->maxDocID() < doc.docID) {
+      text.vocab->setMaxDocID(doc.docID);
     }
-    batch.mergedDocs.erase(merged);
+    doc.item.reset();
     textStoreMillis += docParsingTime;
     ++indexed;
   }

@@ -5,10 +5,10 @@
 #include <utility>
 
 #include "indexer/TALIndexer.h"
+#include "parameters/TLParamsManager.h"
 #include "platform/Clock.h"
 #include "platform/Redaction.h"
 #include "platform/Signpost.h"
-#include "records/TLParamsManager.h"
 
 using platform::MutexLock;
 using platform::Signpost;

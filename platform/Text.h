@@ -24,6 +24,14 @@ void appendUTF8(TLStringView text, std::string& out);
 [[nodiscard]] size_t asciiPrefixLength(std::string_view bytes);
 [[nodiscard]] size_t asciiPrefixLength(TLStringView text);
 
+// Characters of ASCII, whatever the locale; bytes from 0x80 on are none of them.
+[[nodiscard]] constexpr bool isDigit(char c) {
+  return c >= '0' && c <= '9';
+}
+[[nodiscard]] constexpr bool isWhiteSpace(char c) {
+  return c == ' ' || (c >= '\t' && c <= '\r');
+}
+
 // Whether `bytes` is well-formed UTF-8.
 [[nodiscard]] bool isValidUTF8(std::string_view bytes);
 

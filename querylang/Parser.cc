@@ -5,17 +5,15 @@
 #include <utility>
 #include <vector>
 
+#include "platform/Text.h"
+
 namespace sq {
 
 namespace {
 
-// Character classes of the POSIX locale: bytes from 0x80 on belong to none.
-constexpr bool isWhiteSpace(char c) {
-  return c == ' ' || (c >= '\t' && c <= '\r');
-}
-constexpr bool isDigit(char c) {
-  return c >= '0' && c <= '9';
-}
+using platform::isDigit;
+using platform::isWhiteSpace;
+
 constexpr bool isAlphanumeric(char c) {
   return isDigit(c) || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z');
 }

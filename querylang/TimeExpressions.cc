@@ -5,22 +5,18 @@
 
 #include "platform/Calendar.h"
 #include "platform/Clock.h"
+#include "platform/Text.h"
 #include "querylang/TLQueryAdditions.h"
 
 namespace {
 
 using platform::CalendarFields;
+using platform::isDigit;
+using platform::isWhiteSpace;
 using platform::Zone;
 
 constexpr double kSecondsInDay = 86400;
 constexpr double kSecondsInWeek = 7 * kSecondsInDay;
-
-bool isDigit(char c) {
-  return c >= '0' && c <= '9';
-}
-bool isWhiteSpace(char c) {
-  return c == ' ' || (c >= '\t' && c <= '\r');
-}
 
 // The decimal number at the start of a text, after white space; 0 if there is none, infinite if it
 // is too large.

@@ -2,8 +2,8 @@
 
 #include <algorithm>
 
+#include "records/ParameterTable.h"
 #include "records/RecordFields.h"
-#include "records/TLParamsManager.h"
 
 template <>
 struct TLRecordTable<TLParameters> {
@@ -24,7 +24,8 @@ bool equalsASCII(TLStringView text, std::string_view ascii) {
 
 // Logs a read of a key with the wrong type, or of a key that is in no table.
 bool badAccess(std::string_view key, TLParamType type, const char* typeName) {
-  if (TLParamsManager::isValidParamTypeWithKey(key, type)) return false;
+  const auto* row = searchParameter(key);
+  if (row != nullptr && row->type() == type) return false;
   TLParameters::log().error("Param: <{}> is not expected to be of {} type. Bad Access!", key,
                             typeName);
   return true;
@@ -47,7 +48,8 @@ std::shared_ptr<TLParamKeyValue> TLParameters::parameterKeyValueForKey(std::stri
 std::shared_ptr<TLParamKeyValue> TLParameters::fallbackKeyValueForKey(
     std::string_view key, const std::shared_ptr<TLParameters>&) {
   log().error("Using shared Fallback params to get value for Param: <{}>", key);
-  return TLParamsManager::paramsFromFallback()->parameterKeyValueForKey(key);
+  const auto* row = searchParameter(key);
+  return row != nullptr ? defaultRecord(*row) : nullptr;
 }
 
 std::shared_ptr<TLParamKeyValue> TLParameters::kvForKey(

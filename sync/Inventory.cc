@@ -6,7 +6,7 @@
 
 #include "cli/Identifier.h"
 #include "cli/MailDate.h"
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 
 namespace mailsync {
 

@@ -4,20 +4,18 @@
 
 #include <algorithm>
 
+#include "platform/Text.h"
 #include "usersyntax/Syntax.h"
 
 namespace usersyntax {
 
 namespace {
 
+using platform::isWhiteSpace;
 using Type = Token::Type;
 
 constexpr size_t kMaxNameBytes = 24;
 constexpr size_t kShownBytes = 40;
-
-bool isWhiteSpace(char c) {
-  return c == ' ' || (c >= '\t' && c <= '\r');
-}
 
 // Letters of any script; of ASCII, only letters.
 bool isName(std::string_view text) {

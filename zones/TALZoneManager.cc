@@ -4,7 +4,7 @@
 #include <array>
 #include <string_view>
 
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 
 namespace {
 

@@ -2,16 +2,14 @@
 
 #include <array>
 #include <cstdio>
-#include <iterator>
 #include <regex>
 #include <set>
-#include <sstream>
 
 #include "platform/Files.h"
 
 using testing::Contains;
 
-// The program's own help, its man page and its completions name the same commands and options.
+// The program's own help and its man page name the same commands and options.
 namespace {
 
 using Names = std::set<std::string>;
@@ -61,12 +59,6 @@ std::string page() {
   return std::regex_replace(text, std::regex("\\\\-"), "-");
 }
 
-Names wordsAfter(const std::string& text, const char* start) {
-  const size_t begin = text.find(start) + std::string(start).size();
-  std::istringstream words(text.substr(begin, text.find('\'', begin) - begin));
-  return {std::istream_iterator<std::string>(words), {}};
-}
-
 }  // namespace
 
 TEST(CommandLinePageTest, ThePageHasEveryCommandAndOption) {
@@ -80,13 +72,4 @@ TEST(CommandLinePageTest, ThePageHasEveryCommandAndOption) {
     if (option == "--user" || option == "--now") continue;
     EXPECT_THAT(known, Contains(option));
   }
-}
-
-TEST(CommandLinePageTest, TheCompletionsHaveTheSame) {
-  const std::string bash = read(TALLOW_COMPLETIONS "/tallow.bash");
-  EXPECT_EQ(wordsAfter(bash, "local commands='"), commands());
-  EXPECT_EQ(wordsAfter(bash, "local options='"), options());
-  const std::string zsh = read(TALLOW_COMPLETIONS "/tallow.zsh");
-  EXPECT_EQ(found(zsh, "\n  '([a-z]+):"), commands());
-  EXPECT_EQ(found(zsh, "(--[a-z][a-z0-9-]*)[=\\[,}]"), options());
 }

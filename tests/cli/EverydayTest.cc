@@ -7,7 +7,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <nlohmann/json.hpp>
-#include <regex>
 #include <set>
 
 #include "platform/Files.h"
@@ -323,33 +322,6 @@ TEST_F(EverydayTest, WritesTheStatusAsAPage) {
   EXPECT_EQ(run("status --html none/page.html"), 2);
   EXPECT_EQ(run("status --html page.html --format=json"), 2);
   EXPECT_NE(std::system(("ls " + directory / "page.html.* 2>/dev/null").c_str()), 0);
-}
-
-// What `tallow help` lists is in the manual and in the completions of both shells.
-TEST_F(EverydayTest, OptionsAreDocumented) {
-  const auto words = [](const std::string& text, const std::regex& pattern) {
-    return std::set<std::string>(std::sregex_token_iterator(text.begin(), text.end(), pattern, 1),
-                                 std::sregex_token_iterator());
-  };
-  ASSERT_EQ(run("help"), 0);
-  const auto commands = words(output, std::regex("\n  ([a-z]+) +[A-Z]"));
-  EXPECT_THAT(commands, testing::Contains("search"));
-  std::set<std::string> options = words(output, std::regex("(--[a-z0-9-]+)"));
-  for (const std::string& command : commands) {
-    ASSERT_EQ(run("help " + command), 0);
-    options.merge(words(output, std::regex("\n  (?:-.,)?(--[a-z0-9-]+)")));
-  }
-  EXPECT_THAT(options, testing::IsSupersetOf({"--threads", "--class", "--output", "--html"}));
-  for (const char* const page :
-       {"man/tallow.1", "completions/tallow.bash", "completions/tallow.zsh"}) {
-    std::string text =
-        platform::readFile(std::string(TALLOW_PACKAGING) + '/' + page, size_t{1} << 20, nullptr)
-            .value_or("");
-    std::erase(text, '\\');
-    for (const std::string& option : options) {
-      EXPECT_TRUE(std::regex_search(text, std::regex(option + "([^a-z-]|$)"))) << page << option;
-    }
-  }
 }
 
 // The signal comes while the daemon has the first batch.

@@ -10,8 +10,8 @@
 #include "cli/PageParts.h"
 #include "cli/StatusPage.h"
 #include "sync/MailSync.h"
+#include "tests/support/Programs.h"
 #include "tests/support/TemporaryDirectory.h"
-#include "tests/support/TmuxTest.h"
 
 using testing::HasSubstr;
 using testing::Not;
@@ -124,11 +124,7 @@ struct Measured {
 
 class BrowserTest : public StatusPageTest {
  protected:
-  void SetUp() override {
-    if (testsupport::missingProgram({"chromium"}).empty()) return;
-    ASSERT_FALSE(testsupport::isCI()) << "chromium is missing";
-    GTEST_SKIP() << "chromium is not installed";
-  }
+  void SetUp() override { NEED_PROGRAMS("chromium") }
 
   [[nodiscard]] std::string show(const std::string& html, const std::string& options) const {
     std::ofstream(directory / "page.html", std::ios::binary) << html;

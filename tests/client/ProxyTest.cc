@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <future>
 #include <limits>
 #include <thread>
 
@@ -171,10 +172,11 @@ TEST_F(ProxyTest, AbsentDaemonHasItsOwnErrorDomain) {
 }
 
 TEST_F(ProxyTest, DaemonThatEndsDuringACallIsUnreachable) {
-  std::thread stopper;
-  daemon.answer("Ping", [&](rpc::Reply&) {
-    // Drops the reply. The listener joins this thread, so another one must stop it.
-    stopper = std::thread([&] { daemon.stop(); });
+  std::promise<void> called;
+  daemon.answer("Ping", [&](rpc::Reply&) { called.set_value(); });  // drops the reply
+  std::thread stopper([&] {
+    called.get_future().wait();
+    daemon.stop();
   });
   EXPECT_FALSE(debug.ping("hello", &error).has_value());
   stopper.join();

@@ -1,9 +1,10 @@
 #include <gtest/gtest.h>
 
 #include "daemon/TALSearchService.h"
+#include "daemon/VerificationQuery.h"
+#include "parameters/TLParamsManager.h"
 #include "platform/Files.h"
 #include "platform/Signpost.h"
-#include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -234,14 +235,14 @@ TEST_F(SearchServiceTest, EndSignpostHasTheCount) {
 }
 
 TEST(VerificationQuery, IsRecognisedByItsShape) {
-  EXPECT_FALSE(TALSearchService::isMailVerificationQuery(nullptr));
+  EXPECT_FALSE(isMailVerificationQuery(nullptr));
   const std::vector<TLString> five{u"a", u"b", u"c", u"d", u"e"};
   const TLQuery query;
-  EXPECT_FALSE(TALSearchService::isMailVerificationQuery(&query));
+  EXPECT_FALSE(isMailVerificationQuery(&query));
   const auto good = verificationQuery(five);
-  EXPECT_TRUE(TALSearchService::isMailVerificationQuery(good.get()));
+  EXPECT_TRUE(isMailVerificationQuery(good.get()));
   const auto four = verificationQuery({u"a", u"b", u"c", u"d"});
-  EXPECT_FALSE(TALSearchService::isMailVerificationQuery(four.get()));
+  EXPECT_FALSE(isMailVerificationQuery(four.get()));
   using Change = std::function<void(TLQueryNode&)>;
   const std::vector<Change> changes{
       [](TLQueryNode& root) { root.setMergeOp(TLQueryNodeMergeOp::AND); },
@@ -252,7 +253,7 @@ TEST(VerificationQuery, IsRecognisedByItsShape) {
   for (const Change& change : changes) {
     const auto changed = verificationQuery(five);
     change(*changed->root());
-    EXPECT_FALSE(TALSearchService::isMailVerificationQuery(changed.get()));
+    EXPECT_FALSE(isMailVerificationQuery(changed.get()));
   }
 }
 
@@ -263,14 +264,14 @@ TEST(VerificationQuery, SubjectsComeFromTheText) {
       {u"(kTLItemSubject = 'one' || kTLItemSubject = 'two')", {u"one", u"two"}},
       {u"kTLItemSubject = 'a\\'b' || kTLItemSubject = '\\\"q\\\" \\*'", {u"a'b", u"\"q\" *"}},
       {u"kTLItemSubject = '\\\\\\'x'", {u"\\'x"}},
+      // An escaped backslash before an apostrophe is unescaped twice.
+      {u"kTLItemSubject = 'a\\\\'b'", {u"a'b"}},
       {u"kTLItemSubject = 'x' || other = 'y' || kTLItemSubject = ''", {u"x"}},
       {u"((kTLItemSubject = '\u65e5\u672c'))", {u"\u65e5\u672c"}},
   };
   for (const auto& [raw, subjects] : cases) {
-    EXPECT_EQ(TALSearchService::subjectsFromRawQuery(raw), subjects) << platform::toUTF8(raw);
+    EXPECT_EQ(subjectsFromRawQuery(raw), subjects) << platform::toUTF8(raw);
   }
-  // An escaped backslash before an apostrophe is unescaped twice.
-  EXPECT_EQ(TALSearchService::_stringFromEscapedString(u"\\\\'"), u"'");
 }
 
 TEST_F(SearchServiceTest, VerificationFindsExactSubjectsByBothPaths) {

@@ -9,6 +9,7 @@
 #include "platform/Files.h"
 #include "rpc/Names.h"
 #include "tests/daemon/DaemonProcess.h"
+#include "tests/support/Programs.h"
 #include "tests/support/TemporaryDirectory.h"
 
 // General D-Bus tools call every operation as tallowsearchd(8) says. Skipped where a tool is
@@ -22,12 +23,7 @@ constexpr size_t kMaxFileBytes = size_t{1} << 20;
 class ServicePageTest : public testing::Test {
  protected:
   void SetUp() override {
-    for (const char* tool : {"busctl", "gdbus"}) {
-      const char* const ci = std::getenv("CI");
-      if (run(fmt::format("command -v {}", tool)) == 0) continue;
-      if (ci == nullptr || std::string_view(ci) != "true") GTEST_SKIP() << tool << " is missing";
-      FAIL() << tool << " is missing";
-    }
+    NEED_PROGRAMS("busctl", "gdbus")
     // The page's calls go to $XDG_RUNTIME_DIR/tallow.
     std::filesystem::create_directory_symlink(daemon.runtimeDirectory(), directory / "tallow");
   }

@@ -3,8 +3,9 @@
 #include <set>
 
 #include "daemon/TALSearchService.h"
+#include "daemon/VerificationQuery.h"
+#include "parameters/TLParamsManager.h"
 #include "querylang/TLQueryAdditions.h"
-#include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -105,8 +106,8 @@ TEST_F(Verification, AnySubjectsAreFoundExactlyByBothPaths) {
     for (size_t i = 0; i < count; ++i) subjects.push_back(subjectNumber(i));
     subjects.push_back(subjects.front());
     const auto query = queryFor(subjects);
-    ASSERT_TRUE(TALSearchService::isMailVerificationQuery(query.get()));
-    EXPECT_EQ(TALSearchService::subjectsFromRawQuery(*query->rawQuery()), subjects);
+    ASSERT_TRUE(isMailVerificationQuery(query.get()));
+    EXPECT_EQ(subjectsFromRawQuery(*query->rawQuery()), subjects);
     log.clear();
     EXPECT_EQ(found(*query, u"salt.maxTopK=100000"), expected(subjects)) << count;
     EXPECT_EQ(log.count(kLinear), 0u) << count;

@@ -3,7 +3,7 @@
 #include <memory>
 #include <string>
 
-#include "tests/desktop/Process.h"
+#include "tests/support/Process.h"
 
 struct sd_bus;
 

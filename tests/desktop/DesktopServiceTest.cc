@@ -14,6 +14,7 @@
 #include "tests/desktop/DesktopSession.h"
 #include "tests/desktop/MockLogind.h"
 #include "tests/desktop/SearchClient.h"
+#include "tests/support/Programs.h"
 
 using testing::ElementsAre;
 using testing::HasSubstr;
@@ -28,7 +29,7 @@ namespace {
 class DesktopServiceTest : public testing::Test {
  protected:
   void SetUp() override {
-    if (!testsupport::hasPrograms({"dbus-daemon"})) GTEST_SKIP() << "dbus-daemon is missing";
+    NEED_PROGRAMS("dbus-daemon")
     session = std::make_unique<testsupport::DesktopSession>(daemon.runtimeDirectory(), true);
     client = std::make_unique<testsupport::SearchClient>(session->address());
     find({mail("file/mail/a", "harbour")});
@@ -65,8 +66,10 @@ class DesktopServiceTest : public testing::Test {
 class Gate {
  public:
   void pass(rpc::Reply& reply, const std::string& bytes) {
+    // The test, and this object with it, may end while the daemon's thread wakes up.
+    const auto released = _released;
     if (!_reached.exchange(true)) _called.set_value();
-    _released.wait();
+    released.wait();
     reply.send({rpc::BytesArray{bytes}});
   }
   void awaitCall() { _called.get_future().wait(); }
@@ -87,7 +90,8 @@ TEST_F(DesktopServiceTest, OvertakenSearchesAreDropped) {
   constexpr size_t kLast = 49;
   Gate gate;
   const std::string bytes = mail("file/mail/a", "harbour").bytes;
-  daemon.answer("SearchItemsForQuery", [&](rpc::Reply& reply) { gate.pass(reply, bytes); });
+  daemon.answer("SearchItemsForQuery",
+                [&gate, bytes](rpc::Reply& reply) { gate.pass(reply, bytes); });
   client->begin({"word0"});
   gate.awaitCall();
   for (size_t i = 1; i <= kLast; ++i) client->begin({fmt::format("word{}", i)});
@@ -135,7 +139,8 @@ TEST_F(DesktopServiceTest, FollowsTheLockOfTheSession) {
   while (client->search({"x"}).empty()) continue;
   Gate gate;
   const std::string bytes = mail("file/mail/a", "harbour").bytes;
-  daemon.answer("SearchItemsForQuery", [&](rpc::Reply& reply) { gate.pass(reply, bytes); });
+  daemon.answer("SearchItemsForQuery",
+                [&gate, bytes](rpc::Reply& reply) { gate.pass(reply, bytes); });
   testsupport::SearchClient other(session->address());
   other.begin({"y"});
   gate.awaitCall();

@@ -10,6 +10,7 @@
 #include "platform/Files.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/desktop/DesktopSession.h"
+#include "tests/support/Programs.h"
 
 using testing::HasSubstr;
 using testing::Not;
@@ -24,9 +25,7 @@ constexpr const char* kRunner = "org.kde.krunner1";
 class DesktopToolsTest : public testing::Test {
  protected:
   void SetUp() override {
-    if (!testsupport::hasPrograms({"dbus-daemon", "gdbus", "busctl"})) {
-      GTEST_SKIP() << "dbus-daemon, gdbus or busctl is missing";
-    }
+    NEED_PROGRAMS("dbus-daemon", "gdbus", "busctl")
     ASSERT_TRUE(daemon.ready());
     std::filesystem::copy(TALLOW_SAMPLE_MAIL, mail, std::filesystem::copy_options::recursive);
     ASSERT_EQ(run(fmt::format("{} --runtime-dir {} index {}", TALLOW_PROGRAM,

@@ -11,6 +11,7 @@
 #include "tests/daemon/DaemonSupport.h"
 #include "tests/desktop/Bus.h"
 #include "tests/desktop/MockLogind.h"
+#include "tests/support/Programs.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using testing::HasSubstr;
@@ -29,7 +30,7 @@ constexpr const char* kLocked = "1 1\n";
 class LockBridgeTest : public testing::Test {
  protected:
   void SetUp() override {
-    if (!testsupport::hasPrograms({"dbus-daemon"})) GTEST_SKIP() << "dbus-daemon is missing";
+    NEED_PROGRAMS("dbus-daemon")
     ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
     bus = std::make_unique<testsupport::Bus>(directory.path(), "system");
   }

@@ -5,9 +5,9 @@
 #include <random>
 #include <thread>
 
+#include "parameters/TLParamsManager.h"
 #include "platform/Files.h"
 #include "platform/StateCapture.h"
-#include "records/TLParamsManager.h"
 #include "tests/indexer/IndexerSupport.h"
 #include "tests/salt/SaltSupport.h"
 

@@ -4,7 +4,7 @@
 
 #include "docstore/TALSqliteDocStore.h"
 #include "indexer/TALIndexer.h"
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"

@@ -5,8 +5,8 @@
 
 #include "docstore/TALSqliteDocStore.h"
 #include "indexer/TALIndexer.h"
+#include "parameters/TLParamsManager.h"
 #include "platform/Files.h"
-#include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"
 #include "tests/support/TemporaryDirectory.h"

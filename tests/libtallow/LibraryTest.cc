@@ -154,7 +154,7 @@ TEST(LibraryWithoutDaemonTest, IsUnreachableUntilADaemonStarts) {
 }
 
 TEST(LibraryWithoutDaemonTest, AnInterruptEndsACall) {
-  // Before the daemon, whose thread may still look at them when the test has seen enough.
+  // Before the daemon, whose thread may use them until it ends.
   std::promise<void> asked;
   std::promise<void> released;
   testsupport::FakeDaemon daemon;

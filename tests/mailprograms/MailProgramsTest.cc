@@ -18,7 +18,6 @@
 namespace fs = std::filesystem;
 using testing::HasSubstr;
 using testing::Not;
-using testsupport::missingProgram;
 
 namespace {
 
@@ -90,13 +89,6 @@ class MailProgramsTest : public testsupport::TmuxTest {
   const std::string folder = directory / ".cache/tallow/folders/search";
   const testsupport::DaemonProcess daemon{directory.path()};
 };
-
-// Skips or fails the test without these programs.
-#define NEED_PROGRAMS(...)                                                           \
-  if (const std::string missing = missingProgram({__VA_ARGS__}); !missing.empty()) { \
-    ASSERT_FALSE(testsupport::isCI()) << missing << " is missing";                   \
-    GTEST_SKIP() << missing << " is not installed";                                  \
-  }
 
 }  // namespace
 

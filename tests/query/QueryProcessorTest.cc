@@ -1,7 +1,7 @@
 #include <gtest/gtest.h>
 
+#include "parameters/TLParamsManager.h"
 #include "query/TALQueryProcessor.h"
-#include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
 
 namespace {

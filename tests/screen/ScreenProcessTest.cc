@@ -32,10 +32,7 @@ using testsupport::outputOf;
 class ScreenProcessTest : public testsupport::TmuxTest {
  protected:
   void SetUp() override {
-    if (!testsupport::missingProgram({"tmux"}).empty()) {
-      ASSERT_FALSE(testsupport::isCI()) << "tmux is missing";
-      GTEST_SKIP() << "tmux is not installed";
-    }
+    NEED_PROGRAMS("tmux")
     fs::copy(TALLOW_SAMPLE_MAIL, mail, fs::copy_options::recursive);
     startDaemon();
   }

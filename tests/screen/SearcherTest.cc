@@ -111,9 +111,10 @@ TEST_F(SearcherTest, ReportsReasonsOfFailures) {
 
 // A daemon that does not answer does not delay the end of the program.
 TEST_F(SearcherTest, DestructorDoesNotWaitForAReply) {
-  testsupport::FakeDaemon fake;
+  // Before the daemon, whose thread may use them until it ends.
   std::promise<void> called;
   std::promise<void> ended;
+  testsupport::FakeDaemon fake;
   fake.answer("SearchItemsForQuery", [&](rpc::Reply& reply) {
     called.set_value();
     ended.get_future().wait();

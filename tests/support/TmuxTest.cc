@@ -3,8 +3,6 @@
 #include <fmt/format.h>
 
 #include <chrono>
-#include <cstdio>
-#include <cstdlib>
 #include <sstream>
 
 namespace testsupport {
@@ -14,28 +12,6 @@ namespace {
 constexpr std::chrono::seconds kPatience(60);
 
 }  // namespace
-
-std::string outputOf(const std::string& command) {
-  std::string output;
-  FILE* const pipe = popen((command + " 2>/dev/null").c_str(), "r");
-  if (pipe == nullptr) return output;
-  char buffer[4096];
-  for (size_t n = 0; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
-  pclose(pipe);
-  return output;
-}
-
-std::string missingProgram(std::initializer_list<const char*> names) {
-  for (const char* const name : names) {
-    if (outputOf(fmt::format("command -v {}", name)).empty()) return name;
-  }
-  return "";
-}
-
-bool isCI() {
-  const char* const ci = std::getenv("CI");
-  return ci != nullptr && std::string(ci) == "true";
-}
 
 void TmuxTest::start(const std::string& command, int columns, int rows) const {
   tmux(fmt::format("new-session -d -s t -x {} -y {} \"{}\" \\; set -g set-clipboard on", columns,

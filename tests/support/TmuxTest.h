@@ -3,21 +3,13 @@
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <initializer_list>
 #include <string>
 #include <vector>
 
+#include "tests/support/Programs.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace testsupport {
-
-// What a shell command writes to its standard output.
-[[nodiscard]] std::string outputOf(const std::string& command);
-
-// The first of these programs that is not installed; empty if all are. A test that lacks one is
-// skipped, but fails with CI=true (scripts/ci-packages.list).
-[[nodiscard]] std::string missingProgram(std::initializer_list<const char*> names);
-[[nodiscard]] bool isCI();
 
 // A test of programs in a real terminal, which tmux provides. The home directory is `directory`.
 class TmuxTest : public testing::Test {

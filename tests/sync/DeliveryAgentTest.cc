@@ -2,7 +2,7 @@
 #include <cstdio>
 #include <thread>
 
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 #include "tests/sync/WatchProcessSupport.h"
 
 // The watch with a delivery agent that sorts mail into two folders, during searches.
@@ -17,7 +17,7 @@ constexpr int kSearchers = 2;
 class DeliveryAgentTest : public testsupport::WatchProcessTest {
  protected:
   void SetUp() override {
-    if (!hasPrograms({kAgent})) return;
+    NEED_PROGRAMS(kAgent)
     std::ofstream(rules) << fmt::format(
         "SHELL=/bin/sh\nMAILDIR={0}\nDEFAULT={0}/a/\n:0\n* ^Subject:.*7$\nb/\n", mail);
   }
@@ -81,5 +81,5 @@ TEST_F(DeliveryAgentTest, FindsEveryMailExactlyOnce) {
   EXPECT_EQ(found(), all);
   EXPECT_EQ(onDisk().size(), all.size());
   EXPECT_FALSE(std::filesystem::is_empty(mail + "/b/new"));
-  EXPECT_EQ(end(SIGTERM), 0);
+  EXPECT_EQ(watch->end(SIGTERM), 0);
 }

@@ -7,6 +7,7 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr const char* kServer = "/usr/lib/dovecot/imap";
+constexpr size_t kMaxFileBytes = size_t{1} << 20;
 constexpr const char* kCopier = "/usr/bin/mbsync";
 constexpr int kFolders = 20;
 constexpr int kMails = 500;
@@ -15,7 +16,7 @@ constexpr uid_t kNobody = 65534;  // the server refuses root
 class MailServerTest : public testsupport::WatchProcessTest {
  protected:
   void SetUp() override {
-    if (!hasPrograms({kServer, kCopier})) return;
+    NEED_PROGRAMS(kServer, kCopier)
     const bool root = geteuid() == 0;
     write("server.conf",
           fmt::format("mail_location = maildir:{0}/server\nbase_dir = {0}/base\n"
@@ -43,7 +44,7 @@ class MailServerTest : public testsupport::WatchProcessTest {
     std::ofstream(directory / name) << text;
   }
   [[nodiscard]] std::string textOf(const std::string& name) const {
-    return platform::readFile(directory / name, kMaxLog, nullptr).value_or("");
+    return platform::readFile(directory / name, kMaxFileBytes, nullptr).value_or("");
   }
   [[nodiscard]] std::string serverCommand() const {
     return fmt::format("{0} -c {1}/server.conf 2>>{1}/server.log", kServer, directory.path());
@@ -92,5 +93,5 @@ TEST_F(MailServerTest, TheIndexFollowsTheServer) {
   EXPECT_EQ(copied(), static_cast<size_t>(kMails - 20 + 1));
   serve({"SELECT folder2", "COPY 1:* folder6", append(0, kMails + 1)});
   EXPECT_EQ(copied(), static_cast<size_t>(kMails - 20 + 2 + 35));
-  EXPECT_EQ(end(SIGTERM), 0);
+  EXPECT_EQ(watch->end(SIGTERM), 0);
 }

@@ -1,17 +1,12 @@
 #pragma once
 
-#include <fcntl.h>
 #include <fmt/format.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/inotify.h>
-#include <sys/prctl.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
-#include <csignal>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <memory>
@@ -25,6 +20,8 @@
 #include "platform/Files.h"
 #include "sync/Inventory.h"
 #include "tests/daemon/DaemonProcess.h"
+#include "tests/support/Process.h"
+#include "tests/support/Programs.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace testsupport {
@@ -32,29 +29,11 @@ namespace testsupport {
 // `tallow watch` as its own process, with a daemon and a mailbox of the test.
 class WatchProcessTest : public testing::Test {
  protected:
-  static constexpr size_t kMaxLog = size_t{16} << 20;
-
   WatchProcessTest() {
     makeFolder("a");
     makeFolder("b");
     startDaemon();
     startWatch();
-  }
-  ~WatchProcessTest() override {
-    if (pid > 0) end(SIGKILL);
-  }
-
-  // Whether the programs are installed. Without them the test is skipped, but fails with CI=true;
-  // scripts/ci-packages.list has them.
-  static bool hasPrograms(const std::vector<std::string>& paths) {
-    for (const std::string& path : paths) {
-      if (std::filesystem::exists(path)) continue;
-      const char* const ci = std::getenv("CI");
-      if (ci != nullptr && std::string(ci) == "true") ADD_FAILURE() << path << " is not installed";
-      [&path] { GTEST_SKIP() << path << " is not installed"; }();
-      return false;
-    }
-    return true;
   }
   void startDaemon() {
     daemon.reset();
@@ -62,28 +41,14 @@ class WatchProcessTest : public testing::Test {
     TL_ASSERT(daemon->ready());
   }
   void startWatch() {
-    const int log = open(logPath.c_str(), O_CREAT | O_WRONLY | O_APPEND | O_CLOEXEC, 0600);
+    watch = std::make_unique<Process>(
+        std::vector<std::string>{TALLOW_PROGRAM, "watch", mail},
+        Process::Variables{{"RUNTIME_DIRECTORY", daemon->runtimeDirectory()},
+                           {"XDG_STATE_HOME", directory / "client"},
+                           {"XDG_CONFIG_HOME", directory / "config"}},
+        logPath);
+    TL_ASSERT(watch->awaitReady());
     TL_ASSERT(inotify_add_watch(logChanges.get(), logPath.c_str(), IN_MODIFY) >= 0);
-    pid = fork();
-    TL_ASSERT(pid >= 0);
-    if (pid == 0) {
-      prctl(PR_SET_PDEATHSIG, SIGKILL);
-      setenv("RUNTIME_DIRECTORY", daemon->runtimeDirectory().c_str(), 1);
-      setenv("XDG_STATE_HOME", (directory / "client").c_str(), 1);
-      setenv("XDG_CONFIG_HOME", (directory / "config").c_str(), 1);
-      dup2(log, 2);
-      execl(TALLOW_PROGRAM, TALLOW_PROGRAM, "watch", mail.c_str(), nullptr);
-      _exit(127);
-    }
-    close(log);
-  }
-  // The exit status, or 128 plus the number of the signal that ended it.
-  int end(int signal) {
-    kill(pid, signal);
-    int status = 0;
-    waitpid(pid, &status, 0);
-    pid = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
   }
 
   void makeFolder(const std::string& folder) const {
@@ -97,9 +62,6 @@ class WatchProcessTest : public testing::Test {
     std::ofstream(base + "/tmp/" + name)
         << fmt::format("From: a@example.org\nSubject: {}\n\nText\n", name);
     std::filesystem::rename(base + "/tmp/" + name, base + "/new/" + name);
-  }
-  [[nodiscard]] std::string log() const {
-    return platform::readFile(logPath, kMaxLog, nullptr).value_or("");
   }
   [[nodiscard]] std::set<std::string> indexed() const {
     client::SearchServiceProxy service(daemon->runtimeDirectory());
@@ -133,7 +95,7 @@ class WatchProcessTest : public testing::Test {
     waitUntil([this] { return indexed() == onDisk(); });
   }
   void waitUntilSaid(const std::string& text) const {
-    waitUntil([&] { return log().find(text) != std::string::npos; });
+    waitUntil([&] { return watch->log().find(text) != std::string::npos; });
   }
 
   TemporaryDirectory directory;
@@ -141,7 +103,7 @@ class WatchProcessTest : public testing::Test {
   const std::string logPath = directory / "watch.log";
   const platform::FileDescriptor logChanges{inotify_init1(IN_CLOEXEC | IN_NONBLOCK)};
   std::unique_ptr<DaemonProcess> daemon;
-  pid_t pid = -1;
+  std::unique_ptr<Process> watch;
 };
 
 }  // namespace testsupport

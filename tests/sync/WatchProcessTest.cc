@@ -28,7 +28,7 @@ TEST_F(WatchProcessTest, FollowsMailAndFolders) {
   deliver("a", "5");
   waitUntilInStep();
   EXPECT_EQ(indexed().size(), 4U);
-  EXPECT_EQ(end(SIGTERM), 0);
+  EXPECT_EQ(watch->end(SIGTERM), 0);
 }
 
 TEST_F(WatchProcessTest, FindsChangesThatTheKernelDropped) {
@@ -37,13 +37,13 @@ TEST_F(WatchProcessTest, FindsChangesThatTheKernelDropped) {
   if (queued <= 0 || queued > 200000) GTEST_SKIP() << "a queue of " << queued << " events";
   deliver("a", "1");
   waitUntilInStep();
-  kill(pid, SIGSTOP);
+  watch->signal(SIGSTOP);
   for (int i = 0; i <= queued; ++i) {
     fs::rename(mail + "/a/new/1", mail + "/a/new/2");
     fs::rename(mail + "/a/new/2", mail + "/a/new/1");
   }
   deliver("b", "3");
-  kill(pid, SIGCONT);
+  watch->signal(SIGCONT);
   waitUntilInStep();
   EXPECT_EQ(indexed().size(), 2U);
 }
@@ -61,5 +61,5 @@ TEST_F(WatchProcessTest, AThousandRenamesWhileTheDaemonRestarts) {
   startDaemon();
   waitUntilInStep();
   EXPECT_EQ(indexed().size(), static_cast<size_t>(kMany));
-  EXPECT_EQ(end(SIGINT), 0);
+  EXPECT_EQ(watch->end(SIGINT), 0);
 }

@@ -4,7 +4,7 @@
 #include <cstdlib>
 #include <thread>
 
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "zones/TALZoneManager.h"
 #include "zones/zone.h"

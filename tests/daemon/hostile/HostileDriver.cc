@@ -8,7 +8,6 @@
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
-#include <fstream>
 #include <functional>
 #include <latch>
 #include <optional>
@@ -217,16 +216,6 @@ bool lives(const DaemonProcess& daemon) {
   return kill(daemon.pid(), 0) == 0;
 }
 
-size_t anonymousKilobytes(pid_t process) {
-  std::ifstream status(fmt::format("/proc/{}/status", process));
-  std::string name;
-  size_t value = 0;
-  while (status >> name) {
-    if (name == "RssAnon:" && status >> value) return value;
-  }
-  return 0;
-}
-
 // Shuts the daemon down and prints what was wrong. Returns the exit status of the driver.
 int conclude(DaemonProcess& daemon, const GoodClient& good, const std::string& line) {
   daemon.signal(SIGTERM);
@@ -322,7 +311,7 @@ int runFlood(const Options& options) {
     const auto end = Clock::now() + std::chrono::seconds(options.seconds);
     while (Clock::now() < end && good.wrong.empty() && lives(daemon)) {
       std::this_thread::sleep_for(milliseconds(20));
-      most = std::max(most, anonymousKilobytes(daemon.pid()));
+      most = std::max(most, daemon.anonymousKilobytes());
     }
   }
   const int status = conclude(

@@ -15,7 +15,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <map>
 #include <mutex>
 #include <optional>
@@ -236,17 +235,6 @@ class Client {
   uint32_t _next = 0;
 };
 
-// In kilobytes; 0 if the process has ended.
-size_t anonymousMemory(pid_t process) {
-  std::ifstream status(fmt::format("/proc/{}/status", process));
-  std::string name;
-  size_t value = 0;
-  while (status >> name) {
-    if (name == "RssAnon:" && status >> value) return value;
-  }
-  return 0;
-}
-
 // Controls the daemon, on the main thread.
 class Supervisor {
  public:
@@ -303,7 +291,7 @@ class Supervisor {
  private:
   void measure(Clock::duration time) {
     const auto third = static_cast<size_t>(3 * time / _options.length);
-    const size_t memory = anonymousMemory(_daemon->pid());
+    const size_t memory = _daemon->anonymousKilobytes();
     if (memory != 0) _memory[std::min<size_t>(third, 2)].push_back(memory);
   }
 

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <bit>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -8,26 +7,13 @@
 #include <string_view>
 #include <unordered_map>
 #include <unordered_set>
-#include <variant>
 #include <vector>
 
 #include "platform/DefaultsStore.h"
 #include "platform/Log.h"
 #include "platform/Text.h"
+#include "records/ParameterTable.h"
 #include "records/TLParameters.h"
-
-// Types of parameters, by number.
-enum class TLParamType : int32_t { string = 0, integer = 1, floating = 2, boolean = 3 };
-
-// One row of the table of defaults. The alternatives of the value are in the order of the types.
-struct SearchParameterMetadata {
-  std::string_view key;
-  std::variant<const char*, int32_t, float, bool> value;
-
-  [[nodiscard]] constexpr TLParamType type() const {
-    return static_cast<TLParamType>(value.index());
-  }
-};
 
 // Resolves the named parameters of a search from three sources: the table of defaults, overridden
 // by the user defaults store, overridden by the query. No instances. Any thread.

@@ -4,9 +4,9 @@
 #include <map>
 #include <thread>
 
+#include "parameters/TLParamsManager.h"
 #include "platform/DefaultsStore.h"
 #include "platform/Files.h"
-#include "records/TLParamsManager.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 

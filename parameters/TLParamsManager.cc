@@ -1,75 +1,11 @@
-#include "records/TLParamsManager.h"
+#include "parameters/TLParamsManager.h"
 
 #include <algorithm>
-#include <array>
 #include <charconv>
 #include <cmath>
 #include <limits>
 
 namespace {
-
-template <typename Value>
-constexpr SearchParameterMetadata row(std::string_view key, Value value) {
-  return {key, std::variant<const char*, int32_t, float, bool>(std::in_place_type<Value>, value)};
-}
-
-constexpr std::array<SearchParameterMetadata, 30> kDefaults{
-    row("queryModification.enableSpellModification", true),
-    row("queryModification.enableSynonymModificationFirstPass", false),
-    row("queryModification.enableSynonymModification", true),
-    row("queryModification.enableStemModificationFirstPass", false),
-    row("queryModification.enableStemModification", true),
-    row("queryModification.sufficentRetrievalThreshold", 0),
-    row("ranking.freshnessWeight", 0.0F),
-    row("ranking.textScoreWeight", 1.0F),
-    row("ranking.rankingLogsItemCap", 10),
-    // One million, but as the bit pattern of a float: the effective limit is 1232348160.
-    row("salt.maxTermResults", std::bit_cast<int32_t>(1000000.0F)),
-    row("salt.maxTopK", 1000),
-    row("salt.scoreThreshold", 0.02F),
-    row("zoneScore.AccountIdentifier", 1.0F),
-    row("zoneScore.AdditionalRecipientEmailAddresses", 0.1F),
-    row("zoneScore.AdditionalRecipients", 0.1F),
-    row("zoneScore.AuthorEmailAddresses", 0.8F),
-    row("zoneScore.Authors", 1.0F),
-    row("zoneScore.HiddenAdditionalRecipients", 0.0F),
-    row("zoneScore.HiddenRecipientEmailAddresses", 0.0F),
-    row("zoneScore.HtmlContent", 0.5F),
-    row("zoneScore.MailboxIdentifiers", 1.0F),
-    row("zoneScore.Mailboxes", 1.0F),
-    row("zoneScore.RecipientEmailAddresses", 0.1F),
-    row("zoneScore.Recipients", 0.1F),
-    row("zoneScore.RelatedUniqueIdentifier", 1.0F),
-    row("zoneScore.Subject", 0.9F),
-    row("zoneScore.TextContent", 0.5F),
-    row("zoneScore.XFrom", 0.2F),
-    row("zoneScore.AttachmentName", 0.2F),
-    row("zoneScore.AttachmentType", 0.2F),
-};
-
-const SearchParameterMetadata* rowForKey(std::string_view key) {
-  const auto& dict = TLParamsManager::getDefaultParamDict();
-  const auto found = dict.find(key);
-  return found == dict.end() ? nullptr : &found->second;
-}
-
-// A record with the row's key and the default in `value`.
-std::shared_ptr<TLParamKeyValue> record(std::string_view key,
-                                        const decltype(SearchParameterMetadata::value)& value) {
-  const TLString name = platform::fromUTF8(key);
-  switch (static_cast<TLParamType>(value.index())) {
-    case TLParamType::string:
-      return TLParamsManager::tlParamKeyValueWithKeyStringValue(
-          name, platform::fromUTF8(std::get<const char*>(value)));
-    case TLParamType::integer:
-      return TLParamsManager::tlParamKeyValueWithKeyIntValue(name, std::get<int32_t>(value));
-    case TLParamType::floating:
-      return TLParamsManager::tlParamKeyValueWithKeyFloatValue(name, std::get<float>(value));
-    case TLParamType::boolean:
-      return TLParamsManager::tlParamKeyValueWithKeyBoolValue(name, std::get<bool>(value));
-  }
-  return nullptr;
-}
 
 int32_t clampToInt32(int64_t value) {
   return static_cast<int32_t>(std::clamp<int64_t>(value, std::numeric_limits<int32_t>::min(),
@@ -181,7 +117,7 @@ std::shared_ptr<TLParamKeyValue> recordFromText(const SearchParameterMetadata& r
   TLParamsManager::log().error(
       "invalid type for override Param = {} ({} expected) [Using Default Value]",
       platform::toUTF8(pair), expected);
-  return record(row.key, row.value);
+  return defaultRecord(row);
 }
 
 }  // namespace
@@ -195,30 +131,30 @@ const std::unordered_map<std::string_view, SearchParameterMetadata>&
 TLParamsManager::getDefaultParamDict() {
   static const auto dict = [] {
     std::unordered_map<std::string_view, SearchParameterMetadata> result;
-    for (const auto& one : kDefaults) result.emplace(one.key, one);
+    for (const auto& one : searchParameters()) result.emplace(one.key, one);
     return result;
   }();
   return dict;
 }
 
 bool TLParamsManager::isValidParamKey(std::string_view key) {
-  return rowForKey(key) != nullptr;
+  return searchParameter(key) != nullptr;
 }
 
 bool TLParamsManager::isValidParamTypeWithKey(std::string_view key, TLParamType paramType) {
-  const auto* found = rowForKey(key);
-  return found != nullptr && found->type() == paramType;
+  const auto* row = searchParameter(key);
+  return row != nullptr && row->type() == paramType;
 }
 
 std::unordered_set<std::string_view> TLParamsManager::defaultParamsSet() {
   std::unordered_set<std::string_view> result;
-  for (const auto& one : kDefaults) result.insert(one.key);
+  for (const auto& one : searchParameters()) result.insert(one.key);
   return result;
 }
 
 std::shared_ptr<TLParameters> TLParamsManager::paramsFromFallback() {
   auto params = std::make_shared<TLParameters>();
-  for (const auto& one : kDefaults) params->addKeyvalue(record(one.key, one.value));
+  for (const auto& one : searchParameters()) params->addKeyvalue(defaultRecord(one));
   return params;
 }
 
@@ -233,22 +169,22 @@ std::shared_ptr<TLParameters> TLParamsManager::loadSearchParamsFromUserDefaults(
   auto params = std::make_shared<TLParameters>();
   std::unordered_set<std::string_view> missing = defaultParamsSet();
   for (const std::string& key : store.keys()) {
-    const auto* found = rowForKey(key);
+    const auto* found = searchParameter(key);
     const auto stored = found != nullptr ? store.valueForKey(key) : std::nullopt;
     if (!stored) continue;
     missing.erase(found->key);
     params->addKeyvalue(record(*found, *stored));
   }
-  for (const auto& one : kDefaults) {
+  for (const auto& one : searchParameters()) {
     if (!missing.contains(one.key)) continue;
     log().info("No override for param <{}> in UserDefaults. [Using Fallback]", one.key);
-    params->addKeyvalue(record(one.key, one.value));
+    params->addKeyvalue(defaultRecord(one));
   }
   return params;
 }
 
 void TLParamsManager::saveSearchParamsToUserDefaults(platform::DefaultsStore& store) {
-  for (const auto& one : kDefaults) {
+  for (const auto& one : searchParameters()) {
     if (store.valueForKey(one.key)) continue;
     switch (one.type()) {
       case TLParamType::string:
@@ -277,7 +213,7 @@ std::shared_ptr<TLParameters> TLParamsManager::paramsFromString(TLStringView tex
       return nullptr;
     }
     const std::string key = platform::toUTF8(pieces[0]);
-    const auto* found = rowForKey(key);
+    const auto* found = searchParameter(key);
     if (found == nullptr) {
       log().error("Override Param key: {} is not valid", key);
       continue;

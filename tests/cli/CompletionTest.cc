@@ -1,0 +1,157 @@
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "tests/support/Programs.h"
+#include "tests/support/TmuxTest.h"
+
+namespace fs = std::filesystem;
+using testing::Contains;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsSupersetOf;
+using testing::Not;
+
+// The completions in real shells. Each test is skipped if its shell is missing, except with CI=true
+// (scripts/ci-packages.list).
+namespace {
+
+class CompletionTest : public testsupport::TmuxTest {
+ protected:
+  CompletionTest() {
+    fs::create_directories(directory / "bin");
+    fs::create_symlink(TALLOW_PROGRAM, directory / "bin/tallow");
+    fs::create_directories(directory / "work/inner");
+    std::ofstream(directory / "work/mail.mbox") << "From x\n";
+    variables = fmt::format("PATH={}/bin:$PATH", directory.path());
+  }
+  void TearDown() override {
+    if (fs::exists(directory / "tmux")) TmuxTest::TearDown();
+  }
+
+  void writeScript(const char* shell, const std::string& name) const {
+    fs::create_directories(fs::path(directory / name).parent_path());
+    ASSERT_EQ(std::system(
+                  fmt::format(TALLOW_PROGRAM " completion {} >{}/{}", shell, directory.path(), name)
+                      .c_str()),
+              0);
+  }
+  // A saved search, which the shells ask `tallow` for.
+  void saveSearch() const {
+    fs::create_directories(directory / "config/tallow");
+    std::ofstream(directory / "config/tallow/searches") << "bills subject:invoice\n";
+  }
+
+  // Types this and Tab in an empty line, and waits for the text.
+  void complete(const std::string& line, const std::string& expected) const {
+    press("C-u");
+    type("clear");
+    press("Enter");
+    awaitThat([](const std::string& seen) { return seen.find("clear") == std::string::npos; },
+              "an empty screen");
+    type(line);
+    press("Tab");
+    await(expected);
+  }
+
+  // In both interactive shells.
+  void expectCompletions() const {
+    complete("tallow expl", "tallow explain");
+    complete("tallow --format=json sea", "tallow --format=json search");
+    complete("tallow --format j", "tallow --format json");
+    complete("tallow search --so", "tallow search --sort");
+    complete("tallow search --sort=d", "tallow search --sort=date");
+    complete("tallow search harbour @bi", "tallow search harbour @bills");
+    complete("tallow index ma", "tallow index mail.mbox");
+    complete("tallow search --maildir in", "tallow search --maildir inner/");
+    complete("tallow help pur", "tallow help purge");
+    // An option of another command is none of this one.
+    complete("tallow show --mai", "tallow show --mai");
+    type("z");
+    await("tallow show --maiz");
+  }
+};
+
+}  // namespace
+
+TEST_F(CompletionTest, Bash) {
+  NEED_PROGRAMS("bash", "tmux")
+  writeScript("bash", "share/completions/tallow");
+  saveSearch();
+  variables += fmt::format(" BASH_COMPLETION_USER_DIR={}/share", directory.path());
+  start("PS1='ready> ' exec bash --norc --noprofile -i", 100, 20);
+  await("ready>");
+  // With the package bash-completion, which loads the script, and without it.
+  const bool package = fs::exists("/usr/share/bash-completion/bash_completion");
+  EXPECT_TRUE(package || !testsupport::isCI()) << "bash-completion is missing";
+  type(fmt::format("cd {}/work; bind \"set enable-bracketed-paste off\"; source {}; clear",
+                   directory.path(),
+                   package ? "/usr/share/bash-completion/bash_completion"
+                           : directory / "share/completions/tallow"));
+  press("Enter");
+  awaitGone("source");
+  expectCompletions();
+  press("C-u");
+  type("complete -r tallow; source ../share/completions/tallow; clear");
+  press("Enter");
+  awaitGone("source");
+  expectCompletions();
+}
+
+TEST_F(CompletionTest, Zsh) {
+  NEED_PROGRAMS("zsh", "tmux")
+  writeScript("zsh", "functions/_tallow");
+  saveSearch();
+  start("exec zsh -f -i", 100, 20);
+  type(
+      fmt::format("PS1=\"ready> \"; cd {}/work; fpath=({}/functions $fpath); autoload -U compinit; "
+                  "compinit -u -D; clear",
+                  directory.path(), directory.path()));
+  press("Enter");
+  await("ready>");
+  awaitGone("compinit");
+  expectCompletions();
+  // A list shows what each is for.
+  complete("tallow show --", "--attachment");
+  await("Save the attachment with this number");
+  EXPECT_THAT(screen(), Not(HasSubstr("--reread")));
+}
+
+TEST_F(CompletionTest, Fish) {
+  NEED_PROGRAMS("fish")
+  writeScript("fish", "config/fish/completions/tallow.fish");
+  saveSearch();
+  // The words that `complete -C` offers for a line, without their descriptions.
+  const auto offered = [&](const std::string& line) {
+    std::istringstream lines(testsupport::outputOf(fmt::format(
+        "cd {0}/work && HOME={0} XDG_CONFIG_HOME={0}/config XDG_DATA_HOME={0} PATH={0}/bin:$PATH "
+        "fish -c 'complete -C \"{1}\"'",
+        directory.path(), line)));
+    std::vector<std::string> words;
+    for (std::string one; std::getline(lines, one);) words.push_back(one.substr(0, one.find('\t')));
+    return words;
+  };
+  EXPECT_THAT(offered("tallow expl"), ElementsAre("explain"));
+  EXPECT_THAT(offered("tallow --format json sea"), ElementsAre("search"));
+  EXPECT_THAT(offered("tallow --format j"), ElementsAre("json"));
+  EXPECT_THAT(offered("tallow search --so"), ElementsAre("--sort"));
+  EXPECT_THAT(offered("tallow search --sort=d"), ElementsAre("--sort=date"));
+  EXPECT_THAT(offered("tallow search harbour @bi"), ElementsAre("@bills"));
+  EXPECT_THAT(offered("tallow index ma"), Contains("mail.mbox"));
+  EXPECT_THAT(offered("tallow search ma"), Not(Contains("mail.mbox")));
+  EXPECT_THAT(offered("tallow search --maildir in"), Contains("inner/"));
+  EXPECT_THAT(offered("tallow help pur"), ElementsAre("purge"));
+  EXPECT_THAT(offered("tallow show --m"), Not(Contains("--maildir")));
+  EXPECT_THAT(offered("tallow show -"), IsSupersetOf({"--attachment", "-o", "--output", "--raw"}));
+}
+
+TEST_F(CompletionTest, OtherShellsAreRefused) {
+  EXPECT_EQ(WEXITSTATUS(std::system(TALLOW_PROGRAM " completion csh 2>/dev/null")), 2);
+  EXPECT_EQ(WEXITSTATUS(std::system(TALLOW_PROGRAM " completion bash >/dev/full")), 2);
+}
