@@ -11,6 +11,7 @@
 #include "platform/FileDescriptor.h"
 #include "platform/Files.h"
 #include "rpc/Names.h"
+#include "rpc/Server.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
 #include "tests/support/LogCapture.h"
@@ -20,17 +21,29 @@ using testsupport::DaemonProcess;
 
 namespace {
 
+using Connect = int(int, const sockaddr*, socklen_t);
+
+// A socket that is bound or connected to `path`.
+platform::FileDescriptor socketAt(const std::string& path, Connect* attach) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  path.copy(address.sun_path, sizeof address.sun_path - 1);
+  platform::FileDescriptor one(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  EXPECT_EQ(attach(one.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0) << path;
+  return one;
+}
+
+platform::FileDescriptor connectTo(const std::string& path) {
+  return socketAt(path, connect);
+}
+
 // The two sockets of the daemon as systemd holds them.
 class Sockets {
  public:
   explicit Sockets(const std::string& directory) : _directory(directory) {
     EXPECT_TRUE(platform::createDirectories(directory + "/run", nullptr));
     for (const char* const name : {rpc::kSearchServiceName, rpc::kDebugServiceName}) {
-      sockaddr_un address{};
-      address.sun_family = AF_UNIX;
-      (directory + "/run/" + name).copy(address.sun_path, sizeof address.sun_path - 1);
-      platform::FileDescriptor one(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-      EXPECT_EQ(bind(one.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+      platform::FileDescriptor one = socketAt(directory + "/run/" + name, bind);
       EXPECT_EQ(listen(one.get(), 8), 0);
       _sockets.push_back(std::move(one));
     }
@@ -68,6 +81,29 @@ TEST(IdleExitTest, TheTimeBeginsWhenTheLastConnectionEnds) {
   });
   loop.run();
   EXPECT_TRUE(ended);
+}
+
+TEST(IdleExitTest, APausedListenerLeavesAConnectionInTheSocket) {
+  const testsupport::TemporaryDirectory directory;
+  platform::RunLoop loop;
+  const auto listener = rpc::makeListener(loop, directory.path(), rpc::kDebugServiceName);
+  listener->setDelegate([](rpc::Listener&, rpc::Connection&) { return true; });
+  platform::FileDescriptor client;
+  std::unique_ptr<platform::RunLoop::Source> later;
+  std::vector<size_t> open;
+  listener->setConnectionsHandler([&](size_t count) {
+    open.push_back(count);
+    if (later != nullptr) return;
+    if (count == 1) return client.reset();
+    listener->pause();
+    client = connectTo(directory / rpc::kDebugServiceName);
+    // A connection that is accepted would be counted first.
+    later = loop.addTimer(20, [&] { loop.stop(); });
+  });
+  ASSERT_TRUE(listener->resume(nullptr));
+  client = connectTo(directory / rpc::kDebugServiceName);
+  loop.run();
+  EXPECT_EQ(open, (std::vector<size_t>{1, 0}));
 }
 
 TEST(IdleExitTest, OnlyANumberOfSecondsIsALimit) {
