@@ -1,5 +1,4 @@
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 
 #include <csignal>
 #include <filesystem>
@@ -7,7 +6,6 @@
 #include <functional>
 #include <sstream>
 
-#include "client/DebugServiceProxy.h"
 #include "platform/Files.h"
 #include "salt/Quarantine.h"
 #include "tests/daemon/DaemonProcess.h"
@@ -15,7 +13,7 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/TemporaryDirectory.h"
 
-// A class with a damaged index or a full disk, next to a healthy one.
+// A class with a damaged index, next to a healthy one.
 namespace {
 
 namespace fs = std::filesystem;
@@ -153,35 +151,4 @@ TEST_F(BadIndexTest, KillsDoNotCountAsDamage) {
     daemon.wait();
   }
   EXPECT_TRUE(salt::indexesSetAside(index).empty());
-}
-
-// The disk is full for files above a size that only the merge exceeds.
-TEST_F(BadIndexTest, AFullDiskInAMergeLosesNothing) {
-  constexpr rlim_t kMaxBytes = 64 * 1024;
-  signal(SIGXFSZ, SIG_IGN);  // inherited by the daemon
-  editOptions([](auto& op) { op.MaxHotSuffixes = 4000; });
-  {
-    DaemonProcess daemon(directory.path());
-    client::SearchServiceProxy service(daemon.runtimeDirectory());
-    client::DebugServiceProxy debug(daemon.runtimeDirectory());
-    EXPECT_EQ(search(service, "a", "bad"), 10);
-    rlimit limit{kMaxBytes, RLIM_INFINITY};
-    ASSERT_EQ(prlimit(daemon.pid(), RLIMIT_FSIZE, &limit, nullptr), 0);
-    EXPECT_TRUE(debug.forceVacuumAndCompact("bad", nullptr));
-    EXPECT_TRUE(daemon.waitForLog("SALT Error writing to db: IO error"));
-    EXPECT_EQ(search(service, "a", "bad"), 10);
-    EXPECT_EQ(search(service, "a", "good"), 10);
-    end(daemon);
-  }
-  DaemonProcess daemon(directory.path());
-  client::SearchServiceProxy service(daemon.runtimeDirectory());
-  client::DebugServiceProxy debug(daemon.runtimeDirectory());
-  EXPECT_EQ(search(service, "a", "bad"), 10);
-  EXPECT_TRUE(debug.forceVacuumAndCompact("bad", nullptr));
-  EXPECT_TRUE(service.indexItems(mails("b", 1), "test", "bad", nullptr));
-  EXPECT_EQ(search(service, "word", "bad"), 11);
-  end(daemon);
-  const auto merged = salttest::loadIndex(index);
-  EXPECT_TRUE(merged->Validate());
-  EXPECT_GT(merged->GetMetrics().Pages, 0u);
 }
