@@ -11,7 +11,7 @@ namespace cli {
 
 // The daemon's data directory: from the command line or $STATE_DIRECTORY; otherwise, for the user's
 // own service, the directory that current or older versions of systemd use for state; otherwise
-// that of the system service.
+// that of root's daemon.
 [[nodiscard]] std::string stateDirectory(const Options& options);
 
 // Whether the client can see that nothing was ever indexed for the class: a daemon has used the

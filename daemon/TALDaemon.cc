@@ -68,6 +68,26 @@ bool TALDaemon::run(TLErrorOut error) {
   return _searchServiceListener->resume(error) && _debugServiceListener->resume(error);
 }
 
+bool TALDaemon::activated() const {
+  return _searchServiceListener->activated() && _debugServiceListener->activated();
+}
+
+void TALDaemon::setConnectionsHandler(const std::function<void(size_t)>& handler) {
+  const auto count = [this, handler](size_t& one, size_t open) {
+    one = open;
+    handler(_searchConnections + _debugConnections);
+  };
+  _searchServiceListener->setConnectionsHandler(
+      [this, count](size_t open) { count(_searchConnections, open); });
+  _debugServiceListener->setConnectionsHandler(
+      [this, count](size_t open) { count(_debugConnections, open); });
+}
+
+void TALDaemon::pause() {
+  _searchServiceListener->pause();
+  _debugServiceListener->pause();
+}
+
 void TALDaemon::shutdown() {
   log().standard("Starting shutdown...");
   _searchService->shutdown();

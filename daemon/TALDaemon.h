@@ -1,6 +1,8 @@
 #pragma once
 
+#include <functional>
 #include <memory>
+#include <string>
 
 #include "daemon/RPCInterfaces.h"
 #include "daemon/TALSearchService.h"
@@ -34,6 +36,14 @@ class TALDaemon {
   // Starts listening; further calls do nothing. False when a socket is unavailable.
   bool run(TLErrorOut error);
 
+  // Whether systemd passed both sockets, so that the next connection starts the daemon again.
+  [[nodiscard]] bool activated() const;
+  // Calls `handler` with the number of open connections whenever it changes.
+  void setConnectionsHandler(const std::function<void(size_t open)>& handler);
+  // Accepts no more connections. Where systemd passed the sockets, those that arrive now are served
+  // by the next daemon.
+  void pause();
+
   // Shuts every indexer down. Blocks until their queues have drained.
   void shutdown();
 
@@ -47,6 +57,8 @@ class TALDaemon {
 
   std::unique_ptr<TALSearchService> _searchService;
   rpc::Interface _debugServiceProtocol;
+  size_t _searchConnections = 0;
+  size_t _debugConnections = 0;
   std::unique_ptr<rpc::Listener> _searchServiceListener;
   std::unique_ptr<rpc::Listener> _debugServiceListener;
   bool _running = false;

@@ -6,8 +6,10 @@
 #include <csignal>
 #include <cstdio>
 #include <cstring>
+#include <memory>
 #include <string_view>
 
+#include "daemon/IdleExit.h"
 #include "daemon/TALDaemon.h"
 #include "daemon/TLDeviceLockMonitor.h"
 #include "platform/CrashNote.h"
@@ -29,12 +31,34 @@ const platform::Log& log() {
   return handle;
 }
 
-void handleEndingSignal(int signal) {
-  log().standard("Received signal {}.", strsignal(signal));
+void end() {
   sd_notify(0, "STOPPING=1");
   if (TALDaemon* daemon = TALDaemon::sharedInstance()) daemon->shutdown();
   log().standard("Stopping main run loop.");
   platform::mainRunLoop().stop();
+}
+
+void handleEndingSignal(int signal) {
+  log().standard("Received signal {}.", strsignal(signal));
+  end();
+}
+
+// Null unless an idle daemon is to end.
+std::unique_ptr<IdleExit> makeIdleExit(TALDaemon& daemon) {
+  const auto seconds = IdleExit::limitSeconds();
+  if (!seconds) return nullptr;
+  if (!daemon.activated()) {
+    log().standard("TALLOW_IDLE_EXIT is ignored: systemd did not pass the sockets.");
+    return nullptr;
+  }
+  auto exit = std::make_unique<IdleExit>(platform::mainRunLoop(), *seconds * 1000, [&daemon] {
+    daemon.pause();  // a call that arrives from now on waits for the next daemon
+    log().standard("No connection for a while: ending.");
+    end();
+  });
+  daemon.setConnectionsHandler(
+      [exit = exit.get()](size_t open) { exit->connectionsChanged(open); });
+  return exit;
 }
 
 int fail(const std::optional<TLError>& error) {
@@ -102,8 +126,10 @@ int main(int argc, char** argv) {
   // An interrupted purge leaves either its copy or the directory that it replaced.
   if (lock != nullptr) platform::removeItem(platform::purgeDirectory(), nullptr);
   TALDaemon* daemon = TALDaemon::sharedInstance();
+  std::unique_ptr<IdleExit> idleExit;
   if (daemon != nullptr) {
     if (lock == nullptr || !daemon->run(&error)) return fail(error);
+    idleExit = makeIdleExit(*daemon);
     sd_notify(0, "READY=1");
   }
   log().standard("Starting run loop");

@@ -173,8 +173,16 @@ class SocketListener : public Listener {
     return _source != nullptr;
   }
 
+  bool activated() const override { return _descriptor >= 0 && _path.empty(); }
+
+  void setConnectionsHandler(std::function<void(size_t)> handler) override {
+    _connectionsHandler = std::move(handler);
+  }
+
+  void pause() override { _source.reset(); }
+
   void invalidate(uint64_t milliseconds) override {
-    _source.reset();
+    pause();
     if (_descriptor >= 0) {
       close(std::exchange(_descriptor, -1));
       close(std::exchange(_spare, -1));
@@ -229,6 +237,7 @@ class SocketListener : public Listener {
     });
     if (started) {
       _connections.push_back(std::move(connection));
+      _connectionsHandler(_connections.size());
     } else {
       log().error("Refusing connection {}: no thread or no descriptors", which->description());
       connectionTable().leave(which);
@@ -238,12 +247,14 @@ class SocketListener : public Listener {
   void reap(const ServerConnection* which) {
     connectionTable().leave(which);
     _connections.remove_if([which](const auto& connection) { return connection.get() == which; });
+    _connectionsHandler(_connections.size());
   }
 
   platform::RunLoop& _loop;
   const std::string _directory;
   const std::string _serviceName;
   Delegate _delegate;
+  std::function<void(size_t)> _connectionsHandler = [](size_t) {};
   std::string _path;  // of the socket created here; empty for one passed by systemd
   int _descriptor = -1;
   int _spare = -1;

@@ -142,6 +142,13 @@ class Listener {
   // Starts listening. False when the socket is unavailable, for example because another process
   // serves it.
   virtual bool resume(TLErrorOut error) = 0;
+  // Whether systemd passed the socket. Then it outlives the process, and a connection that has not
+  // been accepted starts the next one. Valid after `resume`.
+  [[nodiscard]] virtual bool activated() const = 0;
+  // Calls `handler` with the number of open connections whenever it changes.
+  virtual void setConnectionsHandler(std::function<void(size_t open)> handler) = 0;
+  // Accepts no more connections; those that arrive wait in the socket.
+  virtual void pause() = 0;
   // Stops listening, lets every connection send pending replies for at most `milliseconds`, and
   // joins their threads. The destructor does the same with 0.
   virtual void invalidate(uint64_t milliseconds) = 0;
