@@ -24,7 +24,8 @@ class TALSqliteDocStore::Use {
   explicit Use(const Statement& statement) : _statement(statement.get()) {}
   ~Use() {
     sqlite3_reset(_statement);
-    sqlite3_clear_bindings(_statement);
+    // A statement that could not be prepared is null, which all other functions take.
+    if (_statement != nullptr) sqlite3_clear_bindings(_statement);
   }
   Use(const Use&) = delete;
   Use& operator=(const Use&) = delete;

@@ -56,7 +56,8 @@ bool Statement::run() {
 
 void Statement::reset() {
   sqlite3_reset(_statement.get());
-  sqlite3_clear_bindings(_statement.get());
+  // A statement that could not be prepared is null, which all other functions take.
+  if (_statement != nullptr) sqlite3_clear_bindings(_statement.get());
   _bound = 0;
 }
 

@@ -19,7 +19,8 @@ class Database;
 inline constexpr const char* kCatalogueDomain = "com.quill.tallow.catalogue";
 
 // A prepared statement. Bind the values in order, step through the rows, then call `reset`; `run`
-// does the last two. The database keeps the first failure of a step.
+// does the last two. The database keeps the first failure to prepare or to step; a statement that
+// could not be prepared has no rows.
 class Statement {
  public:
   Statement() = default;
