@@ -8,7 +8,8 @@
 #include "platform/Mutex.h"
 #include "platform/Queue.h"
 
-// Called when the state of the device changes.
+// Called when the state of the device changes, for what has to close then. The daemon has no such
+// part: it asks for the state at each request.
 class TLDeviceLockObserver {
  public:
   virtual ~TLDeviceLockObserver() = default;

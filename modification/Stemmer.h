@@ -19,7 +19,8 @@ struct stemmer {
   int32_t stemEnd;  // index of the last byte before the most recently matched suffix
 };
 
-// The caller owns the uninitialised record and passes it to free_stemmer.
+// For callers who stem many words with one record. The caller owns it, uninitialised, and passes it
+// to free_stemmer.
 [[nodiscard]] stemmer* create_stemmer();
 void free_stemmer(stemmer* record);
 

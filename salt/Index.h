@@ -148,7 +148,8 @@ class Index {
 
   [[nodiscard]] virtual const Options& GetOptions() const = 0;
 
-  // The text of a suffix, read from the stored zone; empty when the zone is absent.
+  // The text of a suffix, read from the stored zone; empty when the zone is absent. For tools, as
+  // GetOptions, ResetScanMetrics and Dump are; the daemon calls none of them.
   [[nodiscard]] virtual std::string GetSuffixText(const SuffixMeta& meta) const = 0;
 
   // Stores the text of a zone and indexes the suffixes that begin at `offsets` (ascending), in one

@@ -6,7 +6,7 @@
 
 // A tokenizer without a linguistic library: converts to lower case and splits at every white space,
 // punctuation, control or symbol character, optionally also between letters and digits. A character
-// here is a UTF-16 unit.
+// here is a UTF-16 unit. For callers without a locale; the daemon has one, and uses Tokenizer.h.
 //
 // Threads: any; immutable after construction.
 class TLFallbackTokenizer {

@@ -1,8 +1,7 @@
-#include "sync/Database.h"
-
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include "sync/Database.h"
 #include "tests/support/TemporaryDirectory.h"
 
 // For instance of a catalogue whose tables somebody else has changed.
