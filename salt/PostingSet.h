@@ -3,7 +3,6 @@
 #include <array>
 #include <cstdint>
 #include <memory>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -11,7 +10,6 @@
 #include "platform/Mutex.h"
 #include "salt/DocPages.h"
 #include "salt/Index.h"
-#include "salt/ZoneMask.h"
 
 namespace salt {
 
@@ -51,26 +49,28 @@ class PostingSet {
   // The two sets must have the same table and not count the same suffix.
   void add(PostingSet&& other);
 
-  // Adds documents whose zone bits index one list. Their suffixes are counted separately, by
-  // addSuffixes.
+  // Adds documents that have the zones of one of `masks`, whose bits index `zones`. Their suffixes
+  // are counted separately, by addSuffixes. Set and lists outlive it.
   class Adder {
    public:
-    Adder(PostingSet* set, const std::vector<uint16_t>& zones);
+    Adder(PostingSet* set, const std::vector<uint16_t>& zones, const std::vector<uint32_t>& masks);
 
-    void add(const DocZones& doc) {
-      if (_bits) {
-        _set._masks[doc.DocID] |= _bits->of(doc.zones);
+    // Adds a document with the zones of masks[mask].
+    void add(uint32_t docID, size_t mask) {
+      if (_translated.empty()) {
+        addOneByOne(docID, _masks[mask]);
       } else {
-        addOneByOne(doc);
+        _set._masks[docID] |= _translated[mask];
       }
     }
 
    private:
-    void addOneByOne(const DocZones& doc);
+    void addOneByOne(uint32_t docID, uint32_t mask);
 
     PostingSet& _set;
     const std::vector<uint16_t>& _zones;
-    std::optional<ZoneMaskMap> _bits;  // nullopt when no bit is left for one of them
+    const std::vector<uint32_t>& _masks;
+    std::vector<uint32_t> _translated;  // the masks in bits of the table; empty if it has too few
   };
   void addSuffixes(uint64_t count) { _suffixes += count; }
 
