@@ -215,12 +215,11 @@ bool Postings::addList(std::string_view list, const DocSet& deleted, PostingSet*
   uint64_t suffixes = 0;
   uint32_t next = 0;  // after the document before
   for (uint32_t i = 0; i < docs; ++i) {
-    next += bits.gamma();
-    const size_t mask = bits.gamma() - size_t{1};
-    const uint32_t count = bits.gamma();
-    if (!bits.good || mask >= masks.size()) return false;
+    const auto [step, mask, count] = bits.threeGammas();
+    next += step;
+    if (!bits.good || mask > masks.size()) return false;
     if (deleted.contains(next - 1)) continue;
-    adder.add(next - 1, mask);
+    adder.add(next - 1, mask - 1);
     suffixes += count;
   }
   places->addSuffixes(suffixes);
