@@ -8,24 +8,26 @@
 namespace salt {
 
 // A set of document numbers, a bit for each. Documents are numbered one after another, so pages of
-// bits are small and a look-up takes no hashing; a page without members takes 24 bytes. One writer,
-// or any number of readers.
+// bits are small and a look-up takes no hashing. One writer, or any number of readers.
 class DocSet {
  public:
   [[nodiscard]] size_t size() const { return _size; }
 
   [[nodiscard]] bool contains(uint32_t docID) const {
     const size_t page = docID / kPageDocs;
-    if (page >= _pages.size() || _pages[page].empty()) return false;
-    return (_pages[page][docID % kPageDocs / kWordDocs] >> (docID % kWordDocs) & 1) != 0;
+    if (page >= _pages.size() || _pages[page] == kNone) return false;
+    return (_words[wordOf(docID)] >> (docID % kWordDocs) & 1) != 0;
   }
 
   // `docID` must not be in the set.
   void insert(uint32_t docID) {
     const size_t page = docID / kPageDocs;
-    if (page >= _pages.size()) _pages.resize(page + 1);
-    if (_pages[page].empty()) _pages[page].resize(kPageDocs / kWordDocs);
-    _pages[page][docID % kPageDocs / kWordDocs] |= uint64_t{1} << (docID % kWordDocs);
+    if (page >= _pages.size()) _pages.resize(page + 1, kNone);
+    if (_pages[page] == kNone) {
+      _pages[page] = static_cast<uint32_t>(_words.size() / kPageWords);
+      _words.resize(_words.size() + kPageWords);
+    }
+    _words[wordOf(docID)] |= uint64_t{1} << (docID % kWordDocs);
     ++_size;
   }
 
@@ -33,9 +35,9 @@ class DocSet {
   template <typename Visit>
   void forEach(const Visit& visit) const {
     for (size_t page = 0; page < _pages.size(); ++page) {
-      for (size_t i = 0; i < _pages[page].size(); ++i) {
-        const size_t first = page * kPageDocs + i * kWordDocs;
-        for (uint64_t word = _pages[page][i]; word != 0; word &= word - 1) {
+      if (_pages[page] == kNone) continue;
+      for (size_t first = page * kPageDocs; first < (page + 1) * kPageDocs; first += kWordDocs) {
+        for (uint64_t word = _words[wordOf(first)]; word != 0; word &= word - 1) {
           visit(static_cast<uint32_t>(first + static_cast<size_t>(std::countr_zero(word))));
         }
       }
@@ -43,10 +45,18 @@ class DocSet {
   }
 
  private:
-  static constexpr uint32_t kPageDocs = 4096;
-  static constexpr uint32_t kWordDocs = 64;
+  static constexpr size_t kPageDocs = 4096;
+  static constexpr size_t kWordDocs = 64;
+  static constexpr size_t kPageWords = kPageDocs / kWordDocs;
+  static constexpr uint32_t kNone = UINT32_MAX;
 
-  std::vector<std::vector<uint64_t>> _pages;  // by number; empty ones have no members
+  // The index in _words of the word with the bit of a document, whose page is not kNone.
+  [[nodiscard]] size_t wordOf(size_t docID) const {
+    return _pages[docID / kPageDocs] * kPageWords + docID % kPageDocs / kWordDocs;
+  }
+
+  std::vector<uint32_t> _pages;  // numbers of pages in _words; kNone for one without members
+  std::vector<uint64_t> _words;
   size_t _size = 0;
 };
 
