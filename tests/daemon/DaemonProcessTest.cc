@@ -336,14 +336,13 @@ TEST_F(DaemonProcessTest, ASecondDaemonEndsWithAMessage) {
 TEST_F(DaemonProcessTest, AcceptsSocketsFromSystemd) {
   const int search = listenAt(directory / "search");
   const int debug = listenAt(directory / "debug");
-  DaemonProcess daemon(directory.path(), {search, debug},
-                       std::string(rpc::kSearchServiceName) + ":" + rpc::kDebugServiceName);
+  const std::string names = std::string(rpc::kSearchServiceName) + ":" + rpc::kDebugServiceName;
+  DaemonProcess daemon(directory.path(), {{"LISTEN_FDNAMES", names}}, {search, debug});
   ASSERT_TRUE(daemon.ready());
   EXPECT_NE(introspect(directory / "debug", "/com/quill/tallow/DebugService").find("Ping"),
             std::string::npos);
   EXPECT_FALSE(platform::fileExists(daemon.socketOf(rpc::kDebugServiceName)));
-  daemon.signal(SIGTERM);
-  EXPECT_EQ(daemon.wait(), 0);
+  EXPECT_EQ(daemon.stop(), 0);
   EXPECT_TRUE(platform::fileExists(directory / "debug"));
   close(search);
   close(debug);

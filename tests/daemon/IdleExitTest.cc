@@ -55,7 +55,7 @@ class Sockets {
                               (count > 1 ? rpc::kDebugServiceName : "");
     std::vector<int> passed;
     for (size_t i = 0; i < count; ++i) passed.push_back(_sockets[i].get());
-    return DaemonProcess(_directory, passed, names);
+    return DaemonProcess(_directory, {{"LISTEN_FDNAMES", names}}, passed);
   }
 
  private:

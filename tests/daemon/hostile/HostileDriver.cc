@@ -21,6 +21,7 @@
 #include "platform/FileDescriptor.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
+#include "tests/support/DriverOptions.h"
 #include "tests/support/RawMessages.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -43,11 +44,11 @@ constexpr rlim_t kDescriptors = 512;    // of the daemon, which limits the numbe
 constexpr int kMessagesOfConnection = 16;
 
 struct Options {
-  bool flood = false;
-  int messages = 1000000;
-  int seconds = 30;
-  size_t maxMegabytes = SIZE_MAX;  // anonymous memory of the daemon
-  uint32_t seed = std::random_device()();
+  std::string mode = "messages";
+  uint64_t messages = 1000000;
+  uint64_t seconds = 30;
+  uint64_t maxMegabytes = SIZE_MAX;  // anonymous memory of the daemon
+  uint64_t seed = std::random_device()();
 };
 
 // A well-behaved client. Each of its searches has a single correct result.
@@ -86,8 +87,8 @@ class GoodClient {
   void waitUntilBegun() const { _begun.wait(); }
 
   [[nodiscard]] std::string report() const {
-    return fmt::format("good_rounds={} answers {} batches {}", _rounds, percentiles(_answers),
-                       percentiles(_indexing));
+    return fmt::format("good_rounds={} answers {} batches {}", _rounds, text(_answers),
+                       text(_indexing));
   }
 
   std::string wrong;
@@ -102,12 +103,8 @@ class GoodClient {
     work();
     times.push_back(std::chrono::duration<double, std::milli>(Clock::now() - start).count());
   }
-  static std::string percentiles(std::vector<double> times) {
-    if (times.empty()) return "none";
-    std::sort(times.begin(), times.end());
-    const auto at = [&](double part) {
-      return times[static_cast<size_t>(part * static_cast<double>(times.size() - 1))];
-    };
+  static std::string text(const std::vector<double>& times) {
+    const auto at = [&](double part) { return testsupport::percentile(times, part); };
     return fmt::format("p50_ms={:.2f} p99_ms={:.2f} max_ms={:.1f}", at(0.5), at(0.99), at(1));
   }
 
@@ -193,11 +190,11 @@ bool exchange(int socket, std::string_view message) {
 }
 
 // Sends invalid messages and returns their number.
-int sendWrongMessages(const DaemonProcess& daemon, const Options& options,
-                      const std::function<bool()>& goesOn) {
-  std::mt19937 random(options.seed);
+uint64_t sendWrongMessages(const DaemonProcess& daemon, const Options& options,
+                           const std::function<bool()>& goesOn) {
+  std::mt19937 random(static_cast<uint32_t>(options.seed));
   const std::vector<Call> calls = validCalls();
-  int sent = 0;
+  uint64_t sent = 0;
   while (sent < options.messages && goesOn()) {
     const std::string service = calls[random() % calls.size()].service;
     const FileDescriptor socket(testsupport::connectTo(daemon.socketOf(service)));
@@ -218,16 +215,11 @@ bool lives(const DaemonProcess& daemon) {
 
 // Shuts the daemon down and prints what was wrong. Returns the exit status of the driver.
 int conclude(DaemonProcess& daemon, const GoodClient& good, const std::string& line) {
-  daemon.signal(SIGTERM);
-  const int status = daemon.wait();
+  const int status = daemon.stop();
   fmt::print("{} {} status={}\n", line, good.report(), status);
-  if (!good.wrong.empty()) fmt::print(stderr, "WRONG: {}\n", good.wrong);
-  const bool right = status == 0 && good.wrong.empty();
-  if (!right) {
-    const std::string log = daemon.log();
-    fmt::print(stderr, "{}\n", log.substr(log.size() - std::min<size_t>(log.size(), 3000)));
-  }
-  return right ? 0 : 1;
+  if (status == 0 && good.wrong.empty()) return 0;
+  fmt::print(stderr, "WRONG: {}\n{}\n", good.wrong, daemon.endOfLog());
+  return 1;
 }
 
 int runMutations(const Options& options) {
@@ -237,7 +229,7 @@ int runMutations(const Options& options) {
   const rlimit limit{kDescriptors, kDescriptors};
   prlimit(daemon.pid(), RLIMIT_NOFILE, &limit, nullptr);
   GoodClient good(daemon.runtimeDirectory(), 20);
-  int sent = 0;
+  uint64_t sent = 0;
   {
     const std::jthread working([&good](const std::stop_token& stop) { good.work(stop); });
     sent = sendWrongMessages(daemon, options, [&] { return good.wrong.empty() && lives(daemon); });
@@ -330,23 +322,14 @@ int main(int argc, char** argv) {
   descriptors.rlim_cur = descriptors.rlim_max;
   setrlimit(RLIMIT_NOFILE, &descriptors);
   Options options;
-  for (int i = 1; i < argc; i += 2) {
-    const std::string_view name = argv[i];
-    const std::string_view value = i + 1 < argc ? argv[i + 1] : "";
-    if (name == "--messages") {
-      options.messages = std::atoi(value.data());
-    } else if (name == "--seconds") {
-      options.seconds = std::atoi(value.data());
-    } else if (name == "--max-mb") {
-      options.maxMegabytes = std::strtoul(value.data(), nullptr, 10);
-    } else if (name == "--seed") {
-      options.seed = static_cast<uint32_t>(std::strtoul(value.data(), nullptr, 10));
-    } else if (name == "--mode" && value == "flood") {
-      options.flood = true;
-    } else {
-      fmt::print(stderr, "{}", kUsage);
-      return 2;
-    }
-  }
-  return options.flood ? runFlood(options) : runMutations(options);
+  testsupport::readOptions(argc, argv, kUsage,
+                           {{"--mode", &options.mode},
+                            {"--messages", &options.messages},
+                            {"--seconds", &options.seconds},
+                            {"--max-mb", &options.maxMegabytes},
+                            {"--seed", &options.seed}});
+  if (options.mode == "messages") return runMutations(options);
+  if (options.mode == "flood") return runFlood(options);
+  fmt::print(stderr, "{}", kUsage);
+  return 2;
 }
