@@ -3,7 +3,6 @@
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <systemd/sd-bus.h>
 #include <unistd.h>
 
@@ -57,20 +56,31 @@ class Client {
   }
   ~Client() { sd_bus_close_unref(bus); }
 
-  sd_bus_message* newCall(const char* member) const {
+  // Sends a call, its arguments as sd-bus takes them, and returns its cookie; 0 if that fails.
+  template <typename... Arguments>
+  uint64_t send(const char* member, const char* signature, Arguments... arguments) const {
     sd_bus_message* call = nullptr;
     sd_bus_message_new_method_call(bus, &call, nullptr, kPath, kService, member);
-    return call;
+    sd_bus_message_append(call, signature, arguments...);
+    uint64_t cookie = 0;  // reading it requests a reply
+    const bool sent = sd_bus_send(bus, call, &cookie) >= 0 && sd_bus_flush(bus) >= 0;
+    sd_bus_message_unref(call);
+    return sent ? cookie : 0;
+  }
+
+  // Makes a call and returns the name of its error, "" if there is none.
+  template <typename... Arguments>
+  std::string errorOf(const char* member, const char* signature, Arguments... arguments) const {
+    sd_bus_error error{};
+    sd_bus_call_method(bus, nullptr, kPath, kService, member, &error, nullptr, signature,
+                       arguments...);
+    const std::string name = error.name == nullptr ? "" : error.name;
+    sd_bus_error_free(&error);
+    return name;
   }
 
   // Makes a call to which the test replies later.
-  void hold() const {
-    sd_bus_message* call = newCall("Hold");
-    uint64_t cookie = 0;  // reading it requests a reply
-    EXPECT_GE(sd_bus_send(bus, call, &cookie), 0);
-    sd_bus_message_unref(call);
-    EXPECT_GE(sd_bus_flush(bus), 0);
-  }
+  void hold() const { EXPECT_NE(send("Hold", ""), 0u); }
 
   // The text of the reply, or the name of the error.
   std::string echo(const std::string& text, const char* interface = kService) const {
@@ -94,39 +104,26 @@ class Client {
 class RPCTest : public testing::Test {
  protected:
   RPCTest() : queue("echo") {
-    interface.methods.push_back(
-        {"Echo",
-         "s",
-         "s",
-         {"input", "output"},
-         [this](rpc::Arguments& arguments, std::shared_ptr<rpc::Reply> reply) {
-           std::string text(arguments.readString());
-           if (text == "fail") return reply->sendError({"Domain", -2, "went wrong"});
-           if (text == "memory") throw std::bad_alloc();
-           if (text == "thread") throw std::system_error(EAGAIN, std::generic_category());
-           if (text == "binary") return reply->send({std::string("\xFF\0x", 3)});
-           queue.submit([text, reply] { reply->send({text}); });
-         }});
-    interface.methods.push_back({"Make",
-                                 "x",
-                                 "aay",
-                                 {"size", "bytes"},
-                                 [](rpc::Arguments& arguments, std::shared_ptr<rpc::Reply> reply) {
-                                   const auto size = static_cast<size_t>(arguments.readInt64());
-                                   reply->send({rpc::BytesArray{std::string(size, 'b')}});
-                                 }});
-    interface.methods.push_back(
-        {"Hold", "", "", {}, [this](rpc::Arguments&, std::shared_ptr<rpc::Reply> reply) {
-           held.set_value(std::move(reply));
-         }});
-    interface.methods.push_back({"List",
-                                 "as",
-                                 "s",
-                                 {"texts", "output"},
-                                 [](rpc::Arguments& arguments, std::shared_ptr<rpc::Reply> reply) {
-                                   reply->send(
-                                       {std::to_string(arguments.readStringArray().size())});
-                                 }});
+    const auto add = [this](const char* member, const char* input, const char* output,
+                            auto handler) {
+      interface.methods.push_back({member, input, output, {}, handler});
+    };
+    add("Echo", "s", "s", [this](rpc::Arguments& arguments, auto reply) {
+      std::string text(arguments.readString());
+      if (text == "fail") return reply->sendError({"Domain", -2, "went wrong"});
+      if (text == "memory") throw std::bad_alloc();
+      if (text == "thread") throw std::system_error(EAGAIN, std::generic_category());
+      if (text == "binary") return reply->send({std::string("\xFF\0x", 3)});
+      queue.submit([text, reply] { reply->send({text}); });
+    });
+    add("Make", "x", "aay", [](rpc::Arguments& arguments, auto reply) {
+      const auto size = static_cast<size_t>(arguments.readInt64());
+      reply->send({rpc::BytesArray{std::string(size, 'b')}});
+    });
+    add("Hold", "", "", [this](rpc::Arguments&, auto reply) { held.set_value(std::move(reply)); });
+    add("List", "as", "s", [](rpc::Arguments& arguments, auto reply) {
+      reply->send({std::to_string(arguments.readStringArray().size())});
+    });
     listener = rpc::makeListener(loop, directory.path(), kService);
     listener->setDelegate([this](rpc::Listener& l, rpc::Connection& connection) {
       connection.addExportedInterface(interface);
@@ -177,16 +174,8 @@ TEST_F(RPCTest, AnswersAndReportsErrorsByName) {
   const Client client(path());
   EXPECT_EQ(client.echo("hello"), "hello");
   EXPECT_EQ(client.echo("fail"), "com.quill.tallow.Error");
-  sd_bus_error error{};
-  EXPECT_LT(
-      sd_bus_call_method(client.bus, nullptr, kPath, kService, "Nothing", &error, nullptr, ""), 0);
-  EXPECT_STREQ(error.name, "org.freedesktop.DBus.Error.UnknownMethod");
-  sd_bus_error_free(&error);
-  EXPECT_LT(sd_bus_call_method(client.bus, nullptr, kPath, kService, "Echo", &error, nullptr, "x",
-                               int64_t{1}),
-            0);
-  EXPECT_STREQ(error.name, rpc::kInvalidArgs);
-  sd_bus_error_free(&error);
+  EXPECT_EQ(client.errorOf("Nothing", ""), SD_BUS_ERROR_UNKNOWN_METHOD);
+  EXPECT_EQ(client.errorOf("Echo", "x", int64_t{1}), rpc::kInvalidArgs);
   EXPECT_EQ(client.echo("still here"), "still here");
 }
 
@@ -233,12 +222,7 @@ TEST_F(RPCTest, TheSocketIsPrivateAndALiveOneIsNotReplaced) {
 TEST(RPCListener, AStaleSocketIsReplaced) {
   const testsupport::TemporaryDirectory directory;
   platform::RunLoop loop;
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  (directory / kService).copy(address.sun_path, sizeof address.sun_path - 1);
-  const int dead = socket(AF_UNIX, SOCK_STREAM, 0);
-  ASSERT_EQ(bind(dead, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-  close(dead);
+  close(testsupport::listenAt(directory / kService));
   EXPECT_TRUE(rpc::makeListener(loop, directory.path(), kService)->resume(nullptr));
   EXPECT_FALSE(platform::fileExists(directory / kService));
   EXPECT_FALSE(
@@ -251,7 +235,7 @@ TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
   const int descriptor = connectTo(path());
   const std::string eager =
       testsupport::authenticationLines() + "BEGIN\r\n" + messageOf("Echo", "s", "\2\0\0\0hi\0"s);
-  ASSERT_EQ(send(descriptor, eager.data(), eager.size(), 0), static_cast<ssize_t>(eager.size()));
+  ASSERT_TRUE(testsupport::sendAll(descriptor, eager));
   std::string answer;
   while (answer.find("hi") == std::string::npos) {
     const std::string more = receiveSome(descriptor);
@@ -275,14 +259,7 @@ TEST_F(RPCTest, AClientThatEndsDuringACallAffectsNobodyElse) {
 
 TEST_F(RPCTest, AClientThatNeverReadsIsClosed) {
   const Client client(path());
-  for (int i = 0; i < 2000; ++i) {
-    sd_bus_message* call = client.newCall("Make");
-    sd_bus_message_append(call, "x", int64_t{100000});
-    uint64_t cookie = 0;
-    const int sent = sd_bus_send(client.bus, call, &cookie);
-    sd_bus_message_unref(call);
-    if (sent < 0 || sd_bus_flush(client.bus) < 0) break;
-  }
+  for (int i = 0; i < 2000 && client.send("Make", "x", int64_t{100000}) != 0;) ++i;
   pollfd closed{client.descriptor, POLLRDHUP, 0};
   EXPECT_EQ(poll(&closed, 1, -1),
             1);  // closed by the other side, because nothing has been read here
@@ -291,13 +268,7 @@ TEST_F(RPCTest, AClientThatNeverReadsIsClosed) {
 }
 
 TEST_F(RPCTest, AReplyBeyondTheProtocolLimitsIsAnError) {
-  const Client client(path());
-  sd_bus_error error{};
-  EXPECT_LT(sd_bus_call_method(client.bus, nullptr, kPath, kService, "Make", &error, nullptr, "x",
-                               int64_t{200} << 20),
-            0);
-  EXPECT_STREQ(error.name, SD_BUS_ERROR_LIMITS_EXCEEDED);
-  sd_bus_error_free(&error);
+  EXPECT_EQ(Client(path()).errorOf("Make", "x", int64_t{200} << 20), SD_BUS_ERROR_LIMITS_EXCEEDED);
 }
 
 TEST_F(RPCTest, InvalidBytesEndOnlyTheirOwnConnection) {
@@ -305,7 +276,7 @@ TEST_F(RPCTest, InvalidBytesEndOnlyTheirOwnConnection) {
        {std::string("GET / HTTP/1.0\r\n\r\n"), std::string(100000, '\xFF'),
         std::string("\0AUTH EXTERNAL 39393939\r\nBEGIN\r\nl\1", 34)}) {
     const int descriptor = connectTo(path());
-    [[maybe_unused]] const ssize_t n = send(descriptor, bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    testsupport::sendAll(descriptor, bytes);
     shutdown(descriptor, SHUT_WR);
     EXPECT_TRUE(waitForEnd(descriptor));
     close(descriptor);
@@ -354,11 +325,8 @@ TEST_F(RPCTest, AConnectionWithCallsInFlightIsNotEvicted) {
 TEST_F(RPCTest, APausedConnectionStillSendsAndNoticesTheEnd) {
   {
     const Client client(path());
-    sd_bus_message* large = client.newCall("Make");
-    sd_bus_message_append(large, "x", int64_t{20} << 20);
-    uint64_t cookie = 0;
-    ASSERT_GE(sd_bus_send(client.bus, large, &cookie), 0);
-    sd_bus_message_unref(large);
+    const uint64_t cookie = client.send("Make", "x", int64_t{20} << 20);
+    ASSERT_NE(cookie, 0u);
     for (size_t i = 0; i < rpc::kMaxPendingCalls; ++i) {
       held = {};
       client.hold();
@@ -384,9 +352,7 @@ TEST_F(RPCTest, RefusesContentThatDoesNotMatchItsSignature) {
   const auto call = [this](const char* member, const char* signature, const std::string& body) {
     const int descriptor = connectTo(path());
     EXPECT_TRUE(authenticate(descriptor));
-    const std::string message = messageOf(member, signature, body);
-    EXPECT_EQ(send(descriptor, message.data(), message.size(), MSG_NOSIGNAL),
-              static_cast<ssize_t>(message.size()));
+    EXPECT_TRUE(testsupport::sendAll(descriptor, messageOf(member, signature, body)));
     const std::string answer = receiveSome(descriptor);
     close(descriptor);
     return answer;
@@ -485,15 +451,10 @@ TEST(RPCRequestBudget, LimitsTheBytesOfAllRequests) {
 
 TEST_F(RPCTest, PendingRepliesAreSentBeforeTheEnd) {
   const Client client(path());
-  sd_bus_message* call = client.newCall("Hold");
-  sd_bus_message* answer = nullptr;
-  std::thread caller([&] { sd_bus_call(client.bus, call, 0, nullptr, &answer); });
+  auto error = std::async(std::launch::async, [&] { return client.errorOf("Hold", ""); });
   auto reply = held.get_future().get();
   queue.submit([reply = std::move(reply)] { reply->send({}); });
   queue.drain();
   stop();
-  caller.join();
-  EXPECT_NE(answer, nullptr);
-  sd_bus_message_unref(answer);
-  sd_bus_message_unref(call);
+  EXPECT_EQ(error.get(), "");
 }

@@ -11,16 +11,33 @@
 #include <string>
 #include <string_view>
 
-// Hand-made D-Bus messages, for peers that violate the protocol.
+// Sockets and hand-made D-Bus messages, for peers that violate the protocol.
 namespace testsupport {
 
-// A socket connected to `path`; negative if nobody accepts.
-inline int connectTo(const std::string& path) {
+inline sockaddr_un addressOf(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   path.copy(address.sun_path, sizeof address.sun_path - 1);
+  return address;
+}
+
+// A socket connected to `path`; negative if nobody accepts.
+inline int connectTo(const std::string& path) {
+  const sockaddr_un address = addressOf(path);
   const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (connect(descriptor, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0) {
+  if (connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0) {
+    return descriptor;
+  }
+  close(descriptor);
+  return -1;
+}
+
+// A socket that listens at `path`; negative if that fails.
+inline int listenAt(const std::string& path) {
+  const sockaddr_un address = addressOf(path);
+  const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 &&
+      listen(descriptor, 8) == 0) {
     return descriptor;
   }
   close(descriptor);
