@@ -115,7 +115,13 @@ TEST_P(EndingSignal, ShutsDownDuringABatchAndASearchWithoutLosingAcknowledgedMai
   EXPECT_GT(acknowledged, 0);
   const DaemonProcess again(directory.path());
   client::SearchServiceProxy service(again.runtimeDirectory());
-  EXPECT_GE(search(service, "word"), 50 + acknowledged);
+  TLQuery query;
+  query.setOriginalQuery(u"word");
+  query.setSearchParams(TLParamsManager::paramsFromString(u"salt.maxTopK=1000000"));
+  const auto items =
+      service.searchItems(query, 0, "default", client::SearchServiceProxy::kNoMaximum, nullptr);
+  ASSERT_TRUE(items);
+  EXPECT_GE(static_cast<int>(items->size()), 50 + acknowledged);
 }
 
 INSTANTIATE_TEST_SUITE_P(Signals, EndingSignal, testing::Values(SIGHUP, SIGINT, SIGPIPE, SIGTERM));

@@ -65,7 +65,9 @@ void Process::run(const std::vector<std::string>& arguments, const Variables& en
     setenv("LISTEN_FDS", std::to_string(passedSockets.size()).c_str(), 1);
   }
   for (size_t i = 0; i < passedSockets.size(); ++i) {
-    dup2(passedSockets[i], kFirstPassedSocket + static_cast<int>(i));
+    const int passed = kFirstPassedSocket + static_cast<int>(i);
+    dup2(passedSockets[i], passed);
+    fcntl(passed, F_SETFD, 0);  // which dup2 leaves alone if it is the same descriptor
   }
   std::vector<char*> words;
   for (const std::string& argument : arguments)
