@@ -1,6 +1,5 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <systemd/sd-bus.h>
 
 #include <csignal>
 #include <cstdlib>
@@ -61,19 +60,18 @@ std::set<std::string> members(const std::string& xml, const std::string& interfa
 }
 
 std::string introspect(const std::string& socketPath, const std::string& objectPath) {
-  sd_bus* bus = nullptr;
-  sd_bus_new(&bus);
-  sd_bus_set_address(bus, ("unix:path=" + socketPath).c_str());
-  EXPECT_GE(sd_bus_start(bus), 0);
-  sd_bus_message* reply = nullptr;
-  sd_bus_call_method(bus, nullptr, objectPath.c_str(), "org.freedesktop.DBus.Introspectable",
-                     "Introspect", nullptr, &reply, "");
-  const char* xml = "";
-  if (reply != nullptr) sd_bus_message_read(reply, "s", &xml);
-  std::string out = xml;
-  sd_bus_message_unref(reply);
-  sd_bus_close_unref(bus);
-  return out;
+  const platform::FileDescriptor socket(testsupport::connectTo(socketPath));
+  EXPECT_TRUE(testsupport::authenticate(socket.get()));
+  testsupport::sendAll(socket.get(),
+                       testsupport::rawCall(objectPath, "org.freedesktop.DBus.Introspectable",
+                                            "Introspect", "", ""));
+  std::string answer;
+  while (answer.find("</node>") == std::string::npos) {
+    const std::string more = testsupport::receiveSome(socket.get());
+    if (more.empty()) break;
+    answer += more;
+  }
+  return answer;
 }
 
 }  // namespace
@@ -159,7 +157,10 @@ TEST_F(DaemonProcessTest, AllOperationsWorkOverTheSockets) {
   EXPECT_TRUE(debug.forceVacuumAndCompact("default", nullptr));
   EXPECT_TRUE(service.deleteAllItems("client", "default", nullptr));
   EXPECT_EQ(search(service, "lun"), 0);
-  EXPECT_NE(debug.ping("hello", nullptr)->find("Received hello\n"), std::string::npos);
+  EXPECT_THAT(*debug.ping("hello", nullptr),
+              testing::AllOf(testing::StartsWith("Received hello\nCmd: "),
+                             testing::HasSubstr(
+                                 "Persistent path: " + directory / "state/TallowSearch" + "\n")));
   daemon.signal(SIGUSR1);
   EXPECT_TRUE(
       daemon.waitForLog("default index stats: {\"DocStoreNumItems\":0,\"SaltNumItems\":0}"));
@@ -248,6 +249,9 @@ TEST_F(DaemonProcessTest, ClassesAreSeparateAndFollowTheLock) {
   ASSERT_TRUE(platform::writeFileAtomically(daemon.socketOf("lock_status"), "1 1", nullptr));
   ASSERT_TRUE(daemon.waitForLog("Device locked with state: 1"));
   EXPECT_EQ(search(service, "word", SysFileProtectionComplete), -2);
+  Outcome error;
+  EXPECT_FALSE(service.indexItems(items, "test", SysFileProtectionComplete, &error));
+  EXPECT_EQ(*error, (TLError{"com.quill.tallow.TALIndexerManager", -2, "Indexer unavailable."}));
   EXPECT_EQ(search(service, "word", "other"), 0);
   ASSERT_TRUE(platform::writeFileAtomically(daemon.socketOf("lock_status"), "0 1", nullptr));
   ASSERT_TRUE(daemon.waitForLog("Device unlocked with state: 0"));

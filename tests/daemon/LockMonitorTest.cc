@@ -49,28 +49,18 @@ struct Observer : TLDeviceLockObserver {
 }  // namespace
 
 TEST(LockMonitor, FollowsTheStates) {
-  struct Row {
+  const struct {
     uint32_t state;
     bool available;
     bool unlocked;
-    const char* line;
+    const char* line;  // its begin
+  } rows[] = {
+      {1, false, false, "default TLDeviceLockMonitor: Device locked with"},
+      {3, true, true, "default TLDeviceLockMonitor: Device unlocked with"},
+      {2, false, true, "default TLDeviceLockMonitor: Device locking with"},
+      {0, true, true, "default TLDeviceLockMonitor: Device unlocked with"},
+      {4, false, true, "fault TLDeviceLockMonitor: Device lock state changed to unexpected"},
   };
-  const std::vector<Row> rows{
-      {1, false, false,
-       "default TLDeviceLockMonitor: Device locked with state: 1, unlockedSinceBoot: 0, "
-       "protectedDataAvailable 0"},
-      {3, true, true,
-       "default TLDeviceLockMonitor: Device unlocked with state: 3, unlockedSinceBoot: 1, "
-       "protectedDataAvailable 1"},
-      {2, false, true,
-       "default TLDeviceLockMonitor: Device locking with state: 2, unlockedSinceBoot: 1, "
-       "protectedDataAvailable 0"},
-      {0, true, true,
-       "default TLDeviceLockMonitor: Device unlocked with state: 0, unlockedSinceBoot: 1, "
-       "protectedDataAvailable 1"},
-      {4, false, true,
-       "fault TLDeviceLockMonitor: Device lock state changed to unexpected state: 4, "
-       "unlockedSinceBoot: 1, protectedDataAvailable 0"}};
   FakeVault vault;
   vault.unlocked = 0;
   vault.state = 9;
@@ -81,11 +71,13 @@ TEST(LockMonitor, FollowsTheStates) {
     EXPECT_TRUE(
         log.has("default TLDeviceLockMonitor: lockState: 9, unlockedSinceBoot: 0, "
                 "protectedDataAvailable: 0"));
-    for (const Row& row : rows) {
+    for (const auto& row : rows) {
       vault.change(row.state);
       EXPECT_EQ(monitor.protectedDataAvailable(), row.available) << row.state;
       EXPECT_EQ(monitor.deviceUnlockedSinceBoot(), row.unlocked) << row.state;
-      EXPECT_TRUE(log.has(row.line)) << row.line;
+      EXPECT_TRUE(
+          log.has(fmt::format("{} state: {}, unlockedSinceBoot: {:d}, protectedDataAvailable {:d}",
+                              row.line, row.state, row.unlocked, row.available)));
     }
   }
   EXPECT_EQ(vault.cancelled, 7);

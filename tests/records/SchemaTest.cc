@@ -1,8 +1,10 @@
 #include <google/protobuf/descriptor.h>
 #include <google/protobuf/message.h>
+#include <google/protobuf/unknown_field_set.h>
 #include <google/protobuf/util/message_differencer.h>
 #include <gtest/gtest.h>
 
+#include <bit>
 #include <nlohmann/json.hpp>
 #include <random>
 #include <set>
@@ -20,8 +22,10 @@
 // the other way round. The random messages also test the records' own operations.
 
 namespace schema = com::quill::tallow;
+using google::protobuf::Descriptor;
 using google::protobuf::FieldDescriptor;
 using google::protobuf::Message;
+using google::protobuf::UnknownFieldSet;
 using testsupport::hex;
 
 namespace {
@@ -30,18 +34,13 @@ class RandomMessages {
  public:
   explicit RandomMessages(uint32_t seed) : _random(seed) {}
 
-  // Sets each field with a probability of one half; sub-messages nest up to `depth` levels.
-  void fill(Message& message, int depth) {
-    for (int i = 0; i < message.GetDescriptor()->field_count(); ++i) {
-      const FieldDescriptor* field = message.GetDescriptor()->field(i);
-      const bool message_ = field->cpp_type() == FieldDescriptor::CPPTYPE_MESSAGE;
-      if (message_ && depth == 0) continue;
-      if (field->is_repeated()) {
-        for (uint32_t n = _random() % 4; n > 0; --n) add(message, field, depth);
-      } else if (isRequired(*field) || _random() % 2 == 0) {
-        set(message, field, depth);
-      }
-    }
+  // A message with each field set with a probability of one half; sub-messages nest up to `depth`
+  // levels.
+  template <typename Schema>
+  Schema make(int depth) {
+    Schema message;
+    EXPECT_TRUE(message.ParseFromString(fields(*Schema::descriptor(), depth)));
+    return message;
   }
 
   // Clears a field of the message or of a message in it, and returns the field of `message` that
@@ -87,38 +86,36 @@ class RandomMessages {
     return result;
   }
 
-  void set(Message& m, const FieldDescriptor* f, int depth) {
-    const auto* r = m.GetReflection();
-    switch (f->cpp_type()) {
-      case FieldDescriptor::CPPTYPE_INT64:
-        return r->SetInt64(&m, f, integer());
-      case FieldDescriptor::CPPTYPE_DOUBLE:
-        return r->SetDouble(&m, f, real());
-      case FieldDescriptor::CPPTYPE_FLOAT:
-        return r->SetFloat(&m, f, static_cast<float>(real()));
-      case FieldDescriptor::CPPTYPE_BOOL:
-        return r->SetBool(&m, f, _random() % 2 == 0);
-      case FieldDescriptor::CPPTYPE_ENUM:
-        return r->SetEnumValue(&m, f, enumeration());
-      case FieldDescriptor::CPPTYPE_STRING:
-        return r->SetString(&m, f, text());
-      case FieldDescriptor::CPPTYPE_MESSAGE:
-        return fill(*r->MutableMessage(&m, f), depth - 1);
-      default:
-        FAIL() << f->full_name();
+  std::string fields(const Descriptor& message, int depth) {
+    UnknownFieldSet set;
+    for (int i = 0; i < message.field_count(); ++i) {
+      const FieldDescriptor& field = *message.field(i);
+      if (field.message_type() != nullptr && depth == 0) continue;
+      uint32_t count = field.is_repeated() ? _random() % 4 : _random() % 2;
+      if (isRequired(field)) count = 1;
+      for (; count > 0; --count) add(field, depth, set);
     }
+    std::string bytes;
+    EXPECT_TRUE(set.SerializeToString(&bytes));
+    return bytes;
   }
-  void add(Message& m, const FieldDescriptor* f, int depth) {
-    const auto* r = m.GetReflection();
-    switch (f->cpp_type()) {
+  void add(const FieldDescriptor& field, int depth, UnknownFieldSet& set) {
+    const int number = field.number();
+    switch (field.cpp_type()) {
+      case FieldDescriptor::CPPTYPE_INT64:
+        return set.AddVarint(number, static_cast<uint64_t>(integer()));
       case FieldDescriptor::CPPTYPE_ENUM:
-        return r->AddEnumValue(&m, f, enumeration());
+        return set.AddVarint(number, static_cast<uint64_t>(int64_t{enumeration()}));
+      case FieldDescriptor::CPPTYPE_BOOL:
+        return set.AddVarint(number, _random() % 2);
+      case FieldDescriptor::CPPTYPE_DOUBLE:
+        return set.AddFixed64(number, std::bit_cast<uint64_t>(real()));
+      case FieldDescriptor::CPPTYPE_FLOAT:
+        return set.AddFixed32(number, std::bit_cast<uint32_t>(static_cast<float>(real())));
       case FieldDescriptor::CPPTYPE_STRING:
-        return r->AddString(&m, f, text());
-      case FieldDescriptor::CPPTYPE_MESSAGE:
-        return fill(*r->AddMessage(&m, f), depth - 1);
+        return set.AddLengthDelimited(number, text());
       default:
-        FAIL() << f->full_name();
+        set.AddLengthDelimited(number, fields(*field.message_type(), depth - 1));
     }
   }
 
@@ -128,8 +125,7 @@ class RandomMessages {
 template <typename Record, typename Schema>
 void expectAgreement(int depth) {
   for (uint32_t seed = testsupport::firstSeed(), end = seed + 400; seed != end; ++seed) {
-    Schema message;
-    RandomMessages(seed).fill(message, depth);
+    const auto message = RandomMessages(seed).make<Schema>(depth);
     const std::string wire = message.SerializeAsString();
     Record record;
     ASSERT_TRUE(record.initWithData(wire)) << seed;
@@ -158,9 +154,8 @@ void expectEveryFieldToCount(int depth) {
     if (!RandomMessages::isRequired(*field)) unseen.insert(field->name());
   }
   for (uint32_t seed = testsupport::firstSeed(), end = seed + 400; seed != end; ++seed) {
-    Schema message;
     RandomMessages random(seed);
-    random.fill(message, depth);
+    auto message = random.make<Schema>(depth);
     Record record;
     ASSERT_TRUE(record.initWithData(message.SerializeAsString()));
     const FieldDescriptor* field = random.clearOne(message);

@@ -133,10 +133,8 @@ std::vector<Call> validCalls() {
   std::vector<Call> calls;
   const auto add = [&](const std::string& service, const char* member, const char* signature,
                        const RawBody& body) {
-    std::string path = "/" + service;
-    std::replace(path.begin(), path.end(), '.', '/');
-    calls.push_back(
-        {service, testsupport::rawCall(path, service, member, signature, body.content())});
+    calls.push_back({service, testsupport::rawCall(rpc::objectPath(service), service, member,
+                                                   signature, body.content())});
   };
   const std::string encoded = query.data();
   add(search, "IndexItems", "aayss", RawBody().bytesArray(items).text("n").text(kBadClass));
