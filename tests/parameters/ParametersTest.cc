@@ -33,15 +33,10 @@ std::string valuesOf(const TLParameters* params) {
 }  // namespace
 
 TEST(Parameters, TableOfDefaults) {
-  EXPECT_EQ(Manager::getDefaultParamDict().size(), 30U);
-  EXPECT_EQ(Manager::defaultParamsSet().size(), 30U);
   const auto params = Manager::paramsFromFallback();
-  EXPECT_EQ(params->keyvaluesCount(), 30U);
   EXPECT_EQ(params->intValueForKey("salt.maxTermResults"), 1232348160);
-  EXPECT_EQ(params->intValueForKey("salt.maxTopK"), 1000);
   EXPECT_EQ(params->intValueForKey("queryModification.sufficentRetrievalThreshold"), 0);
   EXPECT_EQ(params->floatValueForKey("salt.scoreThreshold"), 0.02F);
-  EXPECT_EQ(params->floatValueForKey("zoneScore.XFrom"), 0.2F);
   EXPECT_TRUE(params->boolValueForKey("queryModification.enableStemModification"));
   EXPECT_FALSE(params->boolValueForKey("queryModification.enableStemModificationFirstPass"));
   EXPECT_TRUE(Manager::isValidParamKey("zoneScore.Subject"));

@@ -123,9 +123,10 @@ class RandomMessages {
 };
 
 template <typename Record, typename Schema>
-void expectAgreement(int depth) {
+void expectSameBytesAndMerges(int depth) {
   for (uint32_t seed = testsupport::firstSeed(), end = seed + 400; seed != end; ++seed) {
-    const auto message = RandomMessages(seed).make<Schema>(depth);
+    RandomMessages random(seed);
+    const auto message = random.make<Schema>(depth);
     const std::string wire = message.SerializeAsString();
     Record record;
     ASSERT_TRUE(record.initWithData(wire)) << seed;
@@ -142,10 +143,19 @@ void expectAgreement(int depth) {
       ASSERT_EQ(record.hash(), same->hash()) << seed;
       ASSERT_EQ(record.dictionaryRepresentation(), same->dictionaryRepresentation()) << seed;
     }
+
+    auto merged = message;
+    const auto other = random.make<Schema>(depth);
+    merged.MergeFrom(other);
+    Record source;
+    ASSERT_TRUE(source.initWithData(other.SerializeAsString()));
+    copy->mergeFrom(source);
+    ASSERT_EQ(hex(copy->data()), hex(merged.SerializeAsString())) << seed;
+    ASSERT_EQ(record.data(), wire) << seed;
   }
 }
 
-// Records are equal if they are written the same, and the hash depends on every field.
+// Two records are equal exactly if they are written the same, and the hash depends on every field.
 template <typename Record, typename Schema>
 void expectEveryFieldToCount(int depth) {
   std::set<std::string> unseen;
@@ -182,9 +192,15 @@ void expectSameEnumeration(const google::protobuf::EnumDescriptor* descriptor, i
   }
 }
 
+template <typename Record, typename Schema>
+void expectAgreement(int depth) {
+  expectSameBytesAndMerges<Record, Schema>(depth);
+  expectEveryFieldToCount<Record, Schema>(depth);
+}
+
 }  // namespace
 
-TEST(Schema, RandomRecordsAgreeBothWays) {
+TEST(Schema, RandomRecordsAgreeBothWaysAndEveryFieldCounts) {
   expectAgreement<TLPerson, schema::TLPerson>(0);
   expectAgreement<TLCard, schema::TLCard>(0);
   expectAgreement<TLAttribute, schema::TLAttribute>(1);
@@ -194,16 +210,6 @@ TEST(Schema, RandomRecordsAgreeBothWays) {
   expectAgreement<TLParameters, schema::TLParameters>(1);
 }
 
-TEST(Schema, EqualityAndHashSeeEveryField) {
-  expectEveryFieldToCount<TLPerson, schema::TLPerson>(0);
-  expectEveryFieldToCount<TLCard, schema::TLCard>(0);
-  expectEveryFieldToCount<TLAttribute, schema::TLAttribute>(1);
-  expectEveryFieldToCount<TLIndexableItem, schema::TLIndexableItem>(2);
-  expectEveryFieldToCount<TLQueryNode, schema::TLQueryNode>(3);
-  expectEveryFieldToCount<TLQuery, schema::TLQuery>(4);
-  expectEveryFieldToCount<TLParameters, schema::TLParameters>(1);
-}
-
 TEST(Schema, EnumerationsAgree) {
   expectSameEnumeration<TLAttributeKey>(schema::TLAttributeKey_descriptor(), 0,
                                         TLStringAsAttributeKey, TLAttributeKeyAsString);
@@ -211,4 +217,26 @@ TEST(Schema, EnumerationsAgree) {
                                        TLQueryNodeOpAsString);
   expectSameEnumeration<TLQueryNodeMergeOp>(schema::TLQueryNodeMergeOp_descriptor(), 0,
                                             TLStringAsQueryNodeMergeOp, TLQueryNodeMergeOpAsString);
+}
+
+TEST(Enumerations, NumbersAndNamesOfNodes) {
+  EXPECT_EQ(TLQueryNode::keysAsString(171), "TEXT_CONTENT");
+  EXPECT_EQ(TLQueryNode::opAsString(TLQueryNodeOp(21)), "BOOL_CONSTANT");
+  EXPECT_EQ(TLQueryNode::keysAsString(2), "(unknown: 2)");
+  EXPECT_EQ(TLAttribute::keyAsString(TLAttributeKey(-1)), "(unknown: -1)");
+  EXPECT_EQ(TLQueryNode::opAsString(TLQueryNodeOp(7)), "(unknown: 7)");
+  EXPECT_EQ(TLQueryNode::mergeOpAsString(TLQueryNodeMergeOp(3)), "(unknown: 3)");
+  EXPECT_EQ(TLQueryNode::StringAsKeys("NO_SUCH_KEY"), 0);
+  EXPECT_EQ(TLAttribute::StringAsKey("subject"), TLAttributeKey::UNKNOWN);
+  EXPECT_EQ(TLQueryNode::StringAsOp("NO_SUCH_OP"), TLQueryNodeOp::STRING_EQUAL);
+  EXPECT_EQ(TLQueryNode::StringAsMergeOp("XOR"), TLQueryNodeMergeOp::LEAF);
+}
+
+TEST(Enumerations, NamesOfTheQueryLanguage) {
+  EXPECT_EQ(TLAttributeKeyForQueryName("**"), TLAttributeKey::ANY);
+  EXPECT_EQ(TLAttributeKeyForQueryName("*"), TLAttributeKey::ANY_METADATA);
+  EXPECT_EQ(TLAttributeKeyForQueryName("kTLItemMailboxes"), TLAttributeKey::MAILBOX_IDENTIFIERS);
+  EXPECT_EQ(TLAttributeKeyForQueryName("com_quill_mail_read"), TLAttributeKey::READ);
+  EXPECT_EQ(TLAttributeKeyForQueryName("ktlitemsubject"), std::nullopt);
+  EXPECT_EQ(TLAttributeKeyForQueryName(""), std::nullopt);
 }
