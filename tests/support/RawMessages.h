@@ -132,9 +132,7 @@ inline std::string rawCall(std::string_view path, std::string_view interface,
                            std::string_view member, std::string_view signature,
                            const std::string& body) {
   const auto number = [](size_t value) {
-    std::string bytes;
-    for (size_t i = 0; i < 4; ++i) bytes += static_cast<char>(value >> (8 * i));
-    return bytes;
+    return RawBody().number32(static_cast<uint32_t>(value)).content();
   };
   std::string fields;
   const auto field = [&](char code, char type, std::string_view value) {
