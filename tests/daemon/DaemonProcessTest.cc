@@ -1,3 +1,4 @@
+#include <fmt/ranges.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -35,28 +36,22 @@ class DaemonProcessTest : public testing::Test {
 
 class EndingSignal : public DaemonProcessTest, public testing::WithParamInterface<int> {};
 
-// The members in an introspection text with their argument types: "Member(sas)->b".
-std::set<std::string> members(const std::string& xml, const std::string& interface) {
-  std::set<std::string> out;
+// The methods of an interface in an introspection text, each with its arguments in order.
+std::set<std::string> methods(const std::string& xml, const std::string& interface) {
   const size_t from = xml.find("<interface name=\"" + interface + "\"");
-  if (from == std::string::npos) return out;
+  if (from == std::string::npos) return {};
   const std::string body = xml.substr(from, xml.find("</interface>", from) - from);
-  const std::regex method("<method name=\"(\\w+)\">([\\s\\S]*?)</method>");
-  const std::regex argument("<arg ([^>]*)>");
-  for (std::sregex_iterator m(body.begin(), body.end(), method), end; m != end; ++m) {
-    std::string text = (*m)[1].str() + "(";
-    const std::string arguments = (*m)[2].str();
-    for (std::sregex_iterator a(arguments.begin(), arguments.end(), argument); a != end; ++a) {
-      std::smatch type, name;
-      const std::string attributes = (*a)[1].str();
-      std::regex_search(attributes, type, std::regex("type=\"([^\"]*)\""));
-      std::regex_search(attributes, name, std::regex("name=\"([^\"]*)\""));
-      const bool output = attributes.find("direction=\"out\"") != std::string::npos;
-      text += fmt::format("{}{} {},", output ? ">" : "", type[1].str(), name[1].str());
-    }
-    out.insert(text + ")");
+  const std::regex tag("<(method|arg) ([^>]*)>");
+  const std::regex attribute("\\w+=\"[^\"]*\"");
+  std::vector<std::string> found;
+  for (std::sregex_iterator next(body.begin(), body.end(), tag), end; next != end; ++next) {
+    if ((*next)[1] == "method") found.emplace_back();
+    const std::string text = (*next)[2];
+    const std::set<std::string> attributes(
+        std::sregex_token_iterator(text.begin(), text.end(), attribute), {});
+    found.back() += fmt::format("{} ", fmt::join(attributes, " "));
   }
-  return out;
+  return {found.begin(), found.end()};
 }
 
 std::string introspect(const std::string& socketPath, const std::string& objectPath) {
@@ -279,34 +274,18 @@ TEST_F(DaemonProcessTest, ASecondDaemonEndsWithAMessage) {
   EXPECT_TRUE(debug.ping("x", nullptr));
 }
 
-TEST_F(DaemonProcessTest, AcceptsSocketsFromSystemd) {
-  const platform::FileDescriptor search(testsupport::listenAt(directory / "search"));
-  const platform::FileDescriptor debug(testsupport::listenAt(directory / "debug"));
-  const std::string names = std::string(rpc::kSearchServiceName) + ":" + rpc::kDebugServiceName;
-  DaemonProcess daemon(directory.path(), {{"LISTEN_FDNAMES", names}}, {search.get(), debug.get()});
-  ASSERT_TRUE(daemon.ready());
-  EXPECT_NE(introspect(directory / "debug", "/com/quill/tallow/DebugService").find("Ping"),
-            std::string::npos);
-  EXPECT_FALSE(platform::fileExists(daemon.socketOf(rpc::kDebugServiceName)));
-  EXPECT_EQ(daemon.stop(), 0);
-  EXPECT_TRUE(platform::fileExists(directory / "debug"));
-}
-
 TEST_F(DaemonProcessTest, InterfacesMatchTheirDescriptions) {
   const DaemonProcess daemon(directory.path());
-  const std::vector<std::pair<std::string, std::string>> services{
-      {rpc::kSearchServiceName, "/com/quill/tallowsearch/SearchService"},
-      {rpc::kDebugServiceName, "/com/quill/tallow/DebugService"}};
-  for (const auto& [name, path] : services) {
+  for (const std::string name : {rpc::kSearchServiceName, rpc::kDebugServiceName}) {
     const auto file =
         platform::readFile(std::string(TALLOW_INTERFACES) + "/" + name + ".xml", 1 << 20, nullptr);
     ASSERT_TRUE(file) << name;
-    const auto expected = members(*file, name);
+    const auto expected = methods(*file, name);
     EXPECT_GE(expected.size(), 4u);
-    const std::string served = introspect(daemon.socketOf(name), path);
-    EXPECT_EQ(members(served, name), expected);
-    const auto beside = members(*file, rpc::kSearchExplanationName);
+    const std::string served = introspect(daemon.socketOf(name), rpc::objectPath(name));
+    EXPECT_EQ(methods(served, name), expected);
+    const auto beside = methods(*file, rpc::kSearchExplanationName);
     EXPECT_EQ(beside.size(), name == rpc::kSearchServiceName ? 1u : 0u);
-    EXPECT_EQ(members(served, rpc::kSearchExplanationName), beside);
+    EXPECT_EQ(methods(served, rpc::kSearchExplanationName), beside);
   }
 }

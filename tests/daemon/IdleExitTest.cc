@@ -3,6 +3,7 @@
 #include <cstdlib>
 #include <future>
 
+#include "client/DebugServiceProxy.h"
 #include "client/SearchServiceProxy.h"
 #include "daemon/IdleExit.h"
 #include "platform/FileDescriptor.h"
@@ -119,8 +120,11 @@ TEST(IdleExitTest, ACallThatArrivesDuringTheExitIsAnsweredByTheNextDaemon) {
     return testsupport::search(service, "word");
   });
   EXPECT_EQ(first.wait(), 0);
+  EXPECT_TRUE(platform::fileExists(first.socketOf(rpc::kDebugServiceName)));
   const DaemonProcess second = sockets.startDaemon();
   EXPECT_EQ(late.get(), 20);
+  client::DebugServiceProxy debug(second.runtimeDirectory());
+  EXPECT_TRUE(debug.ping("x", nullptr));
 }
 
 TEST(IdleExitTest, ADaemonWithASocketOfItsOwnStays) {

@@ -1,8 +1,8 @@
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <filesystem>
-#include <future>
-#include <mutex>
+#include <semaphore>
 
 #include "daemon/TLDeviceLockMonitor.h"
 #include "platform/Files.h"
@@ -114,47 +114,35 @@ TEST(LockMonitor, WorksWithoutNotifications) {
   EXPECT_EQ(vault.cancelled, 0);
 }
 
-TEST(FileDeviceVault, ReadsItsFileAndSeesChanges) {
+TEST(FileDeviceVault, ReadsItsFileAndSeesChangesAlsoInANewDirectory) {
   const testsupport::TemporaryDirectory directory;
-  const std::string path = directory / "lock_status";
+  const std::string runtime = directory / "run";
+  const std::string path = runtime + "/lock_status";
+  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
   const auto vault = platform::makeFileDeviceVault(path);
   EXPECT_EQ(vault->DVLGetDeviceLockState(0), 0u);
   EXPECT_EQ(vault->DVLDeviceUnlockedSinceBoot(), 1);
+  std::atomic<uint32_t> awaited{2};
+  std::binary_semaphore seen{0};
   platform::SerialQueue queue("vault");
-  std::promise<void> changed;
   int32_t token = -1;
-  ASSERT_EQ(vault->registerNotification(
-                "n", queue, [&] { changed.set_value(); }, &token),
-            0u);
+  const auto handler = [&] {
+    uint32_t state = vault->DVLGetDeviceLockState(0);
+    if (awaited.compare_exchange_strong(state, 9)) seen.release();
+  };
+  ASSERT_EQ(vault->registerNotification("n", queue, handler, &token), 0u);
   EXPECT_NE(token, -1);
   ASSERT_TRUE(platform::writeFileAtomically(path, "2 1\n", nullptr));
-  changed.get_future().wait();
-  EXPECT_EQ(vault->DVLGetDeviceLockState(0), 2u);
+  seen.acquire();
+  awaited = 1;
+  std::filesystem::rename(runtime, directory / "old");
+  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
+  ASSERT_TRUE(platform::writeFileAtomically(path, "1 1\n", nullptr));
+  seen.acquire();
   vault->cancel(token);
   for (const char* garbled : {"", "x", "1", "1 2", "-1 1", "0 1 1", "99999999999 1"}) {
     ASSERT_TRUE(platform::writeFileAtomically(path, garbled, nullptr));
     EXPECT_EQ(vault->DVLGetDeviceLockState(0), 1u) << garbled;
     EXPECT_EQ(vault->DVLDeviceUnlockedSinceBoot(), 0) << garbled;
   }
-}
-
-TEST(FileDeviceVault, SeesChangesAfterItsDirectoryWasReplaced) {
-  const testsupport::TemporaryDirectory directory;
-  const std::string runtime = directory / "run";
-  const std::string path = runtime + "/lock_status";
-  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
-  const auto vault = platform::makeFileDeviceVault(path);
-  std::promise<void> locked;
-  std::once_flag once;
-  platform::SerialQueue queue("vault");
-  int32_t token = -1;
-  const auto handler = [&] {
-    if (vault->DVLGetDeviceLockState(0) == 1) std::call_once(once, [&] { locked.set_value(); });
-  };
-  ASSERT_EQ(vault->registerNotification("n", queue, handler, &token), 0u);
-  std::filesystem::rename(runtime, directory / "old");
-  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
-  ASSERT_TRUE(platform::writeFileAtomically(path, "1 1\n", nullptr));
-  locked.get_future().wait();
-  vault->cancel(token);
 }

@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <functional>
 #include <latch>
+#include <map>
 #include <optional>
 #include <random>
 #include <stop_token>
@@ -116,13 +117,8 @@ class GoodClient {
   std::vector<double> _answers, _indexing;
 };
 
-struct Call {
-  std::string service;
-  std::string message;
-};
-
-// One valid call of each operation.
-std::vector<Call> validCalls() {
+// Valid messages for each service, one for each operation.
+std::map<std::string, std::vector<std::string>> validCalls() {
   const std::string search = rpc::kSearchServiceName;
   const std::string debug = rpc::kDebugServiceName;
   const auto items = testsupport::mails("bad", 2);
@@ -130,28 +126,26 @@ std::vector<Call> validCalls() {
   TLQuery query;
   query.setRawQuery(u"word");
   query.setOriginalQuery(u"word");
-  std::vector<Call> calls;
+  std::map<std::string, std::vector<std::string>> calls;
   const auto add = [&](const std::string& service, const char* member, const char* signature,
                        const RawBody& body) {
-    calls.push_back({service, testsupport::rawCall(rpc::objectPath(service), service, member,
-                                                   signature, body.content())});
+    calls[service].push_back(
+        testsupport::rawCall(rpc::objectPath(service), service, member, signature, body.content()));
   };
-  const std::string encoded = query.data();
-  add(search, "IndexItems", "aayss", RawBody().bytesArray(items).text("n").text(kBadClass));
-  add(search, "DeleteItemsWithIdentifiers", "asss",
-      RawBody().texts(names).text("n").text(kBadClass));
+  // Most operations end with a client or an index name, and a class.
+  const auto named = [](RawBody body) { return body.text("n").text(kBadClass); };
+  add(search, "IndexItems", "aayss", named(RawBody().bytesArray(items)));
+  add(search, "DeleteItemsWithIdentifiers", "asss", named(RawBody().texts(names)));
   add(search, "IndexItemsDeleteItemsWithIdentifiers", "aayasbayss",
-      RawBody().bytesArray(items).texts(names).number32(1).bytes("state").text("n").text(
-          kBadClass));
-  add(search, "FetchLastClientState", "ss", RawBody().text("n").text(kBadClass));
-  add(search, "DeleteItemsWithDomainIdentifiers", "asss",
-      RawBody().texts(names).text("n").text(kBadClass));
-  add(search, "DeleteAllItems", "ss", RawBody().text("n").text(kBadClass));
+      named(RawBody().bytesArray(items).texts(names).number32(1).bytes("state")));
+  add(search, "FetchLastClientState", "ss", named(RawBody()));
+  add(search, "DeleteItemsWithDomainIdentifiers", "asss", named(RawBody().texts(names)));
+  add(search, "DeleteAllItems", "ss", named(RawBody()));
   add(search, "SearchItemsForQuery", "aytsx",
-      RawBody().bytes(encoded).number64(0).text(kBadClass).number64(10));
+      RawBody().bytes(query.data()).number64(0).text(kBadClass).number64(10));
   add(debug, "Ping", "s", RawBody().text("hello"));
-  add(debug, "FetchStatsForIndexer", "ss", RawBody().text("n").text(kBadClass));
-  add(debug, "FetchStatsForSalt", "ss", RawBody().text("n").text(kBadClass));
+  add(debug, "FetchStatsForIndexer", "ss", named(RawBody()));
+  add(debug, "FetchStatsForSalt", "ss", named(RawBody()));
   add(debug, "ForceVacuumAndCompact", "s", RawBody().text(kBadClass));
   return calls;
 }
@@ -191,17 +185,16 @@ bool exchange(int socket, std::string_view message) {
 uint64_t sendWrongMessages(const DaemonProcess& daemon, const Options& options,
                            const std::function<bool()>& goesOn) {
   std::mt19937 random(static_cast<uint32_t>(options.seed));
-  const std::vector<Call> calls = validCalls();
+  const auto calls = validCalls();
   uint64_t sent = 0;
   while (sent < options.messages && goesOn()) {
-    const std::string service = calls[random() % calls.size()].service;
+    const auto& [service, messages] = *std::next(calls.begin(), random() % calls.size());
     const FileDescriptor socket(testsupport::connectTo(daemon.socketOf(service)));
     if (socket.get() < 0 || !testsupport::authenticate(socket.get())) continue;
     for (int i = 0; i < kMessagesOfConnection && sent < options.messages; ++i) {
-      const Call* call = &calls[random() % calls.size()];
-      while (call->service != service) call = &calls[random() % calls.size()];
       ++sent;
-      if (!exchange(socket.get(), mutated(call->message, random))) break;
+      const std::string& message = messages[random() % messages.size()];
+      if (!exchange(socket.get(), mutated(message, random))) break;
     }
   }
   return sent;
@@ -285,7 +278,7 @@ int runFlood(const Options& options) {
   DaemonProcess daemon(scratch.path());
   const std::string path = daemon.socketOf(rpc::kSearchServiceName);
   GoodClient good(daemon.runtimeDirectory(), kBatch);
-  const std::string message = validCalls()[6].message;
+  const std::string message = validCalls().at(rpc::kSearchServiceName)[6];
   size_t most = 0;
   {
     std::vector<std::jthread> threads;

@@ -10,13 +10,11 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <random>
 #include <set>
@@ -73,15 +71,6 @@ struct Tally {
   std::atomic<bool> wrong{false};
 };
 
-// False when a stop was requested before the time had passed.
-bool pauseFor(const std::stop_token& stop, milliseconds time) {
-  std::mutex mutex;
-  std::condition_variable_any wake;
-  std::unique_lock lock(mutex);
-  wake.wait_for(lock, stop, time, [] { return false; });
-  return !stop.stop_requested();
-}
-
 // One client with its own mails in one class.
 class Client {
  public:
@@ -94,24 +83,19 @@ class Client {
         _tally(tally) {}
 
   void work(const std::stop_token& stop) {
-    while (!_tally.wrong && pauseFor(stop, milliseconds(_random() % (_pause + 1)))) {
+    while (!_tally.wrong && !stop.stop_requested()) {
+      std::this_thread::sleep_for(milliseconds(_random() % (_pause + 1)));
       if (!_service) _service.emplace(_directory, kPatience);
       ++_tally.calls;
-      switch (_random() % 10) {
-        case 0:
-        case 1:
-        case 2:
-          add();
-          break;
-        case 3:
-        case 4:
-          remove();
-          break;
-        case 5:
-          diagnose();
-          break;
-        default:
-          searchOne();
+      const auto die = _random() % 10;
+      if (die < 3) {
+        add();
+      } else if (die < 5) {
+        remove();
+      } else if (die < 6) {
+        diagnose();
+      } else {
+        searchOne();
       }
     }
   }
@@ -188,19 +172,17 @@ class Client {
   void diagnose() {
     client::DebugServiceProxy debug(_directory, kPatience);
     std::optional<TLError> error;
-    switch (_random() % 40) {
-      case 0:
-        settle(debug.forceVacuumAndCompact(_class, &error), error);
-        break;
-      case 1:
-        settle(debug.fetchStatsForIndexer(kName, _class, &error).has_value(), error);
-        break;
-      case 2:
-        settle(_service->fetchLastClientState(kName, _class, &error).has_value(), error);
-        break;
-      default:
-        settle(debug.ping(_prefix, &error).has_value(), error);
+    const auto die = _random() % 40;
+    if (die == 0) {
+      debug.forceVacuumAndCompact(_class, &error);
+    } else if (die == 1) {
+      static_cast<void>(debug.fetchStatsForIndexer(kName, _class, &error));
+    } else if (die == 2) {
+      static_cast<void>(_service->fetchLastClientState(kName, _class, &error));
+    } else {
+      static_cast<void>(debug.ping(_prefix, &error));
     }
+    settle(!error, error);
   }
 
   static bool refusedByLock(const std::optional<TLError>& error) {
