@@ -13,7 +13,6 @@
 #include "client/SearchServiceProxy.h"
 #include "daemon/TALIndexerManager.h"
 #include "parameters/TLParamsManager.h"
-#include "platform/FileDescriptor.h"
 #include "platform/Files.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
@@ -55,18 +54,9 @@ std::set<std::string> methods(const std::string& xml, const std::string& interfa
 }
 
 std::string introspect(const std::string& socketPath, const std::string& objectPath) {
-  const platform::FileDescriptor socket(testsupport::connectTo(socketPath));
-  EXPECT_TRUE(testsupport::authenticate(socket.get()));
-  testsupport::sendAll(socket.get(),
-                       testsupport::rawCall(objectPath, "org.freedesktop.DBus.Introspectable",
-                                            "Introspect", "", ""));
-  std::string answer;
-  while (answer.find("</node>") == std::string::npos) {
-    const std::string more = testsupport::receiveSome(socket.get());
-    if (more.empty()) break;
-    answer += more;
-  }
-  return answer;
+  const std::string call =
+      testsupport::rawCall(objectPath, "org.freedesktop.DBus.Introspectable", "Introspect", "", "");
+  return testsupport::answerTo(call, socketPath, "</node>");
 }
 
 }  // namespace
@@ -175,14 +165,11 @@ TEST_F(DaemonProcessTest, RefusesInvalidBytesNamingArgumentAndIndex) {
   EXPECT_EQ(*error, (TLError{"TALIndexer", 1, "document has no identifier"}));
   EXPECT_EQ(search(service, "fine"), 0);
   const std::string name = rpc::kSearchServiceName;
-  const platform::FileDescriptor socket(testsupport::connectTo(daemon.socketOf(name)));
-  ASSERT_TRUE(testsupport::authenticate(socket.get()));
   testsupport::RawBody body;
   body.bytes("\x0A\x7F").number64(0).text("default").number64(1);
-  testsupport::sendAll(socket.get(),
-                       testsupport::rawCall(rpc::objectPath(name), name, "SearchItemsForQuery",
-                                            "aytsx", body.content()));
-  EXPECT_THAT(testsupport::receiveSome(socket.get()),
+  const std::string call = testsupport::rawCall(rpc::objectPath(name), name, "SearchItemsForQuery",
+                                                "aytsx", body.content());
+  EXPECT_THAT(testsupport::answerTo(call, daemon.socketOf(name)),
               testing::HasSubstr("argument 0 (query): the bytes are no TLQuery"));
   EXPECT_EQ(search(service, "fine"), 0);
 }

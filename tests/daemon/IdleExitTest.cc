@@ -16,13 +16,10 @@
 #include "tests/support/RawMessages.h"
 #include "tests/support/TemporaryDirectory.h"
 
+using testsupport::connectTo;
 using testsupport::DaemonProcess;
 
 namespace {
-
-platform::FileDescriptor connectTo(const std::string& path) {
-  return platform::FileDescriptor(testsupport::connectTo(path));
-}
 
 // The two sockets of the daemon as systemd holds them.
 class Sockets {

@@ -13,6 +13,7 @@
 #include <system_error>
 #include <thread>
 
+#include "platform/FileDescriptor.h"
 #include "platform/Files.h"
 #include "platform/Queue.h"
 #include "rpc/Inlet.h"
@@ -23,7 +24,6 @@
 
 namespace {
 
-using testsupport::authenticate;
 using testsupport::connectTo;
 using testsupport::receiveSome;
 
@@ -49,7 +49,7 @@ std::string messageOf(const char* member, const char* signature, const std::stri
 class Client {
  public:
   explicit Client(const std::string& path) {
-    descriptor = connectTo(path);
+    descriptor = connectTo(path).release();
     sd_bus_new(&bus);
     sd_bus_set_fd(bus, descriptor, descriptor);
     EXPECT_GE(sd_bus_start(bus), 0);
@@ -68,31 +68,23 @@ class Client {
     return sent ? cookie : 0;
   }
 
-  // Makes a call and returns the name of its error, "" if there is none.
+  // Makes a call. The text of the reply, "" if it is no text, or the name of the error.
   template <typename... Arguments>
-  std::string errorOf(const char* member, const char* signature, Arguments... arguments) const {
-    sd_bus_error error{};
-    sd_bus_call_method(bus, nullptr, kPath, kService, member, &error, nullptr, signature,
-                       arguments...);
-    const std::string name = error.name == nullptr ? "" : error.name;
-    sd_bus_error_free(&error);
-    return name;
-  }
-
-  // Makes a call to which the test replies later.
-  void hold() const { EXPECT_NE(send("Hold", ""), 0u); }
-
-  // The text of the reply, or the name of the error.
-  std::string echo(const std::string& text, const char* interface = kService) const {
+  std::string call(const char* interface, const char* member, const char* signature,
+                   Arguments... arguments) const {
     sd_bus_error error{};
     sd_bus_message* reply = nullptr;
-    sd_bus_call_method(bus, nullptr, kPath, interface, "Echo", &error, &reply, "s", text.c_str());
+    sd_bus_call_method(bus, nullptr, kPath, interface, member, &error, &reply, signature,
+                       arguments...);
     const char* result = error.name;
     if (reply != nullptr) sd_bus_message_read(reply, "s", &result);
     std::string answer = result == nullptr ? "" : result;
     sd_bus_error_free(&error);
     sd_bus_message_unref(reply);
     return answer;
+  }
+  std::string echo(const std::string& text, const char* interface = kService) const {
+    return call(interface, "Echo", "s", text.c_str());
   }
 
   sd_bus* bus = nullptr;
@@ -144,6 +136,13 @@ class RPCTest : public testing::Test {
 
   std::string path() const { return directory / kService; }
 
+  // Makes a call of the client to which the test replies later.
+  std::shared_ptr<rpc::Reply> hold(const Client& client) {
+    held = {};
+    EXPECT_NE(client.send("Hold", ""), 0u);
+    return held.get_future().get();
+  }
+
   // Waits until no connection has a running thread.
   static void waitForThreads() {
     const auto serving = [] {
@@ -174,8 +173,8 @@ TEST_F(RPCTest, AnswersAndReportsErrorsByName) {
   const Client client(path());
   EXPECT_EQ(client.echo("hello"), "hello");
   EXPECT_EQ(client.echo("fail"), "com.quill.tallow.Error");
-  EXPECT_EQ(client.errorOf("Nothing", ""), SD_BUS_ERROR_UNKNOWN_METHOD);
-  EXPECT_EQ(client.errorOf("Echo", "x", int64_t{1}), rpc::kInvalidArgs);
+  EXPECT_EQ(client.call(kService, "Nothing", ""), SD_BUS_ERROR_UNKNOWN_METHOD);
+  EXPECT_EQ(client.call(kService, "Echo", "x", int64_t{1}), rpc::kInvalidArgs);
   EXPECT_EQ(client.echo("still here"), "still here");
 }
 
@@ -219,7 +218,7 @@ TEST_F(RPCTest, TheSocketIsPrivateAndOnlyAStaleOneIsReplaced) {
   EXPECT_EQ(Client(path()).echo("first"), "first");
   stop();
   EXPECT_FALSE(platform::fileExists(path()));
-  close(testsupport::listenAt(path()));
+  testsupport::listenAt(path()).reset();
   EXPECT_TRUE(second->resume(nullptr));
   EXPECT_FALSE(
       rpc::makeListener(other, directory / std::string(100, 'd'), kService)->resume(nullptr));
@@ -228,24 +227,22 @@ TEST_F(RPCTest, TheSocketIsPrivateAndOnlyAStaleOneIsReplaced) {
 // Some libraries send the call together with the end of the authentication.
 TEST_F(RPCTest, AnEagerCallIsAnsweredAtOnce) {
   using namespace std::string_literals;
-  const int descriptor = connectTo(path());
+  const platform::FileDescriptor socket = connectTo(path());
   const std::string eager =
       testsupport::authenticationLines() + "BEGIN\r\n" + messageOf("Echo", "s", "\2\0\0\0hi\0"s);
-  ASSERT_TRUE(testsupport::sendAll(descriptor, eager));
+  ASSERT_TRUE(testsupport::sendAll(socket.get(), eager));
   std::string answer;
   while (answer.find("hi") == std::string::npos) {
-    const std::string more = receiveSome(descriptor);
+    const std::string more = receiveSome(socket.get());
     ASSERT_FALSE(more.empty());
     answer += more;
   }
-  close(descriptor);
 }
 
 TEST_F(RPCTest, AClientThatEndsDuringACallAffectsNobodyElse) {
   {
     const Client client(path());
-    client.hold();
-    auto reply = held.get_future().get();
+    const auto reply = hold(client);
     shutdown(client.descriptor, SHUT_RDWR);
     queue.submit([reply] { reply->send({}); });
   }
@@ -264,18 +261,18 @@ TEST_F(RPCTest, AClientThatNeverReadsIsClosed) {
 }
 
 TEST_F(RPCTest, AReplyBeyondTheProtocolLimitsIsAnError) {
-  EXPECT_EQ(Client(path()).errorOf("Make", "x", int64_t{200} << 20), SD_BUS_ERROR_LIMITS_EXCEEDED);
+  EXPECT_EQ(Client(path()).call(kService, "Make", "x", int64_t{200} << 20),
+            SD_BUS_ERROR_LIMITS_EXCEEDED);
 }
 
 TEST_F(RPCTest, InvalidBytesEndOnlyTheirOwnConnection) {
   for (const std::string& bytes :
        {std::string("GET / HTTP/1.0\r\n\r\n"), std::string(100000, '\xFF'),
         std::string("\0AUTH EXTERNAL 39393939\r\nBEGIN\r\nl\1", 34)}) {
-    const int descriptor = connectTo(path());
-    testsupport::sendAll(descriptor, bytes);
-    shutdown(descriptor, SHUT_WR);
-    EXPECT_TRUE(waitForEnd(descriptor));
-    close(descriptor);
+    const platform::FileDescriptor socket = connectTo(path());
+    testsupport::sendAll(socket.get(), bytes);
+    shutdown(socket.get(), SHUT_WR);
+    EXPECT_TRUE(waitForEnd(socket.get()));
   }
   EXPECT_EQ(Client(path()).echo("alive"), "alive");
 }
@@ -285,15 +282,13 @@ TEST_F(RPCTest, InvalidBytesEndOnlyTheirOwnConnection) {
 TEST_F(RPCTest, ConnectionsAreLimitedAndSilentOnesAreEvicted) {
   const Client working(path());
   EXPECT_EQ(working.echo("before"), "before");
-  std::vector<int> silent;
+  std::vector<platform::FileDescriptor> silent;
   for (size_t i = 0; i < rpc::kMaxConnections; ++i) silent.push_back(connectTo(path()));
-  EXPECT_TRUE(waitForEnd(silent.front()));
+  EXPECT_TRUE(waitForEnd(silent.front().get()));
   EXPECT_EQ(Client(path()).echo("new"), "new");
   EXPECT_EQ(working.echo("after"), "after");
-  for (const int descriptor : silent) {
-    EXPECT_TRUE(waitForEnd(descriptor));
-    close(descriptor);
-  }
+  for (const auto& socket : silent) EXPECT_TRUE(waitForEnd(socket.get()));
+  silent.clear();
   EXPECT_EQ(log.count("not authenticated in time") + log.count("evicted for a new connection"),
             rpc::kMaxConnections);
   EXPECT_EQ(working.echo("still"), "still");
@@ -303,13 +298,9 @@ TEST_F(RPCTest, AConnectionWithCallsInFlightIsNotEvicted) {
   std::vector<std::unique_ptr<Client>> busy;
   for (size_t i = 0; i < rpc::kMaxConnections; ++i) {
     busy.push_back(std::make_unique<Client>(path()));
-    held = {};
-    busy.back()->hold();
-    replies.push_back(held.get_future().get());
+    replies.push_back(hold(*busy.back()));
   }
-  const int refused = connectTo(path());
-  EXPECT_TRUE(waitForEnd(refused));
-  close(refused);
+  EXPECT_TRUE(waitForEnd(connectTo(path()).get()));
   EXPECT_TRUE(log.contains("Refusing connection"));
   replies.pop_back();  // without an answer
   EXPECT_EQ(busy.back()->echo("heard"), "heard");
@@ -323,11 +314,7 @@ TEST_F(RPCTest, APausedConnectionStillSendsAndNoticesTheEnd) {
     const Client client(path());
     const uint64_t cookie = client.send("Make", "x", int64_t{20} << 20);
     ASSERT_NE(cookie, 0u);
-    for (size_t i = 0; i < rpc::kMaxPendingCalls; ++i) {
-      held = {};
-      client.hold();
-      replies.push_back(held.get_future().get());
-    }
+    while (replies.size() < rpc::kMaxPendingCalls) replies.push_back(hold(client));
     sd_bus_message* answer = nullptr;
     while (answer == nullptr && sd_bus_wait(client.bus, UINT64_MAX) >= 0) {
       while (sd_bus_process(client.bus, &answer) > 0 && answer == nullptr) {
@@ -346,12 +333,7 @@ TEST_F(RPCTest, APausedConnectionStillSendsAndNoticesTheEnd) {
 // The headers are valid; the errors show only when the content is read.
 TEST_F(RPCTest, RefusesContentThatDoesNotMatchItsSignature) {
   const auto call = [this](const char* member, const char* signature, const std::string& body) {
-    const int descriptor = connectTo(path());
-    EXPECT_TRUE(authenticate(descriptor));
-    EXPECT_TRUE(testsupport::sendAll(descriptor, messageOf(member, signature, body)));
-    const std::string answer = receiveSome(descriptor);
-    close(descriptor);
-    return answer;
+    return testsupport::answerTo(messageOf(member, signature, body), path());
   };
   using namespace std::string_literals;
   EXPECT_THAT(call("Echo", "s", "\2\0\0\0hi\0"s), testing::HasSubstr("hi"));
@@ -438,7 +420,7 @@ TEST(RPCRequestBudget, LimitsTheBytesOfAllRequests) {
 
 TEST_F(RPCTest, PendingRepliesAreSentBeforeTheEnd) {
   const Client client(path());
-  auto error = std::async(std::launch::async, [&] { return client.errorOf("Hold", ""); });
+  auto error = std::async(std::launch::async, [&] { return client.call(kService, "Hold", ""); });
   auto reply = held.get_future().get();
   queue.submit([reply = std::move(reply)] { reply->send({}); });
   queue.drain();

@@ -11,6 +11,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/FileDescriptor.h"
+
 // Sockets and hand-made D-Bus messages, for peers that violate the protocol.
 namespace testsupport {
 
@@ -21,27 +23,25 @@ inline sockaddr_un addressOf(const std::string& path) {
   return address;
 }
 
-// A socket connected to `path`; negative if nobody accepts.
-inline int connectTo(const std::string& path) {
+// A socket connected to `path`; none if nobody accepts.
+inline platform::FileDescriptor connectTo(const std::string& path) {
   const sockaddr_un address = addressOf(path);
-  const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0) {
-    return descriptor;
+  platform::FileDescriptor one(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  if (connect(one.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    one.reset();
   }
-  close(descriptor);
-  return -1;
+  return one;
 }
 
-// A socket that listens at `path`; negative if that fails.
-inline int listenAt(const std::string& path) {
+// A socket that listens at `path`; none if that fails.
+inline platform::FileDescriptor listenAt(const std::string& path) {
   const sockaddr_un address = addressOf(path);
-  const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 &&
-      listen(descriptor, 8) == 0) {
-    return descriptor;
+  platform::FileDescriptor one(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  if (bind(one.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
+      listen(one.get(), 8) != 0) {
+    one.reset();
   }
-  close(descriptor);
-  return -1;
+  return one;
 }
 
 // The first lines of the handshake, without BEGIN.
@@ -76,6 +76,21 @@ inline bool sendAll(int descriptor, std::string_view bytes) {
 inline bool authenticate(int descriptor) {
   return sendAll(descriptor, authenticationLines()) && !receiveSome(descriptor).empty() &&
          sendAll(descriptor, "BEGIN\r\n");
+}
+
+// Sends a message over a new connection. What is received until it contains `end`, or until the
+// other side closes.
+inline std::string answerTo(const std::string& message, const std::string& path,
+                            std::string_view end = "") {
+  const platform::FileDescriptor socket = connectTo(path);
+  std::string answer;
+  if (!authenticate(socket.get()) || !sendAll(socket.get(), message)) return answer;
+  do {
+    const std::string more = receiveSome(socket.get());
+    if (more.empty()) break;
+    answer += more;
+  } while (answer.find(end) == std::string::npos);
+  return answer;
 }
 
 // The body of a message, little-endian, value by value.

@@ -189,7 +189,7 @@ uint64_t sendWrongMessages(const DaemonProcess& daemon, const Options& options,
   uint64_t sent = 0;
   while (sent < options.messages && goesOn()) {
     const auto& [service, messages] = *std::next(calls.begin(), random() % calls.size());
-    const FileDescriptor socket(testsupport::connectTo(daemon.socketOf(service)));
+    const FileDescriptor socket = testsupport::connectTo(daemon.socketOf(service));
     if (socket.get() < 0 || !testsupport::authenticate(socket.get())) continue;
     for (int i = 0; i < kMessagesOfConnection && sent < options.messages; ++i) {
       ++sent;
@@ -235,7 +235,7 @@ int runMutations(const Options& options) {
 void holdSilentOnes(const std::string& path, int count, const std::stop_token& stop) {
   std::vector<FileDescriptor> held;
   for (int i = 0; i < count && !stop.stop_requested(); ++i) {
-    held.emplace_back(testsupport::connectTo(path));
+    held.push_back(testsupport::connectTo(path));
   }
   while (!stop.stop_requested()) std::this_thread::sleep_for(milliseconds(50));
 }
@@ -247,7 +247,7 @@ void drip(const std::string& path, int count, const std::stop_token& stop) {
   while (!stop.stop_requested()) {
     for (FileDescriptor& socket : sockets) {
       if (socket.get() >= 0 && testsupport::sendAll(socket.get(), "x")) continue;
-      socket = FileDescriptor(testsupport::connectTo(path));
+      socket = testsupport::connectTo(path);
       if (socket.get() >= 0 && testsupport::authenticate(socket.get())) {
         testsupport::sendAll(socket.get(), header);
       }
@@ -259,7 +259,7 @@ void drip(const std::string& path, int count, const std::stop_token& stop) {
 // Repeatedly searches for everything and never reads a reply.
 void neverRead(const std::string& path, const std::string& message, const std::stop_token& stop) {
   while (!stop.stop_requested()) {
-    const FileDescriptor socket(testsupport::connectTo(path));
+    const FileDescriptor socket = testsupport::connectTo(path);
     if (socket.get() < 0 || !testsupport::authenticate(socket.get())) continue;
     while (!stop.stop_requested()) {
       const ssize_t size =
