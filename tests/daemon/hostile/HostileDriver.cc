@@ -223,6 +223,7 @@ int runMutations(const Options& options) {
   uint64_t sent = 0;
   {
     const std::jthread working([&good](const std::stop_token& stop) { good.work(stop); });
+    good.waitUntilBegun();  // its class is open before others take the descriptors
     sent = sendWrongMessages(daemon, options, [&] { return good.wrong.empty() && lives(daemon); });
   }
   return conclude(daemon, good, fmt::format("messages={}", sent));
