@@ -29,14 +29,10 @@ class BadIndexTest : public testing::Test {
     for (const char* protectionClass : {"bad", "good"}) {
       EXPECT_TRUE(service.indexItems(mails("a", 10), "test", protectionClass, nullptr));
     }
-    end(daemon);
+    EXPECT_EQ(daemon.stop(), 0);
     fs::copy(root, kept, fs::copy_options::recursive);
   }
 
-  static void end(DaemonProcess& daemon) {
-    daemon.signal(SIGTERM);
-    EXPECT_EQ(daemon.wait(), 0);
-  }
   // Restores the data as it was before all damage.
   void restore() const {
     fs::remove_all(root);
@@ -96,7 +92,7 @@ TEST_F(BadIndexTest, DamageInOneClassDoesNotAffectTheOther) {
     EXPECT_TRUE(daemon.waitForLog(c.line));
     EXPECT_TRUE(service.indexItems(mails("b", 1), "test", "good", nullptr));
     EXPECT_EQ(search(service, "word", "good"), 11) << c.line;
-    end(daemon);
+    EXPECT_EQ(daemon.stop(), 0);
   }
 }
 
@@ -137,7 +133,7 @@ TEST_F(BadIndexTest, SetsAsideAnIndexAfterTwoCrashesAndKeepsTheOtherClass) {
     EXPECT_EQ(search(service, "a", "good"), 10);
     EXPECT_TRUE(service.indexItems(mails("b", 2), "test", "bad", nullptr));
     EXPECT_EQ(search(service, "word", "bad"), 2);
-    end(daemon);
+    EXPECT_EQ(daemon.stop(), 0);
     EXPECT_FALSE(fs::exists(salt::crashNotesPath(index)));
   }
 }

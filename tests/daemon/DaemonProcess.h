@@ -1,5 +1,6 @@
 #pragma once
 
+#include <csignal>
 #include <optional>
 #include <string>
 #include <vector>
@@ -13,8 +14,8 @@ namespace testsupport {
 class DaemonProcess {
  public:
   // Starts it and waits until it reports that it is ready, or has ended.
-  explicit DaemonProcess(const std::string& directory, const std::vector<int>& passedSockets = {},
-                         const std::string& socketNames = "");
+  explicit DaemonProcess(const std::string& directory, Process::Variables environment = {},
+                         const std::vector<int>& passedSockets = {});
   [[nodiscard]] bool ready() const { return _ready; }
   [[nodiscard]] pid_t pid() const { return _process->pid(); }
   [[nodiscard]] const std::string& runtimeDirectory() const { return _runtimeDirectory; }
@@ -25,7 +26,10 @@ class DaemonProcess {
   void signal(int number) const { _process->signal(number); }
   // Waits for the end. Returns the exit status, or 128 plus the number of the signal that ended it.
   int wait() { return _process->end(); }
+  // Ends it in order; the result is that of `wait`.
+  int stop() { return _process->end(SIGTERM); }
   [[nodiscard]] std::string log() const { return _process->log(); }
+  [[nodiscard]] std::string endOfLog() const;
   [[nodiscard]] size_t anonymousKilobytes() const { return _process->anonymousKilobytes(); }
   bool waitForLog(const std::string& text) const { return _process->waitForLog(text); }
 

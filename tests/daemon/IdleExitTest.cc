@@ -1,11 +1,9 @@
 #include <gtest/gtest.h>
-#include <sys/socket.h>
-#include <sys/un.h>
-#include <unistd.h>
 
 #include <cstdlib>
 #include <future>
 
+#include "client/DebugServiceProxy.h"
 #include "client/SearchServiceProxy.h"
 #include "daemon/IdleExit.h"
 #include "platform/FileDescriptor.h"
@@ -15,27 +13,13 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/RawMessages.h"
 #include "tests/support/TemporaryDirectory.h"
 
+using testsupport::connectTo;
 using testsupport::DaemonProcess;
 
 namespace {
-
-using Connect = int(int, const sockaddr*, socklen_t);
-
-// A socket that is bound or connected to `path`.
-platform::FileDescriptor socketAt(const std::string& path, Connect* attach) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  path.copy(address.sun_path, sizeof address.sun_path - 1);
-  platform::FileDescriptor one(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  EXPECT_EQ(attach(one.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0) << path;
-  return one;
-}
-
-platform::FileDescriptor connectTo(const std::string& path) {
-  return socketAt(path, connect);
-}
 
 // The two sockets of the daemon as systemd holds them.
 class Sockets {
@@ -43,19 +27,17 @@ class Sockets {
   explicit Sockets(const std::string& directory) : _directory(directory) {
     EXPECT_TRUE(platform::createDirectories(directory + "/run", nullptr));
     for (const char* const name : {rpc::kSearchServiceName, rpc::kDebugServiceName}) {
-      platform::FileDescriptor one = socketAt(directory + "/run/" + name, bind);
-      EXPECT_EQ(listen(one.get(), 8), 0);
-      _sockets.push_back(std::move(one));
+      _sockets.emplace_back(testsupport::listenAt(directory + "/run/" + name));
     }
   }
 
   // `count` of the sockets are passed.
   [[nodiscard]] DaemonProcess startDaemon(size_t count = 2) const {
-    const std::string names = std::string(rpc::kSearchServiceName) + (count > 1 ? ":" : "") +
-                              (count > 1 ? rpc::kDebugServiceName : "");
+    std::string names = rpc::kSearchServiceName;
+    if (count > 1) names += std::string(":") + rpc::kDebugServiceName;
     std::vector<int> passed;
     for (size_t i = 0; i < count; ++i) passed.push_back(_sockets[i].get());
-    return DaemonProcess(_directory, passed, names);
+    return DaemonProcess(_directory, {{"LISTEN_FDNAMES", names}}, passed);
   }
 
  private:
@@ -135,8 +117,11 @@ TEST(IdleExitTest, ACallThatArrivesDuringTheExitIsAnsweredByTheNextDaemon) {
     return testsupport::search(service, "word");
   });
   EXPECT_EQ(first.wait(), 0);
+  EXPECT_TRUE(platform::fileExists(first.socketOf(rpc::kDebugServiceName)));
   const DaemonProcess second = sockets.startDaemon();
   EXPECT_EQ(late.get(), 20);
+  client::DebugServiceProxy debug(second.runtimeDirectory());
+  EXPECT_TRUE(debug.ping("x", nullptr));
 }
 
 TEST(IdleExitTest, ADaemonWithASocketOfItsOwnStays) {

@@ -1,8 +1,8 @@
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <filesystem>
-#include <future>
-#include <mutex>
+#include <semaphore>
 
 #include "daemon/TLDeviceLockMonitor.h"
 #include "platform/Files.h"
@@ -49,28 +49,18 @@ struct Observer : TLDeviceLockObserver {
 }  // namespace
 
 TEST(LockMonitor, FollowsTheStates) {
-  struct Row {
+  const struct {
     uint32_t state;
     bool available;
     bool unlocked;
-    const char* line;
+    const char* line;  // its begin
+  } rows[] = {
+      {1, false, false, "default TLDeviceLockMonitor: Device locked with"},
+      {3, true, true, "default TLDeviceLockMonitor: Device unlocked with"},
+      {2, false, true, "default TLDeviceLockMonitor: Device locking with"},
+      {0, true, true, "default TLDeviceLockMonitor: Device unlocked with"},
+      {4, false, true, "fault TLDeviceLockMonitor: Device lock state changed to unexpected"},
   };
-  const std::vector<Row> rows{
-      {1, false, false,
-       "default TLDeviceLockMonitor: Device locked with state: 1, unlockedSinceBoot: 0, "
-       "protectedDataAvailable 0"},
-      {3, true, true,
-       "default TLDeviceLockMonitor: Device unlocked with state: 3, unlockedSinceBoot: 1, "
-       "protectedDataAvailable 1"},
-      {2, false, true,
-       "default TLDeviceLockMonitor: Device locking with state: 2, unlockedSinceBoot: 1, "
-       "protectedDataAvailable 0"},
-      {0, true, true,
-       "default TLDeviceLockMonitor: Device unlocked with state: 0, unlockedSinceBoot: 1, "
-       "protectedDataAvailable 1"},
-      {4, false, true,
-       "fault TLDeviceLockMonitor: Device lock state changed to unexpected state: 4, "
-       "unlockedSinceBoot: 1, protectedDataAvailable 0"}};
   FakeVault vault;
   vault.unlocked = 0;
   vault.state = 9;
@@ -81,11 +71,13 @@ TEST(LockMonitor, FollowsTheStates) {
     EXPECT_TRUE(
         log.has("default TLDeviceLockMonitor: lockState: 9, unlockedSinceBoot: 0, "
                 "protectedDataAvailable: 0"));
-    for (const Row& row : rows) {
+    for (const auto& row : rows) {
       vault.change(row.state);
       EXPECT_EQ(monitor.protectedDataAvailable(), row.available) << row.state;
       EXPECT_EQ(monitor.deviceUnlockedSinceBoot(), row.unlocked) << row.state;
-      EXPECT_TRUE(log.has(row.line)) << row.line;
+      EXPECT_TRUE(
+          log.has(fmt::format("{} state: {}, unlockedSinceBoot: {:d}, protectedDataAvailable {:d}",
+                              row.line, row.state, row.unlocked, row.available)));
     }
   }
   EXPECT_EQ(vault.cancelled, 7);
@@ -122,47 +114,35 @@ TEST(LockMonitor, WorksWithoutNotifications) {
   EXPECT_EQ(vault.cancelled, 0);
 }
 
-TEST(FileDeviceVault, ReadsItsFileAndSeesChanges) {
+TEST(FileDeviceVault, ReadsItsFileAndSeesChangesAlsoInANewDirectory) {
   const testsupport::TemporaryDirectory directory;
-  const std::string path = directory / "lock_status";
+  const std::string runtime = directory / "run";
+  const std::string path = runtime + "/lock_status";
+  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
   const auto vault = platform::makeFileDeviceVault(path);
   EXPECT_EQ(vault->DVLGetDeviceLockState(0), 0u);
   EXPECT_EQ(vault->DVLDeviceUnlockedSinceBoot(), 1);
+  std::atomic<uint32_t> awaited{2};
+  std::binary_semaphore seen{0};
   platform::SerialQueue queue("vault");
-  std::promise<void> changed;
   int32_t token = -1;
-  ASSERT_EQ(vault->registerNotification(
-                "n", queue, [&] { changed.set_value(); }, &token),
-            0u);
+  const auto handler = [&] {
+    uint32_t state = vault->DVLGetDeviceLockState(0);
+    if (awaited.compare_exchange_strong(state, 9)) seen.release();
+  };
+  ASSERT_EQ(vault->registerNotification("n", queue, handler, &token), 0u);
   EXPECT_NE(token, -1);
   ASSERT_TRUE(platform::writeFileAtomically(path, "2 1\n", nullptr));
-  changed.get_future().wait();
-  EXPECT_EQ(vault->DVLGetDeviceLockState(0), 2u);
+  seen.acquire();
+  awaited = 1;
+  std::filesystem::rename(runtime, directory / "old");
+  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
+  ASSERT_TRUE(platform::writeFileAtomically(path, "1 1\n", nullptr));
+  seen.acquire();
   vault->cancel(token);
   for (const char* garbled : {"", "x", "1", "1 2", "-1 1", "0 1 1", "99999999999 1"}) {
     ASSERT_TRUE(platform::writeFileAtomically(path, garbled, nullptr));
     EXPECT_EQ(vault->DVLGetDeviceLockState(0), 1u) << garbled;
     EXPECT_EQ(vault->DVLDeviceUnlockedSinceBoot(), 0) << garbled;
   }
-}
-
-TEST(FileDeviceVault, SeesChangesAfterItsDirectoryWasReplaced) {
-  const testsupport::TemporaryDirectory directory;
-  const std::string runtime = directory / "run";
-  const std::string path = runtime + "/lock_status";
-  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
-  const auto vault = platform::makeFileDeviceVault(path);
-  std::promise<void> locked;
-  std::once_flag once;
-  platform::SerialQueue queue("vault");
-  int32_t token = -1;
-  const auto handler = [&] {
-    if (vault->DVLGetDeviceLockState(0) == 1) std::call_once(once, [&] { locked.set_value(); });
-  };
-  ASSERT_EQ(vault->registerNotification("n", queue, handler, &token), 0u);
-  std::filesystem::rename(runtime, directory / "old");
-  ASSERT_TRUE(platform::createDirectories(runtime, nullptr));
-  ASSERT_TRUE(platform::writeFileAtomically(path, "1 1\n", nullptr));
-  locked.get_future().wait();
-  vault->cancel(token);
 }

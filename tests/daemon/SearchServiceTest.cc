@@ -1,8 +1,6 @@
 #include <gtest/gtest.h>
 
 #include "daemon/TALSearchService.h"
-#include "daemon/VerificationQuery.h"
-#include "parameters/TLParamsManager.h"
 #include "platform/Files.h"
 #include "platform/Signpost.h"
 #include "tests/support/LogCapture.h"
@@ -26,25 +24,6 @@ std::shared_ptr<TLQuery> textQuery(const TLString& text) {
   auto query = std::make_shared<TLQuery>();
   query->setRawQuery(text);
   query->setOriginalQuery(text);
-  return query;
-}
-
-// A query as a mail client sends it to check whether it has messages with these subjects.
-std::shared_ptr<TLQuery> verificationQuery(const std::vector<TLString>& subjects) {
-  auto query = std::make_shared<TLQuery>();
-  auto root = std::make_shared<TLQueryNode>();
-  root->setMergeOp(TLQueryNodeMergeOp::OR);
-  TLString raw = u"(";
-  for (const TLString& subject : subjects) {
-    auto leaf = std::make_shared<TLQueryNode>();
-    leaf->addKey(TLAttributeKey::SUBJECT);
-    leaf->setStringValue(subject);
-    root->addChild(leaf);
-    if (raw.size() > 1) raw += u" || ";
-    raw += u"kTLItemSubject = '" + subject + u"'";
-  }
-  query->setRoot(root);
-  query->setRawQuery(raw + u")");
   return query;
 }
 
@@ -118,30 +97,6 @@ TEST_F(SearchServiceTest, MaximumTruncatesAndANegativeOneDoesNot) {
   }
 }
 
-TEST_F(SearchServiceTest, LockStateDecidesWhichClassesAreAccessible) {
-  ASSERT_EQ(index({mail(u"a", u"x")}, "SysFileProtectionComplete"), std::nullopt);
-  lock.protectedDataAvailable = false;
-  const TLError unavailable = TALIndexerManager::indexerUnavailableError();
-  EXPECT_EQ(unavailable,
-            (TLError{"com.quill.tallow.TALIndexerManager", -2, "Indexer unavailable."}));
-  EXPECT_EQ(index({mail(u"b", u"x")}, "SysFileProtectionComplete"), unavailable);
-  EXPECT_TRUE(
-      log.has("error TALIndexerManager: Not providing an SysFileProtectionComplete indexer without "
-              "protected data available."));
-  EXPECT_EQ(index({mail(u"b", u"x")}, "other"), std::nullopt);
-  lock.unlockedSinceBoot = false;
-  EXPECT_EQ(search(textQuery(u"x"), 10, "other"), -1);
-  EXPECT_EQ(lastError, unavailable);
-  EXPECT_TRUE(
-      log.has("error TALIndexerManager: Not providing a requested other indexer prior to first "
-              "unlock."));
-  lock = {true, true};
-  EXPECT_EQ(search(textQuery(u"x"), 10, "other"), 1);
-  EXPECT_EQ(search(textQuery(u"x"), 10, "SysFileProtectionComplete"), 1);
-  EXPECT_TRUE(platform::fileExists(directory / "other/docstore/docstore.db"));
-  EXPECT_TRUE(platform::fileExists(directory / "SysFileProtectionComplete/salt/CURRENT"));
-}
-
 TEST_F(SearchServiceTest, AClassMustNameOneDirectory) {
   const std::vector<std::string> bad{
       "", ".", "..", "../x", "a/b", "/etc", std::string("a\0b", 3), std::string(256, 'c')};
@@ -177,44 +132,6 @@ TEST_F(SearchServiceTest, OnAFullDiskAnOpenClassWorksAndNoOtherIsOpened) {
   EXPECT_EQ(index({mail(u"a", u"x")}, "other"), std::nullopt);
 }
 
-TEST_F(SearchServiceTest, StatisticsStateVacuumAndReset) {
-  ASSERT_EQ(outcomeOf([&](auto reply) {
-              service.indexItems({mail(u"a", u"x")}, {}, "state", "client", "default", reply);
-            }),
-            std::nullopt);
-  std::optional<std::string> state;
-  service.fetchLastClientStateFromIndexerNamed(
-      "client", "default", [&](const auto& value, const auto&) { state = value; });
-  EXPECT_EQ(state, "state");
-  nlohmann::json stats;
-  service.fetchStatsForIndexerNamed("n", "default",
-                                    [&](const auto& value, const auto&) { stats = value; });
-  EXPECT_EQ(stats.at("TLDebugServiceDocStoreNumOfItems"), 1);
-  std::string metrics;
-  service.fetchStatsForSaltNamed("n", "default",
-                                 [&](const auto& value, const auto&) { metrics = *value; });
-  EXPECT_NE(metrics.find("SALT INDEX METRICS\n"), std::string::npos);
-  EXPECT_EQ(outcomeOf([&](auto reply) {
-              service.forceVacuumAndCompactForProtectionClass("default", reply);
-            }),
-            std::nullopt);
-  EXPECT_EQ(outcomeOf([&](auto reply) {
-              service.deleteItemsWithIdentifiers({u"a"}, "n", "default", reply);
-            }),
-            std::nullopt);
-  EXPECT_EQ(outcomeOf([&](auto reply) {
-              service.deleteItemsWithDomainIdentifiers({u"d"}, "n", "default", reply);
-            }),
-            std::nullopt);
-  EXPECT_EQ(
-      outcomeOf([&](auto reply) { service.deleteAllItemsFromIndexerNamed("n", "default", reply); }),
-      std::nullopt);
-  std::string answer;
-  service.ping("hello", [&](const std::string& text) { answer = text; });
-  EXPECT_EQ(answer.substr(0, 20), "Received hello\nCmd: ");
-  EXPECT_NE(answer.find("Persistent path: " + directory.path() + "\n"), std::string::npos);
-}
-
 TEST_F(SearchServiceTest, AfterShutdownNoReplyIsCalled) {
   service.shutdown();
   EXPECT_EQ(search(textQuery(u"x")), -2);
@@ -232,68 +149,4 @@ TEST_F(SearchServiceTest, EndSignpostHasTheCount) {
   ASSERT_GE(events.size(), 2u);
   EXPECT_EQ(events.front(), "SearchQuery:query secret");
   EXPECT_EQ(events.back(), "SearchQuery:query \"se...\"<6 chars> found 1 items");
-}
-
-TEST(VerificationQuery, IsRecognisedByItsShape) {
-  EXPECT_FALSE(isMailVerificationQuery(nullptr));
-  const std::vector<TLString> five{u"a", u"b", u"c", u"d", u"e"};
-  const TLQuery query;
-  EXPECT_FALSE(isMailVerificationQuery(&query));
-  const auto good = verificationQuery(five);
-  EXPECT_TRUE(isMailVerificationQuery(good.get()));
-  const auto four = verificationQuery({u"a", u"b", u"c", u"d"});
-  EXPECT_FALSE(isMailVerificationQuery(four.get()));
-  using Change = std::function<void(TLQueryNode&)>;
-  const std::vector<Change> changes{
-      [](TLQueryNode& root) { root.setMergeOp(TLQueryNodeMergeOp::AND); },
-      [](TLQueryNode& root) { root.childAtIndex(4)->addKey(TLAttributeKey::SUBJECT); },
-      [](TLQueryNode& root) { root.childAtIndex(3)->clearKeys(); },
-      [](TLQueryNode& root) { root.childAtIndex(2)->setOp(TLQueryNodeOp::STRING_NOT_EQUAL); },
-      [](TLQueryNode& root) { root.childAtIndex(0)->setMergeOp(TLQueryNodeMergeOp::OR); }};
-  for (const Change& change : changes) {
-    const auto changed = verificationQuery(five);
-    change(*changed->root());
-    EXPECT_FALSE(isMailVerificationQuery(changed.get()));
-  }
-}
-
-TEST(VerificationQuery, SubjectsComeFromTheText) {
-  using Strings = std::vector<TLString>;
-  const std::vector<std::pair<TLString, Strings>> cases{
-      {u"", {}},
-      {u"(kTLItemSubject = 'one' || kTLItemSubject = 'two')", {u"one", u"two"}},
-      {u"kTLItemSubject = 'a\\'b' || kTLItemSubject = '\\\"q\\\" \\*'", {u"a'b", u"\"q\" *"}},
-      {u"kTLItemSubject = '\\\\\\'x'", {u"\\'x"}},
-      // An escaped backslash before an apostrophe is unescaped twice.
-      {u"kTLItemSubject = 'a\\\\'b'", {u"a'b"}},
-      {u"kTLItemSubject = 'x' || other = 'y' || kTLItemSubject = ''", {u"x"}},
-      {u"((kTLItemSubject = '\u65e5\u672c'))", {u"\u65e5\u672c"}},
-  };
-  for (const auto& [raw, subjects] : cases) {
-    EXPECT_EQ(subjectsFromRawQuery(raw), subjects) << platform::toUTF8(raw);
-  }
-}
-
-TEST_F(SearchServiceTest, VerificationFindsExactSubjectsByBothPaths) {
-  std::vector<TLString> subjects;
-  Items items;
-  for (const char16_t* subject :
-       {u"Lunch", u"Lunch today", u"Re: Lunch", u"Invoice 7", u"Party", u"lunch"}) {
-    items.push_back(mail(u"id" + platform::fromUTF8(std::to_string(items.size())), subject));
-    if (items.size() < 6) subjects.push_back(subject);
-  }
-  ASSERT_EQ(index(items), std::nullopt);
-  EXPECT_EQ(search(verificationQuery(subjects), 1), 5);
-  EXPECT_TRUE(log.has("default TALSearchService: Verification Query Successful"));
-  EXPECT_TRUE(log.contains("Doc with No Subject Match: <\"lu...\"<5 chars>>"));
-  subjects[4] = u"Nobody wrote this";
-  EXPECT_EQ(search(verificationQuery(subjects)), 4);
-  EXPECT_TRUE(log.has("fault TALIndexer: Verification Query Failed"));
-  // A number of results that reaches the limit cannot be trusted.
-  subjects[4] = u"Party";
-  const auto limited = verificationQuery(subjects);
-  limited->setSearchParams(TLParamsManager::paramsFromString(u"salt.maxTopK=6"));
-  log.clear();
-  EXPECT_EQ(search(limited), 5);
-  EXPECT_TRUE(log.contains("(max_limit = 6), will use a slow linear search"));
 }

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <set>
 
 #include "daemon/TALSearchService.h"
@@ -30,6 +31,16 @@ TLString subjectNumber(size_t i) {
   return platform::fromUTF8(fmt::format(fmt::runtime(kForms[i % kForms.size()]), i));
 }
 
+// A query as a mail client sends it to check whether it has messages with these subjects.
+std::shared_ptr<TLQuery> queryFor(const std::vector<TLString>& subjects) {
+  std::string text;
+  for (const TLString& subject : subjects) {
+    text += text.empty() ? "(" : " || ";
+    text += "kTLItemSubject = '" + sq::escaped(platform::toUTF8(subject)) + "'";
+  }
+  return TLQueryAdditions::initWithBeaconQueryString(platform::fromUTF8(text + ")"), true);
+}
+
 class Verification : public testing::Test {
  protected:
   Verification()
@@ -50,14 +61,6 @@ class Verification : public testing::Test {
               std::nullopt);
   }
 
-  static std::shared_ptr<TLQuery> queryFor(const std::vector<TLString>& subjects) {
-    std::string text;
-    for (const TLString& subject : subjects) {
-      text += text.empty() ? "(" : " || ";
-      text += "kTLItemSubject = '" + sq::escaped(platform::toUTF8(subject)) + "'";
-    }
-    return TLQueryAdditions::initWithBeaconQueryString(platform::fromUTF8(text + ")"), true);
-  }
   Identifiers found(const TLQuery& query, const char16_t* parameters) {
     const auto copy = query.copyWithZone();
     copy->setSearchParams(TLParamsManager::paramsFromString(parameters));
@@ -114,18 +117,64 @@ TEST_F(Verification, AnySubjectsAreFoundExactlyByBothPaths) {
     EXPECT_EQ(found(*query, u"salt.maxTopK=1"), expected(subjects)) << count;
     EXPECT_EQ(log.count(kLinear), 1u) << count;
     EXPECT_EQ(log.count("Verification Query Successful"), 2u) << count;
+    EXPECT_EQ(log.contains("Doc with No Subject Match: <\"on...\"<21 chars>>"), count > 24)
+        << count;
   }
 }
 
 // A subject without words is in no index; one that no mail has is not found.
 TEST_F(Verification, TheLinearPathFindsWhatTheIndexCannot) {
-  for (const char16_t* const subject : {u"one", u"two", u"three", u"four", u"!!!", u"!!!"})
+  for (const char16_t* const subject :
+       {u"one", u"two", u"three", u"four", u"five", u"!!!", u"!!!"}) {
     add(subject);
+  }
   index();
   std::vector<TLString> subjects{u"one", u"two", u"three", u"four", u"!!!"};
   EXPECT_EQ(found(*queryFor(subjects), u"salt.maxTopK=100"), expected(subjects));
   EXPECT_EQ(log.count(kLinear), 1u);
+  // A number of results that reaches the limit cannot be trusted.
   subjects.back() = u"five";
+  EXPECT_EQ(found(*queryFor(subjects), u"salt.maxTopK=5"), expected(subjects));
+  EXPECT_TRUE(log.contains("(max_limit = 5)"));
+  subjects.back() = u"six";
   EXPECT_EQ(found(*queryFor(subjects), u"salt.maxTopK=100"), expected(subjects));
   EXPECT_TRUE(log.has("fault TALIndexer: Verification Query Failed"));
+}
+
+TEST(VerificationQuery, IsRecognisedByItsShape) {
+  EXPECT_FALSE(isMailVerificationQuery(nullptr));
+  const std::vector<TLString> five{u"a", u"b", u"c", u"d", u"e"};
+  const TLQuery query;
+  EXPECT_FALSE(isMailVerificationQuery(&query));
+  const auto good = queryFor(five);
+  EXPECT_TRUE(isMailVerificationQuery(good.get()));
+  const auto four = queryFor({u"a", u"b", u"c", u"d"});
+  EXPECT_FALSE(isMailVerificationQuery(four.get()));
+  using Change = std::function<void(TLQueryNode&)>;
+  const std::vector<Change> changes{
+      [](TLQueryNode& root) { root.setMergeOp(TLQueryNodeMergeOp::AND); },
+      [](TLQueryNode& root) { root.childAtIndex(4)->addKey(TLAttributeKey::SUBJECT); },
+      [](TLQueryNode& root) { root.childAtIndex(3)->clearKeys(); },
+      [](TLQueryNode& root) { root.childAtIndex(2)->setOp(TLQueryNodeOp::STRING_NOT_EQUAL); },
+      [](TLQueryNode& root) { root.childAtIndex(0)->setMergeOp(TLQueryNodeMergeOp::OR); }};
+  for (const Change& change : changes) {
+    const auto changed = queryFor(five);
+    change(*changed->root());
+    EXPECT_FALSE(isMailVerificationQuery(changed.get()));
+  }
+}
+
+TEST(VerificationQuery, SubjectsComeFromTheText) {
+  using Strings = std::vector<TLString>;
+  const std::vector<std::pair<TLString, Strings>> cases{
+      {u"", {}},
+      {u"kTLItemSubject = 'a\\'b' || kTLItemSubject = '\\\"q\\\" \\*'", {u"a'b", u"\"q\" *"}},
+      {u"kTLItemSubject = '\\\\\\'x'", {u"\\'x"}},
+      // An escaped backslash before an apostrophe is unescaped twice.
+      {u"kTLItemSubject = 'a\\\\'b'", {u"a'b"}},
+      {u"kTLItemSubject = 'x' || other = 'y' || kTLItemSubject = ''", {u"x"}},
+  };
+  for (const auto& [raw, subjects] : cases) {
+    EXPECT_EQ(subjectsFromRawQuery(raw), subjects) << platform::toUTF8(raw);
+  }
 }

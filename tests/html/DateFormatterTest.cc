@@ -8,51 +8,51 @@ using Seconds = std::optional<double>;
 
 namespace {
 
-// The index of the first formatter that reads the text, and the date; -1 for none.
+struct Case {
+  TLStringView text;
+  std::pair<int, double> result;  // the index of the first formatter that reads it, and the date
+};
+
+constexpr std::pair<int, double> kUnread{-1, 0};
+
 std::pair<int, double> firstThatReads(const std::vector<Factory::Formatter>& formatters,
                                       TLStringView text) {
   for (size_t i = 0; i < formatters.size(); ++i) {
     if (const auto date = formatters[i]->dateFromString(text)) return {static_cast<int>(i), *date};
   }
-  return {-1, 0};
+  return kUnread;
+}
+
+void expectReads(const std::vector<Factory::Formatter>& formatters,
+                 std::initializer_list<Case> cases) {
+  for (const Case& each : cases) {
+    EXPECT_EQ(firstThatReads(formatters, each.text), each.result) << platform::toUTF8(each.text);
+  }
 }
 
 }  // namespace
 
 TEST(DateFormatter, ListsTryZonesFirst) {
-  const struct {
-    TLStringView text;
-    std::pair<int, double> result;
-  } cases[] = {
-      {u"2024-3-5T10:20:30+02:00", {0, 1709626830}},
-      {u"2024-03-05T10:20:30Z", {0, 1709634030}},
-      {u"2024-03-05T10:20:30", {1, 1709634030}},
-      {u"2024-03-05T10:20:30.25-01:00", {2, 1709637630.25}},
-      {u"2024-3-5T10:20:30.5", {3, 1709634030.5}},
-      {u"2024-03-05", {-1, 0}},
-      {u"2024-03-05T10:20:30 and more", {-1, 0}},
-      {u"soon", {-1, 0}},
-      {u"", {-1, 0}},
-  };
-  const auto formatters = Factory::newDateTimeFormatters();
-  ASSERT_EQ(formatters.size(), 4u);
-  for (const auto& each : cases) {
-    EXPECT_EQ(firstThatReads(formatters, each.text), each.result) << platform::toUTF8(each.text);
-  }
-  EXPECT_EQ(firstThatReads(formatters, TLString(300, u'1')).first, -1);
-}
-
-TEST(DateFormatter, DatesAndTimes) {
-  const auto dates = Factory::newDateFormatters();
-  ASSERT_EQ(dates.size(), 2u);
-  EXPECT_EQ(firstThatReads(dates, u"2024-3-5+02:00"), (std::pair<int, double>{0, 1709589600}));
-  EXPECT_EQ(firstThatReads(dates, u"2024-3-5"), (std::pair<int, double>{1, 1709596800}));
-  const auto times = Factory::newTimeFormatters();
-  ASSERT_EQ(times.size(), 4u);
-  EXPECT_EQ(firstThatReads(times, u"01:00:00+01:00"), (std::pair<int, double>{0, 0}));
-  EXPECT_EQ(firstThatReads(times, u"01:00:01"), (std::pair<int, double>{1, 3601}));
-  EXPECT_EQ(firstThatReads(times, u"01:00:01.5Z"), (std::pair<int, double>{2, 3601.5}));
-  EXPECT_EQ(firstThatReads(times, u"01:00:01.5"), (std::pair<int, double>{3, 3601.5}));
+  const TLString digits(300, u'1');
+  expectReads(Factory::newDateTimeFormatters(),
+              {{u"2024-3-5T10:20:30+02:00", {0, 1709626830}},
+               {u"2024-03-05T10:20:30Z", {0, 1709634030}},
+               {u"2024-03-05T10:20:30", {1, 1709634030}},
+               {u"2024-03-05T10:20:30.25-01:00", {2, 1709637630.25}},
+               {u"2024-3-5T10:20:30.5", {3, 1709634030.5}},
+               {u"2024-03-05", kUnread},
+               {u"2024-03-05T10:20:30 and more", kUnread},
+               {u"soon", kUnread},
+               {u"", kUnread},
+               {digits, kUnread}});
+  expectReads(Factory::newDateFormatters(), {{u"2024-3-5+02:00", {0, 1709589600}},
+                                             {u"2024-3-5", {1, 1709596800}},
+                                             {u"01:00:01", kUnread}});
+  expectReads(Factory::newTimeFormatters(), {{u"01:00:00+01:00", {0, 0}},
+                                             {u"01:00:01", {1, 3601}},
+                                             {u"01:00:01.5Z", {2, 3601.5}},
+                                             {u"01:00:01.5", {3, 3601.5}},
+                                             {u"2024-3-5", kUnread}});
 }
 
 TEST(DateFormatter, SingleFormattersAreStrictAndWriteTheirPattern) {

@@ -262,8 +262,7 @@ TEST_F(PurgeTest, TheDaemonRemovesTheRemainsOfAKilledPurge) {
   const auto [refused, reason] = client("");
   EXPECT_EQ(refused, 3);
   EXPECT_THAT(reason, HasSubstr("systemctl --user stop 'tallowsearchd*'"));
-  daemon.signal(SIGTERM);
-  EXPECT_EQ(daemon.wait(), 0);
+  EXPECT_EQ(daemon.stop(), 0);
   const auto [estimated, estimate] = client("--dry-run --format=json");
   EXPECT_EQ(estimated, 0) << estimate;
   EXPECT_THAT(estimate, HasSubstr("\"documents\": 0,"));

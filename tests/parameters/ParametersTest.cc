@@ -1,3 +1,5 @@
+#include <fmt/format.h>
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <fstream>
@@ -16,23 +18,25 @@ using Manager = TLParamsManager;
 
 namespace {
 
-TLParameters& add(TLParameters& params, std::shared_ptr<TLParamKeyValue> keyValue) {
-  params.addKeyvalue(std::move(keyValue));
-  return params;
+// "KEY TYPE VALUE, KEY TYPE VALUE"; empty without a set.
+std::string valuesOf(const TLParameters* params) {
+  std::vector<std::string> texts;
+  for (size_t i = 0; params != nullptr && i < params->keyvaluesCount(); ++i) {
+    auto record = params->keyvalueAtIndex(i)->dictionaryRepresentation();
+    const std::string key = record["key"];
+    record.erase("key");
+    texts.push_back(fmt::format("{} {} {}", key, record.begin().key(), record.begin()->dump()));
+  }
+  return fmt::format("{}", fmt::join(texts, ", "));
 }
 
 }  // namespace
 
 TEST(Parameters, TableOfDefaults) {
-  EXPECT_EQ(Manager::getDefaultParamDict().size(), 30U);
-  EXPECT_EQ(Manager::defaultParamsSet().size(), 30U);
   const auto params = Manager::paramsFromFallback();
-  EXPECT_EQ(params->keyvaluesCount(), 30U);
   EXPECT_EQ(params->intValueForKey("salt.maxTermResults"), 1232348160);
-  EXPECT_EQ(params->intValueForKey("salt.maxTopK"), 1000);
   EXPECT_EQ(params->intValueForKey("queryModification.sufficentRetrievalThreshold"), 0);
   EXPECT_EQ(params->floatValueForKey("salt.scoreThreshold"), 0.02F);
-  EXPECT_EQ(params->floatValueForKey("zoneScore.XFrom"), 0.2F);
   EXPECT_TRUE(params->boolValueForKey("queryModification.enableStemModification"));
   EXPECT_FALSE(params->boolValueForKey("queryModification.enableStemModificationFirstPass"));
   EXPECT_TRUE(Manager::isValidParamKey("zoneScore.Subject"));
@@ -42,120 +46,102 @@ TEST(Parameters, TableOfDefaults) {
 }
 
 TEST(Parameters, TypedReadsLogWhatFails) {
-  TLParameters empty;
-  TLParameters wrong;
-  add(wrong, Manager::tlParamKeyValueWithKeyIntValue(u"ranking.textScoreWeight", 1));
-  add(wrong, Manager::tlParamKeyValueWithKeyFloatValue(u"salt.maxTopK", 1));
-  add(wrong,
-      Manager::tlParamKeyValueWithKeyIntValue(u"queryModification.enableStemModification", 1));
+  const TLParameters empty;
+  const auto wrong = Manager::paramFromKeyValues(
+      {Manager::tlParamKeyValueWithKeyIntValue(u"ranking.textScoreWeight", 1),
+       Manager::tlParamKeyValueWithKeyFloatValue(u"salt.maxTopK", 1),
+       Manager::tlParamKeyValueWithKeyIntValue(u"queryModification.enableStemModification", 1)});
   const auto ignored = Manager::paramFromKeyValues(
       {Manager::tlParamKeyValueWithKeyFloatValue(u"zoneScore.Subject", 7)});
-  using Lines = std::vector<std::string>;
   LogCapture capture;
+  // The lines without their category, one below the other.
   const auto logged = [&] {
-    const Lines lines = capture.lines();
+    std::string text;
+    for (const std::string& line : capture.lines()) {
+      EXPECT_TRUE(line.starts_with("error TLParam"));
+      text += line.substr(line.find(": ") + 2) + "\n";
+    }
     capture.clear();
-    return lines;
+    return text;
   };
 
-  const Lines fallback{
-      "error TLParameters: Param: <zoneScore.Subject> not found in param. Using Fallback",
-      "error TLParameters: Using shared Fallback params to get value for Param: "
-      "<zoneScore.Subject>"};
+  const std::string fallback =
+      "Param: <zoneScore.Subject> not found in param. Using Fallback\n"
+      "Using shared Fallback params to get value for Param: <zoneScore.Subject>\n";
   EXPECT_EQ(empty.floatValueForKey("zoneScore.Subject"), 0.9F);
   EXPECT_EQ(logged(), fallback);
   EXPECT_EQ(empty.floatValueForKey("zoneScore.Subject", ignored), 0.9F);
   EXPECT_EQ(logged(), fallback);
 
   EXPECT_EQ(empty.intValueForKey("zoneScore.Subject"), 0);
-  EXPECT_EQ(logged(), Lines{"error TLParameters: Param: <zoneScore.Subject> is not expected to be "
-                            "of Integer type. Bad Access!"});
   EXPECT_FALSE(empty.boolValueForKey("nosuch"));
-  EXPECT_EQ(logged(), Lines{"error TLParameters: Param: <nosuch> is not expected to be of Bool "
-                            "type. Bad Access!"});
   EXPECT_EQ(empty.floatValueForKey("salt.maxTopK"), std::nullopt);
-  EXPECT_EQ(logged(), Lines{"error TLParameters: Param: <salt.maxTopK> is not expected to be of "
-                            "Float type. Bad Access!"});
   EXPECT_EQ(empty.stringValueForKey("salt.maxTopK"), std::nullopt);
-  EXPECT_EQ(logged(), Lines{"error TLParameters: Param: <salt.maxTopK> is not expected to be of "
-                            "String type. Bad Access!"});
-
-  EXPECT_EQ(wrong.floatValueForKey("ranking.textScoreWeight"), std::nullopt);
-  EXPECT_EQ(wrong.intValueForKey("salt.maxTopK"), 0);
-  EXPECT_FALSE(wrong.boolValueForKey("queryModification.enableStemModification"));
   EXPECT_EQ(logged(),
-            (Lines{"error TLParameters: FloatValue for param: ranking.textScoreWeight is Nil!",
-                   "error TLParameters: IntValue for param: salt.maxTopK is Nil!!",
-                   "error TLParameters: BoolValue for param: "
-                   "queryModification.enableStemModification is Nil!"}));
+            "Param: <zoneScore.Subject> is not expected to be of Integer type. Bad Access!\n"
+            "Param: <nosuch> is not expected to be of Bool type. Bad Access!\n"
+            "Param: <salt.maxTopK> is not expected to be of Float type. Bad Access!\n"
+            "Param: <salt.maxTopK> is not expected to be of String type. Bad Access!\n");
+
+  EXPECT_EQ(wrong->floatValueForKey("ranking.textScoreWeight"), std::nullopt);
+  EXPECT_EQ(wrong->intValueForKey("salt.maxTopK"), 0);
+  EXPECT_FALSE(wrong->boolValueForKey("queryModification.enableStemModification"));
+  EXPECT_EQ(logged(),
+            "FloatValue for param: ranking.textScoreWeight is Nil!\n"
+            "IntValue for param: salt.maxTopK is Nil!!\n"
+            "BoolValue for param: queryModification.enableStemModification is Nil!\n");
 
   EXPECT_EQ(empty.kvForKey("nosuch", nullptr), nullptr);
-  EXPECT_EQ(logged().back(), "error TLParameters: Param: <nosuch> not found in Fallback. Error!");
+  EXPECT_THAT(logged(), testing::EndsWith("Param: <nosuch> not found in Fallback. Error!\n"));
   EXPECT_EQ(Manager::tlParamKeyValueWithKeyBoolValue(std::nullopt, true), nullptr);
-  EXPECT_EQ(logged(), Lines{"error TLParamsManager: TLParamKeyValue can't be initialized with a "
-                            "nil key"});
+  EXPECT_EQ(logged(), "TLParamKeyValue can't be initialized with a nil key\n");
 }
 
 TEST(Parameters, OverrideText) {
   LogCapture capture;
-  struct Case {
-    TLString text;
-    std::optional<std::string> records;  // dictionary of the result
-    std::string log;
+  const std::string format = "Key Value format for override param ";
+  const std::string type = "invalid type for override Param = ";
+  const struct {
+    std::string text;
+    std::string values;  // of the result, each with its key and type; empty if there is none
+    std::string error;   // logged
+  } cases[] = {
+      {"salt.maxTopK=500,ranking.freshnessWeight=0.5",
+       "salt.maxTopK intValue 500, ranking.freshnessWeight floatValue 0.5", ""},
+      {"salt.maxTopK=-12abc", "salt.maxTopK intValue -12", ""},
+      {"salt.maxTopK=+7", "salt.maxTopK intValue 7", ""},
+      {"salt.maxTopK=99999999999", "salt.maxTopK intValue 2147483647", ""},
+      {"ranking.freshnessWeight=-.5e1x", "ranking.freshnessWeight floatValue -5.0", ""},
+      {"ranking.textScoreWeight=1e-50,ranking.freshnessWeight=-1e-400",
+       "ranking.textScoreWeight floatValue 0.0, ranking.freshnessWeight floatValue 0.0", ""},
+      {"queryModification.enableStemModification=NO",
+       "queryModification.enableStemModification boolValue false", ""},
+      {"salt.maxTopK=500,bad", "", format + "bad cannot be parsed"},
+      {"salt.maxTopK=1=2", "", format + "salt.maxTopK=1=2 cannot be parsed"},
+      {"", "", format + " cannot be parsed"},
+      {"nosuch=1,salt.maxTopK=500", "salt.maxTopK intValue 500",
+       "Override Param key: nosuch is not valid"},
+      // An invalid value gives the default one.
+      {"salt.maxTopK=x", "salt.maxTopK intValue 1000",
+       type + "salt.maxTopK=x (Integer expected) [Using Default Value]"},
+      {"salt.maxTopK=+-7", "salt.maxTopK intValue 1000",
+       type + "salt.maxTopK=+-7 (Integer expected) [Using Default Value]"},
+      {"ranking.textScoreWeight=inf", "ranking.textScoreWeight floatValue 1.0",
+       type + "ranking.textScoreWeight=inf (Float expected) [Using Default Value]"},
+      {"ranking.textScoreWeight=1e50", "ranking.textScoreWeight floatValue 1.0",
+       type + "ranking.textScoreWeight=1e50 (Float expected) [Using Default Value]"},
+      {"queryModification.enableStemModification=yes",
+       "queryModification.enableStemModification boolValue true",
+       type + "queryModification.enableStemModification=yes (BOOL expected) [Using Default Value]"},
   };
-  const Case cases[] = {
-      {u"salt.maxTopK=500,ranking.freshnessWeight=0.5",
-       R"([{"intValue":500,"key":"salt.maxTopK"},)"
-       R"({"floatValue":0.5,"key":"ranking.freshnessWeight"}])",
-       ""},
-      {u"salt.maxTopK=-12abc", R"([{"intValue":-12,"key":"salt.maxTopK"}])", ""},
-      {u"salt.maxTopK=+7", R"([{"intValue":7,"key":"salt.maxTopK"}])", ""},
-      {u"salt.maxTopK=99999999999", R"([{"intValue":2147483647,"key":"salt.maxTopK"}])", ""},
-      {u"ranking.freshnessWeight=-.5e1x",
-       R"([{"floatValue":-5.0,"key":"ranking.freshnessWeight"}])", ""},
-      {u"queryModification.enableStemModification=NO",
-       R"([{"boolValue":false,"key":"queryModification.enableStemModification"}])", ""},
-      {u"salt.maxTopK=500,bad", std::nullopt,
-       "error TLParamsManager: Key Value format for override param bad cannot be parsed"},
-      {u"salt.maxTopK=1=2", std::nullopt,
-       "error TLParamsManager: Key Value format for override param salt.maxTopK=1=2 cannot be "
-       "parsed"},
-      {u"", std::nullopt,
-       "error TLParamsManager: Key Value format for override param  cannot be parsed"},
-      {u"nosuch=1,salt.maxTopK=500", R"([{"intValue":500,"key":"salt.maxTopK"}])",
-       "error TLParamsManager: Override Param key: nosuch is not valid"},
-      {u"salt.maxTopK=x", R"([{"intValue":1000,"key":"salt.maxTopK"}])",
-       "error TLParamsManager: invalid type for override Param = salt.maxTopK=x (Integer expected) "
-       "[Using Default Value]"},
-      {u"salt.maxTopK=+-7", R"([{"intValue":1000,"key":"salt.maxTopK"}])",
-       "error TLParamsManager: invalid type for override Param = salt.maxTopK=+-7 (Integer "
-       "expected) [Using Default Value]"},
-      {u"ranking.textScoreWeight=inf", R"([{"floatValue":1.0,"key":"ranking.textScoreWeight"}])",
-       "error TLParamsManager: invalid type for override Param = ranking.textScoreWeight=inf "
-       "(Float expected) [Using Default Value]"},
-      {u"ranking.textScoreWeight=1e-50,ranking.freshnessWeight=-1e-400",
-       R"([{"floatValue":0.0,"key":"ranking.textScoreWeight"},)"
-       R"({"floatValue":0.0,"key":"ranking.freshnessWeight"}])",
-       ""},
-      {u"ranking.textScoreWeight=1e50", R"([{"floatValue":1.0,"key":"ranking.textScoreWeight"}])",
-       "error TLParamsManager: invalid type for override Param = ranking.textScoreWeight=1e50 "
-       "(Float expected) [Using Default Value]"},
-      {u"queryModification.enableStemModification=yes",
-       R"([{"boolValue":true,"key":"queryModification.enableStemModification"}])",
-       "error TLParamsManager: invalid type for override Param = "
-       "queryModification.enableStemModification=yes (BOOL expected) [Using Default Value]"},
-  };
-  for (const Case& one : cases) {
+  for (const auto& one : cases) {
     capture.clear();
-    const auto params = Manager::paramsFromString(one.text);
-    const std::string name = platform::toUTF8(one.text);
-    ASSERT_EQ(params != nullptr, one.records.has_value()) << name;
-    if (params) {
-      EXPECT_EQ(params->dictionaryRepresentation()["keyvalue"].dump(), *one.records) << name;
-    }
-    EXPECT_EQ(capture.lines(),
-              one.log.empty() ? std::vector<std::string>() : std::vector<std::string>{one.log})
-        << name;
+    const auto params = Manager::paramsFromString(platform::fromUTF8(one.text));
+    EXPECT_EQ(params == nullptr, one.values.empty()) << one.text;
+    EXPECT_EQ(valuesOf(params.get()), one.values) << one.text;
+    std::vector<std::string> lines;
+    if (!one.error.empty()) lines.push_back("error TLParamsManager: " + one.error);
+    EXPECT_EQ(capture.lines(), lines) << one.text;
   }
 }
 

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <mutex>
 #include <vector>
 
@@ -22,13 +23,9 @@ class LatestWorkerTest : public testing::Test {
     ++woken;
     changed.notify_all();
   }
-  void awaitStart() {
+  void await(const std::function<bool()>& holds) {
     std::unique_lock lock(mutex);
-    changed.wait(lock, [this] { return !started.empty(); });
-  }
-  void awaitResult(int number) {
-    std::unique_lock lock(mutex);
-    changed.wait(lock, [&] { return woken == number; });
+    changed.wait(lock, holds);
   }
   void letGo() {
     const std::lock_guard lock(mutex);
@@ -51,11 +48,11 @@ class LatestWorkerTest : public testing::Test {
 TEST_F(LatestWorkerTest, OnlyTheLastJobHasAResult) {
   EXPECT_EQ(worker.take(), std::nullopt);
   worker.submit(1);
-  awaitStart();
+  await([this] { return !started.empty(); });
   worker.submit(2);  // stops the first job and may begin
   worker.submit(3);
   letGo();
-  awaitResult(1);
+  await([this] { return woken == 1; });
   EXPECT_EQ(worker.take(), 6);
   EXPECT_EQ(worker.take(), std::nullopt);
   EXPECT_EQ(started.back(), 3);
@@ -64,15 +61,15 @@ TEST_F(LatestWorkerTest, OnlyTheLastJobHasAResult) {
 // The worker is destroyed although the job was never allowed to finish.
 TEST_F(LatestWorkerTest, DestructorStopsTheCurrentJob) {
   worker.submit(1);
-  awaitStart();
+  await([this] { return !started.empty(); });
 }
 
 TEST_F(LatestWorkerTest, ANewJobDropsTheResultOfTheLast) {
   letGo();
   worker.submit(1);
-  awaitResult(1);
+  await([this] { return woken == 1; });
   worker.submit(2);
-  awaitResult(2);
+  await([this] { return woken == 2; });
   EXPECT_EQ(worker.take(), 4);
   EXPECT_EQ(worker.take(), std::nullopt);
 }

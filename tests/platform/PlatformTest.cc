@@ -121,18 +121,6 @@ TEST(Paths, AUserOtherThanRootHasTheirOwnDirectories) {
   ASSERT_EQ(seteuid(user), 0);
 }
 
-TEST(Queue, RunsInOrderAndDrainsAtTheEnd) {
-  std::vector<int> order;
-  {
-    platform::SerialQueue queue("com.quill.tallow.test");
-    for (int i = 0; i < 100; ++i) EXPECT_TRUE(queue.async([&order, i] { order.push_back(i); }));
-    queue.sync([&order] { EXPECT_EQ(order.size(), 100u); });
-    EXPECT_TRUE(queue.async([&order] { order.push_back(100); }));
-  }
-  ASSERT_EQ(order.size(), 101u);
-  for (int i = 0; i <= 100; ++i) EXPECT_EQ(order[static_cast<size_t>(i)], i);
-}
-
 // A thread that ends as soon as it is idle, so that items arrive in each of its states.
 TEST(Queue, LosesNothingWhenThreadsComeAndGo) {
   constexpr int kThreads = 4;
@@ -161,6 +149,15 @@ TEST(Queue, LosesNothingWhenThreadsComeAndGo) {
     }
   }
   EXPECT_EQ(count, kThreads * kItems);
+}
+
+TEST(Queue, RunsWhatIsPendingAtTheEnd) {
+  int ran = 0;
+  {
+    platform::SerialQueue queue("queue");
+    for (int i = 0; i < 1000; ++i) EXPECT_TRUE(queue.async([&ran] { ++ran; }));
+  }
+  EXPECT_EQ(ran, 1000);
 }
 
 TEST(Queue, RunsSynchronousItemsOnTheCallersThread) {

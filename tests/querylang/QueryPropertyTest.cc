@@ -3,7 +3,6 @@
 
 #include <algorithm>
 #include <cstring>
-#include <map>
 #include <random>
 
 #include "querylang/TLQueryAdditions.h"
@@ -31,15 +30,6 @@ class Generator {
     return connective(any(left), any(leaves - left));
   }
 
-  // Trees without free text. Every connective has a comparison directly below it, because one over
-  // nothing but neutral constants disappears even where it would decide its parent.
-  sq::Tree conditions(size_t leaves) {
-    if (leaves <= 1) return condition();
-    sq::Tree rest = leaves == 2 && chance(30) ? constant() : conditions(leaves - 1);
-    return chance(50) ? connective(condition(), std::move(rest))
-                      : connective(std::move(rest), condition());
-  }
-
   // Words in many attributes, times, constants and conditions.
   sq::Tree mixed(size_t leaves) {
     if (leaves >= 5 && chance(30)) return disjunction(4 + below(4));
@@ -62,9 +52,6 @@ class Generator {
  private:
   static constexpr const char* kAll[] = {
       "kTLItemSubject", "kTLItemAuthors", "com_quill_mail_read", "*", "**", "kTLItemMailboxes"};
-  static constexpr const char* kConditions[] = {"kTLItemSubject", "kTLItemAuthors",
-                                                "com_quill_mail_read"};
-
   template <size_t n>
   std::string oneOf(const char* const (&list)[n]) {
     return list[below(n)];
@@ -105,13 +92,6 @@ class Generator {
     return join(op, std::make_unique<sq::node>(sq::kTokenString, std::move(attribute)),
                 std::move(right));
   }
-  sq::Tree condition() {
-    if (!chance(20)) return comparison(oneOf(kConditions), chance(50) ? "1" : "x");
-    auto time = std::make_unique<sq::node>(sq::kTokenTimeAbsolute, chance(50) ? "5" : "10");
-    return join(static_cast<int32_t>(sq::kTokenGreater + below(4)),
-                std::make_unique<sq::node>(sq::kTokenString, "com_quill_mail_dateReceived"),
-                std::move(time));
-  }
   // Usually one word in many attributes.
   sq::Tree disjunction(size_t leaves) {
     const std::string text = smallText();
@@ -138,69 +118,6 @@ TLString textOf(const sq::Tree& tree) {
   return platform::fromUTF8(sq::expressionText(*tree));
 }
 
-// The attribute values of one mail: READ as text, its date in seconds.
-struct Mail {
-  std::map<int32_t, TLString> texts;
-  double date;
-};
-
-// Evaluates the conditions. Removes the wildcards that the optimiser would remove, unless the tree
-// has already been optimised.
-bool satisfies(const Mail& mail, const TLQueryNode& node, bool optimized) {
-  const auto below = [&](const Node& child) { return satisfies(mail, *child, optimized); };
-  if (node.mergeOp() == Merge::AND) {
-    return std::all_of(node.childs().begin(), node.childs().end(), below);
-  }
-  if (node.mergeOp() == Merge::OR) {
-    return std::any_of(node.childs().begin(), node.childs().end(), below);
-  }
-  const auto equals = [&] {
-    const TLString& value = *node.stringValue();
-    return mail.texts.at(node.keyAtIndex(0)) ==
-           (optimized ? value : Additions::removeWildCard(value));
-  };
-  switch (node.op()) {
-    case Op::BOOL_CONSTANT:
-      return node.boolValue();
-    case Op::STRING_EQUAL:
-      return equals();
-    case Op::STRING_NOT_EQUAL:
-      return !equals();
-    case Op::INT_EQUAL:
-      return mail.texts.at(node.keyAtIndex(0)) ==
-             platform::fromUTF8(std::to_string(node.intValue()));
-    case Op::FLOAT_GREATER:
-      return mail.date > node.doubleValue();
-    case Op::FLOAT_LESS:
-      return mail.date < node.doubleValue();
-    case Op::FLOAT_GREATER_EQUAL:
-      return mail.date >= node.doubleValue();
-    case Op::FLOAT_LESS_EQUAL:
-      return mail.date <= node.doubleValue();
-    default:
-      ADD_FAILURE() << "no such op";
-      return false;
-  }
-}
-
-// Every mail that the generated conditions can distinguish.
-std::vector<Mail> corpus() {
-  std::vector<Mail> mails;
-  for (const char16_t* const subject : {u"1", u"x", u"y"}) {
-    for (const char16_t* const author : {u"1", u"x", u"y"}) {
-      for (const char16_t* const read : {u"1", u"x", u"y"}) {
-        for (const double date : {0., 5., 7., 10., 11.}) {
-          mails.push_back({{{static_cast<int32_t>(TLAttributeKey::SUBJECT), subject},
-                            {static_cast<int32_t>(TLAttributeKey::AUTHORS), author},
-                            {static_cast<int32_t>(TLAttributeKey::READ), read}},
-                           date});
-        }
-      }
-    }
-  }
-  return mails;
-}
-
 bool isOneWordInManyAttributes(const TLQueryNode& node) {
   const auto leaves = [](const auto& child) { return child->mergeOp() == Merge::LEAF; };
   if (node.mergeOp() != Merge::OR || node.childsCount() < 5 || !leaves(node.childAtIndex(0)) ||
@@ -215,10 +132,9 @@ bool isOneWordInManyAttributes(const TLQueryNode& node) {
   return texts.front() == texts.back();
 }
 
-bool holdsFreeText(const TLQueryNode& node) {
-  return isOneWordInManyAttributes(node) ||
-         std::any_of(node.childs().begin(), node.childs().end(),
-                     [](const Node& child) { return holdsFreeText(*child); });
+std::string leafOnPaper(const TLQueryNode& leaf, const std::string& text) {
+  return fmt::format("[{} {} '{}' {} {}]", TLQueryNode::keysAsString(leaf.keyAtIndex(0)),
+                     TLQueryNode::opAsString(leaf.op()), text, leaf.intValue(), leaf.doubleValue());
 }
 
 // Reference optimiser on texts: a tree is its text, nothing is the empty text, and constants are
@@ -240,9 +156,7 @@ std::string onPaper(const TLQueryNode& node, std::vector<std::string>& parts) {
       parts.push_back(text);
       return "";
     }
-    return fmt::format("[{} {} '{}' {} {}]", TLQueryNode::keysAsString(key),
-                       TLQueryNode::opAsString(node.op()), text, node.intValue(),
-                       node.doubleValue());
+    return leafOnPaper(node, text);
   }
   const bool isAnd = node.mergeOp() == Merge::AND;
   std::vector<std::string> rest;
@@ -260,10 +174,7 @@ std::string onPaper(const TLQueryNode& node, std::vector<std::string>& parts) {
 std::string paperOf(const TLQueryNode& node) {
   if (node.mergeOp() == Merge::LEAF) {
     if (node.op() == Op::BOOL_CONSTANT) return node.boolValue() ? "true" : "false";
-    return fmt::format("[{} {} '{}' {} {}]", TLQueryNode::keysAsString(node.keyAtIndex(0)),
-                       TLQueryNode::opAsString(node.op()),
-                       platform::toUTF8(platform::orEmpty(node.stringValue())), node.intValue(),
-                       node.doubleValue());
+    return leafOnPaper(node, platform::toUTF8(platform::orEmpty(node.stringValue())));
   }
   std::vector<std::string> childs;
   for (const Node& child : node.childs()) childs.push_back(paperOf(*child));
@@ -284,29 +195,6 @@ TEST(QueryProperties, ATreeWrittenAndReadIsTheSame) {
     ASSERT_TRUE(sq::parse(text.c_str(), again)) << text;
     ASSERT_TRUE(equal(tree.get(), again.get())) << text;
   }
-}
-
-TEST(QueryProperties, OptimisingKeepsWhichMailsSatisfyTheConditions) {
-  Generator generator(testsupport::firstSeed());
-  const std::vector<Mail> mails = corpus();
-  int compared = 0;
-  int changed = 0;
-  for (int i = 0; i < kRounds; ++i) {
-    const TLString text = textOf(generator.conditions(1 + generator.below(12)));
-    const Node before = Additions::_parse(text);
-    if (holdsFreeText(*before)) continue;
-    ++compared;
-    Additions::Parts parts;
-    const Node after = Additions::optimizeQuery(before->copyWithZone(), parts);
-    ASSERT_TRUE(parts.empty());
-    changed += after != nullptr && after->isEqual(*before) ? 0 : 1;
-    for (const Mail& mail : mails) {
-      ASSERT_EQ(after == nullptr || satisfies(mail, *after, true), satisfies(mail, *before, false))
-          << platform::toUTF8(text) << Additions::_stringifyQueryTree(after.get(), 0, true);
-    }
-  }
-  EXPECT_GT(compared, kRounds / 2);
-  EXPECT_GT(changed, compared / 2);
 }
 
 TEST(QueryProperties, OptimisingMatchesTheReferenceRules) {

@@ -4,9 +4,7 @@
 #include <poll.h>
 #include <sys/inotify.h>
 #include <sys/prctl.h>
-#include <sys/socket.h>
 #include <sys/syscall.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -19,6 +17,7 @@
 #include "platform/Assert.h"
 #include "platform/FileDescriptor.h"
 #include "platform/Files.h"
+#include "tests/support/RawMessages.h"
 
 namespace testsupport {
 
@@ -27,13 +26,11 @@ namespace {
 constexpr size_t kMaxFileBytes = size_t{256} << 20;
 constexpr int kFirstPassedSocket = 3;
 
-int listenAt(const std::string& path) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  path.copy(address.sun_path, sizeof address.sun_path - 1);
+int notifySocketAt(const std::string& path) {
+  const sockaddr_un address = addressOf(path);
   unlink(path.c_str());
   const int descriptor = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-  TL_ASSERT(bind(descriptor, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0);
+  TL_ASSERT(bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0);
   return descriptor;
 }
 
@@ -41,7 +38,7 @@ int listenAt(const std::string& path) {
 
 Process::Process(const std::vector<std::string>& arguments, Variables environment, std::string log,
                  const std::vector<int>& passedSockets)
-    : _log(std::move(log)), _notifyPath(_log + ".notify"), _notify(listenAt(_notifyPath)) {
+    : _log(std::move(log)), _notifyPath(_log + ".notify"), _notify(notifySocketAt(_notifyPath)) {
   environment.emplace("NOTIFY_SOCKET", _notifyPath);
   std::array<int, 2> output;
   TL_ASSERT(pipe2(output.data(), O_CLOEXEC) == 0);
@@ -65,7 +62,9 @@ void Process::run(const std::vector<std::string>& arguments, const Variables& en
     setenv("LISTEN_FDS", std::to_string(passedSockets.size()).c_str(), 1);
   }
   for (size_t i = 0; i < passedSockets.size(); ++i) {
-    dup2(passedSockets[i], kFirstPassedSocket + static_cast<int>(i));
+    const int passed = kFirstPassedSocket + static_cast<int>(i);
+    dup2(passedSockets[i], passed);
+    fcntl(passed, F_SETFD, 0);  // which dup2 leaves alone if it is the same descriptor
   }
   std::vector<char*> words;
   for (const std::string& argument : arguments)

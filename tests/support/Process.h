@@ -25,6 +25,8 @@ class Process {
   [[nodiscard]] bool awaitReady();
   // Waits for a line on the standard output, and returns it; empty if it ended first.
   [[nodiscard]] std::string readLine() const;
+  // Where its standard output can be read.
+  [[nodiscard]] int output() const { return _output; }
   [[nodiscard]] pid_t pid() const { return _pid; }
   void signal(int number) const;
   // Sends the signal, if given, and waits for the end. The exit status, or 128 plus the number of

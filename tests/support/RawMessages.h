@@ -11,20 +11,37 @@
 #include <string>
 #include <string_view>
 
-// Hand-made D-Bus messages, for peers that violate the protocol.
+#include "platform/FileDescriptor.h"
+
+// Sockets and hand-made D-Bus messages, for peers that violate the protocol.
 namespace testsupport {
 
-// A socket connected to `path`; negative if nobody accepts.
-inline int connectTo(const std::string& path) {
+inline sockaddr_un addressOf(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   path.copy(address.sun_path, sizeof address.sun_path - 1);
-  const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (connect(descriptor, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0) {
-    return descriptor;
+  return address;
+}
+
+// A socket connected to `path`; none if nobody accepts.
+inline platform::FileDescriptor connectTo(const std::string& path) {
+  const sockaddr_un address = addressOf(path);
+  platform::FileDescriptor one(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  if (connect(one.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    one.reset();
   }
-  close(descriptor);
-  return -1;
+  return one;
+}
+
+// A socket that listens at `path`; none if that fails.
+inline platform::FileDescriptor listenAt(const std::string& path) {
+  const sockaddr_un address = addressOf(path);
+  platform::FileDescriptor one(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  if (bind(one.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
+      listen(one.get(), 8) != 0) {
+    one.reset();
+  }
+  return one;
 }
 
 // The first lines of the handshake, without BEGIN.
@@ -59,6 +76,21 @@ inline bool sendAll(int descriptor, std::string_view bytes) {
 inline bool authenticate(int descriptor) {
   return sendAll(descriptor, authenticationLines()) && !receiveSome(descriptor).empty() &&
          sendAll(descriptor, "BEGIN\r\n");
+}
+
+// Sends a message over a new connection. What is received until it contains `end`, or until the
+// other side closes.
+inline std::string answerTo(const std::string& message, const std::string& path,
+                            std::string_view end = "") {
+  const platform::FileDescriptor socket = connectTo(path);
+  std::string answer;
+  if (!authenticate(socket.get()) || !sendAll(socket.get(), message)) return answer;
+  do {
+    const std::string more = receiveSome(socket.get());
+    if (more.empty()) break;
+    answer += more;
+  } while (answer.find(end) == std::string::npos);
+  return answer;
 }
 
 // The body of a message, little-endian, value by value.
@@ -115,9 +147,7 @@ inline std::string rawCall(std::string_view path, std::string_view interface,
                            std::string_view member, std::string_view signature,
                            const std::string& body) {
   const auto number = [](size_t value) {
-    std::string bytes;
-    for (size_t i = 0; i < 4; ++i) bytes += static_cast<char>(value >> (8 * i));
-    return bytes;
+    return RawBody().number32(static_cast<uint32_t>(value)).content();
   };
   std::string fields;
   const auto field = [&](char code, char type, std::string_view value) {

@@ -91,28 +91,19 @@ mode_t modeOf(int flags, va_list arguments) {
 
 }  // namespace
 
-#define TALLOW_OPEN(name)                                              \
-  extern "C" int name(const char* path, int flags, ...) {              \
-    static auto* const real = next<int(const char*, int, ...)>(#name); \
-    va_list arguments;                                                 \
-    va_start(arguments, flags);                                        \
-    const mode_t mode = modeOf(flags, arguments);                      \
-    va_end(arguments);                                                 \
-    return passes("openat") ? real(path, flags, mode) : -1;            \
+#define TALLOW_OPEN(name, parameters, directory)                               \
+  extern "C" int name parameters {                                             \
+    static auto* const real = next<int(int, const char*, int, ...)>("openat"); \
+    va_list arguments;                                                         \
+    va_start(arguments, flags);                                                \
+    const mode_t mode = modeOf(flags, arguments);                              \
+    va_end(arguments);                                                         \
+    return passes("openat") ? real(directory, path, flags, mode) : -1;         \
   }
-#define TALLOW_OPENAT(name)                                                 \
-  extern "C" int name(int directory, const char* path, int flags, ...) {    \
-    static auto* const real = next<int(int, const char*, int, ...)>(#name); \
-    va_list arguments;                                                      \
-    va_start(arguments, flags);                                             \
-    const mode_t mode = modeOf(flags, arguments);                           \
-    va_end(arguments);                                                      \
-    return passes("openat") ? real(directory, path, flags, mode) : -1;      \
-  }
-TALLOW_OPEN(open)
-TALLOW_OPEN(open64)
-TALLOW_OPENAT(openat)
-TALLOW_OPENAT(openat64)
+TALLOW_OPEN(open, (const char* path, int flags, ...), AT_FDCWD)
+TALLOW_OPEN(open64, (const char* path, int flags, ...), AT_FDCWD)
+TALLOW_OPEN(openat, (int directory, const char* path, int flags, ...), directory)
+TALLOW_OPEN(openat64, (int directory, const char* path, int flags, ...), directory)
 
 #define TALLOW_SIMPLE(result, name, call, parameters, arguments, failure) \
   extern "C" result name parameters {                                     \
@@ -132,20 +123,14 @@ TALLOW_SIMPLE(int, ftruncate64, "ftruncate", (int fd, off64_t size), (fd, size),
 TALLOW_SIMPLE(int, accept4, "accept4", (int fd, sockaddr* address, socklen_t* size, int flags),
               (fd, address, size, flags), -1)
 
-extern "C" ssize_t write(int fd, const void* bytes, size_t size) {
-  static auto* const real = next<ssize_t(int, const void*, size_t)>("write");
-  return !isFile(fd) || passes("write") ? real(fd, bytes, size) : -1;
-}
-
-extern "C" void* mmap(void* address, size_t size, int protection, int flags, int fd, off_t at) {
-  static auto* const real = next<void*(void*, size_t, int, int, int, off_t)>("mmap");
-  return fd < 0 || passes("mmap") ? real(address, size, protection, flags, fd, at) : MAP_FAILED;
-}
-
-extern "C" void* mmap64(void* address, size_t size, int protection, int flags, int fd, off64_t at) {
-  static auto* const real = next<void*(void*, size_t, int, int, int, off64_t)>("mmap64");
-  return fd < 0 || passes("mmap") ? real(address, size, protection, flags, fd, at) : MAP_FAILED;
-}
+TALLOW_SIMPLE(ssize_t, write, isFile(fd) ? "write" : "", (int fd, const void* bytes, size_t size),
+              (fd, bytes, size), -1)
+TALLOW_SIMPLE(void*, mmap, fd >= 0 ? "mmap" : "",
+              (void* address, size_t size, int protection, int flags, int fd, off_t at),
+              (address, size, protection, flags, fd, at), MAP_FAILED)
+TALLOW_SIMPLE(void*, mmap64, fd >= 0 ? "mmap" : "",
+              (void* address, size_t size, int protection, int flags, int fd, off64_t at),
+              (address, size, protection, flags, fd, at), MAP_FAILED)
 
 extern "C" int pthread_create(pthread_t* thread, const pthread_attr_t* attributes,
                               void* (*body)(void*), void* argument) {

@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <functional>
 #include <latch>
+#include <map>
 #include <optional>
 #include <random>
 #include <stop_token>
@@ -21,6 +22,7 @@
 #include "platform/FileDescriptor.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
+#include "tests/support/DriverOptions.h"
 #include "tests/support/RawMessages.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -43,11 +45,11 @@ constexpr rlim_t kDescriptors = 512;    // of the daemon, which limits the numbe
 constexpr int kMessagesOfConnection = 16;
 
 struct Options {
-  bool flood = false;
-  int messages = 1000000;
-  int seconds = 30;
-  size_t maxMegabytes = SIZE_MAX;  // anonymous memory of the daemon
-  uint32_t seed = std::random_device()();
+  std::string mode = "messages";
+  uint64_t messages = 1000000;
+  uint64_t seconds = 30;
+  uint64_t maxMegabytes = SIZE_MAX;  // anonymous memory of the daemon
+  uint64_t seed = std::random_device()();
 };
 
 // A well-behaved client. Each of its searches has a single correct result.
@@ -86,8 +88,8 @@ class GoodClient {
   void waitUntilBegun() const { _begun.wait(); }
 
   [[nodiscard]] std::string report() const {
-    return fmt::format("good_rounds={} answers {} batches {}", _rounds, percentiles(_answers),
-                       percentiles(_indexing));
+    return fmt::format("good_rounds={} answers {} batches {}", _rounds, text(_answers),
+                       text(_indexing));
   }
 
   std::string wrong;
@@ -102,12 +104,8 @@ class GoodClient {
     work();
     times.push_back(std::chrono::duration<double, std::milli>(Clock::now() - start).count());
   }
-  static std::string percentiles(std::vector<double> times) {
-    if (times.empty()) return "none";
-    std::sort(times.begin(), times.end());
-    const auto at = [&](double part) {
-      return times[static_cast<size_t>(part * static_cast<double>(times.size() - 1))];
-    };
+  static std::string text(const std::vector<double>& times) {
+    const auto at = [&](double part) { return testsupport::percentile(times, part); };
     return fmt::format("p50_ms={:.2f} p99_ms={:.2f} max_ms={:.1f}", at(0.5), at(0.99), at(1));
   }
 
@@ -119,13 +117,8 @@ class GoodClient {
   std::vector<double> _answers, _indexing;
 };
 
-struct Call {
-  std::string service;
-  std::string message;
-};
-
-// One valid call of each operation.
-std::vector<Call> validCalls() {
+// Valid messages for each service, one for each operation.
+std::map<std::string, std::vector<std::string>> validCalls() {
   const std::string search = rpc::kSearchServiceName;
   const std::string debug = rpc::kDebugServiceName;
   const auto items = testsupport::mails("bad", 2);
@@ -133,30 +126,26 @@ std::vector<Call> validCalls() {
   TLQuery query;
   query.setRawQuery(u"word");
   query.setOriginalQuery(u"word");
-  std::vector<Call> calls;
+  std::map<std::string, std::vector<std::string>> calls;
   const auto add = [&](const std::string& service, const char* member, const char* signature,
                        const RawBody& body) {
-    std::string path = "/" + service;
-    std::replace(path.begin(), path.end(), '.', '/');
-    calls.push_back(
-        {service, testsupport::rawCall(path, service, member, signature, body.content())});
+    calls[service].push_back(
+        testsupport::rawCall(rpc::objectPath(service), service, member, signature, body.content()));
   };
-  const std::string encoded = query.data();
-  add(search, "IndexItems", "aayss", RawBody().bytesArray(items).text("n").text(kBadClass));
-  add(search, "DeleteItemsWithIdentifiers", "asss",
-      RawBody().texts(names).text("n").text(kBadClass));
+  // Most operations end with a client or an index name, and a class.
+  const auto named = [](RawBody body) { return body.text("n").text(kBadClass); };
+  add(search, "IndexItems", "aayss", named(RawBody().bytesArray(items)));
+  add(search, "DeleteItemsWithIdentifiers", "asss", named(RawBody().texts(names)));
   add(search, "IndexItemsDeleteItemsWithIdentifiers", "aayasbayss",
-      RawBody().bytesArray(items).texts(names).number32(1).bytes("state").text("n").text(
-          kBadClass));
-  add(search, "FetchLastClientState", "ss", RawBody().text("n").text(kBadClass));
-  add(search, "DeleteItemsWithDomainIdentifiers", "asss",
-      RawBody().texts(names).text("n").text(kBadClass));
-  add(search, "DeleteAllItems", "ss", RawBody().text("n").text(kBadClass));
+      named(RawBody().bytesArray(items).texts(names).number32(1).bytes("state")));
+  add(search, "FetchLastClientState", "ss", named(RawBody()));
+  add(search, "DeleteItemsWithDomainIdentifiers", "asss", named(RawBody().texts(names)));
+  add(search, "DeleteAllItems", "ss", named(RawBody()));
   add(search, "SearchItemsForQuery", "aytsx",
-      RawBody().bytes(encoded).number64(0).text(kBadClass).number64(10));
+      RawBody().bytes(query.data()).number64(0).text(kBadClass).number64(10));
   add(debug, "Ping", "s", RawBody().text("hello"));
-  add(debug, "FetchStatsForIndexer", "ss", RawBody().text("n").text(kBadClass));
-  add(debug, "FetchStatsForSalt", "ss", RawBody().text("n").text(kBadClass));
+  add(debug, "FetchStatsForIndexer", "ss", named(RawBody()));
+  add(debug, "FetchStatsForSalt", "ss", named(RawBody()));
   add(debug, "ForceVacuumAndCompact", "s", RawBody().text(kBadClass));
   return calls;
 }
@@ -193,20 +182,19 @@ bool exchange(int socket, std::string_view message) {
 }
 
 // Sends invalid messages and returns their number.
-int sendWrongMessages(const DaemonProcess& daemon, const Options& options,
-                      const std::function<bool()>& goesOn) {
-  std::mt19937 random(options.seed);
-  const std::vector<Call> calls = validCalls();
-  int sent = 0;
+uint64_t sendWrongMessages(const DaemonProcess& daemon, const Options& options,
+                           const std::function<bool()>& goesOn) {
+  std::mt19937 random(static_cast<uint32_t>(options.seed));
+  const auto calls = validCalls();
+  uint64_t sent = 0;
   while (sent < options.messages && goesOn()) {
-    const std::string service = calls[random() % calls.size()].service;
-    const FileDescriptor socket(testsupport::connectTo(daemon.socketOf(service)));
+    const auto& [service, messages] = *std::next(calls.begin(), random() % calls.size());
+    const FileDescriptor socket = testsupport::connectTo(daemon.socketOf(service));
     if (socket.get() < 0 || !testsupport::authenticate(socket.get())) continue;
     for (int i = 0; i < kMessagesOfConnection && sent < options.messages; ++i) {
-      const Call* call = &calls[random() % calls.size()];
-      while (call->service != service) call = &calls[random() % calls.size()];
       ++sent;
-      if (!exchange(socket.get(), mutated(call->message, random))) break;
+      const std::string& message = messages[random() % messages.size()];
+      if (!exchange(socket.get(), mutated(message, random))) break;
     }
   }
   return sent;
@@ -218,16 +206,11 @@ bool lives(const DaemonProcess& daemon) {
 
 // Shuts the daemon down and prints what was wrong. Returns the exit status of the driver.
 int conclude(DaemonProcess& daemon, const GoodClient& good, const std::string& line) {
-  daemon.signal(SIGTERM);
-  const int status = daemon.wait();
+  const int status = daemon.stop();
   fmt::print("{} {} status={}\n", line, good.report(), status);
-  if (!good.wrong.empty()) fmt::print(stderr, "WRONG: {}\n", good.wrong);
-  const bool right = status == 0 && good.wrong.empty();
-  if (!right) {
-    const std::string log = daemon.log();
-    fmt::print(stderr, "{}\n", log.substr(log.size() - std::min<size_t>(log.size(), 3000)));
-  }
-  return right ? 0 : 1;
+  if (status == 0 && good.wrong.empty()) return 0;
+  fmt::print(stderr, "WRONG: {}\n{}\n", good.wrong, daemon.endOfLog());
+  return 1;
 }
 
 int runMutations(const Options& options) {
@@ -237,9 +220,10 @@ int runMutations(const Options& options) {
   const rlimit limit{kDescriptors, kDescriptors};
   prlimit(daemon.pid(), RLIMIT_NOFILE, &limit, nullptr);
   GoodClient good(daemon.runtimeDirectory(), 20);
-  int sent = 0;
+  uint64_t sent = 0;
   {
     const std::jthread working([&good](const std::stop_token& stop) { good.work(stop); });
+    good.waitUntilBegun();  // its class is open before others take the descriptors
     sent = sendWrongMessages(daemon, options, [&] { return good.wrong.empty() && lives(daemon); });
   }
   return conclude(daemon, good, fmt::format("messages={}", sent));
@@ -252,7 +236,7 @@ int runMutations(const Options& options) {
 void holdSilentOnes(const std::string& path, int count, const std::stop_token& stop) {
   std::vector<FileDescriptor> held;
   for (int i = 0; i < count && !stop.stop_requested(); ++i) {
-    held.emplace_back(testsupport::connectTo(path));
+    held.push_back(testsupport::connectTo(path));
   }
   while (!stop.stop_requested()) std::this_thread::sleep_for(milliseconds(50));
 }
@@ -264,7 +248,7 @@ void drip(const std::string& path, int count, const std::stop_token& stop) {
   while (!stop.stop_requested()) {
     for (FileDescriptor& socket : sockets) {
       if (socket.get() >= 0 && testsupport::sendAll(socket.get(), "x")) continue;
-      socket = FileDescriptor(testsupport::connectTo(path));
+      socket = testsupport::connectTo(path);
       if (socket.get() >= 0 && testsupport::authenticate(socket.get())) {
         testsupport::sendAll(socket.get(), header);
       }
@@ -276,7 +260,7 @@ void drip(const std::string& path, int count, const std::stop_token& stop) {
 // Repeatedly searches for everything and never reads a reply.
 void neverRead(const std::string& path, const std::string& message, const std::stop_token& stop) {
   while (!stop.stop_requested()) {
-    const FileDescriptor socket(testsupport::connectTo(path));
+    const FileDescriptor socket = testsupport::connectTo(path);
     if (socket.get() < 0 || !testsupport::authenticate(socket.get())) continue;
     while (!stop.stop_requested()) {
       const ssize_t size =
@@ -295,7 +279,7 @@ int runFlood(const Options& options) {
   DaemonProcess daemon(scratch.path());
   const std::string path = daemon.socketOf(rpc::kSearchServiceName);
   GoodClient good(daemon.runtimeDirectory(), kBatch);
-  const std::string message = validCalls()[6].message;
+  const std::string message = validCalls().at(rpc::kSearchServiceName)[6];
   size_t most = 0;
   {
     std::vector<std::jthread> threads;
@@ -330,23 +314,14 @@ int main(int argc, char** argv) {
   descriptors.rlim_cur = descriptors.rlim_max;
   setrlimit(RLIMIT_NOFILE, &descriptors);
   Options options;
-  for (int i = 1; i < argc; i += 2) {
-    const std::string_view name = argv[i];
-    const std::string_view value = i + 1 < argc ? argv[i + 1] : "";
-    if (name == "--messages") {
-      options.messages = std::atoi(value.data());
-    } else if (name == "--seconds") {
-      options.seconds = std::atoi(value.data());
-    } else if (name == "--max-mb") {
-      options.maxMegabytes = std::strtoul(value.data(), nullptr, 10);
-    } else if (name == "--seed") {
-      options.seed = static_cast<uint32_t>(std::strtoul(value.data(), nullptr, 10));
-    } else if (name == "--mode" && value == "flood") {
-      options.flood = true;
-    } else {
-      fmt::print(stderr, "{}", kUsage);
-      return 2;
-    }
-  }
-  return options.flood ? runFlood(options) : runMutations(options);
+  testsupport::readOptions(argc, argv, kUsage,
+                           {{"--mode", &options.mode},
+                            {"--messages", &options.messages},
+                            {"--seconds", &options.seconds},
+                            {"--max-mb", &options.maxMegabytes},
+                            {"--seed", &options.seed}});
+  if (options.mode == "messages") return runMutations(options);
+  if (options.mode == "flood") return runFlood(options);
+  fmt::print(stderr, "{}", kUsage);
+  return 2;
 }

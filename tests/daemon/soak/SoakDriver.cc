@@ -10,13 +10,11 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <random>
 #include <set>
@@ -31,6 +29,7 @@
 #include "platform/Paths.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/daemon/DaemonSupport.h"
+#include "tests/support/DriverOptions.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
@@ -51,14 +50,16 @@ constexpr const char* kName = "soak";
 constexpr size_t kMaxMails = 200;  // per client
 constexpr rpc::Patience kPatience{20000};
 
+// Times are in seconds, without another unit.
 struct Options {
-  seconds length{1800};  // without the warming up
-  seconds warmUp{0};
-  int clients = 16;
-  seconds killEvery{60};
-  int purgeEvery = 5;      // kills
-  milliseconds pause{20};  // maximum, between two calls of a client; a long one makes a steady load
-  uint32_t seed = std::random_device()();
+  uint64_t seconds = 1800;  // without the warming up
+  uint64_t warmUp = 0;
+  uint64_t clients = 16;
+  uint64_t killEvery = 60;
+  uint64_t purgeEvery = 5;  // kills
+  // The maximum between two calls of a client; a long pause makes a steady load.
+  uint64_t pauseMillis = 20;
+  uint64_t seed = std::random_device()();
 };
 
 // Counters of all threads.
@@ -70,45 +71,31 @@ struct Tally {
   std::atomic<bool> wrong{false};
 };
 
-// False when a stop was requested before the time had passed.
-bool pauseFor(const std::stop_token& stop, milliseconds time) {
-  std::mutex mutex;
-  std::condition_variable_any wake;
-  std::unique_lock lock(mutex);
-  wake.wait_for(lock, stop, time, [] { return false; });
-  return !stop.stop_requested();
-}
-
 // One client with its own mails in one class.
 class Client {
  public:
-  Client(int number, const Options& options, std::string directory, Tally& tally)
+  Client(uint64_t number, const Options& options, std::string directory, Tally& tally)
       : _prefix(fmt::format("c{}m", number)),
-        _class(kClasses[static_cast<size_t>(number) % std::size(kClasses)]),
+        _class(kClasses[number % std::size(kClasses)]),
         _directory(std::move(directory)),
-        _pause(options.pause),
-        _random(options.seed + static_cast<uint32_t>(number)),
+        _pause(options.pauseMillis),
+        _random(static_cast<uint32_t>(options.seed + number)),
         _tally(tally) {}
 
   void work(const std::stop_token& stop) {
-    while (!_tally.wrong && pauseFor(stop, milliseconds(_random() % (_pause.count() + 1)))) {
+    while (!_tally.wrong && !stop.stop_requested()) {
+      std::this_thread::sleep_for(milliseconds(_random() % (_pause + 1)));
       if (!_service) _service.emplace(_directory, kPatience);
       ++_tally.calls;
-      switch (_random() % 10) {
-        case 0:
-        case 1:
-        case 2:
-          add();
-          break;
-        case 3:
-        case 4:
-          remove();
-          break;
-        case 5:
-          diagnose();
-          break;
-        default:
-          searchOne();
+      const auto die = _random() % 10;
+      if (die < 3) {
+        add();
+      } else if (die < 5) {
+        remove();
+      } else if (die < 6) {
+        diagnose();
+      } else {
+        searchOne();
       }
     }
   }
@@ -171,19 +158,12 @@ class Client {
     const uint32_t mail = gone ? *std::next(_gone.begin(), _random() % _gone.size())
                                : std::next(_mails.begin(), _random() % _mails.size())->first;
     if (!gone && _mails[mail] == State::unknown) return;
-    TLQuery query;
     const std::string word = wordOf(mail);
-    query.setRawQuery(platform::fromUTF8(word));
-    query.setOriginalQuery(platform::fromUTF8(word));
     std::optional<TLError> error;
-    const auto items =
-        _service->searchItems(query, 0, _class, SearchServiceProxy::kNoMaximum, &error);
-    if (!settle(items.has_value(), error)) return;
+    const auto identifiers = testsupport::found(*_service, word, _class, &error);
+    if (!settle(identifiers.has_value(), error)) return;
     ++_tally.searches;
-    size_t count = 0;
-    for (const auto& item : *items) {
-      if (item->identifier() == platform::fromUTF8(word)) ++count;
-    }
+    const size_t count = identifiers->count(word);
     if (count == (gone ? 0U : 1U)) return;
     fmt::print(stderr, "WRONG: {} of {} is found {} times\n", word, _class, count);
     _tally.wrong = true;
@@ -192,19 +172,17 @@ class Client {
   void diagnose() {
     client::DebugServiceProxy debug(_directory, kPatience);
     std::optional<TLError> error;
-    switch (_random() % 40) {
-      case 0:
-        settle(debug.forceVacuumAndCompact(_class, &error), error);
-        break;
-      case 1:
-        settle(debug.fetchStatsForIndexer(kName, _class, &error).has_value(), error);
-        break;
-      case 2:
-        settle(_service->fetchLastClientState(kName, _class, &error).has_value(), error);
-        break;
-      default:
-        settle(debug.ping(_prefix, &error).has_value(), error);
+    const auto die = _random() % 40;
+    if (die == 0) {
+      debug.forceVacuumAndCompact(_class, &error);
+    } else if (die == 1) {
+      static_cast<void>(debug.fetchStatsForIndexer(kName, _class, &error));
+    } else if (die == 2) {
+      static_cast<void>(_service->fetchLastClientState(kName, _class, &error));
+    } else {
+      static_cast<void>(debug.ping(_prefix, &error));
     }
+    settle(!error, error);
   }
 
   static bool refusedByLock(const std::optional<TLError>& error) {
@@ -226,7 +204,7 @@ class Client {
   const std::string _prefix;
   const std::string _class;
   const std::string _directory;
-  const milliseconds _pause;
+  const uint64_t _pause;
   std::mt19937 _random;
   Tally& _tally;
   std::optional<SearchServiceProxy> _service;
@@ -239,7 +217,7 @@ class Client {
 class Supervisor {
  public:
   Supervisor(const Options& options, const std::string& directory)
-      : _options(options), _directory(directory), _random(options.seed) {
+      : _options(options), _directory(directory), _random(static_cast<uint32_t>(options.seed)) {
     _daemon.emplace(directory);
   }
 
@@ -247,9 +225,9 @@ class Supervisor {
 
   // Runs until the end of the time or a wrong answer. False if the daemon ended unexpectedly.
   bool supervise(const Tally& tally) {
-    const auto start = Clock::now() + _options.warmUp;
-    auto nextKill = Clock::now() + _options.killEvery;
-    while (Clock::now() - start < _options.length && !tally.wrong) {
+    const auto start = Clock::now() + seconds(_options.warmUp);
+    auto nextKill = Clock::now() + seconds(_options.killEvery);
+    while (Clock::now() - start < seconds(_options.seconds) && !tally.wrong) {
       std::this_thread::sleep_for(milliseconds(200));
       if (Clock::now() >= start) measure(Clock::now() - start);
       if (_random() % 25 == 0) _daemon->signal(SIGUSR1);
@@ -258,7 +236,7 @@ class Supervisor {
                                       _random() % 2 == 0 ? "1 1\n" : "0 1\n", nullptr);
       }
       if (Clock::now() < nextKill) continue;
-      nextKill = Clock::now() + _options.killEvery;
+      nextKill = Clock::now() + seconds(_options.killEvery);
       _daemon->signal(SIGKILL);
       const int status = _daemon->wait();
       if (status != 128 + SIGKILL) return ended(status);
@@ -272,35 +250,29 @@ class Supervisor {
 
   // Shuts the daemon down; false if it fails.
   bool end() {
-    _daemon->signal(SIGTERM);
-    const int status = _daemon->wait();
+    const int status = _daemon->stop();
     return status == 0 || ended(status);
   }
 
   void report(const Tally& tally) const {
     fmt::print(
         "calls={} searches={} refused_while_locked={} failed_by_kills={} kills={} purges={} "
-        "wrong={:d} rss_anon_median_mb={:.1f},{:.1f},{:.1f} rss_anon_max_mb={:.1f},{:.1f},{:.1f} "
-        "seed={}\n",
+        "wrong={:d} rss_anon_median_mb={} rss_anon_max_mb={} seed={}\n",
         tally.calls.load(), tally.searches.load(), tally.refused.load(), tally.failed.load(),
-        _kills, _purges, tally.wrong.load(), percentile(0, 50), percentile(1, 50),
-        percentile(2, 50), percentile(0, 100), percentile(1, 100), percentile(2, 100),
-        _options.seed);
+        _kills, _purges, tally.wrong.load(), megabytes(0.5), megabytes(1), _options.seed);
   }
 
  private:
   void measure(Clock::duration time) {
-    const auto third = static_cast<size_t>(3 * time / _options.length);
-    const size_t memory = _daemon->anonymousKilobytes();
-    if (memory != 0) _memory[std::min<size_t>(third, 2)].push_back(memory);
+    const auto third = static_cast<size_t>(3 * time / seconds(_options.seconds));
+    const auto kilobytes = static_cast<double>(_daemon->anonymousKilobytes());
+    if (kilobytes != 0) _megabytes[std::min<size_t>(third, 2)].push_back(kilobytes / 1024);
   }
 
-  // Of the measured values of a third, in megabytes; 0 if there are none.
-  [[nodiscard]] double percentile(size_t third, size_t percent) const {
-    std::vector<size_t> sorted = _memory[third];
-    if (sorted.empty()) return 0;
-    std::ranges::sort(sorted);
-    return static_cast<double>(sorted[(sorted.size() - 1) * percent / 100]) / 1024;
+  // A percentile for each third.
+  [[nodiscard]] std::string megabytes(double part) const {
+    const auto at = [&](size_t third) { return testsupport::percentile(_megabytes[third], part); };
+    return fmt::format("{:.1f},{:.1f},{:.1f}", at(0), at(1), at(2));
   }
 
   // Removes the remains of deleted mail from all classes, while no daemon runs.
@@ -320,8 +292,7 @@ class Supervisor {
   }
 
   bool ended(int status) const {
-    fmt::print(stderr, "the daemon ended with status {}\n{}\n", status,
-               _daemon->log().substr(0, 4000));
+    fmt::print(stderr, "the daemon ended with status {}\n{}\n", status, _daemon->endOfLog());
     return false;
   }
 
@@ -329,8 +300,8 @@ class Supervisor {
   const std::string _directory;
   std::mt19937 _random;
   std::optional<DaemonProcess> _daemon;
-  std::vector<size_t> _memory[3];  // for each third, in kilobytes
-  int _kills = 0;
+  std::vector<double> _megabytes[3];  // for each third
+  uint64_t _kills = 0;
   int _purges = 0;
 };
 
@@ -342,7 +313,7 @@ int soak(const Options& options) {
   bool sound = true;
   {
     std::vector<std::jthread> threads;
-    for (int number = 0; number < options.clients; ++number) {
+    for (uint64_t number = 0; number < options.clients; ++number) {
       threads.emplace_back([&, number](const std::stop_token& stop) {
         Client(number, options, supervisor.runtimeDirectory(), tally).work(stop);
       });
@@ -358,27 +329,17 @@ int soak(const Options& options) {
 
 int main(int argc, char** argv) {
   Options options;
-  for (int i = 1; i < argc; i += 2) {
-    const std::string_view name = argv[i];
-    const int value = i + 1 < argc ? std::atoi(argv[i + 1]) : -1;
-    if (name == "--seconds" && value > 0) {
-      options.length = seconds(value);
-    } else if (name == "--warm-up" && value >= 0) {
-      options.warmUp = seconds(value);
-    } else if (name == "--purge-every" && value > 0) {
-      options.purgeEvery = value;
-    } else if (name == "--pause" && value >= 0) {
-      options.pause = milliseconds(value);
-    } else if (name == "--clients" && value > 0) {
-      options.clients = value;
-    } else if (name == "--kill-every" && value > 0) {
-      options.killEvery = seconds(value);
-    } else if (name == "--seed" && value >= 0) {
-      options.seed = static_cast<uint32_t>(value);
-    } else {
-      fmt::print(stderr, "{}", kUsage);
-      return 2;
-    }
+  testsupport::readOptions(argc, argv, kUsage,
+                           {{"--seconds", &options.seconds},
+                            {"--warm-up", &options.warmUp},
+                            {"--clients", &options.clients},
+                            {"--kill-every", &options.killEvery},
+                            {"--purge-every", &options.purgeEvery},
+                            {"--pause", &options.pauseMillis},
+                            {"--seed", &options.seed}});
+  if (options.seconds * options.clients * options.killEvery * options.purgeEvery != 0) {
+    return soak(options);
   }
-  return soak(options);
+  fmt::print(stderr, "{}", kUsage);
+  return 2;
 }

@@ -1,14 +1,12 @@
 // Kills a process with SIGKILL while it adds, deletes and merges, repeatedly on the same database,
 // and checks after each kill that the keys contain every acknowledged operation exactly once. Exits
 // with 1 at the first fault and keeps the database.
-#include <fcntl.h>
 #include <fmt/format.h>
 #include <poll.h>
 #include <signal.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
@@ -16,11 +14,12 @@
 #include <optional>
 #include <random>
 
-#include "platform/Assert.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/salt/crash/Workload.h"
+#include "tests/support/DriverOptions.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Process.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using namespace salttest;
@@ -43,14 +42,12 @@ constexpr const char* kUsage =
     "enospc: writes fail at times, by a limit on the size of files or, with DIR on a file system\n"
     "of some megabytes, by filling it.\n";
 
-enum class Mode { kill, truncate, enospc };
-
 struct Options {
   uint64_t kills = 200;
-  uint32_t seed = 1;
-  Mode mode = Mode::kill;
+  uint64_t seed = 1;
+  uint64_t seconds = 86400;  // at most
+  std::string mode = "kill";
   std::string disk;  // a directory on its own small file system, which workers fill
-  std::chrono::seconds most{86400};
 };
 
 struct Tally {
@@ -63,72 +60,34 @@ struct Tally {
   uint64_t lostTails = 0;  // databases that lost operations to a truncated log
 };
 
-// A worker process and the pipe for its reports.
-class WorkerProcess {
- public:
-  explicit WorkerProcess(const WorkerTask& task) {
-    int ends[2];
-    TL_ASSERT(pipe2(ends, O_CLOEXEC) == 0);
-    _reports = ends[0];
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_adddup2(&actions, ends[1], STDOUT_FILENO);
-    std::string words[] = {"salt_crash_driver",
-                           "--worker",
-                           task.path,
-                           std::to_string(task.seed),
-                           std::to_string(task.first),
-                           std::to_string(task.generation),
-                           std::to_string(task.create),
-                           std::to_string(static_cast<int>(task.shortage))};
-    std::vector<char*> arguments;
-    for (std::string& word : words) arguments.push_back(word.data());
-    arguments.push_back(nullptr);
-    TL_ASSERT(posix_spawn(&_pid, "/proc/self/exe", &actions, nullptr, arguments.data(), environ) ==
-              0);
-    posix_spawn_file_actions_destroy(&actions);
-    close(ends[1]);
-  }
+testsupport::Process startWorker(const WorkerTask& task, const std::string& log) {
+  return {{"/proc/self/exe", "--worker", task.path, std::to_string(task.seed),
+           std::to_string(task.first), std::to_string(task.generation), std::to_string(task.create),
+           std::to_string(static_cast<int>(task.shortage))},
+          {},
+          log};
+}
 
-  ~WorkerProcess() { close(_reports); }
-  WorkerProcess(const WorkerProcess&) = delete;
-  WorkerProcess& operator=(const WorkerProcess&) = delete;
-
-  // Appends reports until `end`. False when the worker has ended.
-  bool read(Clock::time_point end, std::string* reports) const {
-    const auto left = std::chrono::ceil<microseconds>(end - Clock::now());
-    const timespec time{left.count() / 1'000'000, left.count() % 1'000'000 * 1000};
-    pollfd waiting{_reports, POLLIN, 0};
-    if (left.count() <= 0 || ppoll(&waiting, 1, &time, nullptr) <= 0) return true;
-    char bytes[4096];
-    const ssize_t size = ::read(_reports, bytes, sizeof bytes);
-    if (size > 0) reports->append(bytes, static_cast<size_t>(size));
-    return size > 0;
-  }
-
-  // Returns the exit status, and appends the remaining reports.
-  int end(std::string* reports) const {
-    kill(_pid, SIGKILL);
-    while (read(Clock::now() + kForever, reports)) {
-    }
-    int status = 0;
-    TL_ASSERT(waitpid(_pid, &status, 0) == _pid);
-    return status;
-  }
-
- private:
-  pid_t _pid = -1;
-  int _reports = -1;
-};
+// Appends reports of the worker until `end`. False when it has ended.
+bool read(const testsupport::Process& worker, Clock::time_point end, std::string* reports) {
+  const auto left = std::chrono::ceil<microseconds>(end - Clock::now());
+  const timespec time{left.count() / 1'000'000, left.count() % 1'000'000 * 1000};
+  pollfd waiting{worker.output(), POLLIN, 0};
+  if (left.count() <= 0 || ppoll(&waiting, 1, &time, nullptr) <= 0) return true;
+  char bytes[4096];
+  const ssize_t size = ::read(worker.output(), bytes, sizeof bytes);
+  if (size > 0) reports->append(bytes, static_cast<size_t>(size));
+  return size > 0;
+}
 
 // One database through all its kills.
 class Trial {
  public:
   Trial(const Options& options, uint32_t seed, Tally* tally)
-      : _mode(options.mode),
-        _shortage(_mode != Mode::enospc  ? Shortage::none
-                  : options.disk.empty() ? Shortage::fileSize
-                                         : Shortage::fullDisk),
+      : _truncates(options.mode == "truncate"),
+        _shortage(options.mode != "enospc" ? Shortage::none
+                  : options.disk.empty()   ? Shortage::fileSize
+                                           : Shortage::fullDisk),
         _path(options.disk.empty() ? _directory / "index" : options.disk + "/index"),
         _seed(seed),
         _tally(*tally),
@@ -151,35 +110,39 @@ class Trial {
     task.create = !_created;
     task.shortage = _shortage;
     std::string reports;
-    const int status = killed(WorkerProcess(task), &reports);
+    testsupport::Process worker = startWorker(task, _directory / "log");
+    const int status = killed(worker, &reports);
     ++_tally.kills;
     std::filesystem::remove(ballastOf(_path));
-    if (!WIFSIGNALED(status) || WTERMSIG(status) != SIGKILL) {
-      return fmt::format("the worker ended with status {:#x}", status);
+    if (status != 128 + SIGKILL) {
+      return fmt::format("the worker ended with status {}\n{}", status, worker.log());
     }
     std::string fault = believe(reports);
-    if (fault.empty() && _mode == Mode::truncate && _created) cutNewestLog();
+    if (fault.empty() && _truncates && _created) cutNewestLog();
     if (fault.empty() && _created) fault = check(reports.size() > 1);
     return fault;
   }
 
  private:
   // Kills during opening, or some time after a number of reports, or right after a failed write.
-  int killed(const WorkerProcess& worker, std::string* reports) {
+  int killed(testsupport::Process& worker, std::string* reports) {
     const microseconds pause(_random() % 3000);
     const size_t quota = 1 + _random() % 80;
     const bool atFailure = _random() % 4 == 0;
     const auto part = static_cast<int>(_random() % 100);
     const auto start = Clock::now();
     auto end = start + (_random() % 5 == 0 ? _opening * part / 100 : kForever);
-    for (bool chosen = false; Clock::now() < end && worker.read(end, reports);) {
+    for (bool chosen = false; Clock::now() < end && read(worker, end, reports);) {
       if (reports->size() == 1) _opening = std::chrono::ceil<microseconds>(Clock::now() - start);
       if (chosen) continue;
       const bool failed = reports->find(static_cast<char>(Report::failed)) != std::string::npos;
       chosen = (atFailure && failed) || reports->size() >= quota;
       if (chosen) end = atFailure ? start : std::min(end, Clock::now() + pause);
     }
-    return worker.end(reports);
+    const int status = worker.end(SIGKILL);
+    while (read(worker, Clock::now() + kForever, reports)) {
+    }
+    return status;
   }
 
   // Updates the expectations from the worker's reports.
@@ -212,7 +175,7 @@ class Trial {
   // Works on copies, so that the next worker is the first to open the database.
   std::string check(bool worked) {
     const Keys keys = readKeys(freshCopy());
-    if (keys.size() < 2 && _mode == Mode::truncate) {  // without metrics there is no index
+    if (keys.size() < 2 && _truncates) {  // without metrics there is no index
       startAnew();
       return "";
     }
@@ -246,7 +209,7 @@ class Trial {
     const auto take = [this] { carryOut(_model, workloadOperation(_seed, _next++)); };
     if (agree()) return true;
     const uint32_t acknowledged = _next;
-    if (_mode == Mode::truncate) {
+    if (_truncates) {
       take();
       if (agree()) return true;
       ++_tally.lostTails;
@@ -266,7 +229,7 @@ class Trial {
   }
 
   const testsupport::TemporaryDirectory _directory;
-  const Mode _mode;
+  const bool _truncates;
   const Shortage _shortage;
   const std::string _path;
   const uint32_t _seed;
@@ -282,9 +245,10 @@ class Trial {
 int drive(const Options& options) {
   Tally tally;
   const auto start = Clock::now();
-  std::mt19937 seeds(options.seed);
+  std::mt19937 seeds(static_cast<uint32_t>(options.seed));
   std::optional<Trial> trial;
-  while (tally.kills < options.kills && Clock::now() - start < options.most) {
+  while (tally.kills < options.kills &&
+         Clock::now() - start < std::chrono::seconds(options.seconds)) {
     if (!trial || trial->over()) {
       trial.emplace(options, seeds(), &tally);
       ++tally.databases;
@@ -313,37 +277,24 @@ int worker(char** words) {
                     number(words[4]) != 0, static_cast<Shortage>(number(words[5]))});
 }
 
-// False for invalid arguments.
-bool parse(int count, char** words, Options* options) {
-  for (int i = 0; i + 1 < count; i += 2) {
-    const std::string_view name = words[i];
-    const std::string_view value = words[i + 1];
-    if (name == "--kills") {
-      options->kills = number(words[i + 1]);
-    } else if (name == "--seed") {
-      options->seed = number(words[i + 1]);
-    } else if (name == "--disk" && std::filesystem::space(value).capacity <= kMaxDiskBytes) {
-      options->disk = value;
-    } else if (name == "--seconds") {
-      options->most = std::chrono::seconds(number(words[i + 1]));
-    } else if (name == "--mode" && (value == "kill" || value == "truncate" || value == "enospc")) {
-      options->mode = value == "kill"       ? Mode::kill
-                      : value == "truncate" ? Mode::truncate
-                                            : Mode::enospc;
-    } else {
-      return false;
-    }
-  }
-  return count % 2 == 0;
-}
-
 }  // namespace
 
 int main(int count, char** words) {
   if (count == 8 && std::strcmp(words[1], "--worker") == 0) return worker(words + 2);
   Options options;
-  if (!parse(count - 1, words + 1, &options)) {
+  testsupport::readOptions(count, words, kUsage,
+                           {{"--mode", &options.mode},
+                            {"--kills", &options.kills},
+                            {"--seed", &options.seed},
+                            {"--seconds", &options.seconds},
+                            {"--disk", &options.disk}});
+  constexpr std::string_view kModes[] = {"kill", "truncate", "enospc"};
+  if (std::ranges::find(kModes, options.mode) == std::end(kModes)) {
     fmt::print(stderr, "{}", kUsage);
+    return 2;
+  }
+  if (!options.disk.empty() && std::filesystem::space(options.disk).capacity > kMaxDiskBytes) {
+    fmt::print(stderr, "{} is not on a small file system\n", options.disk);
     return 2;
   }
   setenv("TALLOW_LOG", "fault",
