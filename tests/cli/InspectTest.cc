@@ -1,10 +1,7 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
 
 #include <csignal>
 #include <cstdio>
-#include <cstdlib>
 #include <filesystem>
 #include <nlohmann/json.hpp>
 
@@ -16,7 +13,7 @@
 #include "salt/Quarantine.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/salt/SaltSupport.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 // The client and the program that it runs, on an index made by the test.
 namespace {
@@ -25,34 +22,21 @@ namespace fs = std::filesystem;
 using testing::HasSubstr;
 using testing::StartsWith;
 
-class InspectTest : public testing::Test {
+class InspectTest : public testsupport::ShellTest {
  protected:
   InspectTest() {
+    tallow = TALLOW_PROGRAM " --state-dir " + state;
     // The lock file that a daemon leaves.
     static_cast<void>(platform::ProcessLock::acquire(platform::processLockPath(state), nullptr));
     platform::createDirectories(platform::joinPath(platform::dataRoot(state), "default"), nullptr);
-  }
-
-  // Runs `tallow COMMAND` on the state and captures the output.
-  int run(const std::string& command) { return shell(client + command); }
-  int shell(const std::string& command) {
-    const std::string redirected =
-        "( " + command + " ) >" + directory / "out" + " 2>" + directory / "err";
-    const int status = std::system(redirected.c_str());
-    output = readAll(directory / "out");
-    errors = readAll(directory / "err");
-    return WEXITSTATUS(status);
-  }
-
-  static std::string readAll(const std::string& path) {
-    return platform::readFile(path, size_t{1} << 30, nullptr).value_or("(no file)");
   }
 
   // All files of the state, with their contents.
   [[nodiscard]] std::map<std::string, std::string> files() const {
     std::map<std::string, std::string> all;
     for (const auto& entry : fs::recursive_directory_iterator(state)) {
-      all[entry.path()] = entry.is_regular_file() ? readAll(entry.path()) : "";
+      const bool file = entry.is_regular_file();
+      all[entry.path()] = file ? read(fs::relative(entry, directory.path())) : "";
     }
     return all;
   }
@@ -74,12 +58,8 @@ class InspectTest : public testing::Test {
     }
   }
 
-  testsupport::TemporaryDirectory directory;
   const std::string state = directory / "state";
   const std::string index = platform::textIndexPath(platform::dataRoot(state), "default");
-  const std::string client = TALLOW_PROGRAM " --state-dir " + state + " ";
-  std::string output;
-  std::string errors;
 };
 
 const salt::SuffixMeta kFirst{1, 0, 1, 0, {}};
@@ -89,19 +69,16 @@ const salt::SuffixMeta kSecond{1, 3, 1, 1, {'b', ' '}};
 
 TEST_F(InspectTest, DumpMatchesTheIndexAndChangesNothing) {
   makeIndex({kFirst, kSecond});
-  std::string dump;
-  {
-    const auto made = salttest::loadIndex(index);
-    ASSERT_TRUE(salttest::addZone(*made, 2, 4, "\x1b[31m red \xe4\xba\xac\xe9\x83\xbd", {0, 6}));
-    ASSERT_TRUE(salttest::addZone(*made, 3, 4, "fifteen bytes..\xe4\xba\xac", {0}));
-    ASSERT_TRUE(made->DeleteDoc(2));
-    dump = made->Dump();
-  }
+  auto made = salttest::loadIndex(index);
+  ASSERT_TRUE(salttest::addZone(*made, 2, 4, "\x1b[31m red \xe4\xba\xac\xe9\x83\xbd", {0, 6}));
+  ASSERT_TRUE(salttest::addZone(*made, 3, 4, "fifteen bytes..\xe4\xba\xac", {0}));
+  ASSERT_TRUE(made->DeleteDoc(2));
+  const std::string dump = made->Dump();
+  made.reset();
   platform::writeFileAtomically(index + "/notes.log", "a log of another kind", nullptr);
   platform::createDirectories(index + "/999999.ldb/000001.log", nullptr);
   const auto before = files();
-  EXPECT_EQ(run("dump"), 0) << errors;
-  EXPECT_EQ(output, cli::cleanLinesForTerminal(dump));
+  EXPECT_EQ(outputOf("dump"), cli::cleanLinesForTerminal(dump));
   EXPECT_THAT(output, HasSubstr("---- [2,4:0]: \"\uFFFD[31m red \u4eac\u90fd\"\n"));
   EXPECT_EQ(run("validate"), 0) << errors;
   EXPECT_EQ(errors, "");
@@ -135,7 +112,7 @@ TEST_F(InspectTest, TwoCrashesOfOneHourAreOneTooMany) {
 
 TEST_F(InspectTest, ClosedPipeEndsTheDump) {
   makeLargeIndex();
-  EXPECT_EQ(shell("{ " + client + "dump; echo $? >&2; } | head -n 1"), 0);
+  EXPECT_EQ(shell("{ " + tallow + " dump; echo $? >&2; } | head -n 1"), 0);
   EXPECT_EQ(output, "SALT INDEX METRICS\n");
   EXPECT_EQ(errors, "2\n");
 }
@@ -195,13 +172,11 @@ TEST_F(InspectTest, ValidateReportsEachFault) {
 
 TEST_F(InspectTest, CountsWhatItFinds) {
   makeIndex({kFirst, kSecond});
-  {
-    const auto made = salttest::loadIndex(index);
-    ASSERT_TRUE(salttest::addZone(*made, 2, 4, "gone"));
-    ASSERT_TRUE(made->DeleteDoc(2));
-  }
-  EXPECT_EQ(run("validate --format=json"), 0);
-  EXPECT_EQ(nlohmann::json::parse(output),
+  auto made = salttest::loadIndex(index);
+  ASSERT_TRUE(salttest::addZone(*made, 2, 4, "gone"));
+  ASSERT_TRUE(made->DeleteDoc(2));
+  made.reset();
+  EXPECT_EQ(nlohmann::json::parse(outputOf("validate --format=json")),
             nlohmann::json::parse(R"({"valid": true, "documents": 1, "deletedDocuments": 1,
                 "zones": 1, "textBytes": 13, "suffixes": 3, "hotSuffixes": 1, "pages": 1,
                 "shards": 1})"));
@@ -267,11 +242,12 @@ TEST_F(InspectTest, CreatesNothingWithoutAnIndex) {
   makeIndex({kFirst});
   const auto before = files();
   for (const char* command : {"validate", "dump"}) {
-    EXPECT_EQ(run(command + std::string(" --class none")), 2);
-    EXPECT_THAT(errors, HasSubstr("none/salt: No such file or directory"));
-    EXPECT_EQ(run(command + std::string(" --class ../TallowSearch/default")), 2);
-    EXPECT_THAT(errors, HasSubstr("must name one directory"));
-    EXPECT_EQ(shell(TALLOW_PROGRAM " --state-dir " + (directory / "none ") + command), 2);
+    for (const auto& [place, reason] :
+         {std::pair(" --class none", "none/salt: No such file or directory"),
+          {" --class ../TallowSearch/default", "must name one directory"}}) {
+      EXPECT_THAT(errorsOf(std::string(command) + place), HasSubstr(reason));
+    }
+    EXPECT_EQ(shell(TALLOW_PROGRAM " --state-dir none " + std::string(command)), 2);
     EXPECT_THAT(errors, HasSubstr("tallowsearchd.lock: No such file or directory"));
   }
   EXPECT_EQ(run("dump --format=json"), 2);

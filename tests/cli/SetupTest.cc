@@ -1,18 +1,14 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 
 #include <atomic>
 #include <csignal>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <memory>
 
 #include "cli/Settings.h"
-#include "platform/Files.h"
 #include "tests/client/FakeDaemon.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/Programs.h"
@@ -52,6 +48,7 @@ done
 exit $status
 )shell";
 
+constexpr const char* kUnset = "-u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY";
 constexpr const char* kSockets = "tallowsearchd.socket tallowsearchd-debug.socket";
 
 class SetupTest : public testsupport::TmuxTest {
@@ -62,7 +59,12 @@ class SetupTest : public testsupport::TmuxTest {
     write("bin/systemctl", kSystemctl);
     fs::permissions(directory / "bin/systemctl", fs::perms::owner_all);
     fs::create_directory(home);
-    variables = environment();
+    variables = fmt::format(
+        "HOME={0}/home XDG_RUNTIME_DIR={0}/xdg XDG_CONFIG_HOME={0}/config "
+        "XDG_STATE_HOME={0}/client STATE_DIRECTORY={0}/state PATH={0}/bin:/usr/bin:/bin",
+        directory.path());
+    environment = kUnset + (' ' + variables);
+    tallow = TALLOW_PROGRAM;
   }
   void TearDown() override {
     if (fs::exists(directory / "tmux")) TmuxTest::TearDown();
@@ -78,33 +80,6 @@ class SetupTest : public testsupport::TmuxTest {
     fs::create_directory_symlink(runtime, directory / "xdg/tallow");
   }
 
-  [[nodiscard]] std::string environment() const {
-    return fmt::format(
-        "HOME={0}/home XDG_RUNTIME_DIR={0}/xdg XDG_CONFIG_HOME={0}/config "
-        "XDG_STATE_HOME={0}/client "
-        "STATE_DIRECTORY={0}/state "
-        "PATH={0}/bin:/usr/bin:/bin",
-        directory.path());
-  }
-  // Runs `tallow ARGUMENTS` without a terminal and returns its exit status.
-  int run(const std::string& arguments, const std::string& more = "") {
-    const std::string command = fmt::format(
-        "cd {0} && env -u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY {1} "
-        "{2} " TALLOW_PROGRAM " {3} >{0}/out 2>{0}/err </dev/null",
-        directory.path(), environment(), more, arguments);
-    const int status = WEXITSTATUS(std::system(command.c_str()));
-    output = read("out");
-    errors = read("err");
-    return status;
-  }
-
-  [[nodiscard]] std::string read(const std::string& name) const {
-    return platform::readFile(directory / name, size_t{1} << 20, nullptr).value_or("");
-  }
-  void write(const std::string& name, const std::string& text) const {
-    fs::create_directories(fs::path(directory / name).parent_path());
-    std::ofstream(directory / name) << text;
-  }
   // What was asked of systemd since the last call, without questions.
   std::vector<std::string> unitCalls() const {
     std::istringstream log(read("systemctl.log"));
@@ -141,8 +116,6 @@ class SetupTest : public testsupport::TmuxTest {
   const std::string home = directory / "home";
   const std::string settings = directory / "config/tallow/config.toml";
   std::unique_ptr<testsupport::DaemonProcess> daemon;
-  std::string output;
-  std::string errors;
 };
 
 }  // namespace
@@ -183,8 +156,8 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
   write("home/.thunderbird/\xFF/ImapMail/x/Inbox", mboxText(1));
   write("home/.thunderbird/none/Mail/Local Folders/Trash", "");
 
-  EXPECT_EQ(run("setup", "MAIL=" + home + "/spool"), 2);
-  EXPECT_THAT(errors, HasSubstr("nothing has been changed; without a terminal, --yes does it"));
+  EXPECT_THAT(errorsOf("setup", "MAIL=" + home + "/spool"),
+              HasSubstr("nothing has been changed; without a terminal, --yes does it"));
   EXPECT_EQ(run("setup --dry-run", "MAIL=" + home + "/spool"), 0) << errors;
   EXPECT_FALSE(fs::exists(settings));
   EXPECT_THAT(unitCalls(), IsEmpty());
@@ -221,28 +194,23 @@ TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
   write("runtime", daemon->runtimeDirectory());
   EXPECT_EQ(run("setup --yes"), 0) << errors;
   EXPECT_THAT(roots(), ElementsAre(home + "/Maildir"));
-  struct stat info;
-  ASSERT_EQ(stat(settings.c_str(), &info), 0);
-  EXPECT_EQ(info.st_mode & 07777, 0600U);
-  ASSERT_EQ(stat((directory / "config/tallow").c_str(), &info), 0);
-  EXPECT_EQ(info.st_mode & 07777, 0700U);
+  EXPECT_EQ(fs::status(settings).permissions(), fs::perms(0600));
+  EXPECT_EQ(fs::status(directory / "config/tallow").permissions(), fs::perms(0700));
   // The watch starts after the sync, whose lock it would wait for.
   EXPECT_THAT(
       unitCalls(),
       ElementsAre(fmt::format("--user start {}", kSockets), "--user stop tallow-watch.service",
                   fmt::format("--user enable {} tallow-watch.service", kSockets),
                   "--user start tallow-watch.service"));
-  EXPECT_EQ(run("search --count lighthouse"), 0);
-  EXPECT_EQ(output, "2\n");
+  EXPECT_EQ(outputOf("search --count lighthouse"), "2\n");
 
   const std::string before = read("config/tallow/config.toml");
-  EXPECT_EQ(run("setup --yes"), 0) << errors;
-  EXPECT_THAT(output, HasSubstr("Already in the settings: " + home + "/Maildir\n"));
+  EXPECT_THAT(outputOf("setup --yes"),
+              HasSubstr("Already in the settings: " + home + "/Maildir\n"));
   EXPECT_THAT(output, HasSubstr("All is set up and at work"));
   EXPECT_THAT(unitCalls(), IsEmpty());
   EXPECT_EQ(read("config/tallow/config.toml"), before);
-  EXPECT_EQ(run("setup"), 0) << errors;
-  EXPECT_THAT(output, HasSubstr("All is set up."));
+  EXPECT_THAT(outputOf("setup"), HasSubstr("All is set up."));
   // New mail is added; a watch that runs gets the new settings.
   makeMaildir(home + "/mail/lists", 1);
   EXPECT_EQ(run("setup --yes " + home + "/mail/../mail"), 0) << errors;
@@ -276,8 +244,7 @@ TEST_F(SetupTest, KeepsWhatTheSettingsSay) {
   fs::remove(directory / "systemctl.log");
   for (const char* const wrong : {"roots = [\n", "rots = []\n", "roots = \"x\"\n"}) {
     write("dotfiles/config.toml", wrong);
-    EXPECT_EQ(run("setup --yes"), 2);
-    EXPECT_THAT(errors, HasSubstr("config.toml:1: "));
+    EXPECT_THAT(errorsOf("setup --yes"), HasSubstr("config.toml:1: "));
     EXPECT_EQ(read("dotfiles/config.toml"), wrong);
   }
   EXPECT_THAT(unitCalls(), IsEmpty());
@@ -306,31 +273,27 @@ TEST_F(SetupTest, WorksWithoutSystemd) {
   EXPECT_THAT(errors, HasSubstr("there is no systemctl"));
   EXPECT_THAT(output, HasSubstr("\n2 added\n`tallow watch` keeps the index in step"));
   // A daemon somewhere else is not that of the units.
-  EXPECT_EQ(run("setup --yes --runtime-dir " + daemon->runtimeDirectory()), 0) << errors;
-  EXPECT_THAT(output, HasSubstr("stay as they are"));
+  EXPECT_THAT(outputOf("setup --yes --runtime-dir " + daemon->runtimeDirectory()),
+              HasSubstr("stay as they are"));
   EXPECT_THAT(unitCalls(), IsEmpty());
 }
 
 TEST_F(SetupTest, RefusesWhatCannotBeRight) {
-  EXPECT_EQ(run("setup --yes"), 2);
-  EXPECT_THAT(errors, HasSubstr("no mail was found"));
+  EXPECT_THAT(errorsOf("setup --yes"), HasSubstr("no mail was found"));
   makeMaildir(home + "/Maildir", 1);
-  EXPECT_EQ(run("setup --yes " + home + "/Maildir " + home + "/none"), 2);
-  EXPECT_THAT(errors, HasSubstr("/none: there is no such file or directory"));
+  EXPECT_THAT(errorsOf("setup --yes " + home + "/Maildir " + home + "/none"),
+              HasSubstr("/none: there is no such file or directory"));
   makeMaildir(home + "/a\xFF", 1);
-  EXPECT_EQ(run("setup --yes " + home + "/a\xFF"), 2);
-  EXPECT_THAT(errors, HasSubstr("which is not UTF-8"));
+  EXPECT_THAT(errorsOf("setup --yes " + home + "/a\xFF"), HasSubstr("which is not UTF-8"));
   EXPECT_EQ(run("setup --yes", "HOME="), 2);
   EXPECT_EQ(run("setup --yes --format=json"), 2);
   if (geteuid() == 0) {
-    EXPECT_EQ(run("setup --yes", "SUDO_USER=mara"), 2);
-    EXPECT_THAT(errors, HasSubstr("run it without sudo"));
+    EXPECT_THAT(errorsOf("setup --yes", "SUDO_USER=mara"), HasSubstr("run it without sudo"));
   }
   EXPECT_FALSE(fs::exists(settings));
   // A place for the settings that cannot be written.
   write("config", "a file");
-  EXPECT_EQ(run("setup --yes"), 2);
-  EXPECT_THAT(errors, HasSubstr("/config"));
+  EXPECT_THAT(errorsOf("setup --yes"), HasSubstr("/config"));
   EXPECT_THAT(unitCalls(), IsEmpty());
 }
 
@@ -347,13 +310,11 @@ TEST_F(SetupTest, AnInterruptLeavesTheRestToTheWatch) {
       reply.send({});
     });
   }
-  const std::string command = fmt::format(
-      "env -u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY {1} sh -c 'echo $$ >{0}/pid; "
-      "exec " TALLOW_PROGRAM " setup --yes >{0}/out 2>{0}/err </dev/null'",
-      directory.path(), environment());
-  EXPECT_EQ(WEXITSTATUS(std::system(command.c_str())), 0) << read("err");
-  EXPECT_THAT(read("out"), testing::EndsWith("interrupted\ntallow-watch.service continues; `tallow "
-                                             "status` shows how far.\n"));
+  EXPECT_EQ(
+      shell("env " + environment + " sh -c 'echo $$ >pid; exec " TALLOW_PROGRAM " setup --yes'"), 0)
+      << errors;
+  EXPECT_THAT(output, testing::EndsWith("interrupted\ntallow-watch.service continues; `tallow "
+                                        "status` shows how far.\n"));
   EXPECT_TRUE(fs::exists(directory / "active.tallow-watch.service"));
 }
 
@@ -362,10 +323,7 @@ TEST_F(SetupTest, AsksOnATerminal) {
   makeMaildir(home + "/Mail", 1);
   makeMaildir(home + "/Maildir", 1);
   startDaemon();
-  start(
-      "env -u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY PS1='ready> ' bash --norc "
-      "--noprofile -i",
-      100, 30);
+  start(fmt::format("env {} PS1='ready> ' bash --norc --noprofile -i", kUnset), 100, 30);
   const auto open = [&](const char* answer, const char* after) {
     await("ready>");
     type("clear");

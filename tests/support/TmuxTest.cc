@@ -19,7 +19,7 @@ void TmuxTest::start(const std::string& command, int columns, int rows) const {
 }
 
 std::string TmuxTest::tmux(const std::string& arguments) const {
-  return outputOf(fmt::format(
+  return testsupport::outputOf(fmt::format(
       "env -u TMUX -u STATE_DIRECTORY LC_ALL=C.UTF-8 HOME={0} XDG_STATE_HOME={0}/client "
       "XDG_CONFIG_HOME={0}/config TZ=UTC SHELL=/bin/bash {1} tmux -u -f /dev/null -S {0}/tmux {2}",
       directory.path(), variables, arguments));

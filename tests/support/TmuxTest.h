@@ -1,18 +1,16 @@
 #pragma once
 
-#include <gtest/gtest.h>
-
 #include <functional>
 #include <string>
 #include <vector>
 
 #include "tests/support/Programs.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 namespace testsupport {
 
 // A test of programs in a real terminal, which tmux provides. The home directory is `directory`.
-class TmuxTest : public testing::Test {
+class TmuxTest : public ShellTest {
  protected:
   void TearDown() override { tmux("kill-server"); }
 
@@ -32,8 +30,7 @@ class TmuxTest : public testing::Test {
   void await(const std::string& text) const;
   void awaitGone(const std::string& text) const;
 
-  const TemporaryDirectory directory;
-  std::string variables;  // environment variables of the programs, NAME=VALUE
+  std::string variables;  // environment variables of the programs in the terminal, NAME=VALUE
 };
 
 }  // namespace testsupport
