@@ -13,12 +13,12 @@
 namespace fs = std::filesystem;
 using testing::HasSubstr;
 using testing::StartsWith;
-using testsupport::ShellTest;
+using IndexTest = testsupport::ShellTest;
 
 // Everyday use of indexed mail, with the program and a real daemon.
 namespace {
 
-class EverydayTest : public ShellTest {
+class EverydayTest : public testsupport::ShellTest {
  protected:
   void SetUp() override {
     ASSERT_TRUE(daemon.ready());
@@ -283,7 +283,7 @@ TEST_F(EverydayTest, WritesTheStatusAsAPage) {
 }
 
 // The signal comes while the daemon has the first batch.
-TEST_F(ShellTest, AnInterruptLeavesASummary) {
+TEST_F(IndexTest, AnInterruptLeavesASummary) {
   testsupport::FakeDaemon daemon;
   daemon.answer("IndexItems", [&](rpc::Reply& reply) {
     kill(std::atoi(read("pid").c_str()), SIGINT);

@@ -1,9 +1,7 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <filesystem>
-#include <fstream>
 #include <memory>
 
 #include "desktop/DesktopService.h"
@@ -11,6 +9,7 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/desktop/DesktopSession.h"
 #include "tests/support/Programs.h"
+#include "tests/support/ShellTest.h"
 
 using testing::HasSubstr;
 using testing::Not;
@@ -22,41 +21,34 @@ constexpr const char* kShell = "org.gnome.Shell.SearchProvider2";
 constexpr const char* kRunner = "org.kde.krunner1";
 
 // Every operation, called by general D-Bus tools, with a daemon that holds the sample mail.
-class DesktopToolsTest : public testing::Test {
+class DesktopToolsTest : public testsupport::ShellTest {
  protected:
   void SetUp() override {
     NEED_PROGRAMS("dbus-daemon", "gdbus", "busctl")
     ASSERT_TRUE(daemon.ready());
     std::filesystem::copy(TALLOW_SAMPLE_MAIL, mail, std::filesystem::copy_options::recursive);
-    ASSERT_EQ(run(fmt::format("{} --runtime-dir {} index {}", TALLOW_PROGRAM,
-                              daemon.runtimeDirectory(), mail)),
-              0);
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+    ASSERT_EQ(run("index " + mail), 0) << errors;
     open(true);
   }
   void open(bool withOpener) {
     session = std::make_unique<testsupport::DesktopSession>(daemon.runtimeDirectory(), withOpener);
   }
 
-  int run(const std::string& command) {
-    const int status =
-        std::system(fmt::format("{} >'{}' 2>&1", command, directory / "out").c_str());
-    output = platform::readFile(directory / "out", kMaxFileBytes, nullptr).value_or("");
-    return status;
-  }
   // The output of a call by gdbus, or of one by busctl.
   std::string gdbus(const char* interface, const std::string& call) {
-    EXPECT_EQ(run(fmt::format("gdbus call --address {} --dest {} --object-path {} --method {}.{}",
-                              session->address(), desktop::kBusName, desktop::kObjectPath,
-                              interface, call)),
+    EXPECT_EQ(shell(fmt::format("gdbus call --address {} --dest {} --object-path {} --method {}.{}",
+                                session->address(), desktop::kBusName, desktop::kObjectPath,
+                                interface, call)),
               0)
-        << output;
+        << errors;
     return output;
   }
   std::string busctl(const char* interface, const std::string& call) {
-    EXPECT_EQ(run(fmt::format("busctl --address={} call {} {} {} {}", session->address(),
-                              desktop::kBusName, desktop::kObjectPath, interface, call)),
+    EXPECT_EQ(shell(fmt::format("busctl --address={} call {} {} {} {}", session->address(),
+                                desktop::kBusName, desktop::kObjectPath, interface, call)),
               0)
-        << output;
+        << errors;
     return output;
   }
   // The first identifier in an output, which puts it in quotes.
@@ -67,11 +59,9 @@ class DesktopToolsTest : public testing::Test {
                : text.substr(begin, text.find_first_of("'\"", begin) - begin);
   }
 
-  const testsupport::TemporaryDirectory directory;
   const std::string mail = directory / "mail";
   const testsupport::DaemonProcess daemon{directory.path()};
   std::unique_ptr<testsupport::DesktopSession> session;
-  std::string output;
 };
 
 std::string fileOf(const std::string& name) {

@@ -1,10 +1,7 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <regex>
 
 #include "platform/Files.h"
@@ -27,26 +24,16 @@ class MailProgramsTest : public testsupport::TmuxTest {
   void prepare() {
     ASSERT_TRUE(daemon.ready());
     if (!fs::exists(mail)) fs::copy(TALLOW_SAMPLE_MAIL, mail, fs::copy_options::recursive);
-    fs::create_directories(directory / "bin");
-    fs::create_symlink(TALLOW_PROGRAM, directory / "bin/tallow");
     write("bin/editor", "#!/bin/sh\ncp \"$1\" \"$HOME/reply\"\n");
+    fs::create_symlink(TALLOW_PROGRAM, directory / "bin/tallow");
     fs::permissions(directory / "bin/editor", fs::perms::owner_all);
     variables = fmt::format(
         "PATH={0}/bin:$PATH RUNTIME_DIRECTORY={1} STATE_DIRECTORY={0}/state TERM=xterm-256color",
         directory.path(), daemon.runtimeDirectory());
-    ASSERT_EQ(std::system(fmt::format("{} --runtime-dir {} index {} >/dev/null 2>&1",
-                                      TALLOW_PROGRAM, daemon.runtimeDirectory(), mail)
-                              .c_str()),
-              0);
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+    ASSERT_EQ(run("index " + mail), 0) << errors;
   }
 
-  void write(const std::string& name, const std::string& text) const {
-    fs::create_directories(fs::path(directory / name).parent_path());
-    std::ofstream(directory / name) << text;
-  }
-  [[nodiscard]] std::string read(const std::string& name) const {
-    return platform::readFile(directory / name, 100000, nullptr).value_or("");
-  }
   // One of the files that are tested.
   [[nodiscard]] static std::string settings(const std::string& name) {
     return platform::readFile(std::string(TALLOW_MAIL_PROGRAMS) + '/' + name, 100000, nullptr)
@@ -135,9 +122,7 @@ TEST_F(MailProgramsTest, Aerc) {
   NEED_PROGRAMS("tmux", "aerc")
   prepare();
   configureAerc(directory / "bin/editor");
-  ASSERT_EQ(std::system((variables + " HOME=" + directory.path() +
-                         " tallow search --maildir=" + folder + " >/dev/null")
-                            .c_str()),
+  ASSERT_EQ(shell(variables + " HOME=" + directory.path() + " tallow search --maildir=" + folder),
             0);
   start("aerc", 120, 30);
   await("Elena Ruiz");
@@ -199,18 +184,14 @@ TEST_F(MailProgramsTest, Emacs) {
 // Nothing of a mail changes the list, and the file compiles without a warning.
 TEST_F(MailProgramsTest, EmacsWithHostileMail) {
   NEED_PROGRAMS("tmux", "emacs")
-  fs::create_directories(mail);
   write("mail/a.eml",
         "From: \"a\x1b[2J\u202E\" <a@example.org>\nSubject: hostile\x07\u202E\u2066 " +
             std::string(100000, 'm') + "\nReply-To: b@example.org\n\nhostile\n");
   prepare();
-  EXPECT_EQ(std::system(fmt::format("cp {1}/tallow.el {0} && cd {0} && emacs -Q --batch --eval "
-                                    "'(setq byte-compile-error-on-warn t)' -f batch-byte-compile "
-                                    "tallow.el >{0}/compiled 2>&1",
-                                    directory.path(), TALLOW_MAIL_PROGRAMS)
-                            .c_str()),
+  EXPECT_EQ(shell("cp " TALLOW_MAIL_PROGRAMS "/tallow.el . && emacs -Q --batch --eval "
+                  "'(setq byte-compile-error-on-warn t)' -f batch-byte-compile tallow.el"),
             0)
-      << read("compiled");
+      << errors;
   start("emacs -nw -Q -l " + directory / "tallow.elc -f tallow-search", 110, 40);
   await("Search mail:");
   type("hostile");

@@ -1,20 +1,11 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
 
-#include <chrono>
 #include <csignal>
-#include <cstdio>
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
-#include <functional>
 #include <memory>
-#include <sstream>
 
 #include "cli/Terminal.h"
-#include "platform/Files.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/TmuxTest.h"
 
@@ -26,8 +17,6 @@ using testing::HasSubstr;
 using testing::Not;
 
 namespace {
-
-using testsupport::outputOf;
 
 class ScreenProcessTest : public testsupport::TmuxTest {
  protected:
@@ -41,26 +30,23 @@ class ScreenProcessTest : public testsupport::TmuxTest {
     daemon.reset();
     daemon = std::make_unique<testsupport::DaemonProcess>(directory.path());
     ASSERT_TRUE(daemon->ready());
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon->runtimeDirectory();
   }
-  void index() const {
-    ASSERT_EQ(std::system(fmt::format("{} index {} >/dev/null 2>&1", program(), mail).c_str()), 0);
-  }
-  [[nodiscard]] std::string program() const {
-    return TALLOW_PROGRAM " --runtime-dir " + daemon->runtimeDirectory();
-  }
+  void index() { ASSERT_EQ(run("index " + mail), 0) << errors; }
 
   // Starts a shell in a terminal of this size, and the program in it.
   void open(int columns, int rows, const std::string& arguments = "") {
     start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
     await("ready>");
-    type(program() + arguments);
+    type(tallow + arguments);
     press("Enter");
     await("Search:");
   }
   // The process ID of the program, a child of the shell.
   [[nodiscard]] pid_t process() const {
     const int shell = std::atoi(tmux("display-message -p -t t '#{pane_pid}'").c_str());
-    return std::atoi(outputOf(fmt::format("cat /proc/{0}/task/{0}/children", shell)).c_str());
+    return std::atoi(
+        testsupport::outputOf(fmt::format("cat /proc/{0}/task/{0}/children", shell)).c_str());
   }
   // Expects that the program has ended with this status, and that the terminal is in line mode with
   // echo again.
@@ -153,8 +139,7 @@ TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
   awaitThat([&](const std::string&) { return fs::exists(directory / "opened"); },
             "the mail being opened");
   await("1-1 of 1");
-  EXPECT_THAT(platform::readFile(directory / "opened", 100000, nullptr).value_or(""),
-              HasSubstr("Subject: Oarlock fixed"));
+  EXPECT_THAT(read("opened"), HasSubstr("Subject: Oarlock fixed"));
   press("Escape");
   expectRestored();
 }
@@ -189,22 +174,20 @@ TEST_F(ScreenProcessTest, DrawsAnySize) {
 // No mail text may move what is shown next to it or below it.
 TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
   fs::remove_all(mail);
-  fs::create_directories(mail);
   const std::string bad =
       "\x1b[2J\x1b]0;title\x07\u009B31m\u202Egnp.exe\u2066\u0645\u0631\u062D\u0628\u0627 "
       "\u05E9\u05DC\u05D5\u05DD "
       "z\u0301\u0302\u0303\u0304\u0305\u0306\u0307\u0308\u0309 "
       "\u4EAC\u90FD\u200D\u2764\uFE0F\U0001F44B\U0001F3FD "
       "\U0001F468\u200D\U0001F469\u200D\U0001F467 \xC3\x28 \xFF";
-  std::ofstream(mail + "/1.eml") << "From: \"" << bad << "\" <a@example.org>\nSubject: hostile "
-                                 << bad << std::string(1000000, 'M')
-                                 << "\nDate: Mon, 08 Jan 2024 08:49:00 +0000\n\n"
-                                 << "hostile\n"
-                                 << bad << "\n\n"
-                                 << std::string(5000, '\t') << bad << "\x0E\x8D\n";
-  std::ofstream(mail + "/2\n\x1b[2J\u202E.eml")
-      << "From: b@example.org\nSubject: hostile but plain\nDate: Mon, 08 Jan 2023 08:49:00 "
-         "+0000\n\nhostile\n";
+  write("mail/1.eml",
+        fmt::format("From: \"{0}\" <a@example.org>\nSubject: hostile {0}{1:M>1000000}\n"
+                    "Date: Mon, 08 Jan 2024 08:49:00 +0000\n\n"
+                    "hostile\n{0}\n\n{1:\t>5000}{0}\x0E\x8D\n",
+                    bad, ""));
+  write("mail/2\n\x1b[2J\u202E.eml",
+        "From: b@example.org\nSubject: hostile but plain\n"
+        "Date: Mon, 08 Jan 2023 08:49:00 +0000\n\nhostile\n");
   index();
   open(90, 24);
   type("hostile");
@@ -279,7 +262,7 @@ TEST_F(ScreenProcessTest, RestoresTheTerminal) {
   // The exit statuses that a shell reports; SIGINT has the effect of Ctrl-C.
   for (const auto& [signal, status] : {std::pair(SIGTERM, 143), {SIGHUP, 129}, {SIGINT, 0}}) {
     press("C-l");
-    type(program());
+    type(tallow);
     press("Enter");
     await("Search:");
     ASSERT_EQ(kill(process(), signal), 0);
