@@ -125,12 +125,7 @@ TEST_F(InspectTest, ValidateReportsEachFault) {
       18);
   const std::string shortPage("\x02", 1);
   const std::string otherOptions(48, '\0');
-  const struct {
-    std::function<void()> make;
-    int status;
-    std::string line;
-    int dumpStatus;
-  } cases[] = {
+  const std::tuple<std::function<void()>, int, std::string, int> cases[] = {
       {page, 0, "", 0},
       {[&] {
          makeIndex({kSecond, kFirst});
@@ -157,16 +152,16 @@ TEST_F(InspectTest, ValidateReportsEachFault) {
        },
        1, "Assertion failed: op.Valid()", 2},
   };
-  for (const auto& c : cases) {
-    c.make();
+  for (const auto& [make, status, line, dumpStatus] : cases) {
+    make();
     const auto before = files();
-    EXPECT_EQ(run("validate"), c.status) << c.line;
-    EXPECT_THAT(output, StartsWith(c.status == 0 ? "valid\n" : "not valid\n"));
-    EXPECT_THAT(errors, HasSubstr(c.line));
-    EXPECT_EQ(run("validate --format=json"), c.status) << c.line;
-    EXPECT_EQ(nlohmann::json::parse(output).at("valid"), c.status == 0);
-    EXPECT_EQ(run("dump"), c.dumpStatus) << c.line;
-    EXPECT_EQ(files(), before) << c.line;
+    EXPECT_EQ(run("validate"), status) << line;
+    EXPECT_THAT(output, StartsWith(status == 0 ? "valid\n" : "not valid\n"));
+    EXPECT_THAT(errors, HasSubstr(line));
+    EXPECT_EQ(run("validate --format=json"), status) << line;
+    EXPECT_EQ(nlohmann::json::parse(output).at("valid"), status == 0);
+    EXPECT_EQ(run("dump"), dumpStatus) << line;
+    EXPECT_EQ(files(), before) << line;
   }
 }
 

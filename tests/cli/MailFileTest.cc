@@ -1,5 +1,4 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <lzma.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -51,7 +50,7 @@ class MailFileTest : public testing::Test {
     return path;
   }
 
-  void read(const std::string& path, bool named = true) {
+  void readFile(const std::string& path, bool named = true) {
     messages.clear();
     places.clear();
     failures.clear();
@@ -71,7 +70,7 @@ class MailFileTest : public testing::Test {
         [this](const std::string&) { ++ignored; }, [](uint64_t) {}};
     finished = cli::readMailFile(path, named, sink);
   }
-  void readBytes(const std::string& bytes) { read(write("box", bytes)); }
+  void readBytes(const std::string& bytes) { readFile(write("box", bytes)); }
 
   testsupport::TemporaryDirectory directory;
   std::vector<std::string> messages;
@@ -90,10 +89,7 @@ const std::string kTwo = kFrom + "Subject: a\n\none\n\n" + kFrom + "Subject: b\n
 
 TEST_F(MailFileTest, SplitsAnMboxAtItsFromLines) {
   const std::string crlf = "From m@example.org Mon Jan  8 08:49:00 2024\r\n";
-  const struct {
-    std::string bytes;
-    std::vector<std::string> messages;
-  } kCases[] = {
+  const std::pair<std::string, std::vector<std::string>> cases[] = {
       {kTwo, {"Subject: a\n\none\n", "Subject: b\n\ntwo\n"}},
       {crlf + "A: a\r\n\r\none\r\n\r\n" + crlf + "B: b\r\n\r\ntwo\r\n",
        {"A: a\r\n\r\none\r\n", "B: b\r\n\r\ntwo\r\n"}},
@@ -107,9 +103,9 @@ TEST_F(MailFileTest, SplitsAnMboxAtItsFromLines) {
       {kFrom, {""}},
       {kFrom + "\n" + kFrom + "A: a\n", {"\n", "A: a\n"}},
   };
-  for (const auto& c : kCases) {
-    readBytes(c.bytes);
-    EXPECT_EQ(messages, c.messages) << c.bytes;
+  for (const auto& [bytes, expected] : cases) {
+    readBytes(bytes);
+    EXPECT_EQ(messages, expected) << bytes;
     EXPECT_THAT(failures, IsEmpty());
     EXPECT_TRUE(finished);
   }
@@ -182,14 +178,7 @@ TEST_F(MailFileTest, TruncatedCompressionIsReported) {
 
 TEST_F(MailFileTest, DetectsTheKindOfAFile) {
   const std::string message = "Subject: a\nfrom: b\n\ntext\n";
-  const struct {
-    const char* name;
-    std::string bytes;
-    bool named;
-    size_t messages;
-    size_t failures;
-    int ignored;
-  } kCases[] = {
+  const std::tuple<const char*, std::string, bool, size_t, size_t, int> cases[] = {
       {"empty", "", true, 0, 0, 0},
       {"message", message, false, 1, 0, 0},
       {"message.gz", gzip(message), false, 1, 0, 0},
@@ -198,26 +187,26 @@ TEST_F(MailFileTest, DetectsTheKindOfAFile) {
       {"notes.txt", "Dear diary", true, 0, 1, 0},
       {"settings", "key: value\n", false, 0, 0, 1},
   };
-  for (const auto& c : kCases) {
-    read(write(c.name, c.bytes), c.named);
-    EXPECT_EQ(messages.size(), c.messages) << c.name;
-    EXPECT_EQ(failures.size(), c.failures) << c.name;
-    EXPECT_EQ(ignored, c.ignored) << c.name;
+  for (const auto& [name, bytes, named, read, failed, passed] : cases) {
+    readFile(write(name, bytes), named);
+    EXPECT_EQ(messages.size(), read) << name;
+    EXPECT_EQ(failures.size(), failed) << name;
+    EXPECT_EQ(ignored, passed) << name;
   }
-  read(directory / "nowhere");
+  readFile(directory / "nowhere");
   EXPECT_THAT(failures, ElementsAre("nowhere: cannot open: No such file or directory"));
   mkfifo((directory / "pipe").c_str(), 0600);
-  read(directory / "pipe");
+  readFile(directory / "pipe");
   EXPECT_THAT(failures, ElementsAre("pipe: not a regular file"));
 }
 
 TEST_F(MailFileTest, FoldersAreNamedAfterTheirPlace) {
   platform::createDirectories(directory / ".Sent/cur", nullptr);
-  read(write(".Sent/cur/1:2,S", "A: a\n\n"));
+  readFile(write(".Sent/cur/1:2,S", "A: a\n\n"));
   EXPECT_EQ(folder, "Sent " + directory / ".Sent");
-  read(write("plain.eml", "A: a\n\n"));
+  readFile(write("plain.eml", "A: a\n\n"));
   EXPECT_EQ(folder.substr(folder.find(' ') + 1), directory.path());
-  read(write("archive.mbox.gz", gzip(kTwo)));
+  readFile(write("archive.mbox.gz", gzip(kTwo)));
   EXPECT_EQ(folder, "archive " + directory / "archive.mbox.gz");
 }
 

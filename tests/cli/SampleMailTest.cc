@@ -1,5 +1,4 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <map>
 
@@ -71,10 +70,7 @@ TEST_F(SampleMail, EveryMessageIsRead) {
 }
 
 TEST_F(SampleMail, EveryFormOfTextArrives) {
-  const struct {
-    const char* subject;
-    const char* words;
-  } kCases[] = {
+  const std::pair<const char*, const char*> cases[] = {
       {"Keys for the boat shed", "padlock is stiff"},
       {"Café de la Gare, vendredi ?", "la crème\nbrûlée"},
       {"京都旅行の予定", "新幹線の切符"},
@@ -91,7 +87,7 @@ TEST_F(SampleMail, EveryFormOfTextArrives) {
       {"Randonnée dimanche", "belvédère"},
       {"Recipe for miso soup", "味噌汁"},
   };
-  for (const auto& c : kCases) EXPECT_THAT(body(c.subject), HasSubstr(c.words)) << c.subject;
+  for (const auto& [name, words] : cases) EXPECT_THAT(body(name), HasSubstr(words)) << name;
   const std::string empty = "(no text, see subject) bring the ladder please";
   EXPECT_FALSE(named(empty).stringValueForKey(Key::TEXT_CONTENT).has_value());
   for (const auto& [subject, words] :

@@ -307,10 +307,7 @@ TEST_F(SearchModel, RandomSearchesMatchAScanOfAllMails) {
 // Conditions of the query language on times, numbers and flags apply as well.
 TEST_F(SearchModel, FiltersMatchAScanOfAllMails) {
   const std::string date = "com_quill_mail_dateReceived";
-  const struct {
-    std::vector<std::string> filters;
-    const char* same;
-  } kCases[] = {
+  const std::pair<std::vector<std::string>, const char*> cases[] = {
       {{date + " >= $time.iso(2024-02-01)"}, "a date:2024-02-01.. "},
       {{date + " < $time.iso(2024-02-01)"}, "a before:2024-02 "},
       {{date + " < $time.iso(2024-02-01) || kTLItemAuthors = \"mara lindqvist\""},
@@ -320,8 +317,8 @@ TEST_F(SearchModel, FiltersMatchAScanOfAllMails) {
       {{"com_quill_mail_flagged == 1"}, "a is:flagged "},
       {{"com_quill_mail_read == 1", "kTLItemSubject != \"re\""}, "a is:read -subject:re"},
   };
-  for (const auto& c : kCases) {
-    EXPECT_EQ(found("a ", c.filters), expected(c.same)) << c.same;
-    EXPECT_FALSE(expected(c.same).empty()) << c.same;
+  for (const auto& [filters, same] : cases) {
+    EXPECT_EQ(found("a ", filters), expected(same)) << same;
+    EXPECT_FALSE(expected(same).empty()) << same;
   }
 }
