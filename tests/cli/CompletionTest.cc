@@ -41,8 +41,7 @@ class CompletionTest : public testsupport::TmuxTest {
   // Types this and Tab in an empty line, and waits for the text.
   void complete(const std::string& line, const std::string& expected) const {
     press("C-u");
-    type("clear");
-    press("Enter");
+    enter("clear");
     awaitThat([](const std::string& seen) { return seen.find("clear") == std::string::npos; },
               "an empty screen");
     type(line);
@@ -79,16 +78,14 @@ TEST_F(CompletionTest, Bash) {
   // With the package bash-completion, which loads the script, and without it.
   const bool package = fs::exists("/usr/share/bash-completion/bash_completion");
   EXPECT_TRUE(package || !testsupport::isCI()) << "bash-completion is missing";
-  type(fmt::format("cd {}/work; bind \"set enable-bracketed-paste off\"; source {}; clear",
-                   directory.path(),
-                   package ? "/usr/share/bash-completion/bash_completion"
-                           : directory / "share/completions/tallow"));
-  press("Enter");
+  enter(fmt::format("cd {}/work; bind \"set enable-bracketed-paste off\"; source {}; clear",
+                    directory.path(),
+                    package ? "/usr/share/bash-completion/bash_completion"
+                            : directory / "share/completions/tallow"));
   awaitGone("source");
   expectCompletions();
   press("C-u");
-  type("complete -r tallow; source ../share/completions/tallow; clear");
-  press("Enter");
+  enter("complete -r tallow; source ../share/completions/tallow; clear");
   awaitGone("source");
   expectCompletions();
 }
@@ -97,11 +94,10 @@ TEST_F(CompletionTest, Zsh) {
   NEED_PROGRAMS("zsh", "tmux")
   writeScript("zsh", "functions/_tallow");
   start("exec zsh -f -i", 100, 20);
-  type(
+  enter(
       fmt::format("PS1=\"ready> \"; cd {}/work; fpath=({}/functions $fpath); autoload -U compinit; "
                   "compinit -u -D; clear",
                   directory.path(), directory.path()));
-  press("Enter");
   await("ready>");
   awaitGone("compinit");
   expectCompletions();

@@ -326,22 +326,18 @@ TEST_F(SetupTest, AsksOnATerminal) {
   start(fmt::format("env {} PS1='ready> ' bash --norc --noprofile -i", kUnset), 100, 30);
   const auto open = [&](const char* answer, const char* after) {
     await("ready>");
-    type("clear");
-    press("Enter");
+    enter("clear");
     awaitGone("[");  // the question of the run before
-    type(TALLOW_PROGRAM " setup; echo status=$?");
-    press("Enter");
+    enter(TALLOW_PROGRAM " setup; echo status=$?");
     await("or \"none\" [");
-    type(answer);
-    press("Enter");
+    enter(answer);
     await(after);
   };
   open("none", "status=2");
   EXPECT_THAT(screen(), HasSubstr("nothing has been changed"));
   EXPECT_FALSE(fs::exists(settings));
   open("3", "or \"none\" [all] 3\nWhich");  // asks again
-  type("2");
-  press("Enter");
+  enter("2");
   await("status=0");
   EXPECT_THAT(roots(), ElementsAre(home + "/Maildir"));
   // Later, the answer is none unless the user wants more.

@@ -92,23 +92,20 @@ TEST_F(MailProgramsTest, Neomutt) {
   // In the open folder.
   press("M-s");
   await("Limit to messages matching: ~I");
-  type("first invoice");
-  press("Enter");
+  enter("first invoice");
   await("[Msgs:1/10 ");
   await("First invoice for the shelves");
   // In all folders.
   press("S");
   await("Search:");
-  type("invoice for");
-  press("Enter");
+  enter("invoice for");
   await("search [Msgs:7 ");
   await("Your invoice 4471");
   EXPECT_EQ(links(), 7U);
   // The links are gone with the next search, and neomutt asks nothing about them.
   press("S");
   await("Search:");
-  type("brackets brass");
-  press("Enter");
+  enter("brackets brass");
   await("search [Msgs:1 ");
   EXPECT_EQ(links(), 1U);
   press("Enter");
@@ -135,8 +132,7 @@ TEST_F(MailProgramsTest, Aerc) {
                                      {"brackets brass", "First invoice for the shelves"}}) {
     press("S");
     await("Search:");
-    type(words);
-    press("Enter");
+    enter(words);
     await(found);
   }
   awaitThat([&](const std::string&) { return links() == 1; }, "one link");
@@ -169,8 +165,7 @@ TEST_F(MailProgramsTest, Emacs) {
   start(fmt::format("emacs -nw -Q -l {}/tallow.el -f tallow-search", TALLOW_MAIL_PROGRAMS), 110,
         40);
   await("Search mail:");
-  type("randonn\u00E9e");
-  press("Enter");
+  enter("randonn\u00E9e");
   await("2024-02-09 11:10 Ren\u00E9 Dufour");
   press("Enter");
   await("Bonjour,");
@@ -194,8 +189,7 @@ TEST_F(MailProgramsTest, EmacsWithHostileMail) {
       << errors;
   start("emacs -nw -Q -l " + directory / "tallow.elc -f tallow-search", 110, 40);
   await("Search mail:");
-  type("hostile");
-  press("Enter");
+  enter("hostile");
   await("1 of 1 mails");
   awaitThat(
       [](const std::string& seen) {

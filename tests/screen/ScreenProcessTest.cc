@@ -38,8 +38,7 @@ class ScreenProcessTest : public testsupport::TmuxTest {
   void open(int columns, int rows, const std::string& arguments = "") {
     start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
     await("ready>");
-    type(tallow + arguments);
-    press("Enter");
+    enter(tallow + arguments);
     await("Search:");
   }
   // The process ID of the program, a child of the shell.
@@ -52,8 +51,7 @@ class ScreenProcessTest : public testsupport::TmuxTest {
   // echo again.
   void expectRestored(int status = 0) const {
     awaitGone("Search:");
-    type("echo left=$?; stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"");
-    press("Enter");
+    enter("echo left=$?; stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"");
     await(fmt::format("left={}\n4\n", status));
   }
 
@@ -110,8 +108,7 @@ TEST_F(ScreenProcessTest, MailsAreReadSortedAndFiltered) {
   press("C-f");
   await("Folder:");
   press("C-u");
-  type("family");
-  press("Enter");
+  enter("family");
   await("in family");
   await("First invoice for the shelves");
   awaitGone("4471");
@@ -250,11 +247,9 @@ TEST_F(ScreenProcessTest, RestoresTheTerminal) {
   await("Stopped");
   await("ready>");
   press("C-l");
-  type("echo be''tween");
-  press("Enter");
+  enter("echo be''tween");
   await("\nbetween");
-  type("fg");
-  press("Enter");
+  enter("fg");
   await("Search: invoice");
   await("Your invoice 4471");
   press("C-c");
@@ -262,8 +257,7 @@ TEST_F(ScreenProcessTest, RestoresTheTerminal) {
   // The exit statuses that a shell reports; SIGINT has the effect of Ctrl-C.
   for (const auto& [signal, status] : {std::pair(SIGTERM, 143), {SIGHUP, 129}, {SIGINT, 0}}) {
     press("C-l");
-    type(tallow);
-    press("Enter");
+    enter(tallow);
     await("Search:");
     ASSERT_EQ(kill(process(), signal), 0);
     expectRestored(status);

@@ -12,8 +12,8 @@
 namespace testsupport {
 
 int ShellTest::shell(const std::string& command) {
-  const std::string whole = fmt::format("cd {0} && ( {1} ) >{0}/out 2>{0}/err </dev/null",
-                                        directory.path(), command);
+  const std::string whole =
+      fmt::format("cd {0} && ( {1} ) >{0}/out 2>{0}/err </dev/null", directory.path(), command);
   const int status = WEXITSTATUS(std::system(whole.c_str()));
   output = read("out");
   errors = read("err");

@@ -33,6 +33,11 @@ void TmuxTest::press(const std::string& keys) const {
   tmux("send-keys -t t " + keys);
 }
 
+void TmuxTest::enter(const std::string& line) const {
+  type(line);
+  press("Enter");
+}
+
 std::string TmuxTest::screen() const {
   return tmux("capture-pane -p -t t");
 }

@@ -21,6 +21,7 @@ class TmuxTest : public ShellTest {
 
   void type(const std::string& text) const;  // without single quotes
   void press(const std::string& keys) const;
+  void enter(const std::string& line) const;  // types it and presses Enter
   [[nodiscard]] std::string screen() const;
   [[nodiscard]] std::vector<std::string> lines() const;
 
