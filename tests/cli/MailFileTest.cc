@@ -1,14 +1,13 @@
 #include <gmock/gmock.h>
-#include <lzma.h>
 #include <sys/stat.h>
 #include <unistd.h>
-#include <zlib.h>
 
 #include "cli/Identifier.h"
 #include "cli/LineReader.h"
 #include "cli/MailFile.h"
 #include "cli/MailWalker.h"
 #include "platform/Files.h"
+#include "tests/extract/Samples.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using testing::ElementsAre;
@@ -17,28 +16,11 @@ using testing::IsEmpty;
 namespace {
 
 std::string gzip(const std::string& bytes) {
-  z_stream stream{};
-  deflateInit2(&stream, 6, Z_DEFLATED, 15 + 16, 8, Z_DEFAULT_STRATEGY);
-  std::string out(compressBound(bytes.size()) + 64, '\0');
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
-  stream.avail_in = static_cast<uInt>(bytes.size());
-  stream.next_out = reinterpret_cast<Bytef*>(out.data());
-  stream.avail_out = static_cast<uInt>(out.size());
-  EXPECT_EQ(deflate(&stream, Z_FINISH), Z_STREAM_END);
-  out.resize(stream.total_out);
-  deflateEnd(&stream);
-  return out;
+  return samples::compressed(bytes, samples::Compression::gzip);
 }
 
 std::string xz(const std::string& bytes) {
-  std::string out(lzma_stream_buffer_bound(bytes.size()), '\0');
-  size_t size = 0;
-  EXPECT_EQ(lzma_easy_buffer_encode(6, LZMA_CHECK_CRC64, nullptr,
-                                    reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size(),
-                                    reinterpret_cast<uint8_t*>(out.data()), &size, out.size()),
-            LZMA_OK);
-  out.resize(size);
-  return out;
+  return samples::compressed(bytes, samples::Compression::xz);
 }
 
 // Reads one file and records what the sink receives.

@@ -2,9 +2,7 @@
 
 #include <map>
 
-#include "cli/MailFile.h"
-#include "cli/MailWalker.h"
-#include "cli/MessageParser.h"
+#include "tests/cli/SampleMail.h"
 
 using Key = TLAttributeKey;
 using testing::HasSubstr;
@@ -15,28 +13,8 @@ namespace {
 class SampleMail : public testing::Test {
  protected:
   static void SetUpTestSuite() {
-    cli::MessageParser parser;
-    const cli::MailSink sink{[&](std::string_view bytes, const cli::MessageOrigin& origin) {
-                               auto result = parser.parse(bytes, origin);
-                               auto* message = std::get_if<cli::ParsedMessage>(&result);
-                               EXPECT_NE(message, nullptr) << origin.identifier;
-                               EXPECT_FALSE(message->cut);
-                               add(*message->item);
-                               return true;
-                             },
-                             [](const std::string& where, const std::string& reason) {
-                               ADD_FAILURE() << where << ": " << reason;
-                               return true;
-                             },
-                             [](const std::string& path) { ADD_FAILURE() << path; },
-                             [](uint64_t) {}};
-    cli::walkMail(TALLOW_SAMPLE_MAIL, {[&](const std::string& path, bool named, uint64_t) {
-                                         return cli::readMailFile(path, named, sink);
-                                       },
-                                       [](const std::string& where, const std::string& reason) {
-                                         ADD_FAILURE() << where << ": " << reason;
-                                         return true;
-                                       }});
+    testsupport::forEachSampleMail(
+        [](auto&, auto, auto&, const TLIndexableItem& item) { add(item); });
   }
 
   static void add(const TLIndexableItem& item) {
@@ -49,9 +27,9 @@ class SampleMail : public testing::Test {
   }
   static const TLIndexableItem& named(const std::string& subject) {
     static const TLIndexableItem none;
-    const auto found = bySubject.find(subject);
-    EXPECT_NE(found, bySubject.end()) << subject;
-    return found == bySubject.end() ? none : *found->second;
+    const auto& found = bySubject[subject];
+    EXPECT_NE(found, nullptr) << subject;
+    return found == nullptr ? none : *found;
   }
   static std::string body(const std::string& subject) {
     return text(named(subject).stringValueForKey(Key::TEXT_CONTENT));

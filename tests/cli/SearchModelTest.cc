@@ -1,19 +1,16 @@
 #include <fmt/format.h>
-#include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <filesystem>
 #include <random>
 #include <set>
+#include <stdexcept>
 
-#include "cli/MailFile.h"
-#include "cli/MailWalker.h"
 #include "cli/QueryInput.h"
 #include "cli/SearchRun.h"
 #include "cli/TextMatch.h"
+#include "tests/cli/SampleMail.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/Seed.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 #include "tokenizer/TLLexemonAssetManager.h"
 #include "tokenizer/Tokenizer.h"
 
@@ -90,40 +87,21 @@ Mail mailOf(std::string_view bytes, const cli::MessageOrigin& origin, const TLIn
   return mail;
 }
 
-class SearchModel : public testing::Test {
+class SearchModel : public testsupport::ShellTest {
  protected:
-  SearchModel() : daemon(directory.path()), random(testsupport::firstSeed()) {
-    EXPECT_TRUE(daemon.ready());
-    const std::string index = std::string(TALLOW_PROGRAM) + " --runtime-dir " +
-                              daemon.runtimeDirectory() + " index " + TALLOW_SAMPLE_MAIL + " >" +
-                              directory / "out";
-    EXPECT_EQ(std::system(index.c_str()), 0);
-    readMails();
+  SearchModel() {
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+    EXPECT_EQ(run("index " TALLOW_SAMPLE_MAIL), 0) << errors;
+    testsupport::forEachSampleMail(
+        [this](const std::string& path, auto bytes, auto& origin, auto& item) {
+          mails.push_back(mailOf(bytes, origin, item));
+          const size_t at = path.find(":2,");
+          if (at != std::string::npos) mails.back().flags = path.substr(at + 3);
+        });
     for (const Mail& mail : mails) {
       for (const auto& [key, words] : mail.texts) texts.emplace_back(key, words);
     }
     std::erase_if(texts, [](const auto& text) { return text.second.empty(); });
-  }
-
-  void readMails() {
-    cli::MessageParser parser;
-    std::string flags;
-    const cli::MailSink sink{
-        [&](std::string_view bytes, const cli::MessageOrigin& origin) {
-          auto parsed = parser.parse(bytes, origin);
-          mails.push_back(mailOf(bytes, origin, *std::get<cli::ParsedMessage>(parsed).item));
-          mails.back().flags = flags;
-          return true;
-        },
-        [](const std::string&, const std::string&) { return true; }, [](const std::string&) {},
-        [](uint64_t) {}};
-    cli::walkMail(TALLOW_SAMPLE_MAIL,
-                  {[&](const std::string& path, bool named, uint64_t) {
-                     const size_t at = path.find(":2,");
-                     flags = at == std::string::npos ? "" : path.substr(at + 3);
-                     return cli::readMailFile(path, named, sink);
-                   },
-                   [](const std::string&, const std::string&) { return true; }});
   }
 
   size_t below(size_t limit) { return std::uniform_int_distribution<size_t>(0, limit - 1)(random); }
@@ -189,13 +167,13 @@ class SearchModel : public testing::Test {
       for (auto text = begin; text != end; ++text) {
         const Words& words = text->second;
         for (size_t at = 0; at + wanted.size() <= words.size(); ++at) {
-          bool same = true;
-          for (size_t i = 0; i < wanted.size(); ++i) {
-            const bool open = node.prefix && i + 1 == wanted.size();
-            same =
-                same && (open ? words[at + i].starts_with(wanted[i]) : words[at + i] == wanted[i]);
+          size_t same = 0;
+          for (; same < wanted.size(); ++same) {
+            const bool open = node.prefix && same + 1 == wanted.size();
+            const std::string& word = words[at + same];
+            if (open ? !word.starts_with(wanted[same]) : word != wanted[same]) break;
           }
-          if (same) return true;
+          if (same == wanted.size()) return true;
         }
       }
     }
@@ -252,15 +230,13 @@ class SearchModel : public testing::Test {
     const auto results =
         cli::runPlan(input->plan, {"default", cli::SortOrder::relevance, SIZE_MAX, false}, service,
                      facts, &error);
-    std::set<std::string> identifiers;
-    if (!results) ADD_FAILURE() << text << ": " << error->message;
-    if (!results) return identifiers;
+    if (!results) throw std::runtime_error(text + ": " + error->message);
     EXPECT_TRUE(results->complete);
+    std::set<std::string> identifiers;
     for (const auto& item : results->items) {
-      const auto added =
-          identifiers.insert(platform::toUTF8(platform::orEmpty(item->identifier())));
-      EXPECT_TRUE(added.second) << text;
+      identifiers.insert(platform::toUTF8(platform::orEmpty(item->identifier())));
     }
+    EXPECT_EQ(identifiers.size(), results->items.size()) << text;
     return identifiers;
   }
 
@@ -273,9 +249,8 @@ class SearchModel : public testing::Test {
     return identifiers;
   }
 
-  const testsupport::TemporaryDirectory directory;
-  const testsupport::DaemonProcess daemon;
-  std::mt19937 random;
+  const testsupport::DaemonProcess daemon{directory.path()};
+  std::mt19937 random{testsupport::firstSeed()};
   std::vector<Mail> mails;
   std::vector<std::pair<Key, Words>> texts;
   bool tooMany = false;

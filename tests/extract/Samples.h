@@ -16,6 +16,10 @@ struct ZipEntry {
 // A zip file; `deflated` compresses its entries.
 [[nodiscard]] std::string zip(const std::vector<ZipEntry>& entries, bool deflated = true);
 
+// The bytes as gzip(1) or xz(1) compress them.
+enum class Compression { gzip, xz };
+[[nodiscard]] std::string compressed(const std::string& bytes, Compression by);
+
 // An office document with these paragraphs.
 [[nodiscard]] std::string docx(const std::vector<std::string>& paragraphs);
 [[nodiscard]] std::string odt(const std::vector<std::string>& paragraphs);
