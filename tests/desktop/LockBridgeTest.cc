@@ -103,8 +103,10 @@ TEST_F(LockBridgeTest, StrictestClassIsClosedWithTheScreen) {
 }
 
 TEST_F(LockBridgeTest, FollowsSignalsAndHintOfItsSession) {
-  start({true, false});
-  EXPECT_EQ(status(), kOpen);
+  start({true, true});
+  EXPECT_EQ(status(), kLocked);
+  logind->setHint(false);
+  await(kOpen);
   logind->signalSession("Lock");
   await(kLocked);
   logind->signalSession("Unlock");
@@ -118,6 +120,8 @@ TEST_F(LockBridgeTest, FollowsSignalsAndHintOfItsSession) {
   logind->prepareForSleep(false);
   logind->setHint(false);
   await(kOpen);
+  EXPECT_EQ(bridge->end(SIGTERM), 0);
+  EXPECT_EQ(status(), kLocked);
 }
 
 // The status is on the disk before the bridge lets the device go to sleep.
@@ -135,7 +139,7 @@ TEST_F(LockBridgeTest, SleepWaitsForTheStatus) {
   }
 }
 
-TEST_F(LockBridgeTest, NoSessionIsLocked) {
+TEST_F(LockBridgeTest, FollowsSessionsAndIsLockedWithoutOne) {
   start({false, false});
   EXPECT_EQ(status(), kLocked);
   logind->beginSession(false);
@@ -146,20 +150,9 @@ TEST_F(LockBridgeTest, NoSessionIsLocked) {
   await(kOpen);
   logind->beginSession(true);
   await(kLocked);
-}
-
-TEST_F(LockBridgeTest, StartsLockedAndEndsLocked) {
-  start({true, true});
-  EXPECT_EQ(status(), kLocked);
   logind->setHint(false);
   await(kOpen);
-  EXPECT_EQ(bridge->end(SIGTERM), 0);
-  EXPECT_EQ(status(), kLocked);
-}
-
-TEST_F(LockBridgeTest, FollowsALogindThatWasRestarted) {
-  start({true, false});
-  EXPECT_EQ(status(), kOpen);
+  // logind is restarted.
   logind.reset();
   startLogind({false, false});
   await(kLocked);

@@ -108,6 +108,13 @@ std::string pdf(const std::vector<std::string>& pages, std::string_view font) {
   return pdfOf(objects);
 }
 
+std::string japanesePDF() {
+  return pdf({"<4EAC90FD>"},
+             "/Subtype/Type0/BaseFont/Any/Encoding/UniJIS-UTF16-H/DescendantFonts[<</Type/Font"
+             "/Subtype/CIDFontType0/BaseFont/Any/CIDSystemInfo<</Registry(Adobe)/Ordering(Japan1)"
+             "/Supplement 4>>/FontDescriptor<</Type/FontDescriptor/FontName/Any/Flags 4>>>>]");
+}
+
 std::string pdfOfManyPages(size_t count) {
   std::string kids;
   for (size_t i = 0; i < count; ++i) kids += fmt::format("{} 0 R ", i + 5);

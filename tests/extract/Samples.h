@@ -28,6 +28,10 @@ enum class Compression { gzip, xz };
 [[nodiscard]] std::string pdf(const std::vector<std::string>& pages,
                               std::string_view font = "/Subtype/Type1/BaseFont/Helvetica");
 
+// A PDF file with a page that says 京都, in a font without a table of its own: its character map is
+// one of the library's data.
+[[nodiscard]] std::string japanesePDF();
+
 // A PDF file whose page tree promises `count` pages with the same content.
 [[nodiscard]] std::string pdfOfManyPages(size_t count);
 
