@@ -22,8 +22,7 @@ std::string mboxOf(size_t messages, size_t bodyBytes) {
 TEST(IndexPipeline, BatchesAreBoundedAndKeepTheOrder) {
   const testsupport::TemporaryDirectory directory;
   const std::string path = directory / "box";
-  for (const auto& [messages, bodyBytes] :
-       {std::pair<size_t, size_t>{1201, 10}, std::pair<size_t, size_t>{100, 150000}}) {
+  for (const auto& [messages, bodyBytes] : {std::pair<size_t, size_t>{1201, 10}, {100, 150000}}) {
     ASSERT_TRUE(platform::writeFileAtomically(path, mboxOf(messages, bodyBytes), nullptr));
     cli::IndexPipeline pipeline({path});
     size_t seen = 0;

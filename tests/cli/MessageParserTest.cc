@@ -6,6 +6,7 @@
 
 #include "cli/MessageParser.h"
 #include "cli/TextBudget.h"
+#include "tests/support/Damage.h"
 
 using Key = TLAttributeKey;
 using Lines = std::vector<std::string>;
@@ -240,15 +241,8 @@ TEST(MessageParser, SurvivesRandomDamage) {
       "Content-Type: message/rfc822\n\nSubject: x\n\ny\n--b--\n";
   std::mt19937 random(3);
   for (int round = 0; round < 5000; ++round) {
-    std::string damaged = message;
-    for (size_t i = 0, n = 1 + random() % 8; i < n; ++i) {
-      const size_t at = random() % damaged.size();
-      const auto kind = random() % 3;
-      if (kind == 0) damaged[at] = static_cast<char>(random());
-      if (kind == 1) damaged.erase(at, random() % 9);
-      if (kind == 2) damaged.insert(at, damaged.substr(random() % damaged.size(), random() % 40));
-    }
+    const std::string bytes = testsupport::damaged(message, 8, random);
     std::string reason;
-    EXPECT_TRUE(parse(damaged, &reason) != nullptr || !reason.empty());
+    EXPECT_TRUE(parse(bytes, &reason) != nullptr || !reason.empty()) << bytes;
   }
 }

@@ -12,6 +12,7 @@
 #include "extract/ZipReader.h"
 #include "platform/Text.h"
 #include "tests/extract/Samples.h"
+#include "tests/support/Damage.h"
 #include "tests/support/Seed.h"
 
 namespace {
@@ -159,11 +160,7 @@ TEST(TextExtraction, SurvivesDamage) {
     for (size_t size = 0; size < whole.size(); size += 1 + size / 40) {
       check(kind, whole.substr(0, size));
     }
-    for (int i = 0; i < 100; ++i) {
-      std::string changed = whole;
-      for (int j = 0; j < 3; ++j) changed[random() % changed.size()] = static_cast<char>(random());
-      check(kind, changed);
-    }
+    for (int i = 0; i < 150; ++i) check(kind, testsupport::damaged(whole, 4, random));
     std::string noise(3000, '\0');
     for (char& c : noise) c = static_cast<char>(random());
     check(kind, noise);
