@@ -1,13 +1,12 @@
 #pragma once
 
-#include <fmt/format.h>
 #include <gmock/gmock.h>
 
 #include <cstdlib>
 #include <nlohmann/json.hpp>
 
 #include "cli/Commands.h"
-#include "platform/Files.h"
+#include "platform/Text.h"
 #include "querylang/TLQueryAdditions.h"
 #include "records/TLIndexableItem.h"
 #include "records/TLQuery.h"

@@ -45,8 +45,7 @@ class CompletionTest : public testsupport::TmuxTest {
     awaitThat([](const std::string& seen) { return seen.find("clear") == std::string::npos; },
               "an empty screen");
     type(line);
-    press("Tab");
-    await(expected);
+    press("Tab", expected);
   }
 
   // In both interactive shells.
@@ -62,8 +61,7 @@ class CompletionTest : public testsupport::TmuxTest {
     complete("tallow help pur", "tallow help purge");
     // An option of another command is none of this one.
     complete("tallow show --mai", "tallow show --mai");
-    type("z");
-    await("tallow show --maiz");
+    type("z", "tallow show --maiz");
   }
 };
 
@@ -97,8 +95,8 @@ TEST_F(CompletionTest, Zsh) {
   enter(
       fmt::format("PS1=\"ready> \"; cd {}/work; fpath=({}/functions $fpath); autoload -U compinit; "
                   "compinit -u -D; clear",
-                  directory.path(), directory.path()));
-  await("ready>");
+                  directory.path(), directory.path()),
+      "ready>");
   awaitGone("compinit");
   expectCompletions();
   // A list shows what each is for.

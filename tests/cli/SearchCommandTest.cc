@@ -1,3 +1,5 @@
+#include <fmt/format.h>
+
 #include <fstream>
 
 #include "cli/Identifier.h"

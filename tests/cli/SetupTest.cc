@@ -121,14 +121,17 @@ class SetupTest : public testsupport::TmuxTest {
 }  // namespace
 
 TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
-  makeMaildir(home + "/Maildir", 3);
-  makeMaildir(home + "/Maildir/.Sent", 2);
-  makeMaildir(home + "/by-mbsync/inbox", 1);
-  makeMaildir(home + "/by-offlineimap/inbox", 1);
-  makeMaildir(home + "/by-mutt", 1);
-  makeMaildir(home + "/by-aerc", 0);
-  makeMaildir(home + "/not-mine", 1);
-  makeMaildir(directory / "elsewhere", 1);
+  for (const auto& [path, mails] : {std::pair("home/Maildir", 3),
+                                    {"home/Maildir/.Sent", 2},
+                                    {"home/by-mbsync/inbox", 1},
+                                    {"home/by-offlineimap/inbox", 1},
+                                    {"home/by-mutt", 1},
+                                    {"home/by-aerc", 0},
+                                    {"home/not-mine", 1},
+                                    {"elsewhere", 1},
+                                    {"outside", 1}}) {
+    makeMaildir(directory / path, mails);
+  }
   write("home/spool", mboxText(4));
   write("home/mail/2010/01", "From: old@example.org\nDate: x\n\nmessage in a file of its own\n");
   write("home/mail/2010/notes.txt", "no mail\n");
@@ -144,7 +147,6 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
         "set realname=\"x\" folder = '$HOME/by-mutt' # set folder=~/not-mine-either\n"
         "set folder=imaps://example.org/\nset spoolfile=+folder=~/not-mine\n");
   write("home/.muttrc", "set folder=~\n");
-  makeMaildir(directory / "outside", 1);
   write("home/.mutt/muttrc", "set folder=~/../outside\n");
   write("home/.config/aerc/accounts.conf",
         "[a]\nsource = maildir://~/by-aerc\n[b]\nsource = imaps://x\n");
@@ -224,10 +226,8 @@ TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
 }
 
 TEST_F(SetupTest, KeepsWhatTheSettingsSay) {
-  makeMaildir(home + "/Maildir", 1);
-  makeMaildir(home + "/Mail/work", 1);
-  makeMaildir(home + "/mail", 1);
-  makeMaildir(home + "/elsewhere", 1);
+  for (const char* path : {"/Maildir", "/Mail/work", "/mail", "/elsewhere"})
+    makeMaildir(home + path, 1);
   const std::string text =
       "# mine\nroots = [ # all\n  \"~/Maildir\",\n]\nexclude = [\"~/mail\"]\n[class]\n"
       "\"~/elsewhere\" = \"work\"\n";
@@ -328,17 +328,14 @@ TEST_F(SetupTest, AsksOnATerminal) {
     await("ready>");
     enter("clear");
     awaitGone("[");  // the question of the run before
-    enter(TALLOW_PROGRAM " setup; echo status=$?");
-    await("or \"none\" [");
-    enter(answer);
-    await(after);
+    enter(TALLOW_PROGRAM " setup; echo status=$?", "or \"none\" [");
+    enter(answer, after);
   };
   open("none", "status=2");
   EXPECT_THAT(screen(), HasSubstr("nothing has been changed"));
   EXPECT_FALSE(fs::exists(settings));
   open("3", "or \"none\" [all] 3\nWhich");  // asks again
-  enter("2");
-  await("status=0");
+  enter("2", "status=0");
   EXPECT_THAT(roots(), ElementsAre(home + "/Maildir"));
   // Later, the answer is none unless the user wants more.
   open("", "status=0");

@@ -2,7 +2,6 @@
 
 #include <string>
 #include <string_view>
-#include <utility>
 #include <vector>
 
 // Small files of the kinds that attachments have, made by the tests themselves.

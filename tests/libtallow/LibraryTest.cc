@@ -1,4 +1,3 @@
-#include <fmt/format.h>
 #include <gmock/gmock.h>
 #include <tallow/tallow.h>
 

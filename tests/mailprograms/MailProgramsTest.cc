@@ -90,26 +90,19 @@ TEST_F(MailProgramsTest, Neomutt) {
   start("neomutt -F " + directory / "muttrc", 110, 30);
   await("[Msgs:10 ");
   // In the open folder.
-  press("M-s");
-  await("Limit to messages matching: ~I");
-  enter("first invoice");
-  await("[Msgs:1/10 ");
+  press("M-s", "Limit to messages matching: ~I");
+  enter("first invoice", "[Msgs:1/10 ");
   await("First invoice for the shelves");
   // In all folders.
-  press("S");
-  await("Search:");
-  enter("invoice for");
-  await("search [Msgs:7 ");
+  press("S", "Search:");
+  enter("invoice for", "search [Msgs:7 ");
   await("Your invoice 4471");
   EXPECT_EQ(links(), 7U);
   // The links are gone with the next search, and neomutt asks nothing about them.
-  press("S");
-  await("Search:");
-  enter("brackets brass");
-  await("search [Msgs:1 ");
+  press("S", "Search:");
+  enter("brackets brass", "search [Msgs:1 ");
   EXPECT_EQ(links(), 1U);
-  press("Enter");
-  await("Dear Mara,");
+  press("Enter", "Dear Mara,");
   press("r");
   EXPECT_THAT(awaitReply("> Dear Mara"), HasSubstr("\nTo: Samir Haddad <samir@example.com>\n"));
   await("Aborted unmodified message");
@@ -123,21 +116,17 @@ TEST_F(MailProgramsTest, Aerc) {
             0);
   start("aerc", 120, 30);
   await("Elena Ruiz");
-  press("n");
-  await("(no messages)");
+  press("n", "(no messages)");
   // The open folder shows the results of each search.
   for (const auto& [words, found] : {std::pair("oarlock fixed", "Oarlock fixed"),
                                      {"harbour", "Minutes of the rowing club"},
                                      {"nothingofthekind", "(no messages)"},
                                      {"brackets brass", "First invoice for the shelves"}}) {
-    press("S");
-    await("Search:");
-    enter(words);
-    await(found);
+    press("S", "Search:");
+    enter(words, found);
   }
   awaitThat([&](const std::string&) { return links() == 1; }, "one link");
-  press("g Enter");
-  await("From: \"Samir Haddad\"");
+  press("g Enter", "From: \"Samir Haddad\"");
   press("r");
   EXPECT_THAT(awaitReply("> Dear Mara"), HasSubstr("Samir Haddad wrote"));
   await("Send this email?");
@@ -153,10 +142,8 @@ TEST_F(MailProgramsTest, AercCompletesAddresses) {
   configureAerc(directory / "bin/waiting");
   start("aerc", 120, 30);
   await("Elena Ruiz");
-  press("c");
-  await("To:");
-  type("sami");
-  await("samir@example.com");
+  press("c", "To:");
+  type("sami", "samir@example.com");
 }
 
 TEST_F(MailProgramsTest, Emacs) {
@@ -165,13 +152,10 @@ TEST_F(MailProgramsTest, Emacs) {
   start(fmt::format("emacs -nw -Q -l {}/tallow.el -f tallow-search", TALLOW_MAIL_PROGRAMS), 110,
         40);
   await("Search mail:");
-  enter("randonn\u00E9e");
-  await("2024-02-09 11:10 Ren\u00E9 Dufour");
-  press("Enter");
-  await("Bonjour,");
+  enter("randonn\u00E9e", "2024-02-09 11:10 Ren\u00E9 Dufour");
+  press("Enter", "Bonjour,");
   await("From:     Ren\u00E9 Dufour <rene.dufour@example.com>");
-  press("r");
-  await("To: Ren\u00E9 Dufour <rene.dufour@example.com>");
+  press("r", "To: Ren\u00E9 Dufour <rene.dufour@example.com>");
   await("Subject: Re: Randonn\u00E9e dimanche");
   await("> Bonjour,");
 }
@@ -189,13 +173,11 @@ TEST_F(MailProgramsTest, EmacsWithHostileMail) {
       << errors;
   start("emacs -nw -Q -l " + directory / "tallow.elc -f tallow-search", 110, 40);
   await("Search mail:");
-  enter("hostile");
-  await("1 of 1 mails");
+  enter("hostile", "1 of 1 mails");
   awaitThat(
       [](const std::string& seen) {
         return std::regex_search(seen, std::regex("\n +a \\[2J +hostile +m+[$]\n"));
       },
       "the row of the mail");
-  press("r");
-  await("To: b@example.org");
+  press("r", "To: b@example.org");
 }

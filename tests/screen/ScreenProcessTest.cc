@@ -38,8 +38,7 @@ class ScreenProcessTest : public testsupport::TmuxTest {
   void open(int columns, int rows, const std::string& arguments = "") {
     start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
     await("ready>");
-    enter(tallow + arguments);
-    await("Search:");
+    enter(tallow + arguments, "Search:");
   }
   // The process ID of the program, a child of the shell.
   [[nodiscard]] pid_t process() const {
@@ -51,8 +50,8 @@ class ScreenProcessTest : public testsupport::TmuxTest {
   // echo again.
   void expectRestored(int status = 0) const {
     awaitGone("Search:");
-    enter("echo left=$?; stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"");
-    await(fmt::format("left={}\n4\n", status));
+    enter("echo left=$?; stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"",
+          fmt::format("left={}\n4\n", status));
   }
 
   const std::string mail = directory / "mail";
@@ -65,28 +64,21 @@ TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
   index();
   open(80, 24);
   await("F1 help");
-  type("minutes of the row");
-  await("Minutes of the rowing club");
+  type("minutes of the row", "Minutes of the rowing club");
   await("1-1 of 1");
   await("Subject:  Minutes of the rowing club");  // the preview
   press("C-u");
   awaitGone("Minutes");
-  type("photos");
-  await("Photos from the island");
+  type("photos", "Photos from the island");
   // Letters of any script, cursor movement, and deleting a word.
   press("C-u");
-  type("京都");
-  await("京都");
+  type("京都", "京都");
   press("C-w");
-  type("invoice zz");
-  await("no match");
-  press("BSpace BSpace BSpace");
-  await("Your invoice 4471");
+  type("invoice zz", "no match");
+  press("BSpace BSpace BSpace", "Your invoice 4471");
   press("C-a");
-  type("x");
-  await("Search: xinvoice");
-  press("C-a DC");
-  await("Your invoice 4471");
+  type("x", "Search: xinvoice");
+  press("C-a DC", "Your invoice 4471");
   // Pasted text goes into the line, even if its characters are keys.
   press("C-e C-u");
   tmux("set-buffer -- \"$(printf 'photos\\rfrom\\tthe\\033OA\\017')\" \\; paste-buffer -p -t t");
@@ -98,31 +90,21 @@ TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
 TEST_F(ScreenProcessTest, MailsAreReadSortedAndFiltered) {
   index();
   open(120, 40);
-  type("invoice");
-  await("Your invoice 4471");
-  press("C-s");
-  await("newest first");
-  press("C-t");
-  await("conversations");
+  type("invoice", "Your invoice 4471");
+  press("C-s", "newest first");
+  press("C-t", "conversations");
   await("(4) ");
-  press("C-f");
-  await("Folder:");
+  press("C-f", "Folder:");
   press("C-u");
-  enter("family");
-  await("in family");
+  enter("family", "in family");
   await("First invoice for the shelves");
   awaitGone("4471");
-  press("Enter");
-  await("q back");
+  press("Enter", "q back");
   await("Subject:  First invoice for the shelves");
-  press("q");
-  await("Search: invoice");
-  press("F1");
-  await("Ctrl-T");
-  press("Escape");
-  await("Search: invoice");
-  press("C-y");
-  await("copied " + mail + "/family/cur/");
+  press("q", "Search: invoice");
+  press("F1", "Ctrl-T");
+  press("Escape", "Search: invoice");
+  press("C-y", "copied " + mail + "/family/cur/");
   EXPECT_THAT(tmux("show-buffer"), HasSubstr(mail + "/family/cur/"));
 }
 
@@ -131,8 +113,7 @@ TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
   variables = fmt::format("TALLOW_OPEN='tee {}/opened <'", directory.path());
   open(80, 24, " screen oarlock fixed");
   await("1-1 of 1");
-  press("C-o");
-  await("Search: oarlock");
+  press("C-o", "Search: oarlock");
   awaitThat([&](const std::string&) { return fs::exists(directory / "opened"); },
             "the mail being opened");
   await("1-1 of 1");
@@ -144,8 +125,7 @@ TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
 TEST_F(ScreenProcessTest, DrawsAnySize) {
   index();
   open(80, 24);
-  type("invoice");
-  await("Your invoice 4471");
+  type("invoice", "Your invoice 4471");
   const auto resize = [&](int columns, int rows) {
     tmux(fmt::format("resize-window -t t -x {} -y {}", columns, rows));
   };
@@ -187,11 +167,9 @@ TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
         "Date: Mon, 08 Jan 2023 08:49:00 +0000\n\nhostile\n");
   index();
   open(90, 24);
-  type("hostile");
-  await("1-2 of 2");
+  type("hostile", "1-2 of 2");
   await("hostile but plain");
-  press("Down");
-  await("Subject:  hostile but plain");
+  press("Down", "Subject:  hostile but plain");
   press("Up");
   awaitGone("Subject:  hostile but plain");
   await("Subject:  hostile");
@@ -208,12 +186,9 @@ TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
     EXPECT_LE(cli::columnsTaken(line), 90u);
   }
   EXPECT_EQ(tmux("display-message -p -t t '#{pane_title}'").find("title"), std::string::npos);
-  press("Down C-y");
-  await("copied ");
-  press("Enter");
-  await("q back");
-  press("Escape");
-  await("Search: hostile");
+  press("Down C-y", "copied ");
+  press("Enter", "q back");
+  press("Escape", "Search: hostile");
   press("Escape");
   expectRestored();
 }
@@ -223,8 +198,7 @@ TEST_F(ScreenProcessTest, WaitsForADaemonThatEnds) {
   daemon->signal(SIGKILL);
   daemon->wait();
   open(80, 24);
-  type("oarlock");
-  await("tallowsearchd is not running; trying again");
+  type("oarlock", "tallowsearchd is not running; trying again");
   startDaemon();
   await("Oarlock fixed");
   awaitGone("not running");
@@ -232,8 +206,7 @@ TEST_F(ScreenProcessTest, WaitsForADaemonThatEnds) {
   daemon->signal(SIGTERM);
   daemon->wait();
   startDaemon();
-  type(" fixed");
-  await("Search: oarlock fixed");
+  type(" fixed", "Search: oarlock fixed");
   awaitGone("not running");
   await("1-1 of 1");
 }
@@ -241,24 +214,19 @@ TEST_F(ScreenProcessTest, WaitsForADaemonThatEnds) {
 TEST_F(ScreenProcessTest, RestoresTheTerminal) {
   index();
   open(80, 24);
-  type("invoice");
-  await("Your invoice 4471");
-  press("C-z");
-  await("Stopped");
+  type("invoice", "Your invoice 4471");
+  press("C-z", "Stopped");
   await("ready>");
   press("C-l");
-  enter("echo be''tween");
-  await("\nbetween");
-  enter("fg");
-  await("Search: invoice");
+  enter("echo be''tween", "\nbetween");
+  enter("fg", "Search: invoice");
   await("Your invoice 4471");
   press("C-c");
   expectRestored();
   // The exit statuses that a shell reports; SIGINT has the effect of Ctrl-C.
   for (const auto& [signal, status] : {std::pair(SIGTERM, 143), {SIGHUP, 129}, {SIGINT, 0}}) {
     press("C-l");
-    enter(tallow);
-    await("Search:");
+    enter(tallow, "Search:");
     ASSERT_EQ(kill(process(), signal), 0);
     expectRestored(status);
   }

@@ -25,17 +25,19 @@ std::string TmuxTest::tmux(const std::string& arguments) const {
       directory.path(), variables, arguments));
 }
 
-void TmuxTest::type(const std::string& text) const {
+void TmuxTest::type(const std::string& text, const std::string& shown) const {
   tmux("send-keys -t t -l -- '" + text + "'");
+  await(shown);
 }
 
-void TmuxTest::press(const std::string& keys) const {
+void TmuxTest::press(const std::string& keys, const std::string& shown) const {
   tmux("send-keys -t t " + keys);
+  await(shown);
 }
 
-void TmuxTest::enter(const std::string& line) const {
+void TmuxTest::enter(const std::string& line, const std::string& shown) const {
   type(line);
-  press("Enter");
+  press("Enter", shown);
 }
 
 std::string TmuxTest::screen() const {
@@ -61,6 +63,7 @@ void TmuxTest::awaitThat(const std::function<bool(const std::string&)>& holds,
 }
 
 void TmuxTest::await(const std::string& text) const {
+  if (text.empty()) return;
   awaitThat([&](const std::string& seen) { return seen.find(text) != std::string::npos; },
             "\"" + text + "\" on the screen");
 }

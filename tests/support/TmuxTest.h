@@ -19,9 +19,11 @@ class TmuxTest : public ShellTest {
   // The output of a tmux command; the terminal is called t.
   std::string tmux(const std::string& arguments) const;
 
-  void type(const std::string& text) const;  // without single quotes
-  void press(const std::string& keys) const;
-  void enter(const std::string& line) const;  // types it and presses Enter
+  // Type a text (without single quotes), press keys, or type a line and press Enter. What is shown
+  // after that, if given, is waited for.
+  void type(const std::string& text, const std::string& shown = "") const;
+  void press(const std::string& keys, const std::string& shown = "") const;
+  void enter(const std::string& line, const std::string& shown = "") const;
   [[nodiscard]] std::string screen() const;
   [[nodiscard]] std::vector<std::string> lines() const;
 

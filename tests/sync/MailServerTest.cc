@@ -75,8 +75,7 @@ class MailServerTest : public testsupport::WatchProcessTest {
   // The number of indexed messages, once the index matches the copied mail.
   size_t copied() {
     run(fmt::format("{} -c copier.conf -a", kCopier));
-    waitUntilInStep();
-    return indexed().size();
+    return waitUntilInStep();
   }
 };
 

@@ -91,8 +91,10 @@ class WatchProcessTest : public testing::Test {
       }
     }
   }
-  void waitUntilInStep() const {
+  // Waits until what is indexed is what is on the disk, and returns the number of messages.
+  size_t waitUntilInStep() const {
     waitUntil([this] { return indexed() == onDisk(); });
+    return indexed().size();
   }
   void waitUntilSaid(const std::string& text) const {
     waitUntil([&] { return watch->log().find(text) != std::string::npos; });
