@@ -71,8 +71,7 @@ TEST_F(CompletionTest, Bash) {
   NEED_PROGRAMS("bash", "tmux")
   writeScript("bash", "share/completions/tallow");
   variables += fmt::format(" BASH_COMPLETION_USER_DIR={}/share", directory.path());
-  start("PS1='ready> ' exec bash --norc --noprofile -i", 100, 20);
-  await("ready>");
+  startShell(100, 20);
   // With the package bash-completion, which loads the script, and without it.
   const bool package = fs::exists("/usr/share/bash-completion/bash_completion");
   EXPECT_TRUE(package || !testsupport::isCI()) << "bash-completion is missing";

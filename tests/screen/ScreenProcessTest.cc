@@ -36,8 +36,7 @@ class ScreenProcessTest : public testsupport::TmuxTest {
 
   // Starts a shell in a terminal of this size, and the program in it.
   void open(int columns, int rows, const std::string& arguments = "") {
-    start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
-    await("ready>");
+    startShell(columns, rows);
     enter(tallow + arguments, "Search:");
   }
   // The process ID of the program, a child of the shell.

@@ -18,6 +18,11 @@ void TmuxTest::start(const std::string& command, int columns, int rows) const {
                    rows, command));
 }
 
+void TmuxTest::startShell(int columns, int rows) const {
+  start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
+  await("ready>");
+}
+
 std::string TmuxTest::tmux(const std::string& arguments) const {
   return testsupport::outputOf(fmt::format(
       "env -u TMUX -u STATE_DIRECTORY LC_ALL=C.UTF-8 HOME={0} XDG_STATE_HOME={0}/client "

@@ -16,6 +16,8 @@ class TmuxTest : public ShellTest {
 
   // Starts `command` in a terminal of this size.
   void start(const std::string& command, int columns, int rows) const;
+  // Starts bash in it.
+  void startShell(int columns, int rows) const;
   // The output of a tmux command; the terminal is called t.
   std::string tmux(const std::string& arguments) const;
 

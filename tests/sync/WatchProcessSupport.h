@@ -1,7 +1,6 @@
 #pragma once
 
 #include <fmt/format.h>
-#include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/inotify.h>
 #include <unistd.h>
@@ -22,12 +21,12 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/Process.h"
 #include "tests/support/Programs.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 namespace testsupport {
 
 // `tallow watch` as its own process, with a daemon and a mailbox of the test.
-class WatchProcessTest : public testing::Test {
+class WatchProcessTest : public ShellTest {
  protected:
   WatchProcessTest() {
     makeFolder("a");
@@ -87,7 +86,7 @@ class WatchProcessTest : public testing::Test {
       pollfd changes{logChanges.get(), POLLIN, 0};
       poll(&changes, 1, -1);
       std::array<char, 4096> events;
-      while (read(logChanges.get(), events.data(), events.size()) > 0) {
+      while (::read(logChanges.get(), events.data(), events.size()) > 0) {
       }
     }
   }
@@ -100,7 +99,6 @@ class WatchProcessTest : public testing::Test {
     waitUntil([&] { return watch->log().find(text) != std::string::npos; });
   }
 
-  TemporaryDirectory directory;
   const std::string mail = directory / "mail";
   const std::string logPath = directory / "watch.log";
   const platform::FileDescriptor logChanges{inotify_init1(IN_CLOEXEC | IN_NONBLOCK)};
