@@ -118,42 +118,29 @@ TEST_F(InspectTest, ClosedPipeEndsTheDump) {
 }
 
 TEST_F(InspectTest, ValidateReportsEachFault) {
-  const auto page = [this] { makeIndex({kFirst, kSecond}); };
+  const std::vector good{kFirst, kSecond};
   const std::string pageKey(
       "\x01"
       "aa ab ba abcd\0\x01\0\x01",
       18);
   const std::string shortPage("\x02", 1);
   const std::string otherOptions(48, '\0');
-  const std::tuple<std::function<void()>, int, std::string, int> cases[] = {
-      {page, 0, "", 0},
-      {[&] {
-         makeIndex({kSecond, kFirst});
-       },
-       1, "SALT Validation failed: Out of order.", 0},
-      {[&] {
-         page();
-         salttest::editMetrics(index, [](auto& m) { m.Pages = m.Suffixes = 9; });
-       },
-       0, "SALT Validation failed: # of suffixes: 2 != 9.", 0},
-      {[&] {
-         page();
-         salttest::editMetrics(index, [](auto& m) { m.CodeVersion = 305; });
-       },
-       1, "SALT Loading failure: Mismatched code version.", 2},
-      {[&] {
-         page();
-         salttest::editKey(index, pageKey, &shortPage);
-       },
-       1, "Assertion failed: s.size()", 2},
-      {[&] {
-         page();
-         salttest::editKey(index, "\xFFOPTIONS", &otherOptions);
-       },
-       1, "Assertion failed: op.Valid()", 2},
-  };
-  for (const auto& [make, status, line, dumpStatus] : cases) {
-    make();
+  const std::tuple<std::vector<salt::SuffixMeta>, std::function<void()>, int, std::string, int>
+      cases[] = {
+          {good, [] {}, 0, "", 0},
+          {{kSecond, kFirst}, [] {}, 1, "SALT Validation failed: Out of order.", 0},
+          {good, [&] { salttest::editMetrics(index, [](auto& m) { m.Pages = m.Suffixes = 9; }); },
+           0, "SALT Validation failed: # of suffixes: 2 != 9.", 0},
+          {good, [&] { salttest::editMetrics(index, [](auto& m) { m.CodeVersion = 305; }); }, 1,
+           "SALT Loading failure: Mismatched code version.", 2},
+          {good, [&] { salttest::editKey(index, pageKey, &shortPage); }, 1,
+           "Assertion failed: s.size()", 2},
+          {good, [&] { salttest::editKey(index, "\xFFOPTIONS", &otherOptions); }, 1,
+           "Assertion failed: op.Valid()", 2},
+      };
+  for (const auto& [page, damage, status, line, dumpStatus] : cases) {
+    makeIndex(page);
+    damage();
     const auto before = files();
     EXPECT_EQ(run("validate"), status) << line;
     EXPECT_THAT(output, StartsWith(status == 0 ? "valid\n" : "not valid\n"));
