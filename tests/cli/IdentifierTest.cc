@@ -1,10 +1,8 @@
 #include <gtest/gtest.h>
 
-#include <fstream>
 #include <random>
 
 #include "cli/Identifier.h"
-#include "platform/Files.h"
 #include "platform/URL.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -53,8 +51,7 @@ TEST(Identifier, RejectsOtherForms) {
 TEST(Identifier, FindsAMaildirFileAfterItsFlagsHaveChanged) {
   const testsupport::TemporaryDirectory directory;
   const std::string cur = directory / "in/cur";
-  platform::createDirectories(cur, nullptr);
-  for (const char* name : {"/1.a:2,RS", "/1.ab"}) std::ofstream(cur + name);
+  for (const char* name : {"in/cur/1.a:2,RS", "in/cur/1.ab"}) directory.write(name, "");
   EXPECT_EQ(cli::findMaildirFile(cur + "/1.a"), cur + "/1.a:2,RS");
   EXPECT_EQ(cli::findMaildirFile(cur + "/1.ab"), cur + "/1.ab");
   EXPECT_EQ(cli::findMaildirFile(directory / "in/new/1.a"), cur + "/1.a:2,RS");

@@ -112,8 +112,8 @@ TEST_F(InspectTest, TwoCrashesOfOneHourAreOneTooMany) {
 
 TEST_F(InspectTest, ClosedPipeEndsTheDump) {
   makeLargeIndex();
-  EXPECT_EQ(shell("{ " + tallow + " dump; echo $? >&2; } | head -n 1"), 0);
-  EXPECT_EQ(output, "SALT INDEX METRICS\n");
+  EXPECT_EQ(outputOfShell("{ " + tallow + " dump; echo $? >&2; } | head -n 1"),
+            "SALT INDEX METRICS\n");
   EXPECT_EQ(errors, "2\n");
 }
 
@@ -215,8 +215,7 @@ TEST_F(InspectTest, FindsTheStateOfTheDaemonByItself) {
       elsewhere + "HOME=" + directory / "home",
   };
   for (const std::string& place : places) {
-    EXPECT_EQ(shell("env -u STATE_DIRECTORY " + place + " " TALLOW_PROGRAM " validate"), 0)
-        << place << errors;
+    outputOfShell("env -u STATE_DIRECTORY " + place + " " TALLOW_PROGRAM " validate");
   }
 }
 

@@ -26,12 +26,6 @@ std::string xz(const std::string& bytes) {
 // Reads one file and records what the sink receives.
 class MailFileTest : public testing::Test {
  protected:
-  std::string write(const std::string& name, const std::string& bytes) {
-    const std::string path = directory / name;
-    platform::writeFileAtomically(path, bytes, nullptr);
-    return path;
-  }
-
   void readFile(const std::string& path, bool named = true) {
     messages.clear();
     places.clear();
@@ -52,7 +46,7 @@ class MailFileTest : public testing::Test {
         [this](const std::string&) { ++ignored; }, [](uint64_t) {}};
     finished = cli::readMailFile(path, named, sink);
   }
-  void readBytes(const std::string& bytes) { readFile(write("box", bytes)); }
+  void readBytes(const std::string& bytes) { readFile(directory.write("box", bytes)); }
 
   testsupport::TemporaryDirectory directory;
   std::vector<std::string> messages;
@@ -170,7 +164,7 @@ TEST_F(MailFileTest, DetectsTheKindOfAFile) {
       {"settings", "key: value\n", false, 0, 0, 1},
   };
   for (const auto& [name, bytes, named, read, failed, passed] : cases) {
-    readFile(write(name, bytes), named);
+    readFile(directory.write(name, bytes), named);
     EXPECT_EQ(messages.size(), read) << name;
     EXPECT_EQ(failures.size(), failed) << name;
     EXPECT_EQ(ignored, passed) << name;
@@ -183,12 +177,11 @@ TEST_F(MailFileTest, DetectsTheKindOfAFile) {
 }
 
 TEST_F(MailFileTest, FoldersAreNamedAfterTheirPlace) {
-  platform::createDirectories(directory / ".Sent/cur", nullptr);
-  readFile(write(".Sent/cur/1:2,S", "A: a\n\n"));
+  readFile(directory.write(".Sent/cur/1:2,S", "A: a\n\n"));
   EXPECT_EQ(folder, "Sent " + directory / ".Sent");
-  readFile(write("plain.eml", "A: a\n\n"));
+  readFile(directory.write("plain.eml", "A: a\n\n"));
   EXPECT_EQ(folder.substr(folder.find(' ') + 1), directory.path());
-  readFile(write("archive.mbox.gz", gzip(kTwo)));
+  readFile(directory.write("archive.mbox.gz", gzip(kTwo)));
   EXPECT_EQ(folder, "archive " + directory / "archive.mbox.gz");
 }
 
@@ -200,11 +193,8 @@ TEST_F(MailFileTest, ASinkCanStop) {
 }
 
 TEST_F(MailFileTest, VisitsEachFileOnceDespiteLoops) {
-  platform::createDirectories(directory / "b/cur", nullptr);
-  platform::createDirectories(directory / "b/tmp", nullptr);
-  platform::createDirectories(directory / "tmp", nullptr);
   for (const char* name : {"z", "a", "b/cur/2", "b/cur/1", "b/tmp/half", "tmp/kept"}) {
-    write(name, "x");
+    directory.write(name, "x");
   }
   ASSERT_EQ(symlink(directory.path().c_str(), (directory / "b/loop").c_str()), 0);
   ASSERT_EQ(symlink((directory / "a").c_str(), (directory / "link").c_str()), 0);

@@ -1,7 +1,5 @@
 #include <fmt/format.h>
 
-#include <fstream>
-
 #include "cli/Identifier.h"
 #include "tests/cli/CommandsTest.h"
 
@@ -185,8 +183,8 @@ TEST_F(CommandsTest, CopiesOfAMessageAreOneResult) {
   const testsupport::TemporaryDirectory mail;
   std::vector<std::shared_ptr<TLIndexableItem>> items;
   for (const auto& [name, id] : {std::pair("a", "<1@x>"), {"b", "<2@x>"}, {"c", "<1@x>"}}) {
-    const std::string path = mail / (std::string(name) + ".eml");
-    std::ofstream(path) << fmt::format("Message-ID:\n {}\nSubject: s\n\n", id);
+    const std::string path =
+        mail.write(std::string(name) + ".eml", fmt::format("Message-ID:\n {}\nSubject: s\n\n", id));
     items.push_back(result(cli::fileIdentifier(path).c_str()));
   }
   answerWith(items);

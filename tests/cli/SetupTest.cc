@@ -5,7 +5,6 @@
 #include <atomic>
 #include <csignal>
 #include <filesystem>
-#include <fstream>
 #include <memory>
 
 #include "cli/Settings.h"
@@ -97,11 +96,11 @@ class SetupTest : public testsupport::TmuxTest {
     return good->roots;
   }
 
-  void makeMaildir(const std::string& path, int mails) const {
-    for (const char* const part : {"cur", "new", "tmp"}) fs::create_directories(path + '/' + part);
+  void makeMaildir(const std::string& name, int mails) const {
+    directory.makeMaildir(name);
     for (int i = 0; i < mails; ++i) {
-      std::ofstream(fmt::format("{}/new/{}.M1.host", path, i))
-          << fmt::format("From: a@example.org\nSubject: lighthouse {}\n\nText\n", i);
+      directory.write(fmt::format("{}/new/{}.M1.host", name, i),
+                      fmt::format("From: a@example.org\nSubject: lighthouse {}\n\nText\n", i));
     }
   }
   static std::string mboxText(int mails) {
@@ -121,16 +120,12 @@ class SetupTest : public testsupport::TmuxTest {
 }  // namespace
 
 TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
-  for (const auto& [path, mails] : {std::pair("home/Maildir", 3),
-                                    {"home/Maildir/.Sent", 2},
-                                    {"home/by-mbsync/inbox", 1},
-                                    {"home/by-offlineimap/inbox", 1},
-                                    {"home/by-mutt", 1},
-                                    {"home/by-aerc", 0},
-                                    {"home/not-mine", 1},
-                                    {"elsewhere", 1},
-                                    {"outside", 1}}) {
-    makeMaildir(directory / path, mails);
+  makeMaildir("home/Maildir", 3);
+  makeMaildir("home/Maildir/.Sent", 2);
+  makeMaildir("home/by-aerc", 0);
+  for (const char* const path : {"home/by-mbsync/inbox", "home/by-offlineimap/inbox",
+                                 "home/by-mutt", "home/not-mine", "elsewhere", "outside"}) {
+    makeMaildir(path, 1);
   }
   write("home/spool", mboxText(4));
   write("home/mail/2010/01", "From: old@example.org\nDate: x\n\nmessage in a file of its own\n");
@@ -190,7 +185,7 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
 }
 
 TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
-  makeMaildir(home + "/Maildir", 2);
+  makeMaildir("home/Maildir", 2);
   startDaemon();
   fs::remove(directory / "xdg/tallow");
   write("runtime", daemon->runtimeDirectory());
@@ -214,7 +209,7 @@ TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
   EXPECT_EQ(read("config/tallow/config.toml"), before);
   EXPECT_THAT(outputOf("setup"), HasSubstr("All is set up."));
   // New mail is added; a watch that runs gets the new settings.
-  makeMaildir(home + "/mail/lists", 1);
+  makeMaildir("home/mail/lists", 1);
   EXPECT_EQ(run("setup --yes " + home + "/mail/../mail"), 0) << errors;
   EXPECT_THAT(roots(), UnorderedElementsAre(home + "/Maildir", home + "/mail"));
   EXPECT_THAT(unitCalls(), testing::IsSupersetOf({"--user stop tallow-watch.service",
@@ -226,8 +221,9 @@ TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
 }
 
 TEST_F(SetupTest, KeepsWhatTheSettingsSay) {
-  for (const char* path : {"/Maildir", "/Mail/work", "/mail", "/elsewhere"})
-    makeMaildir(home + path, 1);
+  for (const char* name : {"Maildir", "Mail/work", "mail", "elsewhere"}) {
+    makeMaildir(std::string("home/") + name, 1);
+  }
   const std::string text =
       "# mine\nroots = [ # all\n  \"~/Maildir\",\n]\nexclude = [\"~/mail\"]\n[class]\n"
       "\"~/elsewhere\" = \"work\"\n";
@@ -252,8 +248,8 @@ TEST_F(SetupTest, KeepsWhatTheSettingsSay) {
 
 // Roots in the settings replace those that `tallow sync` knows.
 TEST_F(SetupTest, TakesWhatWasSyncedBefore) {
-  makeMaildir(home + "/Maildir", 1);
-  makeMaildir(directory / "archive", 1);
+  makeMaildir("home/Maildir", 1);
+  makeMaildir("archive", 1);
   startDaemon();
   ASSERT_EQ(run("sync " + directory / "archive"), 0) << errors;
   EXPECT_EQ(run("setup --yes"), 0) << errors;
@@ -261,7 +257,7 @@ TEST_F(SetupTest, TakesWhatWasSyncedBefore) {
 }
 
 TEST_F(SetupTest, WorksWithoutSystemd) {
-  makeMaildir(home + "/Maildir", 2);
+  makeMaildir("home/Maildir", 2);
   write("fails", "");
   EXPECT_EQ(run("setup --yes"), 75);
   EXPECT_THAT(errors, HasSubstr("the units of systemd cannot be used: Failed to connect to bus: "
@@ -280,10 +276,10 @@ TEST_F(SetupTest, WorksWithoutSystemd) {
 
 TEST_F(SetupTest, RefusesWhatCannotBeRight) {
   EXPECT_THAT(errorsOf("setup --yes"), HasSubstr("no mail was found"));
-  makeMaildir(home + "/Maildir", 1);
+  makeMaildir("home/Maildir", 1);
   EXPECT_THAT(errorsOf("setup --yes " + home + "/Maildir " + home + "/none"),
               HasSubstr("/none: there is no such file or directory"));
-  makeMaildir(home + "/a\xFF", 1);
+  makeMaildir("home/a\xFF", 1);
   EXPECT_THAT(errorsOf("setup --yes " + home + "/a\xFF"), HasSubstr("which is not UTF-8"));
   EXPECT_EQ(run("setup --yes", "HOME="), 2);
   EXPECT_EQ(run("setup --yes --format=json"), 2);
@@ -299,7 +295,7 @@ TEST_F(SetupTest, RefusesWhatCannotBeRight) {
 
 // Ctrl-C in the first sync leaves the rest to the watch.
 TEST_F(SetupTest, AnInterruptLeavesTheRestToTheWatch) {
-  makeMaildir(home + "/Maildir", 3);
+  makeMaildir("home/Maildir", 3);
   testsupport::FakeDaemon fake;
   useDaemon(fake.runtimeDirectory());
   std::atomic<bool> sent{false};
@@ -320,8 +316,8 @@ TEST_F(SetupTest, AnInterruptLeavesTheRestToTheWatch) {
 
 TEST_F(SetupTest, AsksOnATerminal) {
   NEED_PROGRAMS("tmux")
-  makeMaildir(home + "/Mail", 1);
-  makeMaildir(home + "/Maildir", 1);
+  makeMaildir("home/Mail", 1);
+  makeMaildir("home/Maildir", 1);
   startDaemon();
   start(fmt::format("env {} PS1='ready> ' bash --norc --noprofile -i", kUnset), 100, 30);
   const auto open = [&](const char* answer, const char* after) {

@@ -1,7 +1,6 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
 
-#include <fstream>
 #include <map>
 #include <regex>
 #include <set>
@@ -119,7 +118,7 @@ class BrowserTest : public StatusPageTest {
   void SetUp() override { NEED_PROGRAMS("chromium") }
 
   [[nodiscard]] std::string show(const std::string& html, const std::string& options) const {
-    std::ofstream(directory / "page.html", std::ios::binary) << html;
+    directory.write("page.html", html);
     return testsupport::outputOf(fmt::format(
         "HOME={0} timeout 120 chromium --headless --no-sandbox --disable-gpu "
         "--disable-dev-shm-usage --user-data-dir={0}/profile {1} --dump-dom file://{0}/page.html",

@@ -112,8 +112,7 @@ TEST_F(MailProgramsTest, Aerc) {
   NEED_PROGRAMS("tmux", "aerc")
   prepare();
   configureAerc(directory / "bin/editor");
-  ASSERT_EQ(shell(variables + " HOME=" + directory.path() + " tallow search --maildir=" + folder),
-            0);
+  outputOfShell(variables + " HOME=" + directory.path() + " tallow search --maildir=" + folder);
   start("aerc", 120, 30);
   await("Elena Ruiz");
   press("n", "(no messages)");
@@ -167,10 +166,9 @@ TEST_F(MailProgramsTest, EmacsWithHostileMail) {
         "From: \"a\x1b[2J\u202E\" <a@example.org>\nSubject: hostile\x07\u202E\u2066 " +
             std::string(100000, 'm') + "\nReply-To: b@example.org\n\nhostile\n");
   prepare();
-  EXPECT_EQ(shell("cp " TALLOW_MAIL_PROGRAMS "/tallow.el . && emacs -Q --batch --eval "
-                  "'(setq byte-compile-error-on-warn t)' -f batch-byte-compile tallow.el"),
-            0)
-      << errors;
+  outputOfShell("cp " TALLOW_MAIL_PROGRAMS
+                "/tallow.el . && emacs -Q --batch --eval "
+                "'(setq byte-compile-error-on-warn t)' -f batch-byte-compile tallow.el");
   start("emacs -nw -Q -l " + directory / "tallow.elc -f tallow-search", 110, 40);
   await("Search mail:");
   enter("hostile", "1 of 1 mails");

@@ -3,7 +3,6 @@
 
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <nlohmann/json.hpp>
 #include <random>
 #include <thread>
@@ -78,9 +77,8 @@ TEST(McpShownTextTest, CutsBetweenCodePoints) {
 TEST(McpFolderLimitTest, AllowsByTheResolvedPath) {
   namespace fs = std::filesystem;
   const testsupport::TemporaryDirectory directory;
-  for (const char* name : {"in/cur", "inside", "out"}) fs::create_directories(directory / name);
   for (const char* const name : {"in/cur/1:2,S", "in/mail", "in/box", "inside/mail", "out/mail"}) {
-    std::ofstream(directory / name) << "Subject: a\n\nb\n";
+    directory.write(name, "Subject: a\n\nb\n");
   }
   fs::create_symlink(directory / "out/mail", directory / "in/link");
   fs::create_symlink(directory / "out", directory / "in/folder");

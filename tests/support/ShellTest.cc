@@ -4,8 +4,6 @@
 #include <sys/wait.h>
 
 #include <cstdlib>
-#include <filesystem>
-#include <fstream>
 
 #include "platform/Files.h"
 
@@ -18,6 +16,11 @@ int ShellTest::shell(const std::string& command) {
   output = read("out");
   errors = read("err");
   return status;
+}
+
+std::string ShellTest::outputOfShell(const std::string& command) {
+  EXPECT_EQ(shell(command), 0) << command << '\n' << output << errors;
+  return output;
 }
 
 int ShellTest::run(const std::string& arguments, const std::string& more) {
@@ -39,8 +42,7 @@ std::string ShellTest::read(const std::string& name) const {
 }
 
 void ShellTest::write(const std::string& name, const std::string& text) const {
-  std::filesystem::create_directories(std::filesystem::path(directory / name).parent_path());
-  std::ofstream(directory / name, std::ios::binary) << text;
+  directory.write(name, text);
 }
 
 }  // namespace testsupport

@@ -14,6 +14,8 @@ class ShellTest : public testing::Test {
   // Runs the command and returns its exit status; afterwards `output` and `errors` are what it
   // wrote.
   int shell(const std::string& command);
+  // The output of a command that must succeed.
+  std::string outputOfShell(const std::string& command);
 
   // Runs `tallow ARGUMENTS`; `more` are environment variables, NAME=VALUE, besides `environment`.
   int run(const std::string& arguments, const std::string& more = "");

@@ -43,10 +43,9 @@ class MailServerTest : public testsupport::WatchProcessTest {
     return fmt::format("{0} -c {1}/server.conf 2>>{1}/server.log", kServer, directory.path());
   }
   void runAsUser(const std::string& command) {
-    EXPECT_EQ(shell(fmt::format("env -i HOME={} USER=mara PATH=/usr/bin:/bin:/usr/sbin {}",
-                                directory.path(), command)),
-              0)
-        << output << errors << read("server.log");
+    outputOfShell(fmt::format("env -i HOME={} USER=mara PATH=/usr/bin:/bin:/usr/sbin {}",
+                              directory.path(), command));
+    if (HasFailure()) ADD_FAILURE() << read("server.log");
   }
   // Runs the commands of one session, one per line.
   void serve(const std::vector<std::string>& commands) {

@@ -27,11 +27,7 @@ class MailboxTest : public testing::Test {
     for (const char* folder : {"a", "b"}) makeFolder(folder);
   }
 
-  void makeFolder(const std::string& folder) const {
-    for (const char* sub : {"cur", "new", "tmp"}) {
-      fs::create_directories(mail + '/' + folder + '/' + sub);
-    }
-  }
+  void makeFolder(const std::string& folder) const { directory.makeMaildir("mail/" + folder); }
   void put(const std::string& path, const std::string& content) const {
     std::ofstream(mail + '/' + path, std::ios::binary) << content;
   }

@@ -38,8 +38,7 @@ class MailWatchTest : public MailboxTest {
          {std::tuple("AC", "type", "Mains"), std::tuple("AC", "online", online ? "1" : "0"),
           std::tuple("BAT0", "type", "Battery"),
           std::tuple("BAT0", "status", online ? "Full" : "Unknown")}) {
-      fs::create_directories(directory / "power/" + supply);
-      std::ofstream(directory / "power/" + supply + '/' + attribute) << value << '\n';
+      directory.write(fmt::format("power/{}/{}", supply, attribute), std::string(value) + '\n');
     }
   }
   void start(const std::string& root) {

@@ -50,11 +50,7 @@ class WatchProcessTest : public ShellTest {
     TL_ASSERT(inotify_add_watch(logChanges.get(), logPath.c_str(), IN_MODIFY) >= 0);
   }
 
-  void makeFolder(const std::string& folder) const {
-    for (const char* sub : {"cur", "new", "tmp"}) {
-      std::filesystem::create_directories(mail + '/' + folder + '/' + sub);
-    }
-  }
+  void makeFolder(const std::string& folder) const { directory.makeMaildir("mail/" + folder); }
   // Delivers as a delivery agent does.
   void deliver(const std::string& folder, const std::string& name) const {
     const std::string base = mail + '/' + folder;
