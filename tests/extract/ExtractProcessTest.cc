@@ -6,7 +6,6 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <random>
 
 #include "extract/ExtractProcess.h"
@@ -97,41 +96,38 @@ TEST(ExtractProcess, LimitsFilesAndTime) {
 class ReplacedProgram : public ::testing::Test {
  protected:
   std::string script(const std::string& text) {
-    const std::string path = file("program", "#!/bin/sh\n" + text);
+    const std::string path = _directory.write("program", "#!/bin/sh\n" + text);
     chmod(path.c_str(), 0700);
     return path;
-  }
-  std::string file(const std::string& name, const std::string& content) {
-    std::ofstream(_directory / name) << content;
-    return _directory / name;
   }
 
   testsupport::TemporaryDirectory _directory;
 };
 
 TEST_F(ReplacedProgram, ThatTakesTooLongIsEnded) {
-  const std::string ready = file("ready", encode(extract::ReplyHeader{}));
+  const std::string ready = _directory.write("ready", encode(extract::ReplyHeader{}));
   ExtractProcess slow(script("cat " + ready + " >&0\nexec sleep 600\n"));
   const auto text = slow.text(Kind::officeXML, kFine, kRoom, std::chrono::milliseconds(100));
   EXPECT_EQ(text.outcome, Outcome::timedOut);
 }
 
 TEST_F(ReplacedProgram, ThatCannotBeRunGivesNothing) {
-  for (const std::string& program : {_directory / "missing", script("exit 1\n"),
-                                     script("echo it is not one of our headers >&0\n")}) {
-    ExtractProcess process(program);
+  ExtractProcess missing(_directory / "missing");
+  EXPECT_EQ(shown(missing, Kind::officeXML, kFine), "not-run:");
+  for (const char* const text : {"exit 1\n", "echo it is not one of our headers >&0\n"}) {
+    ExtractProcess process(script(text));
     EXPECT_EQ(shown(process, Kind::officeXML, kFine), "not-run:");
   }
 }
 
 // It answers each request with more than was asked for, or ends in the middle.
 TEST_F(ReplacedProgram, ThatLiesCountsAsCrashed) {
-  const std::string ready = file("ready", encode(extract::ReplyHeader{}));
+  const std::string ready = _directory.write("ready", encode(extract::ReplyHeader{}));
   const std::string large =
-      file("large",
-           encode(extract::ReplyHeader{Outcome::extracted, false, 2000}) + std::string(2000, 'x'));
+      _directory.write("large", encode(extract::ReplyHeader{Outcome::extracted, false, 2000}) +
+                                    std::string(2000, 'x'));
   const std::string half =
-      file("half", encode(extract::ReplyHeader{Outcome::cut, false, 100}) + "x");
+      _directory.write("half", encode(extract::ReplyHeader{Outcome::cut, false, 100}) + "x");
   for (const std::string& answer : {large, half}) {
     ExtractProcess lying(
         script("cat " + ready + " >&0\nhead -c 12 >/dev/null\ncat " + answer + " >&0\n"));
