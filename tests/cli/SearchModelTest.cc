@@ -4,10 +4,13 @@
 #include <set>
 #include <stdexcept>
 
+#include "cli/Identifier.h"
+#include "cli/MailFile.h"
+#include "cli/MailWalker.h"
+#include "cli/MessageParser.h"
 #include "cli/QueryInput.h"
 #include "cli/SearchRun.h"
 #include "cli/TextMatch.h"
-#include "tests/cli/SampleMail.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/Seed.h"
 #include "tests/support/ShellTest.h"
@@ -92,16 +95,36 @@ class SearchModel : public testsupport::ShellTest {
   SearchModel() {
     tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
     EXPECT_EQ(run("index " TALLOW_SAMPLE_MAIL), 0) << errors;
-    testsupport::forEachSampleMail(
-        [this](const std::string& path, auto bytes, auto& origin, auto& item) {
-          mails.push_back(mailOf(bytes, origin, item));
-          const size_t at = path.find(":2,");
-          if (at != std::string::npos) mails.back().flags = path.substr(at + 3);
-        });
+    readMails();
     for (const Mail& mail : mails) {
       for (const auto& [key, words] : mail.texts) texts.emplace_back(key, words);
     }
     std::erase_if(texts, [](const auto& text) { return text.second.empty(); });
+  }
+
+  // Anything that cannot be read is a failure of the test.
+  void readMails() {
+    const auto fail = [](const std::string& where, const std::string& reason) {
+      ADD_FAILURE() << where << ": " << reason;
+      return true;
+    };
+    cli::MessageParser parser;
+    std::string flags;
+    const cli::MailSink sink{[&](std::string_view bytes, const cli::MessageOrigin& origin) {
+                               const auto parsed = parser.parse(bytes, origin);
+                               const auto& message = std::get<cli::ParsedMessage>(parsed);
+                               EXPECT_FALSE(message.cut);
+                               mails.push_back(mailOf(bytes, origin, *message.item));
+                               mails.back().flags = flags;
+                               return true;
+                             },
+                             fail, [](const std::string& ignored) { ADD_FAILURE() << ignored; },
+                             [](uint64_t) {}};
+    const auto readFile = [&](const std::string& file, bool named, uint64_t) {
+      flags = cli::maildirFlags(file);
+      return cli::readMailFile(file, named, sink);
+    };
+    cli::walkMail(TALLOW_SAMPLE_MAIL, {readFile, fail});
   }
 
   size_t below(size_t limit) { return std::uniform_int_distribution<size_t>(0, limit - 1)(random); }
