@@ -6,8 +6,8 @@
 #include <ctime>
 #include <random>
 
-#include "cli/Identifier.h"
 #include "platform/Files.h"
+#include "sync/Database.h"
 #include "tests/support/Seed.h"
 #include "tests/sync/MailSyncTest.h"
 
@@ -82,6 +82,18 @@ TEST_F(MailSyncTest, LostOrDamagedCatalogueSendsNothingAgain) {
   std::ofstream(cataloguePath(), std::ios::binary) << std::string(8192, 'x');
   ASSERT_TRUE(sync()) << platform::printable(error);
   EXPECT_EQ(daemon.received(), 4U);
+}
+
+// For instance of a catalogue whose tables somebody else has changed.
+TEST(DatabaseTest, AStatementThatCannotBePreparedFails) {
+  const testsupport::TemporaryDirectory directory;
+  const auto database = mailsync::Database::open(directory / "db", nullptr);
+  ASSERT_NE(database, nullptr);
+  auto statement = database->prepare("SELECT name FROM absent WHERE id = ? AND name = ?");
+  EXPECT_FALSE(statement.bind(1).bindBytes("a").run());
+  EXPECT_EQ(mailsync::first(statement, [](auto& row) { return row.text(0); }), std::nullopt);
+  ASSERT_TRUE(database->failure());
+  EXPECT_THAT(database->failure()->message, HasSubstr("no such table: absent"));
 }
 
 // After a purge. A daemon restored to a state before the deletion is asked for its contents.

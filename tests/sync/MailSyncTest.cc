@@ -5,9 +5,10 @@
 #include "cli/Identifier.h"
 #include "sync/MessageDigest.h"
 
+// Names may have any bytes.
 TEST_F(MailSyncTest, SendsOnlyWhatHasChanged) {
   add("a/new/1", "one");
-  add("a/cur/2:2,S", "two");
+  add("a/cur/\xE9:2,S", "two");
   age();
   EXPECT_EQ(synced(), (Lines{"a: one", "a: two"}));
   EXPECT_EQ(daemon.received(), 2U);
@@ -15,23 +16,23 @@ TEST_F(MailSyncTest, SendsOnlyWhatHasChanged) {
   EXPECT_EQ(report.scan.entered, 0U);
   // Moves and flag changes send nothing, and the identifier stays the same.
   move("a/new/1", "a/cur/1:2,");
-  move("a/cur/2:2,S", "a/cur/2:2,FRS");
+  move("a/cur/\xE9:2,S", "a/cur/\xE9:2,FRS");
   age();
   ASSERT_TRUE(sync());
   EXPECT_EQ(daemon.received(), 2U);
   EXPECT_EQ(report.scan.moves, 1U);
   EXPECT_EQ(report.scan.flagChanges, 1U);
   const auto catalogue = mailsync::openCatalogue(settings, nullptr);
-  const auto place = catalogue->find(cli::maildirIdentifier(mail + "/a/cur/2:2,FRS"));
+  const auto place = catalogue->find(cli::maildirIdentifier(mail + "/a/cur/\xE9:2,FRS"));
   ASSERT_TRUE(place);
-  EXPECT_EQ(place->path, mail + "/a/cur/2:2,FRS");
+  EXPECT_EQ(place->path, mail + "/a/cur/\xE9:2,FRS");
   EXPECT_EQ(place->flags, "FRS");
   EXPECT_TRUE(place->indexed);
   // A move to another folder sends the message again.
   move("a/cur/1:2,", "b/cur/1:2,");
   // New content under the same name.
-  fs::remove(mail + "/a/cur/2:2,FRS");
-  add("a/cur/2:2,FRS", "rewritten");
+  fs::remove(mail + "/a/cur/\xE9:2,FRS");
+  add("a/cur/\xE9:2,FRS", "rewritten");
   age();
   EXPECT_EQ(synced(), (Lines{"b: one", "a: rewritten"}));
   EXPECT_EQ(report.delivery.replaced, 1U);
@@ -76,18 +77,6 @@ TEST_F(MailSyncTest, FileWithTwoPathsCountsOnce) {
   const auto first = cli::parseIdentifier(daemon.content().items.begin()->first)->path;
   fs::remove(mail + "/a/cur/1:2,");
   EXPECT_EQ(synced(), (Lines{"b: one"})) << first;
-}
-
-TEST_F(MailSyncTest, NamesOfAnyBytesAndTenThousandRenames) {
-  add("a/cur/caf\xE9:2,S", "latin");
-  for (int i = 0; i < 10000; ++i) put(fmt::format("b/cur/{}:2,", i), "Subject: x\n\n");
-  ASSERT_TRUE(sync());
-  EXPECT_EQ(daemon.content().items.size(), 10001U);
-  for (int i = 0; i < 10000; ++i)
-    move(fmt::format("b/cur/{}:2,", i), fmt::format("b/cur/{}:2,S", i));
-  ASSERT_TRUE(sync());
-  EXPECT_EQ(report.scan.flagChanges, 10000U);
-  EXPECT_EQ(report.toSend + report.toDelete, 0U);
 }
 
 // Attachments are read when a message is sent, and counted; messages sent before are read again on
