@@ -37,19 +37,13 @@ class DesktopToolsTest : public testsupport::ShellTest {
 
   // The output of a call by gdbus, or of one by busctl.
   std::string gdbus(const char* interface, const std::string& call) {
-    EXPECT_EQ(shell(fmt::format("gdbus call --address {} --dest {} --object-path {} --method {}.{}",
-                                session->address(), desktop::kBusName, desktop::kObjectPath,
-                                interface, call)),
-              0)
-        << errors;
-    return output;
+    return outputOfShell(
+        fmt::format("gdbus call --address {} --dest {} --object-path {} --method {}.{}",
+                    session->address(), desktop::kBusName, desktop::kObjectPath, interface, call));
   }
   std::string busctl(const char* interface, const std::string& call) {
-    EXPECT_EQ(shell(fmt::format("busctl --address={} call {} {} {} {}", session->address(),
-                                desktop::kBusName, desktop::kObjectPath, interface, call)),
-              0)
-        << errors;
-    return output;
+    return outputOfShell(fmt::format("busctl --address={} call {} {} {} {}", session->address(),
+                                     desktop::kBusName, desktop::kObjectPath, interface, call));
   }
   // The first identifier in an output, which puts it in quotes.
   [[nodiscard]] static std::string identifierIn(const std::string& text) {
@@ -63,6 +57,9 @@ class DesktopToolsTest : public testsupport::ShellTest {
   const testsupport::DaemonProcess daemon{directory.path()};
   std::unique_ptr<testsupport::DesktopSession> session;
 };
+
+// What the packages install for desktops.
+using DesktopFiles = testsupport::ShellTest;
 
 std::string fileOf(const std::string& name) {
   return platform::readFile(std::string(TALLOW_DESKTOP_FILES) + '/' + name, kMaxFileBytes, nullptr)
@@ -117,7 +114,7 @@ TEST_F(DesktopToolsTest, MailIsShownInATerminalWithoutAnOpener) {
 }
 
 // One file for each desktop, and all name the same service.
-TEST(DesktopFiles, NameTheService) {
+TEST_F(DesktopFiles, NameTheService) {
   const std::string name = desktop::kBusName;
   const std::string path = desktop::kObjectPath;
   EXPECT_THAT(fileOf(name + ".service"), HasSubstr("\nName=" + name + "\n"));
@@ -129,4 +126,17 @@ TEST(DesktopFiles, NameTheService) {
   const std::string runner = fileOf("com.quill.tallow.Runner.desktop");
   EXPECT_THAT(runner, HasSubstr("\nX-Plasma-DBusRunner-Service=" + name + "\n"));
   EXPECT_THAT(runner, HasSubstr("\nX-Plasma-DBusRunner-Path=" + path + "\n"));
+}
+
+// What software centres and desktops read, checked by their own programs. Skipped without these,
+// except with CI=true (scripts/ci-packages.list).
+TEST_F(DesktopFiles, AreValid) {
+  NEED_PROGRAMS("appstreamcli", "desktop-file-validate")
+  const std::string packaging = TALLOW_PACKAGING;
+  outputOfShell("appstreamcli validate --no-net --pedantic --strict " + packaging +
+                "/appstream/com.quill.tallow.metainfo.xml");
+  for (const auto& entry : std::filesystem::directory_iterator(packaging + "/desktop")) {
+    if (entry.path().extension() != ".desktop") continue;
+    outputOfShell("desktop-file-validate " + entry.path().string());
+  }
 }

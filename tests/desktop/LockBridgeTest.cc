@@ -4,10 +4,7 @@
 #include <csignal>
 #include <memory>
 
-#include "client/SearchServiceProxy.h"
 #include "platform/Files.h"
-#include "tests/daemon/DaemonProcess.h"
-#include "tests/daemon/DaemonSupport.h"
 #include "tests/desktop/Bus.h"
 #include "tests/desktop/MockLogind.h"
 #include "tests/support/Programs.h"
@@ -18,9 +15,6 @@ using testsupport::MockLogind;
 using testsupport::Process;
 
 namespace {
-
-constexpr const char* kStrictest = "SysFileProtectionComplete";
-constexpr int kUnavailable = -2;
 
 constexpr const char* kOpen = "0 1\n";
 constexpr const char* kLocked = "1 1\n";
@@ -73,34 +67,6 @@ class LockBridgeTest : public testing::Test {
 };
 
 }  // namespace
-
-// From the screen to a refused search, through logind, bridge, lock status and daemon.
-TEST_F(LockBridgeTest, StrictestClassIsClosedWithTheScreen) {
-  const testsupport::DaemonProcess daemon(directory.path());
-  ASSERT_TRUE(daemon.ready());
-  client::SearchServiceProxy service(daemon.runtimeDirectory());
-  const std::vector items{testsupport::mail("file/a", "harbour")};
-  for (const char* name : {kStrictest, "default"}) {
-    ASSERT_TRUE(service.indexItems(items, "test", name, nullptr));
-  }
-  // Asks again until the daemon has read the new lock status.
-  const auto awaitAnswer = [&](int64_t answer) {
-    while (testsupport::search(service, "harbour", kStrictest) != answer) continue;
-    EXPECT_EQ(testsupport::search(service, "harbour", "default"), 1);
-  };
-  start({true, false});
-  awaitAnswer(1);
-  logind->signalSession("Lock");
-  awaitAnswer(kUnavailable);
-  logind->signalSession("Unlock");
-  awaitAnswer(1);
-  logind->prepareForSleep(true);
-  awaitAnswer(kUnavailable);
-  logind->prepareForSleep(false);
-  awaitAnswer(1);
-  EXPECT_EQ(bridge->end(SIGTERM), 0);
-  awaitAnswer(kUnavailable);
-}
 
 TEST_F(LockBridgeTest, FollowsSignalsAndHintOfItsSession) {
   start({true, true});
