@@ -1,16 +1,13 @@
 #include "tests/cli/CommandsTest.h"
 
-#include <filesystem>
-#include <fstream>
-
 #include "cli/Identifier.h"
 
 using testing::ElementsAre;
 
 TEST_F(CommandsTest, IndexNamesTheItemsThatTheDaemonRefuses) {
   const testsupport::TemporaryDirectory mail;
-  for (const char* name : {"a", "b", "poison", "c"}) {
-    std::ofstream(mail / name + ".eml") << "Subject: " << name << "\n\ntext\n";
+  for (const std::string name : {"a", "b", "poison", "c"}) {
+    mail.write(name + ".eml", "Subject: " + name + "\n\ntext\n");
   }
   daemon.refuseItemsWith("poison", {"TALIndexer", 1, "index failed"});
   EXPECT_EQ(outputOf({"index", mail.path()}, failure),
@@ -23,13 +20,15 @@ TEST_F(CommandsTest, IndexNamesTheItemsThatTheDaemonRefuses) {
 
 TEST_F(CommandsTest, IndexStopsAtAnErrorThatConcernsAll) {
   const testsupport::TemporaryDirectory mail;
-  std::ofstream(mail / "a.eml") << "Subject: a\n\n";
+  mail.write("a.eml", "Subject: a\n\n");
   daemon.failOnce("IndexItems", {"com.quill.tallow.TALIndexerManager", -2, "Indexer unavailable."});
   EXPECT_THAT(errorsOf({"index", mail.path()}),
               HasSubstr("the index of this class cannot be opened now"));
   EXPECT_EQ(run({"index", mail.path()}), done);
-  EXPECT_EQ(outputOf({"index", mail.path(), mail / "none"}, failure),
-            "1 messages indexed, 1 paths not read\n");
+  mail.write("b.eml", "\n\nno header");
+  mail.write("notes", "no mail");
+  EXPECT_EQ(outputOf({"index", mail.path(), mail / "none", mail / "notes"}, failure),
+            "1 messages indexed, 1 unreadable, 2 paths not read, 1 other files ignored\n");
   const testsupport::TemporaryDirectory empty;
   EXPECT_EQ(jsonOf({"index", empty.path()}, nothingFound)["indexed"], 0);
 }
@@ -45,9 +44,7 @@ TEST_F(CommandsTest, DeleteContinuesAfterAFailure) {
 // The client searches for the folders first, because the daemon deletes folders only by exact name.
 TEST_F(CommandsTest, DeleteTakesPathsAndFolders) {
   const std::string folder = home / "Mail dir";
-  std::filesystem::create_directories(folder + "/cur");
-  const std::string mail = folder + "/cur/1.a:2,S";
-  std::ofstream(mail) << "Subject: s\n\n";
+  const std::string mail = home.write("Mail dir/cur/1.a:2,S", "Subject: s\n\n");
   daemon.failOnce("DeleteItemsWithIdentifiers", {"DocStore", 12, "no document with URL tlw://x"});
   EXPECT_EQ(errorsOf({"delete", mail}, nothingFound), "tallow: " + mail + ": not in the index\n");
   EXPECT_EQ(run({"delete", mail}), done);
@@ -113,6 +110,7 @@ TEST_F(CommandsTest, ExitStatusOfIncorrectUsageAndOfAnAbsentDaemon) {
       {{"--format=files", "stats"}, "are for search only\n"},
       {{"--limit=-1", "search", "x"}, "\"-1\" is not a whole number from 0 on\n"},
       {{"--color=blue", "ping"}, "\"blue\" is not one of always, auto, never\n"},
+      {{"--no-such-option", "ping"}, "there is no option --no-such-option\n"},
       {{"serach", "x"}, "did you mean search?"},
       {{"--format=xml", "ping"}, "\"xml\" is not one of files, json, message-ids, text\n"},
       {{"search", "x", "--sort", "size"}, "\"size\" is not one of date, relevance\n"},
@@ -137,14 +135,10 @@ TEST_F(CommandsTest, ExitStatusOfIncorrectUsageAndOfAnAbsentDaemon) {
   EXPECT_EQ(outputOf({"help", "search"}), help);
   EXPECT_TRUE(daemon.calls().empty());
   daemon.stop();
-  for (const Arguments& command : {Arguments{"ping"},
-                                   {"stats"},
-                                   {"metrics"},
-                                   {"vacuum"},
-                                   {"state"},
-                                   {"search", "x"},
-                                   {"delete", "x"},
-                                   {"index", TALLOW_SAMPLE_MAIL}}) {
+  const Arguments commands[] = {
+      {"ping"},  {"stats"},       {"metrics"},     {"vacuum"},
+      {"state"}, {"search", "x"}, {"delete", "x"}, {"index", TALLOW_SAMPLE_MAIL}};
+  for (const Arguments& command : commands) {
     EXPECT_THAT(errorsOf(command, unreachable),
                 HasSubstr("systemctl --user start tallowsearchd.socket"));
   }
@@ -153,9 +147,8 @@ TEST_F(CommandsTest, ExitStatusOfIncorrectUsageAndOfAnAbsentDaemon) {
 // The catalogue's part is shown with and without a running daemon.
 TEST_F(CommandsTest, SyncAndStatus) {
   const std::string mail = home / "mail";
-  std::filesystem::create_directories(mail + "/cur");
-  std::ofstream(mail + "/cur/1:2,S") << "Subject: a\n\nb\n";
-  std::ofstream(mail + "/cur/2:2,") << "\n";
+  home.write("mail/cur/1:2,S", "Subject: a\n\nb\n");
+  home.write("mail/cur/2:2,", "\n");
   EXPECT_THAT(outputOf({"status"}), HasSubstr("No mailbox is kept in step"));
   EXPECT_THAT(outputOf({"sync", mail, "-n", "-v"}), HasSubstr("send file" + mail + "/cur/1\n"));
   EXPECT_THAT(daemon.indexedItems(), testing::IsEmpty());
@@ -173,23 +166,20 @@ TEST_F(CommandsTest, SyncAndStatus) {
 }
 
 TEST_F(CommandsTest, SyncTakesTheSettings) {
-  for (const char* folder : {"in", "work", "old"}) {
-    std::filesystem::create_directories(home / "mail/" + folder + "/cur");
-    std::ofstream(home / "mail/" + folder + "/cur/1") << "Subject: " << folder << "\n\nb\n";
+  for (const std::string folder : {"in", "work", "old"}) {
+    home.write("mail/" + folder + "/cur/1", "Subject: " + folder + "\n\nb\n");
   }
-  std::ofstream(home / "mail/in/cur/2") << "Subject: large\n\n" << std::string(2000, 'x');
-  std::filesystem::create_directories(home / "XDG_CONFIG_HOME/tallow");
-  const auto set = [&](const std::string& text) {
-    std::ofstream(home / "XDG_CONFIG_HOME/tallow/config.toml") << text;
-  };
-  set("roots = ['" + (home / "mail") + "']\nexclude = ['old']\nlargest_mail = 1500\n[class]\n'" +
-      (home / "mail/work") + "' = 'work'\n");
+  home.write("mail/in/cur/2", "Subject: large\n\n" + std::string(2000, 'x'));
+  constexpr const char* kSettings = "XDG_CONFIG_HOME/tallow/config.toml";
+  home.write(kSettings, "roots = ['" + (home / "mail") +
+                            "']\nexclude = ['old']\nlargest_mail = 1500\n[class]\n'" +
+                            (home / "mail/work") + "' = 'work'\n");
   EXPECT_EQ(outputOf({"sync"}, failure), "default: 1 added, 1 failed\nwork: 1 added\n");
   EXPECT_THAT(errors, HasSubstr("larger than the limit of 1500 bytes"));
   EXPECT_EQ(jsonOf({"sync", "--class=work"})["class"], "work");
   EXPECT_THAT(errorsOf({"sync", home / "mail/work", "--class=default"}),
               HasSubstr("has the class work"));
-  set("\nroot = []");
+  home.write(kSettings, "\nroot = []");
   EXPECT_THAT(errorsOf({"watch"}),
               HasSubstr("config.toml:2: there is no key \"root\"; did you mean \"roots\"?"));
 }

@@ -67,13 +67,6 @@ constexpr auto kRelevance = cli::SortOrder::relevance;
 
 }  // namespace
 
-TEST_F(SearcherTest, AbsentDaemonIsAFailure) {
-  mailscreen::Searcher searcher(options(directory / "none"), [this] { bell.release(); });
-  const Found found = find(searcher, {"words", "", kRelevance, false, 0, 10});
-  EXPECT_EQ(found.failure, Failure::unreachable);
-  EXPECT_EQ(found.reason, "tallowsearchd is not running");
-}
-
 TEST_F(SearcherTest, ReportsReasonsOfFailures) {
   testsupport::FakeDaemon fake;
   mailscreen::Searcher searcher(options(fake.runtimeDirectory()), [this] { bell.release(); });
@@ -84,6 +77,10 @@ TEST_F(SearcherTest, ReportsReasonsOfFailures) {
   found = find(searcher, {"@bills", "", kRelevance, false, 0, 10});
   EXPECT_EQ(found.failure, Failure::query);
   EXPECT_THAT(found.reason, HasSubstr("there is no saved search \"bills\""));
+  fake.stop();
+  found = find(searcher, {"words", "", kRelevance, false, 0, 10});
+  EXPECT_EQ(found.failure, Failure::unreachable);
+  EXPECT_EQ(found.reason, "tallowsearchd is not running");
 }
 
 // A daemon that does not answer does not delay the end of the program.
