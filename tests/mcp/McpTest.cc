@@ -129,7 +129,9 @@ TEST(McpSessionTest, DamagedMessagesEndNothing) {
       R"({"query":"from:mara \"a b\" OR (c -d","limit":5}}})",
       R"({"jsonrpc":"2.0","id":5,"method":"tools/call","params":{"name":"show","arguments":)"
       R"({"id":"file/a%2Fb","from":7}}})",
-      R"({"jsonrpc":"2.0","id":6,"method":"tools/call","params":{"name":"status"}})"};
+      R"({"jsonrpc":"2.0","id":6,"method":"tools/call","params":{"name":"status"}})",
+      R"({"jsonrpc":"2.0","id":[8],"method":"ping"})",
+      R"({"jsonrpc":"2.0","id":9,"method":7})"};
   std::mt19937 random(testsupport::firstSeed());
   for (int round = 0; round < 5000; ++round) {
     std::string line = messages[random() % std::size(messages)];
