@@ -1,11 +1,10 @@
 #include <gmock/gmock.h>
 
-#include <array>
-#include <cstdio>
 #include <regex>
 #include <set>
 
 #include "platform/Files.h"
+#include "tests/support/ShellTest.h"
 
 using testing::Contains;
 
@@ -13,21 +12,6 @@ using testing::Contains;
 namespace {
 
 using Names = std::set<std::string>;
-
-std::string read(const char* path) {
-  return platform::readFile(path, size_t{1} << 20, nullptr).value_or("");
-}
-
-std::string help(const std::string& command = "") {
-  FILE* const pipe = popen((TALLOW_PROGRAM " help " + command).c_str(), "r");
-  std::string text;
-  std::array<char, 4096> bytes;
-  while (const size_t count = fread(bytes.data(), 1, bytes.size(), pipe)) {
-    text.append(bytes.data(), count);
-  }
-  EXPECT_EQ(pclose(pipe), 0) << command;
-  return text;
-}
 
 Names found(const std::string& text, const char* pattern) {
   const std::regex expression(pattern);
@@ -38,30 +22,35 @@ Names found(const std::string& text, const char* pattern) {
   return names;
 }
 
-Names commands() {
-  const std::string text = help();
-  return found(text.substr(text.find("Subcommands:")), "\n  ([a-z]+) ");
-}
+class CommandLinePageTest : public testsupport::ShellTest {
+ protected:
+  CommandLinePageTest() { tallow = TALLOW_PROGRAM " help"; }
 
-Names options() {
-  const std::string any = "(?:^|[ ,])(--[a-z][a-z0-9-]*)";
-  Names names = found(help(), any.c_str());
-  for (const std::string& command : commands()) {
-    const std::string text = help(command);
-    names.merge(found(text.substr(0, text.find("Examples:")), any.c_str()));
+  Names commands() {
+    const std::string text = outputOf("");
+    return found(text.substr(text.find("Subcommands:")), "\n  ([a-z]+) ");
   }
-  return names;
-}
+  Names options() {
+    constexpr const char* kAny = "(?:^|[ ,])(--[a-z][a-z0-9-]*)";
+    Names names = found(outputOf(""), kAny);
+    for (const std::string& command : commands()) {
+      const std::string text = outputOf(command);
+      names.merge(found(text.substr(0, text.find("Examples:")), kAny));
+    }
+    return names;
+  }
+};
 
 // The page without the marks of its fonts, and with plain hyphens.
 std::string page() {
-  const std::string text = std::regex_replace(read(TALLOW_PAGE), std::regex("\\\\f[A-Z]"), "");
+  const auto source = platform::readFile(TALLOW_PAGE, size_t{1} << 20, nullptr).value_or("");
+  const std::string text = std::regex_replace(source, std::regex("\\\\f[A-Z]"), "");
   return std::regex_replace(text, std::regex("\\\\-"), "-");
 }
 
 }  // namespace
 
-TEST(CommandLinePageTest, ThePageHasEveryCommandAndOption) {
+TEST_F(CommandLinePageTest, ThePageHasEveryCommandAndOption) {
   const Names commandsOfPage = found(page(), "\n\\.B[IR]? \"?([a-z]+)");
   for (const std::string& command : commands()) EXPECT_THAT(commandsOfPage, Contains(command));
   const Names optionsOfPage = found(page(), "(--[a-z][a-z0-9-]*)");

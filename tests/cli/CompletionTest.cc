@@ -1,11 +1,7 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
 
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <sstream>
 
 #include "tests/support/Programs.h"
@@ -28,36 +24,28 @@ class CompletionTest : public testsupport::TmuxTest {
     fs::create_directories(directory / "bin");
     fs::create_symlink(TALLOW_PROGRAM, directory / "bin/tallow");
     fs::create_directories(directory / "work/inner");
-    std::ofstream(directory / "work/mail.mbox") << "From x\n";
+    write("work/mail.mbox", "From x\n");
+    // A saved search, which the shells ask `tallow` for.
+    write("config/tallow/searches", "bills subject:invoice\n");
+    tallow = TALLOW_PROGRAM;
     variables = fmt::format("PATH={}/bin:$PATH", directory.path());
   }
   void TearDown() override {
     if (fs::exists(directory / "tmux")) TmuxTest::TearDown();
   }
 
-  void writeScript(const char* shell, const std::string& name) const {
-    fs::create_directories(fs::path(directory / name).parent_path());
-    ASSERT_EQ(std::system(
-                  fmt::format(TALLOW_PROGRAM " completion {} >{}/{}", shell, directory.path(), name)
-                      .c_str()),
-              0);
-  }
-  // A saved search, which the shells ask `tallow` for.
-  void saveSearch() const {
-    fs::create_directories(directory / "config/tallow");
-    std::ofstream(directory / "config/tallow/searches") << "bills subject:invoice\n";
+  void writeScript(const std::string& shell, const std::string& name) {
+    write(name, outputOf("completion " + shell));
   }
 
   // Types this and Tab in an empty line, and waits for the text.
   void complete(const std::string& line, const std::string& expected) const {
     press("C-u");
-    type("clear");
-    press("Enter");
+    enter("clear");
     awaitThat([](const std::string& seen) { return seen.find("clear") == std::string::npos; },
               "an empty screen");
     type(line);
-    press("Tab");
-    await(expected);
+    press("Tab", expected);
   }
 
   // In both interactive shells.
@@ -73,8 +61,7 @@ class CompletionTest : public testsupport::TmuxTest {
     complete("tallow help pur", "tallow help purge");
     // An option of another command is none of this one.
     complete("tallow show --mai", "tallow show --mai");
-    type("z");
-    await("tallow show --maiz");
+    type("z", "tallow show --maiz");
   }
 };
 
@@ -83,23 +70,19 @@ class CompletionTest : public testsupport::TmuxTest {
 TEST_F(CompletionTest, Bash) {
   NEED_PROGRAMS("bash", "tmux")
   writeScript("bash", "share/completions/tallow");
-  saveSearch();
   variables += fmt::format(" BASH_COMPLETION_USER_DIR={}/share", directory.path());
-  start("PS1='ready> ' exec bash --norc --noprofile -i", 100, 20);
-  await("ready>");
+  startShell(100, 20);
   // With the package bash-completion, which loads the script, and without it.
   const bool package = fs::exists("/usr/share/bash-completion/bash_completion");
   EXPECT_TRUE(package || !testsupport::isCI()) << "bash-completion is missing";
-  type(fmt::format("cd {}/work; bind \"set enable-bracketed-paste off\"; source {}; clear",
-                   directory.path(),
-                   package ? "/usr/share/bash-completion/bash_completion"
-                           : directory / "share/completions/tallow"));
-  press("Enter");
+  enter(fmt::format("cd {}/work; bind \"set enable-bracketed-paste off\"; source {}; clear",
+                    directory.path(),
+                    package ? "/usr/share/bash-completion/bash_completion"
+                            : directory / "share/completions/tallow"));
   awaitGone("source");
   expectCompletions();
   press("C-u");
-  type("complete -r tallow; source ../share/completions/tallow; clear");
-  press("Enter");
+  enter("complete -r tallow; source ../share/completions/tallow; clear");
   awaitGone("source");
   expectCompletions();
 }
@@ -107,14 +90,12 @@ TEST_F(CompletionTest, Bash) {
 TEST_F(CompletionTest, Zsh) {
   NEED_PROGRAMS("zsh", "tmux")
   writeScript("zsh", "functions/_tallow");
-  saveSearch();
   start("exec zsh -f -i", 100, 20);
-  type(
+  enter(
       fmt::format("PS1=\"ready> \"; cd {}/work; fpath=({}/functions $fpath); autoload -U compinit; "
                   "compinit -u -D; clear",
-                  directory.path(), directory.path()));
-  press("Enter");
-  await("ready>");
+                  directory.path(), directory.path()),
+      "ready>");
   awaitGone("compinit");
   expectCompletions();
   // A list shows what each is for.
@@ -126,13 +107,13 @@ TEST_F(CompletionTest, Zsh) {
 TEST_F(CompletionTest, Fish) {
   NEED_PROGRAMS("fish")
   writeScript("fish", "config/fish/completions/tallow.fish");
-  saveSearch();
   // The words that `complete -C` offers for a line, without their descriptions.
   const auto offered = [&](const std::string& line) {
-    std::istringstream lines(testsupport::outputOf(fmt::format(
-        "cd {0}/work && HOME={0} XDG_CONFIG_HOME={0}/config XDG_DATA_HOME={0} PATH={0}/bin:$PATH "
+    shell(fmt::format(
+        "cd work && HOME={0} XDG_CONFIG_HOME={0}/config XDG_DATA_HOME={0} PATH={0}/bin:$PATH "
         "fish -c 'complete -C \"{1}\"'",
-        directory.path(), line)));
+        directory.path(), line));
+    std::istringstream lines(output);
     std::vector<std::string> words;
     for (std::string one; std::getline(lines, one);) words.push_back(one.substr(0, one.find('\t')));
     return words;
@@ -152,6 +133,6 @@ TEST_F(CompletionTest, Fish) {
 }
 
 TEST_F(CompletionTest, OtherShellsAreRefused) {
-  EXPECT_EQ(WEXITSTATUS(std::system(TALLOW_PROGRAM " completion csh 2>/dev/null")), 2);
-  EXPECT_EQ(WEXITSTATUS(std::system(TALLOW_PROGRAM " completion bash >/dev/full")), 2);
+  EXPECT_EQ(run("completion csh"), 2);
+  EXPECT_EQ(run("completion bash >/dev/full"), 2);
 }

@@ -1,73 +1,56 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
 
 #include <csignal>
-#include <cstdlib>
 #include <filesystem>
 #include <nlohmann/json.hpp>
 #include <set>
 
-#include "platform/Files.h"
 #include "tests/client/FakeDaemon.h"
 #include "tests/daemon/DaemonProcess.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 namespace fs = std::filesystem;
 using testing::HasSubstr;
 using testing::StartsWith;
+using IndexTest = testsupport::ShellTest;
 
 // Everyday use of indexed mail, with the program and a real daemon.
 namespace {
 
-class EverydayTest : public testing::Test {
+class EverydayTest : public testsupport::ShellTest {
  protected:
   void SetUp() override {
     ASSERT_TRUE(daemon.ready());
-    std::filesystem::copy(TALLOW_SAMPLE_MAIL, mail, std::filesystem::copy_options::recursive);
+    fs::copy(TALLOW_SAMPLE_MAIL, mail, fs::copy_options::recursive);
+    environment = fmt::format(
+        "-u PAGER -u STATE_DIRECTORY XDG_RUNTIME_DIR={0}/run XDG_STATE_HOME={0}/state "
+        "XDG_CONFIG_HOME={0}/config TALLOW_SESSION=test TZ=UTC",
+        directory.path());
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
     ASSERT_EQ(run("index " + mail), 0) << errors;
   }
 
-  // Runs `tallow ARGUMENTS` in a shell and returns the exit status.
-  int run(const std::string& arguments, const std::string& environment = "") {
-    const std::string command = fmt::format(
-        "cd {0} && env -u PAGER -u STATE_DIRECTORY XDG_RUNTIME_DIR={0}/run "
-        "XDG_STATE_HOME={0}/state "
-        "XDG_CONFIG_HOME={0}/config TALLOW_SESSION=test TZ=UTC {1} " TALLOW_PROGRAM
-        " --runtime-dir {2} {3} >{0}/out 2>{0}/err </dev/null",
-        directory.path(), environment, daemon.runtimeDirectory(), arguments);
-    const int status = WEXITSTATUS(std::system(command.c_str()));
-    output = read("out");
-    errors = read("err");
-    return status;
+  [[nodiscard]] nlohmann::json jsonOf(const std::string& arguments) {
+    return nlohmann::json::parse(outputOf("--format=json " + arguments));
   }
-
-  [[nodiscard]] std::string read(const std::string& name) const {
-    return platform::readFile(directory / name, size_t{1} << 20, nullptr).value_or("(none)");
-  }
-
   [[nodiscard]] int count(const std::string& words) {
     run("search --count " + words);
     return std::atoi(output.c_str());
   }
 
-  const testsupport::TemporaryDirectory directory;
   const std::string mail = directory / "mail";
   const testsupport::DaemonProcess daemon{directory.path()};
-  std::string output;
-  std::string errors;
 };
 
 }  // namespace
 
 TEST_F(EverydayTest, ShowsWhatTheLastSearchFound) {
-  EXPECT_EQ(run("show 1"), 2);
-  EXPECT_THAT(errors, HasSubstr("no search of this terminal is known"));
-  ASSERT_EQ(run("search '\"corrected invoice\" ' --offset=1 --limit=1 --sort=date"), 0);
-  EXPECT_THAT(output, StartsWith("  2  2024-01-11 10:03  Nordlys Energy\n"));
-  EXPECT_EQ(run("--color=always show 2"), 0);
-  EXPECT_THAT(output, HasSubstr("\x1b[2mFrom:     \x1b[0mNordlys Energy <"));
+  EXPECT_THAT(errorsOf("show 1"), HasSubstr("no search of this terminal is known"));
+  EXPECT_THAT(outputOf("search '\"corrected invoice\" ' --offset=1 --limit=1 --sort=date"),
+              StartsWith("  2  2024-01-11 10:03  Nordlys Energy\n"));
+  EXPECT_THAT(outputOf("--color=always show 2"),
+              HasSubstr("\x1b[2mFrom:     \x1b[0mNordlys Energy <"));
   EXPECT_THAT(output, HasSubstr("the \x1b[1;33mcorrected\x1b[0m \x1b[1;33minvoice\x1b[0m 4502"));
   EXPECT_EQ(run("show 1"), 1);
   EXPECT_EQ(run("show 2", "TALLOW_SESSION=other"), 2);
@@ -76,65 +59,55 @@ TEST_F(EverydayTest, ShowsWhatTheLastSearchFound) {
   EXPECT_EQ(run("show 2"), 0);
   EXPECT_EQ(run("search nothingofthekind"), 1);
   EXPECT_EQ(run("show 2"), 1);
-  EXPECT_EQ(run("show " + mail + "/archive.mbox:736"), 0);
-  EXPECT_THAT(output, HasSubstr("Date:     Tue, 09 Jan 2024"));
-  EXPECT_EQ(run("show " + mail + "/archive.mbox"), 2);
-  EXPECT_THAT(errors, HasSubstr("this is a mailbox"));
+  EXPECT_THAT(outputOf("show " + mail + "/archive.mbox:736"),
+              HasSubstr("Date:     Tue, 09 Jan 2024"));
+  EXPECT_THAT(errorsOf("show " + mail + "/archive.mbox"), HasSubstr("this is a mailbox"));
   EXPECT_EQ(run("show file/gone other:1"), 2);
   EXPECT_EQ(run("show other:1"), 2);
 }
 
 TEST_F(EverydayTest, SavesAttachments) {
-  platform::writeFileAtomically(directory / "a.eml",
-                                "Subject: s\nMIME-Version: 1.0\nContent-Type: image/png; "
-                                "name=\"../../evil.png\"\n\n\x1b[31m",
-                                nullptr);
-  EXPECT_EQ(run("show ./a.eml"), 0);
-  EXPECT_THAT(output, HasSubstr("\n  1  ../../evil.png  image/png, 5 B\n"));
+  write("a.eml",
+        "Subject: s\nMIME-Version: 1.0\nContent-Type: image/png; name=\"../../evil.png\"\n\n"
+        "\x1b[31m");
+  EXPECT_THAT(outputOf("show ./a.eml"), HasSubstr("\n  1  ../../evil.png  image/png, 5 B\n"));
   EXPECT_EQ(run("show ./a.eml --attachment 1 -o b.png"), 0);
   EXPECT_EQ(read("b.png"), "\x1b[31m");
-  platform::writeFileAtomically(directory / "b.png", "old", nullptr);
+  write("b.png", "old");
   EXPECT_EQ(run("show ./a.eml --attachment 1 -o b.png"), 2);
   EXPECT_EQ(read("b.png"), "old");
   EXPECT_EQ(run("show ./a.eml --attachment 1 -o b.png --force"), 0);
   EXPECT_EQ(read("b.png"), "\x1b[31m");
   // Links are neither followed nor replaced.
-  std::filesystem::create_symlink(directory / "target", directory / "link");
-  EXPECT_EQ(run("show ./a.eml --attachment 1 -o link"), 2);
-  EXPECT_EQ(run("show ./a.eml --attachment 1 -o link --force"), 2);
-  EXPECT_EQ(run("show ./a.eml --attachment 1 -o . --force"), 2);
-  EXPECT_FALSE(std::filesystem::exists(directory / "target"));
-  EXPECT_EQ(run("show ./a.eml --attachment 2 -o c"), 2);
-  EXPECT_EQ(run("show ./a.eml --attachment 1 -o -"), 0);
-  EXPECT_EQ(output, "\x1b[31m");
-  EXPECT_EQ(run("show ./a.eml --raw"), 0);
-  EXPECT_EQ(output, read("a.eml"));
+  fs::create_symlink(directory / "target", directory / "link");
+  for (const char* const wrong : {"1 -o link", "1 -o link --force", "1 -o . --force", "2 -o c"}) {
+    EXPECT_EQ(run(std::string("show ./a.eml --attachment ") + wrong), 2) << wrong;
+  }
+  EXPECT_FALSE(fs::exists(directory / "target"));
+  EXPECT_EQ(outputOf("show ./a.eml --attachment 1 -o -"), "\x1b[31m");
+  EXPECT_EQ(outputOf("show ./a.eml --raw"), read("a.eml"));
 }
 
 TEST_F(EverydayTest, PagesOnATerminal) {
   const std::string shown = "show " + mail + "/archive.mbox:736";
   const auto onTerminal = [&](const std::string& pager) {
-    const std::string command = fmt::format("PAGER='{}' " TALLOW_PROGRAM " {}", pager, shown);
-    return std::system(("script -qec \"" + command + "\" " + directory / "typed" + " >" +
-                        directory / "out </dev/null")
-                           .c_str());
+    return shell(
+        fmt::format("script -qec \"PAGER='{}' " TALLOW_PROGRAM " {}\" typed", pager, shown));
   };
   EXPECT_EQ(onTerminal("sed s/Subject/PAGED/"), 0);
-  EXPECT_THAT(read("out"), HasSubstr("PAGED"));
+  EXPECT_THAT(output, HasSubstr("PAGED"));
   for (const char* const pager : {"no-such-pager-here", "true", ""}) {
     EXPECT_EQ(onTerminal(pager), 0) << pager;
-    EXPECT_EQ(read("out").find("Subject") == std::string::npos, std::string_view(pager) == "true");
+    EXPECT_EQ(output.find("Subject") == std::string::npos, std::string_view(pager) == "true");
   }
 }
 
 TEST_F(EverydayTest, ResultsByConversation) {
-  ASSERT_EQ(run("search --threads 'invoice 4471 '"), 0);
-  EXPECT_THAT(output, HasSubstr("Re: Your invoice 4471 for December  (4 results: 1 2 3 4)\n"));
-  EXPECT_EQ(run("search --threads --count 'invoice 4471 '"), 0);
-  EXPECT_EQ(output, "1\n");
+  EXPECT_THAT(outputOf("search --threads 'invoice 4471 '"),
+              HasSubstr("Re: Your invoice 4471 for December  (4 results: 1 2 3 4)\n"));
+  EXPECT_EQ(outputOf("search --threads --count 'invoice 4471 '"), "1\n");
   EXPECT_EQ(run("show 4"), 0);
-  EXPECT_EQ(run("search --threads --format=json --limit 0 e"), 0);
-  const auto json = nlohmann::json::parse(output);
+  const auto json = jsonOf("search --threads --limit 0 e");
   EXPECT_EQ(json["total"], json["threads"].size());
   std::set<int> ranks;
   for (const auto& thread : json["threads"]) {
@@ -148,8 +121,8 @@ TEST_F(EverydayTest, ResultsByConversation) {
 TEST_F(EverydayTest, DeletesFoldersAndFiles) {
   const int family = count("folder:family");
   ASSERT_GT(family, 0);
-  EXPECT_EQ(run("delete " + mail + "/family"), 0);
-  EXPECT_EQ(output, fmt::format("deleted {}/family: {} messages\n", mail, family));
+  EXPECT_EQ(outputOf("delete " + mail + "/family"),
+            fmt::format("deleted {}/family: {} messages\n", mail, family));
   EXPECT_EQ(count("folder:family"), 0);
   EXPECT_EQ(run("delete " + mail + "/family"), 1);
   EXPECT_EQ(errors, "tallow: " + mail + "/family: not in the index\n");
@@ -164,8 +137,7 @@ TEST_F(EverydayTest, DeletesAMessageOfAMailboxByItsPlace) {
   EXPECT_EQ(run("delete " + message), 0);
   EXPECT_EQ(run("delete " + message), 1);
   EXPECT_EQ(run("sync " + mail), 0);
-  EXPECT_EQ(run("delete " + message), 0);
-  EXPECT_EQ(output, "deleted " + message + '\n');
+  EXPECT_EQ(outputOf("delete " + message), "deleted " + message + '\n');
   EXPECT_EQ(run("delete " + message), 1);
 }
 
@@ -173,16 +145,14 @@ TEST_F(EverydayTest, SavedSearches) {
   EXPECT_EQ(run("save"), 1);
   EXPECT_EQ(run("save bills subject:invoice -corrected"), 0);
   EXPECT_EQ(run("save @libraries from:library"), 0);
-  EXPECT_EQ(run("save"), 0);
-  EXPECT_EQ(output, "bills            subject:invoice -corrected\nlibraries        from:library\n");
+  EXPECT_EQ(outputOf("save"),
+            "bills            subject:invoice -corrected\nlibraries        from:library\n");
   EXPECT_EQ(count("@bills"), count("subject:invoice -corrected"));
   EXPECT_EQ(count("@bills OR @libraries"), count("'(subject:invoice -corrected) OR from:library'"));
   EXPECT_EQ(count("invoice -@bills"), count("'invoice -(subject:invoice -corrected)'"));
-  EXPECT_EQ(run("search @nothing"), 2);
-  EXPECT_THAT(errors, HasSubstr("there is no saved search \"nothing\""));
+  EXPECT_THAT(errorsOf("search @nothing"), HasSubstr("there is no saved search \"nothing\""));
   // Lines that are not searches are kept.
-  const std::string file = directory / "config/tallow/searches";
-  platform::writeFileAtomically(file, "# mine\n\nodd\nbills " + std::string("x\n"), nullptr);
+  write("config/tallow/searches", "# mine\n\nodd\nbills x\n");
   EXPECT_EQ(run("save bills harbour"), 0);
   EXPECT_EQ(read("config/tallow/searches"), "# mine\n\nodd\nbills harbour\n");
   EXPECT_EQ(run("save --delete bills"), 0);
@@ -192,12 +162,10 @@ TEST_F(EverydayTest, SavedSearches) {
 }
 
 TEST_F(EverydayTest, CompletesAddresses) {
-  EXPECT_EQ(run("address samir"), 0);
-  EXPECT_THAT(output, StartsWith("samir@example.com\tSamir Haddad\t"));
+  EXPECT_THAT(outputOf("address samir"), StartsWith("samir@example.com\tSamir Haddad\t"));
   EXPECT_EQ(run("address --mutt had sam@nowhere"), 1);
   EXPECT_EQ(output, "0 addresses\n");
-  EXPECT_EQ(run("address --format=json -- example.org"), 0);
-  const auto list = nlohmann::json::parse(output);
+  const auto list = jsonOf("address -- example.org");
   EXPECT_EQ(list[0]["name"], "Mara Lindqvist");
   for (size_t i = 1; i < list.size(); ++i) EXPECT_LE(list[i]["mails"], list[0]["mails"]);
   EXPECT_EQ(run("address --limit=1 e"), 0);
@@ -211,19 +179,18 @@ TEST_F(EverydayTest, DoesNotCreateAClassWithoutMail) {
     EXPECT_EQ(run(command + state), 1) << command;
     EXPECT_EQ(errors, "tallow: nothing has been indexed for class \"work\" yet\n");
   }
-  EXPECT_FALSE(std::filesystem::exists(directory / "state/TallowSearch/work"));
+  EXPECT_FALSE(fs::exists(directory / "state/TallowSearch/work"));
   EXPECT_EQ(run("index " + mail + "/drafts" + state), 0);
   EXPECT_EQ(run("search toast" + state), 0);
 }
 
 TEST_F(EverydayTest, StatusOfAllClassesAndOfDeletedMail) {
-  const std::string state = " --format=json --state-dir " + directory / "state";
+  const std::string state = " --state-dir " + directory / "state";
   EXPECT_EQ(run("index --class work " + mail + "/drafts"), 0);
   const int family = count("folder:family");
   EXPECT_EQ(run("delete " + mail + "/family"), 0);
   const auto classes = [this](const std::string& arguments) {
-    EXPECT_EQ(run("status" + arguments), 0) << errors;
-    return nlohmann::json::parse(output).at("classes");
+    return jsonOf("status" + arguments).at("classes");
   };
   const auto all = classes(state);
   ASSERT_EQ(all.size(), 2U);
@@ -238,13 +205,11 @@ TEST_F(EverydayTest, StatusOfAllClassesAndOfDeletedMail) {
   ASSERT_EQ(one.size(), 1U);
   EXPECT_EQ(one[0].at("index").at("messages"), all[1].at("index").at("messages"));
   // A class from the settings counts after its first sync; showing the status does not create it.
-  platform::createDirectories(directory / "config/tallow", nullptr);
-  platform::writeFileAtomically(
-      directory / "config/tallow/config.toml",
-      fmt::format("roots = ['{0}']\n[class]\n'{0}' = 'private'\n", mail + "/drafts"), nullptr);
+  write("config/tallow/config.toml",
+        fmt::format("roots = ['{0}']\n[class]\n'{0}' = 'private'\n", mail + "/drafts"));
   EXPECT_EQ(classes(state).size(), 2U);
   EXPECT_TRUE(classes(state + " --class private")[0].at("index").is_null());
-  EXPECT_FALSE(std::filesystem::exists(directory / "state/TallowSearch/private"));
+  EXPECT_FALSE(fs::exists(directory / "state/TallowSearch/private"));
   EXPECT_EQ(run("sync"), 0) << errors;
   EXPECT_EQ(classes(state).size(), 3U);
 }
@@ -262,29 +227,25 @@ TEST_F(EverydayTest, LinksTheResultsForMailPrograms) {
     }
     return found;
   };
-  EXPECT_EQ(run(search + "folder:family"), 0) << errors;
-  EXPECT_EQ(output, "10 messages in " + place + '\n');
+  EXPECT_EQ(outputOf(search + "folder:family"), "10 messages in " + place + '\n');
   EXPECT_THAT(targets(),
               testing::IsSupersetOf({mail + "/family/cur/1707297540.M002.harbour:2,RS .tallow:2,RS",
                                      mail + "/family/new/1707831480.M009.harbour .tallow"}));
   // Of a mailbox there are copies; those of compressed mail are not compressed.
-  ASSERT_EQ(std::system(("gzip " + mail + "/drafts/harvest-toast.eml").c_str()), 0);
+  ASSERT_EQ(shell("gzip mail/drafts/harvest-toast.eml"), 0);
   ASSERT_EQ(run("index " + mail), 0);
-  std::filesystem::remove(mail + "/family/new/1707831480.M009.harbour");
-  EXPECT_EQ(run(search + "--format=json invoice OR toast OR folder:family"), 0) << errors;
-  const auto counts = nlohmann::json::parse(output);
+  fs::remove(mail + "/family/new/1707831480.M009.harbour");
+  const auto counts = jsonOf(search + "invoice OR toast OR folder:family");
   EXPECT_EQ(counts["maildir"], place);
   EXPECT_EQ(counts["linked"], 9);
   EXPECT_EQ(counts["leftOut"], 2);  // the one that was removed, and the one that was compressed
-  const std::string copies = directory / "copies";
-  ASSERT_EQ(std::system(("cat " + place + "/.tallow-folder/* >" + copies).c_str()), 0);
-  EXPECT_THAT(read("copies"), StartsWith("X-Tallow-Copy-Of: "));
-  EXPECT_THAT(read("copies"), HasSubstr("X-Tallow-Copy-Of: mbox" + mail +
-                                        "/archive.mbox?offset=0\nReceived: from"));
-  EXPECT_THAT(read("copies"), HasSubstr("harvest-toast.eml.gz\nFrom: "));
+  EXPECT_THAT(outputOfShell("cat " + place + "/.tallow-folder/*"),
+              StartsWith("X-Tallow-Copy-Of: "));
+  EXPECT_THAT(output, HasSubstr("X-Tallow-Copy-Of: mbox" + mail +
+                                "/archive.mbox?offset=0\nReceived: from"));
+  EXPECT_THAT(output, HasSubstr("harvest-toast.eml.gz\nFrom: "));
   // The folder is not mail, whoever looks into it.
-  EXPECT_EQ(run("sync --format=json " + directory / "folders"), 0) << errors;
-  EXPECT_EQ(nlohmann::json::parse(output)["toSend"], 0);
+  EXPECT_EQ(jsonOf("sync " + directory / "folders")["toSend"], 0);
   EXPECT_EQ(run("index " + place), 2);
   // Each search takes the links of the one before; one that fails takes nothing.
   EXPECT_EQ(run(search + "--limit=2 invoice"), 0);
@@ -295,50 +256,42 @@ TEST_F(EverydayTest, LinksTheResultsForMailPrograms) {
   EXPECT_EQ(run(search + "nothingofthekind"), 1);
   EXPECT_TRUE(targets().empty());
   EXPECT_EQ(run(search + "folder:family"), 0);
-  EXPECT_EQ(run(search), 0);
-  EXPECT_EQ(output, "0 messages in " + place + '\n');
+  EXPECT_EQ(outputOf(search), "0 messages in " + place + '\n');
   EXPECT_TRUE(targets().empty());
-  EXPECT_EQ(run("search --maildir=" + mail + " invoice"), 2);
-  EXPECT_THAT(errors, HasSubstr("is not from a search"));
+  EXPECT_THAT(errorsOf("search --maildir=" + mail + " invoice"), HasSubstr("is not from a search"));
 }
 
 TEST_F(EverydayTest, WritesTheStatusAsAPage) {
   ASSERT_EQ(run("sync " + mail), 0) << errors;
-  EXPECT_EQ(run("status --html page.html", "STATE_DIRECTORY=" + directory / "state"), 0) << errors;
-  EXPECT_EQ(output, "wrote page.html\n");
+  EXPECT_EQ(outputOf("status --html page.html", "STATE_DIRECTORY=" + directory / "state"),
+            "wrote page.html\n");
   const std::string page = read("page.html");
-  for (const std::string& text :
-       {"<span class=\"path\">" + mail + "/family</span><span class=\"count\">10</span>",
-        std::string("<title>2024-02: "), std::string("A sync adds one entry a day"),
-        std::string("device unlocked")}) {
+  EXPECT_THAT(page, HasSubstr("<span class=\"path\">" + mail +
+                              "/family</span><span class=\"count\">10</span>"));
+  for (const char* text : {"<title>2024-02: ", "A sync adds one entry a day", "device unlocked"}) {
     EXPECT_THAT(page, HasSubstr(text));
   }
   // The former page is replaced; nothing else is.
   EXPECT_EQ(run("status --html page.html"), 0);
   fs::create_symlink("page.html", directory / "link");
-  EXPECT_EQ(run("status --html link"), 2);
-  EXPECT_THAT(errors, HasSubstr("link: this is not a plain file, and stays"));
-  EXPECT_EQ(run("status --html ."), 2);
-  EXPECT_EQ(run("status --html none/page.html"), 2);
-  EXPECT_EQ(run("status --html page.html --format=json"), 2);
-  EXPECT_NE(std::system(("ls " + directory / "page.html.* 2>/dev/null").c_str()), 0);
+  EXPECT_THAT(errorsOf("status --html link"),
+              HasSubstr("link: this is not a plain file, and stays"));
+  for (const char* const wrong : {".", "none/page.html", "page.html --format=json"}) {
+    EXPECT_EQ(run(std::string("status --html ") + wrong), 2) << wrong;
+  }
+  EXPECT_NE(shell("ls page.html.*"), 0);
 }
 
 // The signal comes while the daemon has the first batch.
-TEST(IndexTest, AnInterruptLeavesASummary) {
-  const testsupport::TemporaryDirectory directory;
+TEST_F(IndexTest, AnInterruptLeavesASummary) {
   testsupport::FakeDaemon daemon;
-  const auto read = [&](const char* name) {
-    return platform::readFile(directory / name, 1000, nullptr).value_or("");
-  };
   daemon.answer("IndexItems", [&](rpc::Reply& reply) {
     kill(std::atoi(read("pid").c_str()), SIGINT);
     reply.send({});
   });
-  const std::string command =
-      fmt::format("exec sh -c 'echo $$ >{0}/pid; exec " TALLOW_PROGRAM
-                  " --runtime-dir {1} index {2} {2} >{0}/out'",
-                  directory.path(), daemon.runtimeDirectory(), TALLOW_SAMPLE_MAIL);
-  EXPECT_EQ(WEXITSTATUS(std::system(command.c_str())), 2);
-  EXPECT_THAT(read("out"), testing::EndsWith(" messages indexed, interrupted\n"));
+  EXPECT_EQ(shell(fmt::format("sh -c 'echo $$ >pid; exec " TALLOW_PROGRAM
+                              " --runtime-dir {0} index {1} {1}'",
+                              daemon.runtimeDirectory(), TALLOW_SAMPLE_MAIL)),
+            2);
+  EXPECT_THAT(output, testing::EndsWith(" messages indexed, interrupted\n"));
 }

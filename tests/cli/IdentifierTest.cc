@@ -3,7 +3,6 @@
 #include <random>
 
 #include "cli/Identifier.h"
-#include "platform/Files.h"
 #include "platform/URL.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -35,12 +34,8 @@ TEST(Identifier, MakesAStrictURLOfAnyPathAndReadsBack) {
       EXPECT_TRUE(TLURL::parse("tlw://mail_bundle_id/" + identifier).has_value()) << identifier;
       const auto location = parseIdentifier(identifier);
       ASSERT_TRUE(location.has_value()) << identifier;
-      if (!cli::isMaildirFile(path)) {
-        EXPECT_EQ(location->path, path);
-      }
-      if (identifier.starts_with("mbox")) {
-        EXPECT_EQ(location->offset, offset);
-      }
+      EXPECT_TRUE(location->path == path || cli::isMaildirFile(path)) << path;
+      EXPECT_TRUE(location->offset == offset || identifier.starts_with("file")) << identifier;
     }
   }
 }
@@ -56,10 +51,7 @@ TEST(Identifier, RejectsOtherForms) {
 TEST(Identifier, FindsAMaildirFileAfterItsFlagsHaveChanged) {
   const testsupport::TemporaryDirectory directory;
   const std::string cur = directory / "in/cur";
-  platform::createDirectories(cur, nullptr);
-  platform::createDirectories(directory / "in/new", nullptr);
-  platform::writeFileAtomically(cur + "/1.a:2,RS", "", nullptr);
-  platform::writeFileAtomically(cur + "/1.ab", "", nullptr);
+  for (const char* name : {"in/cur/1.a:2,RS", "in/cur/1.ab"}) directory.write(name, "");
   EXPECT_EQ(cli::findMaildirFile(cur + "/1.a"), cur + "/1.a:2,RS");
   EXPECT_EQ(cli::findMaildirFile(cur + "/1.ab"), cur + "/1.ab");
   EXPECT_EQ(cli::findMaildirFile(directory / "in/new/1.a"), cur + "/1.a:2,RS");

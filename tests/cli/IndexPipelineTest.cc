@@ -3,7 +3,6 @@
 
 #include "cli/BatchPace.h"
 #include "cli/IndexPipeline.h"
-#include "platform/Files.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
@@ -21,11 +20,8 @@ std::string mboxOf(size_t messages, size_t bodyBytes) {
 
 TEST(IndexPipeline, BatchesAreBoundedAndKeepTheOrder) {
   const testsupport::TemporaryDirectory directory;
-  const std::string path = directory / "box";
-  for (const auto& [messages, bodyBytes] :
-       {std::pair<size_t, size_t>{1201, 10}, std::pair<size_t, size_t>{100, 150000}}) {
-    ASSERT_TRUE(platform::writeFileAtomically(path, mboxOf(messages, bodyBytes), nullptr));
-    cli::IndexPipeline pipeline({path});
+  for (const auto& [messages, bodyBytes] : {std::pair<size_t, size_t>{1201, 10}, {100, 150000}}) {
+    cli::IndexPipeline pipeline({directory.write("box", mboxOf(messages, bodyBytes))});
     size_t seen = 0;
     uint64_t inputBytes = 0;
     while (const auto batch = pipeline.next()) {
@@ -44,25 +40,9 @@ TEST(IndexPipeline, BatchesAreBoundedAndKeepTheOrder) {
   }
 }
 
-TEST(IndexPipeline, SeparatesFailedMessagesFromFailedPaths) {
-  const testsupport::TemporaryDirectory directory;
-  ASSERT_TRUE(platform::writeFileAtomically(directory / "bad.eml", "\n\nno header", nullptr));
-  ASSERT_TRUE(platform::writeFileAtomically(directory / "notes", "hello", nullptr));
-  ASSERT_TRUE(platform::writeFileAtomically(directory / "good.eml", "A: a\n\nhello", nullptr));
-  cli::IndexPipeline pipeline({directory.path(), directory / "none", directory / "notes"});
-  const auto batch = pipeline.next();
-  ASSERT_TRUE(batch.has_value());
-  EXPECT_FALSE(pipeline.next().has_value());
-  EXPECT_EQ(batch->items.size(), 1u);
-  EXPECT_EQ(batch->messageFailures.size(), 1u);
-  EXPECT_EQ(batch->pathFailures.size(), 2u);
-  EXPECT_EQ(batch->ignored.size(), 1u);
-}
-
 TEST(IndexPipeline, CanBeDestroyedEarly) {
   const testsupport::TemporaryDirectory directory;
-  ASSERT_TRUE(platform::writeFileAtomically(directory / "box", mboxOf(5000, 10), nullptr));
-  cli::IndexPipeline pipeline({directory / "box"});
+  cli::IndexPipeline pipeline({directory.write("box", mboxOf(5000, 10))});
   EXPECT_TRUE(pipeline.next().has_value());
 }
 

@@ -1,10 +1,7 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
 
 #include <csignal>
 #include <cstdio>
-#include <cstdlib>
 #include <filesystem>
 #include <nlohmann/json.hpp>
 
@@ -16,7 +13,7 @@
 #include "salt/Quarantine.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/salt/SaltSupport.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 // The client and the program that it runs, on an index made by the test.
 namespace {
@@ -25,34 +22,21 @@ namespace fs = std::filesystem;
 using testing::HasSubstr;
 using testing::StartsWith;
 
-class InspectTest : public testing::Test {
+class InspectTest : public testsupport::ShellTest {
  protected:
   InspectTest() {
+    tallow = TALLOW_PROGRAM " --state-dir " + state;
     // The lock file that a daemon leaves.
     static_cast<void>(platform::ProcessLock::acquire(platform::processLockPath(state), nullptr));
     platform::createDirectories(platform::joinPath(platform::dataRoot(state), "default"), nullptr);
-  }
-
-  // Runs `tallow COMMAND` on the state and captures the output.
-  int run(const std::string& command) { return shell(client + command); }
-  int shell(const std::string& command) {
-    const std::string redirected =
-        "( " + command + " ) >" + directory / "out" + " 2>" + directory / "err";
-    const int status = std::system(redirected.c_str());
-    output = readAll(directory / "out");
-    errors = readAll(directory / "err");
-    return WEXITSTATUS(status);
-  }
-
-  static std::string readAll(const std::string& path) {
-    return platform::readFile(path, size_t{1} << 30, nullptr).value_or("(no file)");
   }
 
   // All files of the state, with their contents.
   [[nodiscard]] std::map<std::string, std::string> files() const {
     std::map<std::string, std::string> all;
     for (const auto& entry : fs::recursive_directory_iterator(state)) {
-      all[entry.path()] = entry.is_regular_file() ? readAll(entry.path()) : "";
+      const bool file = entry.is_regular_file();
+      all[entry.path()] = file ? read(fs::relative(entry, directory.path())) : "";
     }
     return all;
   }
@@ -74,12 +58,8 @@ class InspectTest : public testing::Test {
     }
   }
 
-  testsupport::TemporaryDirectory directory;
   const std::string state = directory / "state";
   const std::string index = platform::textIndexPath(platform::dataRoot(state), "default");
-  const std::string client = TALLOW_PROGRAM " --state-dir " + state + " ";
-  std::string output;
-  std::string errors;
 };
 
 const salt::SuffixMeta kFirst{1, 0, 1, 0, {}};
@@ -89,19 +69,16 @@ const salt::SuffixMeta kSecond{1, 3, 1, 1, {'b', ' '}};
 
 TEST_F(InspectTest, DumpMatchesTheIndexAndChangesNothing) {
   makeIndex({kFirst, kSecond});
-  std::string dump;
-  {
-    const auto made = salttest::loadIndex(index);
-    ASSERT_TRUE(salttest::addZone(*made, 2, 4, "\x1b[31m red \xe4\xba\xac\xe9\x83\xbd", {0, 6}));
-    ASSERT_TRUE(salttest::addZone(*made, 3, 4, "fifteen bytes..\xe4\xba\xac", {0}));
-    ASSERT_TRUE(made->DeleteDoc(2));
-    dump = made->Dump();
-  }
+  auto made = salttest::loadIndex(index);
+  ASSERT_TRUE(salttest::addZone(*made, 2, 4, "\x1b[31m red \xe4\xba\xac\xe9\x83\xbd", {0, 6}));
+  ASSERT_TRUE(salttest::addZone(*made, 3, 4, "fifteen bytes..\xe4\xba\xac", {0}));
+  ASSERT_TRUE(made->DeleteDoc(2));
+  const std::string dump = made->Dump();
+  made.reset();
   platform::writeFileAtomically(index + "/notes.log", "a log of another kind", nullptr);
   platform::createDirectories(index + "/999999.ldb/000001.log", nullptr);
   const auto before = files();
-  EXPECT_EQ(run("dump"), 0) << errors;
-  EXPECT_EQ(output, cli::cleanLinesForTerminal(dump));
+  EXPECT_EQ(outputOf("dump"), cli::cleanLinesForTerminal(dump));
   EXPECT_THAT(output, HasSubstr("---- [2,4:0]: \"\uFFFD[31m red \u4eac\u90fd\"\n"));
   EXPECT_EQ(run("validate"), 0) << errors;
   EXPECT_EQ(errors, "");
@@ -135,73 +112,53 @@ TEST_F(InspectTest, TwoCrashesOfOneHourAreOneTooMany) {
 
 TEST_F(InspectTest, ClosedPipeEndsTheDump) {
   makeLargeIndex();
-  EXPECT_EQ(shell("{ " + client + "dump; echo $? >&2; } | head -n 1"), 0);
-  EXPECT_EQ(output, "SALT INDEX METRICS\n");
+  EXPECT_EQ(outputOfShell("{ " + tallow + " dump; echo $? >&2; } | head -n 1"),
+            "SALT INDEX METRICS\n");
   EXPECT_EQ(errors, "2\n");
 }
 
 TEST_F(InspectTest, ValidateReportsEachFault) {
-  const auto page = [this] { makeIndex({kFirst, kSecond}); };
+  const std::vector good{kFirst, kSecond};
   const std::string pageKey(
       "\x01"
       "aa ab ba abcd\0\x01\0\x01",
       18);
   const std::string shortPage("\x02", 1);
   const std::string otherOptions(48, '\0');
-  const struct {
-    std::function<void()> make;
-    int status;
-    std::string line;
-    int dumpStatus;
-  } cases[] = {
-      {page, 0, "", 0},
-      {[&] {
-         makeIndex({kSecond, kFirst});
-       },
-       1, "SALT Validation failed: Out of order.", 0},
-      {[&] {
-         page();
-         salttest::editMetrics(index, [](auto& m) { m.Pages = m.Suffixes = 9; });
-       },
-       0, "SALT Validation failed: # of suffixes: 2 != 9.", 0},
-      {[&] {
-         page();
-         salttest::editMetrics(index, [](auto& m) { m.CodeVersion = 305; });
-       },
-       1, "SALT Loading failure: Mismatched code version.", 2},
-      {[&] {
-         page();
-         salttest::editKey(index, pageKey, &shortPage);
-       },
-       1, "Assertion failed: s.size()", 2},
-      {[&] {
-         page();
-         salttest::editKey(index, "\xFFOPTIONS", &otherOptions);
-       },
-       1, "Assertion failed: op.Valid()", 2},
-  };
-  for (const auto& c : cases) {
-    c.make();
+  const std::tuple<std::vector<salt::SuffixMeta>, std::function<void()>, int, std::string, int>
+      cases[] = {
+          {good, [] {}, 0, "", 0},
+          {{kSecond, kFirst}, [] {}, 1, "SALT Validation failed: Out of order.", 0},
+          {good, [&] { salttest::editMetrics(index, [](auto& m) { m.Pages = m.Suffixes = 9; }); },
+           0, "SALT Validation failed: # of suffixes: 2 != 9.", 0},
+          {good, [&] { salttest::editMetrics(index, [](auto& m) { m.CodeVersion = 305; }); }, 1,
+           "SALT Loading failure: Mismatched code version.", 2},
+          {good, [&] { salttest::editKey(index, pageKey, &shortPage); }, 1,
+           "Assertion failed: s.size()", 2},
+          {good, [&] { salttest::editKey(index, "\xFFOPTIONS", &otherOptions); }, 1,
+           "Assertion failed: op.Valid()", 2},
+      };
+  for (const auto& [page, damage, status, line, dumpStatus] : cases) {
+    makeIndex(page);
+    damage();
     const auto before = files();
-    EXPECT_EQ(run("validate"), c.status) << c.line;
-    EXPECT_THAT(output, StartsWith(c.status == 0 ? "valid\n" : "not valid\n"));
-    EXPECT_THAT(errors, HasSubstr(c.line));
-    EXPECT_EQ(run("validate --format=json"), c.status) << c.line;
-    EXPECT_EQ(nlohmann::json::parse(output).at("valid"), c.status == 0);
-    EXPECT_EQ(run("dump"), c.dumpStatus) << c.line;
-    EXPECT_EQ(files(), before) << c.line;
+    EXPECT_EQ(run("validate"), status) << line;
+    EXPECT_THAT(output, StartsWith(status == 0 ? "valid\n" : "not valid\n"));
+    EXPECT_THAT(errors, HasSubstr(line));
+    EXPECT_EQ(run("validate --format=json"), status) << line;
+    EXPECT_EQ(nlohmann::json::parse(output).at("valid"), status == 0);
+    EXPECT_EQ(run("dump"), dumpStatus) << line;
+    EXPECT_EQ(files(), before) << line;
   }
 }
 
 TEST_F(InspectTest, CountsWhatItFinds) {
   makeIndex({kFirst, kSecond});
-  {
-    const auto made = salttest::loadIndex(index);
-    ASSERT_TRUE(salttest::addZone(*made, 2, 4, "gone"));
-    ASSERT_TRUE(made->DeleteDoc(2));
-  }
-  EXPECT_EQ(run("validate --format=json"), 0);
-  EXPECT_EQ(nlohmann::json::parse(output),
+  auto made = salttest::loadIndex(index);
+  ASSERT_TRUE(salttest::addZone(*made, 2, 4, "gone"));
+  ASSERT_TRUE(made->DeleteDoc(2));
+  made.reset();
+  EXPECT_EQ(nlohmann::json::parse(outputOf("validate --format=json")),
             nlohmann::json::parse(R"({"valid": true, "documents": 1, "deletedDocuments": 1,
                 "zones": 1, "textBytes": 13, "suffixes": 3, "hotSuffixes": 1, "pages": 1,
                 "shards": 1})"));
@@ -258,8 +215,7 @@ TEST_F(InspectTest, FindsTheStateOfTheDaemonByItself) {
       elsewhere + "HOME=" + directory / "home",
   };
   for (const std::string& place : places) {
-    EXPECT_EQ(shell("env -u STATE_DIRECTORY " + place + " " TALLOW_PROGRAM " validate"), 0)
-        << place << errors;
+    outputOfShell("env -u STATE_DIRECTORY " + place + " " TALLOW_PROGRAM " validate");
   }
 }
 
@@ -267,11 +223,12 @@ TEST_F(InspectTest, CreatesNothingWithoutAnIndex) {
   makeIndex({kFirst});
   const auto before = files();
   for (const char* command : {"validate", "dump"}) {
-    EXPECT_EQ(run(command + std::string(" --class none")), 2);
-    EXPECT_THAT(errors, HasSubstr("none/salt: No such file or directory"));
-    EXPECT_EQ(run(command + std::string(" --class ../TallowSearch/default")), 2);
-    EXPECT_THAT(errors, HasSubstr("must name one directory"));
-    EXPECT_EQ(shell(TALLOW_PROGRAM " --state-dir " + (directory / "none ") + command), 2);
+    for (const auto& [place, reason] :
+         {std::pair(" --class none", "none/salt: No such file or directory"),
+          {" --class ../TallowSearch/default", "must name one directory"}}) {
+      EXPECT_THAT(errorsOf(std::string(command) + place), HasSubstr(reason));
+    }
+    EXPECT_EQ(shell(TALLOW_PROGRAM " --state-dir none " + std::string(command)), 2);
     EXPECT_THAT(errors, HasSubstr("tallowsearchd.lock: No such file or directory"));
   }
   EXPECT_EQ(run("dump --format=json"), 2);

@@ -1,6 +1,5 @@
 #include <fmt/format.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <cstdlib>
 #include <filesystem>

@@ -1,15 +1,13 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <lzma.h>
 #include <sys/stat.h>
 #include <unistd.h>
-#include <zlib.h>
 
 #include "cli/Identifier.h"
 #include "cli/LineReader.h"
 #include "cli/MailFile.h"
 #include "cli/MailWalker.h"
 #include "platform/Files.h"
+#include "tests/extract/Samples.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using testing::ElementsAre;
@@ -18,40 +16,17 @@ using testing::IsEmpty;
 namespace {
 
 std::string gzip(const std::string& bytes) {
-  z_stream stream{};
-  deflateInit2(&stream, 6, Z_DEFLATED, 15 + 16, 8, Z_DEFAULT_STRATEGY);
-  std::string out(compressBound(bytes.size()) + 64, '\0');
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
-  stream.avail_in = static_cast<uInt>(bytes.size());
-  stream.next_out = reinterpret_cast<Bytef*>(out.data());
-  stream.avail_out = static_cast<uInt>(out.size());
-  EXPECT_EQ(deflate(&stream, Z_FINISH), Z_STREAM_END);
-  out.resize(stream.total_out);
-  deflateEnd(&stream);
-  return out;
+  return samples::compressed(bytes, samples::Compression::gzip);
 }
 
 std::string xz(const std::string& bytes) {
-  std::string out(lzma_stream_buffer_bound(bytes.size()), '\0');
-  size_t size = 0;
-  EXPECT_EQ(lzma_easy_buffer_encode(6, LZMA_CHECK_CRC64, nullptr,
-                                    reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size(),
-                                    reinterpret_cast<uint8_t*>(out.data()), &size, out.size()),
-            LZMA_OK);
-  out.resize(size);
-  return out;
+  return samples::compressed(bytes, samples::Compression::xz);
 }
 
 // Reads one file and records what the sink receives.
 class MailFileTest : public testing::Test {
  protected:
-  std::string write(const std::string& name, const std::string& bytes) {
-    const std::string path = directory / name;
-    platform::writeFileAtomically(path, bytes, nullptr);
-    return path;
-  }
-
-  void read(const std::string& path, bool named = true) {
+  void readFile(const std::string& path, bool named = true) {
     messages.clear();
     places.clear();
     failures.clear();
@@ -71,7 +46,7 @@ class MailFileTest : public testing::Test {
         [this](const std::string&) { ++ignored; }, [](uint64_t) {}};
     finished = cli::readMailFile(path, named, sink);
   }
-  void readBytes(const std::string& bytes) { read(write("box", bytes)); }
+  void readBytes(const std::string& bytes) { readFile(directory.write("box", bytes)); }
 
   testsupport::TemporaryDirectory directory;
   std::vector<std::string> messages;
@@ -90,10 +65,7 @@ const std::string kTwo = kFrom + "Subject: a\n\none\n\n" + kFrom + "Subject: b\n
 
 TEST_F(MailFileTest, SplitsAnMboxAtItsFromLines) {
   const std::string crlf = "From m@example.org Mon Jan  8 08:49:00 2024\r\n";
-  const struct {
-    std::string bytes;
-    std::vector<std::string> messages;
-  } kCases[] = {
+  const std::pair<std::string, std::vector<std::string>> cases[] = {
       {kTwo, {"Subject: a\n\none\n", "Subject: b\n\ntwo\n"}},
       {crlf + "A: a\r\n\r\none\r\n\r\n" + crlf + "B: b\r\n\r\ntwo\r\n",
        {"A: a\r\n\r\none\r\n", "B: b\r\n\r\ntwo\r\n"}},
@@ -107,9 +79,9 @@ TEST_F(MailFileTest, SplitsAnMboxAtItsFromLines) {
       {kFrom, {""}},
       {kFrom + "\n" + kFrom + "A: a\n", {"\n", "A: a\n"}},
   };
-  for (const auto& c : kCases) {
-    readBytes(c.bytes);
-    EXPECT_EQ(messages, c.messages) << c.bytes;
+  for (const auto& [bytes, expected] : cases) {
+    readBytes(bytes);
+    EXPECT_EQ(messages, expected) << bytes;
     EXPECT_THAT(failures, IsEmpty());
     EXPECT_TRUE(finished);
   }
@@ -182,14 +154,7 @@ TEST_F(MailFileTest, TruncatedCompressionIsReported) {
 
 TEST_F(MailFileTest, DetectsTheKindOfAFile) {
   const std::string message = "Subject: a\nfrom: b\n\ntext\n";
-  const struct {
-    const char* name;
-    std::string bytes;
-    bool named;
-    size_t messages;
-    size_t failures;
-    int ignored;
-  } kCases[] = {
+  const std::tuple<const char*, std::string, bool, size_t, size_t, int> cases[] = {
       {"empty", "", true, 0, 0, 0},
       {"message", message, false, 1, 0, 0},
       {"message.gz", gzip(message), false, 1, 0, 0},
@@ -198,26 +163,25 @@ TEST_F(MailFileTest, DetectsTheKindOfAFile) {
       {"notes.txt", "Dear diary", true, 0, 1, 0},
       {"settings", "key: value\n", false, 0, 0, 1},
   };
-  for (const auto& c : kCases) {
-    read(write(c.name, c.bytes), c.named);
-    EXPECT_EQ(messages.size(), c.messages) << c.name;
-    EXPECT_EQ(failures.size(), c.failures) << c.name;
-    EXPECT_EQ(ignored, c.ignored) << c.name;
+  for (const auto& [name, bytes, named, read, failed, passed] : cases) {
+    readFile(directory.write(name, bytes), named);
+    EXPECT_EQ(messages.size(), read) << name;
+    EXPECT_EQ(failures.size(), failed) << name;
+    EXPECT_EQ(ignored, passed) << name;
   }
-  read(directory / "nowhere");
+  readFile(directory / "nowhere");
   EXPECT_THAT(failures, ElementsAre("nowhere: cannot open: No such file or directory"));
   mkfifo((directory / "pipe").c_str(), 0600);
-  read(directory / "pipe");
+  readFile(directory / "pipe");
   EXPECT_THAT(failures, ElementsAre("pipe: not a regular file"));
 }
 
 TEST_F(MailFileTest, FoldersAreNamedAfterTheirPlace) {
-  platform::createDirectories(directory / ".Sent/cur", nullptr);
-  read(write(".Sent/cur/1:2,S", "A: a\n\n"));
+  readFile(directory.write(".Sent/cur/1:2,S", "A: a\n\n"));
   EXPECT_EQ(folder, "Sent " + directory / ".Sent");
-  read(write("plain.eml", "A: a\n\n"));
+  readFile(directory.write("plain.eml", "A: a\n\n"));
   EXPECT_EQ(folder.substr(folder.find(' ') + 1), directory.path());
-  read(write("archive.mbox.gz", gzip(kTwo)));
+  readFile(directory.write("archive.mbox.gz", gzip(kTwo)));
   EXPECT_EQ(folder, "archive " + directory / "archive.mbox.gz");
 }
 
@@ -229,11 +193,8 @@ TEST_F(MailFileTest, ASinkCanStop) {
 }
 
 TEST_F(MailFileTest, VisitsEachFileOnceDespiteLoops) {
-  platform::createDirectories(directory / "b/cur", nullptr);
-  platform::createDirectories(directory / "b/tmp", nullptr);
-  platform::createDirectories(directory / "tmp", nullptr);
   for (const char* name : {"z", "a", "b/cur/2", "b/cur/1", "b/tmp/half", "tmp/kept"}) {
-    write(name, "x");
+    directory.write(name, "x");
   }
   ASSERT_EQ(symlink(directory.path().c_str(), (directory / "b/loop").c_str()), 0);
   ASSERT_EQ(symlink((directory / "a").c_str(), (directory / "link").c_str()), 0);

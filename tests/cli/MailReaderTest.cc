@@ -2,7 +2,6 @@
 
 #include <chrono>
 #include <filesystem>
-#include <fstream>
 
 #include "cli/MailReader.h"
 #include "sync/MessageDigest.h"
@@ -16,8 +15,6 @@ const std::string kFrom = "From mara@example.com Mon Feb  5 09:30:00 2024\n";
 
 class MailReaderTest : public testing::Test {
  protected:
-  void write(const std::string& content) const { std::ofstream(_path) << content; }
-
   [[nodiscard]] std::optional<std::string> read(const std::string& identifier, size_t most = 1000) {
     _error.reset();
     cli::MailReader reader([this](const std::string&) { return _offset; });
@@ -35,7 +32,7 @@ TEST_F(MailReaderTest, FindsAMessageByContentOrNotAtAll) {
   const std::string unquoted = "Subject: two\n\nsecond\nFrom here on\n";
   const std::string name =
       cli::mboxIdentifier(_path, std::string_view(mailsync::messageDigest(unquoted)));
-  write(kFrom + kFirst + "\n" + kFrom + kSecond);
+  _directory.write("archive.mbox", kFrom + kFirst + "\n" + kFrom + kSecond);
   EXPECT_FALSE(read(name)) << "nobody knows where it is";
 
   _offset = kFrom.size() + kFirst.size() + 1;
@@ -59,8 +56,7 @@ TEST_F(MailReaderTest, ListsAChangedMaildirAgain) {
   namespace fs = std::filesystem;
   const std::string maildir = _directory / "Mail";
   fs::create_directories(maildir + "/cur");
-  fs::create_directories(maildir + "/new");
-  std::ofstream(maildir + "/new/1.M1.host") << kFirst;
+  _directory.write("Mail/new/1.M1.host", kFirst);
   const std::string identifier = cli::maildirIdentifier(maildir + "/new/1.M1.host");
   cli::MailReader reader;
   const auto path = [&] {

@@ -1,13 +1,10 @@
-#include <gtest/gtest.h>
-#include <sys/wait.h>
-
 #include <algorithm>
 #include <cstdlib>
 
 #include "platform/Files.h"
 #include "records/TLAttributeKey.h"
 #include "tests/daemon/DaemonProcess.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 // The statements of tallow-query(7) and tallow-search(7) are true.
 namespace {
@@ -42,7 +39,8 @@ std::vector<Example> examplesOf(const std::string& page) {
   return examples;
 }
 
-class Pages : public testing::TestWithParam<std::pair<const char*, size_t>> {};
+class Pages : public testsupport::ShellTest,
+              public testing::WithParamInterface<std::pair<const char*, size_t>> {};
 
 }  // namespace
 
@@ -51,23 +49,17 @@ INSTANTIATE_TEST_SUITE_P(Query, Pages,
                                          std::pair(TALLOW_SEARCH_PAGE, 21u)));
 
 TEST_P(Pages, ExamplesFindTheStatedNumberOfMails) {
-  const testsupport::TemporaryDirectory directory;
   const testsupport::DaemonProcess daemon(directory.path());
   ASSERT_TRUE(daemon.ready());
-  const std::string tallow =
-      std::string(TALLOW_PROGRAM) + " --runtime-dir " + daemon.runtimeDirectory();
-  ASSERT_EQ(std::system((tallow + " index " TALLOW_SAMPLE_MAIL " >" + directory / "out").c_str()),
-            0);
+  tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+  ASSERT_EQ(run("index " TALLOW_SAMPLE_MAIL), 0) << errors;
   const std::vector<Example> examples = examplesOf(readAll(GetParam().first));
   EXPECT_EQ(examples.size(), GetParam().second);
   for (const auto& [command, found] : examples) {
     ASSERT_TRUE(command.starts_with("tallow search ")) << command;
-    const std::string run = tallow + command.substr(6) + " --limit 0 --format=files >" +
-                            directory / "out" + " 2>" + directory / "err";
-    EXPECT_EQ(WEXITSTATUS(std::system(run.c_str())), 0) << run;
-    const std::string output = readAll(directory / "out");
+    EXPECT_EQ(run(command.substr(6) + " --limit 0 --format=files"), 0) << command;
     EXPECT_EQ(std::count(output.begin(), output.end(), '\n'), found) << command << '\n' << output;
-    EXPECT_EQ(readAll(directory / "err"), "") << command;
+    EXPECT_EQ(errors, "") << command;
   }
 }
 

@@ -1,19 +1,19 @@
 #include <fmt/format.h>
-#include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <filesystem>
 #include <random>
 #include <set>
+#include <stdexcept>
 
+#include "cli/Identifier.h"
 #include "cli/MailFile.h"
 #include "cli/MailWalker.h"
+#include "cli/MessageParser.h"
 #include "cli/QueryInput.h"
 #include "cli/SearchRun.h"
 #include "cli/TextMatch.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/Seed.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 #include "tokenizer/TLLexemonAssetManager.h"
 #include "tokenizer/Tokenizer.h"
 
@@ -90,14 +90,11 @@ Mail mailOf(std::string_view bytes, const cli::MessageOrigin& origin, const TLIn
   return mail;
 }
 
-class SearchModel : public testing::Test {
+class SearchModel : public testsupport::ShellTest {
  protected:
-  SearchModel() : daemon(directory.path()), random(testsupport::firstSeed()) {
-    EXPECT_TRUE(daemon.ready());
-    const std::string index = std::string(TALLOW_PROGRAM) + " --runtime-dir " +
-                              daemon.runtimeDirectory() + " index " + TALLOW_SAMPLE_MAIL + " >" +
-                              directory / "out";
-    EXPECT_EQ(std::system(index.c_str()), 0);
+  SearchModel() {
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+    EXPECT_EQ(run("index " TALLOW_SAMPLE_MAIL), 0) << errors;
     readMails();
     for (const Mail& mail : mails) {
       for (const auto& [key, words] : mail.texts) texts.emplace_back(key, words);
@@ -105,25 +102,29 @@ class SearchModel : public testing::Test {
     std::erase_if(texts, [](const auto& text) { return text.second.empty(); });
   }
 
+  // Anything that cannot be read is a failure of the test.
   void readMails() {
+    const auto fail = [](const std::string& where, const std::string& reason) {
+      ADD_FAILURE() << where << ": " << reason;
+      return true;
+    };
     cli::MessageParser parser;
     std::string flags;
-    const cli::MailSink sink{
-        [&](std::string_view bytes, const cli::MessageOrigin& origin) {
-          auto parsed = parser.parse(bytes, origin);
-          mails.push_back(mailOf(bytes, origin, *std::get<cli::ParsedMessage>(parsed).item));
-          mails.back().flags = flags;
-          return true;
-        },
-        [](const std::string&, const std::string&) { return true; }, [](const std::string&) {},
-        [](uint64_t) {}};
-    cli::walkMail(TALLOW_SAMPLE_MAIL,
-                  {[&](const std::string& path, bool named, uint64_t) {
-                     const size_t at = path.find(":2,");
-                     flags = at == std::string::npos ? "" : path.substr(at + 3);
-                     return cli::readMailFile(path, named, sink);
-                   },
-                   [](const std::string&, const std::string&) { return true; }});
+    const cli::MailSink sink{[&](std::string_view bytes, const cli::MessageOrigin& origin) {
+                               const auto parsed = parser.parse(bytes, origin);
+                               const auto& message = std::get<cli::ParsedMessage>(parsed);
+                               EXPECT_FALSE(message.cut);
+                               mails.push_back(mailOf(bytes, origin, *message.item));
+                               mails.back().flags = flags;
+                               return true;
+                             },
+                             fail, [](const std::string& ignored) { ADD_FAILURE() << ignored; },
+                             [](uint64_t) {}};
+    const auto readFile = [&](const std::string& file, bool named, uint64_t) {
+      flags = cli::maildirFlags(file);
+      return cli::readMailFile(file, named, sink);
+    };
+    cli::walkMail(TALLOW_SAMPLE_MAIL, {readFile, fail});
   }
 
   size_t below(size_t limit) { return std::uniform_int_distribution<size_t>(0, limit - 1)(random); }
@@ -189,13 +190,13 @@ class SearchModel : public testing::Test {
       for (auto text = begin; text != end; ++text) {
         const Words& words = text->second;
         for (size_t at = 0; at + wanted.size() <= words.size(); ++at) {
-          bool same = true;
-          for (size_t i = 0; i < wanted.size(); ++i) {
-            const bool open = node.prefix && i + 1 == wanted.size();
-            same =
-                same && (open ? words[at + i].starts_with(wanted[i]) : words[at + i] == wanted[i]);
+          size_t same = 0;
+          for (; same < wanted.size(); ++same) {
+            const bool open = node.prefix && same + 1 == wanted.size();
+            const std::string& word = words[at + same];
+            if (open ? !word.starts_with(wanted[same]) : word != wanted[same]) break;
           }
-          if (same) return true;
+          if (same == wanted.size()) return true;
         }
       }
     }
@@ -252,15 +253,13 @@ class SearchModel : public testing::Test {
     const auto results =
         cli::runPlan(input->plan, {"default", cli::SortOrder::relevance, SIZE_MAX, false}, service,
                      facts, &error);
-    std::set<std::string> identifiers;
-    if (!results) ADD_FAILURE() << text << ": " << error->message;
-    if (!results) return identifiers;
+    if (!results) throw std::runtime_error(text + ": " + error->message);
     EXPECT_TRUE(results->complete);
+    std::set<std::string> identifiers;
     for (const auto& item : results->items) {
-      const auto added =
-          identifiers.insert(platform::toUTF8(platform::orEmpty(item->identifier())));
-      EXPECT_TRUE(added.second) << text;
+      identifiers.insert(platform::toUTF8(platform::orEmpty(item->identifier())));
     }
+    EXPECT_EQ(identifiers.size(), results->items.size()) << text;
     return identifiers;
   }
 
@@ -273,9 +272,8 @@ class SearchModel : public testing::Test {
     return identifiers;
   }
 
-  const testsupport::TemporaryDirectory directory;
-  const testsupport::DaemonProcess daemon;
-  std::mt19937 random;
+  const testsupport::DaemonProcess daemon{directory.path()};
+  std::mt19937 random{testsupport::firstSeed()};
   std::vector<Mail> mails;
   std::vector<std::pair<Key, Words>> texts;
   bool tooMany = false;
@@ -307,10 +305,7 @@ TEST_F(SearchModel, RandomSearchesMatchAScanOfAllMails) {
 // Conditions of the query language on times, numbers and flags apply as well.
 TEST_F(SearchModel, FiltersMatchAScanOfAllMails) {
   const std::string date = "com_quill_mail_dateReceived";
-  const struct {
-    std::vector<std::string> filters;
-    const char* same;
-  } kCases[] = {
+  const std::pair<std::vector<std::string>, const char*> cases[] = {
       {{date + " >= $time.iso(2024-02-01)"}, "a date:2024-02-01.. "},
       {{date + " < $time.iso(2024-02-01)"}, "a before:2024-02 "},
       {{date + " < $time.iso(2024-02-01) || kTLItemAuthors = \"mara lindqvist\""},
@@ -320,8 +315,8 @@ TEST_F(SearchModel, FiltersMatchAScanOfAllMails) {
       {{"com_quill_mail_flagged == 1"}, "a is:flagged "},
       {{"com_quill_mail_read == 1", "kTLItemSubject != \"re\""}, "a is:read -subject:re"},
   };
-  for (const auto& c : kCases) {
-    EXPECT_EQ(found("a ", c.filters), expected(c.same)) << c.same;
-    EXPECT_FALSE(expected(c.same).empty()) << c.same;
+  for (const auto& [filters, same] : cases) {
+    EXPECT_EQ(found("a ", filters), expected(same)) << same;
+    EXPECT_FALSE(expected(same).empty()) << same;
   }
 }

@@ -1,5 +1,4 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <cerrno>
 #include <chrono>
@@ -19,24 +18,18 @@ using End = cli::ProgramRun::End;
 TEST(Setup, AnswersAreNumbersOrWords) {
   using Some = std::vector<size_t>;
   using Chosen = std::optional<Some>;
-  const struct {
-    const char* answer;
-    Chosen chosen;
-  } kCases[] = {
+  const std::pair<const char*, Chosen> cases[] = {
       {"", Some{0, 1, 2}},  {"  ", Some{0, 1, 2}},   {"all", Some{0, 1, 2}},
       {"n", Some{}},        {"3, 1 3", Some{0, 2}},  {"2\r", Some{1}},
       {"0", std::nullopt},  {"4", std::nullopt},     {"1 x", std::nullopt},
       {"-1", std::nullopt}, {"all 1", std::nullopt}, {"99999999999999999999", std::nullopt},
   };
-  for (const auto& c : kCases) EXPECT_EQ(cli::parseChoice(c.answer, 3, true), c.chosen) << c.answer;
+  for (const auto& [text, some] : cases) EXPECT_EQ(cli::parseChoice(text, 3, true), some) << text;
   EXPECT_EQ(cli::parseChoice("", 3, false), Some{});
 }
 
 TEST(Setup, RootsAreAddedAndNothingElseChanges) {
-  const struct {
-    std::string before;
-    const char* after;
-  } kCases[] = {
+  const std::pair<std::string, std::optional<std::string>> cases[] = {
       {"", "# Made by `tallow setup`; tallow-config(5) describes all keys.\nroots = [\"~/M\"]\n"},
       {"on_battery = true\n", "roots = [\"~/M\"]\non_battery = true\n"},
       {"[class]\n\"~/é\" = \"w\"\n", "roots = [\"~/M\"]\n[class]\n\"~/é\" = \"w\"\n"},
@@ -44,13 +37,12 @@ TEST(Setup, RootsAreAddedAndNothingElseChanges) {
       {"# é\r\n  \"roots\" =\t[\r\n'~/a' # ]\r\n, ]",
        "# é\r\n  \"roots\" =\t[\"~/M\", \r\n'~/a' # ]\r\n, ]"},
       // What does not end as expected is left to the user.
-      {"roots = 5", nullptr},
-      {"unknown = 1", nullptr},
-      {"roots = [\"a\"", nullptr},
+      {"roots = 5", std::nullopt},
+      {"unknown = 1", std::nullopt},
+      {"roots = [\"a\"", std::nullopt},
   };
-  for (const auto& c : kCases) {
-    const auto after = cli::withRoots(c.before, {"/h/M"}, "/h");
-    EXPECT_EQ(after, c.after == nullptr ? std::nullopt : std::optional<std::string>(c.after));
+  for (const auto& [before, after] : cases) {
+    EXPECT_EQ(cli::withRoots(before, {"/h/M"}, "/h"), after);
   }
   EXPECT_EQ(cli::rootsLine({"/h", "/hh", "/h/~\x01\x7F\u009B\u202E\"\\"}, "/h"),
             "roots = [\"/h\", \"/hh\", \"~/~\\u0001\\u007f\\u009b\\u202e\\\"\\\\\"]\n");

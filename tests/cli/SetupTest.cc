@@ -1,18 +1,13 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 
 #include <atomic>
 #include <csignal>
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <memory>
 
 #include "cli/Settings.h"
-#include "platform/Files.h"
 #include "tests/client/FakeDaemon.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/Programs.h"
@@ -52,6 +47,7 @@ done
 exit $status
 )shell";
 
+constexpr const char* kUnset = "-u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY";
 constexpr const char* kSockets = "tallowsearchd.socket tallowsearchd-debug.socket";
 
 class SetupTest : public testsupport::TmuxTest {
@@ -62,7 +58,12 @@ class SetupTest : public testsupport::TmuxTest {
     write("bin/systemctl", kSystemctl);
     fs::permissions(directory / "bin/systemctl", fs::perms::owner_all);
     fs::create_directory(home);
-    variables = environment();
+    variables = fmt::format(
+        "HOME={0}/home XDG_RUNTIME_DIR={0}/xdg XDG_CONFIG_HOME={0}/config "
+        "XDG_STATE_HOME={0}/client STATE_DIRECTORY={0}/state PATH={0}/bin:/usr/bin:/bin",
+        directory.path());
+    environment = kUnset + (' ' + variables);
+    tallow = TALLOW_PROGRAM;
   }
   void TearDown() override {
     if (fs::exists(directory / "tmux")) TmuxTest::TearDown();
@@ -78,33 +79,6 @@ class SetupTest : public testsupport::TmuxTest {
     fs::create_directory_symlink(runtime, directory / "xdg/tallow");
   }
 
-  [[nodiscard]] std::string environment() const {
-    return fmt::format(
-        "HOME={0}/home XDG_RUNTIME_DIR={0}/xdg XDG_CONFIG_HOME={0}/config "
-        "XDG_STATE_HOME={0}/client "
-        "STATE_DIRECTORY={0}/state "
-        "PATH={0}/bin:/usr/bin:/bin",
-        directory.path());
-  }
-  // Runs `tallow ARGUMENTS` without a terminal and returns its exit status.
-  int run(const std::string& arguments, const std::string& more = "") {
-    const std::string command = fmt::format(
-        "cd {0} && env -u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY {1} "
-        "{2} " TALLOW_PROGRAM " {3} >{0}/out 2>{0}/err </dev/null",
-        directory.path(), environment(), more, arguments);
-    const int status = WEXITSTATUS(std::system(command.c_str()));
-    output = read("out");
-    errors = read("err");
-    return status;
-  }
-
-  [[nodiscard]] std::string read(const std::string& name) const {
-    return platform::readFile(directory / name, size_t{1} << 20, nullptr).value_or("");
-  }
-  void write(const std::string& name, const std::string& text) const {
-    fs::create_directories(fs::path(directory / name).parent_path());
-    std::ofstream(directory / name) << text;
-  }
   // What was asked of systemd since the last call, without questions.
   std::vector<std::string> unitCalls() const {
     std::istringstream log(read("systemctl.log"));
@@ -122,11 +96,11 @@ class SetupTest : public testsupport::TmuxTest {
     return good->roots;
   }
 
-  void makeMaildir(const std::string& path, int mails) const {
-    for (const char* const part : {"cur", "new", "tmp"}) fs::create_directories(path + '/' + part);
+  void makeMaildir(const std::string& name, int mails) const {
+    directory.makeMaildir(name);
     for (int i = 0; i < mails; ++i) {
-      std::ofstream(fmt::format("{}/new/{}.M1.host", path, i))
-          << fmt::format("From: a@example.org\nSubject: lighthouse {}\n\nText\n", i);
+      directory.write(fmt::format("{}/new/{}.M1.host", name, i),
+                      fmt::format("From: a@example.org\nSubject: lighthouse {}\n\nText\n", i));
     }
   }
   static std::string mboxText(int mails) {
@@ -141,21 +115,18 @@ class SetupTest : public testsupport::TmuxTest {
   const std::string home = directory / "home";
   const std::string settings = directory / "config/tallow/config.toml";
   std::unique_ptr<testsupport::DaemonProcess> daemon;
-  std::string output;
-  std::string errors;
 };
 
 }  // namespace
 
 TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
-  makeMaildir(home + "/Maildir", 3);
-  makeMaildir(home + "/Maildir/.Sent", 2);
-  makeMaildir(home + "/by-mbsync/inbox", 1);
-  makeMaildir(home + "/by-offlineimap/inbox", 1);
-  makeMaildir(home + "/by-mutt", 1);
-  makeMaildir(home + "/by-aerc", 0);
-  makeMaildir(home + "/not-mine", 1);
-  makeMaildir(directory / "elsewhere", 1);
+  makeMaildir("home/Maildir", 3);
+  makeMaildir("home/Maildir/.Sent", 2);
+  makeMaildir("home/by-aerc", 0);
+  for (const char* const path : {"home/by-mbsync/inbox", "home/by-offlineimap/inbox",
+                                 "home/by-mutt", "home/not-mine", "elsewhere", "outside"}) {
+    makeMaildir(path, 1);
+  }
   write("home/spool", mboxText(4));
   write("home/mail/2010/01", "From: old@example.org\nDate: x\n\nmessage in a file of its own\n");
   write("home/mail/2010/notes.txt", "no mail\n");
@@ -171,7 +142,6 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
         "set realname=\"x\" folder = '$HOME/by-mutt' # set folder=~/not-mine-either\n"
         "set folder=imaps://example.org/\nset spoolfile=+folder=~/not-mine\n");
   write("home/.muttrc", "set folder=~\n");
-  makeMaildir(directory / "outside", 1);
   write("home/.mutt/muttrc", "set folder=~/../outside\n");
   write("home/.config/aerc/accounts.conf",
         "[a]\nsource = maildir://~/by-aerc\n[b]\nsource = imaps://x\n");
@@ -183,8 +153,8 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
   write("home/.thunderbird/\xFF/ImapMail/x/Inbox", mboxText(1));
   write("home/.thunderbird/none/Mail/Local Folders/Trash", "");
 
-  EXPECT_EQ(run("setup", "MAIL=" + home + "/spool"), 2);
-  EXPECT_THAT(errors, HasSubstr("nothing has been changed; without a terminal, --yes does it"));
+  EXPECT_THAT(errorsOf("setup", "MAIL=" + home + "/spool"),
+              HasSubstr("nothing has been changed; without a terminal, --yes does it"));
   EXPECT_EQ(run("setup --dry-run", "MAIL=" + home + "/spool"), 0) << errors;
   EXPECT_FALSE(fs::exists(settings));
   EXPECT_THAT(unitCalls(), IsEmpty());
@@ -215,36 +185,31 @@ TEST_F(SetupTest, FindsMailWhereProgramsHaveIt) {
 }
 
 TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
-  makeMaildir(home + "/Maildir", 2);
+  makeMaildir("home/Maildir", 2);
   startDaemon();
   fs::remove(directory / "xdg/tallow");
   write("runtime", daemon->runtimeDirectory());
   EXPECT_EQ(run("setup --yes"), 0) << errors;
   EXPECT_THAT(roots(), ElementsAre(home + "/Maildir"));
-  struct stat info;
-  ASSERT_EQ(stat(settings.c_str(), &info), 0);
-  EXPECT_EQ(info.st_mode & 07777, 0600U);
-  ASSERT_EQ(stat((directory / "config/tallow").c_str(), &info), 0);
-  EXPECT_EQ(info.st_mode & 07777, 0700U);
+  EXPECT_EQ(fs::status(settings).permissions(), fs::perms(0600));
+  EXPECT_EQ(fs::status(directory / "config/tallow").permissions(), fs::perms(0700));
   // The watch starts after the sync, whose lock it would wait for.
   EXPECT_THAT(
       unitCalls(),
       ElementsAre(fmt::format("--user start {}", kSockets), "--user stop tallow-watch.service",
                   fmt::format("--user enable {} tallow-watch.service", kSockets),
                   "--user start tallow-watch.service"));
-  EXPECT_EQ(run("search --count lighthouse"), 0);
-  EXPECT_EQ(output, "2\n");
+  EXPECT_EQ(outputOf("search --count lighthouse"), "2\n");
 
   const std::string before = read("config/tallow/config.toml");
-  EXPECT_EQ(run("setup --yes"), 0) << errors;
-  EXPECT_THAT(output, HasSubstr("Already in the settings: " + home + "/Maildir\n"));
+  EXPECT_THAT(outputOf("setup --yes"),
+              HasSubstr("Already in the settings: " + home + "/Maildir\n"));
   EXPECT_THAT(output, HasSubstr("All is set up and at work"));
   EXPECT_THAT(unitCalls(), IsEmpty());
   EXPECT_EQ(read("config/tallow/config.toml"), before);
-  EXPECT_EQ(run("setup"), 0) << errors;
-  EXPECT_THAT(output, HasSubstr("All is set up."));
+  EXPECT_THAT(outputOf("setup"), HasSubstr("All is set up."));
   // New mail is added; a watch that runs gets the new settings.
-  makeMaildir(home + "/mail/lists", 1);
+  makeMaildir("home/mail/lists", 1);
   EXPECT_EQ(run("setup --yes " + home + "/mail/../mail"), 0) << errors;
   EXPECT_THAT(roots(), UnorderedElementsAre(home + "/Maildir", home + "/mail"));
   EXPECT_THAT(unitCalls(), testing::IsSupersetOf({"--user stop tallow-watch.service",
@@ -256,10 +221,9 @@ TEST_F(SetupTest, SetsUpOnceAndSaysSoAfterwards) {
 }
 
 TEST_F(SetupTest, KeepsWhatTheSettingsSay) {
-  makeMaildir(home + "/Maildir", 1);
-  makeMaildir(home + "/Mail/work", 1);
-  makeMaildir(home + "/mail", 1);
-  makeMaildir(home + "/elsewhere", 1);
+  for (const char* name : {"Maildir", "Mail/work", "mail", "elsewhere"}) {
+    makeMaildir(std::string("home/") + name, 1);
+  }
   const std::string text =
       "# mine\nroots = [ # all\n  \"~/Maildir\",\n]\nexclude = [\"~/mail\"]\n[class]\n"
       "\"~/elsewhere\" = \"work\"\n";
@@ -276,8 +240,7 @@ TEST_F(SetupTest, KeepsWhatTheSettingsSay) {
   fs::remove(directory / "systemctl.log");
   for (const char* const wrong : {"roots = [\n", "rots = []\n", "roots = \"x\"\n"}) {
     write("dotfiles/config.toml", wrong);
-    EXPECT_EQ(run("setup --yes"), 2);
-    EXPECT_THAT(errors, HasSubstr("config.toml:1: "));
+    EXPECT_THAT(errorsOf("setup --yes"), HasSubstr("config.toml:1: "));
     EXPECT_EQ(read("dotfiles/config.toml"), wrong);
   }
   EXPECT_THAT(unitCalls(), IsEmpty());
@@ -285,8 +248,8 @@ TEST_F(SetupTest, KeepsWhatTheSettingsSay) {
 
 // Roots in the settings replace those that `tallow sync` knows.
 TEST_F(SetupTest, TakesWhatWasSyncedBefore) {
-  makeMaildir(home + "/Maildir", 1);
-  makeMaildir(directory / "archive", 1);
+  makeMaildir("home/Maildir", 1);
+  makeMaildir("archive", 1);
   startDaemon();
   ASSERT_EQ(run("sync " + directory / "archive"), 0) << errors;
   EXPECT_EQ(run("setup --yes"), 0) << errors;
@@ -294,7 +257,7 @@ TEST_F(SetupTest, TakesWhatWasSyncedBefore) {
 }
 
 TEST_F(SetupTest, WorksWithoutSystemd) {
-  makeMaildir(home + "/Maildir", 2);
+  makeMaildir("home/Maildir", 2);
   write("fails", "");
   EXPECT_EQ(run("setup --yes"), 75);
   EXPECT_THAT(errors, HasSubstr("the units of systemd cannot be used: Failed to connect to bus: "
@@ -306,37 +269,33 @@ TEST_F(SetupTest, WorksWithoutSystemd) {
   EXPECT_THAT(errors, HasSubstr("there is no systemctl"));
   EXPECT_THAT(output, HasSubstr("\n2 added\n`tallow watch` keeps the index in step"));
   // A daemon somewhere else is not that of the units.
-  EXPECT_EQ(run("setup --yes --runtime-dir " + daemon->runtimeDirectory()), 0) << errors;
-  EXPECT_THAT(output, HasSubstr("stay as they are"));
+  EXPECT_THAT(outputOf("setup --yes --runtime-dir " + daemon->runtimeDirectory()),
+              HasSubstr("stay as they are"));
   EXPECT_THAT(unitCalls(), IsEmpty());
 }
 
 TEST_F(SetupTest, RefusesWhatCannotBeRight) {
-  EXPECT_EQ(run("setup --yes"), 2);
-  EXPECT_THAT(errors, HasSubstr("no mail was found"));
-  makeMaildir(home + "/Maildir", 1);
-  EXPECT_EQ(run("setup --yes " + home + "/Maildir " + home + "/none"), 2);
-  EXPECT_THAT(errors, HasSubstr("/none: there is no such file or directory"));
-  makeMaildir(home + "/a\xFF", 1);
-  EXPECT_EQ(run("setup --yes " + home + "/a\xFF"), 2);
-  EXPECT_THAT(errors, HasSubstr("which is not UTF-8"));
+  EXPECT_THAT(errorsOf("setup --yes"), HasSubstr("no mail was found"));
+  makeMaildir("home/Maildir", 1);
+  EXPECT_THAT(errorsOf("setup --yes " + home + "/Maildir " + home + "/none"),
+              HasSubstr("/none: there is no such file or directory"));
+  makeMaildir("home/a\xFF", 1);
+  EXPECT_THAT(errorsOf("setup --yes " + home + "/a\xFF"), HasSubstr("which is not UTF-8"));
   EXPECT_EQ(run("setup --yes", "HOME="), 2);
   EXPECT_EQ(run("setup --yes --format=json"), 2);
   if (geteuid() == 0) {
-    EXPECT_EQ(run("setup --yes", "SUDO_USER=mara"), 2);
-    EXPECT_THAT(errors, HasSubstr("run it without sudo"));
+    EXPECT_THAT(errorsOf("setup --yes", "SUDO_USER=mara"), HasSubstr("run it without sudo"));
   }
   EXPECT_FALSE(fs::exists(settings));
   // A place for the settings that cannot be written.
   write("config", "a file");
-  EXPECT_EQ(run("setup --yes"), 2);
-  EXPECT_THAT(errors, HasSubstr("/config"));
+  EXPECT_THAT(errorsOf("setup --yes"), HasSubstr("/config"));
   EXPECT_THAT(unitCalls(), IsEmpty());
 }
 
 // Ctrl-C in the first sync leaves the rest to the watch.
 TEST_F(SetupTest, AnInterruptLeavesTheRestToTheWatch) {
-  makeMaildir(home + "/Maildir", 3);
+  makeMaildir("home/Maildir", 3);
   testsupport::FakeDaemon fake;
   useDaemon(fake.runtimeDirectory());
   std::atomic<bool> sent{false};
@@ -347,44 +306,32 @@ TEST_F(SetupTest, AnInterruptLeavesTheRestToTheWatch) {
       reply.send({});
     });
   }
-  const std::string command = fmt::format(
-      "env -u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY {1} sh -c 'echo $$ >{0}/pid; "
-      "exec " TALLOW_PROGRAM " setup --yes >{0}/out 2>{0}/err </dev/null'",
-      directory.path(), environment());
-  EXPECT_EQ(WEXITSTATUS(std::system(command.c_str())), 0) << read("err");
-  EXPECT_THAT(read("out"), testing::EndsWith("interrupted\ntallow-watch.service continues; `tallow "
-                                             "status` shows how far.\n"));
+  EXPECT_EQ(
+      shell("env " + environment + " sh -c 'echo $$ >pid; exec " TALLOW_PROGRAM " setup --yes'"), 0)
+      << errors;
+  EXPECT_THAT(output, testing::EndsWith("interrupted\ntallow-watch.service continues; `tallow "
+                                        "status` shows how far.\n"));
   EXPECT_TRUE(fs::exists(directory / "active.tallow-watch.service"));
 }
 
 TEST_F(SetupTest, AsksOnATerminal) {
   NEED_PROGRAMS("tmux")
-  makeMaildir(home + "/Mail", 1);
-  makeMaildir(home + "/Maildir", 1);
+  makeMaildir("home/Mail", 1);
+  makeMaildir("home/Maildir", 1);
   startDaemon();
-  start(
-      "env -u MAIL -u MAILDIR -u SUDO_USER -u RUNTIME_DIRECTORY PS1='ready> ' bash --norc "
-      "--noprofile -i",
-      100, 30);
+  start(fmt::format("env {} PS1='ready> ' bash --norc --noprofile -i", kUnset), 100, 30);
   const auto open = [&](const char* answer, const char* after) {
     await("ready>");
-    type("clear");
-    press("Enter");
+    enter("clear");
     awaitGone("[");  // the question of the run before
-    type(TALLOW_PROGRAM " setup; echo status=$?");
-    press("Enter");
-    await("or \"none\" [");
-    type(answer);
-    press("Enter");
-    await(after);
+    enter(TALLOW_PROGRAM " setup; echo status=$?", "or \"none\" [");
+    enter(answer, after);
   };
   open("none", "status=2");
   EXPECT_THAT(screen(), HasSubstr("nothing has been changed"));
   EXPECT_FALSE(fs::exists(settings));
   open("3", "or \"none\" [all] 3\nWhich");  // asks again
-  type("2");
-  press("Enter");
-  await("status=0");
+  enter("2", "status=0");
   EXPECT_THAT(roots(), ElementsAre(home + "/Maildir"));
   // Later, the answer is none unless the user wants more.
   open("", "status=0");

@@ -1,9 +1,7 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
-#include <algorithm>
-#include <fstream>
+#include <map>
 #include <regex>
 #include <set>
 
@@ -25,22 +23,20 @@ constexpr double kNow = 1707300000;  // 2024-02-07
 class StatusPageTest : public testing::Test {
  protected:
   StatusPageTest() {
-    std::optional<TLError> error;
     status.name = "default";
-    status.catalogue = mailsync::Catalogue::open(directory / "catalogue", &error);
+    status.catalogue = mailsync::Catalogue::open(directory / "catalogue", nullptr);
     status.lastSync = 1707295200;
     status.disk = cli::DiskUse{812'345'678, 245'000'000};
-    status.index.emplace();
-    status.index->stored = 48210;
-    status.index->searchable = 48210;
-    status.index->textBytes = 390'000'000;
-    status.index->suffixes = 41'000'000;
-    status.index->hotSuffixes = 310'000;
-    status.index->merges = 57;
-    status.index->mergeSeconds = 311.4;
-    status.index->deleted = 903;
-    status.index->scans = 21044;
-    status.index->scanSeconds = 19.1;
+    status.index = cli::IndexStatus{.stored = 48210,
+                                    .searchable = 48210,
+                                    .textBytes = 390'000'000,
+                                    .suffixes = 41'000'000,
+                                    .hotSuffixes = 310'000,
+                                    .merges = 57,
+                                    .mergeSeconds = 311.4,
+                                    .scans = 21044,
+                                    .scanSeconds = 19.1,
+                                    .deleted = 903};
   }
 
   // Messages of a folder; of those without a date, `problem` says why they failed.
@@ -48,18 +44,12 @@ class StatusPageTest : public testing::Test {
            const std::string& problem = "") {
     mailsync::Catalogue& catalogue = *status.catalogue;
     catalogue.begin();
-    mailsync::DirectoryRow row;
-    row.path = folder + "/cur";
-    const auto known = catalogue.directories();
-    const auto found = std::find_if(known.begin(), known.end(),
-                                    [&](const auto& one) { return one.path == row.path; });
-    const int64_t id = found == known.end() ? catalogue.addDirectory(row) : found->id;
+    int64_t& id = _directories[folder];
+    if (id == 0) id = catalogue.addDirectory({.path = folder + "/cur"});
     for (int i = 0; i < count; ++i) {
       const std::string name = fmt::format("{}", ++_messages);
-      mailsync::FileRow file;
-      file.directory = id;
-      file.name = name;
-      file.kind = mailsync::FileKind::maildir;
+      const mailsync::FileRow file{
+          .directory = id, .name = name, .kind = mailsync::FileKind::maildir};
       mailsync::MessageRow added;
       added.file = catalogue.addFile(file);
       added.identifier = "file/" + name;
@@ -110,6 +100,7 @@ class StatusPageTest : public testing::Test {
   cli::ClassStatus status;
 
  private:
+  std::map<std::string, int64_t> _directories;
   int _messages = 0;
 };
 
@@ -127,7 +118,7 @@ class BrowserTest : public StatusPageTest {
   void SetUp() override { NEED_PROGRAMS("chromium") }
 
   [[nodiscard]] std::string show(const std::string& html, const std::string& options) const {
-    std::ofstream(directory / "page.html", std::ios::binary) << html;
+    directory.write("page.html", html);
     return testsupport::outputOf(fmt::format(
         "HOME={0} timeout 120 chromium --headless --no-sandbox --disable-gpu "
         "--disable-dev-shm-usage --user-data-dir={0}/profile {1} --dump-dom file://{0}/page.html",
@@ -148,14 +139,9 @@ class BrowserTest : public StatusPageTest {
     const std::string shown = show(html, options);
     std::smatch parts;
     const std::regex all("measured (\\d+) (\\d+) (\\d+) (\\d+) (.*) end");
-    // The last one is not that in the script.
-    Measured measured;
-    for (auto at = shown.cbegin(); std::regex_search(at, shown.cend(), parts, all);
-         at = parts[0].second) {
-      measured = {std::stoi(parts[1]), std::stoi(parts[2]), std::stoi(parts[3]),
-                  std::stoi(parts[4]), parts[5]};
-    }
-    return measured;
+    if (!std::regex_search(shown, parts, all)) return {};
+    return {std::stoi(parts[1]), std::stoi(parts[2]), std::stoi(parts[3]), std::stoi(parts[4]),
+            parts[5]};
   }
 };
 
@@ -200,8 +186,7 @@ TEST_F(StatusPageTest, TheHistoryIsBounded) {
     mailsync::Measurement one;
     one.day = day;
     one.scanSeconds = 0.25;
-    catalogue.addMeasurement(one);
-    catalogue.addMeasurement(one);
+    for (int times = 0; times < 2; ++times) catalogue.addMeasurement(one);
   }
   const auto kept = catalogue.measurements();
   ASSERT_EQ(kept.size(), static_cast<size_t>(mailsync::kMaxMeasurements));

@@ -10,10 +10,7 @@
 #include "platform/Text.h"
 
 TEST(Terminal, TextIsCleaned) {
-  const struct {
-    std::string text;
-    const char* clean;
-  } kCases[] = {
+  const std::pair<std::string, const char*> cases[] = {
       {"plain 京都 é", "plain 京都 é"},
       {"a\tb\r\nc\u2008d\u2028e\u00A0f", "a b  c d e f"},
       {"\x1b[31mred\x07", "\uFFFD[31mred\uFFFD"},
@@ -24,7 +21,7 @@ TEST(Terminal, TextIsCleaned) {
       {"bad \xC3( \xFF", "bad \uFFFD( \uFFFD"},
       {"\U0001F600", "\U0001F600"},
   };
-  for (const auto& c : kCases) EXPECT_EQ(cli::cleanForTerminal(c.text), c.clean);
+  for (const auto& [text, clean] : cases) EXPECT_EQ(cli::cleanForTerminal(text), clean);
   EXPECT_EQ(cli::cleanLinesForTerminal("a\nb\x1b\n"), "a\nb\uFFFD\n");
 }
 
@@ -56,11 +53,7 @@ TEST(Terminal, CleansRandomBytes) {
 }
 
 TEST(Terminal, HighlightIgnoresCaseAndAccents) {
-  const struct {
-    const char* text;
-    const char* query;
-    const char* marked;
-  } kCases[] = {
+  const std::tuple<const char*, const char*, const char*> cases[] = {
       {"The Invoice, invoices", "invo", "The <Invoice>, <invoices>"},
       {"Crème brûlée", "creme bru", "<Crème> <brûlée>"},
       {"creme", "CRÈME ", "<creme>"},
@@ -70,8 +63,8 @@ TEST(Terminal, HighlightIgnoresCaseAndAccents) {
       {"nothing", "", "nothing"},
       {"a*b", "b", "a*<b>"},
   };
-  for (const auto& c : kCases) {
-    EXPECT_EQ(cli::highlight(c.text, cli::queryWords(c.query), "<", ">"), c.marked);
+  for (const auto& [text, query, marked] : cases) {
+    EXPECT_EQ(cli::highlight(text, cli::queryWords(query), "<", ">"), marked);
   }
 }
 
@@ -84,11 +77,7 @@ TEST(Terminal, ProgressIsOneLineOfTheGivenWidth) {
 }
 
 TEST(Fitted, CountsColumns) {
-  const struct {
-    const char* text;
-    size_t columns;
-    const char* fitted;
-  } kCases[] = {
+  const std::tuple<const char*, size_t, const char*> cases[] = {
       {"abc", 0, "abc"},
       {"abc", 3, "abc"},
       {"abcd", 3, "ab…"},
@@ -98,7 +87,7 @@ TEST(Fitted, CountsColumns) {
       {"e\u0301e\u0301", 2, "e\u0301e\u0301"},
       {"e\u0301e\u0301e", 2, "e\u0301…"},
   };
-  for (const auto& c : kCases) EXPECT_EQ(cli::fitted(c.text, c.columns), c.fitted) << c.text;
+  for (const auto& [text, width, shown] : cases) EXPECT_EQ(cli::fitted(text, width), shown) << text;
 }
 
 TEST(Passage, ShowsWhereTheMostWordsAre) {

@@ -1,10 +1,8 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include "cli/Identifier.h"
 #include "cli/Threads.h"
-#include "platform/Files.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using cli::Thread;
@@ -15,8 +13,7 @@ namespace {
 class ThreadsTest : public testing::Test {
  protected:
   void add(const std::string& header, double date) {
-    const std::string path = directory / fmt::format("{}.eml", hits.size());
-    platform::writeFileAtomically(path, header + "\n\n", nullptr);
+    const std::string path = directory.write(fmt::format("{}.eml", hits.size()), header + "\n\n");
     auto item = std::make_shared<TLIndexableItem>();
     item->setIdentifier(platform::fromUTF8(cli::fileIdentifier(path)));
     item->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, u"Boats\x1b of \u4EAC\u90FD");

@@ -4,7 +4,6 @@
 #include <sys/stat.h>
 
 #include <cstdlib>
-#include <filesystem>
 #include <fstream>
 #include <sstream>
 
@@ -32,8 +31,6 @@ DesktopSession::DesktopSession(const std::string& runtimeDirectory, bool withOpe
                    {"TALLOW_OPEN", withOpener ? "open-mail --now" : ""},
                    {"PATH", _directory / "bin" + ":" + std::getenv("PATH")}},
       _session(_directory.path(), "session", _environment, writeServiceFile()) {
-  std::filesystem::create_directories(_directory / "bin");
-  std::filesystem::create_directories(_directory / "config/tallow");
   TL_ASSERT(mkfifo((_directory / "programs").c_str(), 0600) == 0);
   for (const char* name : {"open-mail", "xdg-terminal-exec"}) writeScript(name);
   configure("desktop_search = true");
@@ -44,20 +41,19 @@ std::string DesktopSession::writeServiceFile() const {
   const std::string installed = "/usr/bin/tallow-desktop";
   TL_ASSERT(text.find(installed) != std::string::npos);
   text.replace(text.find(installed), installed.size(), TALLOW_DESKTOP_PROGRAM);
-  std::filesystem::create_directories(_directory / "services");
-  std::ofstream(_directory / "services/com.quill.tallow.Desktop.service") << text;
+  _directory.write("services/com.quill.tallow.Desktop.service", text);
   return _directory / "services";
 }
 
 void DesktopSession::writeScript(const std::string& name) const {
-  const std::string path = _directory / "bin/" + name;
-  std::ofstream(path) << fmt::format("#!/bin/sh\n(printf '%s' {}; printf '|%s' \"$@\") >'{}'\n",
-                                     name, _directory / "programs");
+  const std::string path = _directory.write(
+      "bin/" + name, fmt::format("#!/bin/sh\n(printf '%s' {}; printf '|%s' \"$@\") >'{}'\n", name,
+                                 _directory / "programs"));
   chmod(path.c_str(), 0700);
 }
 
 void DesktopSession::configure(const std::string& settings) const {
-  std::ofstream(_directory / "config/tallow/config.toml") << settings << '\n';
+  _directory.write("config/tallow/config.toml", settings + '\n');
 }
 
 std::string DesktopSession::nextProgram() const {

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <string>
-#include <vector>
 
 #include "tests/desktop/Bus.h"
 #include "tests/support/TemporaryDirectory.h"

@@ -1,9 +1,7 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <filesystem>
-#include <fstream>
 #include <memory>
 
 #include "desktop/DesktopService.h"
@@ -11,6 +9,7 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/desktop/DesktopSession.h"
 #include "tests/support/Programs.h"
+#include "tests/support/ShellTest.h"
 
 using testing::HasSubstr;
 using testing::Not;
@@ -22,42 +21,29 @@ constexpr const char* kShell = "org.gnome.Shell.SearchProvider2";
 constexpr const char* kRunner = "org.kde.krunner1";
 
 // Every operation, called by general D-Bus tools, with a daemon that holds the sample mail.
-class DesktopToolsTest : public testing::Test {
+class DesktopToolsTest : public testsupport::ShellTest {
  protected:
   void SetUp() override {
     NEED_PROGRAMS("dbus-daemon", "gdbus", "busctl")
     ASSERT_TRUE(daemon.ready());
     std::filesystem::copy(TALLOW_SAMPLE_MAIL, mail, std::filesystem::copy_options::recursive);
-    ASSERT_EQ(run(fmt::format("{} --runtime-dir {} index {}", TALLOW_PROGRAM,
-                              daemon.runtimeDirectory(), mail)),
-              0);
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+    ASSERT_EQ(run("index " + mail), 0) << errors;
     open(true);
   }
   void open(bool withOpener) {
     session = std::make_unique<testsupport::DesktopSession>(daemon.runtimeDirectory(), withOpener);
   }
 
-  int run(const std::string& command) {
-    const int status =
-        std::system(fmt::format("{} >'{}' 2>&1", command, directory / "out").c_str());
-    output = platform::readFile(directory / "out", kMaxFileBytes, nullptr).value_or("");
-    return status;
-  }
   // The output of a call by gdbus, or of one by busctl.
   std::string gdbus(const char* interface, const std::string& call) {
-    EXPECT_EQ(run(fmt::format("gdbus call --address {} --dest {} --object-path {} --method {}.{}",
-                              session->address(), desktop::kBusName, desktop::kObjectPath,
-                              interface, call)),
-              0)
-        << output;
-    return output;
+    return outputOfShell(
+        fmt::format("gdbus call --address {} --dest {} --object-path {} --method {}.{}",
+                    session->address(), desktop::kBusName, desktop::kObjectPath, interface, call));
   }
   std::string busctl(const char* interface, const std::string& call) {
-    EXPECT_EQ(run(fmt::format("busctl --address={} call {} {} {} {}", session->address(),
-                              desktop::kBusName, desktop::kObjectPath, interface, call)),
-              0)
-        << output;
-    return output;
+    return outputOfShell(fmt::format("busctl --address={} call {} {} {} {}", session->address(),
+                                     desktop::kBusName, desktop::kObjectPath, interface, call));
   }
   // The first identifier in an output, which puts it in quotes.
   [[nodiscard]] static std::string identifierIn(const std::string& text) {
@@ -67,12 +53,13 @@ class DesktopToolsTest : public testing::Test {
                : text.substr(begin, text.find_first_of("'\"", begin) - begin);
   }
 
-  const testsupport::TemporaryDirectory directory;
   const std::string mail = directory / "mail";
   const testsupport::DaemonProcess daemon{directory.path()};
   std::unique_ptr<testsupport::DesktopSession> session;
-  std::string output;
 };
+
+// What the packages install for desktops.
+using DesktopFiles = testsupport::ShellTest;
 
 std::string fileOf(const std::string& name) {
   return platform::readFile(std::string(TALLOW_DESKTOP_FILES) + '/' + name, kMaxFileBytes, nullptr)
@@ -127,7 +114,7 @@ TEST_F(DesktopToolsTest, MailIsShownInATerminalWithoutAnOpener) {
 }
 
 // One file for each desktop, and all name the same service.
-TEST(DesktopFiles, NameTheService) {
+TEST_F(DesktopFiles, NameTheService) {
   const std::string name = desktop::kBusName;
   const std::string path = desktop::kObjectPath;
   EXPECT_THAT(fileOf(name + ".service"), HasSubstr("\nName=" + name + "\n"));
@@ -139,4 +126,17 @@ TEST(DesktopFiles, NameTheService) {
   const std::string runner = fileOf("com.quill.tallow.Runner.desktop");
   EXPECT_THAT(runner, HasSubstr("\nX-Plasma-DBusRunner-Service=" + name + "\n"));
   EXPECT_THAT(runner, HasSubstr("\nX-Plasma-DBusRunner-Path=" + path + "\n"));
+}
+
+// What software centres and desktops read, checked by their own programs. Skipped without these,
+// except with CI=true (scripts/ci-packages.list).
+TEST_F(DesktopFiles, AreValid) {
+  NEED_PROGRAMS("appstreamcli", "desktop-file-validate")
+  const std::string packaging = TALLOW_PACKAGING;
+  outputOfShell("appstreamcli validate --no-net --pedantic --strict " + packaging +
+                "/appstream/com.quill.tallow.metainfo.xml");
+  for (const auto& entry : std::filesystem::directory_iterator(packaging + "/desktop")) {
+    if (entry.path().extension() != ".desktop") continue;
+    outputOfShell("desktop-file-validate " + entry.path().string());
+  }
 }

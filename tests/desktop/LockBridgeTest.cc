@@ -1,14 +1,10 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <systemd/sd-bus.h>
 
 #include <csignal>
 #include <memory>
 
-#include "client/SearchServiceProxy.h"
 #include "platform/Files.h"
-#include "tests/daemon/DaemonProcess.h"
-#include "tests/daemon/DaemonSupport.h"
 #include "tests/desktop/Bus.h"
 #include "tests/desktop/MockLogind.h"
 #include "tests/support/Programs.h"
@@ -19,9 +15,6 @@ using testsupport::MockLogind;
 using testsupport::Process;
 
 namespace {
-
-constexpr const char* kStrictest = "SysFileProtectionComplete";
-constexpr int kUnavailable = -2;
 
 constexpr const char* kOpen = "0 1\n";
 constexpr const char* kLocked = "1 1\n";
@@ -75,37 +68,11 @@ class LockBridgeTest : public testing::Test {
 
 }  // namespace
 
-// From the screen to a refused search, through logind, bridge, lock status and daemon.
-TEST_F(LockBridgeTest, StrictestClassIsClosedWithTheScreen) {
-  const testsupport::DaemonProcess daemon(directory.path());
-  ASSERT_TRUE(daemon.ready());
-  client::SearchServiceProxy service(daemon.runtimeDirectory());
-  const std::vector items{testsupport::mail("file/a", "harbour")};
-  for (const char* name : {kStrictest, "default"}) {
-    ASSERT_TRUE(service.indexItems(items, "test", name, nullptr));
-  }
-  // Asks again until the daemon has read the new lock status.
-  const auto awaitAnswer = [&](int64_t answer) {
-    while (testsupport::search(service, "harbour", kStrictest) != answer) continue;
-    EXPECT_EQ(testsupport::search(service, "harbour", "default"), 1);
-  };
-  start({true, false});
-  awaitAnswer(1);
-  logind->signalSession("Lock");
-  awaitAnswer(kUnavailable);
-  logind->signalSession("Unlock");
-  awaitAnswer(1);
-  logind->prepareForSleep(true);
-  awaitAnswer(kUnavailable);
-  logind->prepareForSleep(false);
-  awaitAnswer(1);
-  EXPECT_EQ(bridge->end(SIGTERM), 0);
-  awaitAnswer(kUnavailable);
-}
-
 TEST_F(LockBridgeTest, FollowsSignalsAndHintOfItsSession) {
-  start({true, false});
-  EXPECT_EQ(status(), kOpen);
+  start({true, true});
+  EXPECT_EQ(status(), kLocked);
+  logind->setHint(false);
+  await(kOpen);
   logind->signalSession("Lock");
   await(kLocked);
   logind->signalSession("Unlock");
@@ -119,6 +86,8 @@ TEST_F(LockBridgeTest, FollowsSignalsAndHintOfItsSession) {
   logind->prepareForSleep(false);
   logind->setHint(false);
   await(kOpen);
+  EXPECT_EQ(bridge->end(SIGTERM), 0);
+  EXPECT_EQ(status(), kLocked);
 }
 
 // The status is on the disk before the bridge lets the device go to sleep.
@@ -136,7 +105,7 @@ TEST_F(LockBridgeTest, SleepWaitsForTheStatus) {
   }
 }
 
-TEST_F(LockBridgeTest, NoSessionIsLocked) {
+TEST_F(LockBridgeTest, FollowsSessionsAndIsLockedWithoutOne) {
   start({false, false});
   EXPECT_EQ(status(), kLocked);
   logind->beginSession(false);
@@ -147,20 +116,9 @@ TEST_F(LockBridgeTest, NoSessionIsLocked) {
   await(kOpen);
   logind->beginSession(true);
   await(kLocked);
-}
-
-TEST_F(LockBridgeTest, StartsLockedAndEndsLocked) {
-  start({true, true});
-  EXPECT_EQ(status(), kLocked);
   logind->setHint(false);
   await(kOpen);
-  EXPECT_EQ(bridge->end(SIGTERM), 0);
-  EXPECT_EQ(status(), kLocked);
-}
-
-TEST_F(LockBridgeTest, FollowsALogindThatWasRestarted) {
-  start({true, false});
-  EXPECT_EQ(status(), kOpen);
+  // logind is restarted.
   logind.reset();
   startLogind({false, false});
   await(kLocked);

@@ -6,7 +6,6 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <random>
 
 #include "extract/ExtractProcess.h"
@@ -40,12 +39,8 @@ bool hasLandlock() {
 
 TEST(ExtractProcess, GivesWhatTheParsersGive) {
   ExtractProcess process(TALLOW_EXTRACT_PROGRAM);
-  const std::string japanese =
-      "/Subtype/Type0/BaseFont/Any/Encoding/UniJIS-UTF16-H/DescendantFonts[<</Type/Font"
-      "/Subtype/CIDFontType0/BaseFont/Any/CIDSystemInfo<</Registry(Adobe)/Ordering(Japan1)"
-      "/Supplement 4>>/FontDescriptor<</Type/FontDescriptor/FontName/Any/Flags 4>>>>]";
   const std::pair<Kind, std::string> files[] = {{Kind::pdf, samples::pdf({"A page", "Another"})},
-                                                {Kind::pdf, samples::pdf({"<4EAC90FD>"}, japanese)},
+                                                {Kind::pdf, samples::japanesePDF()},
                                                 {Kind::pdf, samples::encryptedPDF()},
                                                 {Kind::openDocument, samples::odt({"One", "two"})},
                                                 {Kind::officeXML, kFine},
@@ -101,8 +96,7 @@ TEST(ExtractProcess, LimitsFilesAndTime) {
 class ReplacedProgram : public ::testing::Test {
  protected:
   std::string script(const std::string& text) {
-    const std::string path = _directory / "program";
-    std::ofstream(path) << "#!/bin/sh\n" << text;
+    const std::string path = _directory.write("program", "#!/bin/sh\n" + text);
     chmod(path.c_str(), 0700);
     return path;
   }
@@ -111,8 +105,8 @@ class ReplacedProgram : public ::testing::Test {
 };
 
 TEST_F(ReplacedProgram, ThatTakesTooLongIsEnded) {
-  std::ofstream(_directory / "ready") << encode(extract::ReplyHeader{});
-  ExtractProcess slow(script("cat " + (_directory / "ready") + " >&0\nexec sleep 600\n"));
+  const std::string ready = _directory.write("ready", encode(extract::ReplyHeader{}));
+  ExtractProcess slow(script("cat " + ready + " >&0\nexec sleep 600\n"));
   const auto text = slow.text(Kind::officeXML, kFine, kRoom, std::chrono::milliseconds(100));
   EXPECT_EQ(text.outcome, Outcome::timedOut);
 }
@@ -120,25 +114,20 @@ TEST_F(ReplacedProgram, ThatTakesTooLongIsEnded) {
 TEST_F(ReplacedProgram, ThatCannotBeRunGivesNothing) {
   ExtractProcess missing(_directory / "missing");
   EXPECT_EQ(shown(missing, Kind::officeXML, kFine), "not-run:");
-  ExtractProcess ending(script("exit 1\n"));
-  EXPECT_EQ(shown(ending, Kind::officeXML, kFine), "not-run:");
-  ExtractProcess babbling(script("echo it is not one of our headers >&0\n"));
-  EXPECT_EQ(shown(babbling, Kind::officeXML, kFine), "not-run:");
+  for (const char* const text : {"exit 1\n", "echo it is not one of our headers >&0\n"}) {
+    ExtractProcess process(script(text));
+    EXPECT_EQ(shown(process, Kind::officeXML, kFine), "not-run:");
+  }
 }
 
 // It answers each request with more than was asked for, or ends in the middle.
 TEST_F(ReplacedProgram, ThatLiesCountsAsCrashed) {
-  const auto bytes = [this](const char* name, const std::string& content) {
-    const std::string path = _directory / name;
-    std::ofstream(path) << content;
-    return path;
-  };
-  const std::string ready = bytes("ready", encode(extract::ReplyHeader{}));
+  const std::string ready = _directory.write("ready", encode(extract::ReplyHeader{}));
   const std::string large =
-      bytes("large",
-            encode(extract::ReplyHeader{Outcome::extracted, false, 2000}) + std::string(2000, 'x'));
+      _directory.write("large", encode(extract::ReplyHeader{Outcome::extracted, false, 2000}) +
+                                    std::string(2000, 'x'));
   const std::string half =
-      bytes("half", encode(extract::ReplyHeader{Outcome::cut, false, 100}) + "x");
+      _directory.write("half", encode(extract::ReplyHeader{Outcome::cut, false, 100}) + "x");
   for (const std::string& answer : {large, half}) {
     ExtractProcess lying(
         script("cat " + ready + " >&0\nhead -c 12 >/dev/null\ncat " + answer + " >&0\n"));

@@ -34,15 +34,11 @@ constexpr const char* kPage =
     "<</Type/Page/Parent 2 0 R/MediaBox[0 0 600 200]/Resources<</Font<</F 3 0 R>>>>"
     "/Contents {} 0 R>>";
 
-}  // namespace
-
-std::string zip(const std::vector<ZipEntry>& entries, bool deflated) {
+// The file that a writer of some format makes of these entries. Frees the writer.
+std::string written(archive* writer, const std::vector<ZipEntry>& entries) {
   size_t room = 65536;
   for (const ZipEntry& entry : entries) room += entry.name.size() * 2 + entry.content.size() + 512;
   std::string file(room, '\0');
-  archive* const writer = archive_write_new();
-  archive_write_set_format_zip(writer);
-  archive_write_set_options(writer, deflated ? "zip:compression=deflate" : "zip:compression=store");
   size_t used = 0;
   archive_write_open_memory(writer, file.data(), file.size(), &used);
   archive_entry* const header = archive_entry_new();
@@ -58,6 +54,24 @@ std::string zip(const std::vector<ZipEntry>& entries, bool deflated) {
   archive_write_free(writer);
   file.resize(used);
   return file;
+}
+
+}  // namespace
+
+std::string zip(const std::vector<ZipEntry>& entries, bool deflated) {
+  archive* const writer = archive_write_new();
+  archive_write_set_format_zip(writer);
+  archive_write_set_options(writer, deflated ? "zip:compression=deflate" : "zip:compression=store");
+  return written(writer, entries);
+}
+
+std::string compressed(const std::string& bytes, Compression by) {
+  archive* const writer = archive_write_new();
+  archive_write_set_format_raw(writer);
+  archive_write_add_filter(writer,
+                           by == Compression::gzip ? ARCHIVE_FILTER_GZIP : ARCHIVE_FILTER_XZ);
+  archive_write_set_bytes_in_last_block(writer, 1);
+  return written(writer, {{"", bytes}});
 }
 
 std::string docx(const std::vector<std::string>& paragraphs) {
@@ -92,6 +106,13 @@ std::string pdf(const std::vector<std::string>& pages, std::string_view font) {
   }
   objects[1] = fmt::format("<</Type/Pages/Kids[{}]/Count {}>>", kids, pages.size());
   return pdfOf(objects);
+}
+
+std::string japanesePDF() {
+  return pdf({"<4EAC90FD>"},
+             "/Subtype/Type0/BaseFont/Any/Encoding/UniJIS-UTF16-H/DescendantFonts[<</Type/Font"
+             "/Subtype/CIDFontType0/BaseFont/Any/CIDSystemInfo<</Registry(Adobe)/Ordering(Japan1)"
+             "/Supplement 4>>/FontDescriptor<</Type/FontDescriptor/FontName/Any/Flags 4>>>>]");
 }
 
 std::string pdfOfManyPages(size_t count) {

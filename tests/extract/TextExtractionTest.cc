@@ -12,6 +12,7 @@
 #include "extract/ZipReader.h"
 #include "platform/Text.h"
 #include "tests/extract/Samples.h"
+#include "tests/support/Damage.h"
 #include "tests/support/Seed.h"
 
 namespace {
@@ -33,20 +34,18 @@ std::string shown(Kind kind, const std::string& bytes, size_t limit = kRoom) {
 }
 
 std::string shownXML(Kind kind, const std::string& xml) {
-  return shown(kind, samples::zip({{kind == Kind::openDocument ? "content.xml"  //
-                                                               : "word/document.xml",
-                                    xml}}));
+  const char* const name = kind == Kind::openDocument ? "content.xml" : "word/document.xml";
+  return shown(kind, samples::zip({{name, xml}}));
 }
 
 std::string repeated(std::string_view text, size_t count) {
-  std::string all;
-  for (size_t i = 0; i < count; ++i) all += text;
-  return all;
+  return fmt::format("{}", fmt::join(std::vector(count, text), ""));
 }
 
 TEST(TextExtraction, FindsTheTextOfEachKind) {
   EXPECT_EQ(shown(Kind::pdf, samples::pdf({"The harbour is open", "Second page"})),
             "extracted:The harbour is open/Second page/");
+  EXPECT_EQ(shown(Kind::pdf, samples::japanesePDF()), "extracted:京都/");
   EXPECT_EQ(shown(Kind::officeXML, samples::docx({"Lease &amp; more", "café"})),
             "extracted:Lease & more/café/");
   EXPECT_EQ(shown(Kind::openDocument, samples::odt({"One <text:span>two</text:span>", "three"})),
@@ -70,24 +69,10 @@ TEST(TextExtraction, FindsTheTextOfEachKind) {
             "extracted:Dear é/");
 }
 
-// A font without a table of its own that maps to a character set of the library's data.
-TEST(TextExtraction, ReadsPDFWithAPredefinedCharacterMap) {
-  const std::string font =
-      "/Subtype/Type0/BaseFont/Any/Encoding/UniJIS-UTF16-H/DescendantFonts[<</Type/Font"
-      "/Subtype/CIDFontType0/BaseFont/Any/CIDSystemInfo<</Registry(Adobe)/Ordering(Japan1)"
-      "/Supplement 4>>/FontDescriptor<</Type/FontDescriptor/FontName/Any/Flags 4>>>>]";
-  EXPECT_EQ(shown(Kind::pdf, samples::pdf({"<4EAC90FD>"}, font)), "extracted:京都/");
-}
-
 TEST(TextExtraction, OfficeXML) {
-  struct Row {
-    Kind kind;
-    std::string xml;
-    std::string result;
-  };
   const Kind odf = Kind::openDocument;
   const Kind ooxml = Kind::officeXML;
-  const Row rows[] = {
+  const std::tuple<Kind, std::string, std::string> rows[] = {
       {ooxml, "<w:p><w:t>a</w:t><w:tab/><w:t>b</w:t><w:br/><w:t>c</w:t></w:p>",
        "extracted:a\tb/c/"},
       {ooxml, "<w:p><w:delText>old</w:delText><w:instrText>PAGE</w:instrText><w:t>new</w:t></w:p>",
@@ -110,8 +95,8 @@ TEST(TextExtraction, OfficeXML) {
       {odf, repeated("<d>", 400) + "<text:p>deep</text:p>" + repeated("</d>", 400),
        "extracted:deep/"},
       {odf, repeated("<d>", 200000), "damaged:"}};
-  for (const Row& row : rows) {
-    EXPECT_EQ(shownXML(row.kind, row.xml), row.result) << row.xml.substr(0, 200);
+  for (const auto& [kind, xml, result] : rows) {
+    EXPECT_EQ(shownXML(kind, xml), result) << xml.substr(0, 200);
   }
 }
 
@@ -152,8 +137,7 @@ TEST(TextExtraction, ReadsABombUpToItsLimits) {
   EXPECT_LT(bomb.size(), size / 100);
   EXPECT_EQ(shown(Kind::officeXML, bomb), "damaged:");
 
-  std::vector<samples::ZipEntry> names;
-  for (size_t i = 0; i < extract::ZipReader::kMaxEntries + 10; ++i) names.push_back({"n", ""});
+  const std::vector<samples::ZipEntry> names(extract::ZipReader::kMaxEntries + 10, {"n", ""});
   EXPECT_TRUE(shown(Kind::zip, samples::zip(names)).starts_with("cut:n/n/n"));
 }
 
@@ -176,11 +160,7 @@ TEST(TextExtraction, SurvivesDamage) {
     for (size_t size = 0; size < whole.size(); size += 1 + size / 40) {
       check(kind, whole.substr(0, size));
     }
-    for (int i = 0; i < 100; ++i) {
-      std::string changed = whole;
-      for (int j = 0; j < 3; ++j) changed[random() % changed.size()] = static_cast<char>(random());
-      check(kind, changed);
-    }
+    for (int i = 0; i < 150; ++i) check(kind, testsupport::damaged(whole, 4, random));
     std::string noise(3000, '\0');
     for (char& c : noise) c = static_cast<char>(random());
     check(kind, noise);

@@ -1,6 +1,4 @@
-#include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <tallow/tallow.h>
 
 #include <future>

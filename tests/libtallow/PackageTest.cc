@@ -1,15 +1,11 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
 
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
 
 #include "platform/Files.h"
 #include "tests/daemon/DaemonProcess.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 using testing::HasSubstr;
 
@@ -18,30 +14,15 @@ namespace {
 
 constexpr size_t kMaxBytes = size_t{1} << 20;
 
-class PackageTest : public testing::Test {
+class PackageTest : public testsupport::ShellTest {
  protected:
   void SetUp() override {
     for (const char* const component : {"libtallow", "libtallow_dev"}) {
-      ASSERT_EQ(run(fmt::format("{} --install {} --prefix {} --component {}", TALLOW_CMAKE,
-                                TALLOW_BUILD_DIRECTORY, prefix, component)),
-                0)
-          << output;
+      outputOfShell(fmt::format("{} --install {} --prefix {} --component {}", TALLOW_CMAKE,
+                                TALLOW_BUILD_DIRECTORY, prefix, component));
     }
-    std::filesystem::create_directory(directory / "project");
     write("project/example.cc", blockOfPage("```cpp\n"));
     write("project/CMakeLists.txt", blockOfPage("```cmake\n"));
-  }
-
-  int run(const std::string& command) {
-    const std::string whole =
-        fmt::format("cd {} && ({}) >out 2>&1 </dev/null", directory.path(), command);
-    const int status = WEXITSTATUS(std::system(whole.c_str()));
-    output = platform::readFile(directory / "out", kMaxBytes, nullptr).value_or("");
-    return status;
-  }
-
-  void write(const std::string& name, const std::string& text) const {
-    std::ofstream(directory / name) << text;
   }
 
   static std::string blockOfPage(const std::string& fence) {
@@ -54,60 +35,54 @@ class PackageTest : public testing::Test {
 
   // The program of the page, with and without a daemon.
   void tryExample(const std::string& program) {
-    EXPECT_EQ(run(program + " " + directory.path() + "/run"), 75) << output;
-    EXPECT_THAT(output, HasSubstr("daemon not reachable"));
+    EXPECT_EQ(shell(program + " " + directory.path() + "/run"), 75);
+    EXPECT_THAT(errors, HasSubstr("daemon not reachable"));
     const testsupport::DaemonProcess daemon(directory.path());
-    EXPECT_EQ(run(program + " " + daemon.runtimeDirectory()), 0);
-    EXPECT_EQ(output, "example/1: Harbour fees for March\n");
+    EXPECT_EQ(outputOfShell(program + " " + daemon.runtimeDirectory()),
+              "example/1: Harbour fees for March\n");
   }
 
-  const testsupport::TemporaryDirectory directory;
   const std::string prefix = directory / "prefix";
   const std::string libraries = prefix + "/" TALLOW_LIBRARY_DIRECTORY;
-  std::string output;
 };
 
 }  // namespace
 
 // The list has the types of a 64-bit system.
 TEST_F(PackageTest, ExportsNothingButTheInterface) {
-  ASSERT_EQ(run("nm --dynamic --defined-only --demangle " + libraries +
-                "/libtallow.so | sed 's/^[0-9a-f]* //' | LC_ALL=C sort -u"),
-            0);
   const auto expected = platform::readFile(TALLOW_SYMBOLS, kMaxBytes, nullptr);
-  EXPECT_EQ(output, expected.value_or("(none)"));
-  ASSERT_EQ(run("readelf --dynamic " + libraries + "/libtallow.so | grep SONAME"), 0);
-  EXPECT_THAT(output, HasSubstr("[libtallow.so.1]"));
+  EXPECT_EQ(outputOfShell("nm --dynamic --defined-only --demangle " + libraries +
+                          "/libtallow.so | sed 's/^[0-9a-f]* //' | LC_ALL=C sort -u"),
+            expected.value_or("(none)"));
+  EXPECT_THAT(outputOfShell("readelf --dynamic " + libraries + "/libtallow.so | grep SONAME"),
+              HasSubstr("[libtallow.so.1]"));
 }
 
 // No header needs another library, and each can be included alone.
 TEST_F(PackageTest, HeadersStandAlone) {
   for (const auto& header : std::filesystem::directory_iterator(prefix + "/include/tallow")) {
-    EXPECT_EQ(run(fmt::format("{} -std=c++20 -Wall -Wextra -Wpedantic -Wshadow -Werror "
-                              "-fsyntax-only -I{}/include -include {} -x c++ /dev/null",
-                              TALLOW_COMPILER, prefix, header.path().string())),
-              0)
-        << output;
+    outputOfShell(
+        fmt::format("{} -std=c++20 -Wall -Wextra -Wpedantic -Wshadow -Werror "
+                    "-fsyntax-only -I{}/include -include {} -x c++ /dev/null",
+                    TALLOW_COMPILER, prefix, header.path().string()));
     const auto text = platform::readFile(header.path().string(), kMaxBytes, nullptr).value_or("");
     EXPECT_EQ(text.find("#include \""), std::string::npos) << header.path();
   }
 }
 
 TEST_F(PackageTest, PkgConfigBuildsTheProgramOfThePage) {
-  ASSERT_EQ(run(fmt::format("export PKG_CONFIG_PATH={}/pkgconfig; {} -std=c++20 {} "
-                            "project/example.cc $(pkg-config --cflags --libs tallow) "
-                            "-Wl,-rpath,{} -o example",
-                            libraries, TALLOW_COMPILER, TALLOW_COMPILER_FLAGS, libraries)),
-            0)
-      << output;
+  outputOfShell(
+      fmt::format("export PKG_CONFIG_PATH={}/pkgconfig; {} -std=c++20 {} "
+                  "project/example.cc $(pkg-config --cflags --libs tallow) "
+                  "-Wl,-rpath,{} -o example",
+                  libraries, TALLOW_COMPILER, TALLOW_COMPILER_FLAGS, libraries));
   tryExample("./example");
 }
 
 TEST_F(PackageTest, FindPackageBuildsTheProgramOfThePage) {
-  ASSERT_EQ(run(fmt::format("{0} -G Ninja -S project -B built -DCMAKE_PREFIX_PATH={1} "
-                            "-DCMAKE_CXX_COMPILER={2} -DCMAKE_CXX_FLAGS='{3}' && {0} --build built",
-                            TALLOW_CMAKE, prefix, TALLOW_COMPILER, TALLOW_COMPILER_FLAGS)),
-            0)
-      << output;
+  outputOfShell(
+      fmt::format("{0} -G Ninja -S project -B built -DCMAKE_PREFIX_PATH={1} "
+                  "-DCMAKE_CXX_COMPILER={2} -DCMAKE_CXX_FLAGS='{3}' && {0} --build built",
+                  TALLOW_CMAKE, prefix, TALLOW_COMPILER, TALLOW_COMPILER_FLAGS));
   tryExample("built/example");
 }

@@ -1,10 +1,7 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <regex>
 
 #include "platform/Files.h"
@@ -27,26 +24,16 @@ class MailProgramsTest : public testsupport::TmuxTest {
   void prepare() {
     ASSERT_TRUE(daemon.ready());
     if (!fs::exists(mail)) fs::copy(TALLOW_SAMPLE_MAIL, mail, fs::copy_options::recursive);
-    fs::create_directories(directory / "bin");
-    fs::create_symlink(TALLOW_PROGRAM, directory / "bin/tallow");
     write("bin/editor", "#!/bin/sh\ncp \"$1\" \"$HOME/reply\"\n");
+    fs::create_symlink(TALLOW_PROGRAM, directory / "bin/tallow");
     fs::permissions(directory / "bin/editor", fs::perms::owner_all);
     variables = fmt::format(
         "PATH={0}/bin:$PATH RUNTIME_DIRECTORY={1} STATE_DIRECTORY={0}/state TERM=xterm-256color",
         directory.path(), daemon.runtimeDirectory());
-    ASSERT_EQ(std::system(fmt::format("{} --runtime-dir {} index {} >/dev/null 2>&1",
-                                      TALLOW_PROGRAM, daemon.runtimeDirectory(), mail)
-                              .c_str()),
-              0);
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+    ASSERT_EQ(run("index " + mail), 0) << errors;
   }
 
-  void write(const std::string& name, const std::string& text) const {
-    fs::create_directories(fs::path(directory / name).parent_path());
-    std::ofstream(directory / name) << text;
-  }
-  [[nodiscard]] std::string read(const std::string& name) const {
-    return platform::readFile(directory / name, 100000, nullptr).value_or("");
-  }
   // One of the files that are tested.
   [[nodiscard]] static std::string settings(const std::string& name) {
     return platform::readFile(std::string(TALLOW_MAIL_PROGRAMS) + '/' + name, 100000, nullptr)
@@ -103,29 +90,19 @@ TEST_F(MailProgramsTest, Neomutt) {
   start("neomutt -F " + directory / "muttrc", 110, 30);
   await("[Msgs:10 ");
   // In the open folder.
-  press("M-s");
-  await("Limit to messages matching: ~I");
-  type("first invoice");
-  press("Enter");
-  await("[Msgs:1/10 ");
+  press("M-s", "Limit to messages matching: ~I");
+  enter("first invoice", "[Msgs:1/10 ");
   await("First invoice for the shelves");
   // In all folders.
-  press("S");
-  await("Search:");
-  type("invoice for");
-  press("Enter");
-  await("search [Msgs:7 ");
+  press("S", "Search:");
+  enter("invoice for", "search [Msgs:7 ");
   await("Your invoice 4471");
   EXPECT_EQ(links(), 7U);
   // The links are gone with the next search, and neomutt asks nothing about them.
-  press("S");
-  await("Search:");
-  type("brackets brass");
-  press("Enter");
-  await("search [Msgs:1 ");
+  press("S", "Search:");
+  enter("brackets brass", "search [Msgs:1 ");
   EXPECT_EQ(links(), 1U);
-  press("Enter");
-  await("Dear Mara,");
+  press("Enter", "Dear Mara,");
   press("r");
   EXPECT_THAT(awaitReply("> Dear Mara"), HasSubstr("\nTo: Samir Haddad <samir@example.com>\n"));
   await("Aborted unmodified message");
@@ -135,28 +112,20 @@ TEST_F(MailProgramsTest, Aerc) {
   NEED_PROGRAMS("tmux", "aerc")
   prepare();
   configureAerc(directory / "bin/editor");
-  ASSERT_EQ(std::system((variables + " HOME=" + directory.path() +
-                         " tallow search --maildir=" + folder + " >/dev/null")
-                            .c_str()),
-            0);
+  outputOfShell(variables + " HOME=" + directory.path() + " tallow search --maildir=" + folder);
   start("aerc", 120, 30);
   await("Elena Ruiz");
-  press("n");
-  await("(no messages)");
+  press("n", "(no messages)");
   // The open folder shows the results of each search.
   for (const auto& [words, found] : {std::pair("oarlock fixed", "Oarlock fixed"),
                                      {"harbour", "Minutes of the rowing club"},
                                      {"nothingofthekind", "(no messages)"},
                                      {"brackets brass", "First invoice for the shelves"}}) {
-    press("S");
-    await("Search:");
-    type(words);
-    press("Enter");
-    await(found);
+    press("S", "Search:");
+    enter(words, found);
   }
   awaitThat([&](const std::string&) { return links() == 1; }, "one link");
-  press("g Enter");
-  await("From: \"Samir Haddad\"");
+  press("g Enter", "From: \"Samir Haddad\"");
   press("r");
   EXPECT_THAT(awaitReply("> Dear Mara"), HasSubstr("Samir Haddad wrote"));
   await("Send this email?");
@@ -172,10 +141,8 @@ TEST_F(MailProgramsTest, AercCompletesAddresses) {
   configureAerc(directory / "bin/waiting");
   start("aerc", 120, 30);
   await("Elena Ruiz");
-  press("c");
-  await("To:");
-  type("sami");
-  await("samir@example.com");
+  press("c", "To:");
+  type("sami", "samir@example.com");
 }
 
 TEST_F(MailProgramsTest, Emacs) {
@@ -184,14 +151,10 @@ TEST_F(MailProgramsTest, Emacs) {
   start(fmt::format("emacs -nw -Q -l {}/tallow.el -f tallow-search", TALLOW_MAIL_PROGRAMS), 110,
         40);
   await("Search mail:");
-  type("randonn\u00E9e");
-  press("Enter");
-  await("2024-02-09 11:10 Ren\u00E9 Dufour");
-  press("Enter");
-  await("Bonjour,");
+  enter("randonn\u00E9e", "2024-02-09 11:10 Ren\u00E9 Dufour");
+  press("Enter", "Bonjour,");
   await("From:     Ren\u00E9 Dufour <rene.dufour@example.com>");
-  press("r");
-  await("To: Ren\u00E9 Dufour <rene.dufour@example.com>");
+  press("r", "To: Ren\u00E9 Dufour <rene.dufour@example.com>");
   await("Subject: Re: Randonn\u00E9e dimanche");
   await("> Bonjour,");
 }
@@ -199,28 +162,20 @@ TEST_F(MailProgramsTest, Emacs) {
 // Nothing of a mail changes the list, and the file compiles without a warning.
 TEST_F(MailProgramsTest, EmacsWithHostileMail) {
   NEED_PROGRAMS("tmux", "emacs")
-  fs::create_directories(mail);
   write("mail/a.eml",
         "From: \"a\x1b[2J\u202E\" <a@example.org>\nSubject: hostile\x07\u202E\u2066 " +
             std::string(100000, 'm') + "\nReply-To: b@example.org\n\nhostile\n");
   prepare();
-  EXPECT_EQ(std::system(fmt::format("cp {1}/tallow.el {0} && cd {0} && emacs -Q --batch --eval "
-                                    "'(setq byte-compile-error-on-warn t)' -f batch-byte-compile "
-                                    "tallow.el >{0}/compiled 2>&1",
-                                    directory.path(), TALLOW_MAIL_PROGRAMS)
-                            .c_str()),
-            0)
-      << read("compiled");
+  outputOfShell("cp " TALLOW_MAIL_PROGRAMS
+                "/tallow.el . && emacs -Q --batch --eval "
+                "'(setq byte-compile-error-on-warn t)' -f batch-byte-compile tallow.el");
   start("emacs -nw -Q -l " + directory / "tallow.elc -f tallow-search", 110, 40);
   await("Search mail:");
-  type("hostile");
-  press("Enter");
-  await("1 of 1 mails");
+  enter("hostile", "1 of 1 mails");
   awaitThat(
       [](const std::string& seen) {
         return std::regex_search(seen, std::regex("\n +a \\[2J +hostile +m+[$]\n"));
       },
       "the row of the mail");
-  press("r");
-  await("To: b@example.org");
+  press("r", "To: b@example.org");
 }

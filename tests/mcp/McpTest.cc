@@ -1,10 +1,8 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <nlohmann/json.hpp>
 #include <random>
 #include <thread>
@@ -13,6 +11,7 @@
 #include "mcp/LineInput.h"
 #include "mcp/Session.h"
 #include "mcp/ShownText.h"
+#include "tests/support/Damage.h"
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -78,10 +77,8 @@ TEST(McpShownTextTest, CutsBetweenCodePoints) {
 TEST(McpFolderLimitTest, AllowsByTheResolvedPath) {
   namespace fs = std::filesystem;
   const testsupport::TemporaryDirectory directory;
-  for (const char* const name : {"in/cur", "inside", "out"})
-    fs::create_directories(directory / name);
   for (const char* const name : {"in/cur/1:2,S", "in/mail", "in/box", "inside/mail", "out/mail"}) {
-    std::ofstream(directory / name) << "Subject: a\n\nb\n";
+    directory.write(name, "Subject: a\n\nb\n");
   }
   fs::create_symlink(directory / "out/mail", directory / "in/link");
   fs::create_symlink(directory / "out", directory / "in/folder");
@@ -132,19 +129,13 @@ TEST(McpSessionTest, DamagedMessagesEndNothing) {
       R"({"query":"from:mara \"a b\" OR (c -d","limit":5}}})",
       R"({"jsonrpc":"2.0","id":5,"method":"tools/call","params":{"name":"show","arguments":)"
       R"({"id":"file/a%2Fb","from":7}}})",
-      R"({"jsonrpc":"2.0","id":6,"method":"tools/call","params":{"name":"status"}})"};
+      R"({"jsonrpc":"2.0","id":6,"method":"tools/call","params":{"name":"status"}})",
+      R"({"jsonrpc":"2.0","id":[8],"method":"ping"})",
+      R"({"jsonrpc":"2.0","id":9,"method":7})"};
   std::mt19937 random(testsupport::firstSeed());
-  const auto below = [&random](size_t end) { return random() % end; };
   for (int round = 0; round < 5000; ++round) {
-    std::string line = messages[below(std::size(messages))];
-    for (size_t damage = below(4); damage > 0; --damage) {
-      const size_t at = below(line.size());
-      if (below(2) == 0) {
-        line[at] = static_cast<char>(below(256));
-      } else {
-        line.insert(at, line.substr(below(line.size()), below(20)));
-      }
-    }
+    std::string line = messages[random() % std::size(messages)];
+    if (round % 4 != 0) line = testsupport::damaged(line, 3, random);
     const std::string reply = session.answer(line);
     EXPECT_EQ(reply.find('\n'), std::string::npos) << line;
     EXPECT_TRUE(reply.empty() || nlohmann::json::accept(reply)) << line << '\n' << reply;

@@ -1,5 +1,4 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <clocale>
 #include <random>
@@ -43,25 +42,29 @@ class ModelTest : public testing::Test {
 
   // Answers the model's next search with a page of `total` results.
   Search answer(size_t total, bool complete = true) {
-    const auto search = model.nextSearch();
-    EXPECT_TRUE(search.has_value());
-    if (!search) return {};
-    Found found{*search};
-    for (size_t i = search->offset; i < std::min(total, search->offset + search->limit); ++i) {
+    const Search search = model.nextSearch().value();
+    Found found{search};
+    for (size_t i = search.offset; i < std::min(total, search.offset + search.limit); ++i) {
       found.rows.push_back(row(i));
     }
     found.total = total;
     found.complete = complete;
-    found.words = {search->words};
+    found.words = {search.words};
     model.take(found);
-    return *search;
+    return search;
+  }
+  Search fail(Failure failure, const std::string& reason) {
+    Found found{model.nextSearch().value()};
+    found.failure = failure;
+    found.reason = reason;
+    model.take(found);
+    return found.search;
   }
   // Answers the model's next mail request.
   MailRequest load(const mailscreen::Glyphs& text, bool cut = false) {
-    const auto request = model.nextMail();
-    EXPECT_TRUE(request.has_value());
-    if (request) model.take(Mail{*request, text, cut});
-    return request.value_or(MailRequest());
+    const MailRequest request = model.nextMail().value();
+    model.take(Mail{request, text, cut});
+    return request;
   }
   [[nodiscard]] std::string selected() const {
     return model.selected() < model.rows().size() ? model.rows()[model.selected()].identifier : "";
@@ -260,16 +263,14 @@ TEST_F(ModelTest, CommandsApplyToTheSelectedMail) {
   answer(3);
   press(Key::down);
   press(Key::copy);
-  auto command = model.nextCommand();
-  ASSERT_TRUE(command);
-  EXPECT_EQ(command->kind, Command::Kind::copy);
-  EXPECT_EQ(command->place, "/m/1:0");
+  auto command = model.nextCommand().value();
+  EXPECT_EQ(command.kind, Command::Kind::copy);
+  EXPECT_EQ(command.place, "/m/1:0");
   press(Key::enter);
   type("o");
-  command = model.nextCommand();
-  ASSERT_TRUE(command);
-  EXPECT_EQ(command->kind, Command::Kind::open);
-  EXPECT_EQ(command->place, "/m/1");
+  command = model.nextCommand().value();
+  EXPECT_EQ(command.kind, Command::Kind::open);
+  EXPECT_EQ(command.place, "/m/1");
   EXPECT_FALSE(model.nextCommand());
   press(Key::suspend);
   EXPECT_TRUE(model.nextCommand());
@@ -297,36 +298,20 @@ TEST_F(ModelTest, ReportsAndRetriesFailures) {
   type("a");
   answer(3);
   type("b");
-  auto search = model.nextSearch();
-  ASSERT_TRUE(search);
-  Found away{*search};
-  away.failure = Failure::unreachable;
-  away.reason = "not running";
-  model.take(away);
+  fail(Failure::unreachable, "not running");
   EXPECT_EQ(model.statusText(), "not running; trying again");
   EXPECT_EQ(model.rows().size(), 3u);
   EXPECT_TRUE(model.wantsRetry());
   EXPECT_FALSE(model.nextSearch());
   model.retry();
-  search = model.nextSearch();
-  ASSERT_TRUE(search);
-  EXPECT_EQ(search->words, "ab");
-  Found refused{*search};
-  refused.failure = Failure::refused;
-  refused.reason = "locked";
-  model.take(refused);
+  EXPECT_EQ(fail(Failure::refused, "locked").words, "ab");
   EXPECT_EQ(model.statusText(), "locked; trying again");
   EXPECT_TRUE(model.rows().empty()) << "what is locked is not shown any more";
   model.retry();
   answer(2);
   EXPECT_FALSE(model.wantsRetry());
   type("(");
-  search = model.nextSearch();
-  ASSERT_TRUE(search);
-  Found unreadable{*search};
-  unreadable.failure = Failure::query;
-  unreadable.reason = "what?";
-  model.take(unreadable);
+  fail(Failure::query, "what?");
   EXPECT_EQ(model.statusText(), "what?");
   EXPECT_FALSE(model.wantsRetry());
   EXPECT_EQ(model.rows().size(), 2u);

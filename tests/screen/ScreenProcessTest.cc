@@ -1,20 +1,11 @@
 #include <fmt/format.h>
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
 
-#include <chrono>
 #include <csignal>
-#include <cstdio>
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
-#include <functional>
 #include <memory>
-#include <sstream>
 
 #include "cli/Terminal.h"
-#include "platform/Files.h"
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/TmuxTest.h"
 
@@ -26,8 +17,6 @@ using testing::HasSubstr;
 using testing::Not;
 
 namespace {
-
-using testsupport::outputOf;
 
 class ScreenProcessTest : public testsupport::TmuxTest {
  protected:
@@ -41,34 +30,27 @@ class ScreenProcessTest : public testsupport::TmuxTest {
     daemon.reset();
     daemon = std::make_unique<testsupport::DaemonProcess>(directory.path());
     ASSERT_TRUE(daemon->ready());
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon->runtimeDirectory();
   }
-  void index() const {
-    ASSERT_EQ(std::system(fmt::format("{} index {} >/dev/null 2>&1", program(), mail).c_str()), 0);
-  }
-  [[nodiscard]] std::string program() const {
-    return TALLOW_PROGRAM " --runtime-dir " + daemon->runtimeDirectory();
-  }
+  void index() { ASSERT_EQ(run("index " + mail), 0) << errors; }
 
   // Starts a shell in a terminal of this size, and the program in it.
   void open(int columns, int rows, const std::string& arguments = "") {
-    start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
-    await("ready>");
-    type(program() + arguments);
-    press("Enter");
-    await("Search:");
+    startShell(columns, rows);
+    enter(tallow + arguments, "Search:");
   }
   // The process ID of the program, a child of the shell.
   [[nodiscard]] pid_t process() const {
     const int shell = std::atoi(tmux("display-message -p -t t '#{pane_pid}'").c_str());
-    return std::atoi(outputOf(fmt::format("cat /proc/{0}/task/{0}/children", shell)).c_str());
+    return std::atoi(
+        testsupport::outputOf(fmt::format("cat /proc/{0}/task/{0}/children", shell)).c_str());
   }
   // Expects that the program has ended with this status, and that the terminal is in line mode with
   // echo again.
   void expectRestored(int status = 0) const {
     awaitGone("Search:");
-    type("echo left=$?; stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"");
-    press("Enter");
-    await(fmt::format("left={}\n4\n", status));
+    enter("echo left=$?; stty -a | tr \" \" \"\\n\" | grep -cxE \"icanon|echo|isig|icrnl\"",
+          fmt::format("left={}\n4\n", status));
   }
 
   const std::string mail = directory / "mail";
@@ -81,28 +63,21 @@ TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
   index();
   open(80, 24);
   await("F1 help");
-  type("minutes of the row");
-  await("Minutes of the rowing club");
+  type("minutes of the row", "Minutes of the rowing club");
   await("1-1 of 1");
   await("Subject:  Minutes of the rowing club");  // the preview
   press("C-u");
   awaitGone("Minutes");
-  type("photos");
-  await("Photos from the island");
+  type("photos", "Photos from the island");
   // Letters of any script, cursor movement, and deleting a word.
   press("C-u");
-  type("京都");
-  await("京都");
+  type("京都", "京都");
   press("C-w");
-  type("invoice zz");
-  await("no match");
-  press("BSpace BSpace BSpace");
-  await("Your invoice 4471");
+  type("invoice zz", "no match");
+  press("BSpace BSpace BSpace", "Your invoice 4471");
   press("C-a");
-  type("x");
-  await("Search: xinvoice");
-  press("C-a DC");
-  await("Your invoice 4471");
+  type("x", "Search: xinvoice");
+  press("C-a DC", "Your invoice 4471");
   // Pasted text goes into the line, even if its characters are keys.
   press("C-e C-u");
   tmux("set-buffer -- \"$(printf 'photos\\rfrom\\tthe\\033OA\\017')\" \\; paste-buffer -p -t t");
@@ -114,32 +89,21 @@ TEST_F(ScreenProcessTest, ResultsChangeWithEachKey) {
 TEST_F(ScreenProcessTest, MailsAreReadSortedAndFiltered) {
   index();
   open(120, 40);
-  type("invoice");
-  await("Your invoice 4471");
-  press("C-s");
-  await("newest first");
-  press("C-t");
-  await("conversations");
+  type("invoice", "Your invoice 4471");
+  press("C-s", "newest first");
+  press("C-t", "conversations");
   await("(4) ");
-  press("C-f");
-  await("Folder:");
+  press("C-f", "Folder:");
   press("C-u");
-  type("family");
-  press("Enter");
-  await("in family");
+  enter("family", "in family");
   await("First invoice for the shelves");
   awaitGone("4471");
-  press("Enter");
-  await("q back");
+  press("Enter", "q back");
   await("Subject:  First invoice for the shelves");
-  press("q");
-  await("Search: invoice");
-  press("F1");
-  await("Ctrl-T");
-  press("Escape");
-  await("Search: invoice");
-  press("C-y");
-  await("copied " + mail + "/family/cur/");
+  press("q", "Search: invoice");
+  press("F1", "Ctrl-T");
+  press("Escape", "Search: invoice");
+  press("C-y", "copied " + mail + "/family/cur/");
   EXPECT_THAT(tmux("show-buffer"), HasSubstr(mail + "/family/cur/"));
 }
 
@@ -148,13 +112,11 @@ TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
   variables = fmt::format("TALLOW_OPEN='tee {}/opened <'", directory.path());
   open(80, 24, " screen oarlock fixed");
   await("1-1 of 1");
-  press("C-o");
-  await("Search: oarlock");
+  press("C-o", "Search: oarlock");
   awaitThat([&](const std::string&) { return fs::exists(directory / "opened"); },
             "the mail being opened");
   await("1-1 of 1");
-  EXPECT_THAT(platform::readFile(directory / "opened", 100000, nullptr).value_or(""),
-              HasSubstr("Subject: Oarlock fixed"));
+  EXPECT_THAT(read("opened"), HasSubstr("Subject: Oarlock fixed"));
   press("Escape");
   expectRestored();
 }
@@ -162,8 +124,7 @@ TEST_F(ScreenProcessTest, MailIsOpenedByAProgram) {
 TEST_F(ScreenProcessTest, DrawsAnySize) {
   index();
   open(80, 24);
-  type("invoice");
-  await("Your invoice 4471");
+  type("invoice", "Your invoice 4471");
   const auto resize = [&](int columns, int rows) {
     tmux(fmt::format("resize-window -t t -x {} -y {}", columns, rows));
   };
@@ -189,29 +150,25 @@ TEST_F(ScreenProcessTest, DrawsAnySize) {
 // No mail text may move what is shown next to it or below it.
 TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
   fs::remove_all(mail);
-  fs::create_directories(mail);
   const std::string bad =
       "\x1b[2J\x1b]0;title\x07\u009B31m\u202Egnp.exe\u2066\u0645\u0631\u062D\u0628\u0627 "
       "\u05E9\u05DC\u05D5\u05DD "
       "z\u0301\u0302\u0303\u0304\u0305\u0306\u0307\u0308\u0309 "
       "\u4EAC\u90FD\u200D\u2764\uFE0F\U0001F44B\U0001F3FD "
       "\U0001F468\u200D\U0001F469\u200D\U0001F467 \xC3\x28 \xFF";
-  std::ofstream(mail + "/1.eml") << "From: \"" << bad << "\" <a@example.org>\nSubject: hostile "
-                                 << bad << std::string(1000000, 'M')
-                                 << "\nDate: Mon, 08 Jan 2024 08:49:00 +0000\n\n"
-                                 << "hostile\n"
-                                 << bad << "\n\n"
-                                 << std::string(5000, '\t') << bad << "\x0E\x8D\n";
-  std::ofstream(mail + "/2\n\x1b[2J\u202E.eml")
-      << "From: b@example.org\nSubject: hostile but plain\nDate: Mon, 08 Jan 2023 08:49:00 "
-         "+0000\n\nhostile\n";
+  write("mail/1.eml",
+        fmt::format("From: \"{0}\" <a@example.org>\nSubject: hostile {0}{1:M>1000000}\n"
+                    "Date: Mon, 08 Jan 2024 08:49:00 +0000\n\n"
+                    "hostile\n{0}\n\n{1:\t>5000}{0}\x0E\x8D\n",
+                    bad, ""));
+  write("mail/2\n\x1b[2J\u202E.eml",
+        "From: b@example.org\nSubject: hostile but plain\n"
+        "Date: Mon, 08 Jan 2023 08:49:00 +0000\n\nhostile\n");
   index();
   open(90, 24);
-  type("hostile");
-  await("1-2 of 2");
+  type("hostile", "1-2 of 2");
   await("hostile but plain");
-  press("Down");
-  await("Subject:  hostile but plain");
+  press("Down", "Subject:  hostile but plain");
   press("Up");
   awaitGone("Subject:  hostile but plain");
   await("Subject:  hostile");
@@ -228,12 +185,9 @@ TEST_F(ScreenProcessTest, HostileMailDoesNotBreakTheScreen) {
     EXPECT_LE(cli::columnsTaken(line), 90u);
   }
   EXPECT_EQ(tmux("display-message -p -t t '#{pane_title}'").find("title"), std::string::npos);
-  press("Down C-y");
-  await("copied ");
-  press("Enter");
-  await("q back");
-  press("Escape");
-  await("Search: hostile");
+  press("Down C-y", "copied ");
+  press("Enter", "q back");
+  press("Escape", "Search: hostile");
   press("Escape");
   expectRestored();
 }
@@ -243,8 +197,7 @@ TEST_F(ScreenProcessTest, WaitsForADaemonThatEnds) {
   daemon->signal(SIGKILL);
   daemon->wait();
   open(80, 24);
-  type("oarlock");
-  await("tallowsearchd is not running; trying again");
+  type("oarlock", "tallowsearchd is not running; trying again");
   startDaemon();
   await("Oarlock fixed");
   awaitGone("not running");
@@ -252,8 +205,7 @@ TEST_F(ScreenProcessTest, WaitsForADaemonThatEnds) {
   daemon->signal(SIGTERM);
   daemon->wait();
   startDaemon();
-  type(" fixed");
-  await("Search: oarlock fixed");
+  type(" fixed", "Search: oarlock fixed");
   awaitGone("not running");
   await("1-1 of 1");
 }
@@ -261,27 +213,19 @@ TEST_F(ScreenProcessTest, WaitsForADaemonThatEnds) {
 TEST_F(ScreenProcessTest, RestoresTheTerminal) {
   index();
   open(80, 24);
-  type("invoice");
-  await("Your invoice 4471");
-  press("C-z");
-  await("Stopped");
+  type("invoice", "Your invoice 4471");
+  press("C-z", "Stopped");
   await("ready>");
   press("C-l");
-  type("echo be''tween");
-  press("Enter");
-  await("\nbetween");
-  type("fg");
-  press("Enter");
-  await("Search: invoice");
+  enter("echo be''tween", "\nbetween");
+  enter("fg", "Search: invoice");
   await("Your invoice 4471");
   press("C-c");
   expectRestored();
   // The exit statuses that a shell reports; SIGINT has the effect of Ctrl-C.
   for (const auto& [signal, status] : {std::pair(SIGTERM, 143), {SIGHUP, 129}, {SIGINT, 0}}) {
     press("C-l");
-    type(program());
-    press("Enter");
-    await("Search:");
+    enter(tallow, "Search:");
     ASSERT_EQ(kill(process(), signal), 0);
     expectRestored(status);
   }

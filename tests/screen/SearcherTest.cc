@@ -1,18 +1,15 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <clocale>
-#include <condition_variable>
 #include <filesystem>
-#include <fstream>
 #include <future>
-#include <mutex>
+#include <semaphore>
 
 #include "screen/MailLoader.h"
 #include "screen/Searcher.h"
 #include "tests/client/FakeDaemon.h"
 #include "tests/daemon/DaemonProcess.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 using mailscreen::Failure;
 using mailscreen::Found;
@@ -22,26 +19,7 @@ using testing::HasSubstr;
 
 namespace {
 
-// Waits until a worker thread has a result.
-class Bell {
- public:
-  void ring() {
-    const std::lock_guard lock(_mutex);
-    _rung = true;
-    _changed.notify_one();
-  }
-  void wait() {
-    std::unique_lock lock(_mutex);
-    _changed.wait(lock, [this] { return std::exchange(_rung, false); });
-  }
-
- private:
-  std::mutex _mutex;
-  std::condition_variable _changed;
-  bool _rung = false;
-};
-
-class SearcherTest : public testing::Test {
+class SearcherTest : public testsupport::ShellTest {
  protected:
   void SetUp() override {
     ASSERT_NE(std::setlocale(LC_CTYPE, "C.UTF-8"), nullptr);
@@ -55,14 +33,17 @@ class SearcherTest : public testing::Test {
     return options;
   }
 
+  // What a worker thread, which rings when it has something, makes of this.
+  auto resultOf(auto& worker, const auto& task) {
+    worker.submit(task);
+    bell.acquire();
+    return worker.take().value();
+  }
   Found find(mailscreen::Searcher& searcher, const Search& search) {
-    searcher.submit(search);
-    bell.wait();
-    return searcher.take().value_or(Found{});
+    return resultOf(searcher, search);
   }
 
-  const testsupport::TemporaryDirectory directory;
-  Bell bell;
+  std::counting_semaphore<> bell{0};
 };
 
 // The daemon with the sample mail.
@@ -72,34 +53,23 @@ class SampleSearchTest : public SearcherTest {
     SearcherTest::SetUp();
     ASSERT_TRUE(daemon.ready());
     std::filesystem::copy(TALLOW_SAMPLE_MAIL, mail, std::filesystem::copy_options::recursive);
-    index();
-  }
-  void index() const {
-    const std::string command = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory() +
-                                " index " + mail + " >/dev/null 2>&1";
-    ASSERT_EQ(std::system(command.c_str()), 0);
+    tallow = TALLOW_PROGRAM " --runtime-dir " + daemon.runtimeDirectory();
+    ASSERT_EQ(run("index " + mail), 0) << errors;
   }
   Found find(const Search& search) { return SearcherTest::find(searcher, search); }
 
   const std::string mail = directory / "mail";
   const testsupport::DaemonProcess daemon{directory.path()};
-  mailscreen::Searcher searcher{options(daemon.runtimeDirectory()), [this] { bell.ring(); }};
+  mailscreen::Searcher searcher{options(daemon.runtimeDirectory()), [this] { bell.release(); }};
 };
 
 constexpr auto kRelevance = cli::SortOrder::relevance;
 
 }  // namespace
 
-TEST_F(SearcherTest, AbsentDaemonIsAFailure) {
-  mailscreen::Searcher searcher(options(directory / "none"), [this] { bell.ring(); });
-  const Found found = find(searcher, {"words", "", kRelevance, false, 0, 10});
-  EXPECT_EQ(found.failure, Failure::unreachable);
-  EXPECT_EQ(found.reason, "tallowsearchd is not running");
-}
-
 TEST_F(SearcherTest, ReportsReasonsOfFailures) {
   testsupport::FakeDaemon fake;
-  mailscreen::Searcher searcher(options(fake.runtimeDirectory()), [this] { bell.ring(); });
+  mailscreen::Searcher searcher(options(fake.runtimeDirectory()), [this] { bell.release(); });
   fake.failOnce("SearchItemsForQuery", {"com.quill.tallow.TALIndexerManager", -2, "locked"});
   Found found = find(searcher, {"words", "", kRelevance, false, 0, 10});
   EXPECT_EQ(found.failure, Failure::refused);
@@ -107,6 +77,10 @@ TEST_F(SearcherTest, ReportsReasonsOfFailures) {
   found = find(searcher, {"@bills", "", kRelevance, false, 0, 10});
   EXPECT_EQ(found.failure, Failure::query);
   EXPECT_THAT(found.reason, HasSubstr("there is no saved search \"bills\""));
+  fake.stop();
+  found = find(searcher, {"words", "", kRelevance, false, 0, 10});
+  EXPECT_EQ(found.failure, Failure::unreachable);
+  EXPECT_EQ(found.reason, "tallowsearchd is not running");
 }
 
 // A daemon that does not answer does not delay the end of the program.
@@ -161,22 +135,18 @@ TEST_F(SampleSearchTest, PagesThreadsFoldersAndSavedSearches) {
   for (const auto& row : folder.rows) EXPECT_EQ(row.folder, "drafts");
   EXPECT_EQ(find({"", "drafts", kRelevance, false, 0, 100}).rows.size(), 2u);
 
-  std::filesystem::create_directories(directory / "config/tallow");
-  std::ofstream(directory / "config/tallow/searches") << "toasts subject:toast\n";
+  write("config/tallow/searches", "toasts subject:toast\n");
   EXPECT_EQ(find({"@toasts", "", kRelevance, false, 0, 10}).rows.size(), 1u);
   EXPECT_EQ(find({"nothingofthekind @toasts", "", kRelevance, false, 0, 10}).rows.size(), 0u);
 }
 
 TEST_F(SampleSearchTest, LimitsMailsToRead) {
-  mailscreen::MailLoader loader(options(daemon.runtimeDirectory()), [this] { bell.ring(); });
+  mailscreen::MailLoader loader(options(daemon.runtimeDirectory()), [this] { bell.release(); });
   const auto load = [&](const std::string& identifier, bool whole) {
-    loader.submit({identifier, {"lo"}, whole});
-    bell.wait();
-    return loader.take().value_or(Mail{});
+    return resultOf(loader, mailscreen::MailRequest{identifier, {"lo"}, whole});
   };
-  const std::string path = mail + "/large.eml";
-  std::ofstream(path) << "Subject: large\n\n" << std::string(200000, 'x') << "\nlost at the end\n";
-  const std::string identifier = "file" + path;
+  write("mail/large.eml", "Subject: large\n\n" + std::string(200000, 'x') + "\nlost at the end\n");
+  const std::string identifier = "file" + mail + "/large.eml";
   const Mail beginning = load(identifier, false);
   EXPECT_TRUE(beginning.cut);
   EXPECT_LE(beginning.text.size(), mailscreen::MailLoader::kPreviewText);

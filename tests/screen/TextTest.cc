@@ -1,5 +1,4 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <clocale>
 #include <random>
@@ -41,10 +40,7 @@ constexpr const char* kPlain = "\x01";
 }  // namespace
 
 TEST_F(ScreenTextTest, GlyphsAreSafeToDraw) {
-  const struct {
-    const char* text;
-    const char* shown;
-  } kCases[] = {
+  const std::pair<const char*, const char*> cases[] = {
       {"plain 京都 é", "plain 京都 é"},
       {"\u0301first", "first"},
       {"z\u0301\u0302\u0303\u0304\u0305\u0306o", "z\u0301\u0302\u0303\u0304o"},
@@ -54,8 +50,8 @@ TEST_F(ScreenTextTest, GlyphsAreSafeToDraw) {
       {"\x1b[2J\x01\x02\u202Ex", "\uFFFD[2J\uFFFD\uFFFDx"},
       {"private \U0010FFFE", "private \uFFFD"},
   };
-  for (const auto& c : kCases) {
-    EXPECT_EQ(mailscreen::toUTF8(mailscreen::lineOfGlyphs(c.text)), c.shown) << c.text;
+  for (const auto& [text, shown] : cases) {
+    EXPECT_EQ(mailscreen::toUTF8(mailscreen::lineOfGlyphs(text)), shown) << text;
   }
   EXPECT_EQ(mailscreen::toUTF8(mailscreen::fitted(U"京都駅", 5)), "京都…");
   EXPECT_EQ(mailscreen::toUTF8(mailscreen::fitted(U"京都駅", 4)), "京…");

@@ -14,6 +14,9 @@ class TemporaryDirectory {
 
   [[nodiscard]] const std::string& path() const { return _path; }
   [[nodiscard]] std::string operator/(const std::string& name) const { return _path + '/' + name; }
+  // Writes a file, whose directories are made, and returns its path.
+  std::string write(const std::string& name, const std::string& content) const;
+  void makeMaildir(const std::string& name) const;
 
  private:
   std::string _path;

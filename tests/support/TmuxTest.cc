@@ -18,19 +18,31 @@ void TmuxTest::start(const std::string& command, int columns, int rows) const {
                    rows, command));
 }
 
+void TmuxTest::startShell(int columns, int rows) const {
+  start("PS1='ready> ' exec bash --norc --noprofile -i", columns, rows);
+  await("ready>");
+}
+
 std::string TmuxTest::tmux(const std::string& arguments) const {
-  return outputOf(fmt::format(
+  return testsupport::outputOf(fmt::format(
       "env -u TMUX -u STATE_DIRECTORY LC_ALL=C.UTF-8 HOME={0} XDG_STATE_HOME={0}/client "
       "XDG_CONFIG_HOME={0}/config TZ=UTC SHELL=/bin/bash {1} tmux -u -f /dev/null -S {0}/tmux {2}",
       directory.path(), variables, arguments));
 }
 
-void TmuxTest::type(const std::string& text) const {
+void TmuxTest::type(const std::string& text, const std::string& shown) const {
   tmux("send-keys -t t -l -- '" + text + "'");
+  await(shown);
 }
 
-void TmuxTest::press(const std::string& keys) const {
+void TmuxTest::press(const std::string& keys, const std::string& shown) const {
   tmux("send-keys -t t " + keys);
+  await(shown);
+}
+
+void TmuxTest::enter(const std::string& line, const std::string& shown) const {
+  type(line);
+  press("Enter", shown);
 }
 
 std::string TmuxTest::screen() const {
@@ -56,6 +68,7 @@ void TmuxTest::awaitThat(const std::function<bool(const std::string&)>& holds,
 }
 
 void TmuxTest::await(const std::string& text) const {
+  if (text.empty()) return;
   awaitThat([&](const std::string& seen) { return seen.find(text) != std::string::npos; },
             "\"" + text + "\" on the screen");
 }

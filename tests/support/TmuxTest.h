@@ -1,28 +1,31 @@
 #pragma once
 
-#include <gtest/gtest.h>
-
 #include <functional>
 #include <string>
 #include <vector>
 
 #include "tests/support/Programs.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 namespace testsupport {
 
 // A test of programs in a real terminal, which tmux provides. The home directory is `directory`.
-class TmuxTest : public testing::Test {
+class TmuxTest : public ShellTest {
  protected:
   void TearDown() override { tmux("kill-server"); }
 
   // Starts `command` in a terminal of this size.
   void start(const std::string& command, int columns, int rows) const;
+  // Starts bash in it.
+  void startShell(int columns, int rows) const;
   // The output of a tmux command; the terminal is called t.
   std::string tmux(const std::string& arguments) const;
 
-  void type(const std::string& text) const;  // without single quotes
-  void press(const std::string& keys) const;
+  // Type a text (without single quotes), press keys, or type a line and press Enter. What is shown
+  // after that, if given, is waited for.
+  void type(const std::string& text, const std::string& shown = "") const;
+  void press(const std::string& keys, const std::string& shown = "") const;
+  void enter(const std::string& line, const std::string& shown = "") const;
   [[nodiscard]] std::string screen() const;
   [[nodiscard]] std::vector<std::string> lines() const;
 
@@ -32,8 +35,7 @@ class TmuxTest : public testing::Test {
   void await(const std::string& text) const;
   void awaitGone(const std::string& text) const;
 
-  const TemporaryDirectory directory;
-  std::string variables;  // environment variables of the programs, NAME=VALUE
+  std::string variables;  // environment variables of the programs in the terminal, NAME=VALUE
 };
 
 }  // namespace testsupport

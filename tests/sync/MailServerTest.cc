@@ -7,7 +7,6 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr const char* kServer = "/usr/lib/dovecot/imap";
-constexpr size_t kMaxFileBytes = size_t{1} << 20;
 constexpr const char* kCopier = "/usr/bin/mbsync";
 constexpr int kFolders = 20;
 constexpr int kMails = 500;
@@ -40,30 +39,22 @@ class MailServerTest : public testsupport::WatchProcessTest {
       }
     }
   }
-  void write(const std::string& name, const std::string& text) const {
-    std::ofstream(directory / name) << text;
-  }
-  [[nodiscard]] std::string textOf(const std::string& name) const {
-    return platform::readFile(directory / name, kMaxFileBytes, nullptr).value_or("");
-  }
   [[nodiscard]] std::string serverCommand() const {
     return fmt::format("{0} -c {1}/server.conf 2>>{1}/server.log", kServer, directory.path());
   }
-  void run(const std::string& command) const {
-    const std::string whole = fmt::format(
-        "cd {0} && env -i HOME={0} USER=mara PATH=/usr/bin:/bin:/usr/sbin {1} >>{0}/run.log 2>&1",
-        directory.path(), command);
-    EXPECT_EQ(std::system(whole.c_str()), 0) << textOf("run.log") << textOf("server.log");
+  void runAsUser(const std::string& command) {
+    outputOfShell(fmt::format("env -i HOME={} USER=mara PATH=/usr/bin:/bin:/usr/sbin {}",
+                              directory.path(), command));
+    if (HasFailure()) ADD_FAILURE() << read("server.log");
   }
   // Runs the commands of one session, one per line.
-  void serve(const std::vector<std::string>& commands) const {
+  void serve(const std::vector<std::string>& commands) {
     std::string session;
     for (const std::string& command : commands) session += "x " + command + "\r\n";
     write("session", session + "x LOGOUT\r\n");
-    run(fmt::format("sh -c 'cat session | {} > answers'", serverCommand()));
-    const std::string answers = textOf("answers");
-    EXPECT_EQ(answers.find("\nx NO"), std::string::npos) << answers;
-    EXPECT_EQ(answers.find("\nx BAD"), std::string::npos) << answers;
+    runAsUser(fmt::format("sh -c 'cat session | {}'", serverCommand()));
+    EXPECT_EQ(output.find("\nx NO"), std::string::npos) << output;
+    EXPECT_EQ(output.find("\nx BAD"), std::string::npos) << output;
   }
   static std::string append(int folder, int number) {
     const std::string text = fmt::format(
@@ -74,9 +65,8 @@ class MailServerTest : public testsupport::WatchProcessTest {
   }
   // The number of indexed messages, once the index matches the copied mail.
   size_t copied() {
-    run(fmt::format("{} -c copier.conf -a", kCopier));
-    waitUntilInStep();
-    return indexed().size();
+    runAsUser(fmt::format("{} -c copier.conf -a", kCopier));
+    return waitUntilInStep();
   }
 };
 

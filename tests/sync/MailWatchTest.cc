@@ -1,21 +1,12 @@
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include <algorithm>
-#include <filesystem>
-#include <fstream>
 
 #include "sync/DirectoryWatch.h"
 #include "sync/MailWatch.h"
-#include "tests/support/TemporaryDirectory.h"
-#include "tests/sync/StoringDaemon.h"
+#include "tests/sync/MailSyncTest.h"
 
-namespace fs = std::filesystem;
 using mailsync::Change;
 using std::chrono::minutes;
 using testing::Contains;
-using testing::ElementsAre;
-using testing::HasSubstr;
 
 namespace {
 
@@ -39,32 +30,19 @@ class ScriptedSource : public mailsync::ChangeSource {
   std::vector<Change> changes;
 };
 
-class MailWatchTest : public testing::Test {
+class MailWatchTest : public MailboxTest {
  protected:
-  MailWatchTest() {
-    makeFolder("a");
-    makeFolder("b");
-  }
-  void makeFolder(const std::string& folder) const {
-    for (const char* sub : {"cur", "new"}) fs::create_directories(mail + '/' + folder + '/' + sub);
-  }
-  void add(const std::string& path) const {
-    std::ofstream(mail + '/' + path) << "Subject: " << path << "\n\nText\n";
-  }
+  void add(const std::string& path) const { put(path, "Subject: " + path + "\n\nText\n"); }
   void setPower(bool online) const {
     for (const auto& [supply, attribute, value] :
          {std::tuple("AC", "type", "Mains"), std::tuple("AC", "online", online ? "1" : "0"),
           std::tuple("BAT0", "type", "Battery"),
           std::tuple("BAT0", "status", online ? "Full" : "Unknown")}) {
-      fs::create_directories(directory / "power/" + supply);
-      std::ofstream(directory / "power/" + supply + '/' + attribute) << value << '\n';
+      directory.write(fmt::format("power/{}/{}", supply, attribute), std::string(value) + '\n');
     }
   }
   void start(const std::string& root) {
-    settings.sync.runtimeDirectory = daemon.runtimeDirectory();
-    settings.sync.protectionClass = "default";
-    settings.sync.name = "tallow";
-    settings.sync.catalogueDirectory = directory / "state";
+    settings.sync = syncSettings();
     settings.roots = {root};
     settings.powerDirectory = directory / "power";
     auto scripted = std::make_unique<ScriptedSource>();
@@ -79,22 +57,22 @@ class MailWatchTest : public testing::Test {
     ASSERT_TRUE(watch);
     watch->turn(now);
   }
-  // Advances the time and runs a round that is due.
-  void pass(std::chrono::milliseconds time) {
+  // Advances the time and runs a round that is due. Returns the number of messages indexed then.
+  size_t pass(std::chrono::milliseconds time) {
     now = std::max(now, mailsync::RescanPlan::Clock::now()) + time;
     entered = 0;
     watch->turn(now);
+    return indexed();
   }
-  void tell(const std::string& place, const std::string& name) {
-    source->changes.push_back({Change::Kind::entry, place, name, false});
+  // The same with a change that is reported, and long enough for its round.
+  size_t tell(const std::string& place, const std::string& name, bool isDirectory = false,
+              Change::Kind kind = Change::Kind::entry) {
+    source->changes.push_back({kind, place, name, isDirectory});
     pass(std::chrono::seconds(1));
-    pass(std::chrono::seconds(1));
+    return pass(std::chrono::seconds(1));
   }
   [[nodiscard]] size_t indexed() const { return daemon.content().items.size(); }
 
-  testsupport::TemporaryDirectory directory;
-  const std::string mail = directory / "mail";
-  testsupport::StoringDaemon daemon;
   ScriptedSource* source = nullptr;
   mailsync::WatchSettings settings;
   std::set<std::string> refused;
@@ -112,32 +90,22 @@ TEST_F(MailWatchTest, ScansOnlyChangedDirectories) {
   EXPECT_THAT(source->watched, Contains(directory.path()));
   add("a/new/1");
   add("b/new/2");
-  tell(mail + "/a/new", "1");
-  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(tell(mail + "/a/new", "1"), 1U);
   EXPECT_EQ(entered, 1U);
   // Files that programs keep next to mail start no round; a folder with such a name does.
   makeFolder("dovecot");
   add("dovecot/new/3.lock");
-  tell(mail, "dovecot-uidlist.lock");
-  EXPECT_EQ(indexed(), 1U);
-  source->changes.push_back({Change::Kind::entry, mail, "dovecot", true});
-  pass(std::chrono::seconds(1));
-  pass(std::chrono::seconds(1));
-  EXPECT_EQ(indexed(), 2U);
+  EXPECT_EQ(tell(mail, "dovecot-uidlist.lock"), 1U);
+  EXPECT_EQ(tell(mail, "dovecot", true), 2U);
   fs::remove(mail + "/dovecot/new/3.lock");
-  tell(mail + "/dovecot/new", "3.lock");
-  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(tell(mail + "/dovecot/new", "3.lock"), 1U);
   // A new folder, created from the inside out.
   makeFolder("b/c");
   add("b/c/cur/3:2,S");
   source->changes.push_back({Change::Kind::entry, mail + "/b/c", "cur", true});
-  tell(mail + "/b", "c");
-  EXPECT_EQ(indexed(), 2U);
+  EXPECT_EQ(tell(mail + "/b", "c"), 2U);
   EXPECT_THAT(source->watched, Contains(mail + "/b/c/cur"));
-  source->changes.push_back({Change::Kind::lost, "", "", false});
-  pass(std::chrono::seconds(1));
-  pass(std::chrono::seconds(1));
-  EXPECT_EQ(indexed(), 3U);
+  EXPECT_EQ(tell("", "", false, Change::Kind::lost), 3U);
 }
 
 TEST_F(MailWatchTest, ScansUnwatchableDirectoriesAtIntervals) {
@@ -145,10 +113,8 @@ TEST_F(MailWatchTest, ScansUnwatchableDirectoriesAtIntervals) {
   start(mail);
   EXPECT_THAT(said, ElementsAre(HasSubstr("cannot be watched")));
   add("a/new/1");
-  pass(std::chrono::seconds(60));
-  EXPECT_EQ(indexed(), 0U);
-  pass(minutes(2));
-  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(pass(std::chrono::seconds(60)), 0U);
+  EXPECT_EQ(pass(minutes(2)), 1U);
   EXPECT_EQ(said.size(), 1U);
 }
 
@@ -160,17 +126,14 @@ TEST_F(MailWatchTest, RootsMayAppearAndDisappear) {
   EXPECT_THAT(source->watched, Contains(directory / "later"));
   fs::rename(mail, root);
   std::ofstream(root + "/a/new/1") << "Subject: one\n\nText\n";
-  tell(directory / "later", "mail");
-  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(tell(directory / "later", "mail"), 1U);
   EXPECT_THAT(source->watched, Contains(root + "/a/new"));
   fs::rename(root, mail);
-  tell(directory / "later", "mail");
-  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(tell(directory / "later", "mail"), 1U);
   EXPECT_THAT(said, Contains(HasSubstr("is not there")));
   add("b/new/2");
   fs::rename(mail, root);
-  pass(minutes(5));
-  EXPECT_EQ(indexed(), 2U);
+  EXPECT_EQ(pass(minutes(5)), 2U);
 }
 
 TEST_F(MailWatchTest, ALargeBacklogWaitsForPowerAndNewMailDoesNot) {
@@ -183,14 +146,11 @@ TEST_F(MailWatchTest, ALargeBacklogWaitsForPowerAndNewMailDoesNot) {
   EXPECT_EQ(indexed(), 0U);
   EXPECT_THAT(said, ElementsAre(HasSubstr("501 messages wait for power")));
   add("b/new/1");
-  tell(mail + "/b/new", "1");
-  EXPECT_EQ(indexed(), 1U);
-  pass(minutes(2));
-  EXPECT_EQ(indexed(), 1U);
+  EXPECT_EQ(tell(mail + "/b/new", "1"), 1U);
+  EXPECT_EQ(pass(minutes(2)), 1U);
   setPower(true);
   pass(minutes(2));
-  pass(std::chrono::seconds(1));
-  EXPECT_EQ(indexed(), many + 1);
+  EXPECT_EQ(pass(std::chrono::seconds(1)), many + 1);
   EXPECT_EQ(said.size(), 2U);
 }
 
@@ -209,18 +169,15 @@ TEST_F(MailWatchTest, RoundStopsForPowerWithALargeBacklog) {
   pass(std::chrono::seconds(1));
   EXPECT_THAT(said, ElementsAre(HasSubstr(std::to_string(many - sent) + " messages wait")));
   add("b/new/1");
-  tell(mail + "/b/new", "1");
-  EXPECT_EQ(indexed(), sent + 1);
+  EXPECT_EQ(tell(mail + "/b/new", "1"), sent + 1);
   setPower(true);
   pass(minutes(2));
-  pass(std::chrono::seconds(1));
-  EXPECT_EQ(indexed(), many + 1);
+  EXPECT_EQ(pass(std::chrono::seconds(1)), many + 1);
   EXPECT_EQ(daemon.received(), many + 1);
   // New mail within the limit is sent completely.
   for (size_t i = 0; i < limit; ++i) add("b/cur/more" + std::to_string(i) + ":2,");
   daemon.whenReceived(many + 2, [this] { setPower(false); });
-  tell(mail + "/b/cur", "more0:2,");
-  EXPECT_EQ(indexed(), many + 1 + limit);
+  EXPECT_EQ(tell(mail + "/b/cur", "more0:2,"), many + 1 + limit);
 }
 
 TEST_F(MailWatchTest, RefusesASecondWatchOfTheClass) {

@@ -15,6 +15,10 @@ const TLError kUnknownIdentifier{"DocStore", 12, "not found"};
 const TLError kItemRefused{"TALIndexer", 1, "index failed"};
 const TLError kBroken{"Test", 5, "the call failed"};
 
+std::vector<std::string> copiesOf(const std::vector<std::string_view>& texts) {
+  return {texts.begin(), texts.end()};
+}
+
 }  // namespace
 
 StoringDaemon::StoringDaemon() {
@@ -24,16 +28,12 @@ StoringDaemon::StoringDaemon() {
     _interface.methods.push_back({member, input, output, std::vector<const char*>(), handler});
   };
   add("DeleteItemsWithIdentifiers", "asss", "", [this](rpc::Arguments& arguments, Reply reply) {
-    std::vector<std::string> identifiers;
-    for (const auto text : arguments.readStringArray()) identifiers.emplace_back(text);
-    change(identifiers, {}, std::nullopt, *reply);
+    change(copiesOf(arguments.readStringArray()), {}, std::nullopt, *reply);
   });
   add("IndexItemsDeleteItemsWithIdentifiers", "aayasbayss", "",
       [this](rpc::Arguments& arguments, Reply reply) {
-        std::vector<std::string> items;
-        for (const auto bytes : arguments.readBytesArray()) items.emplace_back(bytes);
-        std::vector<std::string> identifiers;
-        for (const auto text : arguments.readStringArray()) identifiers.emplace_back(text);
+        const auto items = copiesOf(arguments.readBytesArray());
+        const auto identifiers = copiesOf(arguments.readStringArray());
         const bool given = arguments.readBoolean();
         std::optional<std::string> state = std::string(arguments.readBytes());
         if (!given) state.reset();

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <fmt/format.h>
-#include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/inotify.h>
 #include <unistd.h>
@@ -22,12 +21,12 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/support/Process.h"
 #include "tests/support/Programs.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ShellTest.h"
 
 namespace testsupport {
 
 // `tallow watch` as its own process, with a daemon and a mailbox of the test.
-class WatchProcessTest : public testing::Test {
+class WatchProcessTest : public ShellTest {
  protected:
   WatchProcessTest() {
     makeFolder("a");
@@ -51,11 +50,7 @@ class WatchProcessTest : public testing::Test {
     TL_ASSERT(inotify_add_watch(logChanges.get(), logPath.c_str(), IN_MODIFY) >= 0);
   }
 
-  void makeFolder(const std::string& folder) const {
-    for (const char* sub : {"cur", "new", "tmp"}) {
-      std::filesystem::create_directories(mail + '/' + folder + '/' + sub);
-    }
-  }
+  void makeFolder(const std::string& folder) const { directory.makeMaildir("mail/" + folder); }
   // Delivers as a delivery agent does.
   void deliver(const std::string& folder, const std::string& name) const {
     const std::string base = mail + '/' + folder;
@@ -87,18 +82,19 @@ class WatchProcessTest : public testing::Test {
       pollfd changes{logChanges.get(), POLLIN, 0};
       poll(&changes, 1, -1);
       std::array<char, 4096> events;
-      while (read(logChanges.get(), events.data(), events.size()) > 0) {
+      while (::read(logChanges.get(), events.data(), events.size()) > 0) {
       }
     }
   }
-  void waitUntilInStep() const {
+  // Waits until what is indexed is what is on the disk, and returns the number of messages.
+  size_t waitUntilInStep() const {
     waitUntil([this] { return indexed() == onDisk(); });
+    return indexed().size();
   }
   void waitUntilSaid(const std::string& text) const {
     waitUntil([&] { return watch->log().find(text) != std::string::npos; });
   }
 
-  TemporaryDirectory directory;
   const std::string mail = directory / "mail";
   const std::string logPath = directory / "watch.log";
   const platform::FileDescriptor logChanges{inotify_init1(IN_CLOEXEC | IN_NONBLOCK)};

@@ -18,16 +18,14 @@ TEST_F(WatchProcessTest, FollowsMailAndFolders) {
   deliver("\xe9t\xe9", "4");
   waitUntilInStep();
   fs::remove(mail + "/b/cur/1:2,FS");
-  waitUntilInStep();
-  EXPECT_EQ(indexed().size(), 3U);
+  EXPECT_EQ(waitUntilInStep(), 3U);
   // A folder that disappears and comes back.
   fs::rename(mail + "/a", directory / "elsewhere");
   waitUntilSaid("is not there");
   EXPECT_EQ(indexed().size(), 3U);
   fs::rename(directory / "elsewhere", mail + "/a");
   deliver("a", "5");
-  waitUntilInStep();
-  EXPECT_EQ(indexed().size(), 4U);
+  EXPECT_EQ(waitUntilInStep(), 4U);
   EXPECT_EQ(watch->end(SIGTERM), 0);
 }
 
@@ -44,8 +42,7 @@ TEST_F(WatchProcessTest, FindsChangesThatTheKernelDropped) {
   }
   deliver("b", "3");
   watch->signal(SIGCONT);
-  waitUntilInStep();
-  EXPECT_EQ(indexed().size(), 2U);
+  EXPECT_EQ(waitUntilInStep(), 2U);
 }
 
 TEST_F(WatchProcessTest, AThousandRenamesWhileTheDaemonRestarts) {
@@ -59,7 +56,6 @@ TEST_F(WatchProcessTest, AThousandRenamesWhileTheDaemonRestarts) {
   }
   waitUntilSaid("tried again");
   startDaemon();
-  waitUntilInStep();
-  EXPECT_EQ(indexed().size(), static_cast<size_t>(kMany));
+  EXPECT_EQ(waitUntilInStep(), static_cast<size_t>(kMany));
   EXPECT_EQ(watch->end(SIGINT), 0);
 }
