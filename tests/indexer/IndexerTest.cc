@@ -203,7 +203,7 @@ TEST_F(IndexerTest, AZoneTooLargeFailsTheRestOfTheBatchAndSendingAgainRepairsIt)
   EXPECT_EQ(search("word"), "c a");
 }
 
-TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccess) {
+TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccessAndRemovedWithTheMail) {
   const auto combined = [&](TALIndexer::Items items, TALIndexer::Strings gone,
                             std::optional<std::string> state) {
     return outcomeOf([&](auto done) {
@@ -227,13 +227,8 @@ TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccess) {
   EXPECT_EQ(combined({mail("b", "word")}, {u"a"}, std::nullopt), std::nullopt);
   EXPECT_EQ(search("word"), "b");
   EXPECT_EQ(fetch(u"client"), std::string("one\0two", 7));
-  EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
+  EXPECT_EQ(reset(), std::nullopt);
   EXPECT_EQ(fetch(u"client"), std::nullopt);
-}
-
-TEST_F(IndexerTest, AResetRemovesEverythingAndIndexingContinues) {
-  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
-  EXPECT_EQ(outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); }), std::nullopt);
   EXPECT_EQ(search("word"), "");
   ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
   EXPECT_EQ(search("word"), "b");
@@ -394,9 +389,7 @@ TEST_F(IndexerTest, SearchesAndStatisticsRunDuringIngest) {
     ASSERT_EQ(add(items), std::nullopt);
     ASSERT_EQ(remove({u"0", u"5"}), std::nullopt);
     if (round == 10) {
-      ASSERT_EQ(
-          outcomeOf([&](auto completion) { indexer->resetWithCompletionHandler(completion); }),
-          std::nullopt);
+      ASSERT_EQ(reset(), std::nullopt);
     }
   }
   done = true;
