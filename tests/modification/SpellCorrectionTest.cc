@@ -7,27 +7,17 @@
 #include "docstore/TALSqliteDocStore.h"
 #include "modification/TALSpellCorrection.h"
 #include "modification/WeightedDistance.h"
+#include "tests/modification/ModificationSupport.h"
 #include "tests/salt/SaltSupport.h"
-#include "tests/support/LogCapture.h"
-#include "tests/support/TemporaryDirectory.h"
 
 using saltsearch::Term;
 using salttest::addZone;
 using testing::ElementsAre;
+using testsupport::word;
 
 namespace {
 
 constexpr uint16_t kZone = 13;
-
-Term word(const std::string& token) {
-  Term term;
-  term.tokens = {token};
-  term.tokenScores = {0.5};
-  term.zones = {kZone};
-  term.zoneScores = {0.5};
-  term.isUnigram = true;
-  return term;
-}
 
 std::vector<std::string> tokens(const std::vector<TALCorrectionCandidate>& candidates) {
   std::vector<std::string> result;
@@ -35,9 +25,9 @@ std::vector<std::string> tokens(const std::vector<TALCorrectionCandidate>& candi
   return result;
 }
 
-class SpellCorrectionTest : public testing::Test {
+class SpellCorrectionTest : public testing::Test, protected testsupport::Corpus {
  protected:
-  SpellCorrectionTest() {
+  SpellCorrectionTest() : Corpus({}) {
     EXPECT_TRUE(store->openWithError(nullptr));
     vocab = std::make_shared<TALTopKVocab>(store, index.get());
     spelling = std::make_unique<TALSpellCorrection>(vocab);
@@ -46,28 +36,22 @@ class SpellCorrectionTest : public testing::Test {
   // Searches, so that `found` is set, and corrects. Returns the first tokens of the terms, "-" if
   // nothing changed.
   std::string correct(std::vector<Term> terms) {
-    static_cast<void>(saltsearch::Search(*index, terms, {1000, 1000000, 0.02}));
     std::vector<Term> corrected;
-    score = spelling->correctSpelling(terms, corrected, *index);
+    score = spelling->correctSpelling(searched(std::move(terms)), corrected, *index);
     if (score <= 0) {
       EXPECT_EQ(score, -1);
       EXPECT_TRUE(corrected.empty());
       return "-";
     }
-    std::string result;
-    for (const Term& term : corrected) result += term.tokens[0] + '|';
-    return result;
+    return testsupport::tokensOf(corrected);
   }
 
   void add(uint32_t docID, const std::string& text, uint16_t zone = kZone) {
     ASSERT_TRUE(addZone(*index, docID, zone, text, salttest::wordOffsets(text)));
   }
 
-  const testsupport::TemporaryDirectory directory;
-  const testsupport::LogCapture log;
   const std::shared_ptr<TALSqliteDocStore> store =
       std::make_shared<TALSqliteDocStore>(directory / "docs.db");
-  const std::unique_ptr<salt::Index> index = salttest::newIndex(directory / "i");
   std::shared_ptr<TALTopKVocab> vocab;
   std::unique_ptr<TALSpellCorrection> spelling;
   float score = 0;
@@ -172,17 +156,17 @@ TEST_F(SpellCorrectionTest, FindsTheRightWordAfterEachKindOfMistake) {
   add(1, "quarterly invoice attached ");
   add(2, "lunch ");
   for (const char* typed : {"invoise ", "invoce ", "invvoice ", "invocie ", "nvoice ", "invoic "}) {
-    EXPECT_EQ(correct({word("quarterly "), word(typed)}), "quarterly |invoice |") << typed;
+    EXPECT_EQ(correct({word("quarterly "), word(typed)}), "[quarterly ][invoice ]") << typed;
   }
   // A prefix is corrected to a prefix.
-  EXPECT_EQ(correct({word("quarterly "), word("invxi")}), "quarterly |invoi|");
+  EXPECT_EQ(correct({word("quarterly "), word("invxi")}), "[quarterly ][invoi]");
   EXPECT_TRUE(
       log.has("default TALSpellCorrection: No match token <\"in...\"<8 chars>> is "
               "considered for spelling correction."));
   EXPECT_TRUE(log.has("default TALSpellCorrection: Found 1 candidates in lexicon."));
   EXPECT_TRUE(
       log.has("default TALSpellCorrection: Spelling returns best candidate with overall "
-              "score: 0.925000, error score: 0.800000, text score: 0.125000. Term "
+              "score: 1.610000, error score: 0.800000, text score: 0.810000. Term "
               "<\"in...\"<8 chars>> modified with candidate <\"in...\"<8 chars>>."));
 }
 
@@ -190,9 +174,9 @@ TEST_F(SpellCorrectionTest, ChangesOneTokenAndItsScore) {
   add(1, "invoice ");
   std::vector<Term> terms{word("invoise ")};
   terms[0].tokens.push_back("other ");
-  terms[0].tokenScores.push_back(0.25);
+  terms[0].tokenScores = {0.5, 0.25};
   std::vector<Term> corrected;
-  EXPECT_FLOAT_EQ(spelling->correctSpelling(terms, corrected, *index), 0.8F + 0.5F);
+  EXPECT_FLOAT_EQ(spelling->correctSpelling(terms, corrected, *index), 0.8F + 0.9F);
   ASSERT_EQ(corrected.size(), 1U);
   EXPECT_THAT(corrected[0].tokens, ElementsAre("invoice ", "other "));
   EXPECT_THAT(corrected[0].tokenScores, ElementsAre(1.0, 0.25));
@@ -204,9 +188,9 @@ TEST_F(SpellCorrectionTest, CandidatesAreScoredByTheWholeQueryAndTheFirstWinsTie
   add(1, "cart red ");
   add(2, "cast blue ");
   add(3, "carp red ");
-  EXPECT_EQ(correct({word("cazt "), word("blue ")}), "cast |blue |");
+  EXPECT_EQ(correct({word("cazt "), word("blue ")}), "[cast ][blue ]");
   // Both replace the third letter.
-  EXPECT_EQ(correct({word("caqt ")}), "cart |");
+  EXPECT_EQ(correct({word("caqt ")}), "[cart ]");
   // No document contains both a candidate and the other word.
   EXPECT_EQ(correct({word("cazt "), word("green ")}), "-");
   EXPECT_TRUE(
@@ -241,7 +225,7 @@ TEST_F(SpellCorrectionTest, CandidatesMustBeInTheTermsZonesAndWithinTheBudget) {
 TEST_F(SpellCorrectionTest, UsesFrequentWordsWhereNoEditFits) {
   add(1, "international ");
   vocab->setVocab({"in ", "international ", "internationalisation", "internatioal", "intern "});
-  EXPECT_EQ(correct({word("interantionel ")}), "international |");
+  EXPECT_EQ(correct({word("interantionel ")}), "[international ]");
   EXPECT_TRUE(
       log.has("default TALSpellCorrection: Spelling did not find any candidate from edit "
               "distance 1. Continue with topK method."));
@@ -255,7 +239,7 @@ TEST_F(SpellCorrectionTest, UsesFrequentWordsWhereNoEditFits) {
 
   vocab->setVocab({"na\xC3\xAFvet\xC3\xA9 "});
   add(2, "na\xC3\xAFvet\xC3\xA9 ");
-  EXPECT_EQ(correct({word("na\xC3\xAFvetx\xC3\xA9 ")}), "na\xC3\xAFvet\xC3\xA9 |");
+  EXPECT_EQ(correct({word("na\xC3\xAFvetx\xC3\xA9 ")}), "[na\xC3\xAFvet\xC3\xA9 ]");
   EXPECT_TRUE(log.has("debug TALSpellCorrection: Token has unsupported char."));
   EXPECT_EQ(correct({word("\xF0\x9F\x98\x80\xF0\x9F\x98\x80 ")}), "-");
 }
@@ -264,10 +248,7 @@ TEST_F(SpellCorrectionTest, HandlesAThousandWords) {
   add(1, "word ");
   std::vector<Term> terms(1000, word("word "));
   terms[500] = word("wrd ");
-  for (Term& term : terms) {
-    term.tokenScores = {1};
-    term.zoneScores = {1};
-  }
+  for (Term& term : terms) term.zoneScores = {1, 1};
   EXPECT_NE(correct(terms), "-");
   terms[501] = word("wrd ");
   EXPECT_EQ(correct(terms), "-");

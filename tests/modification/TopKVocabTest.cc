@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 #include <sqlite3.h>
 
-#include <future>
 #include <latch>
 #include <random>
 
@@ -24,17 +23,21 @@ using testsupport::Outcome;
 using testsupport::outcomeOf;
 using Words = TALTopKVocab::Words;
 
-// An index of a hundred zones that calls a function for each zone iterated over.
+// An index of a hundred zones that counts the zones iterated over, and can wait at the first one.
 class WatchedIndex final : public salt::Index {
  public:
-  std::function<void()> atZone = [] {};
   mutable std::atomic<int> zones = 0;
+  bool waitsAtFirst = false;
+  mutable std::latch reached{1};
+  mutable std::latch goesOn{1};
 
   void ForEachZone(
       std::function<bool(uint32_t, uint16_t, std::string_view)> callback) const override {
     for (uint32_t docID = 1; docID <= 100; ++docID) {
-      ++zones;
-      atZone();
+      if (++zones == 1 && waitsAtFirst) {
+        reached.count_down();
+        goesOn.wait();
+      }
       if (!callback(docID, 1, "word ")) return;
     }
   }
@@ -152,19 +155,15 @@ TEST_F(TopKVocabTest, CountsStoresAndSurvivesARestart) {
     vocab.setMaxDocID(200);
     EXPECT_THAT(*vocab.vocab(), ElementsAre("b ", "a ", "b", "c\xF0\x9F\x98\x80 "));
     const auto lines = log.lines();
-    const auto at = [&lines](const std::string& line) {
-      return std::find_if(lines.begin(), lines.end(),
-                          [&](const auto& l) { return l.find(line) != std::string::npos; }) -
-             lines.begin();
-    };
-    const std::vector<ptrdiff_t> order{at("Starting to rebuild topK vocab from SALT."),
-                                       at("Rebuild date: 20"),
-                                       at("Rebuild docID: 77."),
-                                       at("TopK vocab has 4 tokens."),
-                                       at("TopK vocab rebuild is done."),
-                                       at("Rebuilt topK vocab saved to docstore.")};
-    EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
-    EXPECT_LT(order.back(), std::ssize(lines));
+    auto at = lines.begin();
+    for (const char* text :
+         {"Starting to rebuild topK vocab from SALT.", "Rebuild date: 20", "Rebuild docID: 77.",
+          "TopK vocab has 4 tokens.", "TopK vocab rebuild is done.",
+          "Rebuilt topK vocab saved to docstore."}) {
+      at = std::find_if(at, lines.end(),
+                        [&](const auto& l) { return l.find(text) != std::string::npos; });
+      EXPECT_NE(at, lines.end()) << text;
+    }
   }
   const TALTopKVocab again(store, index.get());
   EXPECT_THAT(*again.vocab(), ElementsAre("b ", "a ", "b", "c\xF0\x9F\x98\x80 "));
@@ -274,28 +273,21 @@ TEST_F(TopKVocabTest, ARequestedRebuildAndShutdownEndTheRestOfARoutineOne) {
 
 TEST_F(TopKVocabTest, ShutdownEndsTheRunningCountAndWaitingRebuilds) {
   auto watched = std::make_unique<WatchedIndex>();
-  std::latch counting(1);
-  std::latch shuttingDown(1);
-  watched->atZone = [&, first = true]() mutable {
-    if (std::exchange(first, false)) {
-      counting.count_down();
-      shuttingDown.wait();
-    }
-  };
+  watched->waitsAtFirst = true;
   TALTopKVocab vocab(store, watched.get());
   vocab.setVocab({"old"});
   std::vector<Outcome> outcomes;
   const auto keep = [&outcomes](const Outcome& outcome) { outcomes.push_back(outcome); };
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
-  counting.wait();
+  watched->reached.wait();
   vocab.setMaxDocID(2001);
   for (int batch = 0; batch < 3; ++batch) {
     vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   }
   std::thread ending([&] { vocab.shutdown(); });
   while (!vocab.isShutdown()) std::this_thread::yield();
-  shuttingDown.count_down();
+  watched->goesOn.count_down();
   ending.join();
   EXPECT_EQ(watched->zones, 2);  // one per pass
   watched.reset();
@@ -312,24 +304,17 @@ TEST_F(TopKVocabTest, ShutdownEndsTheRunningCountAndWaitingRebuilds) {
 }
 
 TEST_F(TopKVocabTest, ARequestedRebuildEndsARoutineCount) {
-  auto watched = std::make_unique<WatchedIndex>();
-  std::latch counting(1);
-  std::latch asked(1);
-  watched->atZone = [&, first = true]() mutable {
-    if (std::exchange(first, false)) {
-      counting.count_down();
-      asked.wait();
-    }
-  };
-  TALTopKVocab vocab(store, watched.get());
+  WatchedIndex watched;
+  watched.waitsAtFirst = true;
+  TALTopKVocab vocab(store, &watched);
   vocab.setMaxDocID(2001);
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
-  counting.wait();
-  std::promise<Outcome> done;
-  vocab.checkAndRebuildTopKVocabWithCompletionHandler(
-      [&done](const Outcome& outcome) { done.set_value(outcome); }, true);
-  asked.count_down();
-  EXPECT_EQ(done.get_future().get(), std::nullopt);
+  watched.reached.wait();
+  EXPECT_EQ(outcomeOf([&](auto done) {
+              vocab.checkAndRebuildTopKVocabWithCompletionHandler(done, true);
+              watched.goesOn.count_down();
+            }),
+            std::nullopt);
   EXPECT_EQ(log.count("Starting to rebuild topK vocab from SALT."), 2U);
   EXPECT_EQ(log.count("TopK vocab rebuild is done."), 1U);
   vocab.shutdown();
