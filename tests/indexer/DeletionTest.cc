@@ -7,16 +7,6 @@ using testsupport::mail;
 using testsupport::Outcome;
 using testsupport::outcomeOf;
 
-TEST_F(IndexerTest, DeletedDocumentsStayGoneAcrossARestart) {
-  ASSERT_EQ(add({mail("a", "word"), mail("b", "word"), mail("c", "word")}), std::nullopt);
-  EXPECT_EQ(remove({u"b"}), std::nullopt);
-  EXPECT_EQ(search("word"), "c a");
-  reopen();
-  EXPECT_EQ(search("word"), "c a");
-  ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
-  EXPECT_EQ(search("word"), "c b a");
-}
-
 TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
   TALIndexer::Items items{mail("b", "word")};
   TALIndexer::Strings identifiers;

@@ -124,14 +124,6 @@ TEST_F(SynonymFile, LoadsWithAnyContents) {
   EXPECT_TRUE(load(std::string(5, '\0')));
 }
 
-TEST_F(SynonymFile, GivesEachSynonymItsScore) {
-  EXPECT_TRUE(model.getSynonymsScores("car").empty());
-  ASSERT_TRUE(load("car,auto,van,cab"));
-  EXPECT_EQ(model.getSynonymsScores("car"), (std::vector<std::pair<std::string, float>>{
-                                                {"auto", 0.1F}, {"van", 0.1F}, {"cab", 0.1F}}));
-  EXPECT_TRUE(model.getSynonymsScores("Car").empty());
-}
-
 TEST(ShippedSynonyms, AreAllUsableAndPlain) {
   const auto bytes = platform::readFile(TALLOW_SYNONYMS, TALSynonyms::kMaxFileBytes, nullptr);
   ASSERT_TRUE(bytes);
