@@ -248,36 +248,6 @@ TEST(Corruption, InvalidOptionsEndTheProcess) {
   expectDeath(std::string(47, '\0'), "parseRecord\\(bytes, &op\\)");
 }
 
-// Valid but unusual options do no harm.
-TEST(Corruption, UnusualOptionsWork) {
-  const std::function<void(Index::Options&)> edits[] = {
-      [](auto& op) { op.MinMatchLen = op.MaxMatchLen = 0; },
-      [](auto& op) { op.MaxMatchLen = 255; },
-      [](auto& op) { op.MaxPageSuffixes = 0; },
-      [](auto& op) { op.MaxPageSuffixes = 1; },
-      [](auto& op) { op.MaxShardSuffixes = 0; },
-      [](auto& op) { op.MaxShards = UINT32_MAX; },
-      [](auto& op) { op.MaxBatchBytes = 0; },
-      [](auto& op) { op.CompactAfterVacuum = true; },
-  };
-  for (const auto& edit : edits) {
-    const testsupport::TemporaryDirectory directory;
-    Index::Options options;
-    options.MaxHotSuffixes = 0;
-    edit(options);
-    auto index = newIndex(directory / "i", options);
-    for (uint32_t docID = 1; docID <= 3; ++docID) {
-      ASSERT_TRUE(addZone(*index, docID, 1, "aa ab ba", {0, 3, 6}));
-      index->Vacuum();
-      index.reset();
-      index = loadIndex(directory / "i");
-      ASSERT_TRUE(index);
-      EXPECT_TRUE(index->Validate());
-      EXPECT_EQ(salttest::scan(*index, "").size(), docID * 3);
-    }
-  }
-}
-
 namespace {
 
 const std::string kPageKey(

@@ -78,13 +78,13 @@ class Generator {
     using Lengths = std::pair<uint8_t, uint8_t>;
     Index::Options op;
     std::tie(op.MinMatchLen, op.MaxMatchLen) =
-        oneOf({Lengths{32, 100}, Lengths{3, 10}, Lengths{0, 255}, Lengths{1, 1}});
+        oneOf({Lengths{32, 100}, Lengths{3, 10}, Lengths{0, 255}, Lengths{1, 1}, Lengths{0, 0}});
     op.MaxZoneSize = oneOf({200u, 200000u});
-    op.MaxPageSuffixes = oneOf({1u, 2u, 3u, 4u, 5u, 50u});
+    op.MaxPageSuffixes = oneOf({0u, 1u, 2u, 3u, 4u, 5u, 50u});
     op.MaxShardSuffixes = oneOf({0u, 1u, 100u, 1000u, 1000000u});
-    op.MaxShards = oneOf({1u, 2u, 16u});
+    op.MaxShards = oneOf({1u, 2u, 16u, UINT32_MAX});
     op.MaxHotSuffixes = oneOf({0u, 1u, 4u, 4u, 100u, 1000000u});
-    op.MaxBatchBytes = oneOf({1u, 1u, 1000u, 1000000u});
+    op.MaxBatchBytes = oneOf({0u, 1u, 1000u, 1000000u});
     op.CompactAfterVacuum = _random() % 8 == 0;
     return op;
   }

@@ -11,48 +11,31 @@
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/PostingSet.h"
+#include "tests/salt/Model.h"
 
 namespace salttest {
 
-namespace {
-
-salt::Index::Metrics storedMetrics(leveldb::DB& db) {
-  std::string bytes;
-  TL_ASSERT(db.Get({}, "\xFFMETRICS", &bytes).ok());
-  std::istringstream stream(bytes);
-  salt::Index::Metrics metrics;
-  TL_ASSERT(metrics.ParseFromIstream(stream));
-  return metrics;
-}
-
-void storeMetrics(leveldb::DB& db, const salt::Index::Metrics& metrics) {
-  std::ostringstream stream;
-  TL_ASSERT(metrics.SerializeToOstream(stream));
-  TL_ASSERT(db.Put({}, "\xFFMETRICS", stream.str()).ok());
-}
-
-}  // namespace
-
 void writePage(const std::string& path, uint8_t shard, const std::string& firstText,
                const std::vector<salt::SuffixMeta>& metas) {
-  salt::Database database = salt::openDatabase(path, salt::OpenMode::existing);
-  salt::Index::Metrics metrics = storedMetrics(*database.db);
   std::string key;
   std::string value;
   salt::suffixKey(shard, firstText, metas.front(), &key);
   salt::pageToValue(metas.data(), metas.size(), &value);
-  TL_ASSERT(database.db->Put({}, key, value).ok());
-  metrics.Shards = std::max<uint64_t>(metrics.Shards, shard);
-  metrics.Pages += 1;
-  metrics.Suffixes += metas.size();
-  storeMetrics(*database.db, metrics);
+  editKey(path, key, &value);
+  editMetrics(path, [&](salt::Index::Metrics& metrics) {
+    metrics.Shards = std::max<uint64_t>(metrics.Shards, shard);
+    metrics.Pages += 1;
+    metrics.Suffixes += metas.size();
+  });
 }
 
 void editMetrics(const std::string& path, const std::function<void(salt::Index::Metrics&)>& edit) {
-  salt::Database database = salt::openDatabase(path, salt::OpenMode::existing);
-  salt::Index::Metrics metrics = storedMetrics(*database.db);
+  salt::Index::Metrics metrics = storedMetrics(readKeys(path));
   edit(metrics);
-  storeMetrics(*database.db, metrics);
+  std::ostringstream stream;
+  TL_ASSERT(metrics.SerializeToOstream(stream));
+  const std::string bytes = stream.str();
+  editKey(path, "\xFFMETRICS", &bytes);
 }
 
 void editKey(const std::string& path, const std::string& key, const std::string* value) {
