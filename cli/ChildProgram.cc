@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <poll.h>
-#include <spawn.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -12,36 +11,13 @@
 #include <csignal>
 
 #include "platform/FileDescriptor.h"
+#include "platform/SpawnPlan.h"
 
 namespace cli {
 
 namespace {
 
 using Clock = std::chrono::steady_clock;
-
-// Starts the program with its output going to `output`. Returns 0 or an errno value.
-int spawn(const std::vector<std::string>& words, int output, pid_t& process) {
-  std::vector<char*> arguments;
-  for (const std::string& word : words) arguments.push_back(const_cast<char*>(word.c_str()));
-  arguments.push_back(nullptr);
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-  posix_spawn_file_actions_adddup2(&actions, output, STDOUT_FILENO);
-  posix_spawn_file_actions_adddup2(&actions, output, STDERR_FILENO);
-  posix_spawnattr_t attributes;
-  posix_spawnattr_init(&attributes);
-  sigset_t usual;
-  sigemptyset(&usual);
-  for (const int signal : {SIGPIPE, SIGINT, SIGTERM}) sigaddset(&usual, signal);
-  posix_spawnattr_setsigdefault(&attributes, &usual);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
-  const int result =
-      posix_spawnp(&process, arguments.front(), &actions, &attributes, arguments.data(), environ);
-  posix_spawnattr_destroy(&attributes);
-  posix_spawn_file_actions_destroy(&actions);
-  return result;
-}
 
 // Adds what can be read now. False at the end of the output.
 bool readSome(int descriptor, std::string& output) {
@@ -89,7 +65,10 @@ ProgramRun runProgram(const std::vector<std::string>& words, std::chrono::millis
   platform::FileDescriptor output(ends[0]);
   platform::FileDescriptor input(ends[1]);
   pid_t process = -1;
-  if (run.status == 0) run.status = spawn(words, input.get(), process);
+  platform::SpawnPlan plan;
+  plan.silence(STDIN_FILENO).pass(input.get(), STDOUT_FILENO).pass(input.get(), STDERR_FILENO);
+  plan.resetSignals({SIGPIPE, SIGINT, SIGTERM});
+  if (run.status == 0) run.status = plan.run(words, process);
   if (run.status != 0) return run;
   input.reset();
   const platform::FileDescriptor ended(static_cast<int>(syscall(SYS_pidfd_open, process, 0)));

@@ -1,6 +1,5 @@
 #include <fcntl.h>
 #include <fmt/format.h>
-#include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -19,6 +18,7 @@
 #include "cli/StateDirectory.h"
 #include "cli/SyncCommand.h"
 #include "platform/FileDescriptor.h"
+#include "platform/SpawnPlan.h"
 
 // Dump, validate and purge. The daemon's text index is read by a separate program, tallow-inspect.
 // These commands run it and clean its output for the terminal.
@@ -54,28 +54,13 @@ class Inspector {
 bool Inspector::start(const char* command, const Options& options) {
   const std::string program = helperProgramPath(kProgram);
   const std::string state = stateDirectory(options);
-  const std::array<const char*, 5> arguments{program.c_str(), command, state.c_str(),
-                                             options.protectionClass.c_str(), nullptr};
   std::array<int, 2> pipe{-1, -1};
   int result = pipe2(pipe.data(), O_CLOEXEC) == 0 ? 0 : errno;
   _output = platform::FileDescriptor(pipe[0]);
   const platform::FileDescriptor input(pipe[1]);
-  if (result == 0) {
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_adddup2(&actions, input.get(), STDOUT_FILENO);
-    posix_spawnattr_t attributes;
-    posix_spawnattr_init(&attributes);
-    sigset_t ending;
-    sigemptyset(&ending);
-    sigaddset(&ending, SIGPIPE);
-    posix_spawnattr_setsigdefault(&attributes, &ending);
-    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
-    result = posix_spawn(&_pid, program.c_str(), &actions, &attributes,
-                         const_cast<char* const*>(arguments.data()), environ);
-    posix_spawnattr_destroy(&attributes);
-    posix_spawn_file_actions_destroy(&actions);
-  }
+  platform::SpawnPlan plan;
+  plan.pass(input.get(), STDOUT_FILENO).resetSignals({SIGPIPE});
+  if (result == 0) result = plan.run({program, command, state, options.protectionClass}, _pid);
   if (result == 0) return true;
   _pid = -1;
   complain(platform::posixError(result, program).message);

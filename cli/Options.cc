@@ -63,7 +63,7 @@ constexpr CommandRow kCommands[] = {
      true},
     {Command::save, "save", "Save a search as @NAME, or list the saved searches", "NAME WORDS",
      false},
-    {Command::mcp, "mcp", "Let a language model search and read the mail of some folders", nullptr,
+    {Command::mcp, "mcp", "Serve search and reading of some folders to another program", nullptr,
      false},
 };
 

@@ -41,7 +41,7 @@ enum class Command {
   save,
   screen,
   setup,
-  mcp  // tools for a language model
+  mcp  // serves search and reading to another program
 };
 enum class OutputFormat { text, json, files, messageIDs };
 enum class SortOrder { relevance, date };

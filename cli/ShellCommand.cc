@@ -1,35 +1,22 @@
 #include "cli/ShellCommand.h"
 
-#include <spawn.h>
 #include <unistd.h>
 
 #include <csignal>
 #include <cstdlib>
 
+#include "platform/SpawnPlan.h"
+
 namespace cli {
 
 int startShell(const std::string& command, const std::vector<std::string>& arguments, int input,
                pid_t& process) {
-  std::vector<const char*> words{"sh", "-c", command.c_str()};
-  if (!arguments.empty()) words.push_back("sh");  // "$0"
-  for (const std::string& argument : arguments) words.push_back(argument.c_str());
-  words.push_back(nullptr);
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
-  posix_spawnattr_t attributes;
-  posix_spawnattr_init(&attributes);
-  sigset_t usual;
-  sigemptyset(&usual);
-  posix_spawnattr_setsigmask(&attributes, &usual);
-  for (const int signal : {SIGPIPE, SIGINT, SIGQUIT, SIGTSTP}) sigaddset(&usual, signal);
-  posix_spawnattr_setsigdefault(&attributes, &usual);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
-  const int result = posix_spawn(&process, "/bin/sh", &actions, &attributes,
-                                 const_cast<char* const*>(words.data()), environ);
-  posix_spawnattr_destroy(&attributes);
-  posix_spawn_file_actions_destroy(&actions);
-  return result;
+  std::vector<std::string> words{"/bin/sh", "-c", command, "sh"};  // the last is "$0"
+  words.insert(words.end(), arguments.begin(), arguments.end());
+  platform::SpawnPlan plan;
+  plan.pass(input, STDIN_FILENO).blockSignals({});
+  plan.resetSignals({SIGPIPE, SIGINT, SIGQUIT, SIGTSTP});
+  return plan.run(words, process);
 }
 
 std::optional<std::string> openingCommand() {

@@ -31,8 +31,8 @@ using TLDocumentIDs = std::unordered_map<TLURL, uint32_t>;
 // Errors have the domain "DocStore" and the code of the SQL engine. Reads return null or 0 both for
 // absent data and on failure, and most do not set the error; writes return false.
 //
-// The indexer does without urlWithID, documentWithURL, vacuumWithError, countWithoutDocBlob,
-// countWithoutHtmlBlob, storePath and retainedAttributes: they are for whoever looks into a store.
+// The indexer does not call urlWithID, documentWithURL, vacuumWithError, countWithoutDocBlob,
+// countWithoutHtmlBlob, storePath and retainedAttributes. They are for tools that inspect a store.
 class TALDocStore {
  public:
   // Called for each document of an enumeration with its running index from 0, its ID and URL, a

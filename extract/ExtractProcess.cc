@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <poll.h>
-#include <spawn.h>
 #include <sys/mman.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
@@ -13,45 +12,21 @@
 #include <csignal>
 #include <cstring>
 
+#include "platform/SpawnPlan.h"
+
 namespace extract {
 
 namespace {
 
-// Descriptors and signals of the program: the socket, no output, and no signal from a terminal,
-// which would take the text from the mail that is in hand.
-class SpawnPlan {
- public:
-  explicit SpawnPlan(int socket) {
-    posix_spawn_file_actions_init(&_actions);
-    posix_spawn_file_actions_adddup2(&_actions, socket, STDIN_FILENO);
-    posix_spawn_file_actions_addopen(&_actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
-    posix_spawn_file_actions_addopen(&_actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
-    posix_spawnattr_init(&_attributes);
-    posix_spawnattr_setflags(&_attributes, POSIX_SPAWN_SETPGROUP | POSIX_SPAWN_SETSIGMASK);
-    sigset_t blocked;
-    sigemptyset(&blocked);
-    sigaddset(&blocked, SIGTERM);  // of a service manager, to all processes of a unit
-    posix_spawnattr_setsigmask(&_attributes, &blocked);
-  }
-  ~SpawnPlan() {
-    posix_spawnattr_destroy(&_attributes);
-    posix_spawn_file_actions_destroy(&_actions);
-  }
-  SpawnPlan(const SpawnPlan&) = delete;
-  SpawnPlan& operator=(const SpawnPlan&) = delete;
-
-  [[nodiscard]] pid_t run(const std::string& program) const {
-    const std::array<const char*, 2> arguments{program.c_str(), nullptr};
-    pid_t process = -1;
-    const int result = posix_spawn(&process, program.c_str(), &_actions, &_attributes,
-                                   const_cast<char* const*>(arguments.data()), environ);
-    return result == 0 ? process : -1;
-  }
-
- private:
-  posix_spawn_file_actions_t _actions;
-  posix_spawnattr_t _attributes;
-};
+// Starts the program with the socket, without output, and without a signal from a terminal, which
+// would take the text from the mail that is in hand. -1 on failure.
+pid_t startProgram(const std::string& program, int socket) {
+  platform::SpawnPlan plan;
+  plan.pass(socket, STDIN_FILENO).silence(STDOUT_FILENO).silence(STDERR_FILENO).inOwnGroup();
+  plan.blockSignals({SIGTERM});  // of a service manager, to all processes of a unit
+  pid_t process = -1;
+  return plan.run({program}, process) == 0 ? process : -1;
+}
 
 // An unnamed file in memory with these bytes; none on failure.
 platform::FileDescriptor memoryFile(std::string_view bytes) {
@@ -110,7 +85,7 @@ bool ExtractProcess::spawn() {
   if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends.data()) != 0) return false;
   _socket = platform::FileDescriptor(ends[0]);
   const platform::FileDescriptor theirs(ends[1]);
-  _process = SpawnPlan(theirs.get()).run(_program);
+  _process = startProgram(_program, theirs.get());
   return _process > 0;
 }
 

@@ -12,8 +12,8 @@
 namespace mcp {
 
 // Which mail may be shown: mail whose file, with all symbolic links resolved, is in one of the
-// named folders or below. It keeps out a model, not a program of the same user that exchanges files
-// while they are read. One thread.
+// named folders or below. It limits what clients ask for; a program of the same user could still
+// exchange files while they are read. One thread.
 class FolderLimit {
  public:
   // Each is a query of its own.

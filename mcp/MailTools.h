@@ -12,7 +12,7 @@
 
 namespace mcp {
 
-// The tools for a model: search, show, threads and status. All of them only read, and show only
+// The tools for clients: search, show, threads and status. All of them only read, and show only
 // mail within the limit. What comes from mail stands under the key "untrusted", cleaned and cut.
 // One thread; each call waits for the daemon as `tallow search` does.
 class MailTools {

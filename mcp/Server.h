@@ -2,8 +2,8 @@
 
 #include "cli/Options.h"
 
-// `tallow mcp`: lets a language model search and read mail, over the Model Context Protocol on the
-// standard input and output.
+// `tallow mcp`: serves search and reading of mail over the Model Context Protocol, on the standard
+// input and output.
 namespace mcp {
 
 // Serves until the input ends or the output is closed. Fails at once if no folder is named, in the

@@ -6,8 +6,8 @@
 
 namespace mcp {
 
-// Text from mail for a model: valid UTF-8, without control characters, changes of direction, and
-// characters that people do not see but models read (tags, variation selectors, zero-width ones).
+// Text from mail for a client: valid UTF-8, without control characters, changes of direction, and
+// characters that people do not see and programs read (tags, variation selectors, zero-width ones).
 // Line feeds stay. At most `most` code points, with "…" at the end if something is cut off.
 [[nodiscard]] std::string shownText(std::string_view text, size_t most);
 

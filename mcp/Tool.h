@@ -19,7 +19,7 @@ struct Property {
   std::optional<int64_t> byDefault = {};
 };
 
-// What a call of a tool gives: a JSON object for the model, or why it failed, in words.
+// What a call of a tool gives: a JSON object for the client, or why it failed, in words.
 struct ToolAnswer {
   nlohmann::ordered_json object;
   std::string failure = {};  // not empty: the call failed

@@ -66,7 +66,7 @@ TEST(Setup, AProgramIsWaitedForWithinBounds) {
   EXPECT_EQ(run.status, 7);
   EXPECT_EQ(run.output, "out\nerr\n");
   EXPECT_EQ(shell("kill -9 $$").status, 128 + SIGKILL);
-  // The end counts, whoever has its output still open.
+  // Ends with the program, even if another process still has its output open.
   run = shell("sleep 1000 & echo $!");
   EXPECT_EQ(run.end, End::exited);
   kill(std::atoi(run.output.c_str()), SIGKILL);

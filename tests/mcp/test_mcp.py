@@ -1,4 +1,4 @@
-"""`tallow mcp` with a real daemon, as programs that run models use it."""
+"""`tallow mcp` with a real daemon, as other programs use it."""
 
 from __future__ import annotations
 
