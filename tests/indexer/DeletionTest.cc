@@ -1,6 +1,5 @@
-#include <sqlite3.h>
-
 #include "tests/indexer/IndexerSupport.h"
+#include "tests/support/SQLiteConnection.h"
 
 using testsupport::IndexerTest;
 using testsupport::mail;
@@ -51,14 +50,10 @@ TEST_F(IndexerTest, DeletesByDomain) {
 TEST_F(IndexerTest, ADeletionThatFailsEndsTheListAndThoseBeforeItStand) {
   ASSERT_EQ(add({mail("a", "word"), mail("b", "word"), mail("c", "word"), mail("d", "word")}),
             std::nullopt);
-  sqlite3* database = nullptr;
-  ASSERT_EQ(sqlite3_open((directory / "docstore/docstore.db").c_str(), &database), SQLITE_OK);
-  EXPECT_EQ(sqlite3_exec(database,
-                         "CREATE TRIGGER keep BEFORE DELETE ON docstore WHEN old.docid = 3 "
-                         "BEGIN SELECT RAISE(ABORT, 'kept'); END",
-                         nullptr, nullptr, nullptr),
-            SQLITE_OK);
-  sqlite3_close(database);
+  testsupport::SQLiteConnection(directory / "docstore/docstore.db")
+      .run(
+          "CREATE TRIGGER keep BEFORE DELETE ON docstore WHEN old.docid = 3 "
+          "BEGIN SELECT RAISE(ABORT, 'kept'); END");
   const auto failure = remove({u"a", u"b", u"c", u"d"});
   ASSERT_TRUE(failure.has_value());
   EXPECT_EQ(failure->domain, "DocStore");

@@ -1,6 +1,5 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sqlite3.h>
 
 #include <latch>
 #include <random>
@@ -12,6 +11,7 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"
+#include "tests/support/SQLiteConnection.h"
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -327,13 +327,13 @@ TEST_F(TopKVocabTest, ALoadNeverBringsOlderWordsBack) {
   vocab.loadTopKVocabFromDocStore(&error);
   ASSERT_EQ(error, std::nullopt);
   ASSERT_THAT(*vocab.vocab(), ElementsAre("stored"));
-  sqlite3* other = nullptr;  // blocks writes to the store
-  ASSERT_EQ(sqlite3_open((directory / "docs.db").c_str(), &other), SQLITE_OK);
-  ASSERT_EQ(sqlite3_exec(other, "begin immediate;", nullptr, nullptr, nullptr), SQLITE_OK);
-  EXPECT_NE(rebuild(vocab), std::nullopt);
-  vocab.loadTopKVocabFromDocStore(&error);
-  EXPECT_THAT(*vocab.vocab(), testing::IsEmpty());
-  sqlite3_close(other);
+  {
+    testsupport::SQLiteConnection other(directory / "docs.db");
+    other.run("BEGIN IMMEDIATE");  // blocks writes to the store
+    EXPECT_NE(rebuild(vocab), std::nullopt);
+    vocab.loadTopKVocabFromDocStore(&error);
+    EXPECT_THAT(*vocab.vocab(), testing::IsEmpty());
+  }
   EXPECT_EQ(rebuild(vocab), std::nullopt);
   vocab.shutdown();
 }
