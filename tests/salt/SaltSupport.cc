@@ -43,13 +43,17 @@ void editKey(const std::string& path, const std::string& key, const std::string*
   TL_ASSERT((value ? database.db->Put({}, key, *value) : database.db->Delete({}, key)).ok());
 }
 
-std::filesystem::path newestLog(const std::string& path) {
-  std::filesystem::path newest;
+std::vector<std::filesystem::path> filesOf(const std::string& path, std::string_view part) {
+  std::vector<std::filesystem::path> found;
   for (const auto& entry : std::filesystem::directory_iterator(path)) {
-    // Names are numbers of equal width.
-    if (entry.path().extension() == ".log") newest = std::max(newest, entry.path());
+    if (entry.path().filename().string().find(part) != std::string::npos) found.push_back(entry);
   }
-  return newest;
+  std::sort(found.begin(), found.end());
+  return found;
+}
+
+std::filesystem::path newestLog(const std::string& path) {
+  return filesOf(path, ".log").back();  // names are numbers of equal width
 }
 
 FileSizeLimit::FileSizeLimit(uint64_t bytes) {
@@ -94,23 +98,29 @@ std::vector<std::string> scan(const salt::Index& index, std::string_view prefix)
   return found;
 }
 
-std::vector<std::pair<uint32_t, uint16_t>> placesOf(const std::vector<uint16_t>& zones,
-                                                    const salt::DocZones* docs, size_t count) {
-  std::vector<std::pair<uint32_t, uint16_t>> places;
-  for (const salt::DocZones* doc = docs; doc != docs + count; ++doc) {
-    for (size_t zone = 0; zone < zones.size(); ++zone) {
-      if ((doc->zones >> zone & 1) != 0) places.emplace_back(doc->DocID, zones[zone]);
-    }
-  }
-  return places;
-}
-
-std::optional<uint64_t> scanPlaces(const salt::Index& index, std::string_view prefix,
-                                   uint64_t limit, const salt::PlacesCallback& callback) {
+std::optional<Places> scanPlaces(const salt::Index& index, std::string_view prefix,
+                                 uint64_t limit) {
   const auto found = index.ScanPlaces({prefix}, limit);
   if (found.front() == nullptr) return std::nullopt;
-  found.front()->deliver(callback);
-  return found.front()->suffixes();
+  Places all{{}, found.front()->suffixes()};
+  found.front()->deliver([&all](const auto& zones, const salt::DocZones* docs, size_t count) {
+    if (count == 0) all.places.insert("an empty run");
+    for (size_t i = 0; i < count * zones.size(); ++i) {
+      const salt::DocZones& doc = docs[i / zones.size()];
+      const size_t zone = i % zones.size();
+      if ((doc.zones >> zone & 1) == 0) continue;
+      all.places.insert(fmt::format("{},{}", doc.DocID, zones[zone]));
+    }
+  });
+  return all;
+}
+
+Places placesOf(const std::vector<std::string>& suffixes) {
+  Places all{{}, suffixes.size()};
+  for (const std::string& suffix : suffixes) {
+    all.places.insert(suffix.substr(0, suffix.find(':')));
+  }
+  return all;
 }
 
 }  // namespace salttest

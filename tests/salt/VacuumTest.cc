@@ -60,12 +60,11 @@ TEST(Vacuum, CachedScansDecideWhetherALimitHolds) {
   addDocs(*index, 1, 10);
   vacuum(*index);
   ASSERT_EQ(index->GetMetrics().HotSuffixes, 0u);
-  const auto places = [&index](uint64_t limit) {
-    size_t delivered = 0;
-    const auto count = salttest::scanPlaces(
-        *index, "two", limit, [&](const auto&, const auto*, size_t run) { delivered += run; });
-    EXPECT_EQ(delivered, count.value_or(0)) << limit;
-    return count;
+  const auto places = [&index](uint64_t limit) -> std::optional<size_t> {
+    const auto found = salttest::scanPlaces(*index, "two", limit);
+    if (!found) return std::nullopt;
+    EXPECT_EQ(found->places.size(), found->suffixes) << limit;
+    return found->suffixes;
   };
   EXPECT_EQ(places(49), std::nullopt);  // of 50 suffixes
   EXPECT_EQ(places(50), 10u);

@@ -5,7 +5,6 @@
 #include <fmt/format.h>
 #include <poll.h>
 #include <signal.h>
-#include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -17,6 +16,7 @@
 #include <random>
 
 #include "platform/Assert.h"
+#include "platform/SpawnPlan.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/salt/crash/Workload.h"
@@ -70,23 +70,15 @@ class WorkerProcess {
     int ends[2];
     TL_ASSERT(pipe2(ends, O_CLOEXEC) == 0);
     _reports = ends[0];
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_adddup2(&actions, ends[1], STDOUT_FILENO);
-    std::string words[] = {"salt_crash_driver",
-                           "--worker",
-                           task.path,
-                           std::to_string(task.seed),
-                           std::to_string(task.first),
-                           std::to_string(task.generation),
-                           std::to_string(task.create),
-                           std::to_string(static_cast<int>(task.shortage))};
-    std::vector<char*> arguments;
-    for (std::string& word : words) arguments.push_back(word.data());
-    arguments.push_back(nullptr);
-    TL_ASSERT(posix_spawn(&_pid, "/proc/self/exe", &actions, nullptr, arguments.data(), environ) ==
-              0);
-    posix_spawn_file_actions_destroy(&actions);
+    const std::vector<std::string> words{"/proc/self/exe",
+                                         "--worker",
+                                         task.path,
+                                         std::to_string(task.seed),
+                                         std::to_string(task.first),
+                                         std::to_string(task.generation),
+                                         std::to_string(task.create),
+                                         std::to_string(static_cast<int>(task.shortage))};
+    TL_ASSERT(platform::SpawnPlan().pass(ends[1], STDOUT_FILENO).run(words, _pid) == 0);
     close(ends[1]);
   }
 
