@@ -235,12 +235,7 @@ TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccessAndRemovedWithTheMail) {
   EXPECT_EQ(store->documentIDWithURL(*TLURL::parse("tlw://mail_bundle_id/b"), nullptr), 1u);
 }
 
-TEST_F(IndexerTest, IndexAndStoreHoldTheSameDocuments) {
-  ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
-  indexer->shutdown();
-  ASSERT_TRUE(platform::removeItem(directory / "salt", nullptr));
-  open();
-  EXPECT_EQ(store->count(nullptr), 0);
+TEST_F(IndexerTest, AStoreThatIsGoneEmptiesTheIndex) {
   ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
   indexer->shutdown();
   ASSERT_TRUE(platform::removeItem(directory / "docstore", nullptr));
@@ -252,24 +247,18 @@ TEST_F(IndexerTest, IndexAndStoreHoldTheSameDocuments) {
 
 TEST_F(IndexerTest, AnIndexThatDoesNotOpenIsRecreatedAndEmptiesTheStore) {
   const std::string salt = directory / "salt";
-  const struct {
-    std::function<void()> damage;
-    std::string line;
-  } cases[] = {
-      {[&] { salttest::editMetrics(salt, [](auto& m) { m.CodeVersion = 303; }); },
-       "error SALT: Loading failure: Mismatched code version."},
-      {[&] { salttest::editMetrics(salt, [](auto& m) { m.Shards = 17; }); },
-       "fault SALT: Loading failure: Metrics corrupted."},
-      {[&] { platform::writeFileAtomically(salt + "/CURRENT", "garbage", nullptr); },
-       "error SALT: Error opening db: Corruption: CURRENT file does not end with newline"},
+  const std::function<void()> damages[] = {
+      [&] { salttest::editMetrics(salt, [](auto& m) { m.CodeVersion = 303; }); },
+      [&] { salttest::editMetrics(salt, [](auto& m) { m.Shards = 17; }); },
+      [&] { platform::writeFileAtomically(salt + "/CURRENT", "garbage", nullptr); },
+      [&] { platform::removeItem(salt, nullptr); },
   };
-  for (const auto& c : cases) {
+  for (const auto& damage : damages) {
     ASSERT_EQ(add({mail("a", "word")}), std::nullopt);
     indexer->shutdown();
-    c.damage();
+    damage();
     log.clear();
     open();
-    EXPECT_TRUE(log.has(c.line)) << c.line;
     EXPECT_TRUE(
         log.has("default TALIndexer: Could not find path, creating new textstore at path " + salt));
     EXPECT_TRUE(log.contains("default TALIndexer: Reset docstore with "));

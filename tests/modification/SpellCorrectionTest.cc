@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <map>
+#include <sstream>
 
 #include "docstore/TALSqliteDocStore.h"
 #include "modification/TALSpellCorrection.h"
@@ -87,41 +88,29 @@ TEST_F(SpellCorrectionTest, EditsByLengthOfTheWord) {
   const struct {
     std::string word;
     size_t count;
-    std::vector<std::pair<std::string, float>> some;  // candidates with scores, in order
+    const char* some;  // candidates, each followed by its score, in order
     std::vector<std::string> none;
   } cases[] = {
       {"abc",
        2 + 3 * 51 + 26,
-       {{"bac", 0.61F},
-        {"zabc", 0.55F},
-        {"acb", 0.62F},
-        {"azc", 0.8F},
-        {"abz", 0.81F},
-        {"abzc", 0.82F},
-        {"abcz", 0.75F}},
+       "bac 0.61 zabc 0.55 acb 0.62 azc 0.8 abz 0.81 abzc 0.82 abcz 0.75",
        {"ab", "ac", "bc"}},
       {"abcd",
        3 + 4 + 4 * 51 + 26,
-       {{"bacd", 0.61F},
-        {"bcd", 0.6F},
-        {"acbd", 0.7F},
-        {"acd", 0.72F},
-        {"abdc", 0.62F},
-        {"abc", 0.79F},
-        {"abcdz", 0.75F}},
+       "bacd 0.61 bcd 0.6 acbd 0.7 acd 0.72 abdc 0.62 abc 0.79 abcdz 0.75",
        {"cd"}},
-      {"aabb", 1 + 4 + 4 * 51 + 26, {{"abb", 0.6F}, {"abab", 0.7F}, {"aab", 0.72F}}, {}},
+      {"aabb", 1 + 4 + 4 * 51 + 26, "abb 0.6 abab 0.7 aab 0.72", {}},
       // The budget of 1000 is exhausted at the nineteenth letter, after 18 * 53 candidates.
-      {"abcdefghijklmnopqrst", 1000, {{"abcdefghijklmnopqrts", 0.62F}}, {"abcdefghijklmnopqrstz"}},
-      {"abcdefghijklmnopqrstu", 1000, {{"abcdefghijklmnopqrtsu", 0.7F}}, {"abcdefghijklmnopqrsut"}},
+      {"abcdefghijklmnopqrst", 1000, "abcdefghijklmnopqrts 0.62", {"abcdefghijklmnopqrstz"}},
+      {"abcdefghijklmnopqrstu", 1000, "abcdefghijklmnopqrtsu 0.7", {"abcdefghijklmnopqrsut"}},
   };
   for (const auto& c : cases) {
     const auto made = spelling->editOneCandidates(c.word);
     EXPECT_EQ(made.size(), c.count) << c.word;
     auto from = made.begin();
-    for (const auto& [token, worth] : c.some) {
-      from = std::find_if(from, made.end(),
-                          [&name = token](const auto& m) { return m._token == name; });
+    std::istringstream some(c.some);
+    for (auto [token, worth] = std::pair(std::string(), 0.0F); some >> token >> worth;) {
+      while (from != made.end() && from->_token != token) ++from;
       ASSERT_NE(from, made.end()) << token;
       EXPECT_EQ(from->_scoreError, worth) << token;
     }
