@@ -48,28 +48,19 @@ class BlockingEnv final : public salttest::FaultInjectionEnv {
   }
 
  private:
-  class File final : public salttest::FaultInjectionFile {
-   public:
-    File(BlockingEnv* disk, leveldb::WritableFile* file) : FaultInjectionFile(file), _disk(*disk) {}
-    leveldb::Status Append(const leveldb::Slice& bytes) override {
-      _disk.pass(Operation::append);
-      return FaultInjectionFile::Append(bytes);
-    }
-    leveldb::Status Sync() override {
-      _disk.pass(Operation::sync);
-      return FaultInjectionFile::Sync();
-    }
-
-   private:
-    BlockingEnv& _disk;
-  };
-
-  leveldb::WritableFile* wrap(const std::string& path, leveldb::WritableFile* file) override {
-    return path.ends_with(_suffix) ? new File(this, file) : file;
+  leveldb::Status append(const std::string& path, File& file,
+                         const leveldb::Slice& bytes) override {
+    pass(path, Operation::append);
+    return file.Append(bytes);
   }
-  void pass(Operation operation) {
+  leveldb::Status sync(const std::string& path, File& file) override {
+    pass(path, Operation::sync);
+    return file.Sync();
+  }
+  void pass(const std::string& path, Operation operation) {
+    if (operation != _blocks || !path.ends_with(_suffix)) return;
     platform::MutexLock lock(_mutex);
-    if (operation != _blocks || !_blocked || _pass-- > 0) return;
+    if (!_blocked || _pass-- > 0) return;
     _waiting = true;
     _changed.notify_all();
     while (_blocked) _changed.wait(_mutex);

@@ -1,7 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <bit>
 #include <ctime>
 #include <numeric>
@@ -45,17 +44,6 @@ TEST(Varint, RoundTripsAroundPowersOfTwoAndEndsAtEveryTruncation) {
   }
   std::string_view endless = "\x80\x80\x80\x80\x80\x01";
   EXPECT_DEATH(salt::readVarint(endless), "shift < 32");
-}
-
-TEST(SuffixLength, EndsAtNULAtALateSpaceAndAtTheMaximum) {
-  std::mt19937 random(3);
-  for (int round = 0; round < 5000; ++round) {
-    Index::Options op;
-    op.MaxMatchLen = static_cast<uint8_t>(random());
-    op.MinMatchLen = static_cast<uint8_t>(random() % (op.MaxMatchLen + 1));
-    const std::string text = salttest::randomText(random, random() % 300);
-    ASSERT_EQ(text.substr(0, salt::suffixLength(text, op)), salttest::naiveCut(text, op));
-  }
 }
 
 TEST(Keys, OnlyTextKeysParseAsSuch) {

@@ -1,4 +1,3 @@
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -90,11 +89,7 @@ class CorruptionTest : public testing::Test {
   void write(const std::string& name, const std::string& bytes) const {
     ASSERT_TRUE(platform::writeFileAtomically(path + '/' + name, bytes, nullptr));
   }
-  [[nodiscard]] fs::path current() const {
-    std::string name = platform::readFile(path + "/CURRENT", 100, nullptr).value_or("");
-    name.pop_back();
-    return path + '/' + name;
-  }
+  [[nodiscard]] fs::path manifest() const { return salttest::filesOf(path, "MANIFEST").at(0); }
 
   testsupport::TemporaryDirectory directory;
   const std::string path = directory / "i";
@@ -167,8 +162,8 @@ TEST_F(CorruptionTest, ADatabaseWithDamagedMetadataDoesNotOpen) {
   } cases[] = {
       {[&] { write("CURRENT", "garbage"); }, "Error opening db: Corruption: CURRENT file"},
       {[&] { write("CURRENT", "MANIFEST-999999\n"); }, "Error opening db: Corruption: CURRENT"},
-      {[&] { flip(current(), 10); }, "Error opening db: Corruption: "},
-      {[&] { fs::resize_file(current(), 0); }, "Error opening db: Corruption: no meta-nextfile"},
+      {[&] { flip(manifest(), 10); }, "Error opening db: Corruption: "},
+      {[&] { fs::resize_file(manifest(), 0); }, "Error opening db: Corruption: no meta-nextfile"},
       {[&] { fs::remove(tables.at(0)); }, "Error opening db: Corruption: 1 missing files"},
       {[&] {
          fs::remove_all(path);

@@ -272,6 +272,16 @@ std::string Model::difference(const salt::Index::Metrics& metrics) const {
   return metrics.Suffixes == places.size() ? "" : "Suffixes";
 }
 
+bool carryOut(salt::Index& index, Operation made) {
+  if (made.zoneID == 0) return index.DeleteDoc(made.docID);
+  return index.AddZone(made.docID, made.zoneID, made.text, made.offsets, made.merge);
+}
+
+bool carryOut(Model& model, const Operation& made) {
+  if (made.zoneID == 0) return model.deleteDoc(made.docID);
+  return model.addZone(made.docID, made.zoneID, made.text, made.offsets, made.merge);
+}
+
 std::string randomText(std::mt19937& random, size_t size) {
   std::string text;
   while (text.size() < size) {

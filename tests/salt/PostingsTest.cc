@@ -1,8 +1,5 @@
-#include <fmt/format.h>
 #include <gtest/gtest.h>
 
-#include <fstream>
-#include <map>
 #include <random>
 #include <set>
 
@@ -46,8 +43,12 @@ class PostingsTest : public testing::Test {
       }
     }
   }
+  void merge() {
+    index->Vacuum();
+    reopen();  // waits for the merge
+  }
   void reopen() {
-    index.reset();  // ends a merge
+    index.reset();
     index = salttest::loadIndex(path);
     ASSERT_NE(index, nullptr);
   }
@@ -82,8 +83,7 @@ class PostingsTest : public testing::Test {
 TEST_F(PostingsTest, AnswersMatchThePagesThroughMergesDeletionsAndReopening) {
   for (int round = 0; round < 8; ++round) {
     addDocs(40);
-    index->Vacuum();
-    reopen();
+    merge();
     expectSame();
     for (uint32_t docID = 1 + static_cast<uint32_t>(round); docID <= lastDoc; docID += 13) {
       ASSERT_TRUE(index->DeleteDoc(docID));
@@ -102,16 +102,14 @@ TEST_F(PostingsTest, ThereAreNoneWithMoreZonesThanBits) {
   }
   addDocs(20);
   prefixes.insert({"s", "same", "same s", "same same same same same "});
-  index->Vacuum();
-  reopen();
+  merge();
   EXPECT_TRUE(files().empty());
   expectSame();
 }
 
 TEST_F(PostingsTest, InvalidFilesAreIgnoredAndRebuilt) {
   addDocs(100);
-  index->Vacuum();
-  reopen();
+  merge();
   ASSERT_FALSE(files().empty());
   const fs::path file = files().front();
   const std::string good = platform::readFile(file, 1 << 20, nullptr).value();
@@ -156,8 +154,7 @@ TEST_F(PostingsTest, InvalidFilesAreIgnoredAndRebuilt) {
 TEST_F(PostingsTest, FilesOfAnotherShardOrIndexAreNotUsed) {
   for (int i = 0; i < 4; ++i) {
     addDocs(60);
-    index->Vacuum();
-    reopen();
+    merge();
   }
   ASSERT_GE(files().size(), 2u);
   index.reset();
@@ -176,10 +173,7 @@ TEST_F(PostingsTest, AMergeSucceedsEvenIfTheFileCannotBeWritten) {
   testsupport::LogCapture log;
   fs::create_directory(salt::postingsPath(path, 1) + ".new");
   addDocs(20);
-  for (int i = 0; i < 2; ++i) {
-    index->Vacuum();
-    reopen();
-  }
+  for (int i = 0; i < 2; ++i) merge();
   EXPECT_TRUE(log.contains("Error writing postings"));
   EXPECT_FALSE(fs::exists(salt::postingsPath(path, 1)));
   EXPECT_LT(index->GetMetrics().HotSuffixes, options.MaxHotSuffixes);

@@ -89,10 +89,14 @@ std::vector<uint32_t> wordOffsets(std::string_view text) {
   return offsets;
 }
 
+std::string printed(const salt::SuffixMeta& suffix) {
+  return fmt::format("{},{}:{}", suffix.DocID, suffix.ZoneID, suffix.Offset);
+}
+
 std::vector<std::string> scan(const salt::Index& index, std::string_view prefix) {
   std::vector<std::string> found;
-  EXPECT_TRUE(index.ScanPrefix(prefix, [&found](const salt::SuffixMeta& meta) {
-    found.push_back(fmt::format("{},{}:{}", meta.DocID, meta.ZoneID, meta.Offset));
+  EXPECT_TRUE(index.ScanPrefix(prefix, [&found](const salt::SuffixMeta& suffix) {
+    found.push_back(printed(suffix));
     return true;
   }));
   return found;

@@ -57,7 +57,10 @@ bool addZone(salt::Index& index, uint32_t docID, uint16_t zoneID, const std::str
 // Offset 0 and the offsets of the bytes after a space.
 [[nodiscard]] std::vector<uint32_t> wordOffsets(std::string_view text);
 
-// The suffixes of a scan: "docID,zoneID:offset" in order.
+// "docID,zoneID:offset"
+[[nodiscard]] std::string printed(const salt::SuffixMeta& suffix);
+
+// The suffixes of a scan, printed, in order.
 [[nodiscard]] std::vector<std::string> scan(const salt::Index& index, std::string_view prefix);
 
 // The places of suffixes, "docID,zoneID", and the number of suffixes.

@@ -16,7 +16,6 @@ using saltsearch::Term;
 using salttest::addZone;
 using salttest::newIndex;
 using testing::ElementsAre;
-using testsupport::LogCapture;
 using testsupport::TemporaryDirectory;
 
 namespace {
@@ -204,7 +203,7 @@ TEST_F(SearchSmall, MalformedTermsAreSkippedWithALogLine) {
       {zones(32), "error SALT: Too many zones in query: 32."},
   };
   for (const auto& c : cases) {
-    const LogCapture log;
+    const testsupport::LogCapture log;
     std::vector<Term> terms{c.bad, apple};
     EXPECT_THAT(printed(saltsearch::Search(*index, terms, kAll)), ElementsAre("3:1", "2:1", "1:1"));
     EXPECT_TRUE(log.has(c.line)) << c.line;

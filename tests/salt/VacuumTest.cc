@@ -1,4 +1,3 @@
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -14,10 +13,7 @@
 using salt::Index;
 using salttest::addZone;
 using salttest::loadIndex;
-using salttest::Model;
 using salttest::newIndex;
-using salttest::scan;
-using testsupport::LogCapture;
 using testsupport::TemporaryDirectory;
 
 namespace {
@@ -49,7 +45,7 @@ void vacuum(Index& index) {
 
 // Compares the keys of a closed index with the model after `docs` documents.
 std::string faultOf(const std::string& path, const Index::Options& options, uint32_t docs) {
-  Model model(options);
+  salttest::Model model(options);
   for (uint32_t docID = 1; docID <= docs; ++docID) model.addZone(docID, 1, kText, kOffsets, true);
   return difference(salttest::readKeys(path), &model);
 }
@@ -118,7 +114,7 @@ TEST(Vacuum, ScansAndAddsRunDuringMerges) {
       for (bool last = false; !last;) {
         last = ended;
         const uint32_t before = added;
-        auto found = scan(*index, "t");  // two per document
+        auto found = salttest::scan(*index, "t");  // two per document
         std::sort(found.begin(), found.end());
         EXPECT_EQ(std::adjacent_find(found.begin(), found.end()), found.end());
         EXPECT_GE(found.size(), 2 * before);
@@ -169,7 +165,7 @@ TEST(Vacuum, AFailedWriteEndsAMergeAndLosesNothing) {
     index = loadIndex(path);
     ASSERT_TRUE(index);
     {
-      const LogCapture log;
+      const testsupport::LogCapture log;
       const salttest::FileSizeLimit limit(std::filesystem::file_size(salttest::newestLog(path)) +
                                           room);
       vacuum(*index);

@@ -10,8 +10,6 @@
 
 namespace {
 
-using salttest::FileSizeLimit;
-
 // Some zones are longer than one read-ahead; every tenth document has none.
 class ZoneTextCacheTest : public testing::Test {
  protected:
@@ -62,7 +60,7 @@ TEST_F(ZoneTextCacheTest, GivesTheSameWithAFileOfAnyLength) {
 TEST_F(ZoneTextCacheTest, WorksWhenTheFileCannotGrow) {
   salt::ZoneTextCache texts(index());
   {
-    const FileSizeLimit limit(100000);
+    const salttest::FileSizeLimit limit(100000);
     expectAllTexts(&texts);
   }
   expectAllTexts(&texts);

@@ -8,6 +8,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
@@ -44,6 +45,7 @@ constexpr const char* kUsage =
     "of some megabytes, by filling it.\n";
 
 enum class Mode { kill, truncate, enospc };
+constexpr std::string_view kModes[] = {"kill", "truncate", "enospc"};
 
 struct Options {
   uint64_t kills = 200;
@@ -318,10 +320,9 @@ bool parse(int count, char** words, Options* options) {
       options->disk = value;
     } else if (name == "--seconds") {
       options->most = std::chrono::seconds(number(words[i + 1]));
-    } else if (name == "--mode" && (value == "kill" || value == "truncate" || value == "enospc")) {
-      options->mode = value == "kill"       ? Mode::kill
-                      : value == "truncate" ? Mode::truncate
-                                            : Mode::enospc;
+    } else if (const auto mode = std::ranges::find(kModes, value);
+               name == "--mode" && mode != std::end(kModes)) {
+      options->mode = static_cast<Mode>(mode - kModes);
     } else {
       return false;
     }
