@@ -3,8 +3,6 @@
 
 using testsupport::IndexerTest;
 using testsupport::mail;
-using testsupport::Outcome;
-using testsupport::outcomeOf;
 
 TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
   TALIndexer::Items items{mail("b", "word")};
@@ -15,7 +13,7 @@ TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
   }
   ASSERT_EQ(add(items), std::nullopt);
   identifiers.insert(identifiers.end(), {u"nobody", u"b"});
-  const Outcome error = remove(identifiers);
+  const testsupport::Outcome error = remove(identifiers);
   ASSERT_TRUE(error);
   EXPECT_EQ(error->domain, "DocStore");
   EXPECT_TRUE(
@@ -37,7 +35,7 @@ TEST_F(IndexerTest, DeletesByDomain) {
   items.back()->setDomainIdentifier(u"third");
   items.push_back(mail("none", "word"));
   ASSERT_EQ(add(items), std::nullopt);
-  EXPECT_EQ(outcomeOf([&](auto done) {
+  EXPECT_EQ(testsupport::outcomeOf([&](auto done) {
               indexer->deleteItemsByDomainIdentifiers({u"even", u"nothing", u"third"}, done);
             }),
             std::nullopt);

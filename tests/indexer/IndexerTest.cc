@@ -17,7 +17,6 @@ using enum TLAttributeKey;
 using testsupport::IndexerTest;
 using testsupport::mail;
 using testsupport::Outcome;
-using testsupport::outcomeOf;
 
 std::shared_ptr<TLParameters> parameters(TLStringView text) {
   return TLParamsManager::paramsFromString(text);
@@ -206,7 +205,7 @@ TEST_F(IndexerTest, AZoneTooLargeFailsTheRestOfTheBatchAndSendingAgainRepairsIt)
 TEST_F(IndexerTest, ClientStateIsStoredOnlyAfterSuccessAndRemovedWithTheMail) {
   const auto combined = [&](TALIndexer::Items items, TALIndexer::Strings gone,
                             std::optional<std::string> state) {
-    return outcomeOf([&](auto done) {
+    return testsupport::outcomeOf([&](auto done) {
       indexer->addDocs(std::move(items), std::move(gone), std::move(state), u"client",
                        "mail_bundle_id", done);
     });

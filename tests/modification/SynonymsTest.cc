@@ -9,8 +9,6 @@
 
 namespace {
 
-using testsupport::Corpus;
-using testsupport::tokensOf;
 using testsupport::word;
 using Terms = std::vector<saltsearch::Term>;
 
@@ -160,10 +158,10 @@ class Expansion : public testing::Test {
     Terms out;
     const Terms searched = corpus.searched(std::move(terms));
     score = model.synonymExpansion(searched, out, *corpus.index);
-    return score == -1.0F ? "no" : tokensOf(out);
+    return score == -1.0F ? "no" : testsupport::tokensOf(out);
   }
 
-  Corpus corpus;
+  testsupport::Corpus corpus;
   TALSynonyms model;
   float score = 0;
 };

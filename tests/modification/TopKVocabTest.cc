@@ -3,6 +3,7 @@
 
 #include <latch>
 #include <random>
+#include <tuple>
 
 #include "docstore/TALSqliteDocStore.h"
 #include "modification/TALTopKVocab.h"
@@ -24,7 +25,7 @@ using testsupport::outcomeOf;
 using Words = TALTopKVocab::Words;
 
 // An index of a hundred zones that counts the zones iterated over, and can wait at the first one.
-class WatchedIndex final : public salt::Index {
+class WatchedIndex : public salt::Index {
  public:
   mutable std::atomic<int> zones = 0;
   bool waitsAtFirst = false;
@@ -41,36 +42,28 @@ class WatchedIndex final : public salt::Index {
       if (!callback(docID, 1, "word ")) return;
     }
   }
-  const Options& GetOptions() const override { return _options; }
-  std::string GetSuffixText(const salt::SuffixMeta&) const override { return ""; }
-  bool AddZone(uint32_t, uint16_t, std::string_view, std::vector<uint32_t>&, bool) override {
-    return false;
-  }
-  bool DeleteDoc(uint32_t) override { return false; }
-  bool DeleteDocs(const std::vector<uint32_t>&) override { return false; }
-  bool ScanPrefix(std::string_view, std::function<bool(const salt::SuffixMeta&)>) const override {
-    return true;
-  }
-  std::vector<std::shared_ptr<const salt::FoundPlaces>> ScanPlaces(
-      const std::vector<std::string_view>&, uint64_t) const override {
-    return {};
-  }
-  std::vector<std::vector<salt::SuffixMeta>> ScanPrefixes(const std::vector<std::string>&,
-                                                          size_t) const override {
-    return {};
-  }
-  void Vacuum() override {}
-  bool Sync() override { return true; }
-  bool Compact() override { return true; }
-  Metrics GetMetrics() const override { return {}; }
-  void ResetScanMetrics() override {}
-  bool Validate() const override { return true; }
-  std::string Dump() const override { return ""; }
-  void WaitForMaintenance() override {}
-  void Interrupt() override {}
 
- private:
-  Options _options;
+  MOCK_METHOD(const Options&, GetOptions, (), (const, override));
+  MOCK_METHOD(std::string, GetSuffixText, (const salt::SuffixMeta&), (const, override));
+  MOCK_METHOD(bool, AddZone, (uint32_t, uint16_t, std::string_view, std::vector<uint32_t>&, bool),
+              (override));
+  MOCK_METHOD(bool, DeleteDoc, (uint32_t), (override));
+  MOCK_METHOD(bool, DeleteDocs, (const std::vector<uint32_t>&), (override));
+  MOCK_METHOD(bool, ScanPrefix, (std::string_view, std::function<bool(const salt::SuffixMeta&)>),
+              (const, override));
+  MOCK_METHOD(std::vector<std::shared_ptr<const salt::FoundPlaces>>, ScanPlaces,
+              (const std::vector<std::string_view>&, uint64_t), (const, override));
+  MOCK_METHOD(std::vector<std::vector<salt::SuffixMeta>>, ScanPrefixes,
+              (const std::vector<std::string>&, size_t), (const, override));
+  MOCK_METHOD(void, Vacuum, (), (override));
+  MOCK_METHOD(bool, Sync, (), (override));
+  MOCK_METHOD(bool, Compact, (), (override));
+  MOCK_METHOD(Metrics, GetMetrics, (), (const, override));
+  MOCK_METHOD(void, ResetScanMetrics, (), (override));
+  MOCK_METHOD(bool, Validate, (), (const, override));
+  MOCK_METHOD(std::string, Dump, (), (const, override));
+  MOCK_METHOD(void, WaitForMaintenance, (), (override));
+  MOCK_METHOD(void, Interrupt, (), (override));
 };
 
 class TopKVocabTest : public testing::Test {
@@ -82,22 +75,18 @@ class TopKVocabTest : public testing::Test {
         [&vocab](auto done) { vocab.checkAndRebuildTopKVocabWithCompletionHandler(done, true); });
   }
 
-  // The outcome of loading a stored blob: an object, its error, and its contents.
-  struct Loaded {
-    Outcome error;
-    Words words;
-    uint32_t docID;
-    double date;
-  };
+  // What a vocabulary of one old word holds after loading the blob: whether there was an error, the
+  // words, the document ID, and the date.
+  using Loaded = std::tuple<bool, Words, uint32_t, double>;
   Loaded load(const std::string& blob) {
     store->storeTopKVocab(blob, nullptr);
     TALTopKVocab vocab(store, index.get());
     vocab.setVocab({"old"});
     vocab.setLastTopKRebuildDocID(1);
     vocab.setLastTopKRebuildDate(1);
-    Loaded loaded;
-    vocab.loadTopKVocabFromDocStore(&loaded.error);
-    return {loaded.error, *vocab.vocab(), vocab.lastTopKRebuildDocID(),
+    Outcome error;
+    vocab.loadTopKVocabFromDocStore(&error);
+    return {error.has_value(), *vocab.vocab(), vocab.lastTopKRebuildDocID(),
             vocab.lastTopKRebuildDate()};
   }
 
@@ -198,43 +187,31 @@ TEST_F(TopKVocabTest, KeepsTheUndamagedPartsOfABlob) {
   };
   const Words old{"old"};
   const Words stored{"one", "two"};
-  const struct {
-    std::string blob;
-    bool error;
-    Words words;
-    uint32_t docID;
-    double date;
-  } cases[] = {
-      {three(words, docID, date), false, stored, 100, 1677721600},
-      {"\x82" + entry(words) + entry(docID), false, old, 1, 1},
-      {"\x80", false, old, 1, 1},
-      {"", true, old, 1, 1},
-      {"\x83\x01\x02\x03", true, old, 1, 1},
-      {three(words, docID, date) + "x", true, old, 1, 1},
-      {std::string(1000000, '\x81'), true, old, 1, 1},
-      {three("\x01", docID, date), true, {}, 1, 1},
-      {three("\x82\x63one", docID, date), true, {}, 1, 1},
-      {three("\x9B\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFF", docID, date), true, {}, 1, 1},
-      {three("", docID, date), true, {}, 1, 1},
-      {three(words, std::string("\x1B\0\0\0\1\0\0\0\0", 9), date), true, stored, 1, 1677721600},
-      {three(words, docID, "\x01"), true, stored, 100, 1},
-      {three(words, docID, "\xF9\x3C"), true, stored, 100, 1},
+  const std::pair<std::string, Loaded> cases[] = {
+      {three(words, docID, date), {false, stored, 100, 1677721600}},
+      {"\x82" + entry(words) + entry(docID), {false, old, 1, 1}},
+      {"\x80", {false, old, 1, 1}},
+      {"", {true, old, 1, 1}},
+      {"\x83\x01\x02\x03", {true, old, 1, 1}},
+      {three(words, docID, date) + "x", {true, old, 1, 1}},
+      {std::string(1000000, '\x81'), {true, old, 1, 1}},
+      {three("\x01", docID, date), {true, {}, 1, 1}},
+      {three("\x82\x63one", docID, date), {true, {}, 1, 1}},
+      {three("\x9B\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFF", docID, date), {true, {}, 1, 1}},
+      {three("", docID, date), {true, {}, 1, 1}},
+      {three(words, std::string("\x1B\0\0\0\1\0\0\0\0", 9), date), {true, stored, 1, 1677721600}},
+      {three(words, docID, "\x01"), {true, stored, 100, 1}},
+      {three(words, docID, "\xF9\x3C"), {true, stored, 100, 1}},
   };
-  for (const auto& c : cases) {
-    const Loaded loaded = load(c.blob);
-    const std::string shown = testing::PrintToString(c.blob.substr(0, 40));
-    EXPECT_EQ(loaded.error.has_value(), c.error) << shown;
-    EXPECT_EQ(loaded.words, c.words) << shown;
-    EXPECT_EQ(loaded.docID, c.docID) << shown;
-    EXPECT_EQ(loaded.date, c.date) << shown;
+  for (const auto& [bytes, expected] : cases) {
+    EXPECT_EQ(load(bytes), expected) << testing::PrintToString(bytes.substr(0, 40));
   }
   EXPECT_TRUE(log.contains("error TALTopKVocab: TopK cannot be unarchived: TALTopKVocab 1: "));
 }
 
 TEST_F(TopKVocabTest, ReadsTruncatedOrChangedBlobsSafely) {
   const std::string blob = topkvocab::archive({"one", std::string(300, 'x'), ""}, 70000, 1.5e9);
-  EXPECT_EQ(load(blob).words, (Words{"one", std::string(300, 'x'), ""}));
-  EXPECT_EQ(load(blob).docID, 70000U);
+  EXPECT_EQ(load(blob), Loaded(false, {"one", std::string(300, 'x'), ""}, 70000, 1.5e9));
   for (size_t size = 0; size < blob.size(); ++size) {
     ASSERT_FALSE(topkvocab::unarchive(std::string_view(blob).substr(0, size))) << size;
   }

@@ -32,30 +32,31 @@ std::string withNULs(std::string_view shown) {
   return bytes;
 }
 
-std::shared_ptr<TLAttribute> attribute(TLAttributeKey key, TLStringView value,
-                                       std::optional<TLString> customKey = std::nullopt) {
-  auto made = std::make_shared<TLAttribute>();
-  made->setKey(key);
-  made->setCustomKey(std::move(customKey));
-  made->setStringValue(TLString(value));
+struct Attribute {
+  TLAttributeKey key;
+  TLString value;
+  std::optional<TLString> customKey = std::nullopt;
+};
+
+std::unique_ptr<TLIndexableItem> item(TLStringView identifier,
+                                      const std::vector<Attribute>& attributes) {
+  auto made = std::make_unique<TLIndexableItem>();
+  made->setIdentifier(TLString(identifier));
+  for (const Attribute& each : attributes) {
+    made->addAttributeWithKeyStringValue(each.key, each.value);
+    made->attributes().back()->setCustomKey(each.customKey);
+  }
   return made;
 }
 
-TLIndexableItem& fill(TLIndexableItem& item, TLStringView identifier,
-                      const std::vector<std::shared_ptr<TLAttribute>>& attributes) {
-  item.setIdentifier(TLString(identifier));
-  for (const auto& each : attributes) item.addAttributes(each);
-  return item;
-}
-
-// "KEY=value" of each attribute in order.
-std::vector<std::string> shown(const TLIndexableItem& item) {
-  std::vector<std::string> lines;
+// "KEY=value " of each attribute in order.
+std::string shown(const TLIndexableItem& item) {
+  std::string text;
   for (const auto& each : item.attributes()) {
-    lines.push_back(TLAttribute::keyAsString(each->key()) + "=" +
-                    platform::printable(each->stringValue()));
+    text += TLAttribute::keyAsString(each->key()) + "=" + platform::printable(each->stringValue());
+    text += ' ';
   }
-  return lines;
+  return text;
 }
 
 std::shared_ptr<TLParameters> parameters(TLStringView overrides) {
@@ -156,38 +157,38 @@ TEST(ZoneManager, ScoresAreSetWhileOthersRead) {
 }
 
 TEST(ZoneManager, MergesAttributeByAttribute) {
-  const TALZoneManager manager;
-  bool shouldIndex = false;
-  TLIndexableItem oldDoc;
-  fill(oldDoc, u"id",
-       {attribute(SUBJECT, u"old"), attribute(READ, u"no"), attribute(AUTHORS, u"ann"),
-        attribute(CUSTOM, u"kept", u"k1"), attribute(CUSTOM, u"replaced", u"k2"),
-        attribute(CUSTOM, u"nameless"), attribute(AUTHORS, u"bob")});
-
-  TLIndexableItem full;
-  const auto merged =
-      manager.mergeNewDoc(fill(full, u"id2", {attribute(SUBJECT, u"new"), attribute(READ, u"yes")}),
-                          &oldDoc, &shouldIndex);
-  EXPECT_EQ(merged->identifier(), u"id2");
-  EXPECT_EQ(shown(*merged),
-            (std::vector<std::string>{"SUBJECT=new", "READ=yes", "AUTHORS=ann", "CUSTOM=kept",
-                                      "CUSTOM=replaced", "CUSTOM=nameless", "AUTHORS=bob"}));
-  EXPECT_TRUE(shouldIndex);
-  EXPECT_EQ(full.attributes().size(), 2u);
-  EXPECT_EQ(oldDoc.attributes().size(), 7u);
-
-  TLIndexableItem custom;
-  const auto other = manager.mergeNewDoc(
-      fill(custom, u"id", {attribute(READ, u"yes"), attribute(CUSTOM, u"mine", u"k2")}), &oldDoc,
-      &shouldIndex);
-  EXPECT_EQ(shown(*other),
-            (std::vector<std::string>{"READ=yes", "CUSTOM=mine", "SUBJECT=old", "AUTHORS=ann",
-                                      "CUSTOM=kept", "CUSTOM=nameless", "AUTHORS=bob"}));
-  EXPECT_FALSE(shouldIndex);
-
-  TLIndexableItem fresh;
-  const auto first = manager.mergeNewDoc(fill(fresh, u"id", {attribute(CONTENT_TYPE, u"t")}),
-                                         nullptr, &shouldIndex);
-  EXPECT_EQ(shown(*first), (std::vector<std::string>{"CONTENT_TYPE=t"}));
-  EXPECT_TRUE(shouldIndex);
+  const auto old = item(u"old", {{SUBJECT, u"old"},
+                                 {READ, u"no"},
+                                 {AUTHORS, u"ann"},
+                                 {CUSTOM, u"kept", u"k1"},
+                                 {CUSTOM, u"replaced", u"k2"},
+                                 {CUSTOM, u"nameless"},
+                                 {AUTHORS, u"bob"}});
+  const struct {
+    std::vector<Attribute> attributes;
+    const TLIndexableItem* old;
+    std::string merged;
+    bool shouldIndex;
+  } cases[] = {
+      {{{SUBJECT, u"new"}, {READ, u"yes"}},
+       old.get(),
+       "SUBJECT=new READ=yes AUTHORS=ann CUSTOM=kept CUSTOM=replaced CUSTOM=nameless AUTHORS=bob ",
+       true},
+      {{{READ, u"yes"}, {CUSTOM, u"mine", u"k2"}},
+       old.get(),
+       "READ=yes CUSTOM=mine SUBJECT=old AUTHORS=ann CUSTOM=kept CUSTOM=nameless AUTHORS=bob ",
+       false},
+      {{{CONTENT_TYPE, u"t"}}, nullptr, "CONTENT_TYPE=t ", true},
+  };
+  const std::string before = shown(*old);
+  for (const auto& c : cases) {
+    const auto added = item(u"id", c.attributes);
+    bool shouldIndex = !c.shouldIndex;
+    const auto merged = TALZoneManager().mergeNewDoc(*added, c.old, &shouldIndex);
+    EXPECT_EQ(merged->identifier(), u"id");
+    EXPECT_EQ(shown(*merged), c.merged);
+    EXPECT_EQ(shouldIndex, c.shouldIndex) << c.merged;
+    EXPECT_EQ(added->attributes().size(), c.attributes.size());
+    EXPECT_EQ(shown(*old), before);
+  }
 }
