@@ -1,14 +1,12 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/resource.h>
-#include <sys/stat.h>
 
-#include <csignal>
 #include <filesystem>
 #include <fstream>
 
 #include "docstore/TALSqliteDocStore.h"
 #include "tests/docstore/DocStoreSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/SQLiteConnection.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -341,21 +339,14 @@ TEST_F(DocStore, ALockedDatabaseFailsWritesAndStillReads) {
 
 TEST_F(DocStore, AFailedCommitIsReportedByTheErrorOnly) {
   fill(1);
-  struct stat log {};
-  ASSERT_EQ(stat((_path + "-wal").c_str(), &log), 0);
   // The write-ahead log cannot grow from here on.
-  struct rlimit before {};
-  getrlimit(RLIMIT_FSIZE, &before);
-  const auto handler = std::signal(SIGXFSZ, SIG_IGN);
-  const struct rlimit none { static_cast<rlim_t>(log.st_size), before.rlim_max };
-  setrlimit(RLIMIT_FSIZE, &none);
   LogCapture capture;
-  std::optional<TLError> error;
-  const bool stored = _store.storeOrUpdateDocuments({{url(2), item(u"s")}}, nullptr, &error);
-  setrlimit(RLIMIT_FSIZE, &before);
-  std::signal(SIGXFSZ, handler);
-  EXPECT_TRUE(stored);
-  EXPECT_TRUE(error);
+  {
+    const testsupport::FileSizeLimit limit(std::filesystem::file_size(_path + "-wal"));
+    std::optional<TLError> error;
+    EXPECT_TRUE(_store.storeOrUpdateDocuments({{url(2), item(u"s")}}, nullptr, &error));
+    EXPECT_TRUE(error);
+  }
   EXPECT_TRUE(capture.contains("error TALSqliteDocStore: Unable to commit transaction: DocStore"));
   EXPECT_EQ(_store.count(nullptr), 1);
   EXPECT_TRUE(_store.storeOrUpdateDocuments({{url(2), item(u"s")}}, nullptr, nullptr));

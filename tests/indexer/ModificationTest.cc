@@ -37,9 +37,7 @@ class QueryModification : public testsupport::IndexerTest {
 };
 
 const TLString kThreshold = u"queryModification.sufficentRetrievalThreshold=";
-const TLString kSpellingOff = u"queryModification.enableSpellModification=NO";
 const TLString kSynonymsOff = u"queryModification.enableSynonymModification=NO";
-const TLString kStemsOff = u"queryModification.enableStemModification=NO";
 using Lines = std::vector<std::string>;
 
 }  // namespace
@@ -85,7 +83,9 @@ TEST_F(QueryModification, KeepsQueriesThatCannotBeModified) {
             "Query modification didnt work out. Return original query results.");
   EXPECT_TRUE(log.has("default TALIndexer: Stem rewrite finished without query modified."));
   log.clear();
-  EXPECT_EQ(search("bill ", kSpellingOff + u"," + kSynonymsOff + u"," + kStemsOff), "");
+  EXPECT_EQ(search("bill ", kSynonymsOff + u",queryModification.enableSpellModification=NO,"
+                                           u"queryModification.enableStemModification=NO"),
+            "");
   EXPECT_EQ(driverLines(),
             (Lines{"Query modification started for query with 1 terms",
                    "Query modification didnt work out. Return original query results."}));

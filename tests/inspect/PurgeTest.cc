@@ -19,6 +19,7 @@
 #include "tests/daemon/DaemonProcess.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"
 #include "tests/support/Programs.h"
@@ -262,7 +263,7 @@ TEST_F(PurgeTest, TheDaemonRemovesTheRemainsOfAKilledPurge) {
 TEST_F(PurgeTest, FullDiskChangesNothing) {
   for (const uint64_t bytes : {0, 1000, 20000, 60000, 150000}) {
     const int status = purgeInChild([bytes](int number, std::string_view) {
-      if (number == 0) new salttest::FileSizeLimit(bytes);
+      if (number == 0) new testsupport::FileSizeLimit(bytes);
     });
     EXPECT_FALSE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << bytes;
     EXPECT_GT(rareWordsLeft(), size_t{kDeleted}) << bytes;

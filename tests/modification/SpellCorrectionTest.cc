@@ -49,6 +49,11 @@ class SpellCorrectionTest : public testing::Test, protected testsupport::Corpus 
     ASSERT_TRUE(salttest::addZone(*index, docID, zone, text, salttest::wordOffsets(text)));
   }
 
+  // Whether this message was logged at the default level.
+  bool logs(const std::string& message) const {
+    return log.has("default TALSpellCorrection: " + message);
+  }
+
   const std::shared_ptr<TALSqliteDocStore> store =
       std::make_shared<TALSqliteDocStore>(directory / "docs.db");
   std::shared_ptr<TALTopKVocab> vocab;
@@ -132,14 +137,11 @@ TEST_F(SpellCorrectionTest, FindsTheRightWordAfterEachKindOfMistake) {
   }
   // A prefix is corrected to a prefix.
   EXPECT_EQ(correct({word("quarterly "), word("invxi")}), "[quarterly ][invoi]");
-  EXPECT_TRUE(
-      log.has("default TALSpellCorrection: No match token <\"in...\"<8 chars>> is "
-              "considered for spelling correction."));
-  EXPECT_TRUE(log.has("default TALSpellCorrection: Found 1 candidates in lexicon."));
-  EXPECT_TRUE(
-      log.has("default TALSpellCorrection: Spelling returns best candidate with overall "
-              "score: 1.610000, error score: 0.800000, text score: 0.810000. Term "
-              "<\"in...\"<8 chars>> modified with candidate <\"in...\"<8 chars>>."));
+  EXPECT_TRUE(logs("No match token <\"in...\"<8 chars>> is considered for spelling correction."));
+  EXPECT_TRUE(logs("Found 1 candidates in lexicon."));
+  EXPECT_TRUE(logs(
+      "Spelling returns best candidate with overall score: 1.610000, error score: 0.800000, text "
+      "score: 0.810000. Term <\"in...\"<8 chars>> modified with candidate <\"in...\"<8 chars>>."));
 }
 
 TEST_F(SpellCorrectionTest, ChangesOneTokenAndItsScore) {
@@ -165,24 +167,19 @@ TEST_F(SpellCorrectionTest, CandidatesAreScoredByTheWholeQueryAndTheFirstWinsTie
   EXPECT_EQ(correct({word("caqt ")}), "[cart ]");
   // No document contains both a candidate and the other word.
   EXPECT_EQ(correct({word("cazt "), word("green ")}), "-");
-  EXPECT_TRUE(
-      log.has("default TALSpellCorrection: Skipping spelling correction as more than 1 "
-              "term has no-matched document."));
+  EXPECT_TRUE(logs("Skipping spelling correction as more than 1 term has no-matched document."));
   add(4, "green ");
   EXPECT_EQ(correct({word("cazt "), word("green ")}), "-");
-  EXPECT_TRUE(
-      log.has("default TALSpellCorrection: Best spelling candidate <\"ca...\"<5 chars>> has "
-              "sub-zero textScore."));
-  EXPECT_TRUE(log.has("default TALSpellCorrection: Spelling correction returns score -1."));
+  EXPECT_TRUE(logs("Best spelling candidate <\"ca...\"<5 chars>> has sub-zero textScore."));
+  EXPECT_TRUE(logs("Spelling correction returns score -1."));
   EXPECT_EQ(correct({word("green ")}), "-");
-  EXPECT_TRUE(
-      log.has("default TALSpellCorrection: Skipping spelling correction as criteria not met."));
+  EXPECT_TRUE(logs("Skipping spelling correction as criteria not met."));
 }
 
 TEST_F(SpellCorrectionTest, CandidatesMustBeInTheTermsZonesAndWithinTheBudget) {
   add(1, "cart ", 99);
   EXPECT_EQ(correct({word("cazt ")}), "-");
-  EXPECT_TRUE(log.has("default TALSpellCorrection: No candidates found in lexicon."));
+  EXPECT_TRUE(logs("No candidates found in lexicon."));
   for (uint32_t docID = 2; docID < 8; ++docID) add(docID, "cast ", kZone - 1);
   add(9, "cast ");
   add(10, "cant ");
@@ -199,9 +196,8 @@ TEST_F(SpellCorrectionTest, UsesFrequentWordsWhereNoEditFits) {
   vocab->setVocab({"in ", "international ", "internationalisation", "internatioal", "intern "});
   EXPECT_EQ(correct({word("interantionel ")}), "[international ]");
   EXPECT_TRUE(
-      log.has("default TALSpellCorrection: Spelling did not find any candidate from edit "
-              "distance 1. Continue with topK method."));
-  EXPECT_TRUE(log.has("default TALSpellCorrection: topKVocab has 5 entries."));
+      logs("Spelling did not find any candidate from edit distance 1. Continue with topK method."));
+  EXPECT_TRUE(logs("topKVocab has 5 entries."));
   // The form of the entry decides, not that of the typed word.
   const auto candidates = spelling->_getCandidatesFromTopKVocab("interantionel", true);
   ASSERT_THAT(tokens(candidates), ElementsAre("international ", "internatioal"));

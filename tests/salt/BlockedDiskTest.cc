@@ -159,33 +159,22 @@ TEST(BlockedDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   EXPECT_TRUE(index->Validate());
 }
 
-TEST(BlockedDisk, IngestWaitsDuringACompaction) {
-  const testsupport::TemporaryDirectory directory;
-  BlockingEnv disk(".ldb");
-  const auto index = newIndexOn(&disk, directory / "i");
-  index->WaitForMaintenance();  // returns at once
-  addDocs(*index, 1);
-
-  disk.blockAfter(0);
-  std::thread compacting([&index] { index->Compact(); });
-  disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
-  compacting.join();
-}
-
-TEST(BlockedDisk, IngestWaitsDuringAMerge) {
-  const testsupport::TemporaryDirectory directory;
-  Index::Options options;
-  options.MaxHotSuffixes = 4;
-  BlockingEnv disk(".log");
-  const auto index = newIndexOn(&disk, directory / "i", options);
-  addDocs(*index, 1);
-
-  disk.blockAfter(2);  // lets the record of the merge pass, but not its pages
-  index->Vacuum();
-  disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
-  EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
+TEST(BlockedDisk, IngestWaitsDuringAMergeAndDuringACompaction) {
+  for (const bool merges : {true, false}) {
+    const testsupport::TemporaryDirectory directory;
+    Index::Options options;
+    if (merges) options.MaxHotSuffixes = 4;
+    BlockingEnv disk(merges ? ".log" : ".ldb");
+    const auto index = newIndexOn(&disk, directory / "i", options);
+    index->WaitForMaintenance();  // returns at once
+    addDocs(*index, 1);
+    disk.blockAfter(merges ? 2 : 0);  // lets the record of a merge pass, but not its pages
+    std::thread working([&] { merges ? index->Vacuum() : static_cast<void>(index->Compact()); });
+    disk.waitForWriter();
+    expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
+    working.join();
+    EXPECT_EQ(index->GetMetrics().HotSuffixes == 0, merges);
+  }
 }
 
 // A merge that would run for long, in an index that nobody needs any more.

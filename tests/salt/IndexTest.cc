@@ -6,6 +6,7 @@
 
 #include "salt/Index.h"
 #include "tests/salt/SaltSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -91,7 +92,7 @@ TEST(Writes, FailOnAFullDisk) {
   const auto index = newIndex(directory / "i");
   ASSERT_TRUE(addZone(*index, 1, 1, "first"));
   const auto log = salttest::newestLog(directory / "i");
-  const salttest::FileSizeLimit limit(std::filesystem::file_size(log) + 10);
+  const testsupport::FileSizeLimit limit(std::filesystem::file_size(log) + 10);
   EXPECT_FALSE(index->DeleteDoc(1));
   EXPECT_FALSE(addZone(*index, 2, 1, std::string(5000, 'z')));
   EXPECT_EQ(index->GetMetrics().DeletedDocs, 0u);

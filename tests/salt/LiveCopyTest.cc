@@ -5,6 +5,7 @@
 #include "salt/Inspection.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -135,7 +136,7 @@ TEST_F(LiveCopyTest, AWriteThatFailsIsAnError) {
   gone.clear();
   fill(3);
   for (const uint64_t bytes : {0, 100, 4000, 20000}) {
-    const salttest::FileSizeLimit limit(bytes);
+    const testsupport::FileSizeLimit limit(bytes);
     EXPECT_EQ(copy(), std::nullopt) << bytes;
     ASSERT_TRUE(error) << bytes;
     EXPECT_EQ(error->domain, kPOSIXErrorDomain);

@@ -2,7 +2,6 @@
 
 #include <fmt/format.h>
 #include <gtest/gtest.h>
-#include <signal.h>
 
 #include <algorithm>
 #include <sstream>
@@ -54,17 +53,6 @@ std::vector<std::filesystem::path> filesOf(const std::string& path, std::string_
 
 std::filesystem::path newestLog(const std::string& path) {
   return filesOf(path, ".log").back();  // names are numbers of equal width
-}
-
-FileSizeLimit::FileSizeLimit(uint64_t bytes) {
-  signal(SIGXFSZ, SIG_IGN);
-  getrlimit(RLIMIT_FSIZE, &_before);
-  const rlimit low{bytes, _before.rlim_max};
-  TL_ASSERT(setrlimit(RLIMIT_FSIZE, &low) == 0);
-}
-
-FileSizeLimit::~FileSizeLimit() {
-  setrlimit(RLIMIT_FSIZE, &_before);
 }
 
 std::unique_ptr<salt::Index> newIndex(const std::string& path, salt::Index::Options options) {

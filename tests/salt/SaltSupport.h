@@ -1,7 +1,5 @@
 #pragma once
 
-#include <sys/resource.h>
-
 #include <filesystem>
 #include <functional>
 #include <memory>
@@ -32,19 +30,6 @@ void editKey(const std::string& path, const std::string& key, const std::string*
 
 // The newest write-ahead log of the database at `path`.
 [[nodiscard]] std::filesystem::path newestLog(const std::string& path);
-
-// During its lifetime, a write that exceeds this file size fails after a partial write, as on a
-// full disk.
-class FileSizeLimit {
- public:
-  explicit FileSizeLimit(uint64_t bytes);
-  ~FileSizeLimit();
-  FileSizeLimit(const FileSizeLimit&) = delete;
-  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
-
- private:
-  rlimit _before{};
-};
 
 [[nodiscard]] std::unique_ptr<salt::Index> newIndex(const std::string& path,
                                                     salt::Index::Options options = {});

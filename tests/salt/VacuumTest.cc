@@ -7,6 +7,7 @@
 #include "salt/Index.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -166,8 +167,8 @@ TEST(Vacuum, AFailedWriteEndsAMergeAndLosesNothing) {
     ASSERT_TRUE(index);
     {
       const testsupport::LogCapture log;
-      const salttest::FileSizeLimit limit(std::filesystem::file_size(salttest::newestLog(path)) +
-                                          room);
+      const testsupport::FileSizeLimit limit(std::filesystem::file_size(salttest::newestLog(path)) +
+                                             room);
       vacuum(*index);
       EXPECT_EQ(log.count("error SALT: Error writing to db: "), 1u);
     }

@@ -6,6 +6,7 @@
 #include "salt/IndexImpl.h"
 #include "salt/ZoneTextCache.h"
 #include "tests/salt/SaltSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
@@ -60,7 +61,7 @@ TEST_F(ZoneTextCacheTest, GivesTheSameWithAFileOfAnyLength) {
 TEST_F(ZoneTextCacheTest, WorksWhenTheFileCannotGrow) {
   salt::ZoneTextCache texts(index());
   {
-    const salttest::FileSizeLimit limit(100000);
+    const testsupport::FileSizeLimit limit(100000);
     expectAllTexts(&texts);
   }
   expectAllTexts(&texts);
