@@ -114,6 +114,7 @@ void expectWaiting(BlockingEnv* disk, const Waits& waits) {
   std::atomic<bool> released = false;
   std::thread releasing([&] {
     while (!begins) std::this_thread::yield();
+    for (int i = 0; i < 1000; ++i) std::this_thread::yield();  // what does not wait ends meanwhile
     released = true;
     disk->release();
   });
