@@ -14,6 +14,8 @@ namespace salt {
 template <typename T>
 class DocPages {
  public:
+  static constexpr uint32_t kPageDocs = 512;
+
   [[nodiscard]] T& operator[](uint32_t docID) {
     const size_t page = docID / kPageDocs;
     if (page >= _pages.size()) _pages.resize(page + 1);
@@ -26,6 +28,11 @@ class DocPages {
     const size_t page = docID / kPageDocs;
     if (page >= _pages.size() || _pages[page] == nullptr) return T();
     return _pages[page][docID % kPageDocs];
+  }
+
+  // The values of the documents from page * kPageDocs on; null when none of them has one.
+  [[nodiscard]] const T* page(size_t page) const {
+    return page < _pages.size() ? _pages[page].get() : nullptr;
   }
 
   // Combines with the values of `other` by |=.
@@ -58,8 +65,6 @@ class DocPages {
   }
 
  private:
-  static constexpr uint32_t kPageDocs = 512;
-
   std::vector<std::unique_ptr<T[]>> _pages;
 };
 

@@ -4,6 +4,7 @@
 #include <bit>
 
 #include "salt/Coding.h"
+#include "salt/ZoneMask.h"
 
 namespace salt {
 
@@ -69,20 +70,23 @@ void PostingSet::add(PostingSet&& other) {
   _others.insert(_others.end(), other._others.begin(), other._others.end());
 }
 
-PostingSet::Adder::Adder(PostingSet* set, const std::vector<uint16_t>& zones)
-    : _set(*set), _zones(zones) {
+PostingSet::Adder::Adder(PostingSet* set, const std::vector<uint16_t>& zones,
+                         const std::vector<uint32_t>& masks)
+    : _set(*set), _zones(zones), _masks(masks) {
   bool all = true;
   for (const uint16_t zone : zones) all = set->bitOf(zone) != 0 && all;
-  if (all) _bits.emplace(zones, [set](uint16_t zone) { return set->bitOf(zone); });
+  if (!all) return;
+  ZoneMaskMap bits(zones, [set](uint16_t zone) { return set->bitOf(zone); });
+  for (const uint32_t mask : masks) _translated.push_back(bits.of(mask));
 }
 
-void PostingSet::Adder::addOneByOne(const DocZones& doc) {
-  for (uint32_t mask = doc.zones; mask != 0; mask &= mask - 1) {
+void PostingSet::Adder::addOneByOne(uint32_t docID, uint32_t mask) {
+  for (; mask != 0; mask &= mask - 1) {
     const uint16_t zone = _zones[static_cast<size_t>(std::countr_zero(mask))];
     if (const uint32_t bit = _set.bitOf(zone); bit != 0) {
-      _set._masks[doc.DocID] |= bit;
+      _set._masks[docID] |= bit;
     } else {
-      _set._others.push_back({doc.DocID, zone});
+      _set._others.push_back({docID, zone});
     }
   }
 }

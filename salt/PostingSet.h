@@ -3,7 +3,6 @@
 #include <array>
 #include <cstdint>
 #include <memory>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -11,7 +10,6 @@
 #include "platform/Mutex.h"
 #include "salt/DocPages.h"
 #include "salt/Index.h"
-#include "salt/ZoneMask.h"
 
 namespace salt {
 
@@ -51,33 +49,46 @@ class PostingSet {
   // The two sets must have the same table and not count the same suffix.
   void add(PostingSet&& other);
 
-  // Adds documents whose zone bits index one list. Their suffixes are counted separately, by
-  // addSuffixes.
+  // Adds documents that have the zones of one of `masks`, whose bits index `zones`. Their suffixes
+  // are counted separately, by addSuffixes. Set and lists outlive it.
   class Adder {
    public:
-    Adder(PostingSet* set, const std::vector<uint16_t>& zones);
+    Adder(PostingSet* set, const std::vector<uint16_t>& zones, const std::vector<uint32_t>& masks);
 
-    void add(const DocZones& doc) {
-      if (_bits) {
-        _set._masks[doc.DocID] |= _bits->of(doc.zones);
+    // Adds a document with the zones of masks[mask].
+    void add(uint32_t docID, size_t mask) {
+      if (_translated.empty()) {
+        addOneByOne(docID, _masks[mask]);
       } else {
-        addOneByOne(doc);
+        at(docID) |= _translated[mask];
       }
     }
 
    private:
-    void addOneByOne(const DocZones& doc);
+    void addOneByOne(uint32_t docID, uint32_t mask);
+    // The set's mask of a document; fast when it is near the one before.
+    uint32_t& at(uint32_t docID) {
+      constexpr uint32_t kPageDocs = DocPages<uint32_t>::kPageDocs;
+      if (_page == nullptr || docID / kPageDocs != _number) {
+        _number = docID / kPageDocs;
+        _page = &_set._masks[_number * kPageDocs];
+      }
+      return _page[docID % kPageDocs];
+    }
 
     PostingSet& _set;
     const std::vector<uint16_t>& _zones;
-    std::optional<ZoneMaskMap> _bits;  // nullopt when no bit is left for one of them
+    const std::vector<uint32_t>& _masks;
+    std::vector<uint32_t> _translated;  // the masks in bits of the table; empty if it has too few
+    uint32_t _number = 0;
+    uint32_t* _page = nullptr;  // number _number of the set
   };
   void addSuffixes(uint64_t count) { _suffixes += count; }
 
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
 
-  // The zones of a document as bits of the table, 0 for none.
-  [[nodiscard]] uint32_t mask(uint32_t docID) const { return _masks.at(docID); }
+  // The zones of each document as bits of the table, 0 for none.
+  [[nodiscard]] const DocPages<uint32_t>& masks() const { return _masks; }
   // Calls visit(docID, mask) in DocID order for each document with a mask.
   template <typename Visit>
   void forEach(const Visit& visit) const {
@@ -109,6 +120,30 @@ class PostingSet {
   std::vector<Place> _others;
 };
 
+// Looks up documents in masks, fast when they are mostly near the one before. One thread; the masks
+// outlive it and do not change.
+class MaskReader {
+ public:
+  explicit MaskReader(const DocPages<uint32_t>& masks) : _masks(&masks) { turnTo(0); }
+
+  // 0 for none.
+  [[nodiscard]] uint32_t mask(uint32_t docID) {
+    const uint32_t page = docID / DocPages<uint32_t>::kPageDocs;
+    if (page != _number) turnTo(page);
+    return _page == nullptr ? 0 : _page[docID % DocPages<uint32_t>::kPageDocs];
+  }
+
+ private:
+  void turnTo(uint32_t page) {
+    _number = page;
+    _page = _masks->page(page);
+  }
+
+  const DocPages<uint32_t>* _masks;
+  uint32_t _number = 0;
+  const uint32_t* _page = nullptr;
+};
+
 // What a scan has found for one prefix. Any thread; the index outlives it.
 class FoundPlaces {
  public:
@@ -127,17 +162,30 @@ class FoundPlaces {
   }
   // The zones that the bits of masks stand for.
   [[nodiscard]] std::vector<uint16_t> zones() const { return _hot->table().zones(); }
-  [[nodiscard]] uint32_t mask(uint32_t docID) const {
-    return _hot->mask(docID) | _pages->mask(docID);
-  }
   // Calls visit(docID, mask) once for each document with a mask.
   template <typename Visit>
   void forEach(const Visit& visit) const {
-    _pages->forEach([&](uint32_t docID, uint32_t mask) { visit(docID, mask | _hot->mask(docID)); });
+    MaskReader hot(_hot->masks());
+    _pages->forEach([&](uint32_t docID, uint32_t mask) { visit(docID, mask | hot.mask(docID)); });
+    MaskReader pages(_pages->masks());
     _hot->forEach([&](uint32_t docID, uint32_t mask) {
-      if (_pages->mask(docID) == 0) visit(docID, mask);
+      if (pages.mask(docID) == 0) visit(docID, mask);
     });
   }
+
+  // Looks up the masks of documents. One thread; the places outlive it.
+  class Reader {
+   public:
+    explicit Reader(const FoundPlaces& found)
+        : _hot(found._hot->masks()), _pages(found._pages->masks()) {}
+
+    // The zones of a document, 0 for none.
+    [[nodiscard]] uint32_t mask(uint32_t docID) { return _hot.mask(docID) | _pages.mask(docID); }
+
+   private:
+    MaskReader _hot;
+    MaskReader _pages;
+  };
 
  private:
   std::shared_ptr<const PostingSet> _hot;

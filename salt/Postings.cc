@@ -7,10 +7,11 @@
 #include <bit>
 #include <cerrno>
 #include <cstring>
-#include <optional>
+#include <map>
 
 #include "platform/Files.h"
 #include "platform/Paths.h"
+#include "salt/BitCoding.h"
 #include "salt/Coding.h"
 #include "salt/Database.h"
 
@@ -19,7 +20,7 @@ namespace salt {
 namespace {
 
 struct Header {
-  char magic[8] = {'T', 'A', 'L', 'P', 'O', 'S', 'T', '1'};
+  char magic[8] = {'T', 'A', 'L', 'P', 'O', 'S', 'T', '2'};
   int64_t indexCreated = 0;
   uint64_t fileBytes = 0;
   uint32_t tableBytes = 0;
@@ -33,7 +34,6 @@ static_assert(sizeof(Header) == 48);
 constexpr size_t kMaxZones = 32;
 constexpr size_t kSumBytes = 4;  // before each list
 constexpr uint32_t kMaxTableBytes = uint32_t{1} << 28;
-constexpr uint32_t kMaxStep = uint32_t{1} << 30;
 constexpr uint64_t kMinBudget = 64 * 1024;
 // A suffix takes about eleven bytes of the index, so this limits posting lists to a twentieth.
 constexpr uint64_t kSuffixesPerByte = 2;
@@ -88,6 +88,7 @@ class Input {
   }
 
   [[nodiscard]] bool empty() const { return _bytes.empty(); }
+  [[nodiscard]] std::string_view rest() const { return _bytes; }
 
   bool good = true;
 
@@ -129,7 +130,7 @@ std::shared_ptr<const Postings> Postings::open(const std::string& directory,
   }
   std::shared_ptr<Postings> postings(new Postings(std::move(file)));
   if (postings->readTable(owner)) return postings;
-  Log.error("Postings in {} are not used: damaged, or of another index", path);
+  Log.error("Postings in {} are not used: damaged, or of another index or version", path);
   (void)removePostings(directory, owner.shard);
   return nullptr;
 }
@@ -184,8 +185,6 @@ const Postings::Entry* Postings::find(std::string_view prefix) const {
   return found ? &*entry : nullptr;
 }
 
-// A list has for each document: its DocID delta times 4, plus 1 if its zone mask follows (else it
-// has the mask of the previous one), plus 2 if its number of suffixes follows (else 1).
 bool Postings::add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const {
   const Entry* const entry = find(prefix);
   if (entry == nullptr) return false;
@@ -195,28 +194,36 @@ bool Postings::add(std::string_view prefix, const DocSet& deleted, PostingSet* p
     std::memcpy(&sum, bytes.data(), sizeof sum);
   }
   const std::string_view list = std::string_view(bytes).substr(kSumBytes);
-  if (sum != static_cast<uint32_t>(sumOf(list))) {
-    Log.error("Postings cannot be read");
-    return false;
-  }
+  if (sum == static_cast<uint32_t>(sumOf(list)) && addList(list, deleted, places)) return true;
+  Log.error("Postings cannot be read");
+  return false;
+}
+
+// A list has the number of documents and the different zone masks, the most frequent first; then
+// for each document, as gamma codes, its distance from the one before, the number of its mask in
+// the list, from 1, and its suffixes.
+bool Postings::addList(std::string_view list, const DocSet& deleted, PostingSet* places) const {
   Input input(list);
-  uint64_t suffixes = 0;
-  uint32_t docID = 0;
-  uint32_t mask = 0;
+  const uint32_t docs = input.varint();
+  std::vector<uint32_t> masks(std::min<size_t>(input.varint(), list.size()));
   const uint32_t allZones =
       _zones.size() == kMaxZones ? UINT32_MAX : (uint32_t{1} << _zones.size()) - 1;
-  PostingSet::Adder adder(places, _zones);
-  while (!input.empty() && input.good) {
-    const uint32_t step = input.varint();
-    docID += step / 4;
-    if ((step & 1) != 0) mask = input.varint() & allZones;
-    const uint32_t count = (step & 2) != 0 ? input.varint() : 1;
-    if (deleted.contains(docID)) continue;
-    adder.add({docID, mask});
+  for (uint32_t& mask : masks) mask = input.varint() & allZones;
+  if (!input.good) return false;
+  BitReader bits(input.rest());
+  PostingSet::Adder adder(places, _zones, masks);
+  uint64_t suffixes = 0;
+  uint32_t next = 0;  // after the document before
+  for (uint32_t i = 0; i < docs; ++i) {
+    const auto [step, mask, count] = bits.threeGammas();
+    next += step;
+    if (!bits.good || mask > masks.size()) return false;
+    if (deleted.contains(next - 1)) continue;
+    adder.add(next - 1, mask - 1);
     suffixes += count;
   }
-  if (input.good) places->addSuffixes(suffixes);
-  return input.good;
+  places->addSuffixes(suffixes);
+  return true;
 }
 
 // --- Building
@@ -261,24 +268,50 @@ void PostingsBuilder::fold() {
 void PostingsBuilder::make(Node* node, std::string text, size_t above) {
   count(node, _pending.size());
   std::string list(kSumBytes, '\0');
-  uint32_t before = 0;
-  uint32_t mask = 0;
-  node->counts->forEach([&](uint32_t docID, const Counts& counts) {
-    if (counts.suffixes == 0) return;
-    if (docID - before >= kMaxStep) _unfit = true;
-    const bool otherMask = counts.mask != mask;
-    const bool several = counts.suffixes != 1;
-    appendVarint(&list, (docID - before) * 4 + (several ? 2 : 0) + (otherMask ? 1 : 0));
-    if (otherMask) appendVarint(&list, counts.mask);
-    if (several) appendVarint(&list, counts.suffixes);
-    before = docID;
-    mask = counts.mask;
-  });
+  appendList(*node->counts, &list);
   const auto sum = static_cast<uint32_t>(sumOf(std::string_view(list).substr(kSumBytes)));
   std::memcpy(list.data(), &sum, sizeof sum);
   _madeBytes += list.size() + text.size();
   _made.push_back({std::move(text), static_cast<uint8_t>(above), node->counted, std::move(list)});
   if (_madeBytes > 2 * budget()) prune(budget());
+}
+
+void PostingsBuilder::appendList(const DocPages<Counts>& counts, std::string* list) {
+  const auto forEachDoc = [&counts](const auto& visit) {
+    counts.forEach([&visit](uint32_t docID, const Counts& of) {
+      if (of.suffixes != 0) visit(docID, of);
+    });
+  };
+  uint32_t docs = 0;
+  std::map<uint32_t, uint32_t>
+      ofMask;  // first the number of documents, then the number of the mask
+  forEachDoc([&](uint32_t, const Counts& of) {
+    ++docs;
+    ++ofMask[of.mask];
+  });
+  std::vector<std::pair<uint32_t, uint32_t>> masks(ofMask.begin(), ofMask.end());
+  std::stable_sort(masks.begin(), masks.end(),
+                   [](const auto& left, const auto& right) { return left.second > right.second; });
+  appendVarint(list, docs);
+  appendVarint(list, static_cast<uint32_t>(masks.size()));
+  for (uint32_t number = 1; const auto& [mask, frequency] : masks) {
+    appendVarint(list, mask);
+    ofMask[mask] = number++;
+  }
+  BitWriter bits(list);
+  uint32_t next = 0;
+  forEachDoc([&](uint32_t docID, const Counts& of) {
+    const uint32_t step = docID - next + 1;
+    if (step > kMaxGamma || of.suffixes > kMaxGamma) {
+      _unfit = true;
+      return;
+    }
+    bits.putGamma(step);
+    bits.putGamma(ofMask[of.mask]);
+    bits.putGamma(of.suffixes);
+    next = docID + 1;
+  });
+  bits.finish();
 }
 
 uint64_t PostingsBuilder::budget() const {

@@ -66,6 +66,9 @@ class Postings {
   [[nodiscard]] std::string_view textOf(const Entry& entry) const {
     return std::string_view(_texts).substr(entry.text, entry.length);
   }
+  // False when the list is invalid.
+  [[nodiscard]] bool addList(std::string_view list, const DocSet& deleted,
+                             PostingSet* places) const;
   // Null when the prefix has no entry.
   [[nodiscard]] const Entry* find(std::string_view prefix) const;
 
@@ -151,6 +154,7 @@ class PostingsBuilder {
     return node.counted + _pending.size() - node.begin;
   }
   void make(Node* node, std::string text, size_t above);
+  void appendList(const DocPages<Counts>& counts, std::string* list);
   // Adds the node's suffixes in _pending before `end` to its counts.
   void count(Node* node, size_t end);
   // Adds the pending suffixes to the counts of the large open nodes, and drops those that no other

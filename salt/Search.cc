@@ -109,7 +109,7 @@ class Searching {
       _matches[u] = matches(u);
       if (!_selective) admit(*_matches[u], [](uint32_t) { return true; });
     }
-    const TermMatches& matches = *_matches[u];
+    TermMatches& matches = *_matches[u];
     const auto maskOf = [&](size_t token, size_t i) { return matches.mask(token, _docs[i].docID); };
     _evaluation.apply(u, maskOf, _docs);
     _matches[u].reset();
@@ -124,7 +124,7 @@ class Searching {
 
   // Adds the documents of the matches that are not yet in _docs and are wanted.
   template <typename Wanted>
-  void admit(const TermMatches& matches, const Wanted& wanted) {
+  void admit(TermMatches& matches, const Wanted& wanted) {
     matches.forEach([&](uint32_t docID, uint32_t) {
       if (wanted(docID) && !std::exchange(_admitted[docID], true)) _docs.push_back({docID});
     });

@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "salt/Search.h"
+#include "salt/ZoneMask.h"
 
 // How the fields of terms determine a document's score, shared by all evaluators of queries.
 namespace saltsearch {
@@ -68,20 +69,18 @@ class Evaluation {
   void apply(size_t u, const MaskOf& maskOf, std::vector<Standing>& docs) const {
     const Step& step = _steps[u];
     const Term& term = _terms[u];
-    uint32_t latestMask = 0;  // neighbouring documents mostly match in the same zones
-    double latestFactor = zoneFactor(term, latestMask);
+    salt::MaskMemo<double> factors;
+    const auto factorOf = [&term](uint32_t zoneMask) { return zoneFactor(term, zoneMask); };
     for (size_t i = 0; i < docs.size(); ++i) {
       DocResult match;
       for (size_t t = 0; t < term.tokens.size(); ++t) {
         take(step, term, t, maskOf(t, i), docs[i], match);
       }
       if (!docs[i].in) continue;
-      if (match.zoneMask != latestMask) {
-        latestMask = match.zoneMask;
-        latestFactor = zoneFactor(term, latestMask);
-      }
       double& score = docs[i].score;
-      score *= match.tokenScore == kNoMatch ? term.defaultScore : match.tokenScore * latestFactor;
+      score *= match.tokenScore == kNoMatch
+                   ? term.defaultScore
+                   : match.tokenScore * factors.of(match.zoneMask, factorOf);
       if (step.prunes && score < step.need) docs[i].in = false;
     }
   }
