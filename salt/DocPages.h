@@ -30,6 +30,8 @@ class DocPages {
     return _pages[page][docID % kPageDocs];
   }
 
+  // The number of pages up to the last one in use.
+  [[nodiscard]] size_t pages() const { return _pages.size(); }
   // The values of the documents from page * kPageDocs on; null when none of them has one.
   [[nodiscard]] const T* page(size_t page) const {
     return page < _pages.size() ? _pages[page].get() : nullptr;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <array>
 #include <cstdint>
 #include <memory>
@@ -120,6 +121,9 @@ class PostingSet {
   std::vector<Place> _others;
 };
 
+// The masks of the documents of one page.
+using MaskPage = std::array<uint32_t, DocPages<uint32_t>::kPageDocs>;
+
 // Looks up documents in masks, fast when they are mostly near the one before. One thread; the masks
 // outlive it and do not change.
 class MaskReader {
@@ -171,6 +175,19 @@ class FoundPlaces {
     _hot->forEach([&](uint32_t docID, uint32_t mask) {
       if (pages.mask(docID) == 0) visit(docID, mask);
     });
+  }
+
+  // The number of pages of masks; see DocPages.
+  [[nodiscard]] size_t pages() const {
+    return std::max(_hot->masks().pages(), _pages->masks().pages());
+  }
+  // Adds to each of `out` what of `bits` is in the mask of a document of the page.
+  void addPage(size_t page, uint32_t bits, MaskPage* out) const {
+    for (const auto& set : {_hot.get(), _pages.get()}) {
+      const uint32_t* const masks = set->masks().page(page);
+      if (masks == nullptr) continue;
+      for (size_t i = 0; i < out->size(); ++i) (*out)[i] |= masks[i] & bits;
+    }
   }
 
   // Looks up the masks of documents. One thread; the places outlive it.

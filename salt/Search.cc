@@ -61,11 +61,25 @@ class Searching {
         required.begin(), required.end(),
         [this](size_t u, size_t v) { return _matches[u]->suffixes() < _matches[v]->suffixes(); });
     std::erase(required, rarest);
-    admit(*_matches[rarest], [&](uint32_t docID) {
-      return std::all_of(required.begin(), required.end(),
-                         [&](size_t u) { return _matches[u]->contains(docID); });
-    });
+    for (size_t page = 0; page < _matches[rarest]->pages(); ++page) {
+      admitPage(page, *_matches[rarest], required);
+    }
     _selective = true;
+  }
+
+  // Adds the documents of a page that `rarest` and all terms of `required` match. The loops over
+  // the page have no branches, so that the compiler uses vector instructions.
+  void admitPage(size_t page, const TermMatches& rarest, const std::vector<size_t>& required) {
+    salt::MaskPage all;
+    rarest.matchPage(page, &all);
+    for (const size_t u : required) {
+      salt::MaskPage one;
+      _matches[u]->matchPage(page, &one);
+      for (size_t i = 0; i < all.size(); ++i) all[i] = one[i] != 0 ? all[i] : 0;
+    }
+    for (size_t i = 0; i < all.size(); ++i) {
+      if (all[i] != 0) _docs.push_back({static_cast<uint32_t>(page * all.size() + i)});
+    }
   }
 
   // Scans for the tokens of term u, and in the same pass for those of later terms that are wanted
@@ -107,7 +121,7 @@ class Searching {
       if (nothingCanChange(u)) return setFound(_index, _terms[u]);
       if (_found[u].empty()) scanFrom(u, [](size_t) { return true; });
       _matches[u] = matches(u);
-      if (!_selective) admit(*_matches[u], [](uint32_t) { return true; });
+      if (!_selective) admit(*_matches[u]);
     }
     TermMatches& matches = *_matches[u];
     const auto maskOf = [&](size_t token, size_t i) { return matches.mask(token, _docs[i].docID); };
@@ -122,11 +136,10 @@ class Searching {
            std::none_of(_docs.begin(), _docs.end(), [](const Standing& doc) { return doc.in; });
   }
 
-  // Adds the documents of the matches that are not yet in _docs and are wanted.
-  template <typename Wanted>
-  void admit(TermMatches& matches, const Wanted& wanted) {
+  // Adds the documents of the matches that are not yet in _docs.
+  void admit(TermMatches& matches) {
     matches.forEach([&](uint32_t docID, uint32_t) {
-      if (wanted(docID) && !std::exchange(_admitted[docID], true)) _docs.push_back({docID});
+      if (!std::exchange(_admitted[docID], true)) _docs.push_back({docID});
     });
   }
 

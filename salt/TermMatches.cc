@@ -1,5 +1,6 @@
 #include "salt/TermMatches.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "salt/TermRules.h"
@@ -46,6 +47,25 @@ TermMatches::TermMatches(const salt::Index& index, Term& term, Found found, size
     });
   }
   term.found = term.found || _suffixes != 0;
+}
+
+size_t TermMatches::pages() const {
+  size_t count = 0;
+  for (const Token& token : _tokens) {
+    count = std::max(count, token.found ? token.found->pages() : token.masks.pages());
+  }
+  return count;
+}
+
+void TermMatches::matchPage(size_t page, salt::MaskPage* out) const {
+  out->fill(0);
+  for (const Token& token : _tokens) {
+    if (token.found) {
+      token.found->addPage(page, _zones.effective(), out);
+    } else if (const uint32_t* const masks = token.masks.page(page); masks != nullptr) {
+      for (size_t i = 0; i < out->size(); ++i) (*out)[i] |= masks[i];
+    }
+  }
 }
 
 void setFound(const salt::Index& index, Term& term) {

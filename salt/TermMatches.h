@@ -36,13 +36,10 @@ class TermMatches {
     Token& of = _tokens[token];
     return of.reader ? _zones.of(of.reader->mask(docID)) : of.masks.at(docID);
   }
-  // Whether any token matches the document.
-  [[nodiscard]] bool contains(uint32_t docID) {
-    for (size_t t = 0; t < _tokens.size(); ++t) {
-      if (mask(t, docID) != 0) return true;
-    }
-    return false;
-  }
+  // The number of pages of documents up to the last one with a match; see DocPages.
+  [[nodiscard]] size_t pages() const;
+  // Sets `out` to something other than 0 for the documents of the page that any token matches.
+  void matchPage(size_t page, salt::MaskPage* out) const;
 
   // Calls visit(docID, mask) for each document of each token, once for a token.
   template <typename Visit>

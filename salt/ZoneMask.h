@@ -40,8 +40,14 @@ class ZoneMaskMap {
   // bitOf(zone) is the mask that stands for a zone: one bit, several or none.
   template <typename BitOf>
   ZoneMaskMap(const std::vector<uint16_t>& zones, const BitOf& bitOf) {
-    for (const uint16_t zone : zones) _bits.push_back(bitOf(zone));
+    for (const uint16_t zone : zones) {
+      _bits.push_back(bitOf(zone));
+      if (_bits.back() != 0) _effective |= uint32_t{1} << (_bits.size() - 1);
+    }
   }
+
+  // The bits that have a result other than 0.
+  [[nodiscard]] uint32_t effective() const { return _effective; }
 
   [[nodiscard]] uint32_t of(uint32_t mask) {
     return _memo.of(mask, [this](uint32_t bits) { return translate(bits); });
@@ -57,6 +63,7 @@ class ZoneMaskMap {
   }
 
   std::vector<uint32_t> _bits;
+  uint32_t _effective = 0;
   MaskMemo<uint32_t> _memo;
 };
 
