@@ -1,55 +1,25 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sqlite3.h>
-#include <sys/resource.h>
-#include <sys/stat.h>
 
-#include <csignal>
 #include <filesystem>
 #include <fstream>
 
 #include "docstore/TALSqliteDocStore.h"
 #include "tests/docstore/DocStoreSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/SQLiteConnection.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using testing::ElementsAre;
 using testsupport::item;
 using testsupport::LogCapture;
+using testsupport::SQLiteConnection;
 using testsupport::subjectOf;
 using testsupport::TemporaryDirectory;
 using testsupport::url;
 
 namespace {
-
-// Another connection to the database file of the store.
-class Connection {
- public:
-  explicit Connection(const std::string& path) {
-    EXPECT_EQ(sqlite3_open(path.c_str(), &_database), SQLITE_OK);
-  }
-  ~Connection() { sqlite3_close(_database); }
-  Connection(const Connection&) = delete;
-  Connection& operator=(const Connection&) = delete;
-
-  void run(const std::string& query) {
-    EXPECT_EQ(sqlite3_exec(_database, query.c_str(), nullptr, nullptr, nullptr), SQLITE_OK)
-        << sqlite3_errmsg(_database);
-  }
-  // The first column of the first row.
-  std::string ask(const std::string& query) {
-    std::string result;
-    const auto keep = [](void* out, int, char** values, char**) {
-      *static_cast<std::string*>(out) = values[0] != nullptr ? values[0] : "NULL";
-      return 0;
-    };
-    EXPECT_EQ(sqlite3_exec(_database, query.c_str(), keep, &result, nullptr), SQLITE_OK);
-    return result;
-  }
-
- private:
-  sqlite3* _database = nullptr;
-};
 
 class DocStore : public testing::Test {
  protected:
@@ -157,7 +127,7 @@ TEST_F(DocStore, KeepsTheRetainedCopyOnly) {
       _store.storeOrUpdateDocuments({{url(1), document}, {url(2), anonymous}}, &ids, nullptr));
   EXPECT_TRUE(_store.documentWithID(ids.at(url(1)), nullptr)->isEqual(*expected));
   EXPECT_TRUE(_store.documentWithURL(url(1), nullptr)->isEqual(*expected));
-  EXPECT_EQ(Connection(_path).ask("SELECT length(doc) FROM docstore WHERE docid = 2"), "0");
+  EXPECT_EQ(SQLiteConnection(_path).ask("SELECT length(doc) FROM docstore WHERE docid = 2"), "0");
   EXPECT_EQ(_store.retainedAttributes().size(), 6U);
 }
 
@@ -287,7 +257,7 @@ TEST_F(DocStore, MetadataHoldsAnyBytes) {
   EXPECT_TRUE(_store.setMetadataValue("", "empty", nullptr));
   EXPECT_EQ(_store.metadataValueForKey("k'ey", nullptr), value);
   EXPECT_EQ(_store.metadataValueForKey("empty", nullptr), "");
-  EXPECT_EQ(Connection(_path).ask("SELECT typeof(value) FROM metadata WHERE key = 'k''ey'"),
+  EXPECT_EQ(SQLiteConnection(_path).ask("SELECT typeof(value) FROM metadata WHERE key = 'k''ey'"),
             "text");
   EXPECT_TRUE(capture.has("debug TALSqliteDocStore: metadataValueForKey for key none"));
   EXPECT_TRUE(capture.has("debug TALSqliteDocStore: setMetadataValue for key k'ey"));
@@ -299,7 +269,7 @@ TEST_F(DocStore, TopKVocabularyIsOneRow) {
   _store.storeTopKVocab("one", nullptr);
   _store.storeTopKVocab(std::string("t\0o", 3), nullptr);
   EXPECT_EQ(_store.loadTopKVocab(nullptr), std::string("t\0o", 3));
-  EXPECT_EQ(Connection(_path).ask("SELECT count(*) FROM topkvocab"), "1");
+  EXPECT_EQ(SQLiteConnection(_path).ask("SELECT count(*) FROM topkvocab"), "1");
   EXPECT_THAT(capture.lines(),
               ElementsAre("debug TALSqliteDocStore: Starting to load TopK vocab.",
                           "debug TALSqliteDocStore: No data loaded from table topkvocab",
@@ -326,7 +296,7 @@ TEST_F(DocStore, ResetKeepsTheVersionOnly) {
 
 TEST_F(DocStore, ALockedDatabaseFailsWritesAndStillReads) {
   fill(2);
-  Connection other(_path);
+  SQLiteConnection other(_path);
   other.run("BEGIN IMMEDIATE");
   LogCapture capture;
   std::optional<TLError> error;
@@ -369,21 +339,14 @@ TEST_F(DocStore, ALockedDatabaseFailsWritesAndStillReads) {
 
 TEST_F(DocStore, AFailedCommitIsReportedByTheErrorOnly) {
   fill(1);
-  struct stat log {};
-  ASSERT_EQ(stat((_path + "-wal").c_str(), &log), 0);
   // The write-ahead log cannot grow from here on.
-  struct rlimit before {};
-  getrlimit(RLIMIT_FSIZE, &before);
-  const auto handler = std::signal(SIGXFSZ, SIG_IGN);
-  const struct rlimit none { static_cast<rlim_t>(log.st_size), before.rlim_max };
-  setrlimit(RLIMIT_FSIZE, &none);
   LogCapture capture;
-  std::optional<TLError> error;
-  const bool stored = _store.storeOrUpdateDocuments({{url(2), item(u"s")}}, nullptr, &error);
-  setrlimit(RLIMIT_FSIZE, &before);
-  std::signal(SIGXFSZ, handler);
-  EXPECT_TRUE(stored);
-  EXPECT_TRUE(error);
+  {
+    const testsupport::FileSizeLimit limit(std::filesystem::file_size(_path + "-wal"));
+    std::optional<TLError> error;
+    EXPECT_TRUE(_store.storeOrUpdateDocuments({{url(2), item(u"s")}}, nullptr, &error));
+    EXPECT_TRUE(error);
+  }
   EXPECT_TRUE(capture.contains("error TALSqliteDocStore: Unable to commit transaction: DocStore"));
   EXPECT_EQ(_store.count(nullptr), 1);
   EXPECT_TRUE(_store.storeOrUpdateDocuments({{url(2), item(u"s")}}, nullptr, nullptr));
@@ -392,7 +355,7 @@ TEST_F(DocStore, AFailedCommitIsReportedByTheErrorOnly) {
 
 TEST_F(DocStore, DamagedAndMissingItems) {
   fill(3);
-  Connection other(_path);
+  SQLiteConnection other(_path);
   other.run("UPDATE docstore SET doc = NULL WHERE docid = 1");
   other.run("UPDATE docstore SET doc = x'0AFF' WHERE docid = 2");
   other.run("UPDATE docstore SET url = 'no url' WHERE docid = 3");

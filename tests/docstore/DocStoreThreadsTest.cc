@@ -7,7 +7,6 @@
 #include "tests/docstore/DocStoreSupport.h"
 
 using testsupport::item;
-using testsupport::subjectOf;
 using testsupport::url;
 
 TEST(DocStoreThreads, ReadersRunConcurrentlyWithAWriter) {
@@ -19,7 +18,7 @@ TEST(DocStoreThreads, ReadersRunConcurrentlyWithAWriter) {
     do {
       const uint32_t docID = store.documentIDWithURL(url(1), nullptr);
       if (docID != 0) {
-        EXPECT_EQ(subjectOf(store.documentWithID(docID, nullptr)), u"s");
+        EXPECT_EQ(testsupport::subjectOf(store.documentWithID(docID, nullptr)), u"s");
         EXPECT_EQ(store.documentsWithURLs({url(1)}, nullptr, nullptr).size(), 1U);
       }
       EXPECT_EQ(store.metadataValueForKey("version", nullptr), "v0.4");

@@ -1,21 +1,8 @@
-#include <sqlite3.h>
-
 #include "tests/indexer/IndexerSupport.h"
+#include "tests/support/SQLiteConnection.h"
 
 using testsupport::IndexerTest;
 using testsupport::mail;
-using testsupport::Outcome;
-using testsupport::outcomeOf;
-
-TEST_F(IndexerTest, DeletedDocumentsStayGoneAcrossARestart) {
-  ASSERT_EQ(add({mail("a", "word"), mail("b", "word"), mail("c", "word")}), std::nullopt);
-  EXPECT_EQ(remove({u"b"}), std::nullopt);
-  EXPECT_EQ(search("word"), "c a");
-  reopen();
-  EXPECT_EQ(search("word"), "c a");
-  ASSERT_EQ(add({mail("b", "word")}), std::nullopt);
-  EXPECT_EQ(search("word"), "c b a");
-}
 
 TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
   TALIndexer::Items items{mail("b", "word")};
@@ -26,7 +13,7 @@ TEST_F(IndexerTest, AnUnknownIdentifierEndsTheListOfDeletions) {
   }
   ASSERT_EQ(add(items), std::nullopt);
   identifiers.insert(identifiers.end(), {u"nobody", u"b"});
-  const Outcome error = remove(identifiers);
+  const testsupport::Outcome error = remove(identifiers);
   ASSERT_TRUE(error);
   EXPECT_EQ(error->domain, "DocStore");
   EXPECT_TRUE(
@@ -48,7 +35,7 @@ TEST_F(IndexerTest, DeletesByDomain) {
   items.back()->setDomainIdentifier(u"third");
   items.push_back(mail("none", "word"));
   ASSERT_EQ(add(items), std::nullopt);
-  EXPECT_EQ(outcomeOf([&](auto done) {
+  EXPECT_EQ(testsupport::outcomeOf([&](auto done) {
               indexer->deleteItemsByDomainIdentifiers({u"even", u"nothing", u"third"}, done);
             }),
             std::nullopt);
@@ -61,14 +48,10 @@ TEST_F(IndexerTest, DeletesByDomain) {
 TEST_F(IndexerTest, ADeletionThatFailsEndsTheListAndThoseBeforeItStand) {
   ASSERT_EQ(add({mail("a", "word"), mail("b", "word"), mail("c", "word"), mail("d", "word")}),
             std::nullopt);
-  sqlite3* database = nullptr;
-  ASSERT_EQ(sqlite3_open((directory / "docstore/docstore.db").c_str(), &database), SQLITE_OK);
-  EXPECT_EQ(sqlite3_exec(database,
-                         "CREATE TRIGGER keep BEFORE DELETE ON docstore WHEN old.docid = 3 "
-                         "BEGIN SELECT RAISE(ABORT, 'kept'); END",
-                         nullptr, nullptr, nullptr),
-            SQLITE_OK);
-  sqlite3_close(database);
+  testsupport::SQLiteConnection(directory / "docstore/docstore.db")
+      .run(
+          "CREATE TRIGGER keep BEFORE DELETE ON docstore WHEN old.docid = 3 "
+          "BEGIN SELECT RAISE(ABORT, 'kept'); END");
   const auto failure = remove({u"a", u"b", u"c", u"d"});
   ASSERT_TRUE(failure.has_value());
   EXPECT_EQ(failure->domain, "DocStore");

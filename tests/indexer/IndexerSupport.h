@@ -52,6 +52,10 @@ class IndexerTest : public testing::Test {
     });
   }
 
+  Outcome reset() {
+    return outcomeOf([&](auto done) { indexer->resetWithCompletionHandler(done); });
+  }
+
   // Identifiers of the results, in order, separated by spaces; on failure the error message.
   std::string search(const std::string& text, std::shared_ptr<TLParameters> overrides = nullptr) {
     TLQuery query;

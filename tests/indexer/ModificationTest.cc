@@ -1,56 +1,26 @@
-#include <gtest/gtest.h>
-
-#include <algorithm>
-#include <future>
-
-#include "docstore/TALSqliteDocStore.h"
-#include "indexer/TALIndexer.h"
 #include "parameters/TLParamsManager.h"
 #include "platform/Files.h"
-#include "tests/support/LogCapture.h"
-#include "tests/support/Outcome.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/indexer/IndexerSupport.h"
 
 namespace {
 
+using testsupport::mail;
+
 // An indexer with three mails and its own synonyms.
-class QueryModification : public testing::Test {
+class QueryModification : public testsupport::IndexerTest {
  protected:
   QueryModification() {
-    EXPECT_TRUE(
-        platform::writeFileAtomically(synonyms, "bill,invoice\nshipping,invoice\n", nullptr));
-    EXPECT_TRUE(store->openWithError(nullptr));
-    indexer = std::make_unique<TALIndexer>(directory / "salt", "testing", store, synonyms);
-    EXPECT_EQ(testsupport::outcomeOf([this](auto done) {
-                indexer->addDocs(
-                    {mail(u"a", u"your invoice of june"), mail(u"b", u"orders shipped in june"),
-                     mail(u"c", u"the billing address")},
-                    "bundle", done);
-              }),
+    EXPECT_TRUE(platform::writeFileAtomically(directory / "synonyms.txt",
+                                              "bill,invoice\nshipping,invoice\n", nullptr));
+    reopen();
+    EXPECT_EQ(add({mail("a", "your invoice of june"), mail("b", "orders shipped in june"),
+                   mail("c", "the billing address")}),
               std::nullopt);
     log.clear();
   }
-  ~QueryModification() override { indexer->shutdown(); }
 
-  static std::shared_ptr<TLIndexableItem> mail(const TLString& identifier,
-                                               const TLString& subject) {
-    auto item = std::make_shared<TLIndexableItem>();
-    item->setIdentifier(identifier);
-    item->addAttributeWithKeyStringValue(TLAttributeKey::SUBJECT, subject);
-    return item;
-  }
-
-  // Identifiers in order; on failure the error message.
-  std::string search(const TLString& text, const TLString& parameters = u"salt.maxTopK=9") {
-    TLQuery query;
-    query.setOriginalQuery(text);
-    query.setSearchParams(TLParamsManager::paramsFromString(parameters));
-    std::optional<TLError> error;
-    std::string out;
-    for (const auto& item : indexer->search(query, &error)) {
-      out += platform::printable(item->identifier());
-    }
-    return error ? error->message : out;
+  std::string search(const std::string& text, TLStringView parameters = u"salt.maxTopK=9") {
+    return IndexerTest::search(text, TLParamsManager::paramsFromString(parameters));
   }
 
   // What the modification driver logged for this search, without the lines of others.
@@ -64,65 +34,58 @@ class QueryModification : public testing::Test {
     }
     return lines;
   }
-
-  testsupport::LogCapture log;
-  testsupport::TemporaryDirectory directory;
-  const std::string synonyms = directory / "synonyms.txt";
-  std::shared_ptr<TALSqliteDocStore> store =
-      std::make_shared<TALSqliteDocStore>(directory / "docstore/docstore.db");
-  std::unique_ptr<TALIndexer> indexer;
 };
 
 const TLString kThreshold = u"queryModification.sufficentRetrievalThreshold=";
-const TLString kSpellingOff = u"queryModification.enableSpellModification=NO";
 const TLString kSynonymsOff = u"queryModification.enableSynonymModification=NO";
-const TLString kStemsOff = u"queryModification.enableStemModification=NO";
 using Lines = std::vector<std::string>;
-const char* const kSpellingGoesOn =
-    "Spelling correction finished without query modified. Continue with other query modification.";
 
 }  // namespace
 
 TEST_F(QueryModification, TriesSpellingThenSynonymsThenStemsUntilOneChangesSomething) {
-  EXPECT_EQ(search(u"bill june"), "a");
-  EXPECT_EQ(
-      driverLines(),
-      (Lines{"Query modification started for query with 3 terms", "Spelling correction started.",
-             kSpellingGoesOn, "Synonyms modification started.",
-             "Synonyms modification finished with query modified. Skipping all other query "
-             "modification.",
-             "Query modification finished. Results retrieved with modified query terms."}));
-  log.clear();
-  EXPECT_EQ(search(u"invoise june"), "a");
-  EXPECT_EQ(
-      driverLines(),
-      (Lines{"Query modification started for query with 3 terms", "Spelling correction started.",
-             "Spelling correction finished with query modified. Skipping all other query "
-             "modification.",
-             "Query modification finished. Results retrieved with modified query terms."}));
-  log.clear();
-  EXPECT_EQ(search(u"ordering june"), "b");
-  EXPECT_EQ(
-      driverLines(),
-      (Lines{"Query modification started for query with 3 terms", "Spelling correction started.",
-             kSpellingGoesOn, "Synonyms modification started.",
-             "Synonyms modification finished without query modified. Continue with other "
-             "query modification.",
-             "Stem rewrite started.", "Stem rewrite finished with query modified.",
-             "Query modification finished. Results retrieved with modified query terms."}));
+  const std::string skips = " finished with query modified. Skipping all other query modification.";
+  const std::string goesOn =
+      " finished without query modified. Continue with other query modification.";
+  const struct {
+    const char* text;
+    const char* found;
+    Lines lines;
+  } cases[] = {
+      {"bill june",
+       "a",
+       {"Spelling correction" + goesOn, "Synonyms modification started.",
+        "Synonyms modification" + skips}},
+      {"invoise june", "a", {"Spelling correction" + skips}},
+      {"ordering june",
+       "b",
+       {"Spelling correction" + goesOn, "Synonyms modification started.",
+        "Synonyms modification" + goesOn, "Stem rewrite started.",
+        "Stem rewrite finished with query modified."}},
+  };
+  for (const auto& c : cases) {
+    log.clear();
+    EXPECT_EQ(search(c.text), c.found);
+    Lines lines{"Query modification started for query with 3 terms",
+                "Spelling correction started."};
+    lines.insert(lines.end(), c.lines.begin(), c.lines.end());
+    lines.push_back("Query modification finished. Results retrieved with modified query terms.");
+    EXPECT_EQ(driverLines(), lines);
+  }
   // The synonym wins, so the stem, which would find mail, is not tried.
-  EXPECT_EQ(search(u"shipping "), "a");
-  EXPECT_EQ(search(u"shipping ", kSynonymsOff), "b");
-  EXPECT_EQ(search(u"shipping "), "a");
+  EXPECT_EQ(search("shipping "), "a");
+  EXPECT_EQ(search("shipping ", kSynonymsOff), "b");
+  EXPECT_EQ(search("shipping "), "a");
 }
 
 TEST_F(QueryModification, KeepsQueriesThatCannotBeModified) {
-  EXPECT_EQ(search(u"zebra "), "");
+  EXPECT_EQ(search("zebra "), "");
   EXPECT_EQ(driverLines().back(),
             "Query modification didnt work out. Return original query results.");
   EXPECT_TRUE(log.has("default TALIndexer: Stem rewrite finished without query modified."));
   log.clear();
-  EXPECT_EQ(search(u"bill ", kSpellingOff + u"," + kSynonymsOff + u"," + kStemsOff), "");
+  EXPECT_EQ(search("bill ", kSynonymsOff + u",queryModification.enableSpellModification=NO,"
+                                           u"queryModification.enableStemModification=NO"),
+            "");
   EXPECT_EQ(driverLines(),
             (Lines{"Query modification started for query with 1 terms",
                    "Query modification didnt work out. Return original query results."}));
@@ -130,31 +93,31 @@ TEST_F(QueryModification, KeepsQueriesThatCannotBeModified) {
 
 TEST_F(QueryModification, RunsUpToTheThresholdOfResults) {
   const struct {
-    TLString text;
+    std::string text;
     TLString threshold;
     const char* found;
     bool runs;
   } cases[] = {
-      {u"invoice ", u"0", "a", false}, {u"invoice ", u"1", "a", true},
-      {u"june ", u"1", "ba", false},   {u"june ", u"-1", "ba", true},  // unsigned
-      {u"bill", u"1", "c", true},
+      {"invoice ", u"0", "a", false}, {"invoice ", u"1", "a", true},
+      {"june ", u"1", "b a", false},  {"june ", u"-1", "b a", true},  // unsigned
+      {"bill", u"1", "c", true},
   };
   for (const auto& c : cases) {
     log.clear();
     EXPECT_EQ(search(c.text, kThreshold + c.threshold), c.found);
-    EXPECT_EQ(log.contains("Query modification started"), c.runs) << platform::toUTF8(c.text);
+    EXPECT_EQ(log.contains("Query modification started"), c.runs) << c.text;
   }
   // The second pass replaces the first one even if it finds less.
-  EXPECT_EQ(search(u"billing", kThreshold + u"5"), "c");
-  EXPECT_EQ(search(u"bill address june", kThreshold + u"5"), "");
+  EXPECT_EQ(search("billing", kThreshold + u"5"), "c");
+  EXPECT_EQ(search("bill address june", kThreshold + u"5"), "");
   EXPECT_TRUE(TALIndexer::_notSufficientRetrieval({}, 0));
   EXPECT_FALSE(TALIndexer::_shouldRunQueryModification(6, 5));
 }
 
 TEST_F(QueryModification, AFailureOfTheSecondPassFailsTheSearch) {
   store->close();
-  EXPECT_EQ(search(u"zebra "), "");
-  const std::string failure = search(u"ordering ");
+  EXPECT_EQ(search("zebra "), "");
+  const std::string failure = search("ordering ");
   EXPECT_TRUE(
       log.contains("error TALIndexer: Failed to search modified query in SALT due to error: "
                    "DocStore 1001: " +
@@ -163,12 +126,12 @@ TEST_F(QueryModification, AFailureOfTheSecondPassFailsTheSearch) {
 }
 
 TEST_F(QueryModification, HandlesManyAndUnusualWords) {
-  TLString words;
-  for (int i = 0; i < 1000; ++i) words += u"zebra" + platform::fromUTF8(std::to_string(i)) + u' ';
+  std::string words;
+  for (int i = 0; i < 1000; ++i) words += "zebra" + std::to_string(i) + ' ';
   EXPECT_EQ(search(words), "");
-  EXPECT_EQ(search(u"\U0001F600\U0001F600\U0001F600 "),
+  EXPECT_EQ(search("\U0001F600\U0001F600\U0001F600 "),
             "Query processor failed to generate query terms");
-  EXPECT_EQ(search(TLString(100000, u'x') + u" "), "");
+  EXPECT_EQ(search(std::string(100000, 'x') + ' '), "");
 }
 
 TEST_F(QueryModification, WithoutASynonymFileThereAreNoSynonyms) {
@@ -179,8 +142,6 @@ TEST_F(QueryModification, WithoutASynonymFileThereAreNoSynonyms) {
   other.shutdown();
   // A reset does not read the synonyms again.
   log.clear();
-  std::promise<void> done;
-  indexer->resetWithCompletionHandler([&done](const auto&) { done.set_value(); });
-  done.get_future().wait();
+  EXPECT_EQ(reset(), std::nullopt);
   EXPECT_FALSE(log.contains("TALSynonyms"));
 }

@@ -6,7 +6,6 @@
 namespace {
 
 using testsupport::Corpus;
-using testsupport::tokensOf;
 using testsupport::word;
 using Terms = std::vector<saltsearch::Term>;
 
@@ -14,7 +13,7 @@ using Terms = std::vector<saltsearch::Term>;
 std::string rewrite(const Corpus& corpus, const Terms& terms) {
   TALStemRewrite rewriter;
   Terms out{word("left over")};
-  return rewriter.stemRewrite(terms, out, *corpus.index) ? tokensOf(out) : "no";
+  return rewriter.stemRewrite(terms, out, *corpus.index) ? testsupport::tokensOf(out) : "no";
 }
 
 }  // namespace

@@ -1,8 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <utility>
-#include <vector>
-
 #include "modification/Stemmer.h"
 #include "platform/Text.h"
 

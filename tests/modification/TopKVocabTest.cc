@@ -1,10 +1,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sqlite3.h>
 
-#include <future>
 #include <latch>
 #include <random>
+#include <tuple>
 
 #include "docstore/TALSqliteDocStore.h"
 #include "modification/TALTopKVocab.h"
@@ -13,6 +12,7 @@
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Outcome.h"
+#include "tests/support/SQLiteConnection.h"
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -24,50 +24,46 @@ using testsupport::Outcome;
 using testsupport::outcomeOf;
 using Words = TALTopKVocab::Words;
 
-// An index of a hundred zones that calls a function for each zone iterated over.
-class WatchedIndex final : public salt::Index {
+// An index of a hundred zones that counts the zones iterated over, and can wait at the first one.
+class WatchedIndex : public salt::Index {
  public:
-  std::function<void()> atZone = [] {};
   mutable std::atomic<int> zones = 0;
+  bool waitsAtFirst = false;
+  mutable std::latch reached{1};
+  mutable std::latch goesOn{1};
 
   void ForEachZone(
       std::function<bool(uint32_t, uint16_t, std::string_view)> callback) const override {
     for (uint32_t docID = 1; docID <= 100; ++docID) {
-      ++zones;
-      atZone();
+      if (++zones == 1 && waitsAtFirst) {
+        reached.count_down();
+        goesOn.wait();
+      }
       if (!callback(docID, 1, "word ")) return;
     }
   }
-  const Options& GetOptions() const override { return _options; }
-  std::string GetSuffixText(const salt::SuffixMeta&) const override { return ""; }
-  bool AddZone(uint32_t, uint16_t, std::string_view, std::vector<uint32_t>&, bool) override {
-    return false;
-  }
-  bool DeleteDoc(uint32_t) override { return false; }
-  bool DeleteDocs(const std::vector<uint32_t>&) override { return false; }
-  bool ScanPrefix(std::string_view, std::function<bool(const salt::SuffixMeta&)>) const override {
-    return true;
-  }
-  std::vector<std::shared_ptr<const salt::FoundPlaces>> ScanPlaces(
-      const std::vector<std::string_view>&, uint64_t) const override {
-    return {};
-  }
-  std::vector<std::vector<salt::SuffixMeta>> ScanPrefixes(const std::vector<std::string>&,
-                                                          size_t) const override {
-    return {};
-  }
-  void Vacuum() override {}
-  bool Sync() override { return true; }
-  bool Compact() override { return true; }
-  Metrics GetMetrics() const override { return {}; }
-  void ResetScanMetrics() override {}
-  bool Validate() const override { return true; }
-  std::string Dump() const override { return ""; }
-  void WaitForMaintenance() override {}
-  void Interrupt() override {}
 
- private:
-  Options _options;
+  MOCK_METHOD(const Options&, GetOptions, (), (const, override));
+  MOCK_METHOD(std::string, GetSuffixText, (const salt::SuffixMeta&), (const, override));
+  MOCK_METHOD(bool, AddZone, (uint32_t, uint16_t, std::string_view, std::vector<uint32_t>&, bool),
+              (override));
+  MOCK_METHOD(bool, DeleteDoc, (uint32_t), (override));
+  MOCK_METHOD(bool, DeleteDocs, (const std::vector<uint32_t>&), (override));
+  MOCK_METHOD(bool, ScanPrefix, (std::string_view, std::function<bool(const salt::SuffixMeta&)>),
+              (const, override));
+  MOCK_METHOD(std::vector<std::shared_ptr<const salt::FoundPlaces>>, ScanPlaces,
+              (const std::vector<std::string_view>&, uint64_t), (const, override));
+  MOCK_METHOD(std::vector<std::vector<salt::SuffixMeta>>, ScanPrefixes,
+              (const std::vector<std::string>&, size_t), (const, override));
+  MOCK_METHOD(void, Vacuum, (), (override));
+  MOCK_METHOD(bool, Sync, (), (override));
+  MOCK_METHOD(bool, Compact, (), (override));
+  MOCK_METHOD(Metrics, GetMetrics, (), (const, override));
+  MOCK_METHOD(void, ResetScanMetrics, (), (override));
+  MOCK_METHOD(bool, Validate, (), (const, override));
+  MOCK_METHOD(std::string, Dump, (), (const, override));
+  MOCK_METHOD(void, WaitForMaintenance, (), (override));
+  MOCK_METHOD(void, Interrupt, (), (override));
 };
 
 class TopKVocabTest : public testing::Test {
@@ -79,22 +75,18 @@ class TopKVocabTest : public testing::Test {
         [&vocab](auto done) { vocab.checkAndRebuildTopKVocabWithCompletionHandler(done, true); });
   }
 
-  // The outcome of loading a stored blob: an object, its error, and its contents.
-  struct Loaded {
-    Outcome error;
-    Words words;
-    uint32_t docID;
-    double date;
-  };
+  // What a vocabulary of one old word holds after loading the blob: whether there was an error, the
+  // words, the document ID, and the date.
+  using Loaded = std::tuple<bool, Words, uint32_t, double>;
   Loaded load(const std::string& blob) {
     store->storeTopKVocab(blob, nullptr);
     TALTopKVocab vocab(store, index.get());
     vocab.setVocab({"old"});
     vocab.setLastTopKRebuildDocID(1);
     vocab.setLastTopKRebuildDate(1);
-    Loaded loaded;
-    vocab.loadTopKVocabFromDocStore(&loaded.error);
-    return {loaded.error, *vocab.vocab(), vocab.lastTopKRebuildDocID(),
+    Outcome error;
+    vocab.loadTopKVocabFromDocStore(&error);
+    return {error.has_value(), *vocab.vocab(), vocab.lastTopKRebuildDocID(),
             vocab.lastTopKRebuildDate()};
   }
 
@@ -152,19 +144,15 @@ TEST_F(TopKVocabTest, CountsStoresAndSurvivesARestart) {
     vocab.setMaxDocID(200);
     EXPECT_THAT(*vocab.vocab(), ElementsAre("b ", "a ", "b", "c\xF0\x9F\x98\x80 "));
     const auto lines = log.lines();
-    const auto at = [&lines](const std::string& line) {
-      return std::find_if(lines.begin(), lines.end(),
-                          [&](const auto& l) { return l.find(line) != std::string::npos; }) -
-             lines.begin();
-    };
-    const std::vector<ptrdiff_t> order{at("Starting to rebuild topK vocab from SALT."),
-                                       at("Rebuild date: 20"),
-                                       at("Rebuild docID: 77."),
-                                       at("TopK vocab has 4 tokens."),
-                                       at("TopK vocab rebuild is done."),
-                                       at("Rebuilt topK vocab saved to docstore.")};
-    EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
-    EXPECT_LT(order.back(), std::ssize(lines));
+    auto at = lines.begin();
+    for (const char* text :
+         {"Starting to rebuild topK vocab from SALT.", "Rebuild date: 20", "Rebuild docID: 77.",
+          "TopK vocab has 4 tokens.", "TopK vocab rebuild is done.",
+          "Rebuilt topK vocab saved to docstore."}) {
+      at = std::find_if(at, lines.end(),
+                        [&](const auto& l) { return l.find(text) != std::string::npos; });
+      EXPECT_NE(at, lines.end()) << text;
+    }
   }
   const TALTopKVocab again(store, index.get());
   EXPECT_THAT(*again.vocab(), ElementsAre("b ", "a ", "b", "c\xF0\x9F\x98\x80 "));
@@ -199,43 +187,31 @@ TEST_F(TopKVocabTest, KeepsTheUndamagedPartsOfABlob) {
   };
   const Words old{"old"};
   const Words stored{"one", "two"};
-  const struct {
-    std::string blob;
-    bool error;
-    Words words;
-    uint32_t docID;
-    double date;
-  } cases[] = {
-      {three(words, docID, date), false, stored, 100, 1677721600},
-      {"\x82" + entry(words) + entry(docID), false, old, 1, 1},
-      {"\x80", false, old, 1, 1},
-      {"", true, old, 1, 1},
-      {"\x83\x01\x02\x03", true, old, 1, 1},
-      {three(words, docID, date) + "x", true, old, 1, 1},
-      {std::string(1000000, '\x81'), true, old, 1, 1},
-      {three("\x01", docID, date), true, {}, 1, 1},
-      {three("\x82\x63one", docID, date), true, {}, 1, 1},
-      {three("\x9B\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFF", docID, date), true, {}, 1, 1},
-      {three("", docID, date), true, {}, 1, 1},
-      {three(words, std::string("\x1B\0\0\0\1\0\0\0\0", 9), date), true, stored, 1, 1677721600},
-      {three(words, docID, "\x01"), true, stored, 100, 1},
-      {three(words, docID, "\xF9\x3C"), true, stored, 100, 1},
+  const std::pair<std::string, Loaded> cases[] = {
+      {three(words, docID, date), {false, stored, 100, 1677721600}},
+      {"\x82" + entry(words) + entry(docID), {false, old, 1, 1}},
+      {"\x80", {false, old, 1, 1}},
+      {"", {true, old, 1, 1}},
+      {"\x83\x01\x02\x03", {true, old, 1, 1}},
+      {three(words, docID, date) + "x", {true, old, 1, 1}},
+      {std::string(1000000, '\x81'), {true, old, 1, 1}},
+      {three("\x01", docID, date), {true, {}, 1, 1}},
+      {three("\x82\x63one", docID, date), {true, {}, 1, 1}},
+      {three("\x9B\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFF", docID, date), {true, {}, 1, 1}},
+      {three("", docID, date), {true, {}, 1, 1}},
+      {three(words, std::string("\x1B\0\0\0\1\0\0\0\0", 9), date), {true, stored, 1, 1677721600}},
+      {three(words, docID, "\x01"), {true, stored, 100, 1}},
+      {three(words, docID, "\xF9\x3C"), {true, stored, 100, 1}},
   };
-  for (const auto& c : cases) {
-    const Loaded loaded = load(c.blob);
-    const std::string shown = testing::PrintToString(c.blob.substr(0, 40));
-    EXPECT_EQ(loaded.error.has_value(), c.error) << shown;
-    EXPECT_EQ(loaded.words, c.words) << shown;
-    EXPECT_EQ(loaded.docID, c.docID) << shown;
-    EXPECT_EQ(loaded.date, c.date) << shown;
+  for (const auto& [bytes, expected] : cases) {
+    EXPECT_EQ(load(bytes), expected) << testing::PrintToString(bytes.substr(0, 40));
   }
   EXPECT_TRUE(log.contains("error TALTopKVocab: TopK cannot be unarchived: TALTopKVocab 1: "));
 }
 
 TEST_F(TopKVocabTest, ReadsTruncatedOrChangedBlobsSafely) {
   const std::string blob = topkvocab::archive({"one", std::string(300, 'x'), ""}, 70000, 1.5e9);
-  EXPECT_EQ(load(blob).words, (Words{"one", std::string(300, 'x'), ""}));
-  EXPECT_EQ(load(blob).docID, 70000U);
+  EXPECT_EQ(load(blob), Loaded(false, {"one", std::string(300, 'x'), ""}, 70000, 1.5e9));
   for (size_t size = 0; size < blob.size(); ++size) {
     ASSERT_FALSE(topkvocab::unarchive(std::string_view(blob).substr(0, size))) << size;
   }
@@ -274,28 +250,21 @@ TEST_F(TopKVocabTest, ARequestedRebuildAndShutdownEndTheRestOfARoutineOne) {
 
 TEST_F(TopKVocabTest, ShutdownEndsTheRunningCountAndWaitingRebuilds) {
   auto watched = std::make_unique<WatchedIndex>();
-  std::latch counting(1);
-  std::latch shuttingDown(1);
-  watched->atZone = [&, first = true]() mutable {
-    if (std::exchange(first, false)) {
-      counting.count_down();
-      shuttingDown.wait();
-    }
-  };
+  watched->waitsAtFirst = true;
   TALTopKVocab vocab(store, watched.get());
   vocab.setVocab({"old"});
   std::vector<Outcome> outcomes;
   const auto keep = [&outcomes](const Outcome& outcome) { outcomes.push_back(outcome); };
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(keep, true);
-  counting.wait();
+  watched->reached.wait();
   vocab.setMaxDocID(2001);
   for (int batch = 0; batch < 3; ++batch) {
     vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
   }
   std::thread ending([&] { vocab.shutdown(); });
   while (!vocab.isShutdown()) std::this_thread::yield();
-  shuttingDown.count_down();
+  watched->goesOn.count_down();
   ending.join();
   EXPECT_EQ(watched->zones, 2);  // one per pass
   watched.reset();
@@ -312,24 +281,17 @@ TEST_F(TopKVocabTest, ShutdownEndsTheRunningCountAndWaitingRebuilds) {
 }
 
 TEST_F(TopKVocabTest, ARequestedRebuildEndsARoutineCount) {
-  auto watched = std::make_unique<WatchedIndex>();
-  std::latch counting(1);
-  std::latch asked(1);
-  watched->atZone = [&, first = true]() mutable {
-    if (std::exchange(first, false)) {
-      counting.count_down();
-      asked.wait();
-    }
-  };
-  TALTopKVocab vocab(store, watched.get());
+  WatchedIndex watched;
+  watched.waitsAtFirst = true;
+  TALTopKVocab vocab(store, &watched);
   vocab.setMaxDocID(2001);
   vocab.checkAndRebuildTopKVocabWithCompletionHandler(nullptr, false);
-  counting.wait();
-  std::promise<Outcome> done;
-  vocab.checkAndRebuildTopKVocabWithCompletionHandler(
-      [&done](const Outcome& outcome) { done.set_value(outcome); }, true);
-  asked.count_down();
-  EXPECT_EQ(done.get_future().get(), std::nullopt);
+  watched.reached.wait();
+  EXPECT_EQ(outcomeOf([&](auto done) {
+              vocab.checkAndRebuildTopKVocabWithCompletionHandler(done, true);
+              watched.goesOn.count_down();
+            }),
+            std::nullopt);
   EXPECT_EQ(log.count("Starting to rebuild topK vocab from SALT."), 2U);
   EXPECT_EQ(log.count("TopK vocab rebuild is done."), 1U);
   vocab.shutdown();
@@ -342,13 +304,13 @@ TEST_F(TopKVocabTest, ALoadNeverBringsOlderWordsBack) {
   vocab.loadTopKVocabFromDocStore(&error);
   ASSERT_EQ(error, std::nullopt);
   ASSERT_THAT(*vocab.vocab(), ElementsAre("stored"));
-  sqlite3* other = nullptr;  // blocks writes to the store
-  ASSERT_EQ(sqlite3_open((directory / "docs.db").c_str(), &other), SQLITE_OK);
-  ASSERT_EQ(sqlite3_exec(other, "begin immediate;", nullptr, nullptr, nullptr), SQLITE_OK);
-  EXPECT_NE(rebuild(vocab), std::nullopt);
-  vocab.loadTopKVocabFromDocStore(&error);
-  EXPECT_THAT(*vocab.vocab(), testing::IsEmpty());
-  sqlite3_close(other);
+  {
+    testsupport::SQLiteConnection other(directory / "docs.db");
+    other.run("BEGIN IMMEDIATE");  // blocks writes to the store
+    EXPECT_NE(rebuild(vocab), std::nullopt);
+    vocab.loadTopKVocabFromDocStore(&error);
+    EXPECT_THAT(*vocab.vocab(), testing::IsEmpty());
+  }
   EXPECT_EQ(rebuild(vocab), std::nullopt);
   vocab.shutdown();
 }

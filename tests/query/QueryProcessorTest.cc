@@ -26,6 +26,10 @@ std::shared_ptr<TLQueryNode> inner(Merge mergeOp,
   return node;
 }
 
+std::shared_ptr<TLParameters> parameters(TLStringView overrides) {
+  return TLParamsManager::resolveOverrides(*TLParamsManager::paramsFromString(overrides), true);
+}
+
 class QueryProcessorTest : public testing::Test {
  protected:
   QueryProcessorTest() : processor(TALQueryProcessor::initWithZoneManager(zoneManager, nullptr)) {}
@@ -120,8 +124,7 @@ TEST_F(QueryProcessorTest, TheFirstPassUsesSynonymsAndStemsIfTheParametersSaySo)
   for (const auto& c : cases) {
     TLQuery query;
     query.setOriginalQuery(c.text);
-    query.setSearchParams(
-        TLParamsManager::resolveOverrides(*TLParamsManager::paramsFromString(c.parameters), true));
+    query.setSearchParams(parameters(c.parameters));
     EXPECT_EQ(print(processor->termsFromQuery(query)), c.terms);
   }
 }
@@ -190,12 +193,6 @@ TEST_F(QueryProcessorTest, HandlesATreeOfAnyDepth) {
 }
 
 TEST_F(QueryProcessorTest, ZoneScoresFollowTheParametersOfTheSearch) {
-  auto score = std::make_shared<TLParamKeyValue>();
-  score->setKey(u"zoneScore.Subject");
-  score->setFloatValue(0.25F);
-  TLParameters overrides;
-  overrides.addKeyvalue(score);
-  zoneManager.setupAttributeScoresWithSearchParams(
-      *TLParamsManager::resolveOverrides(overrides, true));
+  zoneManager.setupAttributeScoresWithSearchParams(*parameters(u"zoneScore.Subject=0.25"));
   EXPECT_EQ(zonesOf(termsOfText(u"x").at(0)).substr(0, 16), "zones:{13:0.25,1");
 }

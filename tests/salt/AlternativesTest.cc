@@ -1,4 +1,3 @@
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <random>
@@ -11,9 +10,6 @@
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
-using saltsearch::AnyDocument;
-using saltsearch::BestScores;
-using saltsearch::Options;
 using saltsearch::Term;
 
 namespace {
@@ -105,10 +101,7 @@ TEST_F(Alternatives, ManyPrefixesFindTheSameAsEachAlone) {
       std::vector<std::string> first = salttest::scan(*index, prefixes[i]);
       first.resize(std::min(first.size(), limit));
       std::vector<std::string> probed;
-      for (const salt::SuffixMeta& meta : all[i]) {
-        probed.push_back(std::to_string(meta.DocID) + ',' + std::to_string(meta.ZoneID) + ':' +
-                         std::to_string(meta.Offset));
-      }
+      for (const auto& suffix : all[i]) probed.push_back(salttest::printed(suffix));
       ASSERT_EQ(probed, first) << prefixes[i];
       found += first.size();
     }
@@ -152,7 +145,7 @@ TEST_F(Alternatives, AnyDocumentAgreesWithSearch) {
     if (round % 30 == 1) term.zoneScores.push_back(1);
     const auto tokens = randomTokens(random);
     const size_t maxSuffixes = 1 + random() % 6;
-    const auto any = AnyDocument(*index, term, tokens, maxSuffixes);
+    const auto any = saltsearch::AnyDocument(*index, term, tokens, maxSuffixes);
     ASSERT_EQ(any.size(), tokens.size());
     for (size_t i = 0; i < tokens.size(); ++i) {
       std::vector<Term> terms{term};
@@ -180,9 +173,9 @@ TEST_F(Alternatives, BestScoresEqualSearchToTheLastBit) {
     }
     const double thresholds[] = {0.02, 0.02, 0, 0.3};
     const size_t limits[] = {1000000, 1000000, 3};
-    const Options options{1, limits[random() % 3], thresholds[random() % 4]};
+    const saltsearch::Options options{1, limits[random() % 3], thresholds[random() % 4]};
     const auto tokens = randomTokens(random);
-    const auto best = BestScores(*index, terms, position, tokens, options);
+    const auto best = saltsearch::BestScores(*index, terms, position, tokens, options);
     ASSERT_EQ(best.size(), tokens.size());
     for (size_t i = 0; i < tokens.size(); ++i) {
       std::vector<Term> changed = terms;

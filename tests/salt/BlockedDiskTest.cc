@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <atomic>
 #include <condition_variable>
-#include <latch>
 #include <thread>
 
 #include "platform/Mutex.h"
@@ -19,12 +18,15 @@ namespace {
 using salt::Index;
 using salttest::addZone;
 
-// Can block writes to files of one kind until they are released.
-class WriteBlockingEnv final : public salttest::FaultInjectionEnv {
- public:
-  explicit WriteBlockingEnv(std::string suffix) : _suffix(std::move(suffix)) {}
+enum class Operation { append, sync };
 
-  // Blocks from the write after so many others; a log record takes two.
+// Can block operations on files of one kind until they are released.
+class BlockingEnv final : public salttest::FaultInjectionEnv {
+ public:
+  explicit BlockingEnv(std::string suffix, Operation blocks = Operation::append)
+      : _suffix(std::move(suffix)), _blocks(blocks) {}
+
+  // Blocks from the operation after so many others; a log record takes two writes.
   void blockAfter(int writes) {
     platform::MutexLock lock(_mutex);
     _blocked = true;
@@ -46,23 +48,17 @@ class WriteBlockingEnv final : public salttest::FaultInjectionEnv {
   }
 
  private:
-  class File final : public salttest::FaultInjectionFile {
-   public:
-    File(WriteBlockingEnv* disk, leveldb::WritableFile* file)
-        : FaultInjectionFile(file), _disk(*disk) {}
-    leveldb::Status Append(const leveldb::Slice& bytes) override {
-      _disk.pass();
-      return FaultInjectionFile::Append(bytes);
-    }
-
-   private:
-    WriteBlockingEnv& _disk;
-  };
-
-  leveldb::WritableFile* wrap(const std::string& path, leveldb::WritableFile* file) override {
-    return path.ends_with(_suffix) ? new File(this, file) : file;
+  leveldb::Status append(const std::string& path, File& file,
+                         const leveldb::Slice& bytes) override {
+    pass(path, Operation::append);
+    return file.Append(bytes);
   }
-  void pass() {
+  leveldb::Status sync(const std::string& path, File& file) override {
+    pass(path, Operation::sync);
+    return file.Sync();
+  }
+  void pass(const std::string& path, Operation operation) {
+    if (operation != _blocks || !path.ends_with(_suffix)) return;
     platform::MutexLock lock(_mutex);
     if (!_blocked || _pass-- > 0) return;
     _waiting = true;
@@ -71,6 +67,7 @@ class WriteBlockingEnv final : public salttest::FaultInjectionEnv {
   }
 
   const std::string _suffix;
+  const Operation _blocks;
   platform::Mutex _mutex;
   std::condition_variable_any _changed;
   bool _blocked TL_GUARDED_BY(_mutex) = false;
@@ -84,22 +81,40 @@ std::vector<std::string> sortedScan(const Index& index) {
   return found;
 }
 
-std::optional<uint64_t> countOfPlaces(const Index& index) {
-  return salttest::scanPlaces(index, "a", 1000, [](const auto&, const auto*, size_t) {});
+uint64_t countOfPlaces(const Index& index) {
+  return salttest::scanPlaces(index, "a")->suffixes;
 }
 
-std::unique_ptr<salt::index> openOn(WriteBlockingEnv* disk, const std::string& path) {
-  return salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, disk));
+// A new index whose files are opened through `disk`.
+std::unique_ptr<salt::index> newIndexOn(BlockingEnv* disk, const std::string& path,
+                                        const Index::Options& options = {}) {
+  EXPECT_NE(salttest::newIndex(path, options), nullptr);
+  auto index = salt::index::load(salt::openDatabase(path, salt::OpenMode::existing, disk));
+  EXPECT_NE(index, nullptr);
+  return index;
+}
+
+void addDocs(Index& index, uint32_t count) {
+  for (uint32_t docID = 1; docID <= count; ++docID) {
+    ASSERT_TRUE(addZone(index, docID, 1, "a b", {0, 2}));
+  }
+}
+
+void write(salt::BatchWriter& writer, size_t bytes) {
+  leveldb::WriteBatch batch;
+  batch.Put("a", std::string(bytes, 'a'));
+  EXPECT_TRUE(writer.write(&batch).ok());
 }
 
 // Runs `waits`, which is released from another thread. If it did not wait, `released` would be
 // false; if its end were not notified, it would take ten seconds.
 template <typename Waits>
-void expectWaiting(WriteBlockingEnv* disk, const Waits& waits) {
+void expectWaiting(BlockingEnv* disk, const Waits& waits) {
   std::atomic<bool> begins = false;
   std::atomic<bool> released = false;
   std::thread releasing([&] {
     while (!begins) std::this_thread::yield();
+    for (int i = 0; i < 1000; ++i) std::this_thread::yield();  // what does not wait ends meanwhile
     released = true;
     disk->release();
   });
@@ -118,15 +133,9 @@ TEST(BlockedDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   Index::Options options;
   options.MaxHotSuffixes = 2 * kDocs;
   options.MaxPageSuffixes = 3;
-  {
-    const auto index = salttest::newIndex(directory / "i", options);
-    for (uint32_t docID = 1; docID < kDocs; ++docID) {
-      ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
-    }
-  }
-  WriteBlockingEnv disk(".log");
-  const auto index = openOn(&disk, directory / "i");
-  ASSERT_NE(index, nullptr);
+  BlockingEnv disk(".log");
+  const auto index = newIndexOn(&disk, directory / "i", options);
+  addDocs(*index, kDocs - 1);
 
   disk.blockAfter(0);
   std::thread adding([&index] { EXPECT_TRUE(addZone(*index, kDocs, 1, "a b", {0, 2})); });
@@ -151,37 +160,22 @@ TEST(BlockedDisk, ScansBeginWhileABatchIsWrittenAndFindEachSuffixOnce) {
   EXPECT_TRUE(index->Validate());
 }
 
-TEST(BlockedDisk, IngestWaitsDuringACompaction) {
-  const testsupport::TemporaryDirectory directory;
-  ASSERT_NE(salttest::newIndex(directory / "i"), nullptr);
-  WriteBlockingEnv disk(".ldb");
-  const auto index = openOn(&disk, directory / "i");
-  ASSERT_NE(index, nullptr);
-  index->WaitForMaintenance();  // returns at once
-  ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
-
-  disk.blockAfter(0);
-  std::thread compacting([&index] { index->Compact(); });
-  disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
-  compacting.join();
-}
-
-TEST(BlockedDisk, IngestWaitsDuringAMerge) {
-  const testsupport::TemporaryDirectory directory;
-  Index::Options options;
-  options.MaxHotSuffixes = 4;
-  ASSERT_NE(salttest::newIndex(directory / "i", options), nullptr);
-  WriteBlockingEnv disk(".log");
-  const auto index = openOn(&disk, directory / "i");
-  ASSERT_NE(index, nullptr);
-  ASSERT_TRUE(addZone(*index, 1, 1, "a b", {0, 2}));
-
-  disk.blockAfter(2);  // lets the record of the merge pass, but not its pages
-  index->Vacuum();
-  disk.waitForWriter();
-  expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
-  EXPECT_EQ(index->GetMetrics().HotSuffixes, 0u);
+TEST(BlockedDisk, IngestWaitsDuringAMergeAndDuringACompaction) {
+  for (const bool merges : {true, false}) {
+    const testsupport::TemporaryDirectory directory;
+    Index::Options options;
+    if (merges) options.MaxHotSuffixes = 4;
+    BlockingEnv disk(merges ? ".log" : ".ldb");
+    const auto index = newIndexOn(&disk, directory / "i", options);
+    index->WaitForMaintenance();  // returns at once
+    addDocs(*index, 1);
+    disk.blockAfter(merges ? 2 : 0);  // lets the record of a merge pass, but not its pages
+    std::thread working([&] { merges ? index->Vacuum() : static_cast<void>(index->Compact()); });
+    disk.waitForWriter();
+    expectWaiting(&disk, [&index] { index->WaitForMaintenance(); });
+    working.join();
+    EXPECT_EQ(index->GetMetrics().HotSuffixes == 0, merges);
+  }
 }
 
 // A merge that would run for long, in an index that nobody needs any more.
@@ -192,13 +186,9 @@ TEST(BlockedDisk, AnInterruptionEndsAMergeAndAllWaits) {
   options.MaxHotSuffixes = 2 * kDocs;
   options.MaxPageSuffixes = 2;
   options.MaxBatchBytes = 1;
-  ASSERT_NE(salttest::newIndex(directory / "i", options), nullptr);
-  WriteBlockingEnv disk(".log");
-  auto index = openOn(&disk, directory / "i");
-  ASSERT_NE(index, nullptr);
-  for (uint32_t docID = 1; docID <= kDocs; ++docID) {
-    ASSERT_TRUE(addZone(*index, docID, 1, "a b", {0, 2}));
-  }
+  BlockingEnv disk(".log");
+  auto index = newIndexOn(&disk, directory / "i", options);
+  addDocs(*index, kDocs);
   disk.blockAfter(2);  // lets the record of the merge and its first pages pass
   index->Vacuum();
   disk.waitForWriter();
@@ -219,98 +209,48 @@ TEST(BlockedDisk, AnInterruptionEndsAMergeAndAllWaits) {
 // leveldb would end the process if it failed to write that memtable.
 TEST(BlockedDisk, BatchesThatMayFillAMemtableWaitForTheEndOfACompaction) {
   const testsupport::TemporaryDirectory directory;
-  WriteBlockingEnv disk(".ldb");
+  BlockingEnv disk(".ldb");
   const salt::Database database =
       salt::openDatabase(directory / "i", salt::OpenMode::create, &disk);
   ASSERT_NE(database.db, nullptr);
   salt::BatchWriter writer(database);
-  const auto write = [&writer](size_t bytes) {
-    leveldb::WriteBatch batch;
-    batch.Put("a", std::string(bytes, 'a'));
-    EXPECT_TRUE(writer.write(&batch).ok());
-  };
-  write(1);
+  write(writer, 1);
 
   disk.blockAfter(0);
   std::thread compacting([&] { writer.compact(nullptr, nullptr); });
   disk.waitForWriter();
-  write(1);
-  expectWaiting(&disk, [&write] { write(2 << 20); });
+  write(writer, 1);
+  expectWaiting(&disk, [&writer] { write(writer, 2 << 20); });
   compacting.join();
 }
 
 // The memtable of a class at rest is written to a table, unless it is small.
 TEST(BlockedDisk, AnIdleWriterFlushesItsMemtable) {
   const testsupport::TemporaryDirectory directory;
-  WriteBlockingEnv disk(".ldb");
+  BlockingEnv disk(".ldb");
   const salt::Database database =
       salt::openDatabase(directory / "i", salt::OpenMode::create, &disk);
   ASSERT_NE(database.db, nullptr);
   disk.blockAfter(0);
-  const auto write = [](salt::BatchWriter* writer, size_t bytes) {
-    leveldb::WriteBatch batch;
-    batch.Put("a", std::string(bytes, 'a'));
-    EXPECT_TRUE(writer->write(&batch).ok());
-  };
   {
     salt::BatchWriter patient(database);  // its end does not wait for the idle time
-    write(&patient, 1 << 20);
+    write(patient, 1 << 20);
   }
   salt::BatchWriter writer(database, std::chrono::milliseconds(0));
-  write(&writer, 1 << 10);
+  write(writer, 1 << 10);
   EXPECT_FALSE(disk.hasWriter());
-  write(&writer, 1 << 20);
+  write(writer, 1 << 20);
   disk.waitForWriter();
   disk.release();
 }
-
-namespace {
-
-// Can block syncs.
-class SyncBlockingEnv final : public salttest::FaultInjectionEnv {
- public:
-  void block() { _gate = std::make_unique<Gate>(); }
-  void waitForSync() { _gate->reached.wait(); }
-  void release() { _gate->open.count_down(); }
-
- private:
-  struct Gate {
-    std::latch reached{1};
-    std::latch open{1};
-    std::atomic<bool> passed{false};
-  };
-  class File final : public salttest::FaultInjectionFile {
-   public:
-    File(SyncBlockingEnv* disk, leveldb::WritableFile* file)
-        : FaultInjectionFile(file), _disk(*disk) {}
-    leveldb::Status Sync() override {
-      if (!_disk._gate->passed.exchange(true)) {
-        _disk._gate->reached.count_down();
-        _disk._gate->open.wait();
-      }
-      return FaultInjectionFile::Sync();
-    }
-
-   private:
-    SyncBlockingEnv& _disk;
-  };
-
-  leveldb::WritableFile* wrap(const std::string&, leveldb::WritableFile* file) override {
-    return new File(this, file);
-  }
-
-  std::unique_ptr<Gate> _gate;
-};
-
-}  // namespace
 
 // The background sync thread once spun while it held the lock that the other thread needed.
 TEST(BlockedDisk, ASyncEndsWhileMuchMoreIsWritten) {
   const testsupport::TemporaryDirectory directory;
   const std::string much(size_t{2} << 20, 'x');
   for (int round = 0; round < 10; ++round) {
-    SyncBlockingEnv disk;
-    disk.block();
+    BlockingEnv disk("", Operation::sync);
+    disk.blockAfter(0);
     salt::LogSync logs(&disk);
     leveldb::WritableFile* opened = nullptr;
     const std::string path = directory / ("log" + std::to_string(round));
@@ -319,7 +259,7 @@ TEST(BlockedDisk, ASyncEndsWhileMuchMoreIsWritten) {
     const std::unique_ptr<leveldb::WritableFile> file(opened);
     ASSERT_TRUE(file->Append("a").ok());
     std::thread syncing([&file] { EXPECT_TRUE(file->Sync().ok()); });
-    disk.waitForSync();
+    disk.waitForWriter();
     ASSERT_TRUE(file->Append(much).ok());
     ASSERT_TRUE(file->Flush().ok());
     disk.release();

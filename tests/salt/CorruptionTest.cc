@@ -1,4 +1,3 @@
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -6,7 +5,6 @@
 #include <fstream>
 #include <set>
 #include <sstream>
-#include <tuple>
 
 #include "platform/Files.h"
 #include "salt/Index.h"
@@ -54,33 +52,21 @@ void flip(const fs::path& path, int64_t at) {
   file.put(static_cast<char>(~byte));
 }
 
-// A suffix, in the order of the hot part.
-using Place = std::tuple<std::string, uint32_t, uint32_t>;  // text, offset, document
-
-Place placeOf(uint32_t docID, uint32_t offset) {
-  const std::string text = salttest::naiveCut(textOf(docID).substr(offset), {});
-  return {text + '\0' + salttest::naiveVarint(offset) + salttest::naiveVarint(docID), offset,
-          docID};
-}
-
-// The suffixes of the documents of one file.
-std::set<Place> placesOf(uint32_t from) {
-  std::set<Place> places;
+// The suffixes of the documents of one file, in the order of the hot part.
+std::vector<std::string> suffixesOf(uint32_t from) {
+  salttest::Model model({});
   for (uint32_t docID = from; docID < from + kDocsPerFile; ++docID) {
-    for (const uint32_t offset : salttest::wordOffsets(textOf(docID))) {
-      places.insert(placeOf(docID, offset));
-    }
+    const std::string text = textOf(docID);
+    model.addZone(docID, 1, text, salttest::wordOffsets(text), false);
   }
-  return places;
+  return model.scan("");
 }
 
-std::set<Place> findAll(const Index& index) {
-  std::set<Place> places;
-  EXPECT_TRUE(index.ScanPrefix("", [&](const salt::SuffixMeta& meta) {
-    EXPECT_TRUE(places.insert(placeOf(meta.DocID, meta.Offset)).second);
-    return true;
-  }));
-  return places;
+std::set<std::string> findAll(const Index& index) {
+  const std::vector<std::string> found = salttest::scan(index, "");
+  const std::set<std::string> suffixes(found.begin(), found.end());
+  EXPECT_EQ(suffixes.size(), found.size());  // each is found once
+  return suffixes;
 }
 
 // Documents 1 to 100 in an old table, 101 to 200 in a newer one, 201 to 300 in the log. Opening
@@ -95,27 +81,15 @@ class CorruptionTest : public testing::Test {
     addDocs(*index, 1 + kDocsPerFile);
     index.reset();
     loadIndex(path).reset();
-    tables = files(".ldb");
+    tables = salttest::filesOf(path, ".ldb");
     index = loadIndex(path);
     addDocs(*index, 1 + 2 * kDocsPerFile);
   }
 
-  [[nodiscard]] std::vector<fs::path> files(const std::string& extension) const {
-    std::vector<fs::path> all;
-    for (const auto& entry : fs::directory_iterator(path)) {
-      if (entry.path().extension() == extension) all.push_back(entry.path());
-    }
-    std::sort(all.begin(), all.end());
-    return all;
-  }
   void write(const std::string& name, const std::string& bytes) const {
     ASSERT_TRUE(platform::writeFileAtomically(path + '/' + name, bytes, nullptr));
   }
-  [[nodiscard]] fs::path current() const {
-    std::string name = platform::readFile(path + "/CURRENT", 100, nullptr).value_or("");
-    name.pop_back();
-    return path + '/' + name;
-  }
+  [[nodiscard]] fs::path manifest() const { return salttest::filesOf(path, "MANIFEST").at(0); }
 
   testsupport::TemporaryDirectory directory;
   const std::string path = directory / "i";
@@ -129,7 +103,7 @@ class CorruptionTest : public testing::Test {
 TEST_F(CorruptionTest, RecoversTheOtherBlocksOfADamagedLog) {
   constexpr int64_t kBlockBytes = 32768;
   constexpr int64_t kBeforeKey = 7 + 12 + 2;  // headers of record, batch and key
-  const fs::path log = files(".log").at(0);
+  const fs::path log = salttest::newestLog(path);
   const std::string bytes = platform::readFile(log, 1 << 20, nullptr).value_or("");
   const auto size = static_cast<int64_t>(bytes.size());
   ASSERT_GT(size, 2 * kBlockBytes);
@@ -158,25 +132,24 @@ TEST_F(CorruptionTest, RecoversTheOtherBlocksOfADamagedLog) {
 // Reads do not verify checksums, but a block must decompress. Everything in other blocks and tables
 // is delivered, then the scan logs the error.
 TEST_F(CorruptionTest, ScansEverythingOutsideADamagedBlock) {
-  constexpr size_t kMaxKeys = 32 * 1024 / 30;  // of one block
+  constexpr ptrdiff_t kMaxKeys = 32 * 1024 / 30;  // of one block
   flip(tables.at(0), 0);
   flip(tables.at(1), 0);
   const auto index = loadIndex(path);
   ASSERT_TRUE(index);
   const LogCapture log;
-  const std::set<Place> found = findAll(*index);
+  const std::set<std::string> found = findAll(*index);
   const std::string line =
       "error SALT: Error scanning index: Corruption: corrupted compressed block contents";
   EXPECT_TRUE(log.has(line));
   for (const uint32_t from : {1u, 101u, 201u}) {
     // Of each damaged table only its first keys are missing.
-    const std::set<Place> all = placesOf(from);
-    auto place = all.begin();
-    size_t missing = 0;
-    for (; place != all.end() && !found.contains(*place); ++place) ++missing;
-    EXPECT_TRUE(std::includes(found.begin(), found.end(), place, all.end())) << from;
-    EXPECT_EQ(missing > 0, from != 201) << from;
-    EXPECT_LT(missing, kMaxKeys) << from;
+    const auto all = suffixesOf(from);
+    const auto isFound = [&found](const auto& suffix) { return found.contains(suffix); };
+    const auto first = std::find_if(all.begin(), all.end(), isFound);
+    EXPECT_TRUE(std::all_of(first, all.end(), isFound)) << from;
+    EXPECT_EQ(first > all.begin(), from != 201) << from;
+    EXPECT_LT(first - all.begin(), kMaxKeys) << from;
   }
   EXPECT_FALSE(index->Validate());
   EXPECT_EQ(log.count(line), 2u);
@@ -189,8 +162,8 @@ TEST_F(CorruptionTest, ADatabaseWithDamagedMetadataDoesNotOpen) {
   } cases[] = {
       {[&] { write("CURRENT", "garbage"); }, "Error opening db: Corruption: CURRENT file"},
       {[&] { write("CURRENT", "MANIFEST-999999\n"); }, "Error opening db: Corruption: CURRENT"},
-      {[&] { flip(current(), 10); }, "Error opening db: Corruption: "},
-      {[&] { fs::resize_file(current(), 0); }, "Error opening db: Corruption: no meta-nextfile"},
+      {[&] { flip(manifest(), 10); }, "Error opening db: Corruption: "},
+      {[&] { fs::resize_file(manifest(), 0); }, "Error opening db: Corruption: no meta-nextfile"},
       {[&] { fs::remove(tables.at(0)); }, "Error opening db: Corruption: 1 missing files"},
       {[&] {
          fs::remove_all(path);
@@ -212,7 +185,7 @@ TEST_F(CorruptionTest, ADatabaseWithDamagedMetadataDoesNotOpen) {
 // The records of an index are read first: unreadable metrics count as another version, and any
 // other unreadable record ends the process.
 TEST_F(CorruptionTest, ATruncatedTableIsNotReadPastItsEnd) {
-  fs::remove(files(".log").at(0));
+  fs::remove(salttest::newestLog(path));
   fs::copy(path, directory / "newest");
   flip(fs::path(directory / "newest") / tables.at(1).filename(), -1);
   const LogCapture log;
@@ -246,36 +219,6 @@ TEST(Corruption, InvalidOptionsEndTheProcess) {
     EXPECT_DEATH(static_cast<void>(newIndex(directory / "i", options)), "op\\.Valid\\(\\)");
   }
   expectDeath(std::string(47, '\0'), "parseRecord\\(bytes, &op\\)");
-}
-
-// Valid but unusual options do no harm.
-TEST(Corruption, UnusualOptionsWork) {
-  const std::function<void(Index::Options&)> edits[] = {
-      [](auto& op) { op.MinMatchLen = op.MaxMatchLen = 0; },
-      [](auto& op) { op.MaxMatchLen = 255; },
-      [](auto& op) { op.MaxPageSuffixes = 0; },
-      [](auto& op) { op.MaxPageSuffixes = 1; },
-      [](auto& op) { op.MaxShardSuffixes = 0; },
-      [](auto& op) { op.MaxShards = UINT32_MAX; },
-      [](auto& op) { op.MaxBatchBytes = 0; },
-      [](auto& op) { op.CompactAfterVacuum = true; },
-  };
-  for (const auto& edit : edits) {
-    const testsupport::TemporaryDirectory directory;
-    Index::Options options;
-    options.MaxHotSuffixes = 0;
-    edit(options);
-    auto index = newIndex(directory / "i", options);
-    for (uint32_t docID = 1; docID <= 3; ++docID) {
-      ASSERT_TRUE(addZone(*index, docID, 1, "aa ab ba", {0, 3, 6}));
-      index->Vacuum();
-      index.reset();
-      index = loadIndex(directory / "i");
-      ASSERT_TRUE(index);
-      EXPECT_TRUE(index->Validate());
-      EXPECT_EQ(salttest::scan(*index, "").size(), docID * 3);
-    }
-  }
 }
 
 namespace {

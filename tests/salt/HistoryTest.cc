@@ -13,8 +13,6 @@
 #include "tests/support/TemporaryDirectory.h"
 
 using salt::Index;
-using salttest::Model;
-using testsupport::TemporaryDirectory;
 using namespace std::string_literals;
 
 namespace {
@@ -24,13 +22,10 @@ constexpr size_t kSteps = 60;
 constexpr unsigned kMaxSeconds = 60;  // for one run; longer means a deadlock
 
 struct Step {
-  enum class Kind { add, append, remove, vacuum, compact, reopen };
+  enum class Kind { operation, vacuum, compact, reopen };
 
-  Kind kind = Kind::add;
-  uint32_t docID = 0;
-  uint16_t zoneID = 0;
-  std::string text;
-  std::vector<uint32_t> offsets;
+  Kind kind = Kind::operation;
+  salttest::Operation operation;
   std::string prefix;  // for the scan that follows
 };
 
@@ -45,15 +40,15 @@ std::ostream& operator<<(std::ostream& stream, const History& history) {
       "match {} to {}, zone {}, page {}, shard {}, shards {}, hot {}, batch {}, compact {}\n",
       op.MinMatchLen, op.MaxMatchLen, op.MaxZoneSize, op.MaxPageSuffixes, op.MaxShardSuffixes,
       op.MaxShards, op.MaxHotSuffixes, op.MaxBatchBytes, op.CompactAfterVacuum);
-  for (const Step& step : history.steps) {
-    constexpr const char* kNames[] = {"add", "append", "remove", "vacuum", "compact", "reopen"};
-    stream << kNames[static_cast<int>(step.kind)];
-    if (step.docID != 0) stream << ' ' << step.docID;
-    if (step.zoneID != 0) {
-      stream << ',' << step.zoneID << ' ' << testing::PrintToString(step.text)
-             << fmt::format(" at {}", fmt::join(step.offsets, ","));
+  for (const auto& [kind, operation, prefix] : history.steps) {
+    constexpr const char* kNames[] = {"operation", "vacuum", "compact", "reopen"};
+    stream << kNames[static_cast<int>(kind)];
+    if (kind == Step::Kind::operation) {
+      stream << fmt::format(" on {},{}, merge {}, at {}: ", operation.docID, operation.zoneID,
+                            operation.merge, fmt::join(operation.offsets, ","))
+             << testing::PrintToString(operation.text);
     }
-    stream << "; scan " << testing::PrintToString(step.prefix) << '\n';
+    stream << "; scan " << testing::PrintToString(prefix) << '\n';
   }
   return stream;
 }
@@ -78,13 +73,13 @@ class Generator {
     using Lengths = std::pair<uint8_t, uint8_t>;
     Index::Options op;
     std::tie(op.MinMatchLen, op.MaxMatchLen) =
-        oneOf({Lengths{32, 100}, Lengths{3, 10}, Lengths{0, 255}, Lengths{1, 1}});
+        oneOf({Lengths{32, 100}, Lengths{3, 10}, Lengths{0, 255}, Lengths{1, 1}, Lengths{0, 0}});
     op.MaxZoneSize = oneOf({200u, 200000u});
-    op.MaxPageSuffixes = oneOf({1u, 2u, 3u, 4u, 5u, 50u});
+    op.MaxPageSuffixes = oneOf({0u, 1u, 2u, 3u, 4u, 5u, 50u});
     op.MaxShardSuffixes = oneOf({0u, 1u, 100u, 1000u, 1000000u});
-    op.MaxShards = oneOf({1u, 2u, 16u});
+    op.MaxShards = oneOf({1u, 2u, 16u, UINT32_MAX});
     op.MaxHotSuffixes = oneOf({0u, 1u, 4u, 4u, 100u, 1000000u});
-    op.MaxBatchBytes = oneOf({1u, 1u, 1000u, 1000000u});
+    op.MaxBatchBytes = oneOf({0u, 1u, 1000u, 1000000u});
     op.CompactAfterVacuum = _random() % 8 == 0;
     return op;
   }
@@ -99,16 +94,20 @@ class Generator {
     } else if (dice < 6) {
       step->kind = Step::Kind::compact;
     } else {
-      step->docID = 1 + _random() % 16 * oneOf({1u, 1u, 50u});
-      step->kind = dice < 8 ? Step::Kind::remove : dice < 13 ? Step::Kind::add : Step::Kind::append;
+      fill(&step->operation, dice < 8);
+      step->operation.merge = dice >= 13;
     }
-    if (step->docID == 0 || step->kind == Step::Kind::remove) return;
-    step->zoneID = oneOf<uint16_t>({1, 1, 1, 129, 256, 65535});
+  }
+
+  void fill(salttest::Operation* made, bool removes) {
+    made->docID = 1 + _random() % 16 * oneOf({1u, 1u, 50u});
+    if (removes) return;
+    made->zoneID = oneOf<uint16_t>({1, 1, 1, 129, 256, 65535});
     const bool known = !_texts.empty() && _random() % 4 == 0;
-    step->text = known ? _texts[_random() % _texts.size()]
+    made->text = known ? _texts[_random() % _texts.size()]
                        : salttest::randomText(_random, _random() % oneOf({10u, 100u, 300u}));
-    step->offsets = salttest::randomOffsets(_random, step->text);
-    _texts.push_back(step->text);
+    made->offsets = salttest::randomOffsets(_random, made->text);
+    _texts.push_back(made->text);
   }
 
   // Usually a prefix that occurs: a piece of a text, perhaps changed at its end.
@@ -149,17 +148,11 @@ class Run {
 
  private:
   std::string take(const Step& step) {
-    const bool merge = step.kind == Step::Kind::append;
-    std::vector<uint32_t> offsets = step.offsets;
     switch (step.kind) {
-      case Step::Kind::add:
-      case Step::Kind::append:
-        return _index->AddZone(step.docID, step.zoneID, step.text, offsets, merge) ==
-                       _model.addZone(step.docID, step.zoneID, step.text, step.offsets, merge)
+      case Step::Kind::operation:
+        return carryOut(*_index, step.operation) == carryOut(_model, step.operation)
                    ? ""
-                   : "AddZone answers otherwise";
-      case Step::Kind::remove:
-        return _index->DeleteDoc(step.docID) == _model.deleteDoc(step.docID) ? "" : "DeleteDoc";
+                   : "the index answers otherwise";
       case Step::Kind::vacuum:
         _index->Vacuum();
         return "";
@@ -207,22 +200,11 @@ class Run {
 
   // The second scan of a prefix may be answered from the cache.
   std::string comparedPlaces(const std::string& prefix, const std::vector<std::string>& suffixes) {
-    std::set<std::string> expected;
-    for (const std::string& suffix : suffixes) expected.insert(suffix.substr(0, suffix.find(':')));
     for (int time = 0; time < 2; ++time) {
-      std::set<std::string> found;
-      const auto count = salttest::scanPlaces(
-          *_index, prefix, SIZE_MAX, [&](const auto& zones, const auto* docs, size_t run) {
-            if (run == 0) found.insert("an empty run");
-            for (const auto& [doc, zone] : salttest::placesOf(zones, docs, run)) {
-              found.insert(fmt::format("{},{}", doc, zone));
-            }
-          });
-      if (count != suffixes.size())
-        return fmt::format("{} suffixes, not {}", *count, suffixes.size());
-      if (found != expected) {
-        return compared(prefix, {found.begin(), found.end()}, {expected.begin(), expected.end()});
-      }
+      const auto found = salttest::scanPlaces(*_index, prefix);
+      if (found == salttest::placesOf(suffixes)) continue;
+      const std::vector<std::string> places(found->places.begin(), found->places.end());
+      return fmt::format("{} places, ", found->suffixes) + compared(prefix, places, suffixes);
     }
     return "";
   }
@@ -235,7 +217,7 @@ class Run {
 
   const History& _history;
   const testsupport::LogCapture _log;
-  Model _model;
+  salttest::Model _model;
   const std::string _path;
   std::unique_ptr<Index> _index;
 };
@@ -243,7 +225,7 @@ class Run {
 // Runs in its own process, so that an assertion or a deadlock is a fault like any other. Because of
 // the fork, this test program must not start threads.
 std::string faultOf(const History& history) {
-  const TemporaryDirectory directory;
+  const testsupport::TemporaryDirectory directory;
   int ends[2];
   EXPECT_EQ(pipe(ends), 0);
   const pid_t child = fork();
@@ -289,10 +271,10 @@ History shortest(History failing) {
     }
   }
   for (size_t at = 0; at < failing.steps.size(); ++at) {
-    for (History shorter = failing; !shorter.steps[at].text.empty(); shorter = failing) {
-      Step& step = shorter.steps[at];
-      step.text.resize(step.text.size() / 2);
-      std::erase_if(step.offsets, [&step](uint32_t offset) { return offset >= step.text.size(); });
+    for (History shorter = failing; !shorter.steps[at].operation.text.empty(); shorter = failing) {
+      auto& [docID, zoneID, text, offsets, merge] = shorter.steps[at].operation;
+      text.resize(text.size() / 2);
+      std::erase_if(offsets, [end = text.size()](uint32_t offset) { return offset >= end; });
       if (!accept(shorter)) break;
     }
   }

@@ -1,21 +1,17 @@
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <set>
 
 #include "salt/Inspection.h"
 #include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
 // Copies of an index without deleted documents.
 namespace {
-
-using salt::Index;
-using salttest::Model;
 
 constexpr uint32_t kSeeds = 6;
 constexpr uint32_t kDocs = 60;
@@ -25,23 +21,12 @@ std::string wordOf(uint32_t docID) {
   return "only" + std::to_string(docID) + "here";
 }
 
-// Some positions of the text, and those of its words.
-std::vector<uint32_t> placesIn(std::mt19937& random, const std::string& text) {
-  std::vector<uint32_t> places = salttest::randomOffsets(random, text);
-  for (const uint32_t word : salttest::wordOffsets(text)) {
-    if (text[word] != '\0') places.push_back(word);
-  }
-  std::sort(places.begin(), places.end());
-  places.erase(std::unique(places.begin(), places.end()), places.end());
-  return places;
-}
-
 class LiveCopyTest : public testing::Test {
  protected:
   // Two zones per document, some merged into shards and some hot.
   void fill(uint32_t seed) {
     std::mt19937 random(seed);
-    Index::Options options;
+    salt::Index::Options options;
     options.MaxPageSuffixes = 1 + seed % 9;
     options.MaxShardSuffixes = 400;
     options.MaxShards = 3;
@@ -52,7 +37,8 @@ class LiveCopyTest : public testing::Test {
       for (const uint16_t zoneID : {1, 300}) {
         const std::string text =
             salttest::randomText(random, 40) + ' ' + wordOf(docID) + ' ' + std::string(20, 'a');
-        ASSERT_TRUE(salttest::addZone(*index, docID, zoneID, text, placesIn(random, text)));
+        ASSERT_TRUE(
+            salttest::addZone(*index, docID, zoneID, text, salttest::randomOffsets(random, text)));
       }
       if (docID % 15 != 0) continue;
       index->Vacuum();
@@ -136,7 +122,7 @@ TEST_F(LiveCopyTest, GivesTheSameAnswersAndContainsNothingElse) {
     // The copy accepts documents and merges like any other index.
     for (uint32_t docID = kDocs + 1; docID < kDocs + 30; ++docID) {
       const std::string text = wordOf(docID) + ' ' + salttest::randomText(random, 200);
-      ASSERT_TRUE(salttest::addZone(*made, docID, 1, text, placesIn(random, text)));
+      ASSERT_TRUE(salttest::addZone(*made, docID, 1, text));
     }
     made->Vacuum();
     EXPECT_TRUE(made->Compact());
@@ -150,7 +136,7 @@ TEST_F(LiveCopyTest, AWriteThatFailsIsAnError) {
   gone.clear();
   fill(3);
   for (const uint64_t bytes : {0, 100, 4000, 20000}) {
-    const salttest::FileSizeLimit limit(bytes);
+    const testsupport::FileSizeLimit limit(bytes);
     EXPECT_EQ(copy(), std::nullopt) << bytes;
     ASSERT_TRUE(error) << bytes;
     EXPECT_EQ(error->domain, kPOSIXErrorDomain);

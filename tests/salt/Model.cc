@@ -9,6 +9,7 @@
 #include <memory>
 #include <sstream>
 #include <tuple>
+#include <unordered_map>
 
 #include "platform/Assert.h"
 
@@ -253,19 +254,32 @@ std::vector<std::string> Model::scan(std::string_view prefix) const {
 
 std::string Model::difference(const salt::Index::Metrics& metrics) const {
   std::set<uint32_t> docs;
+  std::unordered_map<uint16_t, uint64_t> zoneCounts;
   uint64_t zones = 0;
   uint64_t textBytes = 0;
   for (const auto& [id, text] : texts) {
     if (deleted.contains(id.first)) continue;
     docs.insert(id.first);
+    ++zoneCounts[id.second];
     ++zones;
     textBytes += text.size();
   }
   if (metrics.Docs != docs.size()) return "Docs";
   if (metrics.Zones != zones) return "Zones";
+  if (metrics.ZoneCounts != zoneCounts) return "ZoneCounts";
   if (metrics.TextBytes != textBytes) return "TextBytes";
   if (metrics.DeletedDocs != deleted.size()) return "DeletedDocs";
   return metrics.Suffixes == places.size() ? "" : "Suffixes";
+}
+
+bool carryOut(salt::Index& index, Operation made) {
+  if (made.zoneID == 0) return index.DeleteDoc(made.docID);
+  return index.AddZone(made.docID, made.zoneID, made.text, made.offsets, made.merge);
+}
+
+bool carryOut(Model& model, const Operation& made) {
+  if (made.zoneID == 0) return model.deleteDoc(made.docID);
+  return model.addZone(made.docID, made.zoneID, made.text, made.offsets, made.merge);
 }
 
 std::string randomText(std::mt19937& random, size_t size) {

@@ -54,6 +54,19 @@ struct Model {
   uint32_t lastDocID = 0;
 };
 
+// One call of AddZone or, if `zoneID` is 0, of DeleteDoc.
+struct Operation {
+  uint32_t docID = 0;
+  uint16_t zoneID = 0;
+  std::string text;
+  std::vector<uint32_t> offsets;
+  bool merge = true;
+};
+
+// Applies an operation to the index or the model, and returns its answer.
+bool carryOut(salt::Index& index, Operation operation);
+bool carryOut(Model& model, const Operation& operation);
+
 // A text with a small alphabet, so that suffixes share long prefixes, with spaces, some NULs and
 // some bytes above 0x7F.
 [[nodiscard]] std::string randomText(std::mt19937& random, size_t size);

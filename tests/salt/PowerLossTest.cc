@@ -15,7 +15,6 @@
 namespace {
 
 using salt::Index;
-using testsupport::TemporaryDirectory;
 
 // Tracks how much of each file is certainly on disk, and takes snapshots of the directory as a
 // power loss would leave it: whenever a file is removed or a manifest grows. A manifest reaches the
@@ -52,47 +51,27 @@ class PowerLossEnv final : public salttest::FaultInjectionEnv {
   }
 
  private:
-  class File final : public salttest::FaultInjectionFile {
-   public:
-    File(PowerLossEnv* disk, std::string path, leveldb::WritableFile* file)
-        : FaultInjectionFile(file), _disk(*disk), _path(std::move(path)) {}
-
-    leveldb::Status Flush() override {
-      const leveldb::Status status = FaultInjectionFile::Flush();
-      if (_path.find("MANIFEST") != std::string::npos) _disk.manifestGrew(_path);
-      return status;
-    }
-    leveldb::Status Sync() override {
-      if (const leveldb::Status flushed = FaultInjectionFile::Flush(); !flushed.ok())
-        return flushed;
-      std::error_code gone;  // an obsolete log may have been removed
-      const uint64_t written = std::filesystem::file_size(_path, gone);
-      const leveldb::Status status = FaultInjectionFile::Sync();
-      if (!gone) _disk.synced(_path, written);
-      return status;
-    }
-
-   private:
-    PowerLossEnv& _disk;
-    const std::string _path;
-  };
-
-  leveldb::WritableFile* wrap(const std::string& path, leveldb::WritableFile* file) override {
+  void opened(const std::string& path) override {
     platform::MutexLock lock(_mutex);
     _synced.emplace(path, 0);
-    return new File(this, path, file);
   }
-
-  void synced(const std::string& path, uint64_t written) {
-    platform::MutexLock lock(_mutex);
-    const auto known = _synced.find(path);
-    if (known != _synced.end()) known->second = std::max(known->second, written);
-  }
-
-  void manifestGrew(const std::string& path) {
+  leveldb::Status flush(const std::string& path, File& file) override {
+    const leveldb::Status status = file.Flush();
+    if (path.find("MANIFEST") == std::string::npos) return status;
     platform::MutexLock lock(_mutex);
     _synced[path] = std::filesystem::file_size(path);
     takeSnapshot();
+    return status;
+  }
+  leveldb::Status sync(const std::string& path, File& file) override {
+    if (const leveldb::Status flushed = file.Flush(); !flushed.ok()) return flushed;
+    std::error_code gone;  // an obsolete log may have been removed
+    const uint64_t written = std::filesystem::file_size(path, gone);
+    const leveldb::Status status = file.Sync();
+    platform::MutexLock lock(_mutex);
+    const auto known = _synced.find(path);
+    if (!gone && known != _synced.end()) known->second = std::max(known->second, written);
+    return status;
   }
 
   void takeSnapshot() TL_REQUIRES(_mutex) {
@@ -139,7 +118,7 @@ void addDocs(Index& index, PowerLossEnv& disk, uint32_t count) {
 }
 
 TEST(PowerLoss, LeavesTheFirstOperationsWithoutAGap) {
-  const TemporaryDirectory directory;
+  const testsupport::TemporaryDirectory directory;
   PowerLossEnv disk(directory / "snapshots");
   const std::string path = directory / "index";
   Index::Options options;

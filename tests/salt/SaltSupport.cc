@@ -2,7 +2,6 @@
 
 #include <fmt/format.h>
 #include <gtest/gtest.h>
-#include <signal.h>
 
 #include <algorithm>
 #include <sstream>
@@ -11,48 +10,31 @@
 #include "salt/Coding.h"
 #include "salt/Database.h"
 #include "salt/PostingSet.h"
+#include "tests/salt/Model.h"
 
 namespace salttest {
 
-namespace {
-
-salt::Index::Metrics storedMetrics(leveldb::DB& db) {
-  std::string bytes;
-  TL_ASSERT(db.Get({}, "\xFFMETRICS", &bytes).ok());
-  std::istringstream stream(bytes);
-  salt::Index::Metrics metrics;
-  TL_ASSERT(metrics.ParseFromIstream(stream));
-  return metrics;
-}
-
-void storeMetrics(leveldb::DB& db, const salt::Index::Metrics& metrics) {
-  std::ostringstream stream;
-  TL_ASSERT(metrics.SerializeToOstream(stream));
-  TL_ASSERT(db.Put({}, "\xFFMETRICS", stream.str()).ok());
-}
-
-}  // namespace
-
 void writePage(const std::string& path, uint8_t shard, const std::string& firstText,
                const std::vector<salt::SuffixMeta>& metas) {
-  salt::Database database = salt::openDatabase(path, salt::OpenMode::existing);
-  salt::Index::Metrics metrics = storedMetrics(*database.db);
   std::string key;
   std::string value;
   salt::suffixKey(shard, firstText, metas.front(), &key);
   salt::pageToValue(metas.data(), metas.size(), &value);
-  TL_ASSERT(database.db->Put({}, key, value).ok());
-  metrics.Shards = std::max<uint64_t>(metrics.Shards, shard);
-  metrics.Pages += 1;
-  metrics.Suffixes += metas.size();
-  storeMetrics(*database.db, metrics);
+  editKey(path, key, &value);
+  editMetrics(path, [&](salt::Index::Metrics& metrics) {
+    metrics.Shards = std::max<uint64_t>(metrics.Shards, shard);
+    metrics.Pages += 1;
+    metrics.Suffixes += metas.size();
+  });
 }
 
 void editMetrics(const std::string& path, const std::function<void(salt::Index::Metrics&)>& edit) {
-  salt::Database database = salt::openDatabase(path, salt::OpenMode::existing);
-  salt::Index::Metrics metrics = storedMetrics(*database.db);
+  salt::Index::Metrics metrics = storedMetrics(readKeys(path));
   edit(metrics);
-  storeMetrics(*database.db, metrics);
+  std::ostringstream stream;
+  TL_ASSERT(metrics.SerializeToOstream(stream));
+  const std::string bytes = stream.str();
+  editKey(path, "\xFFMETRICS", &bytes);
 }
 
 void editKey(const std::string& path, const std::string& key, const std::string* value) {
@@ -60,24 +42,17 @@ void editKey(const std::string& path, const std::string& key, const std::string*
   TL_ASSERT((value ? database.db->Put({}, key, *value) : database.db->Delete({}, key)).ok());
 }
 
-std::filesystem::path newestLog(const std::string& path) {
-  std::filesystem::path newest;
+std::vector<std::filesystem::path> filesOf(const std::string& path, std::string_view part) {
+  std::vector<std::filesystem::path> found;
   for (const auto& entry : std::filesystem::directory_iterator(path)) {
-    // Names are numbers of equal width.
-    if (entry.path().extension() == ".log") newest = std::max(newest, entry.path());
+    if (entry.path().filename().string().find(part) != std::string::npos) found.push_back(entry);
   }
-  return newest;
+  std::sort(found.begin(), found.end());
+  return found;
 }
 
-FileSizeLimit::FileSizeLimit(uint64_t bytes) {
-  signal(SIGXFSZ, SIG_IGN);
-  getrlimit(RLIMIT_FSIZE, &_before);
-  const rlimit low{bytes, _before.rlim_max};
-  TL_ASSERT(setrlimit(RLIMIT_FSIZE, &low) == 0);
-}
-
-FileSizeLimit::~FileSizeLimit() {
-  setrlimit(RLIMIT_FSIZE, &_before);
+std::filesystem::path newestLog(const std::string& path) {
+  return filesOf(path, ".log").back();  // names are numbers of equal width
 }
 
 std::unique_ptr<salt::Index> newIndex(const std::string& path, salt::Index::Options options) {
@@ -102,32 +77,42 @@ std::vector<uint32_t> wordOffsets(std::string_view text) {
   return offsets;
 }
 
+std::string printed(const salt::SuffixMeta& suffix) {
+  return fmt::format("{},{}:{}", suffix.DocID, suffix.ZoneID, suffix.Offset);
+}
+
 std::vector<std::string> scan(const salt::Index& index, std::string_view prefix) {
   std::vector<std::string> found;
-  EXPECT_TRUE(index.ScanPrefix(prefix, [&found](const salt::SuffixMeta& meta) {
-    found.push_back(fmt::format("{},{}:{}", meta.DocID, meta.ZoneID, meta.Offset));
+  EXPECT_TRUE(index.ScanPrefix(prefix, [&found](const salt::SuffixMeta& suffix) {
+    found.push_back(printed(suffix));
     return true;
   }));
   return found;
 }
 
-std::vector<std::pair<uint32_t, uint16_t>> placesOf(const std::vector<uint16_t>& zones,
-                                                    const salt::DocZones* docs, size_t count) {
-  std::vector<std::pair<uint32_t, uint16_t>> places;
-  for (const salt::DocZones* doc = docs; doc != docs + count; ++doc) {
-    for (size_t zone = 0; zone < zones.size(); ++zone) {
-      if ((doc->zones >> zone & 1) != 0) places.emplace_back(doc->DocID, zones[zone]);
-    }
-  }
-  return places;
-}
-
-std::optional<uint64_t> scanPlaces(const salt::Index& index, std::string_view prefix,
-                                   uint64_t limit, const salt::PlacesCallback& callback) {
+std::optional<Places> scanPlaces(const salt::Index& index, std::string_view prefix,
+                                 uint64_t limit) {
   const auto found = index.ScanPlaces({prefix}, limit);
   if (found.front() == nullptr) return std::nullopt;
-  found.front()->deliver(callback);
-  return found.front()->suffixes();
+  Places all{{}, found.front()->suffixes()};
+  found.front()->deliver([&all](const auto& zones, const salt::DocZones* docs, size_t count) {
+    if (count == 0) all.places.insert("an empty run");
+    for (size_t i = 0; i < count * zones.size(); ++i) {
+      const salt::DocZones& doc = docs[i / zones.size()];
+      const size_t zone = i % zones.size();
+      if ((doc.zones >> zone & 1) == 0) continue;
+      all.places.insert(fmt::format("{},{}", doc.DocID, zones[zone]));
+    }
+  });
+  return all;
+}
+
+Places placesOf(const std::vector<std::string>& suffixes) {
+  Places all{{}, suffixes.size()};
+  for (const std::string& suffix : suffixes) {
+    all.places.insert(suffix.substr(0, suffix.find(':')));
+  }
+  return all;
 }
 
 }  // namespace salttest

@@ -1,13 +1,12 @@
 #pragma once
 
-#include <sys/resource.h>
-
 #include <filesystem>
 #include <functional>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
-#include <utility>
+#include <string_view>
 #include <vector>
 
 #include "salt/Index.h"
@@ -25,21 +24,12 @@ void editMetrics(const std::string& path, const std::function<void(salt::Index::
 // Writes a key or, without a value, removes it.
 void editKey(const std::string& path, const std::string& key, const std::string* value);
 
+// The files of the database at `path` whose names contain `part`, in the order of their names.
+[[nodiscard]] std::vector<std::filesystem::path> filesOf(const std::string& path,
+                                                         std::string_view part);
+
 // The newest write-ahead log of the database at `path`.
 [[nodiscard]] std::filesystem::path newestLog(const std::string& path);
-
-// During its lifetime, a write that exceeds this file size fails after a partial write, as on a
-// full disk.
-class FileSizeLimit {
- public:
-  explicit FileSizeLimit(uint64_t bytes);
-  ~FileSizeLimit();
-  FileSizeLimit(const FileSizeLimit&) = delete;
-  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
-
- private:
-  rlimit _before{};
-};
 
 [[nodiscard]] std::unique_ptr<salt::Index> newIndex(const std::string& path,
                                                     salt::Index::Options options = {});
@@ -52,15 +42,23 @@ bool addZone(salt::Index& index, uint32_t docID, uint16_t zoneID, const std::str
 // Offset 0 and the offsets of the bytes after a space.
 [[nodiscard]] std::vector<uint32_t> wordOffsets(std::string_view text);
 
-// The suffixes of a scan: "docID,zoneID:offset" in order.
+// "docID,zoneID:offset"
+[[nodiscard]] std::string printed(const salt::SuffixMeta& suffix);
+
+// The suffixes of a scan, printed, in order.
 [[nodiscard]] std::vector<std::string> scan(const salt::Index& index, std::string_view prefix);
 
-// ScanPlaces for one prefix: the number of suffixes, or nullopt.
-std::optional<uint64_t> scanPlaces(const salt::Index& index, std::string_view prefix,
-                                   uint64_t limit, const salt::PlacesCallback& callback);
+// The places of suffixes, "docID,zoneID", and the number of suffixes.
+struct Places {
+  std::set<std::string> places;
+  uint64_t suffixes = 0;
+  bool operator==(const Places&) const = default;
+};
 
-// The places of a batch as (docID, zoneID).
-[[nodiscard]] std::vector<std::pair<uint32_t, uint16_t>> placesOf(
-    const std::vector<uint16_t>& zones, const salt::DocZones* docs, size_t count);
+// The result of ScanPlaces for one prefix, which may use posting lists and the cache; and of a
+// scan, which reads the pages.
+[[nodiscard]] std::optional<Places> scanPlaces(const salt::Index& index, std::string_view prefix,
+                                               uint64_t limit = UINT64_MAX);
+[[nodiscard]] Places placesOf(const std::vector<std::string>& suffixes);
 
 }  // namespace salttest

@@ -1,9 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <atomic>
-#include <thread>
-
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
 #include "tests/salt/SaltSupport.h"
@@ -18,17 +15,6 @@ using salttest::scan;
 using testing::ElementsAre;
 using testsupport::TemporaryDirectory;
 using namespace std::string_literals;
-
-namespace {
-
-Index::Options matchLengths(uint8_t least, uint8_t most) {
-  Index::Options options;
-  options.MinMatchLen = least;
-  options.MaxMatchLen = most;
-  return options;
-}
-
-}  // namespace
 
 TEST(ScanPrefix, StopsWhenToldAndCountsWhatItDid) {
   const TemporaryDirectory directory;
@@ -78,72 +64,12 @@ TEST(ScanPrefix, SkipsShardsWithoutPages) {
   EXPECT_THAT(scan(*index, "wz"), ElementsAre());
 }
 
-TEST(ScanPrefix, RunsConcurrentlyWithAddZone) {
-  const TemporaryDirectory directory;
-  const auto index = newIndex(directory / "i");
-  std::atomic<uint32_t> added{0};
-  std::jthread writer([&] {
-    for (uint32_t docID = 1; docID <= 300; ++docID) {
-      EXPECT_TRUE(addZone(*index, docID, 1, "some words", {0, 5}));
-      added = docID;
-    }
-  });
-  for (bool done = false; !done;) {
-    done = added == 300;
-    const uint32_t before = added;
-    const size_t found = scan(*index, "some").size();
-    EXPECT_GE(found, before);
-    EXPECT_LE(found, index->GetMetrics().Docs);
-  }
-}
-
-TEST(Suffix, DerivesTheNextFromThePageEntry) {
-  const TemporaryDirectory directory;
-  const auto owner = newIndex(directory / "i", matchLengths(2, 5));
-  ASSERT_TRUE(addZone(*owner, 1, 1, "abcdefg", {}));
-  const auto& index = dynamic_cast<const salt::index&>(*owner);
-  const struct {
-    SuffixMeta meta;
-    std::string known;
-    bool full;
-  } cases[] = {
-      {{1, 0, 1, 3, {'x', 'y'}}, "abcxy", false},  // may be longer
-      {{1, 0, 1, 3, {'x', 0}}, "abcx", true},
-      {{1, 0, 1, 3, {0, 0}}, "abc", true},
-      {{1, 0, 1, 0, {0, 0}}, "", false},  // nothing is known, so it is fetched
-  };
-  for (const auto& c : cases) {
-    salt::Suffix suffix(index, {});
-    EXPECT_TRUE(suffix.full && suffix.knownText().empty());
-    suffix.fromKey(
-        "\x01"
-        "abcd\0\x01\0\x01"s);
-    suffix.fromNextMeta(c.meta);
-    EXPECT_EQ(suffix.knownText(), c.known);
-    EXPECT_EQ(suffix.full, c.full);
-  }
-  salt::Suffix suffix(index, {});
-  suffix.fromKey(
-      "\x01"
-      "abcde\0\x01\0\x01"s);
-  suffix.fromNextMeta({1, 0, 1, 1, {'b', 'c'}});
-  suffix.fromNextMeta({1, 0, 1, 4, {'e', 0}});  // longer common prefix than the known text: ignored
-  EXPECT_EQ(suffix.knownText(), "abc");
-  EXPECT_FALSE(suffix.full);
-  suffix.fetch();
-  suffix.fetch();
-  EXPECT_EQ(suffix.knownText(), "abcde");
-  EXPECT_EQ(suffix.fetches, 1u);
-  salt::Suffix copy(index, {});
-  copy = suffix;
-  EXPECT_EQ(copy.knownText(), "abcde");
-  EXPECT_EQ(copy.fetches, 0u);
-  EXPECT_EQ(copy.meta.DocID, 1u);
-}
-
 TEST(Suffix, CorruptDataEndsTheProcess) {
   const TemporaryDirectory directory;
-  const auto owner = newIndex(directory / "i", matchLengths(2, 5));
+  Index::Options options;
+  options.MinMatchLen = 2;
+  options.MaxMatchLen = 5;
+  const auto owner = newIndex(directory / "i", options);
   const auto& index = dynamic_cast<const salt::index&>(*owner);
   salt::Suffix suffix(index, {});
   EXPECT_DEATH(suffix.fromKey("\0ab"s), "s\\.size\\(\\)");

@@ -13,7 +13,6 @@
 #include "tests/support/Seed.h"
 #include "tests/support/TemporaryDirectory.h"
 
-using saltsearch::TokenizeAlphanum;
 using saltsearch::TokenizeSpace;
 using saltsearch::TopKTokens;
 using saltsearch::ZoneScoreDefault;
@@ -92,19 +91,6 @@ TEST(TopTokens, SkipsDeletedDocumentsAndVeryLongTokens) {
   EXPECT_THAT(top(0), ElementsAre());
 }
 
-TEST(TopTokens, EndsWhenToldTo) {
-  const testsupport::TemporaryDirectory directory;
-  const auto index = salttest::newIndex(directory / "i");
-  for (uint32_t docID = 1; docID <= 50; ++docID) addZone(*index, docID, 1, "word ");
-  int zones = 0;
-  const auto tokenize = [&zones](std::string_view text) {
-    ++zones;
-    return TokenizeSpace(text);
-  };
-  static_cast<void>(TopKTokens(*index, 5, ZoneScoreDefault, tokenize, [&] { return zones < 7; }));
-  EXPECT_EQ(zones, 7);
-}
-
 TEST(TopTokens, TakesNoMoreMemoryForMoreTokens) {
   const testsupport::TemporaryDirectory directory;
   const auto index = salttest::newIndex(directory / "i");
@@ -143,6 +129,6 @@ TEST(TopTokens, SplittersFindTheStartsOfWords) {
   };
   for (const auto& c : cases) {
     EXPECT_EQ(TokenizeSpace(c.text), c.space) << c.text;
-    EXPECT_EQ(TokenizeAlphanum(c.text), c.letters) << c.text;
+    EXPECT_EQ(saltsearch::TokenizeAlphanum(c.text), c.letters) << c.text;
   }
 }

@@ -6,11 +6,10 @@
 #include "salt/IndexImpl.h"
 #include "salt/ZoneTextCache.h"
 #include "tests/salt/SaltSupport.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace {
-
-using salttest::FileSizeLimit;
 
 // Some zones are longer than one read-ahead; every tenth document has none.
 class ZoneTextCacheTest : public testing::Test {
@@ -62,7 +61,7 @@ TEST_F(ZoneTextCacheTest, GivesTheSameWithAFileOfAnyLength) {
 TEST_F(ZoneTextCacheTest, WorksWhenTheFileCannotGrow) {
   salt::ZoneTextCache texts(index());
   {
-    const FileSizeLimit limit(100000);
+    const testsupport::FileSizeLimit limit(100000);
     expectAllTexts(&texts);
   }
   expectAllTexts(&texts);

@@ -32,30 +32,31 @@ std::string withNULs(std::string_view shown) {
   return bytes;
 }
 
-std::shared_ptr<TLAttribute> attribute(TLAttributeKey key, TLStringView value,
-                                       std::optional<TLString> customKey = std::nullopt) {
-  auto made = std::make_shared<TLAttribute>();
-  made->setKey(key);
-  made->setCustomKey(std::move(customKey));
-  made->setStringValue(TLString(value));
+struct Attribute {
+  TLAttributeKey key;
+  TLString value;
+  std::optional<TLString> customKey = std::nullopt;
+};
+
+std::unique_ptr<TLIndexableItem> item(TLStringView identifier,
+                                      const std::vector<Attribute>& attributes) {
+  auto made = std::make_unique<TLIndexableItem>();
+  made->setIdentifier(TLString(identifier));
+  for (const Attribute& each : attributes) {
+    made->addAttributeWithKeyStringValue(each.key, each.value);
+    made->attributes().back()->setCustomKey(each.customKey);
+  }
   return made;
 }
 
-TLIndexableItem& fill(TLIndexableItem& item, TLStringView identifier,
-                      const std::vector<std::shared_ptr<TLAttribute>>& attributes) {
-  item.setIdentifier(TLString(identifier));
-  for (const auto& each : attributes) item.addAttributes(each);
-  return item;
-}
-
-// "KEY=value" of each attribute in order.
-std::vector<std::string> shown(const TLIndexableItem& item) {
-  std::vector<std::string> lines;
+// "KEY=value " of each attribute in order.
+std::string shown(const TLIndexableItem& item) {
+  std::string text;
   for (const auto& each : item.attributes()) {
-    lines.push_back(TLAttribute::keyAsString(each->key()) + "=" +
-                    platform::printable(each->stringValue()));
+    text += TLAttribute::keyAsString(each->key()) + "=" + platform::printable(each->stringValue());
+    text += ' ';
   }
-  return lines;
+  return text;
 }
 
 std::shared_ptr<TLParameters> parameters(TLStringView overrides) {
@@ -110,23 +111,14 @@ TEST(ZoneManager, ZonesAreAttributeKeys) {
   }
 }
 
-TEST(ZoneManager, DefaultScoresAndTheirOrder) {
-  const struct {
-    int32_t zone;
-    std::optional<float> score;
-  } rows[] = {{13, 0.9F},  {171, 0.5F}, {104, 0.5F}, {107, 1.0F}, {111, 0.1F},
-              {115, 0.1F}, {119, 0.0F}, {108, 0.8F}, {112, 0.1F}, {116, 0.1F},
-              {120, 0.0F}, {22, {}},    {138, 1.0F}, {165, 1.0F}, {106, 1.0F},
-              {180, 1.0F}, {147, 0.2F}, {132, 0.2F}, {131, 0.2F}};
+// The tests of the query processor show the other scores, and the order of all zones.
+TEST(ZoneManager, DefaultScoresOfZonesThatFreeTextDoesNotSearch) {
   TALZoneManager manager;
   manager.setupAttributeScoresWithSearchParams(*TLParamsManager::paramsFromFallback());
-  ASSERT_EQ(manager.indexableEnumKeyAttribs().size(), std::size(rows));
-  for (size_t i = 0; i < std::size(rows); ++i) {
-    EXPECT_EQ(static_cast<int32_t>(manager.indexableEnumKeyAttribs()[i]), rows[i].zone);
-    EXPECT_EQ(manager.scoreForZoneID(rows[i].zone), rows[i].score) << rows[i].zone;
+  for (const int32_t zone : {138, 165, 106, 180}) EXPECT_EQ(manager.scoreForZoneID(zone), 1.0F);
+  for (const std::optional<int32_t> none : {std::optional<int32_t>(), {22}, {999}}) {
+    EXPECT_EQ(manager.scoreForZoneID(none), std::nullopt);
   }
-  EXPECT_EQ(manager.scoreForZoneID(std::nullopt), std::nullopt);
-  EXPECT_EQ(manager.scoreForZoneID(999), std::nullopt);
 }
 
 TEST(ZoneManager, ParametersOfASearchStayInForce) {
@@ -165,38 +157,38 @@ TEST(ZoneManager, ScoresAreSetWhileOthersRead) {
 }
 
 TEST(ZoneManager, MergesAttributeByAttribute) {
-  const TALZoneManager manager;
-  bool shouldIndex = false;
-  TLIndexableItem oldDoc;
-  fill(oldDoc, u"id",
-       {attribute(SUBJECT, u"old"), attribute(READ, u"no"), attribute(AUTHORS, u"ann"),
-        attribute(CUSTOM, u"kept", u"k1"), attribute(CUSTOM, u"replaced", u"k2"),
-        attribute(CUSTOM, u"nameless"), attribute(AUTHORS, u"bob")});
-
-  TLIndexableItem full;
-  const auto merged =
-      manager.mergeNewDoc(fill(full, u"id2", {attribute(SUBJECT, u"new"), attribute(READ, u"yes")}),
-                          &oldDoc, &shouldIndex);
-  EXPECT_EQ(merged->identifier(), u"id2");
-  EXPECT_EQ(shown(*merged),
-            (std::vector<std::string>{"SUBJECT=new", "READ=yes", "AUTHORS=ann", "CUSTOM=kept",
-                                      "CUSTOM=replaced", "CUSTOM=nameless", "AUTHORS=bob"}));
-  EXPECT_TRUE(shouldIndex);
-  EXPECT_EQ(full.attributes().size(), 2u);
-  EXPECT_EQ(oldDoc.attributes().size(), 7u);
-
-  TLIndexableItem custom;
-  const auto other = manager.mergeNewDoc(
-      fill(custom, u"id", {attribute(READ, u"yes"), attribute(CUSTOM, u"mine", u"k2")}), &oldDoc,
-      &shouldIndex);
-  EXPECT_EQ(shown(*other),
-            (std::vector<std::string>{"READ=yes", "CUSTOM=mine", "SUBJECT=old", "AUTHORS=ann",
-                                      "CUSTOM=kept", "CUSTOM=nameless", "AUTHORS=bob"}));
-  EXPECT_FALSE(shouldIndex);
-
-  TLIndexableItem fresh;
-  const auto first = manager.mergeNewDoc(fill(fresh, u"id", {attribute(CONTENT_TYPE, u"t")}),
-                                         nullptr, &shouldIndex);
-  EXPECT_EQ(shown(*first), (std::vector<std::string>{"CONTENT_TYPE=t"}));
-  EXPECT_TRUE(shouldIndex);
+  const auto old = item(u"old", {{SUBJECT, u"old"},
+                                 {READ, u"no"},
+                                 {AUTHORS, u"ann"},
+                                 {CUSTOM, u"kept", u"k1"},
+                                 {CUSTOM, u"replaced", u"k2"},
+                                 {CUSTOM, u"nameless"},
+                                 {AUTHORS, u"bob"}});
+  const struct {
+    std::vector<Attribute> attributes;
+    const TLIndexableItem* old;
+    std::string merged;
+    bool shouldIndex;
+  } cases[] = {
+      {{{SUBJECT, u"new"}, {READ, u"yes"}},
+       old.get(),
+       "SUBJECT=new READ=yes AUTHORS=ann CUSTOM=kept CUSTOM=replaced CUSTOM=nameless AUTHORS=bob ",
+       true},
+      {{{READ, u"yes"}, {CUSTOM, u"mine", u"k2"}},
+       old.get(),
+       "READ=yes CUSTOM=mine SUBJECT=old AUTHORS=ann CUSTOM=kept CUSTOM=nameless AUTHORS=bob ",
+       false},
+      {{{CONTENT_TYPE, u"t"}}, nullptr, "CONTENT_TYPE=t ", true},
+  };
+  const std::string before = shown(*old);
+  for (const auto& c : cases) {
+    const auto added = item(u"id", c.attributes);
+    bool shouldIndex = !c.shouldIndex;
+    const auto merged = TALZoneManager().mergeNewDoc(*added, c.old, &shouldIndex);
+    EXPECT_EQ(merged->identifier(), u"id");
+    EXPECT_EQ(shown(*merged), c.merged);
+    EXPECT_EQ(shouldIndex, c.shouldIndex) << c.merged;
+    EXPECT_EQ(added->attributes().size(), c.attributes.size());
+    EXPECT_EQ(shown(*old), before);
+  }
 }

@@ -297,7 +297,7 @@ int main(int count, char** words) {
     fmt::print(stderr, "{} is not on a small file system\n", options.disk);
     return 2;
   }
-  setenv("TALLOW_LOG", "fault",
-         0);  // workers log refused and failed operations, which are expected
+  // Workers log refused and failed operations, which are expected.
+  setenv("TALLOW_LOG", "fault", 0);
   return drive(options);
 }

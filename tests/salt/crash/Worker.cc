@@ -10,6 +10,7 @@
 #include "platform/Files.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/salt/crash/Workload.h"
+#include "tests/support/FileSizeLimit.h"
 
 namespace salttest {
 
@@ -79,7 +80,7 @@ class Worker {
     } else if (_task.shortage == Shortage::fileSize) {
       const uint64_t log = std::filesystem::file_size(newestLog(_task.path));
       const uint64_t sizes[] = {log + _random() % 300, log + _random() % 20000, _random() % 20000};
-      _shortage.emplace<FileSizeLimit>(sizes[_random() % std::size(sizes)]);
+      _shortage.emplace<testsupport::FileSizeLimit>(sizes[_random() % std::size(sizes)]);
     }
   }
 
@@ -100,7 +101,7 @@ class Worker {
   const WorkerTask& _task;
   std::mt19937 _random;
   std::unique_ptr<salt::Index> _index;
-  std::variant<std::monostate, FileSizeLimit, DiskFiller> _shortage;
+  std::variant<std::monostate, testsupport::FileSizeLimit, DiskFiller> _shortage;
 };
 
 }  // namespace

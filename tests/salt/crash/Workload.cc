@@ -65,14 +65,4 @@ Operation workloadOperation(uint32_t seed, uint32_t number) {
   return made;
 }
 
-bool carryOut(salt::Index& index, Operation operation) {
-  if (operation.zoneID == 0) return index.DeleteDoc(operation.docID);
-  return index.AddZone(operation.docID, operation.zoneID, operation.text, operation.offsets, true);
-}
-
-bool carryOut(Model& model, const Operation& operation) {
-  if (operation.zoneID == 0) return model.deleteDoc(operation.docID);
-  return model.addZone(operation.docID, operation.zoneID, operation.text, operation.offsets, true);
-}
-
 }  // namespace salttest

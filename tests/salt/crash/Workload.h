@@ -9,14 +9,6 @@
 
 namespace salttest {
 
-// One call of AddZone or, if `zoneID` is 0, of DeleteDoc.
-struct Operation {
-  uint32_t docID = 0;
-  uint16_t zoneID = 0;
-  std::string text;
-  std::vector<uint32_t> offsets;
-};
-
 // How space is withheld from a worker.
 enum class Shortage { none, fileSize, fullDisk };
 
@@ -24,10 +16,6 @@ enum class Shortage { none, fileSize, fullDisk };
 // checker need not communicate.
 [[nodiscard]] salt::Index::Options workloadOptions(uint32_t seed, Shortage shortage);
 [[nodiscard]] Operation workloadOperation(uint32_t seed, uint32_t number);
-
-// Applies an operation to the index or the model, and returns its answer.
-bool carryOut(salt::Index& index, Operation operation);
-bool carryOut(Model& model, const Operation& operation);
 
 // Reports of a worker on its standard output, one byte each.
 enum class Report : char {
