@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <array>
 #include <filesystem>
 #include <memory>
 #include <string>
@@ -6,12 +7,14 @@
 #include <vector>
 
 #include "platform/Assert.h"
+#include "salt/BitCoding.h"
 #include "salt/Coding.h"
 #include "salt/IndexImpl.h"
 #include "salt/Suffix.h"
 
-// Any text and any numbers. Checks suffixLength against a loop that applies the rule byte by byte,
-// the round trip of keys and pages, and a page's suffixes against the texts they were made from.
+// Any text and any numbers. Checks gamma codes in two ways, suffixLength against a loop that
+// applies the rule byte by byte, the round trip of keys and pages, and a page's suffixes against
+// the texts they were made from.
 namespace {
 
 std::string slowCut(std::string_view text, const salt::Index::OptionsBlock& op) {
@@ -98,6 +101,17 @@ void walkPage(const salt::index& idx, const std::vector<Entry>& entries) {
   }
 }
 
+// Numbers three at a time are the numbers one by one, as far as there are any.
+void readCodes(std::string_view bytes) {
+  salt::BitReader together(bytes);
+  salt::BitReader single(bytes);
+  while (together.good) {
+    const auto numbers = together.threeGammas();
+    const std::array<uint32_t, 3> expected{single.gamma(), single.gamma(), single.gamma()};
+    TL_ASSERT(together.good == single.good && numbers == expected);
+  }
+}
+
 // An empty index whose options are used; its directory is kept for the whole run.
 const salt::index& sharedIndex() {
   static const std::unique_ptr<salt::Index> shared = [] {
@@ -114,6 +128,7 @@ const salt::index& sharedIndex() {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const std::string_view text(reinterpret_cast<const char*>(data), size);
+  readCodes(text);
   walkPage(sharedIndex(), entriesOf(text, sharedIndex().op));
   if (size < 2) return 0;
   salt::Index::OptionsBlock op;

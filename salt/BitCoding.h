@@ -114,7 +114,7 @@ class BitReader {
   bool good = true;
 
  private:
-  static constexpr unsigned kMaxLength = 2 * 27 + 1;
+  static constexpr unsigned kMaxLength = 2 * std::bit_width(kMaxGamma) - 1;
 
   [[nodiscard]] unsigned codeLength() const {
     return 2 * static_cast<unsigned>(std::countl_zero(_bits)) + 1;

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <array>
 #include <random>
 #include <vector>
 
@@ -19,9 +20,16 @@ TEST(BitCoding, ReadsWhatWasWrittenAndNothingAfterIt) {
   for (const uint32_t value : values) writer.putGamma(value);
   writer.finish();
   BitReader reader(std::string_view(bytes).substr(6));
-  for (const uint32_t value : values) ASSERT_EQ(reader.gamma(), value);
+  for (size_t i = 0; i < values.size(); ++i) {
+    if (random() % 2 == 0 && i + 3 <= values.size()) {
+      ASSERT_EQ(reader.threeGammas(), (std::array{values[i], values[i + 1], values[i + 2]}));
+      i += 2;
+    } else {
+      ASSERT_EQ(reader.gamma(), values[i]);
+    }
+  }
   EXPECT_TRUE(reader.good);
-  for (int i = 0; i < 8; ++i) reader.gamma();  // the rest of the last byte holds no code
+  for (int i = 0; i < 3; ++i) reader.threeGammas();  // the rest of the last byte holds no code
   EXPECT_FALSE(reader.good);
 }
 
