@@ -109,8 +109,8 @@ TLString AttachmentText::of(const std::vector<GMimeObject*>& attachments) {
 }
 
 bool AttachmentText::hasRoom() const {
-  constexpr size_t kLeast = 16;
-  return _read < kMaxAttachments && _budget.left() >= kLeast && Clock::now() < _until;
+  constexpr size_t kMinBytes = 16;
+  return _read < kMaxAttachments && _budget.left() >= kMinBytes && Clock::now() < _until;
 }
 
 Outcome AttachmentText::add(Kind kind, GMimeObject* attachment) {

@@ -15,8 +15,8 @@ namespace {
 // The size of all drawings in their own units.
 constexpr double kWidth = 1000;
 constexpr double kHeight = 100;
-constexpr double kLeastHeight = 1;  // of a value above 0, so that it is seen
-constexpr double kGap = 0.2;        // of the space of a bar
+constexpr double kMinHeight = 1;  // of a value above 0, so that it is seen
+constexpr double kGap = 0.2;      // of the space of a bar
 
 // A hash as a content security policy has it.
 std::string hashOf(std::string_view text) {
@@ -35,7 +35,7 @@ std::string hashOf(std::string_view text) {
 
 std::string barSVG(const Bar& bar, double x, double width, double most) {
   const double share = most > 0 ? std::clamp(bar.value / most, 0.0, 1.0) : 0;
-  const double height = share > 0 ? std::max(share * kHeight, kLeastHeight) : 0;
+  const double height = share > 0 ? std::max(share * kHeight, kMinHeight) : 0;
   // The hidden part makes all of the column show the value when it is pointed to.
   return fmt::format(
       "<g><title>{}: {}</title><rect class=\"back\" x=\"{:.2f}\" y=\"0\" width=\"{:.2f}\" "

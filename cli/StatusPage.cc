@@ -21,8 +21,8 @@ constexpr size_t kMaxFolders = 1000;
 constexpr size_t kMaxProblems = 10000;
 constexpr size_t kMaxReasons = 50;
 constexpr size_t kPathsOfAReason = 100;
-constexpr int kMostMonths = 36;
-constexpr int kLeastMonths = 12;
+constexpr int kMaxMonths = 36;
+constexpr int kMinMonths = 12;
 
 std::string sizeOf(int64_t bytes) {
   return sizeText(static_cast<uint64_t>(std::max<int64_t>(bytes, 0)));
@@ -137,8 +137,7 @@ std::string monthSection(const std::vector<mailsync::MonthCount>& counts, double
   }
   if (months.empty()) return "";
   const int last = months.rbegin()->first;
-  const int first =
-      std::clamp(months.begin()->first, last - kMostMonths + 1, last - kLeastMonths + 1);
+  const int first = std::clamp(months.begin()->first, last - kMaxMonths + 1, last - kMinMonths + 1);
   std::string html = chartHTML(countChart("By month", months, first, last, monthName));
   if (years.size() > 1) {
     html += chartHTML(countChart("By year", years, years.begin()->first, years.rbegin()->first,

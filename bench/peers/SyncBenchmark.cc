@@ -124,10 +124,11 @@ void measureUpdates(std::vector<std::unique_ptr<SyncSystem>>& systems, peers::Sy
 
 // Seconds until a search finds the word.
 double awaitWord(client::SearchServiceProxy& service, const std::string& word, double start) {
-  constexpr double kLongest = 60;
+  constexpr double kMaxSeconds = 60;
   constexpr std::chrono::milliseconds kPoll{1};
   while (bench::timedSearch(service, word, true).results == 0) {
-    if (bench::secondsNow() - start > kLongest) throw std::runtime_error("the watch finds nothing");
+    if (bench::secondsNow() - start > kMaxSeconds)
+      throw std::runtime_error("the watch finds nothing");
     std::this_thread::sleep_for(kPoll);
   }
   return bench::secondsNow() - start;

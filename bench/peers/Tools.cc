@@ -30,7 +30,7 @@ std::string notmuchPrefix(const std::string& word) {
   return (isOperator ? "body:" : "") + word + '*';
 }
 
-const std::string kMaximum = std::to_string(bench::kMaxResults);
+const std::string kMaxResultsText = std::to_string(bench::kMaxResults);
 
 bench::Variables variablesOf(const bench::ScratchDirectory& scratch) {
   return {{"HOME", scratch / ""}, {"LC_ALL", "C.UTF-8"}};
@@ -47,7 +47,8 @@ Tool mu(const std::string& mail, const bench::ScratchDirectory& scratch) {
   const std::string home = "--muhome=" + scratch / "mu";
   const auto search = [home](const std::string& query) -> Arguments {
     const auto words = bench::wordsOfQuery(query);
-    return {"mu", "find", home, "--maxnum=" + kMaximum, quotedWords(words) + words.back() + '*'};
+    return {"mu", "find", home, "--maxnum=" + kMaxResultsText,
+            quotedWords(words) + words.back() + '*'};
   };
   return {scratch / "mu/xapian",
           variablesOf(scratch),
@@ -67,7 +68,7 @@ Tool notmuch(const std::string& mail, const bench::ScratchDirectory& scratch) {
                                   "[maildir]\nsynchronize_flags=false\n";
   const auto search = [](const std::string& query) -> Arguments {
     const auto words = bench::wordsOfQuery(query);
-    return {"notmuch", "search", "--limit=" + kMaximum,
+    return {"notmuch", "search", "--limit=" + kMaxResultsText,
             quotedWords(words) + notmuchPrefix(words.back())};
   };
   bench::Variables variables = variablesOf(scratch);
