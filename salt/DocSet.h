@@ -45,7 +45,7 @@ class DocSet {
   }
 
  private:
-  static constexpr size_t kPageDocs = 4096;
+  static constexpr size_t kPageDocs = 512;  // a cache line
   static constexpr size_t kWordDocs = 64;
   static constexpr size_t kPageWords = kPageDocs / kWordDocs;
   static constexpr uint32_t kNone = UINT32_MAX;

@@ -67,6 +67,7 @@ class PostingSet {
 
    private:
     void addOneByOne(uint32_t docID, uint32_t mask);
+
     // The set's mask of a document; fast when it is near the one before.
     uint32_t& at(uint32_t docID) {
       constexpr uint32_t kPageDocs = DocPages<uint32_t>::kPageDocs;
@@ -82,7 +83,7 @@ class PostingSet {
     const std::vector<uint32_t>& _masks;
     std::vector<uint32_t> _translated;  // the masks in bits of the table; empty if it has too few
     uint32_t _number = 0;
-    uint32_t* _page = nullptr;  // number _number of the set
+    uint32_t* _page = nullptr;  // the page with this number, or null
   };
   void addSuffixes(uint64_t count) { _suffixes += count; }
 
@@ -181,13 +182,17 @@ class FoundPlaces {
   [[nodiscard]] size_t pages() const {
     return std::max(_hot->masks().pages(), _pages->masks().pages());
   }
-  // Adds to each of `out` what of `bits` is in the mask of a document of the page.
-  void addPage(size_t page, uint32_t bits, MaskPage* out) const {
+  // Adds to each of `out` what of `bits` is in the mask of a document of the page. False when no
+  // document has a mask.
+  bool addPage(size_t page, uint32_t bits, MaskPage* out) const {
+    bool some = false;
     for (const auto& set : {_hot.get(), _pages.get()}) {
       const uint32_t* const masks = set->masks().page(page);
       if (masks == nullptr) continue;
+      some = true;
       for (size_t i = 0; i < out->size(); ++i) (*out)[i] |= masks[i] & bits;
     }
+    return some;
   }
 
   // Looks up the masks of documents. One thread; the places outlive it.

@@ -71,10 +71,10 @@ class Searching {
   // the page have no branches, so that the compiler uses vector instructions.
   void admitPage(size_t page, const TermMatches& rarest, const std::vector<size_t>& required) {
     salt::MaskPage all;
-    rarest.matchPage(page, &all);
+    if (!rarest.matchPage(page, &all)) return;
     for (const size_t u : required) {
       salt::MaskPage one;
-      _matches[u]->matchPage(page, &one);
+      if (!_matches[u]->matchPage(page, &one)) return;
       for (size_t i = 0; i < all.size(); ++i) all[i] = one[i] != 0 ? all[i] : 0;
     }
     for (size_t i = 0; i < all.size(); ++i) {

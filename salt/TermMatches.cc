@@ -57,15 +57,18 @@ size_t TermMatches::pages() const {
   return count;
 }
 
-void TermMatches::matchPage(size_t page, salt::MaskPage* out) const {
+bool TermMatches::matchPage(size_t page, salt::MaskPage* out) const {
   out->fill(0);
+  bool some = false;
   for (const Token& token : _tokens) {
     if (token.found) {
-      token.found->addPage(page, _zones.effective(), out);
+      some = token.found->addPage(page, _zones.effective(), out) || some;
     } else if (const uint32_t* const masks = token.masks.page(page); masks != nullptr) {
+      some = true;
       for (size_t i = 0; i < out->size(); ++i) (*out)[i] |= masks[i];
     }
   }
+  return some;
 }
 
 void setFound(const salt::Index& index, Term& term) {

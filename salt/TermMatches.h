@@ -38,8 +38,9 @@ class TermMatches {
   }
   // The number of pages of documents up to the last one with a match; see DocPages.
   [[nodiscard]] size_t pages() const;
-  // Sets `out` to something other than 0 for the documents of the page that any token matches.
-  void matchPage(size_t page, salt::MaskPage* out) const;
+  // Sets `out` to something other than 0 for the documents of the page that any token matches, and
+  // to 0 for the others. False when there is certainly no match.
+  [[nodiscard]] bool matchPage(size_t page, salt::MaskPage* out) const;
 
   // Calls visit(docID, mask) for each document of each token, once for a token.
   template <typename Visit>
