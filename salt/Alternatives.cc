@@ -56,7 +56,7 @@ class SharedSearch {
 
   void add(const std::string& token) {
     _terms[_position].tokens[0] = token;
-    TermMatches found(_index, _terms[_position], _options.maxSuffixes);
+    const TermMatches found(_index, _terms[_position], _options.maxSuffixes);
     Matches& matches = _byToken.emplace_back();
     found.forEach([&](uint32_t docID, uint32_t mask) {
       matches.docs.push_back({docID});
@@ -72,7 +72,7 @@ class SharedSearch {
         applyToken();
         continue;
       }
-      TermMatches found(_index, _terms[u], _options.maxSuffixes);
+      const TermMatches found(_index, _terms[u], _options.maxSuffixes);
       for (auto& [docs, masks] : _byToken) {
         const auto maskOf = [&found, &docs = docs](size_t token, size_t i) {
           return found.mask(token, docs[i].docID);

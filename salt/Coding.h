@@ -23,6 +23,11 @@ inline char* putVarint(char* out, uint32_t value) {
   return out;
 }
 
+inline void appendVarint(std::string* out, uint32_t value) {
+  char bytes[kMaxVarint32];
+  out->append(bytes, static_cast<size_t>(putVarint(bytes, value) - bytes));
+}
+
 inline uint32_t readVarint(std::string_view& s) {
   uint32_t value = 0;
   for (int shift = 0;; shift += 7) {

@@ -36,11 +36,6 @@ class Runs {
   std::vector<DocZones> _run;
 };
 
-void appendVarint(std::string* out, uint32_t value) {
-  char bytes[kMaxVarint32];
-  out->append(bytes, static_cast<size_t>(putVarint(bytes, value) - bytes));
-}
-
 }  // namespace
 
 uint32_t ZoneBitTable::bitOf(uint16_t zoneID) {

@@ -61,29 +61,17 @@ class PostingSet {
       if (_translated.empty()) {
         addOneByOne(docID, _masks[mask]);
       } else {
-        at(docID) |= _translated[mask];
+        _set._masks[docID] |= _translated[mask];
       }
     }
 
    private:
     void addOneByOne(uint32_t docID, uint32_t mask);
 
-    // The set's mask of a document; fast when it is near the one before.
-    uint32_t& at(uint32_t docID) {
-      constexpr uint32_t kPageDocs = DocPages<uint32_t>::kPageDocs;
-      if (_page == nullptr || docID / kPageDocs != _number) {
-        _number = docID / kPageDocs;
-        _page = &_set._masks[_number * kPageDocs];
-      }
-      return _page[docID % kPageDocs];
-    }
-
     PostingSet& _set;
     const std::vector<uint16_t>& _zones;
     const std::vector<uint32_t>& _masks;
     std::vector<uint32_t> _translated;  // the masks in bits of the table; empty if it has too few
-    uint32_t _number = 0;
-    uint32_t* _page = nullptr;  // the page with this number, or null
   };
   void addSuffixes(uint64_t count) { _suffixes += count; }
 
@@ -91,6 +79,7 @@ class PostingSet {
 
   // The zones of each document as bits of the table, 0 for none.
   [[nodiscard]] const DocPages<uint32_t>& masks() const { return _masks; }
+  [[nodiscard]] uint32_t mask(uint32_t docID) const { return _masks.at(docID); }
   // Calls visit(docID, mask) in DocID order for each document with a mask.
   template <typename Visit>
   void forEach(const Visit& visit) const {
@@ -125,30 +114,6 @@ class PostingSet {
 // The masks of the documents of one page.
 using MaskPage = std::array<uint32_t, DocPages<uint32_t>::kPageDocs>;
 
-// Looks up documents in masks, fast when they are mostly near the one before. One thread; the masks
-// outlive it and do not change.
-class MaskReader {
- public:
-  explicit MaskReader(const DocPages<uint32_t>& masks) : _masks(&masks) { turnTo(0); }
-
-  // 0 for none.
-  [[nodiscard]] uint32_t mask(uint32_t docID) {
-    const uint32_t page = docID / DocPages<uint32_t>::kPageDocs;
-    if (page != _number) turnTo(page);
-    return _page == nullptr ? 0 : _page[docID % DocPages<uint32_t>::kPageDocs];
-  }
-
- private:
-  void turnTo(uint32_t page) {
-    _number = page;
-    _page = _masks->page(page);
-  }
-
-  const DocPages<uint32_t>* _masks;
-  uint32_t _number = 0;
-  const uint32_t* _page = nullptr;
-};
-
 // What a scan has found for one prefix. Any thread; the index outlives it.
 class FoundPlaces {
  public:
@@ -167,14 +132,15 @@ class FoundPlaces {
   }
   // The zones that the bits of masks stand for.
   [[nodiscard]] std::vector<uint16_t> zones() const { return _hot->table().zones(); }
+  [[nodiscard]] uint32_t mask(uint32_t docID) const {
+    return _hot->mask(docID) | _pages->mask(docID);
+  }
   // Calls visit(docID, mask) once for each document with a mask.
   template <typename Visit>
   void forEach(const Visit& visit) const {
-    MaskReader hot(_hot->masks());
-    _pages->forEach([&](uint32_t docID, uint32_t mask) { visit(docID, mask | hot.mask(docID)); });
-    MaskReader pages(_pages->masks());
+    _pages->forEach([&](uint32_t docID, uint32_t mask) { visit(docID, mask | _hot->mask(docID)); });
     _hot->forEach([&](uint32_t docID, uint32_t mask) {
-      if (pages.mask(docID) == 0) visit(docID, mask);
+      if (_pages->mask(docID) == 0) visit(docID, mask);
     });
   }
 
@@ -194,20 +160,6 @@ class FoundPlaces {
     }
     return some;
   }
-
-  // Looks up the masks of documents. One thread; the places outlive it.
-  class Reader {
-   public:
-    explicit Reader(const FoundPlaces& found)
-        : _hot(found._hot->masks()), _pages(found._pages->masks()) {}
-
-    // The zones of a document, 0 for none.
-    [[nodiscard]] uint32_t mask(uint32_t docID) { return _hot.mask(docID) | _pages.mask(docID); }
-
-   private:
-    MaskReader _hot;
-    MaskReader _pages;
-  };
 
  private:
   std::shared_ptr<const PostingSet> _hot;

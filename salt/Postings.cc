@@ -55,11 +55,6 @@ uint64_t sumOf(std::string_view bytes, uint64_t seed = 0) {
   return sum;
 }
 
-void appendVarint(std::string* out, uint32_t value) {
-  char bytes[kMaxVarint32];
-  out->append(bytes, static_cast<size_t>(putVarint(bytes, value) - bytes));
-}
-
 // Reads untrusted bytes: invalid input clears `good` and yields 0.
 class Input {
  public:
@@ -283,20 +278,20 @@ void PostingsBuilder::appendList(const DocPages<Counts>& counts, std::string* li
     });
   };
   uint32_t docs = 0;
-  std::map<uint32_t, uint32_t>
-      ofMask;  // first the number of documents, then the number of the mask
+  std::map<uint32_t, uint32_t> frequencies;  // of masks
   forEachDoc([&](uint32_t, const Counts& of) {
     ++docs;
-    ++ofMask[of.mask];
+    ++frequencies[of.mask];
   });
-  std::vector<std::pair<uint32_t, uint32_t>> masks(ofMask.begin(), ofMask.end());
+  std::vector<std::pair<uint32_t, uint32_t>> masks(frequencies.begin(), frequencies.end());
   std::stable_sort(masks.begin(), masks.end(),
                    [](const auto& left, const auto& right) { return left.second > right.second; });
   appendVarint(list, docs);
   appendVarint(list, static_cast<uint32_t>(masks.size()));
-  for (uint32_t number = 1; const auto& [mask, frequency] : masks) {
+  std::map<uint32_t, uint32_t> numbers;  // of masks, from 1
+  for (const auto& [mask, frequency] : masks) {
     appendVarint(list, mask);
-    ofMask[mask] = number++;
+    numbers.emplace(mask, numbers.size() + 1);
   }
   BitWriter bits(list);
   uint32_t next = 0;
@@ -307,7 +302,7 @@ void PostingsBuilder::appendList(const DocPages<Counts>& counts, std::string* li
       return;
     }
     bits.putGamma(step);
-    bits.putGamma(ofMask[of.mask]);
+    bits.putGamma(numbers[of.mask]);
     bits.putGamma(of.suffixes);
     next = docID + 1;
   });

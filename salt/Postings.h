@@ -47,7 +47,8 @@ class Postings {
                                                             const PostingsOwner& owner);
 
   // Adds the places of all suffixes that begin with `prefix`, except those of documents in
-  // `deleted`. False, adding nothing, when there is no list or, with a log line, it cannot be read.
+  // `deleted`. False when there is no list or, with a log line, it cannot be read; then the pages
+  // must be scanned.
   [[nodiscard]] bool add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const;
 
  private:

@@ -123,7 +123,7 @@ class Searching {
       _matches[u] = matches(u);
       if (!_selective) admit(*_matches[u]);
     }
-    TermMatches& matches = *_matches[u];
+    const TermMatches& matches = *_matches[u];
     const auto maskOf = [&](size_t token, size_t i) { return matches.mask(token, _docs[i].docID); };
     _evaluation.apply(u, maskOf, _docs);
     _matches[u].reset();
@@ -137,7 +137,7 @@ class Searching {
   }
 
   // Adds the documents of the matches that are not yet in _docs.
-  void admit(TermMatches& matches) {
+  void admit(const TermMatches& matches) {
     matches.forEach([&](uint32_t docID, uint32_t) {
       if (!std::exchange(_admitted[docID], true)) _docs.push_back({docID});
     });

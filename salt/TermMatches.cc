@@ -33,7 +33,6 @@ TermMatches::TermMatches(const salt::Index& index, Term& term, Found found, size
     const size_t left = maxSuffixes - _suffixes;
     if (found[t] != nullptr && found[t]->hasAllInMasks() && found[t]->suffixes() <= left) {
       token.found = std::move(found[t]);
-      token.reader.emplace(*token.found);
       _suffixes += token.found->suffixes();
       continue;
     }

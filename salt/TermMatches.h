@@ -3,7 +3,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <optional>
 #include <vector>
 
 #include "salt/DocPages.h"
@@ -30,11 +29,10 @@ class TermMatches {
   // The number of suffixes taken.
   [[nodiscard]] size_t suffixes() const { return _suffixes; }
 
-  // The zone mask (see ZoneBits) of a token's match in a document, 0 where it does not match. Fast
-  // when documents are mostly near the one before.
-  [[nodiscard]] uint32_t mask(size_t token, uint32_t docID) {
-    Token& of = _tokens[token];
-    return of.reader ? _zones.of(of.reader->mask(docID)) : of.masks.at(docID);
+  // The zone mask (see ZoneBits) of a token's match in a document, 0 where it does not match.
+  [[nodiscard]] uint32_t mask(size_t token, uint32_t docID) const {
+    const Token& of = _tokens[token];
+    return of.found ? _zones.of(of.found->mask(docID)) : of.masks.at(docID);
   }
   // The number of pages of documents up to the last one with a match; see DocPages.
   [[nodiscard]] size_t pages() const;
@@ -44,7 +42,7 @@ class TermMatches {
 
   // Calls visit(docID, mask) for each document of each token, once for a token.
   template <typename Visit>
-  void forEach(const Visit& visit) {
+  void forEach(const Visit& visit) const {
     for (const Token& token : _tokens) {
       if (token.found) {
         token.found->forEach([&](uint32_t docID, uint32_t found) {
@@ -60,13 +58,12 @@ class TermMatches {
 
  private:
   struct Token {
-    std::shared_ptr<const salt::FoundPlaces> found;   // null when the masks are in `masks`
-    std::optional<salt::FoundPlaces::Reader> reader;  // of `found`
+    std::shared_ptr<const salt::FoundPlaces> found;  // null when the masks are in `masks`
     salt::DocPages<uint32_t> masks;
   };
 
   std::vector<Token> _tokens;
-  salt::ZoneMaskMap _zones;  // from what was found to the zones of the term
+  mutable salt::ZoneMaskMap _zones;  // from what was found to the zones of the term
   size_t _suffixes = 0;
 };
 
