@@ -19,8 +19,8 @@ sigset_t setOf(std::initializer_list<int> signals) {
 }  // namespace
 
 SpawnPlan::SpawnPlan() {
-  posix_spawn_file_actions_init(&_actions);
-  posix_spawnattr_init(&_attributes);
+  keepError(posix_spawn_file_actions_init(&_actions));
+  keepError(posix_spawnattr_init(&_attributes));
 }
 
 SpawnPlan::~SpawnPlan() {
@@ -29,12 +29,12 @@ SpawnPlan::~SpawnPlan() {
 }
 
 SpawnPlan& SpawnPlan::pass(int ours, int theirs) {
-  posix_spawn_file_actions_adddup2(&_actions, ours, theirs);
+  keepError(posix_spawn_file_actions_adddup2(&_actions, ours, theirs));
   return *this;
 }
 
 SpawnPlan& SpawnPlan::silence(int theirs) {
-  posix_spawn_file_actions_addopen(&_actions, theirs, "/dev/null", O_RDWR, 0);
+  keepError(posix_spawn_file_actions_addopen(&_actions, theirs, "/dev/null", O_RDWR, 0));
   return *this;
 }
 
@@ -58,11 +58,16 @@ SpawnPlan& SpawnPlan::inOwnGroup() {
 }
 
 int SpawnPlan::run(const std::vector<std::string>& words, pid_t& process) const {
+  if (_error != 0) return _error;
   std::vector<char*> arguments;
   for (const std::string& word : words) arguments.push_back(const_cast<char*>(word.c_str()));
   arguments.push_back(nullptr);
   return posix_spawnp(&process, arguments.front(), &_actions, &_attributes, arguments.data(),
                       environ);
+}
+
+void SpawnPlan::keepError(int result) {
+  if (_error == 0) _error = result;
 }
 
 void SpawnPlan::addFlag(short flag) {

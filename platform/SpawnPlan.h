@@ -30,15 +30,17 @@ class SpawnPlan {
   SpawnPlan& inOwnGroup();
 
   // Starts words[0], which is looked up in $PATH if it has no slash, with all words as arguments.
-  // Returns 0 or an errno value.
+  // Returns 0 or an errno value, which may be that of an earlier step of the plan.
   [[nodiscard]] int run(const std::vector<std::string>& words, pid_t& process) const;
 
  private:
+  void keepError(int result);
   void addFlag(short flag);
 
   posix_spawn_file_actions_t _actions;
   posix_spawnattr_t _attributes;
   short _flags = 0;
+  int _error = 0;  // of the first step that failed
 };
 
 }  // namespace platform
