@@ -18,8 +18,9 @@ class DeliveryAgentTest : public testsupport::WatchProcessTest {
  protected:
   void SetUp() override {
     NEED_PROGRAMS(kAgent)
-    std::ofstream(rules) << fmt::format(
-        "SHELL=/bin/sh\nMAILDIR={0}\nDEFAULT={0}/a/\n:0\n* ^Subject:.*7$\nb/\n", mail);
+    write(
+        "rules",
+        fmt::format("SHELL=/bin/sh\nMAILDIR={0}\nDEFAULT={0}/a/\n:0\n* ^Subject:.*7$\nb/\n", mail));
   }
 
   void deliverByAgent(int number) const {

@@ -1,13 +1,12 @@
 // What goes wrong: with the mail, the catalogue, the disk and the daemon.
 
-#include <sys/resource.h>
-
-#include <csignal>
 #include <ctime>
+#include <fstream>
 #include <random>
 
 #include "platform/Files.h"
 #include "sync/Database.h"
+#include "tests/support/FileSizeLimit.h"
 #include "tests/support/Seed.h"
 #include "tests/sync/MailSyncTest.h"
 
@@ -141,16 +140,9 @@ TEST_F(MailSyncTest, FullDiskLosesNothing) {
     add(fmt::format("b/cur/{}", i), fmt::format("s{}", i));
     expected.insert(fmt::format("b: s{}", i));
   }
-  // Files of this process cannot grow, which has the effect of a full disk.
-  std::signal(SIGXFSZ, SIG_IGN);
-  rlimit before{};
-  getrlimit(RLIMIT_FSIZE, &before);
-  for (const rlim_t bytes : {rlim_t{100000}, rlim_t{300000}}) {
-    const rlimit full{bytes, before.rlim_max};
-    setrlimit(RLIMIT_FSIZE, &full);
-    const bool done = sync();
-    setrlimit(RLIMIT_FSIZE, &before);
-    ASSERT_FALSE(done) << bytes;
+  for (const uint64_t bytes : {100000, 300000}) {
+    const testsupport::FileSizeLimit full(bytes);
+    ASSERT_FALSE(sync()) << bytes;
     EXPECT_EQ(error->domain, mailsync::kCatalogueDomain);
   }
   EXPECT_EQ(synced(), expected);

@@ -6,7 +6,6 @@
 #include <sys/stat.h>
 
 #include <filesystem>
-#include <fstream>
 #include <set>
 
 #include "platform/Text.h"
@@ -29,7 +28,7 @@ class MailboxTest : public testing::Test {
 
   void makeFolder(const std::string& folder) const { directory.makeMaildir("mail/" + folder); }
   void put(const std::string& path, const std::string& content) const {
-    std::ofstream(mail + '/' + path, std::ios::binary) << content;
+    directory.write("mail/" + path, content);
   }
   [[nodiscard]] mailsync::SyncSettings syncSettings() const {
     mailsync::SyncSettings settings;

@@ -125,7 +125,7 @@ TEST_F(MailWatchTest, RootsMayAppearAndDisappear) {
   tell(directory.path(), "later");
   EXPECT_THAT(source->watched, Contains(directory / "later"));
   fs::rename(mail, root);
-  std::ofstream(root + "/a/new/1") << "Subject: one\n\nText\n";
+  directory.write("later/mail/a/new/1", "Subject: one\n\nText\n");
   EXPECT_EQ(tell(directory / "later", "mail"), 1U);
   EXPECT_THAT(source->watched, Contains(root + "/a/new"));
   fs::rename(root, mail);
