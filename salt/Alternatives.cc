@@ -58,9 +58,9 @@ class SharedSearch {
     _terms[_position].tokens[0] = token;
     const TermMatches found(_index, _terms[_position], _options.maxSuffixes);
     Matches& matches = _byToken.emplace_back();
-    found.forEach([&](uint32_t docID, uint32_t mask) {
+    found.forEach([&](uint32_t docID) {
       matches.docs.push_back({docID});
-      matches.masks.push_back(mask);
+      matches.masks.push_back(found.mask(0, docID));
     });
     _standings += matches.docs.size();
   }

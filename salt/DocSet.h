@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <bit>
 #include <cstddef>
 #include <cstdint>
@@ -7,28 +8,80 @@
 
 namespace salt {
 
+// The bits of 512 documents with consecutive numbers, a cache line.
+class DocPage {
+ public:
+  static constexpr size_t kDocs = 512;
+
+  [[nodiscard]] bool contains(size_t doc) const {
+    return (_words[doc / kWordDocs] >> (doc % kWordDocs) & 1) != 0;
+  }
+  void insert(size_t doc) { _words[doc / kWordDocs] |= uint64_t{1} << (doc % kWordDocs); }
+
+  [[nodiscard]] bool empty() const {
+    uint64_t any = 0;
+    for (const uint64_t word : _words) any |= word;
+    return any == 0;
+  }
+  [[nodiscard]] size_t size() const {
+    size_t count = 0;
+    for (const uint64_t word : _words) count += static_cast<size_t>(std::popcount(word));
+    return count;
+  }
+
+  DocPage& operator|=(const DocPage& other) {
+    for (size_t i = 0; i < _words.size(); ++i) _words[i] |= other._words[i];
+    return *this;
+  }
+  DocPage& operator&=(const DocPage& other) {
+    for (size_t i = 0; i < _words.size(); ++i) _words[i] &= other._words[i];
+    return *this;
+  }
+  friend DocPage operator&(DocPage left, const DocPage& right) { return left &= right; }
+
+  // Calls visit(number in the page) for each member, ascending.
+  template <typename Visit>
+  void forEach(const Visit& visit) const {
+    for (size_t i = 0; i < _words.size(); ++i) {
+      for (uint64_t word = _words[i]; word != 0; word &= word - 1) {
+        visit(i * kWordDocs + static_cast<size_t>(std::countr_zero(word)));
+      }
+    }
+  }
+
+ private:
+  static constexpr size_t kWordDocs = 64;
+
+  std::array<uint64_t, kDocs / kWordDocs> _words{};
+};
+
 // A set of document numbers, a bit for each. Documents are numbered one after another, so pages of
 // bits are small and a look-up takes no hashing. One writer, or any number of readers.
 class DocSet {
  public:
-  [[nodiscard]] size_t size() const { return _size; }
-
   [[nodiscard]] bool contains(uint32_t docID) const {
-    const size_t page = docID / kPageDocs;
-    if (page >= _pages.size() || _pages[page] == kNone) return false;
-    return (_words[wordOf(docID)] >> (docID % kWordDocs) & 1) != 0;
+    const DocPage* const bits = page(docID / DocPage::kDocs);
+    return bits != nullptr && bits->contains(docID % DocPage::kDocs);
   }
 
-  // `docID` must not be in the set.
-  void insert(uint32_t docID) {
-    const size_t page = docID / kPageDocs;
-    if (page >= _pages.size()) _pages.resize(page + 1, kNone);
-    if (_pages[page] == kNone) {
-      _pages[page] = static_cast<uint32_t>(_words.size() / kPageWords);
-      _words.resize(_words.size() + kPageWords);
+  void insert(uint32_t docID) { writable(docID / DocPage::kDocs).insert(docID % DocPage::kDocs); }
+  void insert(const DocSet& other) {
+    for (size_t page = 0; page < other.pages(); ++page) {
+      if (const DocPage* const bits = other.page(page); bits != nullptr) writable(page) |= *bits;
     }
-    _words[wordOf(docID)] |= uint64_t{1} << (docID % kWordDocs);
-    ++_size;
+  }
+
+  [[nodiscard]] size_t size() const {
+    size_t count = 0;
+    for (const DocPage& bits : _bits) count += bits.size();
+    return count;
+  }
+
+  // The number of pages up to the last one in use.
+  [[nodiscard]] size_t pages() const { return _pages.size(); }
+  // The documents from page * DocPage::kDocs on; null when none of them is a member.
+  [[nodiscard]] const DocPage* page(size_t page) const {
+    return page < _pages.size() && _pages[page] != kNone ? &_bits[_pages[page]] : nullptr;
   }
 
   // Calls visit(docID) for each member, ascending.
@@ -36,28 +89,29 @@ class DocSet {
   void forEach(const Visit& visit) const {
     for (size_t page = 0; page < _pages.size(); ++page) {
       if (_pages[page] == kNone) continue;
-      for (size_t first = page * kPageDocs; first < (page + 1) * kPageDocs; first += kWordDocs) {
-        for (uint64_t word = _words[wordOf(first)]; word != 0; word &= word - 1) {
-          visit(static_cast<uint32_t>(first + static_cast<size_t>(std::countr_zero(word))));
-        }
-      }
+      _bits[_pages[page]].forEach(
+          [&](size_t doc) { visit(static_cast<uint32_t>(page * DocPage::kDocs + doc)); });
     }
   }
 
- private:
-  static constexpr size_t kPageDocs = 512;  // a cache line
-  static constexpr size_t kWordDocs = 64;
-  static constexpr size_t kPageWords = kPageDocs / kWordDocs;
-  static constexpr uint32_t kNone = UINT32_MAX;
-
-  // The index in _words of the word with the bit of a document, whose page is not kNone.
-  [[nodiscard]] size_t wordOf(size_t docID) const {
-    return _pages[docID / kPageDocs] * kPageWords + docID % kPageDocs / kWordDocs;
+  [[nodiscard]] size_t bytes() const {
+    return _pages.capacity() * sizeof(_pages[0]) + _bits.capacity() * sizeof(_bits[0]);
   }
 
-  std::vector<uint32_t> _pages;  // numbers of pages in _words; kNone for one without members
-  std::vector<uint64_t> _words;
-  size_t _size = 0;
+ private:
+  static constexpr uint32_t kNone = UINT32_MAX;
+
+  DocPage& writable(size_t page) {
+    if (page >= _pages.size()) _pages.resize(page + 1, kNone);
+    if (_pages[page] == kNone) {
+      _pages[page] = static_cast<uint32_t>(_bits.size());
+      _bits.emplace_back();
+    }
+    return _bits[_pages[page]];
+  }
+
+  std::vector<uint32_t> _pages;  // numbers of pages in _bits; kNone for one without members
+  std::vector<DocPage> _bits;
 };
 
 }  // namespace salt

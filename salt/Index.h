@@ -54,17 +54,6 @@ struct Place {
   uint16_t ZoneID = 0;
 };
 
-// All places of one document: bit n is set for the zone at index n of a list of at most 32.
-struct DocZones {
-  uint32_t DocID = 0;
-  uint32_t zones = 0;
-};
-
-// Receives places in batches of documents, with the list that their zone bits index. Both are valid
-// during the call only.
-using PlacesCallback =
-    std::function<void(const std::vector<uint16_t>& zones, const DocZones* docs, size_t count)>;
-
 class FoundPlaces;  // what a scan has found for one prefix; salt/PostingSet.h
 
 // Threads: every operation may run on any thread, concurrently with the others. Readers work on a
@@ -203,7 +192,7 @@ class Index {
   [[nodiscard]] virtual std::string Dump() const = 0;
 
   // ScanPrefix for callers that need only documents and zones, for several prefixes in one pass.
-  // Memory: 4 bytes for each prefix and matching document and its neighbours. Null for a prefix
+  // Memory: a bit for each prefix, zone and matching document and its neighbours. Null for a prefix
   // with which more than `limit` suffixes might begin: only ScanPrefix can then tell which come
   // first.
   [[nodiscard]] virtual std::vector<std::shared_ptr<const FoundPlaces>> ScanPlaces(

@@ -61,7 +61,7 @@ bool index::readRecords(TLErrorOut error) {
   for (size_t at = 0; at + sizeof(uint32_t) <= bytes.size(); at += sizeof(uint32_t)) {
     uint32_t docID = 0;
     std::memcpy(&docID, bytes.data() + at, sizeof docID);
-    if (docID != 0 && !deleted.contains(docID)) deleted.insert(docID);
+    if (docID != 0) deleted.insert(docID);
   }
   _deleted = std::make_shared<const DocSet>(std::move(deleted));
   return true;

@@ -4,6 +4,7 @@
 #include <fmt/format.h>
 #include <sys/stat.h>
 
+#include <array>
 #include <bit>
 #include <cerrno>
 #include <cstring>
@@ -206,7 +207,10 @@ bool Postings::addList(std::string_view list, const DocSet& deleted, PostingSet*
   for (uint32_t& mask : masks) mask = input.varint() & allZones;
   if (!input.good) return false;
   BitReader bits(input.rest());
-  PostingSet::Adder adder(places, _zones, masks);
+  // Zones are made before their sets are taken, which others would move.
+  for (const uint16_t zone : _zones) (void)places->docsOf(zone);
+  std::array<DocSet*, kMaxZones> docsOf{};
+  for (size_t i = 0; i < _zones.size(); ++i) docsOf[i] = &places->docsOf(_zones[i]);
   uint64_t suffixes = 0;
   uint32_t next = 0;  // after the document before
   for (uint32_t i = 0; i < docs; ++i) {
@@ -214,7 +218,9 @@ bool Postings::addList(std::string_view list, const DocSet& deleted, PostingSet*
     next += step;
     if (!bits.good || mask > masks.size()) return false;
     if (deleted.contains(next - 1)) continue;
-    adder.add(next - 1, mask - 1);
+    for (uint32_t left = masks[mask - 1]; left != 0; left &= left - 1) {
+      docsOf[static_cast<size_t>(std::countr_zero(left))]->insert(next - 1);
+    }
     suffixes += count;
   }
   places->addSuffixes(suffixes);

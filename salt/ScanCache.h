@@ -20,34 +20,18 @@ namespace salt {
 // Memory: kMaxBytes. Any thread.
 class ScanCache {
  public:
-  // Of live documents. Where documents are few and far between, the set is kept encoded.
-  class Found {
-   public:
-    explicit Found(std::shared_ptr<const PostingSet> set);
-
-    [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
-    [[nodiscard]] std::shared_ptr<const PostingSet> set() const;
-    [[nodiscard]] size_t bytes() const { return _set ? _set->bytes() : _encoded.size(); }
-
-   private:
-    ZoneBitTable& _table;
-    uint64_t _suffixes;
-    std::shared_ptr<const PostingSet> _set;
-    std::string _encoded;
-  };
-
   // Null when the prefix is not cached for this generation.
-  [[nodiscard]] std::shared_ptr<const Found> find(std::string_view prefix, uint64_t generation)
+  [[nodiscard]] std::shared_ptr<const PostingSet> find(std::string_view prefix, uint64_t generation)
       TL_EXCLUDES(_mutex);
 
   // Ignored unless `generation` is the latest.
-  void keep(std::string_view prefix, uint64_t generation, std::shared_ptr<const Found> found)
+  void keep(std::string_view prefix, uint64_t generation, std::shared_ptr<const PostingSet> found)
       TL_EXCLUDES(_mutex);
 
  private:
   struct Entry {
     std::string prefix;
-    std::shared_ptr<const Found> found;
+    std::shared_ptr<const PostingSet> found;
 
     [[nodiscard]] size_t bytes() const { return kOverhead + prefix.size() + found->bytes(); }
   };

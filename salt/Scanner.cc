@@ -131,8 +131,6 @@ constexpr unsigned kMaxShardsOnOneThread = 2;  // not worth waking a thread
 
 // What one thread has found for a prefix.
 struct Share {
-  explicit Share(ZoneBitTable& table) : hot(table), pages(table) {}
-
   PostingSet hot;
   PostingSet pages;
   Scanner::Counts counts;
@@ -148,8 +146,8 @@ struct Share {
 struct Request {
   size_t number;  // in the caller's list
   std::string_view prefix;
-  std::shared_ptr<const ScanCache::Found> known;
-  std::vector<Share> shares;  // by thread
+  std::shared_ptr<const PostingSet> known;
+  std::array<Share, Scanner::kThreads> shares;  // by thread
 };
 
 // The parallel parts of one scan, hot part first. Each part takes the next shard that none has
@@ -236,7 +234,6 @@ std::vector<std::shared_ptr<const FoundPlaces>> Scanner::scanPlaces(
         known ? known->suffixes() + view.metrics.HotSuffixes : view.metrics.Suffixes;
     if (most > limit) continue;
     requests.push_back({i, prefix, std::move(known), {}});
-    while (requests.back().shares.size() < kThreads) requests.back().shares.emplace_back(_zones);
   }
   std::sort(requests.begin(), requests.end(),
             [](const Request& left, const Request& right) { return left.prefix < right.prefix; });
@@ -248,9 +245,9 @@ std::vector<std::shared_ptr<const FoundPlaces>> Scanner::scanPlaces(
   for (Request& request : requests) {
     Share& share = request.shares.front();
     for (size_t part = 1; part < kThreads; ++part) share.add(std::move(request.shares[part]));
-    auto pages = request.known ? request.known->set()
+    auto pages = request.known ? std::move(request.known)
                                : std::make_shared<const PostingSet>(std::move(share.pages));
-    if (keep && !request.known) remember(request.prefix, view, pages);
+    if (keep) _scanCache.keep(request.prefix, view.pageGeneration, pages);
     auto found = std::make_shared<const FoundPlaces>(
         std::make_shared<const PostingSet>(std::move(share.hot)), std::move(pages));
     share.counts.results = found->suffixes();
@@ -267,12 +264,6 @@ void Scanner::runParts(const IndexView& view, unsigned shards,
   } else {
     _runner.run(part);
   }
-}
-
-void Scanner::remember(std::string_view prefix, const IndexView& view,
-                       const std::shared_ptr<const PostingSet>& pages) const {
-  if (!pages->others().empty()) return;
-  _scanCache.keep(prefix, view.pageGeneration, std::make_shared<const ScanCache::Found>(pages));
 }
 
 }  // namespace salt

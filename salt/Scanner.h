@@ -48,8 +48,6 @@ class Scanner {
  private:
   using Clock = std::chrono::steady_clock;
 
-  void remember(std::string_view prefix, const IndexView& view,
-                const std::shared_ptr<const PostingSet>& pages) const;
   // Runs part(0) and, where a second thread is worth waking, part(1) concurrently.
   void runParts(const IndexView& view, unsigned shards,
                 const std::function<void(size_t part)>& part) const;
@@ -57,8 +55,7 @@ class Scanner {
   void learnStarts() const;
 
   const index& _idx;
-  mutable ZoneBitTable _zones;  // thread-safe, as are the next two
-  mutable ScanCache _scanCache;
+  mutable ScanCache _scanCache;  // thread-safe, as is the next
   mutable TwoThreadRunner _runner;
 };
 

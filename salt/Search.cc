@@ -9,7 +9,8 @@
 #include <string_view>
 #include <utility>
 
-#include "salt/DocPages.h"
+#include "salt/Contenders.h"
+#include "salt/DocSet.h"
 #include "salt/TermMatches.h"
 #include "salt/TermRules.h"
 
@@ -17,13 +18,52 @@ namespace saltsearch {
 
 namespace {
 
-// Bound the memory for matches: how many required terms are evaluated before the others, and how
-// many tokens one scan looks for.
-constexpr size_t kMaxTermsAhead = 8;
+// How many tokens one scan looks for.
 constexpr size_t kMaxTokensTogether = 8;
+// The matches of so many tokens are held at a time, a bit for each document and zone. The terms of
+// a longer query are evaluated one after another, the first of the required ones before the others.
+constexpr size_t kMaxTokensHeld = 32;
+
+bool ranksAbove(const DocResult& left, const DocResult& right) {
+  return left.score > right.score || (left.score == right.score && left.docID > right.docID);
+}
+
+// The documents with the highest scores so far.
+class TopDocs {
+ public:
+  explicit TopDocs(size_t maxResults) : _maxResults(maxResults) {}
+
+  [[nodiscard]] bool full() const { return _heap.size() == _maxResults; }
+  // The lowest score; must not be empty.
+  [[nodiscard]] double lowest() const { return _heap.front().score; }
+
+  void add(const Standing& standing) {
+    DocResult doc;
+    doc.docID = standing.docID;
+    doc.score = standing.score;
+    if (full()) {
+      if (_maxResults == 0 || !ranksAbove(doc, _heap.front())) return;
+      std::pop_heap(_heap.begin(), _heap.end(), ranksAbove);
+      _heap.back() = doc;
+    } else {
+      _heap.push_back(doc);
+    }
+    std::push_heap(_heap.begin(), _heap.end(), ranksAbove);
+  }
+
+  // Sorted.
+  std::vector<DocResult> take() {
+    std::sort_heap(_heap.begin(), _heap.end(), ranksAbove);
+    return std::move(_heap);
+  }
+
+ private:
+  const size_t _maxResults;
+  std::vector<DocResult> _heap;
+};
 
 // One search. Required terms are scanned first: only documents that match all of them can be
-// results, so of the other terms all other documents are skipped, usually the great majority.
+// results.
 class Searching {
  public:
   Searching(const salt::Index& index, std::vector<Term>& terms, const Options& options)
@@ -31,59 +71,125 @@ class Searching {
         _terms(terms),
         _options(options),
         _evaluation(terms, options),
+        _top(options.maxResults),
         _found(terms.size()),
         _matches(terms.size()) {}
 
-  std::vector<Standing> run() {
-    matchRequired();
+  std::vector<DocResult> run() {
+    size_t tokens = 0;
     for (size_t u = 0; u < _terms.size(); ++u) {
-      if (!_evaluation.skips(u)) evaluate(u);
+      if (!_evaluation.skips(u)) tokens += _terms[u].tokens.size();
     }
-    return std::move(_docs);
+    if (tokens <= kMaxTokensHeld) {
+      evaluateTogether();
+    } else {
+      evaluateOneByOne();
+    }
+    return _top.take();
   }
-
-  [[nodiscard]] bool accepts(const Standing& doc) const { return _evaluation.accepts(doc); }
 
  private:
-  // Only documents that match all required terms can be results. They are among those of the rarest
-  // one, which is looked through.
+  void evaluateTogether() {
+    matchRequired();
+    for (size_t u = 0; u < _terms.size(); ++u) {
+      if (_evaluation.skips(u) || _matches[u]) continue;
+      if (nobodyIsLeft()) {
+        setFound(_index, _terms[u]);
+      } else {
+        match(u, [](size_t) { return true; });
+      }
+    }
+    if (!nobodyIsLeft()) evaluatePages();
+  }
+
+  // From the last page on, since of equal scores the later document counts: once the list is full,
+  // an earlier one must score higher.
+  void evaluatePages() {
+    if (_options.maxResults == 0) return;
+    std::optional<Contenders> contenders;
+    if (!_required.empty()) contenders.emplace(_evaluation, _terms, _matches);
+    std::vector<Standing> docs;
+    for (size_t page = pages(); page-- > 0;) {
+      salt::DocPage candidates = candidatesOf(page);
+      if (contenders && _top.full()) {
+        if (!contenders->exceed(_top.lowest())) return;
+        candidates = contenders->select(page, candidates);
+      }
+      if (candidates.empty()) continue;
+      docs.clear();
+      addStandings(page, candidates, &docs);
+      for (size_t u = 0; u < _terms.size(); ++u) {
+        if (!_evaluation.skips(u)) applyPage(u, page, docs);
+      }
+      addToTop(docs);
+    }
+  }
+
+  void applyPage(size_t u, size_t page, std::vector<Standing>& docs) {
+    _matches[u]->getPage(page, &_pageParts);
+    const auto maskOf = [&](size_t token, size_t i) {
+      uint32_t mask = 0;
+      for (const TermMatches::PagePart& part : _pageParts[token]) {
+        if (part.docs->contains(docs[i].docID % salt::DocPage::kDocs)) mask |= part.mask;
+      }
+      return mask;
+    };
+    _evaluation.apply(u, maskOf, docs);
+  }
+
+  void evaluateOneByOne() {
+    matchRequired();
+    std::vector<Standing> docs;
+    for (size_t page = 0; page < pages(); ++page) addStandings(page, candidatesOf(page), &docs);
+    salt::DocSet admitted;
+    for (size_t u = 0; u < _terms.size(); ++u) {
+      if (_evaluation.skips(u)) continue;
+      if (!_required.empty() && docs.empty()) {
+        setFound(_index, _terms[u]);
+        continue;
+      }
+      match(u, [](size_t) { return true; });
+      if (_required.empty()) {
+        _matches[u]->forEach([&](uint32_t docID) {
+          if (!admitted.contains(docID)) docs.push_back({docID});
+          admitted.insert(docID);
+        });
+      }
+      const TermMatches& matches = *_matches[u];
+      _evaluation.apply(
+          u, [&](size_t token, size_t i) { return matches.mask(token, docs[i].docID); }, docs);
+      _matches[u].reset();
+    }
+    addToTop(docs);
+  }
+
+  // Matches required terms, as many as can be held.
   void matchRequired() {
-    std::vector<size_t> required;
-    for (size_t u = 0; u < _terms.size() && required.size() < kMaxTermsAhead; ++u) {
-      if (_evaluation.demandsMatch(u) && !_evaluation.skips(u)) required.push_back(u);
+    size_t tokens = 0;
+    for (size_t u = 0; u < _terms.size(); ++u) {
+      const size_t more = _terms[u].tokens.size();
+      if (_evaluation.skips(u) || !_evaluation.demandsMatch(u)) continue;
+      if (tokens + more > kMaxTokensHeld) continue;
+      _required.push_back(u);
+      tokens += more;
     }
-    if (required.empty()) return;
-    for (const size_t u : required) {
-      if (_found[u].empty()) scanFrom(u, [this](size_t v) { return _evaluation.demandsMatch(v); });
-      _matches[u] = matches(u);
-    }
-    const size_t rarest = *std::min_element(
-        required.begin(), required.end(),
-        [this](size_t u, size_t v) { return _matches[u]->suffixes() < _matches[v]->suffixes(); });
-    std::erase(required, rarest);
-    for (size_t page = 0; page < _matches[rarest]->pages(); ++page) {
-      admitPage(page, *_matches[rarest], required);
-    }
-    _selective = true;
-  }
-
-  // Adds the documents of a page that `rarest` and all terms of `required` match. The loops over
-  // the page have no branches, so that the compiler uses vector instructions.
-  void admitPage(size_t page, const TermMatches& rarest, const std::vector<size_t>& required) {
-    salt::MaskPage all;
-    if (!rarest.matchPage(page, &all)) return;
-    for (const size_t u : required) {
-      salt::MaskPage one;
-      if (!_matches[u]->matchPage(page, &one)) return;
-      for (size_t i = 0; i < all.size(); ++i) all[i] = one[i] != 0 ? all[i] : 0;
-    }
-    for (size_t i = 0; i < all.size(); ++i) {
-      if (all[i] != 0) _docs.push_back({static_cast<uint32_t>(page * all.size() + i)});
+    for (const size_t u : _required) {
+      match(u, [this](size_t v) {
+        return std::find(_required.begin(), _required.end(), v) != _required.end();
+      });
     }
   }
 
-  // Scans for the tokens of term u, and in the same pass for those of later terms that are wanted
-  // and not scanned yet, as far as they are few.
+  // Scans for the tokens of term u, unless that was done, and in the same pass for those of later
+  // terms that are wanted, as far as they are few.
+  template <typename Wanted>
+  void match(size_t u, const Wanted& wanted) {
+    if (_matches[u]) return;
+    if (_found[u].empty()) scanFrom(u, wanted);
+    _matches[u].emplace(_index, _terms[u], std::move(_found[u]), _options.maxSuffixes);
+    _found[u].clear();
+  }
+
   template <typename Wanted>
   void scanFrom(size_t u, const Wanted& wanted) {
     std::vector<size_t> together{u};
@@ -110,83 +216,75 @@ class Searching {
     }
   }
 
-  TermMatches matches(size_t u) {
-    TermMatches::Found found = std::move(_found[u]);
-    _found[u].clear();
-    return {_index, _terms[u], std::move(found), _options.maxSuffixes};
-  }
-
-  void evaluate(size_t u) {
-    if (!_matches[u]) {
-      if (nothingCanChange(u)) return setFound(_index, _terms[u]);
-      if (_found[u].empty()) scanFrom(u, [](size_t) { return true; });
-      _matches[u] = matches(u);
-      if (!_selective) admit(*_matches[u]);
+  // The number of pages with candidates, at most.
+  [[nodiscard]] size_t pages() const {
+    size_t count = 0;
+    for (const auto& matches : _matches) {
+      if (matches) count = std::max(count, matches->pages());
     }
-    const TermMatches& matches = *_matches[u];
-    const auto maskOf = [&](size_t token, size_t i) { return matches.mask(token, _docs[i].docID); };
-    _evaluation.apply(u, maskOf, _docs);
-    _matches[u].reset();
+    return count;
   }
 
-  // Whether no candidate is left and this term adds none.
-  [[nodiscard]] bool nothingCanChange(size_t u) const {
-    if (_selective && _docs.empty()) return true;
-    return _evaluation.admitsNobody(u) &&
-           std::none_of(_docs.begin(), _docs.end(), [](const Standing& doc) { return doc.in; });
+  // The documents of the page that match all required terms or, without any, at least one term.
+  [[nodiscard]] salt::DocPage candidatesOf(size_t page) const {
+    salt::DocPage all;
+    if (_required.empty()) {
+      for (const auto& matches : _matches) {
+        if (matches) matches->addPage(page, &all);
+      }
+      return all;
+    }
+    for (const size_t u : _required) {
+      salt::DocPage one;
+      _matches[u]->addPage(page, &one);
+      all = u == _required.front() ? one : all & one;
+      if (all.empty()) break;
+    }
+    return all;
   }
 
-  // Adds the documents of the matches that are not yet in _docs.
-  void admit(const TermMatches& matches) {
-    matches.forEach([&](uint32_t docID, uint32_t) {
-      if (!std::exchange(_admitted[docID], true)) _docs.push_back({docID});
+  // Whether no document matches all required terms.
+  [[nodiscard]] bool nobodyIsLeft() {
+    if (_required.empty()) return false;
+    if (!_anyCandidate) {
+      _anyCandidate = false;
+      for (size_t page = _matches[_required.front()]->pages(); page-- > 0 && !*_anyCandidate;) {
+        _anyCandidate = !candidatesOf(page).empty();
+      }
+    }
+    return !*_anyCandidate;
+  }
+
+  static void addStandings(size_t page, const salt::DocPage& candidates,
+                           std::vector<Standing>* docs) {
+    candidates.forEach([&](size_t doc) {
+      docs->push_back({static_cast<uint32_t>(page * salt::DocPage::kDocs + doc)});
     });
+  }
+
+  void addToTop(const std::vector<Standing>& docs) {
+    for (const Standing& doc : docs) {
+      if (_evaluation.accepts(doc)) _top.add(doc);
+    }
   }
 
   const salt::Index& _index;
   std::vector<Term>& _terms;
   const Options& _options;
   const Evaluation _evaluation;
+  TopDocs _top;
   std::vector<TermMatches::Found> _found;            // of terms not yet matched
   std::vector<std::optional<TermMatches>> _matches;  // of terms not yet evaluated
-  std::vector<Standing> _docs;
-  salt::DocPages<bool> _admitted;  // documents in _docs
-  bool _selective = false;         // only admitted documents can be results
+  std::vector<size_t> _required;                     // terms matched before the others
+  std::optional<bool> _anyCandidate;                 // once known
+  std::vector<std::vector<TermMatches::PagePart>> _pageParts;
 };
-
-bool ranksAbove(const DocResult& left, const DocResult& right) {
-  return left.score > right.score || (left.score == right.score && left.docID > right.docID);
-}
-
-std::vector<DocResult> topDocs(const std::vector<Standing>& docs, const Searching& searching,
-                               size_t maxResults) {
-  std::vector<DocResult> heap;
-  if (maxResults == 0) return heap;
-  // Largest DocID first, so that ties are decided by the order of arrival.
-  for (auto standing = docs.rbegin(); standing != docs.rend(); ++standing) {
-    if (!searching.accepts(*standing)) continue;
-    DocResult doc;
-    doc.docID = standing->docID;
-    doc.score = standing->score;
-    if (heap.size() == maxResults) {
-      if (!ranksAbove(doc, heap.front())) continue;
-      std::pop_heap(heap.begin(), heap.end(), ranksAbove);
-      heap.back() = doc;
-    } else {
-      heap.push_back(doc);
-    }
-    std::push_heap(heap.begin(), heap.end(), ranksAbove);
-  }
-  std::sort_heap(heap.begin(), heap.end(), ranksAbove);
-  return heap;
-}
 
 }  // namespace
 
 std::vector<DocResult> Search(const salt::Index& index, std::vector<Term>& terms,
                               const Options& options) {
-  Searching searching(index, terms, options);
-  return topDocs(searching.run(), searching, options.maxResults);
+  return Searching(index, terms, options).run();
 }
 
 double ZoneScoreDefault(uint32_t, uint16_t) {

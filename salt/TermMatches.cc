@@ -1,24 +1,10 @@
 #include "salt/TermMatches.h"
 
-#include <algorithm>
 #include <utility>
 
 #include "salt/TermRules.h"
 
 namespace saltsearch {
-
-namespace {
-
-// The bits of the zones of a term for those of masks that were found.
-salt::ZoneMaskMap zoneMap(const ZoneBits& bits, const TermMatches::Found& found) {
-  std::vector<uint16_t> zones;
-  for (const auto& places : found) {
-    if (places != nullptr) zones = places->zones();  // the table only grows
-  }
-  return {zones, [&bits](uint16_t zone) { return bits.of(zone); }};
-}
-
-}  // namespace
 
 TermMatches::TermMatches(const salt::Index& index, Term& term, size_t maxSuffixes)
     : TermMatches(index, term,
@@ -26,48 +12,55 @@ TermMatches::TermMatches(const salt::Index& index, Term& term, size_t maxSuffixe
                   maxSuffixes) {}
 
 TermMatches::TermMatches(const salt::Index& index, Term& term, Found found, size_t maxSuffixes)
-    : _tokens(term.tokens.size()), _zones(zoneMap(ZoneBits(term.zones), found)) {
+    : _found(std::move(found)), _parts(term.tokens.size()) {
   const ZoneBits zoneBits(term.zones);
+  size_t suffixes = 0;
   for (size_t t = 0; t < term.tokens.size(); ++t) {
-    Token& token = _tokens[t];
-    const size_t left = maxSuffixes - _suffixes;
-    if (found[t] != nullptr && found[t]->hasAllInMasks() && found[t]->suffixes() <= left) {
-      token.found = std::move(found[t]);
-      _suffixes += token.found->suffixes();
-      continue;
+    if (_found[t] == nullptr || _found[t]->suffixes() > maxSuffixes - suffixes) {
+      const auto first = std::make_shared<salt::PostingSet>();
+      index.ScanPrefix(term.tokens[t], [&](const salt::SuffixMeta& meta) {
+        term.found = true;
+        if (suffixes + first->suffixes() == maxSuffixes) return false;
+        first->add({meta.DocID, meta.ZoneID});
+        return true;
+      });
+      _found[t] = std::make_shared<const salt::FoundPlaces>(
+          first, std::make_shared<const salt::PostingSet>());
     }
-    index.ScanPrefix(term.tokens[t], [&](const salt::SuffixMeta& meta) {
-      term.found = true;
-      if (_suffixes == maxSuffixes) return false;
-      ++_suffixes;
-      const uint32_t bits = zoneBits.of(meta.ZoneID);
-      if (bits != 0) token.masks[meta.DocID] |= bits;
-      return true;
+    suffixes += _found[t]->suffixes();
+    _found[t]->forEachZone([&](uint16_t zone, const salt::DocSet& docs) {
+      if (const uint32_t mask = zoneBits.of(zone); mask != 0) _parts[t].push_back({&docs, mask});
     });
   }
-  term.found = term.found || _suffixes != 0;
+  term.found = term.found || suffixes != 0;
+}
+
+void TermMatches::getPage(size_t page, std::vector<std::vector<PagePart>>* parts) const {
+  parts->resize(_parts.size());
+  for (size_t t = 0; t < _parts.size(); ++t) {
+    (*parts)[t].clear();
+    for (const Part& part : _parts[t]) {
+      if (const salt::DocPage* const docs = part.docs->page(page); docs != nullptr) {
+        (*parts)[t].push_back({docs, part.mask});
+      }
+    }
+  }
 }
 
 size_t TermMatches::pages() const {
   size_t count = 0;
-  for (const Token& token : _tokens) {
-    count = std::max(count, token.found ? token.found->pages() : token.masks.pages());
+  for (const auto& parts : _parts) {
+    for (const Part& part : parts) count = std::max(count, part.docs->pages());
   }
   return count;
 }
 
-bool TermMatches::matchPage(size_t page, salt::MaskPage* out) const {
-  out->fill(0);
-  bool some = false;
-  for (const Token& token : _tokens) {
-    if (token.found) {
-      some = token.found->addPage(page, _zones.effective(), out) || some;
-    } else if (const uint32_t* const masks = token.masks.page(page); masks != nullptr) {
-      some = true;
-      for (size_t i = 0; i < out->size(); ++i) (*out)[i] |= masks[i];
+void TermMatches::addPage(size_t page, salt::DocPage* docs) const {
+  for (const auto& parts : _parts) {
+    for (const Part& part : parts) {
+      if (const salt::DocPage* const more = part.docs->page(page); more != nullptr) *docs |= *more;
     }
   }
-  return some;
 }
 
 void setFound(const salt::Index& index, Term& term) {

@@ -1,24 +1,34 @@
 #pragma once
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
 #include <vector>
 
-#include "salt/DocPages.h"
+#include "salt/DocSet.h"
 #include "salt/PostingSet.h"
 #include "salt/Search.h"
-#include "salt/ZoneMask.h"
 
 namespace saltsearch {
 
 // The documents that the tokens of one term match, and the zones of the term in which they match.
-// Answers from what scans have found, so that only the documents asked for cost anything. One
-// thread; the index outlives it.
+// Answers from what scans have found. One thread; the index outlives it.
 class TermMatches {
  public:
   // What scans for the tokens have found; null where only ScanPrefix can tell.
   using Found = std::vector<std::shared_ptr<const salt::FoundPlaces>>;
+
+  // The documents that a token matches in one zone of the index. A zone may have two such parts.
+  struct Part {
+    const salt::DocSet* docs;
+    uint32_t mask;  // of the zones of the term; see ZoneBits
+  };
+  // The same for the documents of one page.
+  struct PagePart {
+    const salt::DocPage* docs;
+    uint32_t mask;
+  };
 
   // Takes what was found for a well-formed term and sets Term::found. Takes at most `maxSuffixes`
   // suffixes over all tokens.
@@ -26,45 +36,38 @@ class TermMatches {
   // Scans for the tokens first.
   TermMatches(const salt::Index& index, Term& term, size_t maxSuffixes);
 
-  // The number of suffixes taken.
-  [[nodiscard]] size_t suffixes() const { return _suffixes; }
+  // By token.
+  [[nodiscard]] const std::vector<std::vector<Part>>& parts() const { return _parts; }
+  // Only the parts with a document on the page, by token.
+  void getPage(size_t page, std::vector<std::vector<PagePart>>* parts) const;
 
   // The zone mask (see ZoneBits) of a token's match in a document, 0 where it does not match.
   [[nodiscard]] uint32_t mask(size_t token, uint32_t docID) const {
-    const Token& of = _tokens[token];
-    return of.found ? _zones.of(of.found->mask(docID)) : of.masks.at(docID);
+    uint32_t mask = 0;
+    for (const Part& part : _parts[token]) {
+      if (part.docs->contains(docID)) mask |= part.mask;
+    }
+    return mask;
   }
-  // The number of pages of documents up to the last one with a match; see DocPages.
-  [[nodiscard]] size_t pages() const;
-  // Sets `out` to something other than 0 for the documents of the page that any token matches, and
-  // to 0 for the others. False when there is certainly no match.
-  [[nodiscard]] bool matchPage(size_t page, salt::MaskPage* out) const;
 
-  // Calls visit(docID, mask) for each document of each token, once for a token.
+  // The number of pages of documents up to the last one with a match; see DocSet.
+  [[nodiscard]] size_t pages() const;
+  // Adds the documents of the page that any token matches.
+  void addPage(size_t page, salt::DocPage* docs) const;
+  // Calls visit(docID) for each document that any token matches, ascending.
   template <typename Visit>
   void forEach(const Visit& visit) const {
-    for (const Token& token : _tokens) {
-      if (token.found) {
-        token.found->forEach([&](uint32_t docID, uint32_t found) {
-          if (const uint32_t mask = _zones.of(found); mask != 0) visit(docID, mask);
-        });
-      } else {
-        token.masks.forEach([&visit](uint32_t docID, uint32_t mask) {
-          if (mask != 0) visit(docID, mask);
-        });
-      }
+    for (size_t page = 0; page < pages(); ++page) {
+      salt::DocPage docs;
+      addPage(page, &docs);
+      docs.forEach(
+          [&](size_t doc) { visit(static_cast<uint32_t>(page * salt::DocPage::kDocs + doc)); });
     }
   }
 
  private:
-  struct Token {
-    std::shared_ptr<const salt::FoundPlaces> found;  // null when the masks are in `masks`
-    salt::DocPages<uint32_t> masks;
-  };
-
-  std::vector<Token> _tokens;
-  mutable salt::ZoneMaskMap _zones;  // from what was found to the zones of the term
-  size_t _suffixes = 0;
+  Found _found;  // holds the documents of the parts
+  std::vector<std::vector<Part>> _parts;
 };
 
 // Sets Term::found as TermMatches does, stopping at the first suffix.

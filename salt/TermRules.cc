@@ -1,6 +1,7 @@
 #include "salt/TermRules.h"
 
 #include <algorithm>
+#include <bit>
 #include <cmath>
 
 #include "salt/Database.h"
@@ -64,8 +65,8 @@ ZoneBits::ZoneBits(const std::vector<uint16_t>& zones) {
 double zoneFactor(const Term& term, uint32_t zoneMask) {
   if (term.zones.empty()) return 1.0;
   double sum = 0;
-  for (size_t i = 0; i < term.zones.size(); ++i) {
-    if ((zoneMask >> i & 1) != 0) sum += term.zoneScores[i];
+  for (; zoneMask != 0; zoneMask &= zoneMask - 1) {
+    sum += term.zoneScores[static_cast<size_t>(std::countr_zero(zoneMask))];
   }
   return std::min(sum, 1.0);
 }

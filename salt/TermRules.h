@@ -5,7 +5,6 @@
 #include <vector>
 
 #include "salt/Search.h"
-#include "salt/ZoneMask.h"
 
 // How the fields of terms determine a document's score, shared by all evaluators of queries.
 namespace saltsearch {
@@ -69,8 +68,6 @@ class Evaluation {
   void apply(size_t u, const MaskOf& maskOf, std::vector<Standing>& docs) const {
     const Step& step = _steps[u];
     const Term& term = _terms[u];
-    salt::MaskMemo<double> factors;
-    const auto factorOf = [&term](uint32_t zoneMask) { return zoneFactor(term, zoneMask); };
     for (size_t i = 0; i < docs.size(); ++i) {
       DocResult match;
       for (size_t t = 0; t < term.tokens.size(); ++t) {
@@ -78,9 +75,8 @@ class Evaluation {
       }
       if (!docs[i].in) continue;
       double& score = docs[i].score;
-      score *= match.tokenScore == kNoMatch
-                   ? term.defaultScore
-                   : match.tokenScore * factors.of(match.zoneMask, factorOf);
+      score *= match.tokenScore == kNoMatch ? term.defaultScore
+                                            : match.tokenScore * zoneFactor(term, match.zoneMask);
       if (step.prunes && score < step.need) docs[i].in = false;
     }
   }

@@ -164,7 +164,7 @@ bool ZoneWriter::deleteDocs(const std::vector<uint32_t>& docIDs) {
   DocSet after = *before;
   for (const uint32_t docID : docIDs) {
     if (docID == 0) return refuse("Invalid DocID.");
-    if (!after.contains(docID)) after.insert(docID);
+    after.insert(docID);
   }
   if (after.size() == before->size()) return true;
   std::string bytes;

@@ -95,14 +95,8 @@ std::optional<Places> scanPlaces(const salt::Index& index, std::string_view pref
   const auto found = index.ScanPlaces({prefix}, limit);
   if (found.front() == nullptr) return std::nullopt;
   Places all{{}, found.front()->suffixes()};
-  found.front()->deliver([&all](const auto& zones, const salt::DocZones* docs, size_t count) {
-    if (count == 0) all.places.insert("an empty run");
-    for (size_t i = 0; i < count * zones.size(); ++i) {
-      const salt::DocZones& doc = docs[i / zones.size()];
-      const size_t zone = i % zones.size();
-      if ((doc.zones >> zone & 1) == 0) continue;
-      all.places.insert(fmt::format("{},{}", doc.DocID, zones[zone]));
-    }
+  found.front()->forEachZone([&all](uint16_t zone, const salt::DocSet& docs) {
+    docs.forEach([&](uint32_t docID) { all.places.insert(fmt::format("{},{}", docID, zone)); });
   });
   return all;
 }
