@@ -101,13 +101,13 @@ void walkPage(const salt::index& idx, const std::vector<Entry>& entries) {
   }
 }
 
-// Numbers three at a time are the numbers one by one, as far as there are any.
+// Numbers two at a time are the numbers one by one, as far as there are any.
 void readCodes(std::string_view bytes) {
   salt::BitReader together(bytes);
   salt::BitReader single(bytes);
   while (together.good) {
-    const auto numbers = together.threeGammas();
-    const std::array<uint32_t, 3> expected{single.gamma(), single.gamma(), single.gamma()};
+    const auto numbers = together.twoGammas();
+    const std::array<uint32_t, 2> expected{single.gamma(), single.gamma()};
     TL_ASSERT(together.good == single.good && numbers == expected);
   }
 }

@@ -36,16 +36,6 @@ bool makeDirectory(const std::string& path, TLErrorOut error) {
   return false;
 }
 
-bool writeAll(int fd, const std::string& bytes) {
-  for (size_t done = 0; done < bytes.size();) {
-    const ssize_t n = ::write(fd, bytes.data() + done, bytes.size() - done);
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return false;
-    done += static_cast<size_t>(n);
-  }
-  return fsync(fd) == 0;
-}
-
 }  // namespace
 
 bool readAt(int file, uint64_t offset, char* bytes, size_t count) {
@@ -144,12 +134,18 @@ std::optional<std::string> readFile(const std::string& path, size_t maximum, TLE
 }
 
 bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error) {
+  return writeFileAtomically(
+      path, [&bytes](int file) { return writeAt(file, 0, bytes); }, error);
+}
+
+bool writeFileAtomically(const std::string& path, const std::function<bool(int file)>& write,
+                         TLErrorOut error) {
   if (refuseNUL(path, error)) return false;
   const std::string temporary = path + ".new";
   {
     const FileDescriptor file(
         open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
-    if (file.get() < 0 || !writeAll(file.get(), bytes)) {
+    if (file.get() < 0 || !write(file.get()) || fsync(file.get()) != 0) {
       setError(error, posixError(errno, temporary));
       return false;
     }
@@ -159,6 +155,10 @@ bool writeFileAtomically(const std::string& path, const std::string& bytes, TLEr
     return false;
   }
   return true;
+}
+
+FileDescriptor openUnnamedFile(const std::string& directory) {
+  return FileDescriptor(open(directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, S_IRUSR | S_IWUSR));
 }
 
 uint64_t freeBytes(const std::string& path) {

@@ -1,11 +1,13 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include "platform/FileDescriptor.h"
 #include "platform/TLError.h"
 
 // File access with error objects. Paths are bytes; every operation refuses a path containing NUL
@@ -36,8 +38,15 @@ bool removeItem(const std::string& path, TLErrorOut error);
 [[nodiscard]] bool readAt(int file, uint64_t offset, char* bytes, size_t count);
 [[nodiscard]] bool writeAt(int file, uint64_t offset, std::string_view bytes);
 
+// A file without a name in the directory, which is gone once it is closed, also by a crash; invalid
+// with errno set on failure.
+[[nodiscard]] FileDescriptor openUnnamedFile(const std::string& directory);
+
 // Writes a temporary file beside the target, syncs it and renames it over the target.
 bool writeFileAtomically(const std::string& path, const std::string& bytes, TLErrorOut error);
+// The same with write(file), which returns false, with errno set, on failure.
+bool writeFileAtomically(const std::string& path, const std::function<bool(int file)>& write,
+                         TLErrorOut error);
 
 // The bytes that this process can still write to the file system of `path`; the largest number when
 // unknown.

@@ -46,15 +46,15 @@ class BitWriter {
   unsigned _used = 0;  // less than 8 between calls
 };
 
-// Three numbers by the bits that they begin with. Most numbers are small, so that a look into a
-// table of 8 KB replaces three times counting zeros.
+// Two numbers by the bits that they begin with. Most numbers are small, so that a look into a table
+// of 6 KB replaces twice counting zeros.
 class GammaTable {
  public:
   static constexpr unsigned kBits = 11;
 
   struct Entry {
-    uint8_t length = 0;  // of the three codes; 0 when they do not fit into kBits
-    std::array<uint8_t, 3> values{};
+    uint8_t length = 0;  // of both codes; 0 when they do not fit into kBits
+    std::array<uint8_t, 2> values{};
   };
 
   constexpr GammaTable() {
@@ -87,14 +87,14 @@ class BitReader {
  public:
   explicit BitReader(std::string_view bytes) : _bytes(bytes) {}
 
-  // The next three numbers, faster than one by one.
-  std::array<uint32_t, 3> threeGammas() {
+  // The next two numbers, faster than one by one.
+  std::array<uint32_t, 2> twoGammas() {
     if (_count < GammaTable::kBits) fill();
     const GammaTable::Entry& entry = kGammaTable.at(_bits >> (64 - GammaTable::kBits));
-    if (entry.length == 0 || entry.length > _count) return {gamma(), gamma(), gamma()};
+    if (entry.length == 0 || entry.length > _count) return {gamma(), gamma()};
     _bits <<= entry.length;
     _count -= entry.length;
-    return {entry.values[0], entry.values[1], entry.values[2]};
+    return {entry.values[0], entry.values[1]};
   }
 
   // The next number. At the end or at invalid bits it clears `good` and returns 0.

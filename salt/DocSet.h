@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <cstddef>
@@ -17,6 +18,18 @@ class DocPage {
     return (_words[doc / kWordDocs] >> (doc % kWordDocs) & 1) != 0;
   }
   void insert(size_t doc) { _words[doc / kWordDocs] |= uint64_t{1} << (doc % kWordDocs); }
+  // Inserts `count` documents from `first` on.
+  void insert(size_t first, size_t count) {
+    while (count > 0) {
+      const size_t taken = std::min(count, kWordDocs - first % kWordDocs);
+      _words[first / kWordDocs] |= UINT64_MAX >> (kWordDocs - taken) << (first % kWordDocs);
+      first += taken;
+      count -= taken;
+    }
+  }
+  void erase(const DocPage& other) {
+    for (size_t i = 0; i < _words.size(); ++i) _words[i] &= ~other._words[i];
+  }
 
   [[nodiscard]] bool empty() const {
     uint64_t any = 0;
@@ -65,10 +78,31 @@ class DocSet {
   }
 
   void insert(uint32_t docID) { writable(docID / DocPage::kDocs).insert(docID % DocPage::kDocs); }
+  // Inserts `count` documents from `first` on.
+  void insert(uint32_t first, uint32_t count) {
+    while (count > 0) {
+      const uint32_t inPage = first % DocPage::kDocs;
+      const uint32_t taken = std::min<uint32_t>(count, DocPage::kDocs - inPage);
+      writable(first / DocPage::kDocs).insert(inPage, taken);
+      first += taken;
+      count -= taken;
+    }
+  }
   void insert(const DocSet& other) {
     for (size_t page = 0; page < other.pages(); ++page) {
       if (const DocPage* const bits = other.page(page); bits != nullptr) writable(page) |= *bits;
     }
+  }
+  void erase(const DocSet& other) {
+    for (size_t page = 0; page < std::min(pages(), other.pages()); ++page) {
+      if (_pages[page] == kNone || other._pages[page] == kNone) continue;
+      _bits[_pages[page]].erase(other._bits[other._pages[page]]);
+    }
+  }
+
+  [[nodiscard]] bool empty() const {
+    return std::all_of(_bits.begin(), _bits.end(),
+                       [](const DocPage& bits) { return bits.empty(); });
   }
 
   [[nodiscard]] size_t size() const {
@@ -79,7 +113,7 @@ class DocSet {
 
   // The number of pages up to the last one in use.
   [[nodiscard]] size_t pages() const { return _pages.size(); }
-  // The documents from page * DocPage::kDocs on; null when none of them is a member.
+  // The documents from page * DocPage::kDocs on; null when none of them has ever been a member.
   [[nodiscard]] const DocPage* page(size_t page) const {
     return page < _pages.size() && _pages[page] != kNone ? &_bits[_pages[page]] : nullptr;
   }
@@ -92,6 +126,22 @@ class DocSet {
       _bits[_pages[page]].forEach(
           [&](size_t doc) { visit(static_cast<uint32_t>(page * DocPage::kDocs + doc)); });
     }
+  }
+
+  // Calls visit(first, count) for each run of consecutive members, ascending.
+  template <typename Visit>
+  void forEachRun(const Visit& visit) const {
+    uint32_t first = 0;
+    uint32_t count = 0;
+    forEach([&](uint32_t docID) {
+      if (count > 0 && docID != first + count) {
+        visit(first, count);
+        count = 0;
+      }
+      if (count == 0) first = docID;
+      ++count;
+    });
+    if (count > 0) visit(first, count);
   }
 
   [[nodiscard]] size_t bytes() const {
@@ -110,7 +160,7 @@ class DocSet {
     return _bits[_pages[page]];
   }
 
-  std::vector<uint32_t> _pages;  // numbers of pages in _bits; kNone for one without members
+  std::vector<uint32_t> _pages;  // numbers of pages in _bits; kNone for one that never had a member
   std::vector<DocPage> _bits;
 };
 

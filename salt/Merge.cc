@@ -16,7 +16,7 @@ Merge::Merge(index& owner, uint8_t shard, bool hot)
       _hot(_hotView, 0),
       _previous(owner, &_zoneTexts),
       _first(owner, &_zoneTexts),
-      _postings(owner.op.MaxShardSuffixes),
+      _postings(owner.path(), owner.op.MaxShardSuffixes),
       _withHot(hot) {}
 
 bool Merge::run() {
@@ -96,8 +96,8 @@ std::string_view Merge::previousText(size_t bytes) {
   return _previous.knownText().substr(0, bytes);
 }
 
-std::string Merge::postings(const PostingsOwner& owner) {
-  return _postings.finish(owner, [this](size_t bytes) { return previousText(bytes); });
+bool Merge::finishPostings() {
+  return _postings.finish([this](size_t bytes) { return previousText(bytes); });
 }
 
 std::string_view Merge::firstText() {
@@ -111,9 +111,7 @@ std::string_view Merge::firstText() {
 
 void Merge::flushPage(size_t count) {
   TL_ASSERT(_pending.size() >= count);
-  suffixKey(_shard, firstText(), _pending.front(), &_key);
-  pageToValue(_pending.data(), count, &_value);
-  putPage();
+  if (_withHot) putPage(count);
   ++_pageDelta;
   _pace.giveWay();
   _interrupted = _idx.interrupted();
@@ -124,7 +122,9 @@ void Merge::flushPage(size_t count) {
 
 // The first new page written after an old one begins replaces it, mostly with the same key. If the
 // value is the same too, there is nothing to write.
-void Merge::putPage() {
+void Merge::putPage(size_t count) {
+  suffixKey(_shard, firstText(), _pending.front(), &_key);
+  pageToValue(_pending.data(), count, &_value);
   const bool replaces = !_oldKey.empty();
   if (replaces && _oldKey != _key) _batch.Delete(_oldKey);
   if (!replaces || _oldKey != _key || _oldValue != _value) _batch.Put(_key, _value);

@@ -31,8 +31,9 @@ class Merge {
   // committed before stays. False when it did not reach the end.
   [[nodiscard]] bool run();
 
-  // The bytes of the shard's new posting list file, empty for none. Call it after a complete run.
-  [[nodiscard]] std::string postings(const PostingsOwner& owner);
+  // After a complete run: the posting lists of the shard, and whether there are any.
+  [[nodiscard]] bool finishPostings();
+  [[nodiscard]] PostingsBuilder& postings() { return _postings; }
 
  private:
   [[nodiscard]] bool oldIsNext();
@@ -47,12 +48,12 @@ class Merge {
 
   [[nodiscard]] std::string_view firstText();
 
-  // Writes the first `count` pending suffixes as a page.
+  // Ends a page with the first `count` pending suffixes.
   void flushPage(size_t count);
 
-  // Adds the page of _key and _value to the batch, and the deletion of the old page that it
-  // replaces.
-  void putPage();
+  // Adds the page of the first `count` pending suffixes to the batch, and the deletion of the old
+  // page that it replaces.
+  void putPage(size_t count);
 
   // Writes all pending suffixes as pages, and the batch if it is large enough or `final` is set.
   void commit(bool final);

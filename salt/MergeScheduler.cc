@@ -115,15 +115,9 @@ bool MergeScheduler::mergePages(uint8_t shard, bool hot) {
   if (!removePostings(_idx.path(), shard)) return false;
   Merge merge(_idx, shard, hot);
   if (!merge.run()) return false;
+  if (!merge.finishPostings() || !_idx.Sync()) return true;
   const PostingsOwner owner = _idx.postingsOwner(shard);
-  const std::string postings = merge.postings(owner);
-  if (postings.empty() || !_idx.Sync()) return true;
-  std::optional<TLError> error;
-  if (platform::writeFileAtomically(postingsPath(_idx.path(), shard), postings, &error)) {
-    _idx.setPostings(shard, Postings::open(_idx.path(), owner));
-  } else {
-    Log.error("Error writing postings: {}", error->message);
-  }
+  if (merge.postings().write(owner)) _idx.setPostings(shard, Postings::open(_idx.path(), owner));
   return true;
 }
 

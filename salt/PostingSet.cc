@@ -1,5 +1,7 @@
 #include "salt/PostingSet.h"
 
+#include <algorithm>
+
 namespace salt {
 
 void PostingSet::add(PostingSet&& other) {
@@ -11,6 +13,15 @@ void PostingSet::add(PostingSet&& other) {
   }
   _suffixes += other._suffixes;
   for (const Zone& zone : other._zones) docsOf(zone.ZoneID).insert(zone.docs);
+}
+
+void PostingSet::erase(const DocSet& docs) {
+  for (Zone& zone : _zones) zone.docs.erase(docs);
+}
+
+bool PostingSet::empty() const {
+  return std::all_of(_zones.begin(), _zones.end(),
+                     [](const Zone& zone) { return zone.docs.empty(); });
 }
 
 size_t PostingSet::bytes() const {

@@ -12,7 +12,7 @@
 namespace salt {
 
 // The distinct places of many suffixes, as a set of documents for each zone, and the number of
-// suffixes. A mail has about ten zones. Built by one thread; then any thread may read it.
+// suffixes added. A mail has about ten zones. Built by one thread; then any thread may read it.
 class PostingSet {
  public:
   struct Zone {
@@ -27,6 +27,8 @@ class PostingSet {
 
   // The two sets must not count the same suffix.
   void add(PostingSet&& other);
+  // Their suffixes remain counted.
+  void erase(const DocSet& docs);
 
   // The documents of a zone, to which more may be added; valid until the next zone is asked for.
   // Their suffixes are counted by addSuffixes.
@@ -39,6 +41,9 @@ class PostingSet {
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
   // In no order.
   [[nodiscard]] const std::vector<Zone>& zones() const { return _zones; }
+
+  // Whether there is no document.
+  [[nodiscard]] bool empty() const;
 
   [[nodiscard]] size_t bytes() const;
 
@@ -56,8 +61,11 @@ class FoundPlaces {
   FoundPlaces(std::shared_ptr<const PostingSet> hot, std::shared_ptr<const PostingSet> pages)
       : _hot(std::move(hot)), _pages(std::move(pages)) {}
 
-  // The number of matching suffixes.
+  // The number of matching suffixes; those of deleted documents may be among them.
   [[nodiscard]] uint64_t suffixes() const { return _hot->suffixes() + _pages->suffixes(); }
+
+  // Whether no document matches.
+  [[nodiscard]] bool empty() const { return _hot->empty() && _pages->empty(); }
 
   // Calls visit(zoneID, documents) for the zones with a match; a zone may come twice.
   template <typename Visit>

@@ -4,11 +4,10 @@
 #include <fmt/format.h>
 #include <sys/stat.h>
 
-#include <array>
 #include <bit>
 #include <cerrno>
 #include <cstring>
-#include <map>
+#include <optional>
 
 #include "platform/Files.h"
 #include "platform/Paths.h"
@@ -21,7 +20,7 @@ namespace salt {
 namespace {
 
 struct Header {
-  char magic[8] = {'T', 'A', 'L', 'P', 'O', 'S', 'T', '2'};
+  char magic[8] = {'T', 'A', 'L', 'P', 'O', 'S', 'T', '3'};
   int64_t indexCreated = 0;
   uint64_t fileBytes = 0;
   uint32_t tableBytes = 0;
@@ -32,7 +31,6 @@ struct Header {
 };
 static_assert(sizeof(Header) == 48);
 
-constexpr size_t kMaxZones = 32;
 constexpr size_t kSumBytes = 4;  // before each list
 constexpr uint32_t kMaxTableBytes = uint32_t{1} << 28;
 constexpr uint64_t kMinBudget = 64 * 1024;
@@ -152,8 +150,8 @@ bool Postings::readTable(const PostingsOwner& owner) {
 
   Input input(table);
   const uint32_t zones = input.varint();
-  if (zones > kMaxZones) return false;
-  for (uint32_t i = 0; i < zones; ++i) _zones.push_back(static_cast<uint16_t>(input.varint()));
+  for (uint32_t i = 0; i < zones && input.good; ++i)
+    _zones.push_back(static_cast<uint16_t>(input.varint()));
   uint64_t offset = sizeof header + table.size();
   std::string text;
   for (uint32_t i = 0; i < header.entries && input.good; ++i) {
@@ -181,7 +179,7 @@ const Postings::Entry* Postings::find(std::string_view prefix) const {
   return found ? &*entry : nullptr;
 }
 
-bool Postings::add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const {
+bool Postings::add(std::string_view prefix, PostingSet* places) const {
   const Entry* const entry = find(prefix);
   if (entry == nullptr) return false;
   std::string bytes(entry->bytes, '\0');
@@ -190,38 +188,35 @@ bool Postings::add(std::string_view prefix, const DocSet& deleted, PostingSet* p
     std::memcpy(&sum, bytes.data(), sizeof sum);
   }
   const std::string_view list = std::string_view(bytes).substr(kSumBytes);
-  if (sum == static_cast<uint32_t>(sumOf(list)) && addList(list, deleted, places)) return true;
+  if (sum == static_cast<uint32_t>(sumOf(list)) && addList(list, places)) return true;
   Log.error("Postings cannot be read");
   return false;
 }
 
-// A list has the number of documents and the different zone masks, the most frequent first; then
-// for each document, as gamma codes, its distance from the one before, the number of its mask in
-// the list, from 1, and its suffixes.
-bool Postings::addList(std::string_view list, const DocSet& deleted, PostingSet* places) const {
+// A list has the number of suffixes and that of zones; for each zone its number in the file and its
+// number of runs of documents; then for each run, as gamma codes, the number of documents before
+// it, from the end of the one before, and its own.
+bool Postings::addList(std::string_view list, PostingSet* places) const {
   Input input(list);
-  const uint32_t docs = input.varint();
-  std::vector<uint32_t> masks(std::min<size_t>(input.varint(), list.size()));
-  const uint32_t allZones =
-      _zones.size() == kMaxZones ? UINT32_MAX : (uint32_t{1} << _zones.size()) - 1;
-  for (uint32_t& mask : masks) mask = input.varint() & allZones;
+  const uint32_t suffixes = input.varint();
+  std::vector<std::pair<uint32_t, uint32_t>> zones(std::min<size_t>(input.varint(), _zones.size()));
+  for (auto& [number, runs] : zones) {
+    number = input.varint();
+    runs = input.varint();
+    if (number >= _zones.size()) return false;
+  }
   if (!input.good) return false;
   BitReader bits(input.rest());
-  // Zones are made before their sets are taken, which others would move.
-  for (const uint16_t zone : _zones) (void)places->docsOf(zone);
-  std::array<DocSet*, kMaxZones> docsOf{};
-  for (size_t i = 0; i < _zones.size(); ++i) docsOf[i] = &places->docsOf(_zones[i]);
-  uint64_t suffixes = 0;
-  uint32_t next = 0;  // after the document before
-  for (uint32_t i = 0; i < docs; ++i) {
-    const auto [step, mask, count] = bits.threeGammas();
-    next += step;
-    if (!bits.good || mask > masks.size()) return false;
-    if (deleted.contains(next - 1)) continue;
-    for (uint32_t left = masks[mask - 1]; left != 0; left &= left - 1) {
-      docsOf[static_cast<size_t>(std::countr_zero(left))]->insert(next - 1);
+  for (const auto& [number, runs] : zones) {
+    DocSet& docs = places->docsOf(_zones[number]);
+    uint64_t end = 0;  // of the run before
+    for (uint32_t i = 0; i < runs; ++i) {
+      const auto [gap, count] = bits.twoGammas();
+      const uint64_t first = end + gap;
+      end = first + count;
+      if (!bits.good || end > UINT32_MAX) return false;
+      docs.insert(static_cast<uint32_t>(first), count);
     }
-    suffixes += count;
   }
   places->addSuffixes(suffixes);
   return true;
@@ -229,27 +224,22 @@ bool Postings::addList(std::string_view list, const DocSet& deleted, PostingSet*
 
 // --- Building
 
-uint32_t PostingsBuilder::bitOf(uint16_t zoneID) {
-  for (size_t i = 0; i < _zones.size(); ++i) {
-    if (_zones[i] == zoneID) return uint32_t{1} << i;
-  }
-  if (_zones.size() == kMaxZones) {
-    _unfit = true;
-    return 0;
-  }
-  _zones.push_back(zoneID);
-  return uint32_t{1} << (_zones.size() - 1);
+PostingsBuilder::PostingsBuilder(std::string directory, uint64_t fullShard)
+    : _directory(std::move(directory)),
+      _minSuffixes(std::max<uint64_t>(kMinSuffixes, fullShard / 4000)),
+      _maxPending(std::clamp<uint64_t>(fullShard / 4, 64, uint64_t{1} << 18)),
+      _lists(platform::openUnnamedFile(_directory)) {
+  if (_lists.get() < 0) fail();
 }
 
-void PostingsBuilder::count(Node* node, size_t end) {
-  if (node->counts == nullptr) node->counts = std::make_unique<DocPages<Counts>>();
-  for (size_t at = node->begin; at < end; ++at) {
-    Counts& counts = (*node->counts)[_pending[at].DocID];
-    counts.mask |= bitOf(_pending[at].ZoneID);
-    ++counts.suffixes;
-  }
-  node->counted += end - node->begin;
-  node->begin = end;
+void PostingsBuilder::fail() {
+  Log.error("Error writing postings: {}", std::strerror(errno));
+  _unfit = true;
+}
+
+void PostingsBuilder::count(size_t end, Node* node) {
+  if (node->places == nullptr) node->places = std::make_unique<PostingSet>();
+  for (; node->begin < end; ++node->begin) node->places->add(_pending[node->begin]);
 }
 
 void PostingsBuilder::fold() {
@@ -260,59 +250,63 @@ void PostingsBuilder::fold() {
     break;
   }
   for (Node& node : _open) {
-    if (node.begin < end) count(&node, end);
+    if (node.begin < end) count(end, &node);
     node.begin -= end;
   }
   _pending.erase(_pending.begin(), _pending.begin() + static_cast<ptrdiff_t>(end));
 }
 
 void PostingsBuilder::make(Node* node, std::string text, size_t above) {
-  count(node, _pending.size());
-  std::string list(kSumBytes, '\0');
-  appendList(*node->counts, &list);
-  const auto sum = static_cast<uint32_t>(sumOf(std::string_view(list).substr(kSumBytes)));
-  std::memcpy(list.data(), &sum, sizeof sum);
+  count(_pending.size(), node);
+  const std::string list = listOf(*node->places);
   _madeBytes += list.size() + text.size();
-  _made.push_back({std::move(text), static_cast<uint8_t>(above), node->counted, std::move(list)});
+  _made.push_back({std::move(text), static_cast<uint8_t>(above), static_cast<uint32_t>(list.size()),
+                   _listsEnd, node->places->suffixes()});
+  keep(list);
   if (_madeBytes > 2 * budget()) prune(budget());
 }
 
-void PostingsBuilder::appendList(const DocPages<Counts>& counts, std::string* list) {
-  const auto forEachDoc = [&counts](const auto& visit) {
-    counts.forEach([&visit](uint32_t docID, const Counts& of) {
-      if (of.suffixes != 0) visit(docID, of);
+std::string PostingsBuilder::listOf(const PostingSet& places) {
+  if (places.suffixes() > UINT32_MAX) _unfit = true;
+  std::string list(kSumBytes, '\0');
+  appendVarint(&list, static_cast<uint32_t>(places.suffixes()));
+  appendVarint(&list, static_cast<uint32_t>(places.zones().size()));
+  std::string codes;
+  BitWriter bits(&codes);
+  for (const PostingSet::Zone& zone : places.zones()) {
+    uint32_t runs = 0;
+    uint32_t end = 0;  // of the run before
+    zone.docs.forEachRun([&](uint32_t first, uint32_t count) {
+      if (first - end > kMaxGamma || count > kMaxGamma) {
+        _unfit = true;
+        return;
+      }
+      bits.putGamma(first - end);
+      bits.putGamma(count);
+      end = first + count;
+      ++runs;
     });
-  };
-  uint32_t docs = 0;
-  std::map<uint32_t, uint32_t> frequencies;  // of masks
-  forEachDoc([&](uint32_t, const Counts& of) {
-    ++docs;
-    ++frequencies[of.mask];
-  });
-  std::vector<std::pair<uint32_t, uint32_t>> masks(frequencies.begin(), frequencies.end());
-  std::stable_sort(masks.begin(), masks.end(),
-                   [](const auto& left, const auto& right) { return left.second > right.second; });
-  appendVarint(list, docs);
-  appendVarint(list, static_cast<uint32_t>(masks.size()));
-  std::map<uint32_t, uint32_t> numbers;  // of masks, from 1
-  for (const auto& [mask, frequency] : masks) {
-    appendVarint(list, mask);
-    numbers.emplace(mask, numbers.size() + 1);
+    appendVarint(&list, numberOf(zone.ZoneID));
+    appendVarint(&list, runs);
   }
-  BitWriter bits(list);
-  uint32_t next = 0;
-  forEachDoc([&](uint32_t docID, const Counts& of) {
-    const uint32_t step = docID - next + 1;
-    if (step > kMaxGamma || of.suffixes > kMaxGamma) {
-      _unfit = true;
-      return;
-    }
-    bits.putGamma(step);
-    bits.putGamma(numbers[of.mask]);
-    bits.putGamma(of.suffixes);
-    next = docID + 1;
-  });
   bits.finish();
+  list += codes;
+  const auto sum = static_cast<uint32_t>(sumOf(std::string_view(list).substr(kSumBytes)));
+  std::memcpy(list.data(), &sum, sizeof sum);
+  return list;
+}
+
+uint32_t PostingsBuilder::numberOf(uint16_t zoneID) {
+  const auto known = std::find(_zones.begin(), _zones.end(), zoneID);
+  const auto number = static_cast<uint32_t>(known - _zones.begin());
+  if (known == _zones.end()) _zones.push_back(zoneID);
+  return number;
+}
+
+void PostingsBuilder::keep(std::string_view list) {
+  if (_unfit) return;
+  if (!platform::writeAt(_lists.get(), _listsEnd, list)) return fail();
+  _listsEnd += list.size();
 }
 
 uint64_t PostingsBuilder::budget() const {
@@ -324,17 +318,39 @@ void PostingsBuilder::prune(uint64_t maxBytes) {
     _minSuffixes += std::max<uint64_t>(_minSuffixes / 8, 1);
     std::erase_if(_made, [this](const Made& made) {
       if (made.suffixes >= _minSuffixes) return false;
-      _madeBytes -= made.list.size() + made.text.size();
+      _madeBytes -= made.bytes + made.text.size();
       return true;
     });
   }
 }
 
-std::string PostingsBuilder::file(const PostingsOwner& owner) {
-  prune(budget());
-  if (_made.empty() || _unfit) return "";
+bool PostingsBuilder::write(const PostingsOwner& owner) {
   std::sort(_made.begin(), _made.end(),
             [](const Made& left, const Made& right) { return left.text < right.text; });
+  const auto writeAll = [this, &owner](int file) {
+    const std::string start = head(owner);
+    uint64_t end = start.size();
+    if (!platform::writeAt(file, 0, start)) return false;
+    std::string list;
+    for (const Made& made : _made) {
+      list.resize(made.bytes);
+      if (!platform::readAt(_lists.get(), made.offset, list.data(), list.size()) ||
+          !platform::writeAt(file, end, list)) {
+        return false;
+      }
+      end += list.size();
+    }
+    return true;
+  };
+  std::optional<TLError> error;
+  if (platform::writeFileAtomically(postingsPath(_directory, owner.shard), writeAll, &error)) {
+    return true;
+  }
+  Log.error("Error writing postings: {}", error->message);
+  return false;
+}
+
+std::string PostingsBuilder::head(const PostingsOwner& owner) const {
   std::string table;
   appendVarint(&table, static_cast<uint32_t>(_zones.size()));
   for (const uint16_t zone : _zones) appendVarint(&table, zone);
@@ -348,8 +364,8 @@ std::string PostingsBuilder::file(const PostingsOwner& owner) {
     appendVarint(&table, static_cast<uint32_t>(made.text.size() - shared));
     table.append(made.text, shared);
     appendVarint(&table, made.above);
-    appendVarint(&table, static_cast<uint32_t>(made.list.size()));
-    lists += made.list.size();
+    appendVarint(&table, made.bytes);
+    lists += made.bytes;
     before = made.text;
   }
   Header header;
@@ -360,12 +376,7 @@ std::string PostingsBuilder::file(const PostingsOwner& owner) {
   header.fileBytes = sizeof header + table.size() + lists;
   const std::string_view head(reinterpret_cast<const char*>(&header), sizeof header);
   header.sum = sumOf(table, sumOf(head));
-  std::string bytes;
-  bytes.reserve(header.fileBytes);
-  bytes.append(reinterpret_cast<const char*>(&header), sizeof header);
-  bytes += table;
-  for (const Made& made : _made) bytes += made.list;
-  return bytes;
+  return std::string(head) + table;
 }
 
 }  // namespace salt

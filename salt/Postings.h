@@ -10,8 +10,6 @@
 #include <vector>
 
 #include "platform/FileDescriptor.h"
-#include "salt/DocPages.h"
-#include "salt/DocSet.h"
 #include "salt/PostingSet.h"
 
 // Posting lists for the prefixes that many suffixes of a shard begin with: the documents, with
@@ -46,10 +44,10 @@ class Postings {
   [[nodiscard]] static std::shared_ptr<const Postings> open(const std::string& directory,
                                                             const PostingsOwner& owner);
 
-  // Adds the places of all suffixes that begin with `prefix`, except those of documents in
-  // `deleted`. False when there is no list or, with a log line, it cannot be read; then the pages
-  // must be scanned.
-  [[nodiscard]] bool add(std::string_view prefix, const DocSet& deleted, PostingSet* places) const;
+  // Adds the places of all suffixes that begin with `prefix`, including those of deleted documents.
+  // False when there is no list or, with a log line, it cannot be read; then the pages must be
+  // scanned.
+  [[nodiscard]] bool add(std::string_view prefix, PostingSet* places) const;
 
  private:
   struct Entry {
@@ -68,14 +66,13 @@ class Postings {
     return std::string_view(_texts).substr(entry.text, entry.length);
   }
   // False when the list is invalid.
-  [[nodiscard]] bool addList(std::string_view list, const DocSet& deleted,
-                             PostingSet* places) const;
+  [[nodiscard]] bool addList(std::string_view list, PostingSet* places) const;
   // Null when the prefix has no entry.
   [[nodiscard]] const Entry* find(std::string_view prefix) const;
 
   const platform::FileDescriptor _file;
   std::string _texts;
-  std::vector<uint16_t> _zones;  // by bit of a zone mask
+  std::vector<uint16_t> _zones;  // by number in the file
   std::vector<Entry> _entries;   // in text order
 };
 
@@ -86,14 +83,14 @@ class Postings {
 // less than the node's text.
 //
 // Memory: the places of the last 260,000 suffixes, the documents of open nodes with more suffixes
-// than that, and twice the size of the result.
+// than that, and the texts of the entries. The lists are kept in an unnamed file in the directory
+// of the index; when it cannot be created or written, with a log line, no file is made.
 class PostingsBuilder {
  public:
-  // `fullShard` is MaxShardSuffixes. Only prefixes with at least a 500th of that many suffixes,
-  // 2,000 of a million, get an entry: scanning fewer from the pages is as fast.
-  explicit PostingsBuilder(uint64_t fullShard)
-      : _minSuffixes(std::max<uint64_t>(kMinSuffixes, fullShard / 500)),
-        _maxPending(std::clamp<uint64_t>(fullShard / 4, 64, uint64_t{1} << 18)) {}
+  // `fullShard` is MaxShardSuffixes. Only prefixes with at least a 4,000th of that many suffixes,
+  // 250 of a million, get an entry, and fewer where the space does not suffice: finding the first
+  // of them in the pages takes longer than reading a list.
+  PostingsBuilder(std::string directory, uint64_t fullShard);
 
   // Takes the next suffix, which shares `lcp` bytes with the previous one. Where that ends a node
   // with many suffixes, `textBefore(n)` is asked for the first n bytes of the previous suffix.
@@ -105,31 +102,31 @@ class PostingsBuilder {
     if (_pending.size() >= _maxPending) fold();
   }
 
-  // The bytes of the file after the last suffix; empty when there is no entry.
+  // Ends the last nodes, after the last suffix. False when there is nothing to write.
   template <typename Text>
-  [[nodiscard]] std::string finish(const PostingsOwner& owner, const Text& textBefore) {
+  [[nodiscard]] bool finish(const Text& textBefore) {
     close(0, textBefore);
-    return file(owner);
+    prune(budget());
+    return !_made.empty() && !_unfit;
   }
+
+  // Writes the file, once finished. False, with a log line, on failure.
+  [[nodiscard]] bool write(const PostingsOwner& owner);
 
  private:
   static constexpr uint64_t kMinSuffixes = 2;
 
-  struct Counts {
-    uint32_t mask = 0;  // of zones
-    uint32_t suffixes = 0;
-  };
   struct Node {
-    size_t depth = 0;      // length of the text shared by its suffixes
-    size_t begin = 0;      // index in _pending of its first suffix not yet in `counts`
-    uint64_t counted = 0;  // suffixes in `counts`
-    std::unique_ptr<DocPages<Counts>> counts;
+    size_t depth = 0;                    // length of the text shared by its suffixes
+    size_t begin = 0;                    // index in _pending of its first suffix not in `places`
+    std::unique_ptr<PostingSet> places;  // of the suffixes before
   };
   struct Made {
     std::string text;
     uint8_t above;
+    uint32_t bytes;  // of the list, at `offset` of _lists
+    uint64_t offset;
     uint64_t suffixes;
-    std::string list;
   };
 
   // Ends the nodes whose texts are longer than `lcp`, and opens one of that length if there is
@@ -152,22 +149,28 @@ class PostingsBuilder {
   }
 
   [[nodiscard]] uint64_t suffixesOf(const Node& node) const {
-    return node.counted + _pending.size() - node.begin;
+    return (node.places ? node.places->suffixes() : 0) + _pending.size() - node.begin;
   }
   void make(Node* node, std::string text, size_t above);
-  void appendList(const DocPages<Counts>& counts, std::string* list);
-  // Adds the node's suffixes in _pending before `end` to its counts.
-  void count(Node* node, size_t end);
-  // Adds the pending suffixes to the counts of the large open nodes, and drops those that no other
+  [[nodiscard]] std::string listOf(const PostingSet& places);
+  // Adds the node's suffixes in _pending before `end` to its places.
+  void count(size_t end, Node* node);
+  // Adds the pending suffixes to the places of the large open nodes, and drops those that no other
   // node needs.
   void fold();
-  [[nodiscard]] uint32_t bitOf(uint16_t zoneID);
+  [[nodiscard]] uint32_t numberOf(uint16_t zoneID);
+  // Appends to _lists.
+  void keep(std::string_view list);
+  // Logs the error in errno.
+  void fail();
 
   // Drops the entries with the fewest suffixes until the lists take at most `maxBytes`.
   void prune(uint64_t maxBytes);
   [[nodiscard]] uint64_t budget() const;
-  [[nodiscard]] std::string file(const PostingsOwner& owner);
+  // The bytes of the file before the lists.
+  [[nodiscard]] std::string head(const PostingsOwner& owner) const;
 
+  const std::string _directory;
   uint64_t _taken = 0;
   uint64_t _minSuffixes;
   const uint64_t _maxPending;
@@ -175,8 +178,10 @@ class PostingsBuilder {
   std::vector<Node> _open;
   std::vector<Made> _made;
   uint64_t _madeBytes = 0;
-  std::vector<uint16_t> _zones;  // by bit
-  bool _unfit = false;  // the format cannot hold it: more than 32 zones, or DocIDs too far apart
+  platform::FileDescriptor _lists;
+  uint64_t _listsEnd = 0;
+  std::vector<uint16_t> _zones;  // by number in the file
+  bool _unfit = false;  // a failure, or what the format cannot hold: documents too far apart
 };
 
 }  // namespace salt

@@ -191,7 +191,7 @@ class PlacesScan {
                                  PostingSet* places) const {
     const auto& postings = *_view.postings;
     return shard < postings.size() && postings[shard] != nullptr &&
-           postings[shard]->add(prefix, *_view.deleted, places);
+           postings[shard]->add(prefix, places);
   }
 
   const IndexView& _view;
@@ -245,6 +245,7 @@ std::vector<std::shared_ptr<const FoundPlaces>> Scanner::scanPlaces(
   for (Request& request : requests) {
     Share& share = request.shares.front();
     for (size_t part = 1; part < kThreads; ++part) share.add(std::move(request.shares[part]));
+    share.pages.erase(*view.deleted);  // those of posting lists
     auto pages = request.known ? std::move(request.known)
                                : std::make_shared<const PostingSet>(std::move(share.pages));
     if (keep) _scanCache.keep(request.prefix, view.pageGeneration, pages);

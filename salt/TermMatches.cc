@@ -6,6 +6,29 @@
 
 namespace saltsearch {
 
+namespace {
+
+// The places of the first `maxSuffixes` suffixes over all tokens. Sets Term::found.
+TermMatches::Found firstSuffixes(const salt::Index& index, Term& term, size_t maxSuffixes) {
+  const auto none = std::make_shared<const salt::PostingSet>();
+  TermMatches::Found found;
+  size_t suffixes = 0;
+  for (const std::string& token : term.tokens) {
+    const auto places = std::make_shared<salt::PostingSet>();
+    index.ScanPrefix(token, [&](const salt::SuffixMeta& meta) {
+      term.found = true;
+      if (suffixes == maxSuffixes) return false;
+      ++suffixes;
+      places->add({meta.DocID, meta.ZoneID});
+      return true;
+    });
+    found.push_back(std::make_shared<const salt::FoundPlaces>(places, none));
+  }
+  return found;
+}
+
+}  // namespace
+
 TermMatches::TermMatches(const salt::Index& index, Term& term, size_t maxSuffixes)
     : TermMatches(index, term,
                   index.ScanPlaces({term.tokens.begin(), term.tokens.end()}, maxSuffixes),
@@ -13,26 +36,20 @@ TermMatches::TermMatches(const salt::Index& index, Term& term, size_t maxSuffixe
 
 TermMatches::TermMatches(const salt::Index& index, Term& term, Found found, size_t maxSuffixes)
     : _found(std::move(found)), _parts(term.tokens.size()) {
+  size_t left = maxSuffixes;
+  const bool all = std::all_of(_found.begin(), _found.end(), [&left](const auto& places) {
+    if (places == nullptr || places->suffixes() > left) return false;
+    left -= places->suffixes();
+    return true;
+  });
+  if (!all) _found = firstSuffixes(index, term, maxSuffixes);
   const ZoneBits zoneBits(term.zones);
-  size_t suffixes = 0;
   for (size_t t = 0; t < term.tokens.size(); ++t) {
-    if (_found[t] == nullptr || _found[t]->suffixes() > maxSuffixes - suffixes) {
-      const auto first = std::make_shared<salt::PostingSet>();
-      index.ScanPrefix(term.tokens[t], [&](const salt::SuffixMeta& meta) {
-        term.found = true;
-        if (suffixes + first->suffixes() == maxSuffixes) return false;
-        first->add({meta.DocID, meta.ZoneID});
-        return true;
-      });
-      _found[t] = std::make_shared<const salt::FoundPlaces>(
-          first, std::make_shared<const salt::PostingSet>());
-    }
-    suffixes += _found[t]->suffixes();
+    if (!_found[t]->empty()) term.found = true;
     _found[t]->forEachZone([&](uint16_t zone, const salt::DocSet& docs) {
       if (const uint32_t mask = zoneBits.of(zone); mask != 0) _parts[t].push_back({&docs, mask});
     });
   }
-  term.found = term.found || suffixes != 0;
 }
 
 void TermMatches::getPage(size_t page, std::vector<std::vector<PagePart>>* parts) const {

@@ -1,7 +1,5 @@
 #include "salt/ZoneTextCache.h"
 
-#include <fcntl.h>
-
 #include <algorithm>
 
 #include "platform/Files.h"
@@ -21,7 +19,7 @@ uint64_t idOf(uint32_t docID, uint16_t zoneID) {
 ZoneTextCache::ZoneTextCache(const index& owner, uint64_t maxFileBytes)
     : _idx(owner),
       _iterator(owner.db->NewIterator(readOptions(false))),
-      _file(open(owner.path().c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, S_IRUSR | S_IWUSR)) {
+      _file(platform::openUnnamedFile(owner.path())) {
   if (_file.get() >= 0) {
     _maxFileBytes = std::min(maxFileBytes, platform::freeBytes(owner.path()) / 4);
   }

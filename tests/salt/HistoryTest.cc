@@ -202,7 +202,9 @@ class Run {
   std::string comparedPlaces(const std::string& prefix, const std::vector<std::string>& suffixes) {
     for (int time = 0; time < 2; ++time) {
       const auto found = salttest::scanPlaces(*_index, prefix);
-      if (found == salttest::placesOf(suffixes)) continue;
+      const salttest::Places expected = salttest::placesOf(suffixes);
+      // Suffixes of deleted documents may be counted.
+      if (found->places == expected.places && found->suffixes >= expected.suffixes) continue;
       const std::vector<std::string> places(found->places.begin(), found->places.end());
       return fmt::format("{} places, ", found->suffixes) + compared(prefix, places, suffixes);
     }
