@@ -8,14 +8,6 @@
 
 namespace salt {
 
-namespace {
-
-uint64_t idOf(uint32_t docID, uint16_t zoneID) {
-  return uint64_t{docID} << 16 | zoneID;
-}
-
-}  // namespace
-
 ZoneTextCache::ZoneTextCache(const index& owner, uint64_t maxFileBytes)
     : _idx(owner),
       _iterator(owner.db->NewIterator(readOptions(false))),
@@ -26,15 +18,24 @@ ZoneTextCache::ZoneTextCache(const index& owner, uint64_t maxFileBytes)
 }
 
 std::string_view ZoneTextCache::find(const SuffixMeta& meta) {
-  const auto kept = _kept.find(idOf(meta.DocID, meta.ZoneID));
-  if (kept == _kept.end() || !readKept(kept->second, meta)) readStored(meta);
+  const Kept* const kept = find(meta.DocID, meta.ZoneID);
+  if (kept == nullptr || !readKept(*kept, meta)) readStored(meta);
   return _suffix;
 }
 
-bool ZoneTextCache::readKept(const Stretch& stretch, const SuffixMeta& meta) {
-  const uint32_t offset = std::min(meta.Offset, stretch.bytes);
-  _suffix.resize(std::min<size_t>(stretch.bytes - offset, _idx.op.MaxMatchLen));
-  if (!platform::readAt(_file.get(), stretch.begin + offset, _suffix.data(), _suffix.size())) {
+const ZoneTextCache::Kept* ZoneTextCache::find(uint32_t docID, uint16_t zoneID) const {
+  const uint32_t first = _firstOf.at(docID);
+  if (first == 0) return nullptr;
+  for (size_t at = first - 1;; ++at) {
+    if (_kept[at].zoneID == zoneID) return &_kept[at];
+    if (_kept[at].last) return nullptr;
+  }
+}
+
+bool ZoneTextCache::readKept(const Kept& kept, const SuffixMeta& meta) {
+  const uint32_t offset = std::min(meta.Offset, kept.bytes);
+  _suffix.resize(std::min<size_t>(kept.bytes - offset, _idx.op.MaxMatchLen));
+  if (!platform::readAt(_file.get(), kept.begin + offset, _suffix.data(), _suffix.size())) {
     forget();
     return false;
   }
@@ -48,40 +49,48 @@ void ZoneTextCache::readStored(const SuffixMeta& meta) {
   _iterator->Seek(slice(key.view()));
   if (!_iterator->Valid() || view(_iterator->key()) != key.view()) return;
   _suffix = _idx.suffixText(meta, view(_iterator->value()));
-  if (_file.get() < 0) return;
-  addRead(idOf(meta.DocID, meta.ZoneID));
-  for (_iterator->Next(); _iterator->Valid() && _read.size() < kReadAheadBytes; _iterator->Next()) {
-    uint32_t docID = 0;
+  if (_file.get() >= 0 && _firstOf.at(meta.DocID) == 0) readAhead(meta.DocID);
+}
+
+// Ends with a whole document.
+void ZoneTextCache::readAhead(uint32_t docID) {
+  uint64_t read = 0;
+  uint32_t inHand = 0;  // the document of the zones that were read last
+  for (_iterator->Seek(slice(index::textKey(docID, 0).view())); _iterator->Valid();
+       _iterator->Next()) {
     uint16_t zoneID = 0;
     if (!parseTextKey(view(_iterator->key()), &docID, &zoneID)) break;
-    const uint64_t id = idOf(docID, zoneID);
-    if (_kept.contains(id)) break;
-    addRead(id);
+    if (docID != inHand) {
+      if (read >= kReadAheadBytes || _firstOf.at(docID) != 0) break;
+      if (inHand != 0) _kept.back().last = true;
+      inHand = docID;
+      _firstOf[docID] = static_cast<uint32_t>(_kept.size() + 1);
+    }
+    const std::string_view text = view(_iterator->value());
+    _kept.push_back({static_cast<uint32_t>(_fileBytes + _read.size()),
+                     static_cast<uint32_t>(text.size()), zoneID, false});
+    _read += text;
+    read += text.size();
+    if (_read.size() >= kReadAheadBytes && !keepRead()) return;
   }
-  keepRead();
+  if (inHand != 0) _kept.back().last = true;
+  if (!keepRead() || _fileBytes <= _maxFileBytes) return;
+  _firstOf = {};
+  _kept.clear();
+  _fileBytes = 0;
 }
 
-void ZoneTextCache::addRead(uint64_t id) {
-  const leveldb::Slice text = _iterator->value();
-  _kept[id] = {_fileBytes + _read.size(), static_cast<uint32_t>(text.size())};
-  _read.append(text.data(), text.size());
-}
-
-void ZoneTextCache::keepRead() {
-  if (!platform::writeAt(_file.get(), _fileBytes, _read)) {
-    forget();
-  } else {
-    _fileBytes += _read.size();
-  }
+bool ZoneTextCache::keepRead() {
+  const bool written = platform::writeAt(_file.get(), _fileBytes, _read);
+  _fileBytes += _read.size();
   _read.clear();
-  if (_fileBytes > _maxFileBytes) {
-    _kept.clear();
-    _fileBytes = 0;
-  }
+  if (!written) forget();
+  return written;
 }
 
 // When the disk is full or fails, the texts in the file are not needed: the database has them.
 void ZoneTextCache::forget() {
+  _firstOf = {};
   _kept.clear();
   _file.reset();
 }

@@ -5,12 +5,13 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <deque>
 #include <memory>
 #include <string>
 #include <string_view>
-#include <unordered_map>
 
 #include "platform/FileDescriptor.h"
+#include "salt/DocPages.h"
 #include "salt/Index.h"
 
 namespace salt {
@@ -39,19 +40,25 @@ class ZoneTextCache {
   [[nodiscard]] bool good() const { return _iterator->status().ok(); }
 
  private:
-  struct Stretch {
-    uint64_t begin;  // offset in the file
+  // Where a text is in the file. The zones of a document follow one another.
+  struct Kept {
+    uint32_t begin;
     uint32_t bytes;
+    uint16_t zoneID;
+    bool last;  // of its document
   };
 
   static constexpr size_t kReadAheadBytes = 64 * 1024;
 
+  // Null when it is not in the file.
+  [[nodiscard]] const Kept* find(uint32_t docID, uint16_t zoneID) const;
   // False when the file cannot be read.
-  [[nodiscard]] bool readKept(const Stretch& stretch, const SuffixMeta& meta);
+  [[nodiscard]] bool readKept(const Kept& kept, const SuffixMeta& meta);
   void readStored(const SuffixMeta& meta);
-  // Adds the zone at the iterator to the texts that keepRead writes.
-  void addRead(uint64_t id);
-  void keepRead();
+  // Adds documents from `docID` on to the file.
+  void readAhead(uint32_t docID);
+  // Writes _read; false on failure.
+  bool keepRead();
   void forget();
 
   const index& _idx;
@@ -59,7 +66,8 @@ class ZoneTextCache {
   platform::FileDescriptor _file;
   uint64_t _maxFileBytes = 0;
   uint64_t _fileBytes = 0;
-  std::unordered_map<uint64_t, Stretch> _kept;
+  DocPages<uint32_t> _firstOf;  // the place in _kept of a document's first zone, from 1; or 0
+  std::deque<Kept> _kept;
   std::string _read;    // texts to be written at _fileBytes
   std::string _suffix;  // of the last call
 };

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <array>
 #include <random>
 
 #include "salt/Coding.h"
@@ -11,7 +12,7 @@
 
 namespace {
 
-// Some zones are longer than one read-ahead; every tenth document has none.
+// Some zones are longer than one read-ahead, some documents have two; every tenth has none.
 class ZoneTextCacheTest : public testing::Test {
  protected:
   ZoneTextCacheTest() {
@@ -22,7 +23,11 @@ class ZoneTextCacheTest : public testing::Test {
       if (words != 0) {
         EXPECT_TRUE(salttest::addZone(*_index, doc, 3, text));
       }
-      _texts.push_back(std::move(text));
+      const std::string second = doc % 3 == 0 ? "second zone of " + std::to_string(doc) : "";
+      if (!second.empty()) {
+        EXPECT_TRUE(salttest::addZone(*_index, doc, 12, second));
+      }
+      _texts.push_back({std::move(text), second});
     }
   }
 
@@ -30,8 +35,9 @@ class ZoneTextCacheTest : public testing::Test {
     for (int i = 0; i < 3000; ++i) {
       salt::SuffixMeta meta{};
       meta.DocID = 1 + static_cast<uint32_t>(_random() % kDocs);
-      meta.ZoneID = 3;
-      const std::string& text = _texts[meta.DocID - 1];
+      const bool second = _random() % 4 == 0;
+      meta.ZoneID = second ? 12 : 3;
+      const std::string& text = _texts[meta.DocID - 1][second];
       meta.Offset = static_cast<uint32_t>(_random() % (text.size() + 3));
       EXPECT_EQ(texts->find(meta), index().suffixText(meta, text));
     }
@@ -48,7 +54,7 @@ class ZoneTextCacheTest : public testing::Test {
   std::mt19937 _random{7};
   testsupport::TemporaryDirectory _directory;
   std::unique_ptr<salt::Index> _index = salttest::newIndex(_directory.path() + "/index");
-  std::vector<std::string> _texts;
+  std::vector<std::array<std::string, 2>> _texts;
 };
 
 TEST_F(ZoneTextCacheTest, GivesTheSameWithAFileOfAnyLength) {
