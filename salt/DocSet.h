@@ -52,6 +52,8 @@ class DocPage {
   }
   friend DocPage operator&(DocPage left, const DocPage& right) { return left &= right; }
 
+  bool operator==(const DocPage&) const = default;
+
   // Calls visit(number in the page) for each member, ascending.
   template <typename Visit>
   void forEach(const Visit& visit) const {

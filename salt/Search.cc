@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <array>
 #include <cstdint>
 #include <iterator>
 #include <optional>
@@ -37,12 +38,17 @@ class TopDocs {
   // The lowest score; must not be empty.
   [[nodiscard]] double lowest() const { return _heap.front().score; }
 
-  void add(const Standing& standing) {
+  // Whether no document with this score can be added.
+  [[nodiscard]] bool refuses(double score) const {
+    return full() && (_heap.empty() || score < lowest());
+  }
+
+  void add(uint32_t docID, double score) {
     DocResult doc;
-    doc.docID = standing.docID;
-    doc.score = standing.score;
+    doc.docID = docID;
+    doc.score = score;
     if (full()) {
-      if (_maxResults == 0 || !ranksAbove(doc, _heap.front())) return;
+      if (_heap.empty() || !ranksAbove(doc, _heap.front())) return;
       std::pop_heap(_heap.begin(), _heap.end(), ranksAbove);
       _heap.back() = doc;
     } else {
@@ -89,6 +95,12 @@ class Searching {
   }
 
  private:
+  // Documents of a page that the same tokens match in the same zones.
+  struct Group {
+    salt::DocPage docs;
+    std::array<uint32_t, kMaxTokensHeld> masks;  // by token, over all terms
+  };
+
   void evaluateTogether() {
     matchRequired();
     for (size_t u = 0; u < _terms.size(); ++u) {
@@ -108,33 +120,66 @@ class Searching {
     if (_options.maxResults == 0) return;
     std::optional<Contenders> contenders;
     if (!_required.empty()) contenders.emplace(_evaluation, _terms, _matches);
-    std::vector<Standing> docs;
     for (size_t page = pages(); page-- > 0;) {
       salt::DocPage candidates = candidatesOf(page);
       if (contenders && _top.full()) {
         if (!contenders->exceed(_top.lowest())) return;
         candidates = contenders->select(page, candidates);
       }
-      if (candidates.empty()) continue;
-      docs.clear();
-      addStandings(page, candidates, &docs);
-      for (size_t u = 0; u < _terms.size(); ++u) {
-        if (!_evaluation.skips(u)) applyPage(u, page, docs);
-      }
-      addToTop(docs);
+      if (!candidates.empty()) evaluatePage(page, candidates);
     }
   }
 
-  void applyPage(size_t u, size_t page, std::vector<Standing>& docs) {
-    _matches[u]->getPage(page, &_pageParts);
-    const auto maskOf = [&](size_t token, size_t i) {
-      uint32_t mask = 0;
-      for (const TermMatches::PagePart& part : _pageParts[token]) {
-        if (part.docs->contains(docs[i].docID % salt::DocPage::kDocs)) mask |= part.mask;
+  // Documents that the same tokens match in the same zones have the same score, which is computed
+  // once for all of them.
+  void evaluatePage(size_t page, const salt::DocPage& candidates) {
+    group(page, candidates);
+    std::vector<Standing> scores(_groups.size());
+    size_t first = 0;  // token of the term
+    for (size_t u = 0; u < _terms.size(); ++u) {
+      if (_evaluation.skips(u)) continue;
+      _evaluation.apply(
+          u, [&](size_t token, size_t i) { return _groups[i].masks[first + token]; }, scores);
+      first += _terms[u].tokens.size();
+    }
+    for (size_t i = 0; i < scores.size(); ++i) {
+      if (!_evaluation.accepts(scores[i]) || _top.refuses(scores[i].score)) continue;
+      _groups[i].docs.forEach([&](size_t doc) {
+        _top.add(static_cast<uint32_t>(page * salt::DocPage::kDocs + doc), scores[i].score);
+      });
+    }
+  }
+
+  // Divides the candidates into groups by what matches them where.
+  void group(size_t page, const salt::DocPage& candidates) {
+    _groups.assign(1, {candidates, {}});
+    size_t token = 0;
+    for (const auto& matches : _matches) {
+      if (!matches) continue;
+      for (const auto& parts : matches->parts()) {
+        for (const TermMatches::Part& part : parts) {
+          const salt::DocPage* const docs = part.docs->page(page);
+          if (docs != nullptr) divide(*docs, token, part.mask);
+        }
+        ++token;
       }
-      return mask;
-    };
-    _evaluation.apply(u, maskOf, docs);
+    }
+  }
+
+  // Notes that the token matches these documents in the zones of the mask.
+  void divide(const salt::DocPage& docs, size_t token, uint32_t mask) {
+    for (size_t i = 0, count = _groups.size(); i < count; ++i) {
+      const salt::DocPage matched = _groups[i].docs & docs;
+      if (matched.empty()) continue;
+      if (matched == _groups[i].docs) {
+        _groups[i].masks[token] |= mask;
+        continue;
+      }
+      _groups[i].docs.erase(matched);
+      _groups.push_back(_groups[i]);
+      _groups.back().docs = matched;
+      _groups.back().masks[token] |= mask;
+    }
   }
 
   void evaluateOneByOne() {
@@ -160,7 +205,9 @@ class Searching {
           u, [&](size_t token, size_t i) { return matches.mask(token, docs[i].docID); }, docs);
       _matches[u].reset();
     }
-    addToTop(docs);
+    for (const Standing& doc : docs) {
+      if (_evaluation.accepts(doc)) _top.add(doc.docID, doc.score);
+    }
   }
 
   // Matches required terms, as many as can be held.
@@ -262,12 +309,6 @@ class Searching {
     });
   }
 
-  void addToTop(const std::vector<Standing>& docs) {
-    for (const Standing& doc : docs) {
-      if (_evaluation.accepts(doc)) _top.add(doc);
-    }
-  }
-
   const salt::Index& _index;
   std::vector<Term>& _terms;
   const Options& _options;
@@ -277,7 +318,7 @@ class Searching {
   std::vector<std::optional<TermMatches>> _matches;  // of terms not yet evaluated
   std::vector<size_t> _required;                     // terms matched before the others
   std::optional<bool> _anyCandidate;                 // once known
-  std::vector<std::vector<TermMatches::PagePart>> _pageParts;
+  std::vector<Group> _groups;                        // of the page that is evaluated
 };
 
 }  // namespace

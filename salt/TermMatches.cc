@@ -52,18 +52,6 @@ TermMatches::TermMatches(const salt::Index& index, Term& term, Found found, size
   }
 }
 
-void TermMatches::getPage(size_t page, std::vector<std::vector<PagePart>>* parts) const {
-  parts->resize(_parts.size());
-  for (size_t t = 0; t < _parts.size(); ++t) {
-    (*parts)[t].clear();
-    for (const Part& part : _parts[t]) {
-      if (const salt::DocPage* const docs = part.docs->page(page); docs != nullptr) {
-        (*parts)[t].push_back({docs, part.mask});
-      }
-    }
-  }
-}
-
 size_t TermMatches::pages() const {
   size_t count = 0;
   for (const auto& parts : _parts) {

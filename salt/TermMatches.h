@@ -24,12 +24,6 @@ class TermMatches {
     const salt::DocSet* docs;
     uint32_t mask;  // of the zones of the term; see ZoneBits
   };
-  // The same for the documents of one page.
-  struct PagePart {
-    const salt::DocPage* docs;
-    uint32_t mask;
-  };
-
   // Takes what was found for a well-formed term and sets Term::found. Takes at most `maxSuffixes`
   // suffixes over all tokens.
   TermMatches(const salt::Index& index, Term& term, Found found, size_t maxSuffixes);
@@ -38,8 +32,6 @@ class TermMatches {
 
   // By token.
   [[nodiscard]] const std::vector<std::vector<Part>>& parts() const { return _parts; }
-  // Only the parts with a document on the page, by token.
-  void getPage(size_t page, std::vector<std::vector<PagePart>>* parts) const;
 
   // The zone mask (see ZoneBits) of a token's match in a document, 0 where it does not match.
   [[nodiscard]] uint32_t mask(size_t token, uint32_t docID) const {
