@@ -41,6 +41,11 @@ class PostingSet {
   [[nodiscard]] uint64_t suffixes() const { return _suffixes; }
   // In no order.
   [[nodiscard]] const std::vector<Zone>& zones() const { return _zones; }
+  // Null for a zone without documents.
+  [[nodiscard]] const DocSet* docsOf(uint16_t zoneID) const {
+    const size_t at = zoneID < _places.size() ? _places[zoneID] : 0;
+    return at != 0 ? &_zones[at - 1].docs : nullptr;
+  }
 
   // Whether there is no document.
   [[nodiscard]] bool empty() const;

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstring>
 #include <optional>
+#include <unordered_map>
 
 #include "platform/Files.h"
 #include "platform/Paths.h"
@@ -36,6 +37,8 @@ constexpr uint32_t kMaxTableBytes = uint32_t{1} << 28;
 constexpr uint64_t kMinBudget = 64 * 1024;
 // A suffix takes about eleven bytes of the index, so this limits posting lists to a twentieth.
 constexpr uint64_t kSuffixesPerByte = 2;
+// An heir has all of a node's suffixes but one in so many.
+constexpr uint64_t kSuffixesOverHeirs = 4;
 
 // Detects accidental damage, not forgery.
 uint64_t sumOf(std::string_view bytes, uint64_t seed = 0) {
@@ -159,10 +162,14 @@ bool Postings::readTable(const PostingsOwner& owner) {
     text.resize(std::min<size_t>(text.size(), shared));
     text += input.bytes(input.varint());
     const uint32_t above = input.varint();
+    const uint32_t heir = input.varint();
     const uint32_t bytes = input.varint();
-    if (text.size() > UINT8_MAX || above >= text.size() || bytes < kSumBytes) return false;
+    if (text.size() > UINT8_MAX || above >= text.size() || heir >= header.entries - i ||
+        bytes < kSumBytes) {
+      return false;
+    }
     _entries.push_back({static_cast<uint32_t>(_texts.size()), static_cast<uint8_t>(text.size()),
-                        static_cast<uint8_t>(above), static_cast<uint32_t>(offset), bytes});
+                        static_cast<uint8_t>(above), heir, static_cast<uint32_t>(offset), bytes});
     _texts += text;
     offset += bytes;
   }
@@ -180,25 +187,38 @@ const Postings::Entry* Postings::find(std::string_view prefix) const {
 }
 
 bool Postings::add(std::string_view prefix, PostingSet* places) const {
-  const Entry* const entry = find(prefix);
+  const Entry* entry = find(prefix);
   if (entry == nullptr) return false;
-  std::string bytes(entry->bytes, '\0');
-  uint32_t sum = 0;
-  if (platform::readAt(_file.get(), entry->offset, bytes.data(), bytes.size())) {
-    std::memcpy(&sum, bytes.data(), sizeof sum);
+  uint32_t suffixes = 0;
+  bool good = addEntry(*entry, &suffixes, places);
+  while (good && entry->heir != 0) {
+    entry += entry->heir;
+    uint32_t among = 0;  // `suffixes` counts them
+    good = addEntry(*entry, &among, places);
   }
+  if (good) {
+    places->addSuffixes(suffixes);
+  } else {
+    Log.error("Postings cannot be read");
+  }
+  return good;
+}
+
+bool Postings::addEntry(const Entry& entry, uint32_t* suffixes, PostingSet* places) const {
+  std::string bytes(entry.bytes, '\0');
+  if (!platform::readAt(_file.get(), entry.offset, bytes.data(), bytes.size())) return false;
+  uint32_t sum = 0;
+  std::memcpy(&sum, bytes.data(), sizeof sum);
   const std::string_view list = std::string_view(bytes).substr(kSumBytes);
-  if (sum == static_cast<uint32_t>(sumOf(list)) && addList(list, places)) return true;
-  Log.error("Postings cannot be read");
-  return false;
+  return sum == static_cast<uint32_t>(sumOf(list)) && addList(list, suffixes, places);
 }
 
 // A list has the number of suffixes and that of zones; for each zone its number in the file and its
 // number of runs of documents; then for each run, as gamma codes, the number of documents before
 // it, from the end of the one before, and its own.
-bool Postings::addList(std::string_view list, PostingSet* places) const {
+bool Postings::addList(std::string_view list, uint32_t* suffixes, PostingSet* places) const {
   Input input(list);
-  const uint32_t suffixes = input.varint();
+  *suffixes = input.varint();
   std::vector<std::pair<uint32_t, uint32_t>> zones(std::min<size_t>(input.varint(), _zones.size()));
   for (auto& [number, runs] : zones) {
     number = input.varint();
@@ -218,7 +238,6 @@ bool Postings::addList(std::string_view list, PostingSet* places) const {
       docs.insert(static_cast<uint32_t>(first), count);
     }
   }
-  places->addSuffixes(suffixes);
   return true;
 }
 
@@ -258,15 +277,41 @@ void PostingsBuilder::fold() {
 
 void PostingsBuilder::make(Node* node, std::string text, size_t above) {
   count(_pending.size(), node);
-  const std::string list = listOf(*node->places);
+  const uint64_t suffixes = node->places->suffixes();
+  const bool inheriting = inherits(*node);
+  const std::string list = listOf(*node->places, inheriting ? node->heir.places.get() : nullptr);
+  if (inheriting) raise(node->heir.offset, suffixes);
   _madeBytes += list.size() + text.size();
   _made.push_back({std::move(text), static_cast<uint8_t>(above), static_cast<uint32_t>(list.size()),
-                   _listsEnd, node->places->suffixes()});
+                   _listsEnd, inheriting ? node->heir.offset : kNone, suffixes});
+  node->heir = {_listsEnd, std::make_unique<PostingSet>(*node->places)};
   keep(list);
   if (_madeBytes > 2 * budget()) prune(budget());
 }
 
-std::string PostingsBuilder::listOf(const PostingSet& places) {
+void PostingsBuilder::bequeath(Node& child, Node* parent) {
+  const Heir& now = parent->heir;
+  if (now.places == nullptr || now.places->suffixes() < child.heir.places->suffixes()) {
+    parent->heir = std::move(child.heir);
+  }
+}
+
+bool PostingsBuilder::inherits(const Node& node) const {
+  const PostingSet* const heir = node.heir.places.get();
+  return heir != nullptr && heir->suffixes() >= _minSuffixes &&
+         heir->suffixes() >=
+             node.places->suffixes() / kSuffixesOverHeirs * (kSuffixesOverHeirs - 1);
+}
+
+void PostingsBuilder::raise(uint64_t offset, uint64_t suffixes) {
+  for (auto made = _made.rbegin(); made != _made.rend() && offset != kNone; ++made) {
+    if (made->offset != offset) continue;
+    made->suffixes = suffixes;
+    offset = made->heir;
+  }
+}
+
+std::string PostingsBuilder::listOf(const PostingSet& places, const PostingSet* heir) {
   if (places.suffixes() > UINT32_MAX) _unfit = true;
   std::string list(kSumBytes, '\0');
   appendVarint(&list, static_cast<uint32_t>(places.suffixes()));
@@ -274,9 +319,12 @@ std::string PostingsBuilder::listOf(const PostingSet& places) {
   std::string codes;
   BitWriter bits(&codes);
   for (const PostingSet::Zone& zone : places.zones()) {
+    DocSet docs = zone.docs;
+    const DocSet* const among = heir != nullptr ? heir->docsOf(zone.ZoneID) : nullptr;
+    if (among != nullptr) docs.erase(*among);
     uint32_t runs = 0;
     uint32_t end = 0;  // of the run before
-    zone.docs.forEachRun([&](uint32_t first, uint32_t count) {
+    docs.forEachRun([&](uint32_t first, uint32_t count) {
       if (first - end > kMaxGamma || count > kMaxGamma) {
         _unfit = true;
         return;
@@ -354,9 +402,12 @@ std::string PostingsBuilder::head(const PostingsOwner& owner) const {
   std::string table;
   appendVarint(&table, static_cast<uint32_t>(_zones.size()));
   for (const uint16_t zone : _zones) appendVarint(&table, zone);
+  std::unordered_map<uint64_t, size_t> places;  // of entries, by offset
+  for (size_t i = 0; i < _made.size(); ++i) places[_made[i].offset] = i;
   std::string_view before;
   uint64_t lists = 0;
-  for (const Made& made : _made) {
+  for (size_t i = 0; i < _made.size(); ++i) {
+    const Made& made = _made[i];
     const auto shared = static_cast<size_t>(
         std::mismatch(before.begin(), before.end(), made.text.begin(), made.text.end()).first -
         before.begin());
@@ -364,6 +415,8 @@ std::string PostingsBuilder::head(const PostingsOwner& owner) const {
     appendVarint(&table, static_cast<uint32_t>(made.text.size() - shared));
     table.append(made.text, shared);
     appendVarint(&table, made.above);
+    TL_ASSERT(made.heir == kNone || places.contains(made.heir));
+    appendVarint(&table, made.heir == kNone ? 0 : static_cast<uint32_t>(places[made.heir] - i));
     appendVarint(&table, made.bytes);
     lists += made.bytes;
     before = made.text;

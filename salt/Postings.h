@@ -18,7 +18,9 @@
 // scan reads the pages.
 //
 // Sorted suffixes form a tree of shared prefixes. An entry is a node of this tree: all prefixes of
-// its text that are longer than the text of the parent node have the same suffixes.
+// its text that are longer than the text of the parent node have the same suffixes. Where one child
+// has most of the suffixes of a node, as in words that nearly always follow one another, the list
+// of the node has only the documents that the child's list has not.
 namespace salt {
 
 // Identifies the shard that a posting list file belongs to; a file of any other is not read.
@@ -54,6 +56,7 @@ class Postings {
     uint32_t text;    // offset in _texts
     uint8_t length;   // of the text
     uint8_t above;    // text length of the parent node
+    uint32_t heir;    // the distance to the entry of the child whose documents belong to it; or 0
     uint32_t offset;  // of the list in the file
     uint32_t bytes;   // of the list
   };
@@ -65,8 +68,9 @@ class Postings {
   [[nodiscard]] std::string_view textOf(const Entry& entry) const {
     return std::string_view(_texts).substr(entry.text, entry.length);
   }
-  // False when the list is invalid.
-  [[nodiscard]] bool addList(std::string_view list, PostingSet* places) const;
+  // False when the list is invalid or cannot be read.
+  [[nodiscard]] bool addEntry(const Entry& entry, uint32_t* suffixes, PostingSet* places) const;
+  [[nodiscard]] bool addList(std::string_view list, uint32_t* suffixes, PostingSet* places) const;
   // Null when the prefix has no entry.
   [[nodiscard]] const Entry* find(std::string_view prefix) const;
 
@@ -116,17 +120,26 @@ class PostingsBuilder {
  private:
   static constexpr uint64_t kMinSuffixes = 2;
 
+  static constexpr uint64_t kNone = UINT64_MAX;
+
+  // The largest child of a node that has an entry.
+  struct Heir {
+    uint64_t offset = kNone;  // of its list
+    std::unique_ptr<PostingSet> places;
+  };
   struct Node {
     size_t depth = 0;                    // length of the text shared by its suffixes
     size_t begin = 0;                    // index in _pending of its first suffix not in `places`
     std::unique_ptr<PostingSet> places;  // of the suffixes before
+    Heir heir;
   };
   struct Made {
     std::string text;
     uint8_t above;
-    uint32_t bytes;  // of the list, at `offset` of _lists
-    uint64_t offset;
-    uint64_t suffixes;
+    uint32_t bytes;   // of the list, at `offset` of _lists
+    uint64_t offset;  // identifies the entry
+    uint64_t heir;    // the offset of the list of its heir, whose documents belong to it; or kNone
+    uint64_t suffixes;  // its own or, if it is an heir whose documents another uses, of that one
   };
 
   // Ends the nodes whose texts are longer than `lcp`, and opens one of that length if there is
@@ -142,6 +155,7 @@ class PostingsBuilder {
       if (suffixesOf(next) < _minSuffixes) continue;
       const size_t above = std::max(lcp, _open.empty() ? 0 : _open.back().depth);
       make(&next, std::string(textBefore(next.depth)), above);
+      if (!_open.empty() && _open.back().depth >= lcp) bequeath(next, &_open.back());
     }
     if (lcp == 0 || (!_open.empty() && _open.back().depth == lcp)) return;
     next.depth = lcp;
@@ -151,8 +165,16 @@ class PostingsBuilder {
   [[nodiscard]] uint64_t suffixesOf(const Node& node) const {
     return (node.places ? node.places->suffixes() : 0) + _pending.size() - node.begin;
   }
+  // Makes the entry of a node, which becomes its own heir: the node may go on as its parent.
   void make(Node* node, std::string text, size_t above);
-  [[nodiscard]] std::string listOf(const PostingSet& places);
+  // Makes the heir of `child` that of its parent if it is larger.
+  static void bequeath(Node& child, Node* parent);
+  // Whether the node's list is to have only documents that its heir has not.
+  [[nodiscard]] bool inherits(const Node& node) const;
+  // An entry whose documents another one uses lives as long as that.
+  void raise(uint64_t offset, uint64_t suffixes);
+  // Without the documents of `heir` unless that is null.
+  [[nodiscard]] std::string listOf(const PostingSet& places, const PostingSet* heir);
   // Adds the node's suffixes in _pending before `end` to its places.
   void count(size_t end, Node* node);
   // Adds the pending suffixes to the places of the large open nodes, and drops those that no other

@@ -75,10 +75,11 @@ class PostingsTest : public testing::Test {
           << prefix;
     }
   }
-  // How many pages scans for the most frequent prefixes read.
-  [[nodiscard]] uint64_t pageReads() const {
+  // How many pages scans read, for the most frequent prefixes unless others are given.
+  [[nodiscard]] uint64_t pageReads(const std::vector<std::string>& scanned = {"a", "aa", "b",
+                                                                              "ab"}) const {
     const uint64_t before = index->GetMetrics().ScanPageReads;
-    for (const char* prefix : {"a", "aa", "b", "ab"}) {
+    for (const std::string& prefix : scanned) {
       EXPECT_TRUE(salttest::scanPlaces(*index, prefix));
     }
     return index->GetMetrics().ScanPageReads - before;
@@ -148,6 +149,33 @@ TEST_F(PostingsTest, InvalidFilesAreIgnoredAndRebuilt) {
   ASSERT_TRUE(index->Compact());
   EXPECT_EQ(platform::readFile(file, 1 << 20, nullptr), good);
   EXPECT_EQ(pageReads(), byPostings);
+  expectSame();
+}
+
+// Words that nearly always follow one another share their documents.
+TEST_F(PostingsTest, OnlyTheMostFrequentPrefixesHaveAListWhereSpaceDoesNotSuffice) {
+  options.MaxHotSuffixes = 100000;
+  index.reset();
+  fs::remove_all(path);
+  index = salttest::newIndex(path, options);
+  addDocs(300);
+  for (int i = 0; i < 60000; ++i) {
+    const auto number = random() % 16 * (random() % 16);  // some words are frequent
+    const std::string word{static_cast<char>('p' + number / 16),
+                           static_cast<char>('a' + number % 16)};
+    const std::string text = word + (i % 9 == 0 ? " other" : " same words end") + " here ";
+    const auto offsets = salttest::wordOffsets(text);
+    ASSERT_TRUE(
+        salttest::addZone(*index, ++lastDoc, static_cast<uint16_t>(1 + i % 3), text, offsets));
+    if (i < 9) prefixes.insert({text.substr(0, 1), text, text.substr(word.size() + 1)});
+  }
+  for (const char* prefix : {"s", "same", "same words e", "words", "words end h", "h", "e"})
+    prefixes.insert(prefix);
+  merge();
+  ASSERT_EQ(files().size(), 1u);
+  EXPECT_LT(fs::file_size(files().front()), 200000u);
+  EXPECT_EQ(pageReads({"s", "same", "words", "end h"}), 0u);
+  EXPECT_GT(pageReads({"aa"}), 0u);
   expectSame();
 }
 
