@@ -7,10 +7,12 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 
 #include "platform/FileDescriptor.h"
+#include "platform/Paths.h"
 
 namespace platform {
 
@@ -158,7 +160,13 @@ bool writeFileAtomically(const std::string& path, const std::function<bool(int f
 }
 
 FileDescriptor openUnnamedFile(const std::string& directory) {
-  return FileDescriptor(open(directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, S_IRUSR | S_IWUSR));
+  FileDescriptor file(open(directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
+  if (file.get() >= 0 || (errno != EOPNOTSUPP && errno != EISDIR)) return file;
+  // The file system has only files with names.
+  std::string path = joinPath(directory, "unnamed-XXXXXX");
+  file = FileDescriptor(mkostemp(path.data(), O_CLOEXEC));
+  if (file.get() >= 0) unlink(path.c_str());
+  return file;
 }
 
 uint64_t freeBytes(const std::string& path) {

@@ -38,8 +38,8 @@ bool removeItem(const std::string& path, TLErrorOut error);
 [[nodiscard]] bool readAt(int file, uint64_t offset, char* bytes, size_t count);
 [[nodiscard]] bool writeAt(int file, uint64_t offset, std::string_view bytes);
 
-// A file without a name in the directory, which is gone once it is closed, also by a crash; invalid
-// with errno set on failure.
+// A new file without a name on the file system of the directory, which is gone once it is closed,
+// also by a crash. Invalid, with errno set, on failure.
 [[nodiscard]] FileDescriptor openUnnamedFile(const std::string& directory);
 
 // Writes a temporary file beside the target, syncs it and renames it over the target.

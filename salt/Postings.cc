@@ -153,8 +153,9 @@ bool Postings::readTable(const PostingsOwner& owner) {
 
   Input input(table);
   const uint32_t zones = input.varint();
-  for (uint32_t i = 0; i < zones && input.good; ++i)
+  for (uint32_t i = 0; i < zones && input.good; ++i) {
     _zones.push_back(static_cast<uint16_t>(input.varint()));
+  }
   uint64_t offset = sizeof header + table.size();
   std::string text;
   for (uint32_t i = 0; i < header.entries && input.good; ++i) {

@@ -12,10 +12,9 @@
 #include "platform/FileDescriptor.h"
 #include "salt/PostingSet.h"
 
-// Posting lists for the prefixes that many suffixes of a shard begin with: the documents, with
-// their zones and number of suffixes. A scan for such a prefix reads the list instead of the pages.
-// Posting lists are derived from the pages and optional: when a list is absent or unreadable, the
-// scan reads the pages.
+// Posting lists for the prefixes that many suffixes of a shard begin with: the documents of each
+// zone. A scan for such a prefix reads the list instead of the pages. Posting lists are derived
+// from the pages and optional: when a list is absent or unreadable, the scan reads the pages.
 //
 // Sorted suffixes form a tree of shared prefixes. An entry is a node of this tree: all prefixes of
 // its text that are longer than the text of the parent node have the same suffixes. Where one child
@@ -119,7 +118,6 @@ class PostingsBuilder {
 
  private:
   static constexpr uint64_t kMinSuffixes = 2;
-
   static constexpr uint64_t kNone = UINT64_MAX;
 
   // The largest child of a node that has an entry.

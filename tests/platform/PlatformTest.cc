@@ -223,6 +223,18 @@ TEST(Files, FailuresNameThePath) {
   EXPECT_EQ(platform::listDirectory(temporary.path(), nullptr)->size(), 0u);
 }
 
+TEST(Files, AnUnnamedFileLeavesNothingBehind) {
+  const testsupport::TemporaryDirectory directory;
+  const platform::FileDescriptor file = platform::openUnnamedFile(directory.path());
+  ASSERT_GE(file.get(), 0);
+  ASSERT_TRUE(platform::writeAt(file.get(), 3, "text"));
+  std::string read(4, '\0');
+  EXPECT_TRUE(platform::readAt(file.get(), 3, read.data(), read.size()));
+  EXPECT_EQ(read, "text");
+  EXPECT_EQ(platform::listDirectory(directory.path(), nullptr), std::vector<std::string>());
+  EXPECT_LT(platform::openUnnamedFile(directory / "missing").get(), 0);
+}
+
 TEST(TextFile, DetectsTheEncoding) {
   using namespace std::string_literals;
   const TLString text = u"na\u00efve,gr\u00fcn\n";
