@@ -12,6 +12,10 @@ void PostingSet::add(PostingSet&& other) {
     return;
   }
   _suffixes += other._suffixes;
+  insert(other);
+}
+
+void PostingSet::insert(const PostingSet& other) {
   for (const Zone& zone : other._zones) docsOf(zone.ZoneID).insert(zone.docs);
 }
 

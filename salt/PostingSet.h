@@ -27,7 +27,9 @@ class PostingSet {
 
   // The two sets must not count the same suffix.
   void add(PostingSet&& other);
-  // Their suffixes remain counted.
+  // Adds documents whose suffixes are counted by addSuffixes, or removes some whose suffixes remain
+  // counted.
+  void insert(const PostingSet& other);
   void erase(const DocSet& docs);
 
   // The documents of a zone, to which more may be added; valid until the next zone is asked for.

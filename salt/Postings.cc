@@ -276,7 +276,8 @@ void PostingsBuilder::fold() {
   _pending.erase(_pending.begin(), _pending.begin() + static_cast<ptrdiff_t>(end));
 }
 
-void PostingsBuilder::make(Node* node, std::string text, size_t above) {
+void PostingsBuilder::make(Node* node, std::string text, size_t above, Node* parent) {
+  const size_t begin = node->begin;
   count(_pending.size(), node);
   const uint64_t suffixes = node->places->suffixes();
   const bool inheriting = inherits(*node);
@@ -285,16 +286,20 @@ void PostingsBuilder::make(Node* node, std::string text, size_t above) {
   _madeBytes += list.size() + text.size();
   _made.push_back({std::move(text), static_cast<uint8_t>(above), static_cast<uint32_t>(list.size()),
                    _listsEnd, inheriting ? node->heir.offset : kNone, suffixes});
-  node->heir = {_listsEnd, std::make_unique<PostingSet>(*node->places)};
+  if (parent == nullptr) {
+    node->heir = {_listsEnd, std::make_unique<PostingSet>(*node->places)};
+  } else {
+    count(begin, parent);
+    parent->places->insert(*node->places);
+    parent->places->addSuffixes(node->begin - begin);
+    parent->begin = node->begin;
+    const PostingSet* const heir = parent->heir.places.get();
+    if (heir == nullptr || heir->suffixes() < suffixes) {
+      parent->heir = {_listsEnd, std::move(node->places)};
+    }
+  }
   keep(list);
   if (_madeBytes > 2 * budget()) prune(budget());
-}
-
-void PostingsBuilder::bequeath(Node& child, Node* parent) {
-  const Heir& now = parent->heir;
-  if (now.places == nullptr || now.places->suffixes() < child.heir.places->suffixes()) {
-    parent->heir = std::move(child.heir);
-  }
 }
 
 bool PostingsBuilder::inherits(const Node& node) const {

@@ -151,9 +151,9 @@ class PostingsBuilder {
       next = std::move(_open.back());
       _open.pop_back();
       if (suffixesOf(next) < _minSuffixes) continue;
-      const size_t above = std::max(lcp, _open.empty() ? 0 : _open.back().depth);
-      make(&next, std::string(textBefore(next.depth)), above);
-      if (!_open.empty() && _open.back().depth >= lcp) bequeath(next, &_open.back());
+      Node* const parent = !_open.empty() && _open.back().depth >= lcp ? &_open.back() : nullptr;
+      const size_t above = parent != nullptr ? parent->depth : lcp;
+      make(&next, std::string(textBefore(next.depth)), above, parent);
     }
     if (lcp == 0 || (!_open.empty() && _open.back().depth == lcp)) return;
     next.depth = lcp;
@@ -163,10 +163,9 @@ class PostingsBuilder {
   [[nodiscard]] uint64_t suffixesOf(const Node& node) const {
     return (node.places ? node.places->suffixes() : 0) + _pending.size() - node.begin;
   }
-  // Makes the entry of a node, which becomes its own heir: the node may go on as its parent.
-  void make(Node* node, std::string text, size_t above);
-  // Makes the heir of `child` that of its parent if it is larger.
-  static void bequeath(Node& child, Node* parent);
+  // Makes the entry of a node, and adds its suffixes to its parent; without one, the node goes on
+  // as its own parent.
+  void make(Node* node, std::string text, size_t above, Node* parent);
   // Whether the node's list is to have only documents that its heir has not.
   [[nodiscard]] bool inherits(const Node& node) const;
   // An entry whose documents another one uses lives as long as that.
