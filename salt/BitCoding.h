@@ -15,16 +15,18 @@ namespace salt {
 // The largest number that has a code here.
 inline constexpr uint32_t kMaxGamma = (uint32_t{1} << 28) - 1;
 
+// The bits of the code of a number.
+[[nodiscard]] constexpr unsigned gammaBits(uint32_t value) {
+  return 2 * static_cast<unsigned>(std::bit_width(value)) - 1;
+}
+
 // Appends codes to a string. One thread.
 class BitWriter {
  public:
   explicit BitWriter(std::string* out) : _out(*out) {}
 
   // `value` is from 1 to kMaxGamma.
-  void putGamma(uint32_t value) {
-    const auto zeros = static_cast<unsigned>(std::bit_width(value)) - 1;
-    put(value, 2 * zeros + 1);
-  }
+  void putGamma(uint32_t value) { put(value, gammaBits(value)); }
 
   // Fills the last byte with zeros; nothing can be put afterwards.
   void finish() {

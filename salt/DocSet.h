@@ -90,10 +90,15 @@ class DocSet {
       count -= taken;
     }
   }
+  void insert(size_t page, const DocPage& docs) { writable(page) |= docs; }
   void insert(const DocSet& other) {
     for (size_t page = 0; page < other.pages(); ++page) {
       if (const DocPage* const bits = other.page(page); bits != nullptr) writable(page) |= *bits;
     }
+  }
+  // Removes the documents of a page.
+  void erasePage(size_t page) {
+    if (page < _pages.size() && _pages[page] != kNone) _bits[_pages[page]] = {};
   }
   void erase(const DocSet& other) {
     for (size_t page = 0; page < std::min(pages(), other.pages()); ++page) {
@@ -130,22 +135,6 @@ class DocSet {
     }
   }
 
-  // Calls visit(first, count) for each run of consecutive members, ascending.
-  template <typename Visit>
-  void forEachRun(const Visit& visit) const {
-    uint32_t first = 0;
-    uint32_t count = 0;
-    forEach([&](uint32_t docID) {
-      if (count > 0 && docID != first + count) {
-        visit(first, count);
-        count = 0;
-      }
-      if (count == 0) first = docID;
-      ++count;
-    });
-    if (count > 0) visit(first, count);
-  }
-
   [[nodiscard]] size_t bytes() const {
     return _pages.capacity() * sizeof(_pages[0]) + _bits.capacity() * sizeof(_bits[0]);
   }
@@ -165,5 +154,21 @@ class DocSet {
   std::vector<uint32_t> _pages;  // numbers of pages in _bits; kNone for one that never had a member
   std::vector<DocPage> _bits;
 };
+
+// Calls visit(first, count) for each run of consecutive members of a DocPage or DocSet, ascending.
+template <typename Set, typename Visit>
+void forEachRun(const Set& set, const Visit& visit) {
+  uint32_t first = 0;
+  uint32_t count = 0;
+  set.forEach([&](size_t doc) {
+    if (count > 0 && doc != first + count) {
+      visit(first, count);
+      count = 0;
+    }
+    if (count == 0) first = static_cast<uint32_t>(doc);
+    ++count;
+  });
+  if (count > 0) visit(first, count);
+}
 
 }  // namespace salt

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstring>
 #include <optional>
+#include <type_traits>
 #include <unordered_map>
 
 #include "platform/Files.h"
@@ -31,6 +32,7 @@ struct Header {
   uint64_t sum = 0;  // of the header with 0 in this field, and the table
 };
 static_assert(sizeof(Header) == 48);
+static_assert(sizeof(DocPage) == DocPage::kDocs / 8 && std::is_trivially_copyable_v<DocPage>);
 
 constexpr size_t kSumBytes = 4;  // before each list
 constexpr uint32_t kMaxTableBytes = uint32_t{1} << 28;
@@ -92,6 +94,32 @@ class Input {
  private:
   std::string_view _bytes;
 };
+
+// Whether the codes of the documents of a page would take nearly as much as its bits do, which are
+// read much faster.
+bool isDense(const DocPage& docs) {
+  constexpr unsigned kMinBits = DocPage::kDocs * 3 / 4;
+  unsigned bits = 0;
+  uint32_t end = 0;  // of the run before
+  forEachRun(docs, [&](uint32_t first, uint32_t count) {
+    bits += gammaBits(first - end + 1) + gammaBits(count);
+    end = first + count;
+  });
+  return bits >= kMinBits;
+}
+
+// Removes the dense pages and appends their bits; returns their numbers.
+std::vector<uint32_t> takeDensePages(DocSet* docs, std::string* bits) {
+  std::vector<uint32_t> taken;
+  for (size_t page = 0; page < docs->pages(); ++page) {
+    const DocPage* const those = docs->page(page);
+    if (those == nullptr || !isDense(*those)) continue;
+    bits->append(reinterpret_cast<const char*>(those), sizeof *those);
+    docs->erasePage(page);
+    taken.push_back(static_cast<uint32_t>(page));
+  }
+  return taken;
+}
 
 bool syncDirectory(const std::string& directory) {
   const platform::FileDescriptor file(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
@@ -214,29 +242,44 @@ bool Postings::addEntry(const Entry& entry, uint32_t* suffixes, PostingSet* plac
   return sum == static_cast<uint32_t>(sumOf(list)) && addList(list, suffixes, places);
 }
 
-// A list has the number of suffixes and that of zones; for each zone its number in the file and its
-// number of runs of documents; then for each run, as gamma codes, the number of documents before
-// it, from the end of the one before, and its own.
+// A list has the number of suffixes and that of zones; for each zone its number in the file and how
+// many runs of documents and dense pages it has; then gamma codes, for each zone those of its runs
+// and then those of its dense pages; then the bits of all dense pages.
 bool Postings::addList(std::string_view list, uint32_t* suffixes, PostingSet* places) const {
+  struct Zone {
+    uint32_t number = 0;
+    uint32_t runs = 0;
+    uint32_t pages = 0;
+  };
   Input input(list);
   *suffixes = input.varint();
-  std::vector<std::pair<uint32_t, uint32_t>> zones(std::min<size_t>(input.varint(), _zones.size()));
-  for (auto& [number, runs] : zones) {
-    number = input.varint();
-    runs = input.varint();
-    if (number >= _zones.size()) return false;
+  std::vector<Zone> zones(std::min<size_t>(input.varint(), _zones.size()));
+  uint64_t pages = 0;
+  for (auto& zone : zones) {
+    zone = {input.varint(), input.varint(), input.varint()};
+    if (zone.number >= _zones.size()) return false;
+    pages += zone.pages;
   }
-  if (!input.good) return false;
-  BitReader bits(input.rest());
-  for (const auto& [number, runs] : zones) {
-    DocSet& docs = places->docsOf(_zones[number]);
+  const size_t rest = input.rest().size();
+  if (!input.good || pages > rest / sizeof(DocPage)) return false;
+  BitReader codes(input.bytes(rest - pages * sizeof(DocPage)));
+  for (const Zone& zone : zones) {
+    DocSet& docs = places->docsOf(_zones[zone.number]);
     uint64_t end = 0;  // of the run before
-    for (uint32_t i = 0; i < runs; ++i) {
-      const auto [gap, count] = bits.twoGammas();
+    for (uint32_t i = 0; i < zone.runs; ++i) {
+      const auto [gap, count] = codes.twoGammas();
       const uint64_t first = end + gap;
       end = first + count;
-      if (!bits.good || end > UINT32_MAX) return false;
+      if (!codes.good || end > UINT32_MAX) return false;
       docs.insert(static_cast<uint32_t>(first), count);
+    }
+    uint64_t next = 0;  // after the page before
+    for (uint32_t i = 0; i < zone.pages; ++i) {
+      next += codes.gamma();
+      if (!codes.good || next > UINT32_MAX / DocPage::kDocs) return false;
+      DocPage bits;
+      std::memcpy(&bits, input.bytes(sizeof bits).data(), sizeof bits);
+      docs.insert(static_cast<size_t>(next - 1), bits);
     }
   }
   return true;
@@ -323,28 +366,37 @@ std::string PostingsBuilder::listOf(const PostingSet& places, const PostingSet* 
   appendVarint(&list, static_cast<uint32_t>(places.suffixes()));
   appendVarint(&list, static_cast<uint32_t>(places.zones().size()));
   std::string codes;
+  std::string dense;
   BitWriter bits(&codes);
+  const auto put = [&](uint32_t number) {
+    if (number > kMaxGamma) _unfit = true;
+    if (!_unfit) bits.putGamma(number);
+  };
   for (const PostingSet::Zone& zone : places.zones()) {
     DocSet docs = zone.docs;
     const DocSet* const among = heir != nullptr ? heir->docsOf(zone.ZoneID) : nullptr;
     if (among != nullptr) docs.erase(*among);
+    const std::vector<uint32_t> pages = takeDensePages(&docs, &dense);
     uint32_t runs = 0;
     uint32_t end = 0;  // of the run before
-    docs.forEachRun([&](uint32_t first, uint32_t count) {
-      if (first - end > kMaxGamma || count > kMaxGamma) {
-        _unfit = true;
-        return;
-      }
-      bits.putGamma(first - end);
-      bits.putGamma(count);
+    forEachRun(docs, [&](uint32_t first, uint32_t count) {
+      put(first - end);
+      put(count);
       end = first + count;
       ++runs;
     });
+    uint32_t next = 0;  // after the page before
+    for (const uint32_t page : pages) {
+      put(page + 1 - next);
+      next = page + 1;
+    }
     appendVarint(&list, numberOf(zone.ZoneID));
     appendVarint(&list, runs);
+    appendVarint(&list, static_cast<uint32_t>(pages.size()));
   }
   bits.finish();
   list += codes;
+  list += dense;
   const auto sum = static_cast<uint32_t>(sumOf(std::string_view(list).substr(kSumBytes)));
   std::memcpy(list.data(), &sum, sizeof sum);
   return list;
