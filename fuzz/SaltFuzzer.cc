@@ -1,5 +1,5 @@
 #include <algorithm>
-#include <array>
+#include <bit>
 #include <filesystem>
 #include <memory>
 #include <string>
@@ -101,14 +101,22 @@ void walkPage(const salt::index& idx, const std::vector<Entry>& entries) {
   }
 }
 
-// Numbers two at a time are the numbers one by one, as far as there are any.
+// Codes are what they are when read bit by bit, as far as there are any.
 void readCodes(std::string_view bytes) {
-  salt::BitReader together(bytes);
-  salt::BitReader single(bytes);
-  while (together.good) {
-    const auto numbers = together.twoGammas();
-    const std::array<uint32_t, 2> expected{single.gamma(), single.gamma()};
-    TL_ASSERT(together.good == single.good && numbers == expected);
+  const size_t end = bytes.size() * 8;
+  const auto bitAt = [&](size_t at) {
+    return static_cast<uint32_t>(static_cast<uint8_t>(bytes[at / 8]) >> (7 - at % 8) & 1);
+  };
+  salt::BitReader reader(bytes);
+  for (size_t at = 0;;) {
+    size_t zeros = 0;
+    while (at + zeros < end && bitAt(at + zeros) == 0) ++zeros;
+    const bool valid = at + 2 * zeros < end && zeros < std::bit_width(salt::kMaxGamma);
+    uint32_t expected = 0;
+    for (size_t i = 0; valid && i <= zeros; ++i) expected = expected << 1 | bitAt(at + zeros + i);
+    TL_ASSERT(reader.gamma() == expected && reader.good == valid);
+    if (!valid) return;
+    at += 2 * zeros + 1;
   }
 }
 

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <array>
 #include <bit>
 #include <cstddef>
 #include <cstdint>
@@ -48,56 +47,10 @@ class BitWriter {
   unsigned _used = 0;  // less than 8 between calls
 };
 
-// Two numbers by the bits that they begin with. Most numbers are small, so that a look into a table
-// of 6 KB replaces twice counting zeros.
-class GammaTable {
- public:
-  static constexpr unsigned kBits = 11;
-
-  struct Entry {
-    uint8_t length = 0;  // of both codes; 0 when they do not fit into kBits
-    std::array<uint8_t, 2> values{};
-  };
-
-  constexpr GammaTable() {
-    for (uint32_t bits = 0; bits < _entries.size(); ++bits) _entries[bits] = decode(bits);
-  }
-
-  [[nodiscard]] constexpr const Entry& at(uint64_t bits) const { return _entries[bits]; }
-
- private:
-  static constexpr Entry decode(uint32_t bits) {
-    Entry entry;
-    unsigned at = kBits;  // the number of bits not yet decoded
-    for (uint8_t& value : entry.values) {
-      const auto zeros = at - static_cast<unsigned>(std::bit_width(bits & ((1U << at) - 1)));
-      if (2 * zeros + 1 > at) return {};
-      at -= 2 * zeros + 1;
-      value = static_cast<uint8_t>((bits >> at) & ((2U << zeros) - 1));
-    }
-    entry.length = static_cast<uint8_t>(kBits - at);
-    return entry;
-  }
-
-  std::array<Entry, size_t{1} << kBits> _entries;
-};
-
-inline constexpr GammaTable kGammaTable;
-
 // Reads codes from untrusted bytes. One thread; the bytes outlive it.
 class BitReader {
  public:
   explicit BitReader(std::string_view bytes) : _bytes(bytes) {}
-
-  // The next two numbers, faster than one by one.
-  std::array<uint32_t, 2> twoGammas() {
-    if (_count < GammaTable::kBits) fill();
-    const GammaTable::Entry& entry = kGammaTable.at(_bits >> (64 - GammaTable::kBits));
-    if (entry.length == 0 || entry.length > _count) return {gamma(), gamma()};
-    _bits <<= entry.length;
-    _count -= entry.length;
-    return {entry.values[0], entry.values[1]};
-  }
 
   // The next number. At the end or at invalid bits it clears `good` and returns 0.
   uint32_t gamma() {

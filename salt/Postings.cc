@@ -267,8 +267,8 @@ bool Postings::addList(std::string_view list, uint32_t* suffixes, PostingSet* pl
     DocSet& docs = places->docsOf(_zones[zone.number]);
     uint64_t end = 0;  // of the run before
     for (uint32_t i = 0; i < zone.runs; ++i) {
-      const auto [gap, count] = codes.twoGammas();
-      const uint64_t first = end + gap;
+      const uint64_t first = end + codes.gamma();
+      const uint32_t count = codes.gamma();
       end = first + count;
       if (!codes.good || end > UINT32_MAX) return false;
       docs.insert(static_cast<uint32_t>(first), count);
