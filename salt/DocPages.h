@@ -1,10 +1,8 @@
 #pragma once
 
-#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <utility>
 #include <vector>
 
 namespace salt {
@@ -28,17 +26,6 @@ class DocPages {
     const size_t page = docID / kPageDocs;
     if (page >= _pages.size() || _pages[page] == nullptr) return T();
     return _pages[page][docID % kPageDocs];
-  }
-
-  // Calls visit(docID, value) in DocID order for each document of an allocated page.
-  template <typename Visit>
-  void forEach(const Visit& visit) const {
-    for (size_t page = 0; page < _pages.size(); ++page) {
-      if (_pages[page] == nullptr) continue;
-      for (uint32_t i = 0; i < kPageDocs; ++i) {
-        visit(static_cast<uint32_t>(page * kPageDocs + i), _pages[page][i]);
-      }
-    }
   }
 
  private:

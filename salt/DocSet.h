@@ -125,13 +125,17 @@ class DocSet {
     return page < _pages.size() && _pages[page] != kNone ? &_bits[_pages[page]] : nullptr;
   }
 
+  // The number of a document from its page and its number there.
+  [[nodiscard]] static uint32_t docID(size_t page, size_t doc) {
+    return static_cast<uint32_t>(page * DocPage::kDocs + doc);
+  }
+
   // Calls visit(docID) for each member, ascending.
   template <typename Visit>
   void forEach(const Visit& visit) const {
     for (size_t page = 0; page < _pages.size(); ++page) {
       if (_pages[page] == kNone) continue;
-      _bits[_pages[page]].forEach(
-          [&](size_t doc) { visit(static_cast<uint32_t>(page * DocPage::kDocs + doc)); });
+      _bits[_pages[page]].forEach([&](size_t doc) { visit(docID(page, doc)); });
     }
   }
 

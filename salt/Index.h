@@ -110,7 +110,7 @@ class Index {
     uint64_t LastShardVacuumed = 0;
     uint64_t Scans = 0;
     double ScanSeconds = 0;
-    uint64_t ScanResults = 0;      // suffixes passed to callbacks
+    uint64_t ScanResults = 0;      // suffixes passed to callbacks, or found by ScanPlaces
     uint64_t ScanTextFetches = 0;  // zone texts read to complete a suffix
     uint64_t ScanHotReads = 0;     // hot keys loaded
     uint64_t ScanPageReads = 0;    // pages loaded

@@ -31,9 +31,10 @@ class Merge {
   // committed before stays. False when it did not reach the end.
   [[nodiscard]] bool run();
 
-  // After a complete run: the posting lists of the shard, and whether there are any.
+  // After a complete run: ends the posting lists of the shard, false when there are none; then
+  // writes their file, false with a log line on failure.
   [[nodiscard]] bool finishPostings();
-  [[nodiscard]] PostingsBuilder& postings() { return _postings; }
+  [[nodiscard]] bool writePostings(const PostingsOwner& owner) { return _postings.write(owner); }
 
  private:
   [[nodiscard]] bool oldIsNext();

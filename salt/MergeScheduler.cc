@@ -5,7 +5,6 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/Files.h"
 #include "platform/Memory.h"
 #include "salt/IndexImpl.h"
 #include "salt/Merge.h"
@@ -117,7 +116,7 @@ bool MergeScheduler::mergePages(uint8_t shard, bool hot) {
   if (!merge.run()) return false;
   if (!merge.finishPostings() || !_idx.Sync()) return true;
   const PostingsOwner owner = _idx.postingsOwner(shard);
-  if (merge.postings().write(owner)) _idx.setPostings(shard, Postings::open(_idx.path(), owner));
+  if (merge.writePostings(owner)) _idx.setPostings(shard, Postings::open(_idx.path(), owner));
   return true;
 }
 

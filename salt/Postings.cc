@@ -36,6 +36,7 @@ static_assert(sizeof(DocPage) == DocPage::kDocs / 8 && std::is_trivially_copyabl
 
 constexpr size_t kSumBytes = 4;  // before each list
 constexpr uint32_t kMaxTableBytes = uint32_t{1} << 28;
+constexpr uint64_t kMinSuffixes = 2;  // of an entry
 constexpr uint64_t kMinBudget = 64 * 1024;
 // A suffix takes about eleven bytes of the index, so this limits posting lists to a twentieth.
 constexpr uint64_t kSuffixesPerByte = 2;

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -91,8 +90,7 @@ class Postings {
 class PostingsBuilder {
  public:
   // `fullShard` is MaxShardSuffixes. Only prefixes with at least a 4,000th of that many suffixes,
-  // 250 of a million, get an entry, and fewer where the space does not suffice: finding the first
-  // of them in the pages takes longer than reading a list.
+  // 250 of a million, get an entry, and only those with more where the space does not suffice.
   PostingsBuilder(std::string directory, uint64_t fullShard);
 
   // Takes the next suffix, which shares `lcp` bytes with the previous one. Where that ends a node
@@ -117,7 +115,6 @@ class PostingsBuilder {
   [[nodiscard]] bool write(const PostingsOwner& owner);
 
  private:
-  static constexpr uint64_t kMinSuffixes = 2;
   static constexpr uint64_t kNone = UINT64_MAX;
 
   // The largest child of a node that has an entry.

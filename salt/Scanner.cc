@@ -245,10 +245,12 @@ std::vector<std::shared_ptr<const FoundPlaces>> Scanner::scanPlaces(
   for (Request& request : requests) {
     Share& share = request.shares.front();
     for (size_t part = 1; part < kThreads; ++part) share.add(std::move(request.shares[part]));
-    share.pages.erase(*view.deleted);  // those of posting lists
-    auto pages = request.known ? std::move(request.known)
-                               : std::make_shared<const PostingSet>(std::move(share.pages));
-    if (keep) _scanCache.keep(request.prefix, view.pageGeneration, pages);
+    auto pages = std::move(request.known);
+    if (pages == nullptr) {
+      share.pages.erase(*view.deleted);  // those of posting lists
+      pages = std::make_shared<const PostingSet>(std::move(share.pages));
+      if (keep) _scanCache.keep(request.prefix, view.pageGeneration, pages);
+    }
     auto found = std::make_shared<const FoundPlaces>(
         std::make_shared<const PostingSet>(std::move(share.hot)), std::move(pages));
     share.counts.results = found->suffixes();

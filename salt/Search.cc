@@ -119,10 +119,10 @@ class Searching {
   void evaluatePages() {
     if (_options.maxResults == 0) return;
     std::optional<Contenders> contenders;
-    if (!_required.empty()) contenders.emplace(_evaluation, _terms, _matches);
     for (size_t page = pages(); page-- > 0;) {
       salt::DocPage candidates = candidatesOf(page);
-      if (contenders && _top.full()) {
+      if (!_required.empty() && _top.full()) {
+        if (!contenders) contenders.emplace(_evaluation, _terms, _matches);
         if (!contenders->exceed(_top.lowest())) return;
         candidates = contenders->select(page, candidates);
       }
@@ -134,19 +134,18 @@ class Searching {
   // once for all of them.
   void evaluatePage(size_t page, const salt::DocPage& candidates) {
     group(page, candidates);
-    std::vector<Standing> scores(_groups.size());
+    _scores.assign(_groups.size(), {});
     size_t first = 0;  // token of the term
     for (size_t u = 0; u < _terms.size(); ++u) {
       if (_evaluation.skips(u)) continue;
       _evaluation.apply(
-          u, [&](size_t token, size_t i) { return _groups[i].masks[first + token]; }, scores);
+          u, [&](size_t token, size_t i) { return _groups[i].masks[first + token]; }, _scores);
       first += _terms[u].tokens.size();
     }
-    for (size_t i = 0; i < scores.size(); ++i) {
-      if (!_evaluation.accepts(scores[i]) || _top.refuses(scores[i].score)) continue;
-      _groups[i].docs.forEach([&](size_t doc) {
-        _top.add(static_cast<uint32_t>(page * salt::DocPage::kDocs + doc), scores[i].score);
-      });
+    for (size_t i = 0; i < _scores.size(); ++i) {
+      if (!_evaluation.accepts(_scores[i]) || _top.refuses(_scores[i].score)) continue;
+      _groups[i].docs.forEach(
+          [&](size_t doc) { _top.add(salt::DocSet::docID(page, doc), _scores[i].score); });
     }
   }
 
@@ -304,9 +303,7 @@ class Searching {
 
   static void addStandings(size_t page, const salt::DocPage& candidates,
                            std::vector<Standing>* docs) {
-    candidates.forEach([&](size_t doc) {
-      docs->push_back({static_cast<uint32_t>(page * salt::DocPage::kDocs + doc)});
-    });
+    candidates.forEach([&](size_t doc) { docs->push_back({salt::DocSet::docID(page, doc)}); });
   }
 
   const salt::Index& _index;
@@ -319,6 +316,7 @@ class Searching {
   std::vector<size_t> _required;                     // terms matched before the others
   std::optional<bool> _anyCandidate;                 // once known
   std::vector<Group> _groups;                        // of the page that is evaluated
+  std::vector<Standing> _scores;                     // of the groups
 };
 
 }  // namespace

@@ -24,6 +24,7 @@ class TermMatches {
     const salt::DocSet* docs;
     uint32_t mask;  // of the zones of the term; see ZoneBits
   };
+
   // Takes what was found for a well-formed term and sets Term::found. Takes at most `maxSuffixes`
   // suffixes over all tokens.
   TermMatches(const salt::Index& index, Term& term, Found found, size_t maxSuffixes);
@@ -52,8 +53,7 @@ class TermMatches {
     for (size_t page = 0; page < pages(); ++page) {
       salt::DocPage docs;
       addPage(page, &docs);
-      docs.forEach(
-          [&](size_t doc) { visit(static_cast<uint32_t>(page * salt::DocPage::kDocs + doc)); });
+      docs.forEach([&](size_t doc) { visit(salt::DocSet::docID(page, doc)); });
     }
   }
 

@@ -21,11 +21,11 @@ class index;
 // A cache of zone texts for operations that complete very many suffixes. The suffixes of a shard
 // come from few documents, again and again, and reading one from the database decompresses the
 // whole zone. So each text read is kept uncompressed in an unnamed temporary file beside the
-// database, which the kernel caches as far as memory allows. Documents with neighbouring numbers
-// mostly share a shard, so a read from the database reads ahead.
+// database, which the kernel caches as far as memory allows. Whole documents are read, and those
+// that follow, since documents with neighbouring numbers mostly share a shard.
 //
-// Disk: a quarter of the free space, at most kMaxFileBytes; then the file starts over. Memory:
-// about 60 bytes for each cached zone. When the file cannot be created or used, each text is read
+// Disk: a quarter of the free space, at most kMaxFileBytes; past that, the file starts over.
+// Memory: 12 bytes for each cached zone. When the file cannot be created or used, each text is read
 // from the database. One thread. The index outlives it.
 class ZoneTextCache {
  public:

@@ -1,12 +1,11 @@
 #include <gtest/gtest.h>
-#include <leveldb/db.h>
 
-#include <map>
 #include <random>
 #include <set>
 
 #include "platform/Files.h"
 #include "salt/Postings.h"
+#include "tests/salt/Model.h"
 #include "tests/salt/SaltSupport.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -54,18 +53,12 @@ class PostingsTest : public testing::Test {
     index = salttest::loadIndex(path);
     ASSERT_NE(index, nullptr);
   }
-  // All keys and values but those of counters.
-  std::map<std::string, std::string> contents() {
+  // All keys and values but the counters.
+  salttest::Keys contents() {
     index.reset();
-    leveldb::DB* opened = nullptr;
-    EXPECT_TRUE(leveldb::DB::Open({}, path, &opened).ok());
-    const std::unique_ptr<leveldb::DB> db(opened);
-    const std::unique_ptr<leveldb::Iterator> it(db->NewIterator({}));
-    std::map<std::string, std::string> all;
-    for (it->SeekToFirst(); it->Valid(); it->Next())
-      all[it->key().ToString()] = it->value().ToString();
-    all.erase("\xFFMETRICS");
-    return all;
+    salttest::Keys keys = salttest::readKeys(path);
+    keys.erase("\xFFMETRICS");
+    return keys;
   }
   [[nodiscard]] std::vector<fs::path> files() const { return salttest::filesOf(path, "postings-"); }
   void expectSame() const {

@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <map>
 #include <random>
+#include <set>
 
 #include "salt/Search.h"
 #include "tests/salt/SaltSupport.h"
@@ -238,8 +239,8 @@ TEST_F(SearchSmall, SuffixesAreLimitedPerTermAndFoundIsSet) {
   EXPECT_EQ(results[0].zoneMask, 0u);
 }
 
-// Places come in batches; the limit applies within a batch and across batches.
-TEST(SearchLimit, AppliesWithinAndAcrossBatches) {
+// Where not all suffixes are taken, a scan reads them one by one.
+TEST(SearchLimit, IsExactAndCounted) {
   const TemporaryDirectory directory;
   const auto index = salttest::newIndex(directory / "index");
   for (uint32_t docID = 1; docID <= 700; ++docID) {
@@ -251,6 +252,40 @@ TEST(SearchLimit, AppliesWithinAndAcrossBatches) {
     EXPECT_EQ(saltsearch::Search(*index, terms, {1000, limit, 0}).size(),
               std::min<size_t>(limit, 700));
     EXPECT_EQ(index->GetMetrics().ScanResults, std::min<size_t>(limit + 1, 700));
+  }
+}
+
+// Suffixes of deleted documents are in posting lists and what is cached of them, but do not count.
+TEST(SearchLimit, IsExactOverTokensWithPostingListsAndDeletedDocuments) {
+  const TemporaryDirectory directory;
+  salt::Index::Options small;
+  small.MaxHotSuffixes = 200;
+  const auto index = salttest::newIndex(directory / "index", small);
+  for (uint32_t docID = 1; docID <= 700; ++docID) {
+    ASSERT_TRUE(salttest::addZone(*index, docID, 1, "apple "));
+    ASSERT_TRUE(salttest::addZone(*index, 1000 + docID, 1, "pear "));
+  }
+  ASSERT_TRUE(index->Compact());  // after the merge that runs
+  index->Vacuum();
+  ASSERT_TRUE(index->Compact());
+  for (uint32_t docID = 1; docID <= 1700; docID += 5) ASSERT_TRUE(index->DeleteDoc(docID));
+  std::vector<std::string> inOrder = salttest::scan(*index, "apple");
+  for (const std::string& suffix : salttest::scan(*index, "pear")) inOrder.push_back(suffix);
+  const auto expectExact = [&](size_t limit) {
+    const auto taken = inOrder.begin() + static_cast<ptrdiff_t>(std::min(limit, inOrder.size()));
+    std::set<std::string> docs;
+    for (auto at = inOrder.begin(); at != taken; ++at) docs.insert(at->substr(0, at->find(',')));
+    std::set<std::string> found;
+    for (const std::string& doc :
+         search(*index, {term({"apple", "pear"}, {1, 1})}, {2000, limit, 0})) {
+      found.insert(doc.substr(0, doc.find(':')));
+    }
+    EXPECT_EQ(found, docs) << limit;
+  };
+  for (int time = 0; time < 2; ++time) {  // the second time the sets are cached
+    for (const size_t limit : {0, 1, 300, 559, 560, 561, 700, 950, 1100, 1119, 1120, 1121, 2000}) {
+      expectExact(limit);
+    }
   }
 }
 
